@@ -1,0 +1,34 @@
+# Language, warnings, hardening and sanitizers, once for every target of the project.
+
+option(REMVOL_TESTS "Build the tests and the benchmarks" OFF)
+set(REMVOL_SANITIZE "" CACHE STRING "Sanitizers to build with, such as address,undefined")
+
+if(NOT CMAKE_BUILD_TYPE)
+  set(CMAKE_BUILD_TYPE Release)
+endif()
+
+set(CMAKE_CXX_STANDARD 20)
+set(CMAKE_CXX_STANDARD_REQUIRED ON)
+set(CMAKE_CXX_EXTENSIONS OFF)
+set(CMAKE_C_STANDARD 11)
+set(CMAKE_POSITION_INDEPENDENT_CODE ON)
+set(CMAKE_CXX_VISIBILITY_PRESET hidden)
+set(CMAKE_C_VISIBILITY_PRESET hidden)
+set(CMAKE_VISIBILITY_INLINES_HIDDEN ON)
+# Installed programs find the private libraries beside them, wherever the prefix is.
+file(RELATIVE_PATH _bin_to_lib "/${CMAKE_INSTALL_BINDIR}" "/${CMAKE_INSTALL_LIBDIR}")
+set(CMAKE_INSTALL_RPATH "$ORIGIN/${_bin_to_lib};$ORIGIN")
+
+add_compile_definitions(_GNU_SOURCE)
+add_compile_options(
+  -Wall -Wextra -Wpedantic -Wshadow -Wconversion -Wformat=2 -Werror
+  -fstack-protector-strong -fstack-clash-protection -fcf-protection)
+add_link_options(-pie -Wl,-z,relro,-z,now -Wl,--as-needed)
+if(REMVOL_SANITIZE)
+  add_compile_options(-fsanitize=${REMVOL_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
+  add_link_options(-fsanitize=${REMVOL_SANITIZE})
+elseif(CMAKE_BUILD_TYPE STREQUAL "Debug")
+  add_compile_definitions(_GLIBCXX_ASSERTIONS)
+else()
+  add_compile_definitions(_FORTIFY_SOURCE=2 _GLIBCXX_ASSERTIONS)
+endif()
