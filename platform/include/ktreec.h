@@ -17,27 +17,27 @@
 extern "C" {
 #endif
 
-/* Sets the node at `path` to `value` and creates what is missing on the way; setting `name:N` where fewer than
- * N children of that name exist creates the ones before it as empty nodes. Returns 0, or -1 on a bad path, a
- * value that is too long, or a daemon that does not answer; nothing is changed then. */
-int ktreec_set(const char *socket, unsigned flags, const char *path, const char *value);
+/* Sets the node at `path` to `value` and creates what is missing on the way; setting `name:N` where fewer
+ * than N children of that name exist creates the ones before it as empty nodes. Returns 0, or -1 on a bad
+ * path, a value that is too long, or a daemon that does not answer; nothing is changed then. */
+int ktreec_set(const char* socket, unsigned flags, const char* path, const char* value);
 
 /* Reads the value at `path` into `buffer` of `size` bytes, always NUL-terminated when size > 0. Returns the
  * bytes put there without the NUL (at most size - 1), 0 for an empty value, -1 when the node is missing, has
  * no value, or on any error (the buffer then holds the empty text). */
-int ktreec_get_wb(const char *socket, unsigned flags, const char *path, char *buffer, size_t size);
+int ktreec_get_wb(const char* socket, unsigned flags, const char* path, char* buffer, size_t size);
 
 /* Deletes the node at `path` and all below it; the later children of the same name move down by one. Returns
  * 0, or -1 (also when there is no such node). */
-int ktreec_del(const char *socket, unsigned flags, const char *path);
+int ktreec_del(const char* socket, unsigned flags, const char* path);
 
 /* Writes the whole tree to `file` as XML, mode 0600, replacing it in one step. Returns 0, or -1; the file is
  * then as it was. */
-int ktreec_dump(const char *socket, unsigned flags, const char *file);
+int ktreec_dump(const char* socket, unsigned flags, const char* file);
 
 /* Makes the tree what `file` holds. Returns 0, or -1 when the file is missing or damaged; the tree is then as
  * it was. */
-int ktreec_load(const char *socket, unsigned flags, const char *file);
+int ktreec_load(const char* socket, unsigned flags, const char* file);
 
 #ifdef __cplusplus
 }

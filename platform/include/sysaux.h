@@ -10,62 +10,62 @@ extern "C" {
 
 /* Runs the shell command that printf(format, ...) would print. Returns what system(3) returns, or -1 when the
  * command cannot be formatted. */
-int System(const char *format, ...) __attribute__((format(printf, 1, 2)));
+int System(const char* format, ...) __attribute__((format(printf, 1, 2)));
 
 /* Copies `text` into `out` of `size` bytes and puts a backslash before each character that a shell interprets
  * inside double quotes. Returns 0; -1 when `out` is too small, `out` is then empty. */
-int str_insert_back_slash(char *out, size_t size, const char *text);
+int str_insert_back_slash(char* out, size_t size, const char* text);
 
 /* Removes the characters of `set` from both ends of `text`, in place. Returns `text`. */
-char *strtrim(char *text, const char *set);
+char* strtrim(char* text, const char* set);
 
 /* Removes the characters of `set` from the right end of `text`, in place. Returns `text`. */
-char *strrtrim(char *text, const char *set);
+char* strrtrim(char* text, const char* set);
 
 /* Converts decimal text to a number; leading blanks are allowed. Returns 0 when it is not a number. */
-long long str2ll(const char *text);
+long long str2ll(const char* text);
 
 /* Reads the hardware address of a network interface. Returns 0, or -1. */
-int sys_get_mac_addr(const char *interface, unsigned char mac[6]);
+int sys_get_mac_addr(const char* interface, unsigned char mac[6]);
 
 /* Puts the host name into `out` of `size` bytes. Returns 0, or -1. */
-int sys_hostname(char *out, size_t size);
+int sys_hostname(char* out, size_t size);
 
 /* Returns the size of the block device whose path printf(format, ...) would print; 0 or less when unknown. */
-long long sys_get_disk_space(const char *format, ...) __attribute__((format(printf, 1, 2)));
+long long sys_get_disk_space(const char* format, ...) __attribute__((format(printf, 1, 2)));
 
 /* Writes the kernel names of the partitions of `device` (a path), joined by ",", into `out`, which holds at
  * least 1024 characters. Returns their number. */
-int sys_get_partition_list(char *out, const char *device);
+int sys_get_partition_list(char* out, const char* device);
 
-/* Writes a new partition table with one partition that covers the disk. The partition's node is there when the
- * call returns. A disk that carries a signature of its own is refused. Returns 0, or non-zero. */
-int sys_create_1_partition(const char *device);
+/* Writes a new partition table with one partition that covers the disk. The partition's node is there when
+ * the call returns. A disk that carries a signature of its own is refused. Returns 0, or non-zero. */
+int sys_create_1_partition(const char* device);
 
 /* Grows the only partition of `device` to the end of the disk and keeps its data. Returns 0, or non-zero. */
-int sys_expand_1_partition(const char *device);
+int sys_expand_1_partition(const char* device);
 
 /* Returns the size of a partition by its kernel name, such as sdb1; 0 or less when unknown. */
-long long sys_get_partition_size(const char *name);
+long long sys_get_partition_size(const char* name);
 
 /* Returns 0 when `node` is a usable block device whose first mebibyte can be read, non-zero otherwise. */
-int sys_check_dev(const char *node);
+int sys_check_dev(const char* node);
 
-/* Puts the name of the file system on `node` into `out`, which holds at least 16 characters. Another signature
- * (LVM, RAID, encryption ...) counts and gives its name, cut to 15 characters. Returns 0, or non-zero when
- * nothing is recognised. */
-int sys_get_fs_type(char *out, const char *node);
+/* Puts the name of the file system on `node` into `out`, which holds at least 16 characters. Another
+ * signature (LVM, RAID, encryption ...) counts and gives its name, cut to 15 characters. Returns 0, or
+ * non-zero when nothing is recognised. */
+int sys_get_fs_type(char* out, const char* node);
 
 /* Returns non-zero when the file system on `node` says of itself that it wants a check. */
-int sys_check_fs_state(const char *node);
+int sys_check_fs_state(const char* node);
 
 /* Returns non-zero when `path` is a mount point. */
-int sys_mount_point(const char *path);
+int sys_mount_point(const char* path);
 
-/* Gives the size, the used and the available bytes of the file system mounted on `path`. Returns 0, or -1 when
- * `path` is not a mount point. */
-int sys_get_df_info(const char *path, unsigned long long *total, unsigned long long *used,
-                    unsigned long long *available);
+/* Gives the size, the used and the available bytes of the file system mounted on `path`. Returns 0, or -1
+ * when `path` is not a mount point. */
+int sys_get_df_info(const char* path, unsigned long long* total, unsigned long long* used,
+                    unsigned long long* available);
 
 #ifdef __cplusplus
 }

@@ -1,0 +1,16 @@
+#define LOG_SOURCE "remvol_debug.cpp"
+#include "frontend/remvol_debug.h"
+
+#include "frontend/log.h"
+#include "tree/access.h"
+#include "tree/keys.h"
+
+namespace remvol {
+
+int dbg_get_remvol_debug_lv() {
+  const int level = tree_read_number(key::kDebugLevel, 0);
+  LOG(1, "get debug level = %d", level);
+  return level;
+}
+
+}  // namespace remvol

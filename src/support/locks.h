@@ -1,0 +1,39 @@
+// Exclusion between runs of the tool: record locks on files, and the format semaphore. The kernel releases
+// all of them when a process dies.
+#ifndef REMVOL_SUPPORT_LOCKS_H
+#define REMVOL_SUPPORT_LOCKS_H
+
+namespace remvol {
+
+inline constexpr char kLockDir[] = "/var/lock/virtual_volume/";
+inline constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.lock";
+inline constexpr char kRecoverQueueLock[] = "/var/lock/virtual_volume/remvol_recover_queue.lock";
+
+// Makes the lock directory when missing. Returns 0, or -108 after printing the system error.
+int make_lock_dir();
+
+// Tries the recover lock once. Returns the descriptor; -1 when another process holds it, -10 on another
+// error, -108 when the file cannot be opened.
+int get_recover_cri_flock();
+
+// Releases the recover lock and closes `fd` in every case. Returns 0, -1, -2 (bad descriptor) or -10.
+int unlock_recover_cri_flock(int fd);
+
+// Takes a write lock on the file at `path`, with random waits below `max_wait_us` (above 0) microseconds
+// between tries. Returns the descriptor; -1 when the retries ran out, -10 on another error, -108 when the
+// file cannot be opened.
+int wait_flock(const char* path, int max_retries, int max_wait_us);
+
+// Releases a lock of wait_flock and closes `fd` in every case. Returns 0, -1, -2 or -10.
+int unlock_flock(int fd);
+
+// Makes the format semaphore when missing and waits for it. Returns 0; -1 when it cannot be had, -2 when the
+// wait failed.
+int format_sem_P(int* sem_id, int initial);
+
+// Leaves the format semaphore, or removes it when nobody waits (`sem_id` is then -1). Returns 0 or -2.
+int format_sem_V(int* sem_id);
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,26 @@
+// Portal addresses: their form, and whether they answer.
+#ifndef REMVOL_SUPPORT_NET_H
+#define REMVOL_SUPPORT_NET_H
+
+#include <cstddef>
+
+namespace remvol {
+
+// Pings `address` (IPv6 may stand in square brackets) twice, from `interface` unless that is null or empty.
+// Returns 1 when it answers, else 0 (also for a null or empty address).
+int ping_ip(const char* address, const char* interface);
+
+// Returns non-zero when `text` is not empty and contains a colon.
+int is_ipv6_text(const char* text);
+
+// Converts IPv6 text to 16 bytes in network byte order, without validation. Returns 0, or -1 for a null text,
+// one shorter than 3 characters, or a buffer below 16 bytes.
+int parse_ipv6_text(unsigned char* address, size_t size, const char* text);
+
+// Returns 1 when `address`, with or without square brackets, is link-local (fe80::/10 with bytes 2 to 7
+// zero), 0 when not, -1 on a bad argument.
+int is_ipv6_link_local(const char* address);
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,51 @@
+#include "tree/access.h"
+
+#include <cstdlib>
+#include <cstring>
+
+#include "ktreec.h"
+#include "support/result.h"
+
+namespace remvol {
+
+namespace {
+constexpr int kWriteTries = 3;
+}
+
+bool tree_read(const char* key, char* buffer, size_t size) {
+  memset(buffer, 0, size);
+  return ktreec_get_wb(main_socket, 0, key, buffer, size) > 0 && buffer[0] != '\0';
+}
+
+bool tree_present(const char* key) {
+  char value[256];
+  return tree_read(key, value);
+}
+
+int tree_read_number(const char* key, int missing) {
+  char value[128];
+  return tree_read(key, value) ? atoi(value) : missing;
+}
+
+bool tree_slot_is_free(const char* key) {
+  char value[256] = "";
+  return ktreec_get_wb(main_socket, 0, key, value, sizeof value) == -1 || value[0] == '\0';
+}
+
+int tree_write(const char* key, const char* value) {
+  return ktreec_set(main_socket, 0, key, value) == 0 ? kOk : kTreeFailed;
+}
+
+int tree_write_with_tries(const char* key, const char* value, Caller caller) {
+  for (int tries = 0; tries < kWriteTries; tries++) {
+    if (tree_write(key, value) == kOk) return kOk;
+    LOG_AT(caller, 0, "ktreec_set(%s) failed", key);
+  }
+  return kTreeFailed;
+}
+
+int tree_delete(const char* key) {
+  return ktreec_del(main_socket, 0, key) == 0 ? kOk : kTreeFailed;
+}
+
+}  // namespace remvol

@@ -1,0 +1,45 @@
+// Access to the configuration tree's main instance. A key counts as present only when the read gives more
+// than 0 bytes and the value is not empty; a missing key is never an error by itself, each reader has a
+// default.
+#ifndef REMVOL_TREE_ACCESS_H
+#define REMVOL_TREE_ACCESS_H
+
+#include <cstddef>
+
+#include "frontend/log.h"
+
+namespace remvol {
+
+// The tree instance that holds the settings and the status.
+inline constexpr char main_socket[] = "/var/run/ktree_sock_vv";
+
+// Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns whether the key is present.
+[[nodiscard]] bool tree_read(const char* key, char* buffer, size_t size);
+
+template <size_t N>
+[[nodiscard]] bool tree_read(const char* key, char (&buffer)[N]) {
+  return tree_read(key, buffer, N);
+}
+
+// Returns whether `key` is present.
+[[nodiscard]] bool tree_present(const char* key);
+
+// Returns the decimal number at `key`, 0 when its text is no number, `missing` when the key is not present.
+int tree_read_number(const char* key, int missing);
+
+// The looser rule of the free-slot searches: free when the read is exactly -1 or the value is empty.
+[[nodiscard]] bool tree_slot_is_free(const char* key);
+
+// Sets `key` in one try. Returns 0, or -103 (not logged).
+[[nodiscard]] int tree_write(const char* key, const char* value);
+
+// Sets `key` in up to 3 tries and logs "ktreec_set(%s) failed" in the caller's name after each failed one.
+// Returns 0, or -103 after the third.
+int tree_write_with_tries(const char* key, const char* value, Caller caller = Caller());
+
+// Deletes `key` and all below it. Returns 0, or -103 (not logged).
+[[nodiscard]] int tree_delete(const char* key);
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,73 @@
+// State numbers of targets and LUNs and their writers. Writers of single values try up to 3 times where not
+// said otherwise, and return -103 after the third failure.
+#ifndef REMVOL_TREE_STATE_H
+#define REMVOL_TREE_STATE_H
+
+#include "tree/record.h"
+
+namespace remvol {
+
+enum ConnectState : int {
+  kDisconnected = 0,
+  kConnected = 1,
+  kConnecting = 2,
+  kRecovering = 3,  // connection lost, being reopened
+  kConnectError = 4,
+};
+
+enum FormatState : int {
+  kFormatIdle = 0,
+  kFormatting = 1,
+  kFormatFailed = 3,
+  kFormatWaiting = 4,  // for the format semaphore
+};
+
+enum VolumeState : int {
+  kVolumeNormal = 0,
+  kVolumeCreating = 1,
+  kVolumeOffline = 2,
+  kVolumeFailed = 3,
+  kVolumeLost = 4,  // at start-up the session showed no usable disk
+  kVolumeUnsupported = 5,
+};
+
+enum AccessRight : int { VOL_AC_RO = 0, VOL_AC_RW = 1 };
+
+// Writes the target's connect state in one try. Returns 0, -1 (out of memory) or -103.
+int ktree_set_connect_state(int dbidx, int state);
+
+// Writes the LUN's access right. Returns 0; -1 for a right that is neither VOL_AC_RW nor VOL_AC_RO or a dbidx
+// below 1; -103.
+int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx);
+
+// Reads the LUN's access right into `right`: VOL_AC_RO only when the key holds 0, else VOL_AC_RW. Returns 0,
+// or -1 for a null `right` or a dbidx below 1.
+int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx);
+
+// Writes the format state of the entry's LUN. Returns 0 or -103.
+int ktree_update_formatting_state(const TargetEntry* entry, int state);
+
+// Writes the format progress in percent. Returns 0, -1 for a dbidx below 1, or -103.
+int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent);
+
+// Writes the volume state of the entry's LUN. Returns 0 or -103.
+int ktree_update_volume_state(const TargetEntry* entry, int state);
+
+// Writes one volume state to every LUN of the entry's target, up to the first empty slot, and leaves the last
+// slot in lun_db_idx. Returns 0, -1 for a null entry or an unknown target, or the first failing result.
+int ktree_update_all_volume_state(TargetEntry* entry, int state);
+
+// Records a mount: copies the node and the mount point into the entry and writes both and the file-system
+// type to the tree, in one try each. Returns 0; write failures are ignored.
+int ktree_update_mount_info(TargetEntry* entry, const char* node, const char* mount_point,
+                            const char* fs_type);
+
+// Writes the initiator's iSCSI name. Returns 0 or -103.
+int ktree_update_initiator_iqn(const char* name);
+
+// Stores the entry's conn_set, in one try. Returns 0 or -103.
+int ktree_record_connect_set(const TargetEntry* entry);
+
+}  // namespace remvol
+
+#endif

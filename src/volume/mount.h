@@ -1,0 +1,40 @@
+// Mounting a LUN as a shared folder under "/mnt/VV/".
+#ifndef REMVOL_VOLUME_MOUNT_H
+#define REMVOL_VOLUME_MOUNT_H
+
+#include "tree/record.h"
+
+namespace remvol {
+
+inline constexpr char kMountRoot[] = "/mnt/VV/";
+
+// Results of Target_mount that its callers tell apart.
+enum MountResult : int {
+  kMountNoPartition = -2,
+  kMountFormatFailed = -3,
+  kMountNoMountPoint = -4,
+  kMountUnsupported = -6,
+  kMountReadOnly = -7,
+  kMountTooSmall = -8,
+};
+
+// Partitions, formats (when `force_format` is non-zero or there is no file system), mounts and records the
+// entry's LUN; reloads the share services when `update_share` is non-zero. Returns 0 (also when the mount
+// never took hold: volume state 3 tells), -1 bad entry, no file system after formatting or no device node, a
+// MountResult, or -103.
+int Target_mount(TargetEntry* entry, int force_format, int update_share);
+
+// Mounts every LUN of the target up to the first empty slot and refreshes its status. Returns 0, or -1 for a
+// null entry or a db_idx below 1.
+int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share);
+
+// Remounts a mount point in place and waits. `wait_seconds` 0: no wait; below 4: 3 seconds. Returns 0, also
+// when `path` is no mount point; -1 for a null path or a failed remount.
+int remount_mnt_path(const char* path, int wait_seconds);
+
+// Has the SMB and AFP services reload their shares. Returns 0.
+int reload_share_services();
+
+}  // namespace remvol
+
+#endif
