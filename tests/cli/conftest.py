@@ -1,0 +1,25 @@
+import pathlib
+import sys
+
+import pytest
+
+sys.path.insert(0, str(pathlib.Path(__file__).parent))
+
+from harness import Box  # noqa: E402
+
+
+@pytest.fixture
+def bare_box():
+    """A box without the tree's daemon."""
+    box = Box()
+    yield box
+    complaints = box.complaints()
+    box.close()
+    assert not complaints, "\n".join(complaints)
+
+
+@pytest.fixture
+def box(bare_box):
+    """A box: see the text of the package harness."""
+    bare_box.tree.start()
+    return bare_box
