@@ -10,6 +10,10 @@ namespace remvol {
 // or no interface could be chosen. Failed commands are logged and ignored.
 int Target_Config_Gen(TargetEntry* entry);
 
+// Deletes the target's node record for the entry's portal. Returns 0, also when the command failed (there may
+// be no record); -1 when the entry is null or no interface could be chosen.
+int _target_record_delete(TargetEntry* entry);
+
 // Logs in. Returns 0; 1 when the login was not confirmed or the command did not start; -1 when no interface
 // could be chosen or the port is out of range.
 int _target_login(TargetEntry* entry);

@@ -1,0 +1,106 @@
+#include "tasks/add.h"
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/node.h"
+#include "iscsi/session.h"
+#include "iscsi/session_check.h"
+#include "support/result.h"
+#include "tree/entry.h"
+#include "tree/search_results.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+#include "volume/mount.h"
+
+namespace remvol {
+
+namespace {
+
+// What a result of Target_mount means for a LUN that was just added. A result that is not listed means
+// kMountBroken.
+struct MountOutcome {
+  int mounted;
+  VolumeState state;
+  int result;
+};
+
+constexpr MountOutcome kMountOutcomes[] = {
+    {kOk, kVolumeNormal, kOk},
+    {kMountUnsupported, kVolumeUnsupported, kMountUnsupported},
+    {kMountReadOnly, kVolumeNormal, kMountReadOnly},
+    {kMountTooSmall, kVolumeOffline, kOk},  // the LUN stays added: its disk may come to life later
+};
+constexpr MountOutcome kMountBroken = {kFailed, kVolumeFailed, kFailed};
+
+const MountOutcome& _mount_outcome(int mounted) {
+  for (const MountOutcome& outcome : kMountOutcomes) {
+    if (outcome.mounted == mounted) return outcome;
+  }
+  return kMountBroken;
+}
+
+// Mounts the LUN in a slot of the connected target in `entry`, when it is enabled, and puts the result of the
+// last step into `result`. Returns false when the mount broke: nothing more is to be done then.
+bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result) {
+  ktree_update_dev(entry);
+  if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) < 0) return true;
+  int enable = 0;
+  *result = ktree_get_lun_enable(&enable, dbidx, lun_dbidx);
+  if (*result != kOk || enable != 1) return true;
+
+  ktree_update_volume_state(entry, kVolumeCreating);
+  const MountOutcome& outcome = _mount_outcome(Target_mount(entry, 0, 0));
+  ktree_update_volume_state(entry, outcome.state);
+  ktree_update_lun_status(entry, 0);
+  *result = outcome.result;
+  return &outcome != &kMountBroken;
+}
+
+// Stores the requested target and LUN. Returns 0 with both slots, or -1.
+int _store_requested_lun(int* dbidx, int* lun_dbidx) {
+  TargetEntry* const entry = &request_target;
+  *dbidx = ktree_add_entry(entry);
+  if (*dbidx <= 0) return kFailed;
+  if (ktree_get_dbidx_by_lun(*dbidx, entry->lun) > 0) return kFailed;
+  if (ktree_check_duplicate_share_name(entry->share) != 0) {
+    LOG(0, "share name %s has benn used", entry->share);
+    return kFailed;
+  }
+  *lun_dbidx = ktree_add_lun_entry(entry);
+  if (*lun_dbidx <= 0) {
+    LOG(0, "can not add target %s with lun %d", entry->target_name, entry->lun);
+    return kFailed;
+  }
+  return kOk;
+}
+
+}  // namespace
+
+int task_add() {
+  LOG(2, "start");
+  int dbidx = 0;
+  int lun_dbidx = 0;
+  if (_store_requested_lun(&dbidx, &lun_dbidx) != kOk) return kFailed;
+  ktree_update_lun_status(&request_target, 0);
+  ktree_update_status(&request_target);
+
+  int result = kOk;
+  if (check_target_connected(request_target.target_name) == 0) {
+    Target_Config_Gen(&request_target);  // no login: the volume is mounted when the target is next connected
+  } else if (!_mount_added_lun(&request_target, dbidx, lun_dbidx, &result)) {
+    return result;
+  }
+  ktree_update_current_targetcnt();
+  LOG(2, "end");
+  return result;
+}
+
+int task_share(const char* share) {
+  LOG(2, "start");
+  const int used = ktree_check_duplicate_share_name(share);
+  LOG(1, used != 0 ? "share name %s is not ok" : "share name %s is ok", share);
+  LOG(2, "end");
+  return used;
+}
+
+}  // namespace remvol

@@ -1,0 +1,138 @@
+#include "tasks/connect.h"
+
+#include <unistd.h>
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/node.h"
+#include "iscsi/session.h"
+#include "support/command.h"
+#include "support/result.h"
+#include "tree/entry.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+#include "volume/mount.h"
+#include "volume/unmount.h"
+
+namespace remvol {
+
+namespace {
+
+// The devices of a fresh session need a moment.
+constexpr unsigned kSettleSeconds = 1;
+
+// A mount that was refused for its entry (-1) or that found the volume read-only leaves the state "normal".
+VolumeState _state_after_mount(int mounted) {
+  switch (mounted) {
+    case kOk:
+    case kFailed:
+    case kMountReadOnly:
+      return kVolumeNormal;
+    case kMountUnsupported:
+      return kVolumeUnsupported;
+    case kMountTooSmall:
+      return kVolumeOffline;
+    default:
+      return kVolumeFailed;
+  }
+}
+
+// Mounts the LUN in `entry` and stores what became of it; a failure shows in the volume state alone.
+void _mount_connected_lun(TargetEntry* entry) {
+  ktree_update_volume_state(entry, kVolumeCreating);
+  VolumeState state = kVolumeOffline;
+  if (entry->dev[0] != '\0') state = _state_after_mount(Target_mount(entry, 0, 0));
+  ktree_update_volume_state(entry, state);
+  ktree_update_lun_status(entry, 0);
+}
+
+// Mounts the enabled LUNs of the target at `dbidx`, with `entry` as the record for each. Returns 0, or why
+// the last LUN visited could not be asked whether it is enabled.
+int _mount_enabled_luns(TargetEntry* entry, int dbidx) {
+  int result = kOk;
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+    if (ktree_get_lun_entry_by_dbidx(entry, dbidx, slot) != kOk) break;
+    int enable = 0;
+    result = ktree_get_lun_enable(&enable, dbidx, slot);
+    if (result == kOk && enable == 1) _mount_connected_lun(entry);
+  }
+  return result;
+}
+
+// Takes the session down again after a login that brought no usable disk; `found` is what ktree_update_dev
+// said. Returns the command's result: a tree that refuses writes counts as success, and the session stays.
+int _give_up_session(TargetEntry* entry, int found) {
+  if (found == kTreeFailed) {
+    LOG(0, "ktree failed, exit...");
+    return kOk;
+  }
+  if (found == -1) LOG(1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
+  if (found == -2) LOG(1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
+  // The message comes when the logout worked. Whoever reads these logs knows it so.
+  if (Target_Logout(entry) == kOk) LOG(1, "Logout Fail on Target: %s ", entry->target_name);
+  ktree_record_connect_set(entry);
+  ktree_update_all_volume_state(entry, kVolumeFailed);
+  return kFailed;
+}
+
+// Finds the disks of a target that was just logged in, and mounts them. Returns the command's result.
+int _present_volumes(TargetEntry* entry) {
+  const int found = ktree_update_dev(entry);
+  if (found != kOk) return _give_up_session(entry, found);
+  sleep(kSettleSeconds);
+  const int result = _mount_enabled_luns(entry, entry->db_idx);
+  ktree_update_status(entry);
+  reload_share_services();
+  return result;
+}
+
+int _disconnect_all() {
+  Target_umount_all();
+  LOG(1, "update share folder status");
+  reload_share_services();
+  LOG(1, "finish share folder status");
+  return run_command("iscsiadm -m node -u") == 0 ? kOk : 1;
+}
+
+int _disconnect_requested() {
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) != kOk) return kFailed;
+  Target_Disconnect(&entry);
+  ktree_update_status(&entry);
+  return kOk;
+}
+
+}  // namespace
+
+int task_connect() {
+  LOG(2, "start");
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) != kOk) {
+    LOG(1, "Can not find: %s", request_target.target_name);
+    return kTreeFailed;
+  }
+  ktree_set_connect_state(entry.db_idx, kConnecting);
+  ktree_update_status(&entry);
+  Target_Config_Gen(&entry);
+  const int login = Target_Connect(&entry);
+  if (login != kOk) {
+    LOG(0, "Target_Connect failed , target name = %s", entry.target_name);
+    ktree_set_connect_state(entry.db_idx, kConnectError);
+    return login;
+  }
+  entry.conn_set = 1;
+  ktree_record_connect_set(&entry);
+  ktree_set_connect_state(entry.db_idx, kConnected);
+  const int result = _present_volumes(&entry);
+  LOG(2, "end, ret = %d", result);
+  return result;
+}
+
+int task_disconnect(int all) {
+  LOG(2, "start");
+  const int result = all != 0 ? _disconnect_all() : _disconnect_requested();
+  LOG(2, "end");
+  return result;
+}
+
+}  // namespace remvol

@@ -1,0 +1,120 @@
+#include "tasks/format.h"
+
+#include <unistd.h>
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/node.h"
+#include "iscsi/session.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tasks/ftp_share.h"
+#include "tasks/requested_lun.h"
+#include "tree/entry.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+#include "volume/mount.h"
+#include "volume/unmount.h"
+
+namespace remvol {
+
+namespace {
+
+// The devices of a fresh session need a moment.
+constexpr unsigned kSettleSeconds = 1;
+
+// Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry or no device; 1
+// unknown target or LUN.
+int _read_lun_to_format(TargetEntry* entry) {
+  if (request_target.target_name[0] == '\0' || request_target.lun < 0) return kFailed;
+  int dbidx = 0;
+  int lun_dbidx = 0;
+  const int found = find_requested_lun(&dbidx, &lun_dbidx);
+  if (found != kOk) return found;
+  if (read_requested_lun(entry, dbidx, lun_dbidx) != kOk) return kFailed;
+  if (entry->dev[0] == '\0') {
+    LOG(2, "Can not get device");
+    return kFailed;
+  }
+  return kOk;
+}
+
+// Formats and mounts the LUN anew, with its FTP share taken down meanwhile. Returns -1 when the mount table
+// cannot be read, else the result of the mount.
+int _remake_volume(TargetEntry* entry) {
+  ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0);
+  ktree_update_lun_status(entry, 1);
+  ktree_update_volume_state(entry, kVolumeCreating);
+
+  FtpPath ftp_path;
+  if (take_ftp_share_down(entry, ftp_path) != kOk) {
+    ktree_update_volume_state(entry, kVolumeNormal);
+    return kFailed;
+  }
+  Target_LUN_umount(entry);
+  const int mounted = Target_mount(entry, 1, 0);
+  if (mounted != kOk && mounted != kMountUnsupported && mounted != kMountReadOnly) {
+    ktree_update_volume_state(entry, kVolumeFailed);
+  }
+  if (ftp_path[0] != '\0') {
+    LOG(1, "mount_ftp : FTP SHARE PATH = %s", ftp_path);
+    Target_remount_ftp(entry, ftp_path);
+  }
+  ktree_update_lun_status(entry, 0);
+  return mounted;
+}
+
+// Puts the requested CHAP settings into the target's entry, its slot and its node record.
+void _store_chap(TargetEntry* entry) {
+  entry->chap = request_target.chap;
+  copy_text(entry->chap_name, request_target.chap_name);
+  copy_text(entry->chap_pwd, request_target.chap_pwd);
+  ktree_add_entry(entry);
+  Target_Config_Gen(entry);
+}
+
+// Logs the target in with its new settings and mounts its volumes. A failure is stored, not returned: the
+// settings are to be kept either way.
+void _reconnect(TargetEntry* entry, int conn_set) {
+  if (Target_Connect(entry) != kOk) {
+    LOG(0, "Reconnect failed , target name = %s", entry->target_name);
+    entry->conn_set = 0;
+    ktree_record_connect_set(entry);
+    ktree_set_connect_state(entry->db_idx, kConnectError);
+    return;
+  }
+  entry->conn_set = conn_set;
+  ktree_record_connect_set(entry);
+  ktree_update_dev(entry);
+  sleep(kSettleSeconds);
+  Target_mount_all_lun(entry, 0, 1);
+}
+
+}  // namespace
+
+int task_format() {
+  TargetEntry entry = {};
+  LOG(2, "start");
+  int result = _read_lun_to_format(&entry);
+  if (result == kOk) result = _remake_volume(&entry);
+  LOG(2, "end");
+  return result;
+}
+
+int task_modify() {
+  LOG(2, "start");
+  int result = kFailed;
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {
+    const int conn_set = entry.conn_set;
+    Target_Disconnect(&entry);
+    _store_chap(&entry);
+    if (conn_set != 0) _reconnect(&entry, conn_set);
+    ktree_update_status(&entry);
+    result = kOk;
+  }
+  LOG(2, "end");
+  return result;
+}
+
+}  // namespace remvol

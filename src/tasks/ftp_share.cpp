@@ -1,0 +1,27 @@
+#include "tasks/ftp_share.h"
+
+#include <cstring>
+
+#include "support/result.h"
+#include "volume/unmount.h"
+
+namespace remvol {
+
+int take_ftp_share_down(const TargetEntry* entry, FtpPath& path, Caller caller) {
+  memset(path, 0, sizeof path);
+  switch (get_ftp_share_path(entry, path)) {
+    case kMountTableUnreadable:
+      LOG_AT(caller, 2, "Can not read /proc/mounts");
+      return kMountTableUnreadable;
+    case kNoFtpShare:
+      memset(path, 0, sizeof path);
+      LOG_AT(caller, 2, "Can not find ftp share folder");
+      return kOk;
+    default:
+      LOG_AT(caller, 1, "umount_ftp : FTP SHARE PATH = %s", path);
+      Target_umount_ftp(entry, path);
+      return kOk;
+  }
+}
+
+}  // namespace remvol

@@ -1,0 +1,18 @@
+// The second mount of a volume, in the public FTP area, while the volume is out of service.
+#ifndef REMVOL_TASKS_FTP_SHARE_H
+#define REMVOL_TASKS_FTP_SHARE_H
+
+#include "frontend/log.h"
+#include "tree/record.h"
+
+namespace remvol {
+
+using FtpPath = char[512];
+
+// Unmounts the FTP mount of the entry's volume and leaves its path in `path`, empty when there is none. Logs
+// in the caller's name. Returns 0, or -105 when the mount table cannot be read.
+int take_ftp_share_down(const TargetEntry* entry, FtpPath& path, Caller caller = Caller());
+
+}  // namespace remvol
+
+#endif

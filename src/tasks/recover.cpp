@@ -1,0 +1,210 @@
+#include "tasks/recover.h"
+
+#include <unistd.h>
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/node.h"
+#include "support/command.h"
+#include "support/locks.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tasks/connect.h"
+#include "tasks/ftp_share.h"
+#include "tasks/requested_lun.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+#include "tree/recover_queue.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+#include "volume/degrade.h"
+#include "volume/format.h"
+#include "volume/unmount.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kQueueLockRetries = 3;
+constexpr int kQueueLockWaitUs = 100000;
+constexpr int kBusyRetrySeconds = 10;
+
+struct TargetHealth {
+  bool degraded = false;  // a LUN was found read-only or could not be checked
+  bool busy = false;      // a LUN is being formatted, waits for that, or is being resized
+};
+
+// Asks twice, a second apart: between two steps of the work looked for the process list is empty for a
+// moment. `probe` returns 0 when it is running.
+template <typename Probe>
+bool _is_running(Probe probe) {
+  if (probe() == 0) return true;
+  sleep(1);
+  return probe() == 0;
+}
+
+bool _is_formatting(const TargetEntry* lun) {
+  int state = kFormatIdle;
+  const int read = ktree_get_lun_format_state(lun->db_idx, lun->lun_db_idx, &state);
+  if (read != kOk || (state != kFormatting && state != kFormatWaiting)) return false;
+  return _is_running(check_mkfs_process_existing);
+}
+
+void _log_busy(const TargetEntry* lun, const char* work) {
+  LOG(1, "One of target:%s 's LUN is %s", lun->target_name, work);
+  LOG(1, "Skip it now, and kick it back to recover queue");
+}
+
+void _check_lun(const TargetEntry* lun, TargetHealth* health) {
+  const char* device = lun->dev[0] != '\0' ? lun->dev : lun->mnt_dev;
+  const int degraded = check_mnt_dev_degrade_to_ro(device, lun->mnt);
+  if (degraded == 1 || degraded == -1) {
+    LOG(1, "dev %s access right is degraded to ro", device);
+    health->degraded = true;
+  }
+  if (_is_formatting(lun)) {
+    _log_busy(lun, "formatting or waitting for format");
+    health->busy = true;
+  }
+  if (_is_running([device] { return check_resizing_fs(device); })) {
+    _log_busy(lun, "resizing");
+    health->busy = true;
+  }
+}
+
+TargetHealth _check_luns(int dbidx) {
+  TargetHealth health;
+  TargetEntry lun;
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+    if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) break;
+    _check_lun(&lun, &health);
+  }
+  return health;
+}
+
+void _keep_volumes(TargetEntry* entry) {
+  entry->conn_set = 1;
+  ktree_record_connect_set(entry);
+  ktree_set_connect_state(entry->db_idx, kConnected);
+  ktree_update_status(entry);
+}
+
+// Starts a run in the background that comes back for the target after a while.
+void _postpone(const TargetEntry* entry) {
+  run_command(CommandText("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds,
+                          entry->target_name));
+}
+
+// Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one
+// ends the walk.
+void _unmount_luns(int dbidx) {
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+    if (!tree_present(KeyText(key::kLunNumber, dbidx, slot))) break;
+    TargetEntry lun;
+    if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) continue;
+    FtpPath ftp_path;
+    take_ftp_share_down(&lun, ftp_path);
+    Target_LUN_umount(&lun);
+  }
+}
+
+// Unmounts everything, logs out and connects the target again. Returns the result of the connection.
+int _rebuild(TargetEntry* entry) {
+  _unmount_luns(entry->db_idx);
+  Target_Logout(entry);
+  entry->conn_set = 1;
+  ktree_set_connect_state(entry->db_idx, kConnecting);
+  request_target = *entry;
+  const int result = task_connect();
+  int state = kDisconnected;
+  if (result == kTreeFailed && ktree_get_connect_state(entry->db_idx, &state) == kOk && state != kConnected) {
+    ktree_set_connect_state(entry->db_idx, kDisconnected);
+  }
+  return result;
+}
+
+// Recovers the target named in the request record. Returns its result.
+int _recover_requested_target() {
+  const char* name = request_target.target_name;
+  LOG(1, "==> Processing - %s", name);
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
+    LOG(1, "Can not find: %s", name);
+    return kNotStored;
+  }
+  int state = kDisconnected;
+  ktree_get_connect_state(entry.db_idx, &state);
+  if (entry.conn_set == 0 || state != kRecovering) {
+    LOG(1, "This target %s has not been set to connect", name);
+    return kOk;
+  }
+  const TargetHealth health = _check_luns(entry.db_idx);
+  if (health.degraded && !health.busy) return _rebuild(&entry);
+  if (health.degraded) {
+    _postpone(&entry);
+  } else {
+    _keep_volumes(&entry);
+  }
+  return kOk;
+}
+
+// Recovers the requested target and then whatever is queued. Returns the result of the last one.
+int _drain_queue() {
+  int result = kOk;
+  do {
+    result = _recover_requested_target();
+    request_target = TargetEntry{};
+  } while (ktree_pop_recover_queue(request_target.target_name) == kOk &&
+           request_target.target_name[0] != '\0');
+  return result;
+}
+
+// Leaves the requested target to the run that is recovering. Returns 0, -1 or -103.
+int _queue_requested_target() {
+  const char* name = request_target.target_name;
+  LOG(1, "==> insert queue - %s", name);
+  const int lock = wait_flock(kRecoverQueueLock, kQueueLockRetries, kQueueLockWaitUs);
+  if (lock < 0) {
+    LOG(0, "lock failed for %s, skip and exit", name);
+    return kFailed;
+  }
+  const int result = ktree_insert_recover_queue(name);
+  unlock_flock(lock);
+  return result;
+}
+
+}  // namespace
+
+int task_oiscsi_evt_reopen() {
+  const char* name = request_target.target_name;
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
+    LOG(1, "Can not find: %s", name);
+    return kNotStored;
+  }
+  if (entry.conn_set != 0) {
+    ktree_set_connect_state(entry.db_idx, kRecovering);
+  } else {
+    LOG(1, "This target %s has not been set to connect", name);
+  }
+  return kOk;
+}
+
+int task_oiscsi_evt_recover(int wait_seconds) {
+  if (wait_seconds > 0) {
+    LOG(1, "Sleep %d seconds before add %s to recover queue...", wait_seconds, request_target.target_name);
+    sleep(static_cast<unsigned>(wait_seconds));
+  }
+  if (make_lock_dir() != kOk) {
+    LOG(0, "create lock directory failed");
+    return kFailed;
+  }
+  const int lock = get_recover_cri_flock();
+  if (lock < 0) return _queue_requested_target();  // another run works the queue off
+  const int result = _drain_queue();
+  unlock_recover_cri_flock(lock);
+  return result;
+}
+
+}  // namespace remvol

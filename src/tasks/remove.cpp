@@ -1,0 +1,97 @@
+#include "tasks/remove.h"
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/node.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tasks/requested_lun.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+#include "volume/mount.h"
+#include "volume/unmount.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kDeleteTries = 4;
+constexpr int kNotDeleted = 2;
+
+// Has the share services look at their shares again before the volume of `entry` goes away. They reload
+// everything at once, so the entry is not needed.
+int reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
+  return reload_share_services();
+}
+
+// Deletes a slot; the tree moves the slots behind it down. Returns 0 or kNotDeleted.
+int _delete_slot(const char* key) {
+  for (int tries = 0; tries < kDeleteTries; tries++) {
+    if (tree_delete(key) == kOk) return kOk;
+    LOG(0, "ktreec_del() of path '%s' failed", key);
+  }
+  return kNotDeleted;
+}
+
+// Removes the target in `entry`, volumes, session and node record first. Returns 0 or kNotDeleted.
+int _remove_target(TargetEntry* entry) {
+  TargetEntry lun;
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+    if (ktree_get_lun_entry_by_dbidx(&lun, entry->db_idx, slot) != kOk) break;
+    reload_lun_share(&lun);
+  }
+  Target_Disconnect(entry);
+  _target_record_delete(entry);
+  return _delete_slot(KeyText(key::kTarget, entry->db_idx));
+}
+
+// Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
+int _remove_lun(int dbidx, int lun_dbidx) {
+  TargetEntry lun;
+  if (read_requested_lun(&lun, dbidx, lun_dbidx) != kOk) return kFailed;
+  reload_lun_share(&lun);
+  Target_LUN_umount(&lun);
+  return _delete_slot(KeyText(key::kLun, dbidx, lun_dbidx));
+}
+
+}  // namespace
+
+int task_del() {
+  LOG(2, "start");
+  int result = kNotStored;
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {
+    result = _remove_target(&entry);
+  } else {
+    LOG(1, "Can not find: %s", request_target.target_name);
+  }
+  ktree_update_current_targetcnt();
+  LOG(2, "end");
+  return result;
+}
+
+int task_del_lun() {
+  LOG(2, "start");
+  int dbidx = 0;
+  int lun_dbidx = 0;
+  int result = kFailed;
+  bool target_gone = false;
+  if (request_target.lun < 0) {
+    LOG(0, "lun is not given");
+  } else {
+    result = find_requested_lun(&dbidx, &lun_dbidx);
+  }
+  if (result == kOk && ktree_count_target_luns(dbidx) <= 1) {
+    LOG(2, "removing target %s", request_target.target_name);
+    target_gone = true;
+    result = task_del();
+  } else if (result == kOk) {
+    result = _remove_lun(dbidx, lun_dbidx);
+  }
+  if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);
+  LOG(2, "end, ret = %d", result);
+  return result;
+}
+
+}  // namespace remvol

@@ -1,0 +1,31 @@
+#include "tasks/requested_lun.h"
+
+#include "frontend/request.h"
+#include "support/result.h"
+#include "tree/entry.h"
+
+namespace remvol {
+
+int find_requested_lun(int* dbidx, int* lun_dbidx, Caller caller) {
+  const TargetEntry& wanted = request_target;
+  *dbidx = ktree_get_dbidx_by_targetname(wanted.target_name);
+  if (*dbidx < 1) {
+    LOG_AT(caller, 0, "Can not find: %s", wanted.target_name);
+    return kNotStored;
+  }
+  *lun_dbidx = ktree_get_dbidx_by_lun(*dbidx, wanted.lun);
+  if (*lun_dbidx < 1) {
+    LOG_AT(caller, 0, "Can not find lun %d under target %s", wanted.lun, wanted.target_name);
+    return kNotStored;
+  }
+  return kOk;
+}
+
+int read_requested_lun(TargetEntry* entry, int dbidx, int lun_dbidx, Caller caller) {
+  if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) == kOk) return kOk;
+  LOG_AT(caller, 0, "Can not get lun entry %d under target %s", request_target.lun,
+         request_target.target_name);
+  return kFailed;
+}
+
+}  // namespace remvol

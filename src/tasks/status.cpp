@@ -1,0 +1,97 @@
+#include "tasks/status.h"
+
+#include <algorithm>
+#include <cstdlib>
+
+#include "frontend/log.h"
+#include "iscsi/session.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+
+namespace remvol {
+
+namespace {
+
+// Refreshes the status texts of the LUNs of the target at `dbidx`, with `entry` as the record for each.
+void _refresh_luns(TargetEntry* entry, int dbidx) {
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+    if (ktree_get_lun_entry_by_dbidx(entry, dbidx, slot) != kOk) break;
+    int format_state = kFormatIdle;
+    ktree_get_lun_format_state(dbidx, slot, &format_state);
+    ktree_update_lun_status(entry, format_state == kFormatting ? 1 : 0);
+  }
+  ktree_refresh_total_luncnt();
+}
+
+// Refreshes the target called `name` at `dbidx`. Returns 0, also when it had to be skipped, or -103.
+int _refresh_target(const char* name, int dbidx) {
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(name, &entry) != kOk) return kOk;
+  const int found = ktree_update_dev(&entry);
+  if (found == kListingFailed) {
+    LOG(2, "iscsiadm -m session failed. Skip this target.");
+    return kOk;
+  }
+  if (found == kTreeFailed) {
+    LOG(0, "set value to ktree failed. Exit.");
+    return kTreeFailed;
+  }
+  ktree_update_status(&entry);
+  _refresh_luns(&entry, dbidx);
+  return kOk;
+}
+
+// Refreshes the targets and deletes slots without a name, garbage of an interrupted add or delete. The slot
+// that moves into a deleted one's place is visited next; no more slots are visited than were counted. Returns
+// 0 or -103.
+int _refresh_targets(int count) {
+  int slot = 1;
+  for (int visited = 0; visited < count; visited++) {
+    char name[sizeof TargetEntry::target_name];
+    if (tree_read(KeyText(key::kTargetName, slot), name)) {
+      if (_refresh_target(name, slot) != kOk) return kTreeFailed;
+      slot++;
+      continue;
+    }
+    const KeyText path(key::kTarget, slot);
+    if (tree_delete(path) == kOk) continue;
+    LOG(0, "ktreec_del() of path '%s' failed", path.c_str());
+    slot++;
+  }
+  return kOk;
+}
+
+// Deletes the nameless slots behind the counted ones, up to the first without a status.
+void _prune_slots_behind(int count) {
+  int slot = count + 1;
+  for (int visited = count; visited < kMaxTargets; visited++) {
+    if (!tree_present(KeyText(key::kTargetStatus, slot))) return;
+    if (!tree_slot_is_free(KeyText(key::kTargetName, slot))) {
+      slot++;
+      continue;
+    }
+    const KeyText path(key::kTarget, slot);
+    LOG(0, "ktreec_del() of path '%s'", path.c_str());
+    if (tree_delete(path) != kOk) slot++;
+  }
+}
+
+}  // namespace
+
+int task_status() {
+  LOG(2, "start");
+  char text[128];
+  if (!tree_read(key::kTargetCount, text)) return kFailed;
+  const int count = std::min(atoi(text), kMaxTargets);
+  if (_refresh_targets(count) != kOk) return kTreeFailed;
+  _prune_slots_behind(count);
+  LOG(2, "end");
+  return kOk;
+}
+
+}  // namespace remvol
