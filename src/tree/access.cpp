@@ -33,12 +33,20 @@ bool tree_slot_is_free(const char* key) {
 }
 
 int tree_write(const char* key, const char* value) {
-  return ktreec_set(main_socket, 0, key, value) == 0 ? kOk : kTreeFailed;
+  return tree_write_to(main_socket, key, value);
+}
+
+int tree_write_to(const char* socket, const char* key, const char* value) {
+  return ktreec_set(socket, 0, key, value) == 0 ? kOk : kTreeFailed;
 }
 
 int tree_write_with_tries(const char* key, const char* value, Caller caller) {
+  return tree_write_with_tries_to(main_socket, key, value, caller);
+}
+
+int tree_write_with_tries_to(const char* socket, const char* key, const char* value, Caller caller) {
   for (int tries = 0; tries < kWriteTries; tries++) {
-    if (tree_write(key, value) == kOk) return kOk;
+    if (tree_write_to(socket, key, value) == kOk) return kOk;
     LOG_AT(caller, 0, "ktreec_set(%s) failed", key);
   }
   return kTreeFailed;

@@ -33,7 +33,7 @@ enum VolumeState : int {
 
 enum AccessRight : int { VOL_AC_RO = 0, VOL_AC_RW = 1 };
 
-// Writes the target's connect state in one try. Returns 0, -1 (out of memory) or -103.
+// Writes the target's connect state in one try. Returns 0 or -103.
 int ktree_set_connect_state(int dbidx, int state);
 
 // Writes the LUN's access right. Returns 0; -1 for a right that is neither VOL_AC_RW nor VOL_AC_RO or a dbidx

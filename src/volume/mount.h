@@ -32,9 +32,6 @@ int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share)
 // when `path` is no mount point; -1 for a null path or a failed remount.
 int remount_mnt_path(const char* path, int wait_seconds);
 
-// Has the SMB and AFP services reload their shares. Returns 0.
-int reload_share_services();
-
 }  // namespace remvol
 
 #endif

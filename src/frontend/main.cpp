@@ -1,0 +1,101 @@
+// remvol: one command of the appliance a run. main reads the command line, runs the command's handler and
+// records the outcome.
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+
+#include "frontend/commands.h"
+#include "frontend/log.h"
+#include "frontend/options.h"
+#include "frontend/remvol_debug.h"
+#include "frontend/request.h"
+#include "ktreec.h"
+#include "support/text.h"
+#include "sysaux.h"
+#include "tree/access.h"
+#include "tree/keys.h"
+#include "volume/share_services.h"
+
+using namespace remvol;
+
+namespace {
+
+constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
+constexpr char kResetMark[] = "/tmp/reset_default";  // while it exists, the flash copy stays as it is
+constexpr int kFailureStatus = -1;
+
+// Those who started the command poll this key: empty while it runs, then its result.
+void record_result(const char* value) {
+  ktreec_set(main_socket, 0, KeyText("%s/%s", key::kResult, gs_str_command), value);
+}
+
+int fail(bool show_usage) {
+  if (show_usage) print_usage();
+  fflush(stdout);
+  // Only the SMB service is reloaded, and on every failure: users of the shares see what is left of them.
+  (void)!system("winshare_reload");
+  if (gs_str_command != nullptr) record_result("-1");
+  puts("execute failed.");
+  return kFailureStatus;
+}
+
+int succeed(const Command& command, int result) {
+  record_result(NumberText("%d", result));
+  ktreec_dump(main_socket, 0, kSettingsFile);
+  if (command.persists && access(kResetMark, F_OK) != 0) {
+    System("flashrun \"cp -f %s /usr/local/config/\"", kSettingsFile);
+  }
+  if (command.persists) reload_share_services();
+  return result;
+}
+
+const char* failure_message(const Command& command) {
+  const bool for_all = command.failure_all != nullptr && (OPT_FLAG & kOptName) == 0;
+  return for_all ? command.failure_all : command.failure;
+}
+
+int run(const Command& command, const Options& options, Caller caller) {
+  record_result("");
+  if (command.run == nullptr) return fail(false);
+  if ((OPT_FLAG & command.required) != command.required) {
+    LOG_AT(caller, 1, "OPT_FLAG: %08x", OPT_FLAG);
+    return fail(false);
+  }
+  const int result = command.run(options);
+  if (result != 0 && !command.reports_value) {
+    LOG_AT(caller, 1, "%s", failure_message(command));
+    return fail(false);
+  }
+  return succeed(command, result);
+}
+
+void keep_program_path(int argc, char** argv) {
+  if (argc > 0) copy_text(program_path, argv[0]);
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  debug_level = dbg_get_remvol_debug_lv();
+  keep_program_path(argc, argv);
+  for (int i = 0; i < argc; i++) LOG(1, "arg[%d]: '%s'", i, argv[i]);
+  request_target = TargetEntry();
+  Options options;
+  switch (parse_options(argc, argv, &options)) {
+    case ParseEnd::kExit:
+      return 0;
+    case ParseEnd::kFail:
+      return fail(false);
+    case ParseEnd::kUsage:
+      return fail(true);
+    case ParseEnd::kReady:
+      break;
+  }
+  if (gs_str_command == nullptr) {
+    fprintf(stderr, "%s: %s:%d: %s: Assertion `gs_str_command' failed.\n", program_path, LOG_SOURCE, __LINE__,
+            __func__);
+    abort();
+  }
+  return run(kCommands[options.command], options, Caller());
+}

@@ -1,0 +1,229 @@
+#include "frontend/options.h"
+
+#include <arpa/inet.h>
+#include <getopt.h>
+#include <netdb.h>
+#include <sys/socket.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "frontend/commands.h"
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/keys.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kVersion = 1;
+constexpr size_t kAddressSize = sizeof(TargetEntry::ip);
+constexpr char kShortOptions[] = "i:p:n:s:vc:U:P:d:l:ho:w:";
+
+// The long options are the rows of the command table.
+const option* long_options() {
+  static option options[kCommandCount + 1] = {};
+  for (int i = 0; i < kCommandCount; i++) {
+    options[i].name = kCommands[i].name;
+    options[i].val = i == kHelpCommand ? 'h' : 0;
+  }
+  return options;
+}
+
+ParseEnd choose_command(int index, Options* options) {
+  if (options->command >= 0) {
+    LOG(1, "Command parameter check failed, %d & %d", options->command, index);
+    return ParseEnd::kFail;
+  }
+  gs_str_command = kCommands[index].name;
+  if (optarg != nullptr) printf(" with arg %s", optarg);
+  putchar('\n');
+  options->command = index;
+  return ParseEnd::kReady;
+}
+
+void log_option(int option, Caller caller) {
+  LOG_AT(caller, 1, "opt('%c') with arg '%s'", option, optarg);
+  LOG_AT(caller, 1, "OPT_FLAG: %08x", OPT_FLAG);
+}
+
+template <size_t N>
+ParseEnd take_name(int option, unsigned bit, char (&field)[N]) {
+  if (check_name(optarg) < 0) {
+    LOG(1, "Command parameter check failed, wrong name: '%s'", optarg);
+    return ParseEnd::kFail;
+  }
+  OPT_FLAG |= bit;
+  copy_text(field, optarg);
+  log_option(option, Caller());
+  return ParseEnd::kReady;
+}
+
+ParseEnd take_number(int option, unsigned bit, int32_t* field) {
+  OPT_FLAG |= bit;
+  *field = atoi(optarg);
+  log_option(option, Caller());
+  return ParseEnd::kReady;
+}
+
+// User and secret count only behind "-c 1"; given earlier they are dropped without a word. Callers rely on
+// that order.
+template <size_t N>
+void take_credential(int option, char (&field)[N]) {
+  if (request_target.chap != 1) return;
+  copy_text(field, optarg);
+  log_option(option, Caller());
+}
+
+ParseEnd take_secret() {
+  take_credential('P', request_target.chap_pwd);
+  // The process list shows a process's arguments to everybody.
+  explicit_bzero(optarg, strlen(optarg));
+  return ParseEnd::kReady;
+}
+
+ParseEnd take_address() {
+  OPT_FLAG |= kOptAddress;
+  log_option('i', Caller());
+  if (_resovle_net_address_to_ip(request_target.ip, &request_target.inet_type, optarg) != 0) {
+    LOG(0, "ip address %s -> error", optarg);
+    return ParseEnd::kFail;
+  }
+  LOG(1, "get ip address %s = %s, inet_type = %s", optarg, request_target.ip,
+      request_target.inet_type == AF_INET ? "AF_INET" : "AF_INET6");
+  return ParseEnd::kReady;
+}
+
+ParseEnd store_debug_level() {
+  const NumberText value("%d", atoi(optarg));
+  LOG(0, "ktreec_set %s=%s", key::kDebugLevel, value.c_str());
+  if (tree_write(key::kDebugLevel, value) != kOk) LOG(0, "ktreec_set(%s) failed ", key::kDebugLevel);
+  return ParseEnd::kExit;
+}
+
+ParseEnd print_version() {
+  printf("\n\rremvol version: %d\n\r", kVersion);
+  return ParseEnd::kExit;
+}
+
+ParseEnd take_option(int option, int index, Options* options) {
+  switch (option) {
+    case 0:
+      return choose_command(index, options);
+    case 'n':
+      return take_name(option, kOptName, request_target.target_name);
+    case 's':
+      return take_name(option, kOptShare, request_target.share);
+    case 'c':
+      return take_number(option, kOptChap, &request_target.chap);
+    case 'p':
+      return take_number(option, kOptPort, &request_target.port);
+    case 'l':
+      return take_number(option, kOptLun, &request_target.lun);
+    case 'i':
+      return take_address();
+    case 'U':
+      take_credential(option, request_target.chap_name);
+      return ParseEnd::kReady;
+    case 'P':
+      return take_secret();
+    case 'o':
+      output_file = optarg;
+      return ParseEnd::kReady;
+    case 'w':
+      options->wait_seconds = atoi(optarg);
+      return ParseEnd::kReady;
+    case 'd':
+      return store_debug_level();
+    case 'v':
+      return print_version();
+    default:
+      return ParseEnd::kUsage;
+  }
+}
+
+int format_ipv4(char* address, const sockaddr_in& socket) {
+  char text[kAddressSize] = "";
+  if (inet_ntop(AF_INET, &socket.sin_addr, text, sizeof text) == nullptr) LOG(1, "inet_ntop failed");
+  memcpy(address, text, sizeof text);
+  return kOk;
+}
+
+int format_ipv6(char* address, const sockaddr_in6& socket) {
+  char text[INET6_ADDRSTRLEN] = "";
+  if (inet_ntop(AF_INET6, &socket.sin6_addr, text, sizeof text) == nullptr) {
+    puts("get address failed");
+    LOG(1, "inet_ntop failed");
+    return kFailed;
+  }
+  snprintf(address, kAddressSize, "[%s]", text);
+  return kOk;
+}
+
+}  // namespace
+
+ParseEnd parse_options(int argc, char** argv, Options* options) {
+  const option* const commands = long_options();
+  int index = 0;
+  int option = 0;
+  while ((option = getopt_long(argc, argv, kShortOptions, commands, &index)) != -1) {
+    const ParseEnd end = take_option(option, index, options);
+    if (end != ParseEnd::kReady) return end;
+  }
+  return ParseEnd::kReady;
+}
+
+int check_name(const char*) {
+  return 0;
+}
+
+int _resovle_net_address_to_ip(char* address, int* family, const char* host) {
+  if (address == nullptr || family == nullptr || host == nullptr || host[0] == '\0') return kFailed;
+  addrinfo hints = {};
+  hints.ai_socktype = SOCK_STREAM;
+  addrinfo* found = nullptr;
+  const int error = getaddrinfo(host, nullptr, &hints, &found);
+  if (error != 0) {
+    LOG(1, "getaddrinfo return %s\n", gai_strerror(error));
+    return kFailed;
+  }
+  *family = found->ai_family;
+  sockaddr_storage socket = {};
+  memcpy(&socket, found->ai_addr, found->ai_addrlen);
+  freeaddrinfo(found);
+  if (*family == AF_INET) return format_ipv4(address, reinterpret_cast<const sockaddr_in&>(socket));
+  if (*family == AF_INET6) return format_ipv6(address, reinterpret_cast<const sockaddr_in6&>(socket));
+  LOG(1, "get ip address failed\n");
+  return kFailed;
+}
+
+// --add works without -c, though the text lists it: user interfaces show this text as it stands.
+void print_usage() {
+  printf(
+      "use: %s [\n"
+      "\t--init\n"
+      "\t--search -i IP -p port\n"
+      "\t--search_lun -n TARGET_NAME -i IP -p port -c CHAP [-U usename -P pwd]\n"
+      "\t--add -n TARGET_NAME -l Lun -i IP -p port -s shared -c CHAP [-U usename -P pwd]\n"
+      "\t--del -n TARGET_NAME\n"
+      "\t--del_lun -n TARGET_NAME -l LUN\n"
+      "\t--format -n TARGET_NAME -l LUN\n"
+      "\t--modify -n TARGET_NAME -c CHAP [-U usename -P pwd]\n"
+      "\t--modify_address -n TARGET_NAME -i IP -p port\n"
+      "\t--status\n"
+      "\t--check_share_name -s shared\n"
+      "\t--disconnect [-n TARGET_NAME]\n"
+      "\t--connect -n TARGET_NAME\n"
+      "\t--system_off (for system shutdown use only)\n"
+      "\t--deinit\n"
+      "\t--verupgrade\n"
+      "\r\n",
+      program_path);
+}
+
+}  // namespace remvol

@@ -1,0 +1,38 @@
+// The command line: from arguments into the request record.
+#ifndef REMVOL_FRONTEND_OPTIONS_H
+#define REMVOL_FRONTEND_OPTIONS_H
+
+namespace remvol {
+
+// How the reading of the command line ended.
+enum class ParseEnd {
+  kReady,  // run the command
+  kFail,   // take the failure path
+  kUsage,  // the same after the usage text
+  kExit,   // nothing more to do, exit status 0
+};
+
+// What main needs beside the request record.
+struct Options {
+  int command = -1;      // row of the command table; -1 when none was given
+  int wait_seconds = 0;  // argument of -w
+};
+
+// Reads the arguments into the request record and `options`. -d and -v do their work at once and end the
+// reading. The secret after -P is overwritten in `argv`.
+ParseEnd parse_options(int argc, char** argv, Options* options);
+
+// The one place where rules for target and share names would stand. Returns 0 to accept `name`, which it
+// always does, or a negative number.
+int check_name(const char* name);
+
+// Resolves a host name or address to the numeric text of its first result (IPv6 in square brackets) in
+// `address`, which holds at least 48 bytes, and its family in `family`. Returns 0 or -1.
+int _resovle_net_address_to_ip(char* address, int* family, const char* host);
+
+// Prints how to call the tool.
+void print_usage();
+
+}  // namespace remvol
+
+#endif

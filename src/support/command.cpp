@@ -1,0 +1,41 @@
+#include "support/command.h"
+
+#include <unistd.h>
+
+#include <cstdlib>
+#include <ctime>
+
+namespace remvol {
+
+int run_command(const char* command, Caller caller) {
+  const int status = system(command);
+  if (status != 0) LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
+  return status;
+}
+
+int command_exit_code(int status) {
+  return (status >> 8) & 0xff;
+}
+
+void log_command_status(int status, Caller caller) {
+  const int exited = (status & 0x7f) == 0 ? 1 : 0;
+  LOG_AT(caller, 2, "!!!ret=%d, WIFEXITED=%d, WEXITSTATUS=%d", status, exited, command_exit_code(status));
+}
+
+int process_system_cmd_mt(const char* command, int cycles, int max_wait_us) {
+  srand(static_cast<unsigned>(time(nullptr)));
+  int status = 0;
+  for (int cycle = 0; cycle < cycles; cycle++) {
+    if (cycle > 0 && max_wait_us >= 2) {
+      const int wait = rand() % max_wait_us;
+      LOG(0, "retry cmd : cycle = %d, time = %d", cycle, wait);
+      usleep(static_cast<useconds_t>(wait));
+    }
+    status = run_command(command);
+    if (status == 0) return 0;
+    log_command_status(status);
+  }
+  return status;
+}
+
+}  // namespace remvol

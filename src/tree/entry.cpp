@@ -1,0 +1,258 @@
+#include "tree/entry.h"
+
+#include <cstdlib>
+#include <cstring>
+
+#include "frontend/log.h"
+#include "ktreec.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/keys.h"
+#include "tree/state.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr size_t kValueSize = 256;
+
+// Copies the text at `key` into `field`, which stays as it is when the key is not present.
+template <size_t N>
+void read_field(const char* key, char (&field)[N]) {
+  char value[kValueSize];
+  if (tree_read(key, value)) copy_text(field, value);
+}
+
+void read_target_fields(TargetEntry* entry, int dbidx) {
+  entry->chap = tree_read_number(KeyText(key::kTargetChap, dbidx), 0);
+  read_field(KeyText(key::kTargetChapName, dbidx), entry->chap_name);
+  read_field(KeyText(key::kTargetChapPwd, dbidx), entry->chap_pwd);
+  read_field(KeyText(key::kTargetIp, dbidx), entry->ip);
+  entry->port = tree_read_number(KeyText(key::kTargetPort, dbidx), 0);
+  entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
+}
+
+int read_state(const char* key, int* value, int missing) {
+  char text[128];
+  const bool present = tree_read(key, text);
+  *value = present ? atoi(text) : missing;
+  return present ? kOk : kTreeFailed;
+}
+
+// Writes one value of a new entry. Returns whether the tree took it.
+bool set_value(const char* key, const char* value, Caller caller) {
+  if (tree_write(key, value) == kOk) return true;
+  LOG_AT(caller, 0, "ktreec_set() failed");
+  return false;
+}
+
+bool set_value(const char* key, int value, Caller caller) {
+  return set_value(key, NumberText("%d", value), caller);
+}
+
+}  // namespace
+
+int ktree_get_dbidx_by_targetname(const char* target_name) {
+  if (target_name == nullptr) return kFailed;
+  int dbidx = kFailed;
+  for (int n = 1; n <= kMaxTargets && dbidx == kFailed; n++) {
+    const KeyText key(key::kTargetName, n);
+    char name[kValueSize];
+    if (!tree_read(key, name)) {
+      LOG(1, "ktreec_get(%s) failed", key.c_str());
+      break;
+    }
+    if (strcmp(name, target_name) == 0) dbidx = n;
+  }
+  LOG(1, "get %s db_idx=%d", target_name, dbidx);
+  return dbidx;
+}
+
+int ktree_get_free_dbidx() {
+  for (int n = 1; n <= kMaxTargets; n++) {
+    if (!tree_slot_is_free(KeyText(key::kTargetName, n))) continue;
+    LOG(3, "free ent id: %d", n);
+    return n;
+  }
+  return kTreeFailed;
+}
+
+int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry) {
+  if (entry == nullptr) {
+    LOG(0, "Entry is NULL");
+    return kFailed;
+  }
+  *entry = TargetEntry();
+  const int dbidx = ktree_get_dbidx_by_targetname(target_name);
+  if (dbidx < 1) {
+    LOG(0, "Can not get entry from %s", target_name != nullptr ? target_name : "");
+    return kFailed;
+  }
+  entry->db_idx = dbidx;
+  copy_text(entry->target_name, target_name);
+  read_target_fields(entry, dbidx);
+  LOG(1, "get %s db_idx=%d", target_name, dbidx);
+  return kOk;
+}
+
+int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx) {
+  if (entry == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
+  *entry = TargetEntry();
+  char value[kValueSize];
+  if (!tree_read(KeyText(key::kTargetName, dbidx), value)) {
+    LOG(0, "Can not get entry from %d", dbidx);
+    return kFailed;
+  }
+  copy_text(entry->target_name, value);
+  entry->db_idx = dbidx;
+  if (!tree_read(KeyText(key::kLunNumber, dbidx, lun_dbidx), value)) {
+    LOG(2, "Can not get lun from %d", lun_dbidx);
+    return kFailed;
+  }
+  entry->lun = atoi(value);
+  entry->lun_db_idx = lun_dbidx;
+  read_field(KeyText(key::kLunShare, dbidx, lun_dbidx), entry->share);
+  read_field(KeyText(key::kLunDev, dbidx, lun_dbidx), entry->dev);
+  read_field(KeyText(key::kLunMntDev, dbidx, lun_dbidx), entry->mnt_dev);
+  read_field(KeyText(key::kLunMnt, dbidx, lun_dbidx), entry->mnt);
+  read_target_fields(entry, dbidx);
+  return kOk;
+}
+
+int ktree_update_current_targetcnt() {
+  int count = 0;
+  for (int n = 1; n <= kMaxTargets; n++) count += tree_present(KeyText(key::kTargetName, n)) ? 1 : 0;
+  return tree_write_with_tries(key::kTargetCount, NumberText("%d", count));
+}
+
+int ktree_get_total_luncnt() {
+  int total = 0;
+  for (int n = 1; n <= kMaxTargets && !tree_slot_is_free(KeyText(key::kTargetName, n)); n++) {
+    total += ktree_count_target_luns(n);
+  }
+  return total;
+}
+
+int ktree_count_target_luns(int dbidx) {
+  if (dbidx < 1) return kFailed;
+  int count = 0;
+  while (count < kMaxLunsPerTarget && !tree_slot_is_free(KeyText(key::kLunNumber, dbidx, count + 1))) count++;
+  return count;
+}
+
+int ktree_refresh_total_luncnt() {
+  return tree_write_with_tries(key::kTotalLunCount, NumberText("%d", ktree_get_total_luncnt()));
+}
+
+int ktree_update_current_luncnt(int dbidx) {
+  int count = 0;
+  for (int m = 1; m <= kMaxLunsPerTarget; m++) {
+    count += tree_present(KeyText(key::kLunNumber, dbidx, m)) ? 1 : 0;
+  }
+  const int result = tree_write_with_tries(KeyText(key::kTargetLunCount, dbidx), NumberText("%d", count));
+  const int total_result = ktree_refresh_total_luncnt();
+  return result != kOk ? result : total_result;
+}
+
+int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value) {
+  return read_state(KeyText(key::kLunFormatState, dbidx, lun_dbidx), value, -1);
+}
+
+int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value) {
+  return read_state(KeyText(key::kLunFormatProgress, dbidx, lun_dbidx), value, 0);
+}
+
+int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value) {
+  return read_state(KeyText(key::kLunVolumeState, dbidx, lun_dbidx), value, -1);
+}
+
+int ktree_get_connect_state(int dbidx, int* value) {
+  return read_state(KeyText(key::kTargetConnState, dbidx), value, -1);
+}
+
+int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
+  if (enable == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
+  *enable = 0;
+  char value[128] = "";
+  const int length =
+      ktreec_get_wb(main_socket, 0, KeyText(key::kLunEnable, dbidx, lun_dbidx), value, sizeof value);
+  if (length > 0 && value[0] != '\0') {
+    *enable = atoi(value) != 0 ? 1 : 0;
+    return kOk;
+  }
+  return length < 0 && value[0] != '\0' ? kFailed : kTreeFailed;
+}
+
+int ktree_get_free_lun_dbidx(int dbidx) {
+  if (ktree_get_total_luncnt() >= kMaxLuns) {
+    LOG(2, "max number of lun = %d reached", kMaxLuns);
+    return kFailed;
+  }
+  int m = 1;
+  for (; m <= kMaxLunsPerTarget; m++) {
+    if (!tree_slot_is_free(KeyText(key::kLunNumber, dbidx, m))) continue;
+    LOG(3, "free ent id: %d", m);
+    return m;
+  }
+  // The number printed is the one past the last slot, not the target's.
+  LOG(3, "fail to get free lun dbidx at target idx : %d", m);
+  return kTreeFailed;
+}
+
+int ktree_get_dbidx_by_lun(int dbidx, int lun) {
+  if (lun < 0) return kFailed;
+  int lun_dbidx = kFailed;
+  for (int m = 1; m <= kMaxLunsPerTarget && lun_dbidx == kFailed; m++) {
+    const KeyText key(key::kLunNumber, dbidx, m);
+    char value[kValueSize];
+    if (!tree_read(key, value)) {
+      LOG(1, "ktreec_get(%s) failed", key.c_str());
+      break;
+    }
+    if (atoi(value) == lun) lun_dbidx = m;
+  }
+  LOG(1, "get lun: %d at db_idx=%d", lun, lun_dbidx);
+  return lun_dbidx;
+}
+
+int ktree_add_lun_entry(TargetEntry* entry) {
+  if (entry == nullptr) return kFailed;
+  const int n = entry->db_idx >= 1 ? entry->db_idx : ktree_get_dbidx_by_targetname(entry->target_name);
+  if (n < 1 || ktree_get_dbidx_by_lun(n, entry->lun) >= 1) return kFailed;
+  const int m = ktree_get_free_lun_dbidx(n);
+  if (m <= 0) return kFailed;
+  entry->lun_db_idx = m;
+  const Caller here;
+  const bool stored = set_value(KeyText(key::kLunNumber, n, m), entry->lun, here) &&
+                      set_value(KeyText(key::kLunShare, n, m), entry->share, here) &&
+                      set_value(KeyText(key::kLunEnable, n, m), 1, here) &&
+                      set_value(KeyText(key::kLunAccessRight, n, m), VOL_AC_RW, here);
+  if (!stored) return kTreeFailed;
+  ktree_update_current_luncnt(n);
+  return m;
+}
+
+int ktree_add_entry(TargetEntry* entry) {
+  if (entry == nullptr || entry->target_name[0] == '\0' || entry->ip[0] == '\0' || entry->port < 0) {
+    return kFailed;
+  }
+  if (entry->chap != 0 && (entry->chap_name[0] == '\0' || entry->chap_pwd[0] == '\0')) return kFailed;
+  int n = ktree_get_dbidx_by_targetname(entry->target_name);
+  if (n < 1) n = ktree_get_free_dbidx();
+  if (n < 1) {
+    LOG(0, "ktree_get_free_dbidx() failed");
+    return kFailed;
+  }
+  entry->db_idx = n;
+  const Caller here;
+  bool stored = set_value(KeyText(key::kTargetName, n), entry->target_name, here);
+  stored &= set_value(KeyText(key::kTargetChap, n), entry->chap, here);
+  stored &= set_value(KeyText(key::kTargetChapName, n), entry->chap_name, here);
+  stored &= set_value(KeyText(key::kTargetChapPwd, n), entry->chap_pwd, here);
+  stored &= set_value(KeyText(key::kTargetIp, n), entry->ip, here);
+  stored &= set_value(KeyText(key::kTargetPort, n), entry->port, here);
+  return stored ? n : kFailed;
+}
+
+}  // namespace remvol

@@ -1,0 +1,110 @@
+#include "tree/state.h"
+
+#include "frontend/log.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+
+namespace remvol {
+
+int ktree_set_connect_state(int dbidx, int state) {
+  const KeyText key(key::kTargetConnState, dbidx);
+  if (tree_write(key, NumberText("%d", state)) == kOk) return kOk;
+  LOG(0, "ktreec_set(%s) failed", key.c_str());
+  return kTreeFailed;
+}
+
+int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx) {
+  if (right != VOL_AC_RW && right != VOL_AC_RO) {
+    LOG(0, "volume access right should be VOL_AC_RW or VOL_AC_RO, but you given %d", right);
+    return kFailed;
+  }
+  if (dbidx < 1 || lun_dbidx < 1) {
+    LOG(0, "db index must > 0");
+    return kFailed;
+  }
+  return tree_write_with_tries(KeyText(key::kLunAccessRight, dbidx, lun_dbidx), NumberText("%d", right));
+}
+
+int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx) {
+  if (right == nullptr) {
+    LOG(0, "vol_ac is null");
+    return kFailed;
+  }
+  if (dbidx < 1 || lun_dbidx < 1) {
+    LOG(0, "db index must > 0");
+    return kFailed;
+  }
+  const int stored = tree_read_number(KeyText(key::kLunAccessRight, dbidx, lun_dbidx), VOL_AC_RW);
+  *right = stored == VOL_AC_RO ? VOL_AC_RO : VOL_AC_RW;
+  return kOk;
+}
+
+int ktree_update_formatting_state(const TargetEntry* entry, int state) {
+  if (entry->db_idx < 1 || entry->lun_db_idx < 1) {
+    // Only a warning: the tree itself refuses a slot below 1.
+    LOG(0, "target or lun db index not given");
+  }
+  return tree_write_with_tries(KeyText(key::kLunFormatState, entry->db_idx, entry->lun_db_idx),
+                               NumberText("%d", state));
+}
+
+int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent) {
+  if (dbidx < 1 || lun_dbidx < 1) {
+    LOG(0, "target or lun db index not given");
+    return kFailed;
+  }
+  const KeyText key(key::kLunFormatProgress, dbidx, lun_dbidx);
+  const NumberText value("%d", percent);
+  LOG(2, "set %s = %s", key.c_str(), value.c_str());
+  return tree_write_with_tries(key, value);
+}
+
+int ktree_update_volume_state(const TargetEntry* entry, int state) {
+  const KeyText key(key::kLunVolumeState, entry->db_idx, entry->lun_db_idx);
+  const NumberText value("%d", state);
+  LOG(1, "set %s=%s", key.c_str(), value.c_str());
+  return tree_write_with_tries(key, value);
+}
+
+int ktree_update_all_volume_state(TargetEntry* entry, int state) {
+  if (entry == nullptr) return kFailed;
+  if (entry->db_idx < 1) entry->db_idx = ktree_get_dbidx_by_targetname(entry->target_name);
+  if (entry->db_idx < 1) return kFailed;
+  for (int m = 1; m <= kMaxLunsPerTarget; m++) {
+    if (!tree_present(KeyText(key::kLunNumber, entry->db_idx, m))) break;
+    entry->lun_db_idx = m;
+    const int result = ktree_update_volume_state(entry, state);
+    if (result != kOk) return result;
+  }
+  return kOk;
+}
+
+int ktree_update_mount_info(TargetEntry* entry, const char* node, const char* mount_point,
+                            const char* fs_type) {
+  copy_text(entry->mnt_dev, node);
+  copy_text(entry->mnt, mount_point);
+  const int n = entry->db_idx;
+  const int m = entry->lun_db_idx;
+  (void)tree_write(KeyText(key::kLunMntDev, n, m), entry->mnt_dev);
+  (void)tree_write(KeyText(key::kLunMnt, n, m), entry->mnt);
+  (void)tree_write(KeyText(key::kLunFsType, n, m), fs_type);
+  return kOk;
+}
+
+int ktree_update_initiator_iqn(const char* name) {
+  return tree_write_with_tries(key::kInitiatorName, name);
+}
+
+int ktree_record_connect_set(const TargetEntry* entry) {
+  const KeyText key(key::kTargetConnSet, entry->db_idx);
+  const NumberText value("%d", entry->conn_set);
+  LOG(1, "ktreec_set %s=%s", key.c_str(), value.c_str());
+  if (tree_write(key, value) == kOk) return kOk;
+  LOG(0, "ktreec_set() failed");
+  return kTreeFailed;
+}
+
+}  // namespace remvol

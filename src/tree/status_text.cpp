@@ -1,0 +1,169 @@
+#include "tree/status_text.h"
+
+#include "frontend/log.h"
+#include "iscsi/session_check.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "sysaux.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+#include "tree/state.h"
+#include "volume/mount.h"
+
+namespace remvol {
+
+namespace {
+
+using StatusText = Text<64>;
+
+// What the status text of a LUN is made of.
+struct LunState {
+  int right;
+  int format;
+  int volume;
+  int progress;
+};
+
+int write_logged(const char* key, const char* value, Caller caller) {
+  LOG_AT(caller, 1, "ktreec_set %s=%s", key, value);
+  return tree_write_with_tries(key, value, caller);
+}
+
+// The text, marked when the volume is read-only.
+StatusText with_right(const char* text, int right) {
+  return right == VOL_AC_RO ? StatusText("%s ( %s )", text, "Read Only") : StatusText("%s", text);
+}
+
+StatusText progress_text(const LunState& state) {
+  return StatusText("%s %d%%", "Formatting", state.progress);
+}
+
+bool failed(const LunState& state) {
+  return state.format == kFormatFailed || state.volume == kVolumeFailed;
+}
+
+// A file system is there, but it is not mounted.
+StatusText unmounted_text(const LunState& state) {
+  if (state.format == kFormatting) return progress_text(state);
+  if (state.volume == kVolumeCreating) return StatusText("Creating Volume");
+  if (state.volume == kVolumeUnsupported) return with_right("Unsupported File System", state.right);
+  if (!failed(state)) return StatusText("Offline");
+  return with_right("Create Volume Failed", state.right);
+}
+
+// No file system was recognised.
+StatusText unformatted_text(const LunState& state) {
+  if (state.format == kFormatting) return progress_text(state);
+  if (state.format == kFormatWaiting) return StatusText("Wait to Format");
+  if (state.volume == kVolumeCreating) return StatusText("Creating Volume");
+  if (failed(state)) return with_right("Create Volume Failed", state.right);
+  if (state.volume == kVolumeOffline) return StatusText("Offline");
+  // The user interface knows no read-only form of this text here.
+  if (state.volume == kVolumeUnsupported) return StatusText("Unsupported File System");
+  return with_right("No Format", state.right);
+}
+
+LunState read_lun_state(int n, int m, int right) {
+  LunState state = {right, 0, 0, 0};
+  ktree_get_lun_format_state(n, m, &state.format);
+  ktree_get_lun_volume_state(n, m, &state.volume);
+  ktree_get_lun_format_progress(n, m, &state.progress);
+  return state;
+}
+
+// Writes a status text and a size; both are tried even when the first fails.
+int write_status(const TargetEntry* entry, const char* text, const char* size, Caller caller) {
+  const int n = entry->db_idx;
+  const int m = entry->lun_db_idx;
+  const int status_result = write_logged(KeyText(key::kLunStatus, n, m), text, caller);
+  const int size_result = write_logged(KeyText(key::kLunSize, n, m), size, caller);
+  return status_result != kOk ? status_result : size_result;
+}
+
+// The text of a LUN on which the file system `fs_type` was recognised.
+int write_recognised(const TargetEntry* entry, const LunState& state, const char* fs_type, Caller caller) {
+  const int type_result =
+      write_logged(KeyText(key::kLunFsType, entry->db_idx, entry->lun_db_idx), fs_type, caller);
+  unsigned long long total = 0;
+  unsigned long long used = 0;
+  unsigned long long available = 0;
+  const Text<256> mount_point("%s%s", kMountRoot, entry->share);
+  int result = kOk;
+  if (sys_get_df_info(mount_point, &total, &used, &available) == 0) {
+    result =
+        write_status(entry, with_right("Running", state.right), Text<64>("%llu/%llu", used, total), caller);
+  } else {
+    result = write_status(entry, unmounted_text(state), "0/0", caller);
+  }
+  return type_result != kOk ? type_result : result;
+}
+
+int compose_lun_status(const TargetEntry* entry, int formatting, int right, Caller caller) {
+  const int n = entry->db_idx;
+  const int m = entry->lun_db_idx;
+  int enable = 0;
+  if (ktree_get_lun_enable(&enable, n, m) != kOk || enable == 0) {
+    // The size of a disabled LUN stays as it was.
+    return write_logged(KeyText(key::kLunStatus, n, m), "Disable", caller);
+  }
+  const LunState state = read_lun_state(n, m, right);
+  if (formatting != 0) return write_status(entry, progress_text(state), "0/0", caller);
+  if (entry->dev[0] == '\0') return write_status(entry, "Offline", "0/0", caller);
+  char fs_type[16] = "";
+  if (sys_get_fs_type(fs_type, entry->mnt_dev) == 0) {
+    return write_recognised(entry, state, fs_type, caller);
+  }
+  return write_status(entry, unformatted_text(state), "0/0", caller);
+}
+
+// Writes the connect state that goes with a status text. `printed` is the state that a failure names: those
+// who read the log know it as 1 for a connected target and 0 for every other.
+int follow_connect_state(int dbidx, int state, int printed, Caller caller) {
+  const int result = ktree_set_connect_state(dbidx, state);
+  if (result != kOk) LOG_AT(caller, 0, "ktree_set_connect_state(%d, %d) failed", dbidx, printed);
+  return result;
+}
+
+}  // namespace
+
+int ktree_update_status(const TargetEntry* entry) {
+  const int n = entry->db_idx;
+  const KeyText key(key::kTargetStatus, n);
+  const Caller here;
+  int state = -1;
+  ktree_get_connect_state(n, &state);
+  if (state == kRecovering && entry->conn_set == 1) return write_logged(key, "Reconnecting", here);
+  // The result of the connect-state write hides that of the text.
+  if (check_target_connected(entry->target_name) == 1) {
+    write_logged(key, "Connected", here);
+    return follow_connect_state(n, kConnected, 1, here);
+  }
+  if (state == kConnecting) {
+    write_logged(key, "Connecting", here);
+    return follow_connect_state(n, kConnecting, 0, here);
+  }
+  if (state != kConnectError) {
+    write_logged(key, "Disconnected", here);
+    return follow_connect_state(n, kDisconnected, 0, here);
+  }
+  return write_logged(key, "Connect Error", here);
+}
+
+int ktree_update_lun_status(const TargetEntry* entry, int formatting) {
+  LOG(2, "update lun status start");
+  if (entry->db_idx < 1 || entry->lun_db_idx < 1) {
+    LOG(1, "target or lun db index not given");
+    return kFailed;
+  }
+  int right = VOL_AC_RW;
+  if (ktree_get_lun_vol_access_right(&right, entry->db_idx, entry->lun_db_idx) != kOk) {
+    LOG(0, "ktree_get_lun_vol_access_right() failed");
+    return kFailed;
+  }
+  const int result = compose_lun_status(entry, formatting, right, Caller());
+  LOG(2, "update status end");
+  return result;
+}
+
+}  // namespace remvol

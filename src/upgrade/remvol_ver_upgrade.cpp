@@ -1,0 +1,167 @@
+#define LOG_SOURCE "remvol_ver_upgrade.cpp"
+#include "upgrade/remvol_ver_upgrade.h"
+
+#include <algorithm>
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+
+#include "frontend/log.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/keys.h"
+#include "tree/record.h"
+#include "tree/state.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kLunSlot = 1;  // a version-0 target has one LUN, number 0
+
+// A state number that moved from the target to its LUN.
+struct MovedState {
+  const char* from;
+  const char* to;
+};
+
+constexpr MovedState kMovedStates[] = {
+    {key::kOldFormatState, key::kLunFormatState},
+    {key::kOldFormatProgress, key::kLunFormatProgress},
+    {key::kOldVolumeState, key::kLunVolumeState},
+};
+
+int set_value(const char* key, const char* value, Caller caller) {
+  if (tree_write(key, value) == kOk) return kOk;
+  LOG_AT(caller, 0, "ktreec_set() failed");
+  return kFailed;
+}
+
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat-nonliteral"  // the formats are those of the table above
+void move_state(int n, const MovedState& state, Caller caller) {
+  char value[256];
+  if (!tree_read(KeyText(state.from, n), value)) return;
+  const KeyText key(state.to, n, kLunSlot);
+  const NumberText number("%d", atoi(value));
+  if (tree_write(key, number) != kOk)
+    LOG_AT(caller, 0, "ktreec_set %s= %s failed", key.c_str(), number.c_str());
+}
+#pragma GCC diagnostic pop
+
+// The target's share becomes its LUN's. A share that is missing is logged as a failed write: that is how
+// those who read the log know it.
+int move_share(int n, Caller caller) {
+  char share[256];
+  if (!tree_read(KeyText(key::kOldShare, n), share)) {
+    LOG_AT(caller, 0, "ktreec_set() failed");
+    return kFailed;
+  }
+  return set_value(KeyText(key::kLunShare, n, kLunSlot), share, caller);
+}
+
+int upgrade_target(int n, Caller caller) {
+  const KeyText name(key::kTargetName, n);
+  if (tree_slot_is_free(name)) {
+    LOG_AT(caller, 2, "get %s fail", name.c_str());
+    return kFailed;
+  }
+  if (set_value(KeyText(key::kTargetLunCount, n), "1", caller) != kOk ||
+      set_value(KeyText(key::kLunNumber, n, kLunSlot), "0", caller) != kOk ||
+      set_value(KeyText(key::kLunEnable, n, kLunSlot), "1", caller) != kOk ||
+      set_value(KeyText(key::kLunAccessRight, n, kLunSlot), NumberText("%d", VOL_AC_RW), caller) != kOk ||
+      move_share(n, caller) != kOk) {
+    return kFailed;
+  }
+  for (const MovedState& state : kMovedStates) move_state(n, state, caller);
+  return kOk;
+}
+
+int upgrade_targets(Caller caller) {
+  char text[256];
+  if (!tree_read(key::kTargetCount, text)) {
+    LOG_AT(caller, 1, "%s is NULL or disappear, exit func", key::kTargetCount);
+    return kOk;
+  }
+  const int count = atoi(text);
+  if (count <= 0) {
+    LOG_AT(caller, 1, "%s = 0, exit func", key::kTargetCount);
+    return kOk;
+  }
+  for (int n = 1; n <= count; n++) {
+    if (upgrade_target(n, caller) != kOk) return kFailed;
+  }
+  return kOk;
+}
+
+int upgrade_from(int stored, int current, Caller caller) {
+  if (stored > current) {
+    printf("remvol: Do not support settings downgrade to version %d", current);
+    return kFailed;
+  }
+  if (current == stored) {
+    LOG_AT(caller, 2, "the same version, EXIT");
+    return kOk;
+  }
+  if (stored != 0) {
+    LOG_AT(caller, 1, "Not supported versions, EXIT");
+    return kOk;
+  }
+  const int result = version_upgrade_v0_to_v1();
+  if (result == kOk) set_remvol_ver_to_db(current);
+  return result;
+}
+
+}  // namespace
+
+int get_remvol_ver_from_db(int* version) {
+  if (version == nullptr) return kFailed;
+  *version = tree_read_number(key::kVersion, 0);
+  return kOk;
+}
+
+int compare_remvol_ver(int* stored, int* current) {
+  if (stored == nullptr || current == nullptr || get_remvol_ver_from_db(stored) != kOk) return kFailed;
+  *current = kSettingsVersion;
+  const long long difference = llabs(static_cast<long long>(*current) - *stored);
+  return static_cast<int>(std::min<long long>(difference, INT_MAX));
+}
+
+int is_remvol_ver_changed() {
+  int stored = 0;
+  int current = 0;
+  return compare_remvol_ver(&stored, &current) != 0 ? 1 : 0;
+}
+
+int set_remvol_ver_to_db(int version) {
+  const NumberText value("%d", version);
+  if (tree_write(key::kVersion, value) == kOk) return kOk;
+  LOG(0, "ktreec_set %s = %s failed", key::kVersion, value.c_str());
+  return kFailed;
+}
+
+void delete_fw_flag() {
+  if (tree_delete(key::kFirmwareUpgrade) != kOk) LOG(2, "ktreec_del %s failed", key::kFirmwareUpgrade);
+}
+
+int version_upgrade_v0_to_v1() {
+  LOG(1, "v0 to v1 start");
+  const int result = upgrade_targets(Caller());
+  LOG(1, "v0 to v1 end, ret = %d", result);
+  return result;
+}
+
+int version_upgrade() {
+  LOG(1, "Start remvol settings upgrade");
+  int stored = 0;
+  int current = 0;
+  int result = compare_remvol_ver(&stored, &current) < 0 ? kFailed : kOk;
+  LOG(2, "preious version = %d, now version = %d", stored, current);
+  if (result == kOk) result = upgrade_from(stored, current, Caller());
+  delete_fw_flag();
+  LOG(1, "Finish remvol settings upgrade");
+  return result;
+}
+
+}  // namespace remvol
