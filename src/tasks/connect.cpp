@@ -12,6 +12,7 @@
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/mount.h"
+#include "volume/share_services.h"
 #include "volume/unmount.h"
 
 namespace remvol {

@@ -9,7 +9,7 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
-#include "volume/mount.h"
+#include "volume/share_services.h"
 #include "volume/unmount.h"
 
 namespace remvol {
