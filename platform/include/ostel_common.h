@@ -6,9 +6,13 @@
 extern "C" {
 #endif
 
+#pragma GCC visibility push(default)
+
 /* Returns the link speed of LAN port 0 (egiga0) or 1 (egiga1) in Mbit/s; 0 without a link or for another
- * port. */
+ * port. A link whose driver does not tell a speed counts as 1000. */
 int LIB_Get_Lan_Link_Speed(int port);
+
+#pragma GCC visibility pop
 
 #ifdef __cplusplus
 }

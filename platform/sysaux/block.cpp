@@ -1,0 +1,75 @@
+#include "block.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <limits.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+
+#include "fd.h"
+
+namespace sysaux {
+
+// The sysfs path of the block device `node`; a link to the device's directory.
+static bool block_dir_path(const char* node, char* path, size_t size) {
+  struct stat info;
+  if (node == nullptr || stat(node, &info) != 0 || !S_ISBLK(info.st_mode)) return false;
+  snprintf(path, size, "/sys/dev/block/%u:%u", major(info.st_rdev), minor(info.st_rdev));
+  return true;
+}
+
+int open_block_dir(const char* node) {
+  char path[64];
+  if (!block_dir_path(node, path, sizeof path)) return -1;
+  return open(path, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+}
+
+bool kernel_name(const char* node, char* name, size_t size) {
+  char path[64];
+  char target[PATH_MAX];
+  if (!block_dir_path(node, path, sizeof path)) return false;
+  const ssize_t length = readlink(path, target, sizeof target - 1);
+  if (length <= 0) return false;
+  target[length] = '\0';
+  const char* slash = strrchr(target, '/');
+  const char* last = slash != nullptr ? slash + 1 : target;
+  if (strlen(last) >= size) return false;
+  strcpy(name, last);
+  return true;
+}
+
+bool read_line_at(int dir, const char* name, char* text, size_t size) {
+  const Fd file(openat(dir, name, O_RDONLY | O_CLOEXEC));
+  if (!file.ok()) return false;
+  const ssize_t length = read(file.get(), text, size - 1);
+  if (length <= 0) return false;
+  text[length] = '\0';
+  text[strcspn(text, "\n")] = '\0';
+  return true;
+}
+
+bool read_number_at(int dir, const char* name, long long* value) {
+  char text[32];
+  if (!read_line_at(dir, name, text, sizeof text)) return false;
+  char* end = text;
+  errno = 0;
+  *value = strtoll(text, &end, 10);
+  return errno == 0 && end != text && *end == '\0';
+}
+
+bool first_mebibyte_readable(int fd) {
+  char chunk[65536];
+  posix_fadvise(fd, 0, kFirstMebibyte, POSIX_FADV_DONTNEED);
+  for (size_t at = 0; at < kFirstMebibyte;) {
+    const ssize_t got = pread(fd, chunk, sizeof chunk, static_cast<off_t>(at));
+    if (got < 0 && errno == EINTR) continue;
+    if (got <= 0) return false;
+    at += static_cast<size_t>(got);
+  }
+  return true;
+}
+
+}  // namespace sysaux

@@ -1,0 +1,103 @@
+#include "content.h"
+
+#include <blkid/blkid.h>
+#include <stdio.h>
+#include <string.h>
+
+#include "block.h"
+
+namespace sysaux {
+
+namespace {
+
+// The four answers of blkid_do_safeprobe (libblkid's manual).
+enum Answer { kFound = 0, kNothing = 1, kAmbivalent = -2, kFailed = -1 };
+
+int collect(blkid_partlist table, Extent* extents, int max) {
+  const int all = table != nullptr ? blkid_partlist_numof_partitions(table) : 0;
+  int count = 0;
+  for (int i = 0; i < all && count < max; ++i) {
+    blkid_partition partition = blkid_partlist_get_partition(table, i);
+    long long size = blkid_partition_get_size(partition);
+    // The kernel shows no more of a container than its first two sectors, so that nobody formats it.
+    if (blkid_partition_is_extended(partition) && size > 2) size = 2;
+    extents[count++] = {blkid_partition_get_partno(partition), blkid_partition_get_start(partition), size};
+  }
+  return count;
+}
+
+class Probe {
+ public:
+  explicit Probe(int device) : probe_(blkid_new_probe()) {
+    if (probe_ == nullptr || blkid_probe_set_device(probe_, device, 0, 0) != 0) return;
+    blkid_probe_enable_superblocks(probe_, 1);
+    blkid_probe_enable_partitions(probe_, 1);
+    // The backup GPT counts also where the first sectors were overwritten.
+    blkid_probe_set_partitions_flags(probe_, BLKID_PARTS_FORCE_GPT);
+    ready_ = true;
+  }
+  ~Probe() { blkid_free_probe(probe_); }
+  Probe(const Probe&) = delete;
+  Probe& operator=(const Probe&) = delete;
+
+  Answer run(int superblock_flags) {
+    if (!ready_) return kFailed;
+    blkid_probe_set_superblocks_flags(probe_, BLKID_SUBLKS_TYPE | superblock_flags);
+    return static_cast<Answer>(blkid_do_safeprobe(probe_));
+  }
+
+  const char* value(const char* tag) const {
+    const char* text = nullptr;
+    return blkid_probe_lookup_value(probe_, tag, &text, nullptr) == 0 ? text : nullptr;
+  }
+
+  // The partitions in the table. An empty table of another kind may hide a GPT, so that is looked for then.
+  int partitions(Extent* extents, int max) {
+    if (!ready_) return 0;
+    const int count = collect(blkid_probe_get_partitions(probe_), extents, max);
+    if (count > 0) return count;
+    char gpt[] = "gpt";
+    char* only[] = {gpt, nullptr};
+    blkid_probe_filter_partitions_type(probe_, BLKID_FLTR_ONLYIN, only);
+    return collect(blkid_probe_get_partitions(probe_), extents, max);
+  }
+
+ private:
+  blkid_probe probe_;
+  bool ready_ = false;
+};
+
+bool table_has_partitions(Probe& probe) {
+  // A protective MBR whose GPT cannot be used: the disk shrank, its sectors changed their size, or the table
+  // is damaged.
+  const char* type = probe.value("PTTYPE");
+  if (type != nullptr && strcmp(type, "PMBR") == 0) return true;
+  Extent first;
+  return probe.partitions(&first, 1) > 0;
+}
+
+}  // namespace
+
+Content recognise(int device, char name[16]) {
+  name[0] = '\0';
+  Probe probe(device);
+  Answer answer = probe.run(0);
+  if (answer != kAmbivalent && answer != kFailed && probe.value("TYPE") == nullptr) {
+    answer = probe.run(BLKID_SUBLKS_BADCSUM);
+  }
+  if (answer == kNothing) return Content::nothing;
+  if (answer != kFound && answer != kAmbivalent) return Content::unreadable;
+  const char* type = answer == kFound ? probe.value("TYPE") : "ambivalent";
+  const char* found = type != nullptr ? type : probe.value("PTTYPE");
+  snprintf(name, 16, "%.15s", found != nullptr ? found : "unknown");
+  if (type != nullptr) return Content::signature;
+  return table_has_partitions(probe) ? Content::partitions : Content::empty_table;
+}
+
+int read_table(int disk, Extent* extents, int max) {
+  Probe probe(disk);
+  if (probe.run(0) == kFailed) return -1;
+  return probe.partitions(extents, max);
+}
+
+}  // namespace sysaux

@@ -1,0 +1,31 @@
+// What a block device carries, recognised by libblkid's low-level probing. The library's cache, which may be
+// old, is never asked.
+#ifndef SYSAUX_CONTENT_H
+#define SYSAUX_CONTENT_H
+
+#include "partitions.h"
+
+namespace sysaux {
+
+enum class Content {
+  nothing,      // no signature that libblkid knows
+  signature,    // a file system, LVM, RAID, encryption, swap ... or several that contradict each other
+  empty_table,  // a partition table without partitions, and nothing else
+  partitions,   // a partition table with partitions
+  unreadable,   // a read failed, so nothing is known
+};
+
+// Recognises what the open device carries. A signature whose checksum is wrong counts: it marks data that
+// somebody may want to save. The name goes into `name`, which holds 16 characters, cut when longer: that of
+// the file system or other signature, "ambivalent" when several contradict each other, the table's name for a
+// table; empty otherwise.
+Content recognise(int device, char name[16]);
+
+// The partitions that the partition table of the open disk has, in the order of their numbers, at most `max`.
+// Returns their number, 0 also when there is no table, -1 when a read failed. A table that is left in the
+// backup GPT alone counts.
+int read_table(int disk, Extent* extents, int max);
+
+}  // namespace sysaux
+
+#endif

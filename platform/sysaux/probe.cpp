@@ -1,0 +1,89 @@
+// The module that recognises: file systems and partitions.
+#include <fcntl.h>
+#include <limits.h>
+#include <stdio.h>
+#include <string.h>
+#include <sys/stat.h>
+
+#include "block.h"
+#include "content.h"
+#include "fd.h"
+#include "modules.h"
+#include "partitions.h"
+
+using namespace sysaux;
+
+namespace {
+
+constexpr size_t kListSize = 1024;  // what the caller's buffer holds
+
+// Joins names with commas; a name that does not fit any more is left out whole.
+class NameList {
+ public:
+  explicit NameList(char* out) : out_(out) { out_[0] = '\0'; }
+  void add(const char* name) {
+    const size_t length = strlen(name);
+    if (used_ + length + 2 > kListSize) return;
+    if (used_ > 0) out_[used_++] = ',';
+    memcpy(out_ + used_, name, length + 1);
+    used_ += length;
+  }
+
+ private:
+  char* out_;
+  size_t used_ = 0;
+};
+
+// Names a partition as the kernel does: sda1, but loop0p1 and nvme0n1p1 after a digit.
+void partition_name(const char* disk, int number, char* name, size_t size) {
+  const size_t length = strlen(disk);
+  const bool digit = length > 0 && disk[length - 1] >= '0' && disk[length - 1] <= '9';
+  snprintf(name, size, "%s%s%d", disk, digit ? "p" : "", number);
+}
+
+// Lists the partitions of the table that the kernel has not read, and has the kernel make them. They count
+// also when it refuses, because a disk with partitions must never pass for an empty one.
+int list_unread_table(const char* device, int block_dir, NameList* names) {
+  Extent extents[kMaxPartitions];
+  Partition shown;
+  char disk_name[32];
+  char name[64];
+  const Fd disk(open(device, O_RDONLY | O_CLOEXEC));
+  if (!disk.ok() || !kernel_name(device, disk_name, sizeof disk_name)) return -1;
+  const int count = read_table(disk.get(), extents, kMaxPartitions);
+  for (int i = 0; i < count; ++i) {
+    partition_name(disk_name, extents[i].number, name, sizeof name);
+    names->add(name);
+    if (announce_partition(disk.get(), block_dir, extents[i], &shown))
+      wait_for_node(block_dir, disk_name, shown.name);
+  }
+  return count;
+}
+
+}  // namespace
+
+int sysaux_probe_fs_type(char* out, const char* node) {
+  struct stat info;
+  out[0] = '\0';
+  if (node == nullptr || stat(node, &info) != 0 || !S_ISBLK(info.st_mode)) return -1;
+  const Fd device(open(node, O_RDONLY | O_CLOEXEC));
+  if (!device.ok()) return -1;
+  const Content content = recognise(device.get(), out);
+  if (content == Content::nothing) return 1;
+  if (content != Content::unreadable) return 0;
+  // sys_check_dev accepts a node that reads well at its start. Where a read failed further on, the node must
+  // not look empty then, because an empty one is formatted.
+  if (!first_mebibyte_readable(device.get())) return -1;
+  strcpy(out, "unreadable");
+  return 0;
+}
+
+int sysaux_probe_partition_list(char* out, const char* device) {
+  PartitionList known;
+  NameList names(out);
+  const Fd block_dir(open_block_dir(device));
+  if (!block_dir.ok() || !read_partitions(block_dir.get(), &known)) return -1;
+  if (known.count == 0) return list_unread_table(device, block_dir.get(), &names);
+  for (int i = 0; i < known.count; ++i) names.add(known.at[i].name);
+  return known.count;
+}
