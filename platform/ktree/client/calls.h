@@ -1,0 +1,34 @@
+// The operations of the client, with more to tell than the C interface can: ktreec_*() and the ktreec program
+// are made of these.
+#pragma once
+
+#include <cstddef>
+
+#include "ktree/client/channel.h"
+
+namespace ktree::client {
+
+// Why a call failed, as a person reads it; empty when there is nothing to add to the result.
+struct Reason {
+  char text[kMaxErrorBytes + 1];
+};
+
+[[nodiscard]] Result set(const char* socket, const char* path, const char* value);
+[[nodiscard]] Result del(const char* socket, const char* path);
+
+// Puts at most `room` bytes of the value into `buffer` and their number into `size`.
+[[nodiscard]] Result get(const char* socket, const char* path, char* buffer, size_t room, size_t& size);
+
+// Replaces `file` by the settings file of the tree.
+[[nodiscard]] Result dump(const char* socket, const char* file, Reason& reason);
+
+// Writes the settings file of the tree to `fd`.
+[[nodiscard]] Result dump_to(const char* socket, int fd, Reason& reason);
+
+// Makes the tree what `file` holds.
+[[nodiscard]] Result load(const char* socket, const char* file, Reason& reason);
+
+// Writes the listing of the subtree at `path` ("/" is the whole tree) to `fd`.
+[[nodiscard]] Result list_to(const char* socket, const char* path, int fd, Reason& reason);
+
+}  // namespace ktree::client

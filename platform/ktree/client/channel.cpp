@@ -1,0 +1,316 @@
+#include "ktree/client/channel.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <pthread.h>
+#include <sys/socket.h>
+#include <sys/time.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+
+namespace ktree::client {
+namespace {
+
+constexpr int kTries = 3;
+
+struct Channel {
+  Channel* next;
+  pthread_mutex_t lock;
+  int fd;       // -1: not connected
+  pid_t owner;  // the process that connected: a forked child must not speak on its parent's connection
+  sockaddr_un address;
+};
+
+pthread_mutex_t channels_lock = PTHREAD_MUTEX_INITIALIZER;
+Channel* channels = nullptr;
+
+// The end of a request in milliseconds of CLOCK_MONOTONIC.
+struct Deadline {
+  int64_t end;
+  bool tight;  // some of the time has gone by
+
+  static int64_t now() {
+    timespec time = {};
+    clock_gettime(CLOCK_MONOTONIC, &time);
+    return int64_t{time.tv_sec} * 1000 + time.tv_nsec / 1000000;
+  }
+  [[nodiscard]] int64_t left() const {
+    const int64_t milliseconds = end - now();
+    return milliseconds > 0 ? milliseconds : 0;
+  }
+};
+
+// What became of one try.
+enum class Outcome {
+  answered,
+  not_sent,   // the daemon cannot have read the whole request
+  lost,       // the connection ended, the daemon may have carried the request out
+  timed_out,  // or the daemon speaks another language
+};
+
+// A thread of the parent may have held a lock at the fork; in the child nobody would ever release it.
+void unlock_in_child() {
+  pthread_mutex_init(&channels_lock, nullptr);
+  for (Channel* channel = channels; channel != nullptr; channel = channel->next) {
+    pthread_mutex_init(&channel->lock, nullptr);
+  }
+}
+
+Channel* make_channel(const char* socket) {
+  auto* channel = static_cast<Channel*>(calloc(1, sizeof(Channel)));
+  if (channel == nullptr) {
+    return nullptr;
+  }
+  if (channels == nullptr) {
+    pthread_atfork(nullptr, nullptr, unlock_in_child);
+  }
+  pthread_mutex_init(&channel->lock, nullptr);
+  channel->fd = -1;
+  channel->address.sun_family = AF_UNIX;
+  strcpy(channel->address.sun_path, socket);
+  channel->next = channels;
+  channels = channel;
+  return channel;
+}
+
+// The channel of `socket`, made at its first use; null when the path is no socket's. Never removed.
+Channel* find_channel(const char* socket) {
+  const size_t length = strlen(socket);
+  if (length == 0 || length >= sizeof(sockaddr_un::sun_path)) {
+    return nullptr;
+  }
+  pthread_mutex_lock(&channels_lock);
+  Channel* channel = channels;
+  while (channel != nullptr && strcmp(channel->address.sun_path, socket) != 0) {
+    channel = channel->next;
+  }
+  if (channel == nullptr) {
+    channel = make_channel(socket);
+  }
+  pthread_mutex_unlock(&channels_lock);
+  return channel;
+}
+
+void disconnect(Channel& channel) {
+  if (channel.fd >= 0) {
+    close(channel.fd);
+  }
+  channel.fd = -1;
+}
+
+// Waits until `fd` is ready for `events`. Returns false when the time is over.
+bool wait_for(int fd, short events, Deadline& deadline) {
+  deadline.tight = true;
+  for (;;) {
+    pollfd entry = {fd, events, 0};
+    const int ready = poll(&entry, 1, static_cast<int>(deadline.left()));
+    if (ready > 0) {
+      return true;
+    }
+    if (ready == 0 || errno != EINTR) {
+      return false;
+    }
+  }
+}
+
+// Opens a socket above the standard descriptors: a program that runs without them would print into it.
+int open_socket() {
+  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (fd < 0 || fd > STDERR_FILENO) {
+    return fd;
+  }
+  const int above = fcntl(fd, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
+  close(fd);
+  return above;
+}
+
+// The socket's own time limits bound the connect (which waits while the daemon's backlog is full) and the
+// usual receive.
+bool connect_channel(Channel& channel, Deadline& deadline) {
+  const int64_t left = deadline.left();
+  const timeval limit = {left / 1000, (left % 1000) * 1000 + 1};
+  const int fd = open_socket();
+  if (fd < 0) {
+    return false;
+  }
+  if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit) != 0 ||
+      setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit) != 0 ||
+      connect(fd, reinterpret_cast<const sockaddr*>(&channel.address), sizeof channel.address) != 0) {
+    close(fd);
+    return false;
+  }
+  deadline.tight = true;
+  channel.fd = fd;
+  channel.owner = getpid();
+  return true;
+}
+
+// The parts of a message that are still to be moved.
+struct Parts {
+  iovec part[3];
+  size_t count;
+  size_t left;
+
+  void advance(size_t done) {
+    left -= done;
+    for (size_t i = 0; i < count && done > 0; i++) {
+      const size_t step = done < part[i].iov_len ? done : part[i].iov_len;
+      part[i].iov_base = static_cast<char*>(part[i].iov_base) + step;
+      part[i].iov_len -= step;
+      done -= step;
+    }
+  }
+};
+
+iovec readable(const void* data, size_t size) {
+  return {const_cast<void*>(data), size};
+}
+
+void pass_descriptor(msghdr& message, cmsghdr* control, int fd) {
+  message.msg_control = control;
+  message.msg_controllen = CMSG_SPACE(sizeof fd);
+  control->cmsg_level = SOL_SOCKET;
+  control->cmsg_type = SCM_RIGHTS;
+  control->cmsg_len = CMSG_LEN(sizeof fd);
+  memcpy(CMSG_DATA(control), &fd, sizeof fd);
+}
+
+Outcome send_request(int fd, const Call& call, Deadline& deadline) {
+  RequestHeader header = {};
+  header.length = static_cast<uint32_t>(sizeof header - kLengthBytes + call.path.size() + call.value.size());
+  header.operation = static_cast<uint8_t>(call.operation);
+  header.path_length = static_cast<uint16_t>(call.path.size());
+  Parts parts = {{readable(&header, sizeof header), readable(call.path.data(), call.path.size()),
+                  readable(call.value.data(), call.value.size())},
+                 3,
+                 sizeof header + call.path.size() + call.value.size()};
+  alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int))] = {};
+  msghdr message = {};
+  message.msg_iov = parts.part;
+  message.msg_iovlen = parts.count;
+  if (call.document >= 0) {
+    pass_descriptor(message, reinterpret_cast<cmsghdr*>(control), call.document);
+  }
+  while (parts.left > 0) {
+    const ssize_t n = sendmsg(fd, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (n > 0) {
+      parts.advance(static_cast<size_t>(n));
+      message.msg_control = nullptr;
+      message.msg_controllen = 0;
+    } else if (errno != EINTR && errno != EAGAIN) {
+      return Outcome::not_sent;
+    } else if (!wait_for(fd, POLLOUT, deadline)) {
+      return Outcome::timed_out;
+    }
+  }
+  return Outcome::answered;
+}
+
+// The end of the connection as a receive sees it. The kernel says ECONNRESET when the other side closed with
+// something of ours unread (unix(7) sockets do, unix_release_sock() in the kernel): the request was then not
+// carried out.
+Outcome lost_connection(ssize_t received) {
+  return received < 0 && errno == ECONNRESET ? Outcome::not_sent : Outcome::lost;
+}
+
+Outcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& deadline) {
+  Parts parts = {{{&header, sizeof header}, {call.body, call.room}, {}}, 2, sizeof header + call.room};
+  msghdr message = {};
+  message.msg_iov = parts.part;
+  message.msg_iovlen = parts.count;
+  size_t have = 0;
+  size_t wanted = sizeof header;
+  while (have < wanted) {
+    if (deadline.tight && !wait_for(fd, POLLIN, deadline)) {
+      return Outcome::timed_out;
+    }
+    const ssize_t n = recvmsg(fd, &message, deadline.tight ? MSG_DONTWAIT : 0);
+    deadline.tight = true;
+    if (n > 0) {
+      parts.advance(static_cast<size_t>(n));
+      have += static_cast<size_t>(n);
+      if (have >= sizeof header) {
+        wanted = kLengthBytes + size_t{header.length};
+      }
+      if (wanted < sizeof header || wanted > sizeof header + call.room || have > wanted) {
+        return Outcome::timed_out;
+      }
+    } else if (n == 0 || (errno != EINTR && errno != EAGAIN)) {
+      return lost_connection(n);
+    }
+  }
+  call.size = wanted - sizeof header;
+  return Outcome::answered;
+}
+
+Outcome try_once(Channel& channel, Call& call, ReplyHeader& header, Deadline& deadline) {
+  const Outcome sent = send_request(channel.fd, call, deadline);
+  return sent == Outcome::answered ? receive_reply(channel.fd, call, header, deadline) : sent;
+}
+
+// A delete that was carried out must not be sent again: it would take the next sibling.
+bool may_try_again(Outcome outcome, Operation operation) {
+  return outcome == Outcome::not_sent || (outcome == Outcome::lost && operation != Operation::del);
+}
+
+Result result_of(uint8_t status) {
+  switch (static_cast<Status>(status)) {
+    case Status::done:
+      return Result::done;
+    case Status::missing:
+      return Result::missing;
+    case Status::refused:
+      return Result::refused;
+    case Status::damaged:
+      return Result::damaged;
+    case Status::failed:
+      break;
+  }
+  return Result::failed;
+}
+
+Result request_on(Channel& channel, Call& call) {
+  Deadline deadline = {Deadline::now() + kRequestMilliseconds, false};
+  if (channel.fd >= 0 && channel.owner != getpid()) {
+    disconnect(channel);
+  }
+  for (int i = 0; i < kTries; i++) {
+    if (channel.fd < 0 && !connect_channel(channel, deadline)) {
+      return Result::unreachable;
+    }
+    ReplyHeader header = {};
+    const Outcome outcome = try_once(channel, call, header, deadline);
+    if (outcome == Outcome::answered) {
+      return result_of(header.status);
+    }
+    disconnect(channel);
+    if (!may_try_again(outcome, call.operation)) {
+      break;
+    }
+  }
+  return Result::unreachable;
+}
+
+}  // namespace
+
+Result request(const char* socket, Call& call) {
+  call.size = 0;
+  Channel* channel = find_channel(socket == nullptr ? kDefaultSocket : socket);
+  if (channel == nullptr) {
+    return Result::unreachable;
+  }
+  if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) {
+    return Result::refused;
+  }
+  pthread_mutex_lock(&channel->lock);
+  const Result result = request_on(*channel, call);
+  pthread_mutex_unlock(&channel->lock);
+  return result;
+}
+
+}  // namespace ktree::client

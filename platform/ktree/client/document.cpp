@@ -1,0 +1,188 @@
+#include "ktree/client/document.h"
+
+#include <fcntl.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstring>
+
+#include "ktree/limits.h"
+
+namespace ktree::client {
+namespace {
+
+int write_all(int fd, const char* data, size_t size) {
+  while (size > 0) {
+    const ssize_t n = write(fd, data, size);
+    if (n > 0) {
+      data += n;
+      size -= static_cast<size_t>(n);
+    } else if (n == 0 || errno != EINTR) {
+      return n == 0 ? EIO : errno;
+    }
+  }
+  return 0;
+}
+
+// Copies `from`, from offset 0 to its end, to the position of `to`. Returns 0 or an errno value.
+int copy_all(int from, int to) {
+  char buffer[65536];
+  off_t offset = 0;
+  for (;;) {
+    const ssize_t n = pread(from, buffer, sizeof buffer, offset);
+    if (n == 0) {
+      return 0;
+    }
+    if (n < 0) {
+      if (errno == EINTR) {
+        continue;
+      }
+      return errno;
+    }
+    const int wrong = write_all(to, buffer, static_cast<size_t>(n));
+    if (wrong != 0) {
+      return wrong;
+    }
+    offset += n;
+    if (static_cast<size_t>(offset) > kMaxDocumentBytes) {
+      return EFBIG;
+    }
+  }
+}
+
+// A file that is about to take the place of another one; removed again unless it did.
+class Replacement {
+ public:
+  // Makes it in the folder of `file`. Returns 0 or an errno value. The name holds the process and thread, so
+  // what is there already was left by one that died.
+  int create(const char* file) {
+    const int length = snprintf(path_, sizeof path_, "%s.%ld.tmp", file, static_cast<long>(gettid()));
+    if (length < 0 || static_cast<size_t>(length) >= sizeof path_) {
+      path_[0] = '\0';
+      return ENAMETOOLONG;
+    }
+    unlink(path_);
+    fd_ = open(path_, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+    if (fd_ < 0) {
+      path_[0] = '\0';
+      return errno;
+    }
+    // The process's mask may take bits away; it cannot add any.
+    return fchmod(fd_, 0600) == 0 ? 0 : errno;
+  }
+
+  // Writes it to the disk and gives it the name `file`. Returns 0 or an errno value.
+  int commit(const char* file) {
+    if (fsync(fd_) != 0) {
+      return errno;
+    }
+    const int closed = close(fd_);
+    fd_ = -1;
+    if (closed != 0 || rename(path_, file) != 0) {
+      return errno;
+    }
+    path_[0] = '\0';
+    return 0;
+  }
+
+  [[nodiscard]] int fd() const { return fd_; }
+
+  Replacement() = default;
+  Replacement(const Replacement&) = delete;
+  Replacement& operator=(const Replacement&) = delete;
+  ~Replacement() {
+    if (fd_ >= 0) {
+      close(fd_);
+    }
+    if (path_[0] != '\0') {
+      unlink(path_);
+    }
+  }
+
+ private:
+  int fd_ = -1;
+  char path_[PATH_MAX] = "";
+};
+
+// A rename is on the disk when its folder is.
+int sync_folder_of(const char* file) {
+  char folder[PATH_MAX];
+  const char* slash = strrchr(file, '/');
+  const size_t length = slash == nullptr ? 0 : static_cast<size_t>(slash - file) + 1;
+  if (length >= sizeof folder) {
+    return ENAMETOOLONG;
+  }
+  memcpy(folder, file, length);
+  folder[length] = '\0';
+  const int fd = open(length == 0 ? "." : folder, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (fd < 0) {
+    return errno;
+  }
+  // A file system without this operation says EINVAL (fsync(2)); there is nothing more to be done then.
+  const int wrong = fsync(fd) == 0 || errno == EINVAL ? 0 : errno;
+  close(fd);
+  return wrong;
+}
+
+// What a rename over `file` must not replace.
+int check_replaceable(const char* file) {
+  struct stat info = {};
+  if (stat(file, &info) != 0 || S_ISREG(info.st_mode)) {
+    return 0;
+  }
+  return S_ISDIR(info.st_mode) ? EISDIR : EINVAL;
+}
+
+}  // namespace
+
+MemoryFile::MemoryFile() : fd_(memfd_create("ktree", MFD_CLOEXEC)) {}
+
+MemoryFile::~MemoryFile() {
+  if (fd_ >= 0) {
+    close(fd_);
+  }
+}
+
+int MemoryFile::read_from(const char* file) const {
+  // Opening a pipe would wait for its other end.
+  const int fd = open(file, O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+  if (fd < 0) {
+    return errno;
+  }
+  struct stat info = {};
+  int wrong = fstat(fd, &info) != 0   ? errno
+              : S_ISREG(info.st_mode) ? 0
+              : S_ISDIR(info.st_mode) ? EISDIR
+                                      : EINVAL;
+  if (wrong == 0) {
+    wrong = copy_all(fd, fd_);
+  }
+  close(fd);
+  return wrong;
+}
+
+int MemoryFile::write_to(int fd) const {
+  return copy_all(fd_, fd);
+}
+
+int MemoryFile::replace_file(const char* file) const {
+  int wrong = check_replaceable(file);
+  if (wrong != 0) {
+    return wrong;
+  }
+  Replacement replacement;
+  wrong = replacement.create(file);
+  if (wrong == 0) {
+    wrong = write_to(replacement.fd());
+  }
+  if (wrong == 0) {
+    wrong = replacement.commit(file);
+  }
+  return wrong == 0 ? sync_folder_of(file) : wrong;
+}
+
+}  // namespace ktree::client

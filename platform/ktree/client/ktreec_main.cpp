@@ -1,0 +1,188 @@
+// ktreec: the command line client of the configuration tree.
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "ktree/client/calls.h"
+
+namespace {
+
+using ktree::client::Reason;
+using ktree::client::Result;
+
+constexpr int kNo = 1;  // the node is missing, or the daemon refused
+constexpr int kUsageError = 2;
+constexpr int kUnreachable = 3;
+
+constexpr char kUsage[] =
+    "Usage: ktreec [-S SOCKET] OPERATION\n"
+    "Reads and changes the configuration tree of the ktree daemon on SOCKET (/var/run/ktree_sock).\n"
+    "\n"
+    "  -g PATH        print the value\n"
+    "  -s PATH VALUE  set the value\n"
+    "  -d PATH        delete the node and all below it\n"
+    "  -t [PATH]      print the subtree, a line `path=value` for every value\n"
+    "  -l FILE        make the tree what the settings file FILE holds\n"
+    "  -D FILE        write the settings file FILE; - is standard output\n"
+    "  -h, --help     print this text and exit\n"
+    "  -V, --version  print the version and exit\n"
+    "\n"
+    "Exit status: 0 done, 1 missing or refused, 2 wrong usage, 3 the daemon cannot be reached.\n";
+
+struct Arguments {
+  const char* socket;
+  const char* operands[2];
+};
+
+int complain(const char* subject, const char* text) {
+  fprintf(stderr, "ktreec: %s: %s\n", subject, text);
+  return kNo;
+}
+
+// The exit status for `result`. What went wrong is told with `subject`; a node that is missing goes without a
+// word.
+int conclude(const Arguments& arguments, Result result, const char* subject, const char* reason) {
+  switch (result) {
+    case Result::done:
+      return EXIT_SUCCESS;
+    case Result::missing:
+      return kNo;
+    case Result::refused:
+      return complain(subject, "not a path or a value that the tree can take");
+    case Result::damaged:
+    case Result::failed:
+      return complain(subject, reason);
+    case Result::unreachable:
+      break;
+  }
+  const char* socket = arguments.socket == nullptr ? ktree::client::kDefaultSocket : arguments.socket;
+  complain(socket, "the daemon cannot be reached");
+  return kUnreachable;
+}
+
+int do_get(const Arguments& arguments) {
+  static char value[ktree::kMaxValueBytes + 1];
+  size_t size = 0;
+  const Result result =
+      ktree::client::get(arguments.socket, arguments.operands[0], value, ktree::kMaxValueBytes, size);
+  if (result == Result::done) {
+    value[size] = '\n';
+    if (fwrite(value, 1, size + 1, stdout) != size + 1 || fflush(stdout) != 0) {
+      return complain("standard output", strerror(errno));
+    }
+  }
+  return conclude(arguments, result, arguments.operands[0], "");
+}
+
+int do_set(const Arguments& arguments) {
+  const Result result = ktree::client::set(arguments.socket, arguments.operands[0], arguments.operands[1]);
+  return conclude(arguments, result, arguments.operands[0], "");
+}
+
+int do_del(const Arguments& arguments) {
+  const Result result = ktree::client::del(arguments.socket, arguments.operands[0]);
+  return conclude(arguments, result, arguments.operands[0], "");
+}
+
+int do_list(const Arguments& arguments) {
+  const char* path = arguments.operands[0] == nullptr ? "/" : arguments.operands[0];
+  Reason reason;
+  const Result result = ktree::client::list_to(arguments.socket, path, STDOUT_FILENO, reason);
+  return conclude(arguments, result, path, reason.text);
+}
+
+int do_load(const Arguments& arguments) {
+  Reason reason;
+  const Result result = ktree::client::load(arguments.socket, arguments.operands[0], reason);
+  return conclude(arguments, result, arguments.operands[0], reason.text);
+}
+
+int do_dump(const Arguments& arguments) {
+  const char* file = arguments.operands[0];
+  Reason reason;
+  if (strcmp(file, "-") == 0) {
+    const Result result = ktree::client::dump_to(arguments.socket, STDOUT_FILENO, reason);
+    return conclude(arguments, result, "standard output", reason.text);
+  }
+  return conclude(arguments, ktree::client::dump(arguments.socket, file, reason), file, reason.text);
+}
+
+struct Operation {
+  const char* option;
+  int least_operands;
+  int most_operands;
+  int (*run)(const Arguments& arguments);
+};
+
+constexpr Operation kOperations[] = {
+    {"-g", 1, 1, do_get},  {"-s", 2, 2, do_set},  {"-d", 1, 1, do_del},
+    {"-t", 0, 1, do_list}, {"-l", 1, 1, do_load}, {"-D", 1, 1, do_dump},
+};
+
+const Operation* find_operation(const char* option) {
+  for (const Operation& operation : kOperations) {
+    if (strcmp(operation.option, option) == 0) {
+      return &operation;
+    }
+  }
+  return nullptr;
+}
+
+int usage_error(const char* text) {
+  fprintf(stderr, "ktreec: %s; see ktreec --help\n", text);
+  return kUsageError;
+}
+
+// Takes the words after the program's name: the socket and one operation with its operands. Operands are
+// taken by their place, so a value may begin with a dash. Returns null, or what is wrong.
+const char* parse(char** word, Arguments& arguments, const Operation*& operation) {
+  while (*word != nullptr) {
+    if (strcmp(*word, "-S") == 0) {
+      if (*++word == nullptr) {
+        return "-S wants a socket";
+      }
+      arguments.socket = *word++;
+      continue;
+    }
+    if (operation != nullptr) {
+      return "one operation at a time";
+    }
+    operation = find_operation(*word++);
+    if (operation == nullptr) {
+      return "no such operation";
+    }
+    int taken = 0;
+    for (; taken < operation->most_operands && *word != nullptr; taken++) {
+      arguments.operands[taken] = *word++;
+    }
+    if (taken < operation->least_operands) {
+      return "an operand is missing";
+    }
+  }
+  return operation == nullptr ? "no operation" : nullptr;
+}
+
+bool is_one_of(const char* word, const char* one, const char* other) {
+  return strcmp(word, one) == 0 || strcmp(word, other) == 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  if (argc == 2 && is_one_of(argv[1], "-h", "--help")) {
+    fputs(kUsage, stdout);
+    return EXIT_SUCCESS;
+  }
+  if (argc == 2 && is_one_of(argv[1], "-V", "--version")) {
+    puts("ktreec " REMVOL_VERSION);
+    return EXIT_SUCCESS;
+  }
+  Arguments arguments = {};
+  const Operation* operation = nullptr;
+  const char* wrong = argc == 0 ? "no operation" : parse(argv + 1, arguments, operation);
+  return wrong == nullptr ? operation->run(arguments) : usage_error(wrong);
+}

@@ -1,0 +1,186 @@
+#include "ktree/endpoint.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <ctime>
+
+namespace ktree {
+namespace {
+
+constexpr int kLockTries = 50;  // 100 ms apart: a starting daemon holds the folder for much less than 5 s
+constexpr long kLockPause = 100000000;
+
+std::string folder_of(const std::string& path) {
+  size_t slash = path.rfind('/');
+  return slash == std::string::npos ? "." : slash == 0 ? "/" : path.substr(0, slash);
+}
+
+std::string name_of(const std::string& path) {
+  return path.substr(path.rfind('/') + 1);
+}
+
+bool lock_folder(int folder) {
+  for (int i = 0; i < kLockTries; i++) {
+    if (flock(folder, LOCK_EX | LOCK_NB) == 0) {
+      return true;
+    }
+    if (errno != EWOULDBLOCK && errno != EINTR) {
+      return false;
+    }
+    timespec pause = {0, kLockPause};
+    nanosleep(&pause, nullptr);
+  }
+  return false;
+}
+
+bool socket_address(const std::string& path, sockaddr_un& address) {
+  address = {};
+  address.sun_family = AF_UNIX;
+  if (path.empty() || path.size() >= sizeof address.sun_path) {
+    errno = ENAMETOOLONG;
+    return false;
+  }
+  memcpy(address.sun_path, path.c_str(), path.size() + 1);
+  return true;
+}
+
+// True when a process listens there; one that is too busy to take the connection at once does, too.
+bool is_answered(const sockaddr_un& address) {
+  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+  if (fd < 0) {
+    return true;
+  }
+  const bool refused = connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 &&
+                       (errno == ECONNREFUSED || errno == ENOENT);
+  close(fd);
+  return !refused;
+}
+
+std::string system_error(const std::string& what) {
+  return what + ": " + strerror(errno);
+}
+
+}  // namespace
+
+Endpoint::~Endpoint() {
+  if (folder_ >= 0) {
+    remove(socket_);
+    remove(pid_);
+    close(folder_);
+  }
+  if (listener_ >= 0) {
+    close(listener_);
+  }
+}
+
+bool Endpoint::open(const std::string& socket_path, const std::string& name, std::string& error) {
+  const std::string folder = folder_of(socket_path);
+  folder_ = ::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (folder_ < 0 || !lock_folder(folder_)) {
+    error = system_error(folder);
+    return false;
+  }
+  bool opened = make_free(socket_path, error);
+  if (opened) {
+    pid_.name = name_of(socket_path) + "_" + name + ".pid";
+    opened = write_pid();
+    if (!opened) {
+      error = system_error(folder + "/" + pid_.name);
+    } else if (!listen_on(socket_path)) {
+      opened = false;
+      error = system_error(socket_path);
+    }
+  }
+  flock(folder_, LOCK_UN);
+  return opened;
+}
+
+bool Endpoint::make_free(const std::string& socket_path, std::string& error) const {
+  sockaddr_un address = {};
+  struct stat info = {};
+  if (!socket_address(socket_path, address)) {
+    error = system_error(socket_path);
+    return false;
+  }
+  if (lstat(socket_path.c_str(), &info) != 0) {
+    return true;
+  }
+  if (!S_ISSOCK(info.st_mode)) {
+    error = socket_path + ": there is a file of this name that is not a socket";
+    return false;
+  }
+  if (is_answered(address)) {
+    error = socket_path + ": another daemon listens on this socket";
+    return false;
+  }
+  if (unlink(socket_path.c_str()) != 0) {
+    error = system_error(socket_path);
+    return false;
+  }
+  return true;
+}
+
+bool Endpoint::listen_on(const std::string& socket_path) {
+  sockaddr_un address = {};
+  if (!socket_address(socket_path, address)) {
+    return false;
+  }
+  listener_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+  if (listener_ < 0) {
+    return false;
+  }
+  // The mask makes the socket private from its first moment; a chmod after the bind would leave a gap.
+  const mode_t mask = umask(0177);
+  const int bound = bind(listener_, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+  umask(mask);
+  return bound == 0 && remember(socket_, name_of(socket_path)) && listen(listener_, SOMAXCONN) == 0;
+}
+
+// Writes the number into a file of another name first: whoever sees the pid file finds a whole number in it.
+bool Endpoint::write_pid() {
+  char text[24];
+  const int length = snprintf(text, sizeof text, "%ld\n", static_cast<long>(getpid()));
+  const std::string temporary = pid_.name + ".new";
+  unlinkat(folder_, temporary.c_str(), 0);
+  const int fd =
+      openat(folder_, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
+  if (fd < 0) {
+    return false;
+  }
+  const bool written = write(fd, text, static_cast<size_t>(length)) == length;
+  const bool closed = close(fd) == 0;
+  if (written && closed && renameat(folder_, temporary.c_str(), folder_, pid_.name.c_str()) == 0) {
+    return remember(pid_, pid_.name);
+  }
+  const int reason = errno;
+  unlinkat(folder_, temporary.c_str(), 0);
+  errno = reason;
+  return false;
+}
+
+bool Endpoint::remember(OwnFile& file, const std::string& name) const {
+  struct stat info = {};
+  if (fstatat(folder_, name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
+    return false;
+  }
+  file = {name, info.st_dev, info.st_ino};
+  return true;
+}
+
+void Endpoint::remove(const OwnFile& file) const {
+  struct stat info = {};
+  if (file.inode != 0 && fstatat(folder_, file.name.c_str(), &info, AT_SYMLINK_NOFOLLOW) == 0 &&
+      info.st_dev == file.device && info.st_ino == file.inode) {
+    unlinkat(folder_, file.name.c_str(), 0);
+  }
+}
+
+}  // namespace ktree

@@ -1,0 +1,46 @@
+// The daemon's places in the file system: its socket and the file with its process number.
+#pragma once
+
+#include <sys/types.h>
+
+#include <string>
+
+namespace ktree {
+
+// Holds the socket and the pid file from open() to the end of its life, and removes both then.
+class Endpoint {
+ public:
+  Endpoint() = default;
+  Endpoint(const Endpoint&) = delete;
+  Endpoint& operator=(const Endpoint&) = delete;
+  ~Endpoint();
+
+  // Makes the pid file SOCKET_NAME.pid and listens on `socket_path` (mode 0600). A socket file that a dead
+  // daemon left is replaced; when a daemon answers on it, or it is no socket, nothing is touched. Two daemons
+  // that start at the same time keep out of each other's way by a lock on the folder. Returns false with a
+  // message in `error`.
+  [[nodiscard]] bool open(const std::string& socket_path, const std::string& name, std::string& error);
+
+  [[nodiscard]] int listener() const { return listener_; }
+
+ private:
+  // A file in the folder, known by its inode, so that a file that took its name is left alone.
+  struct OwnFile {
+    std::string name;
+    dev_t device = 0;
+    ino_t inode = 0;
+  };
+
+  [[nodiscard]] bool make_free(const std::string& socket_path, std::string& error) const;
+  [[nodiscard]] bool listen_on(const std::string& socket_path);
+  [[nodiscard]] bool write_pid();
+  [[nodiscard]] bool remember(OwnFile& file, const std::string& name) const;
+  void remove(const OwnFile& file) const;
+
+  int folder_ = -1;
+  int listener_ = -1;
+  OwnFile socket_;
+  OwnFile pid_;
+};
+
+}  // namespace ktree

@@ -1,0 +1,142 @@
+// ktree: the daemon of the configuration tree.
+
+#include <fcntl.h>
+#include <getopt.h>
+#include <sys/resource.h>
+#include <sys/signalfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <string>
+
+#include "ktree/endpoint.h"
+#include "ktree/server.h"
+
+namespace {
+
+constexpr int kUsageError = 2;
+constexpr size_t kMaxClients = 4096;
+constexpr size_t kOwnDescriptors = 16;
+
+constexpr char kUsage[] =
+    "Usage: ktree -n NAME -s SOCKET\n"
+    "Holds a configuration tree and serves it on the unix socket SOCKET.\n"
+    "\n"
+    "  -n NAME        name of the tree; the process number goes into SOCKET_NAME.pid\n"
+    "  -s SOCKET      path of the socket\n"
+    "  -h, --help     print this text and exit\n"
+    "  -V, --version  print the version and exit\n";
+
+struct Options {
+  std::string name;
+  std::string socket;
+};
+
+// Returns -1 when the daemon is to run, otherwise the exit status.
+int parse_options(int argc, char** argv, Options& options) {
+  const option long_options[] = {
+      {"help", no_argument, nullptr, 'h'}, {"version", no_argument, nullptr, 'V'}, {nullptr, 0, nullptr, 0}};
+  int letter = 0;
+  while ((letter = getopt_long(argc, argv, "n:s:hV", long_options, nullptr)) != -1) {
+    switch (letter) {
+      case 'n':
+        options.name = optarg;
+        break;
+      case 's':
+        options.socket = optarg;
+        break;
+      case 'h':
+        fputs(kUsage, stdout);
+        return 0;
+      case 'V':
+        puts("ktree " REMVOL_VERSION);
+        return 0;
+      default:
+        fputs(kUsage, stderr);
+        return kUsageError;
+    }
+  }
+  if (optind != argc || options.socket.empty() || options.name.empty() ||
+      options.name.find('/') != std::string::npos) {
+    fputs(kUsage, stderr);
+    return kUsageError;
+  }
+  return -1;
+}
+
+// What the starting process left open is not the daemon's: a lock file among it would stay locked for as long
+// as the daemon lives. The standard descriptors stay, or become /dev/null when there are none.
+void leave_foreign_descriptors() {
+  int fd = 0;
+  do {
+    fd = open("/dev/null", O_RDWR | O_CLOEXEC);
+  } while (fd >= 0 && fd <= STDERR_FILENO);
+  close_range(STDERR_FILENO + 1, ~0U, 0);
+}
+
+// The tree holds secrets, which no core file may carry to a disk.
+void limit_process() {
+  const rlimit no_core = {0, 0};
+  setrlimit(RLIMIT_CORE, &no_core);
+  rlimit files = {};
+  if (getrlimit(RLIMIT_NOFILE, &files) == 0) {
+    files.rlim_cur = files.rlim_max;
+    setrlimit(RLIMIT_NOFILE, &files);
+  }
+}
+
+// Every client may have a memory file with the daemon, so two descriptors are reckoned for each.
+size_t client_limit() {
+  rlimit files = {};
+  if (getrlimit(RLIMIT_NOFILE, &files) != 0) {
+    return 1;
+  }
+  const size_t limit = std::max<size_t>(files.rlim_cur, kOwnDescriptors + 2);
+  return std::min((limit - kOwnDescriptors) / 2, kMaxClients);
+}
+
+// SIGTERM and SIGINT as a descriptor. A shell starts a background command with SIGINT ignored, which would
+// keep it from the descriptor, too.
+int open_signals() {
+  signal(SIGPIPE, SIG_IGN);
+  signal(SIGHUP, SIG_IGN);
+  signal(SIGTERM, SIG_DFL);
+  signal(SIGINT, SIG_DFL);
+  sigset_t mask;
+  sigemptyset(&mask);
+  sigaddset(&mask, SIGTERM);
+  sigaddset(&mask, SIGINT);
+  sigprocmask(SIG_BLOCK, &mask, nullptr);
+  return signalfd(-1, &mask, SFD_CLOEXEC | SFD_NONBLOCK);
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  Options options;
+  const int status = parse_options(argc, argv, options);
+  if (status >= 0) {
+    return status;
+  }
+  leave_foreign_descriptors();
+  limit_process();
+  const int signals = open_signals();
+  ktree::Endpoint endpoint;
+  std::string error;
+  if (signals < 0 || !endpoint.open(options.socket, options.name, error)) {
+    fprintf(stderr, "ktree: %s\n", error.empty() ? strerror(errno) : error.c_str());
+    return EXIT_FAILURE;
+  }
+  auto server = std::make_unique<ktree::Server>(endpoint.listener(), signals, client_limit());
+  if (!server->run()) {
+    fprintf(stderr, "ktree: %s\n", strerror(errno));
+    return EXIT_FAILURE;
+  }
+  return EXIT_SUCCESS;
+}

@@ -1,0 +1,107 @@
+#include "ktree/service.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cstring>
+
+#include "ktree/listing.h"
+#include "ktree/settings_reader.h"
+#include "ktree/settings_writer.h"
+
+namespace ktree {
+namespace {
+
+// True for a memory file (memfd_create(2)) or a file of a memory file system, the only ones that answer
+// F_GET_SEALS: reading and writing them never waits for a device or another process.
+bool is_memory_file(int fd) {
+  struct stat info = {};
+  return fd >= 0 && fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && fcntl(fd, F_GET_SEALS) >= 0;
+}
+
+}  // namespace
+
+Service::Answer Service::handle(const Request& request) {
+  switch (request.operation) {
+    case Operation::get:
+      return get(request);
+    case Operation::set:
+      return set(request);
+    case Operation::del:
+      return del(request);
+    case Operation::dump:
+      return dump(request);
+    case Operation::load:
+      return load(request);
+    case Operation::list:
+      return list(request);
+  }
+  return {Status::refused, {}};
+}
+
+Service::Answer Service::get(const Request& request) const {
+  uint32_t wanted = 0;
+  Path path;
+  if (request.value.size() != sizeof wanted || !parse_path(request.path, path)) {
+    return {Status::refused, {}};
+  }
+  memcpy(&wanted, request.value.data(), sizeof wanted);
+  const Node* node = tree_.find(path);
+  if (node == nullptr || !node->has_value()) {
+    return {Status::missing, {}};
+  }
+  return {Status::done, node->value().substr(0, wanted)};
+}
+
+Service::Answer Service::set(const Request& request) {
+  Path path;
+  const bool carried =
+      request.value.size() <= kMaxValueBytes && request.value.find('\0') == std::string_view::npos;
+  if (!carried || !parse_path(request.path, path) || !tree_.set(path, request.value)) {
+    return {Status::refused, {}};
+  }
+  return {Status::done, {}};
+}
+
+Service::Answer Service::del(const Request& request) {
+  Path path;
+  if (!request.value.empty() || !parse_path(request.path, path)) {
+    return {Status::refused, {}};
+  }
+  return {tree_.remove(path) ? Status::done : Status::missing, {}};
+}
+
+Service::Answer Service::dump(const Request& request) const {
+  return {is_memory_file(request.document) && write_settings(tree_, request.document) ? Status::done
+                                                                                      : Status::failed,
+          {}};
+}
+
+Service::Answer Service::load(const Request& request) {
+  if (!is_memory_file(request.document)) {
+    return {Status::failed, {}};
+  }
+  Tree loaded;
+  if (!read_settings(request.document, loaded, error_)) {
+    return {Status::damaged, std::string_view(error_).substr(0, kMaxErrorBytes)};
+  }
+  tree_.swap(loaded);
+  return {Status::done, {}};
+}
+
+Service::Answer Service::list(const Request& request) const {
+  Path path;
+  path.depth = 0;
+  if (request.path != "/" && !parse_path(request.path, path)) {
+    return {Status::refused, {}};
+  }
+  const Node* node = tree_.find(path);
+  if (node == nullptr) {
+    return {Status::missing, {}};
+  }
+  const bool written = is_memory_file(request.document) && write_listing(*node, path, request.document);
+  return {written ? Status::done : Status::failed, {}};
+}
+
+}  // namespace ktree

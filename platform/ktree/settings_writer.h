@@ -1,0 +1,11 @@
+// Writes the tree as the XML of the settings file.
+#pragma once
+
+#include "ktree/tree.h"
+
+namespace ktree {
+
+// Writes `tree` to `fd` from its current position. Returns false when it could not be written in full.
+[[nodiscard]] bool write_settings(const Tree& tree, int fd);
+
+}  // namespace ktree

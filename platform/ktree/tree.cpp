@@ -1,0 +1,181 @@
+#include "ktree/tree.h"
+
+#include <algorithm>
+#include <cstring>
+#include <utility>
+
+namespace ktree {
+namespace {
+
+auto group_position(const Node& parent, std::string_view name) {
+  return std::lower_bound(parent.groups.begin(), parent.groups.end(), name,
+                          [](const std::unique_ptr<Group>& group, std::string_view wanted) {
+                            return std::string_view(group->name) < wanted;
+                          });
+}
+
+Group* find_group(const Node& parent, std::string_view name) {
+  auto position = group_position(parent, name);
+  return position != parent.groups.end() && (*position)->name == name ? position->get() : nullptr;
+}
+
+size_t members_of(const Node& parent, std::string_view name) {
+  const Group* group = find_group(parent, name);
+  return group == nullptr ? 0 : group->members.size();
+}
+
+Node* find_child(const Node& parent, const Element& element) {
+  Group* group = find_group(parent, element.name);
+  return group == nullptr || element.number > group->members.size() ? nullptr
+                                                                    : group->members[element.number - 1];
+}
+
+void unlink_sibling(Node& parent, Node& node) {
+  (node.previous == nullptr ? parent.first_child : node.previous->next) = node.next;
+  (node.next == nullptr ? parent.last_child : node.next->previous) = node.previous;
+}
+
+void leave_group(Node& parent, Node& node, unsigned number) {
+  Group* group = node.group;
+  group->members.erase(group->members.begin() + (number - 1));
+  if (group->members.empty()) {
+    parent.groups.erase(group_position(parent, group->name));
+  }
+}
+
+}  // namespace
+
+Tree::~Tree() {
+  while (root_.first_child != nullptr) {
+    destroy(std::exchange(root_.first_child, root_.first_child->next));
+  }
+}
+
+const Node* Tree::find(const Path& path) const {
+  const Node* node = &root_;
+  for (size_t i = 0; i < path.depth && node != nullptr; i++) {
+    node = find_child(*node, path.elements[i]);
+  }
+  return node;
+}
+
+bool Tree::fits(Growth growth) const {
+  return growth.nodes <= kMaxNodes - node_count_ && growth.bytes <= kMaxTreeBytes - bytes_;
+}
+
+bool Tree::set(const Path& path, std::string_view value) {
+  Node* node = &root_;
+  size_t existing = 0;
+  for (; existing < path.depth; existing++) {
+    Node* child = find_child(*node, path.elements[existing]);
+    if (child == nullptr) {
+      break;
+    }
+    node = child;
+  }
+  Growth growth = {0, existing == path.depth && value.size() <= node->size ? 0 : value.size()};
+  for (size_t i = existing; i < path.depth; i++) {
+    const Element& element = path.elements[i];
+    size_t made = element.number - (i == existing ? members_of(*node, element.name) : 0);
+    growth.nodes += made;
+    growth.bytes += made * element.name.size();
+  }
+  if (!fits(growth)) {
+    return false;
+  }
+  for (size_t i = existing; i < path.depth; i++) {
+    const Element& element = path.elements[i];
+    Node* child = nullptr;
+    for (size_t have = members_of(*node, element.name); have < element.number; have++) {
+      child = make_child(*node, element.name);
+    }
+    node = child;
+  }
+  store_value(*node, value);
+  return true;
+}
+
+bool Tree::remove(const Path& path) {
+  Node* parent = nullptr;
+  Node* node = &root_;
+  for (size_t i = 0; i < path.depth; i++) {
+    parent = std::exchange(node, find_child(*node, path.elements[i]));
+    if (node == nullptr) {
+      return false;
+    }
+  }
+  if (parent == nullptr) {
+    return false;
+  }
+  bytes_ -= node->group->name.size();
+  unlink_sibling(*parent, *node);
+  leave_group(*parent, *node, path.elements[path.depth - 1].number);
+  node->group = nullptr;
+  destroy(node);
+  return true;
+}
+
+Node* Tree::append_child(Node& parent, std::string_view name) {
+  if (members_of(parent, name) >= kMaxNumber || !fits({1, name.size()})) {
+    return nullptr;
+  }
+  return make_child(parent, name);
+}
+
+bool Tree::set_value(Node& node, std::string_view value) {
+  if (value.size() > kMaxValueBytes || !fits({0, value.size()})) {
+    return false;
+  }
+  store_value(node, value);
+  return true;
+}
+
+void Tree::swap(Tree& other) noexcept {
+  std::swap(root_, other.root_);
+  std::swap(node_count_, other.node_count_);
+  std::swap(bytes_, other.bytes_);
+}
+
+Node* Tree::make_child(Node& parent, std::string_view name) {
+  auto position = group_position(parent, name);
+  if (position == parent.groups.end() || (*position)->name != name) {
+    auto group = std::make_unique<Group>();
+    group->name = name;
+    position = parent.groups.insert(position, std::move(group));
+  }
+  Node* node = new Node;
+  node->group = position->get();
+  node->group->members.push_back(node);
+  node->previous = parent.last_child;
+  (parent.last_child == nullptr ? parent.first_child : parent.last_child->next) = node;
+  parent.last_child = node;
+  node_count_++;
+  bytes_ += name.size();
+  return node;
+}
+
+void Tree::store_value(Node& node, std::string_view value) {
+  if (!node.has_value() || value.size() != node.size) {
+    node.text = std::make_unique_for_overwrite<char[]>(value.size());
+    bytes_ += value.size() - node.size;
+    node.size = static_cast<uint32_t>(value.size());
+  }
+  if (!value.empty()) {
+    memcpy(node.text.get(), value.data(), value.size());
+  }
+}
+
+// Frees `node`, which nothing leads to any more, and all below it; no deeper than a path can be.
+void Tree::destroy(Node* node) {
+  if (node->group != nullptr) {
+    bytes_ -= node->group->name.size();
+  }
+  bytes_ -= node->size;
+  node_count_--;
+  while (node->first_child != nullptr) {
+    destroy(std::exchange(node->first_child, node->first_child->next));
+  }
+  delete node;
+}
+
+}  // namespace ktree
