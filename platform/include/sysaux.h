@@ -24,12 +24,12 @@ char* strtrim(char* text, const char* set);
 /* Removes the characters of `set` from the right end of `text`, in place. Returns `text`. */
 char* strrtrim(char* text, const char* set);
 
-/* Converts decimal text to a number; leading blanks are allowed, and what follows the digits is ignored. Returns 0
- * when it does not begin with a number, the nearest possible number when it is too large. */
+/* Converts decimal text to a number; leading blanks are allowed, and what follows the digits is ignored.
+ * Returns 0 when it does not begin with a number, the nearest possible number when it is too large. */
 long long str2ll(const char* text);
 
-/* Reads the hardware address of a network interface. Returns 0, or -1 when there is no such interface or it has
- * no Ethernet address. */
+/* Reads the hardware address of a network interface. Returns 0, or -1 when there is no such interface or it
+ * has no Ethernet address. */
 int sys_get_mac_addr(const char* interface, unsigned char mac[6]);
 
 /* Puts the host name into `out` of `size` bytes. Returns 0, or -1 when it is empty or does not fit. */
@@ -39,17 +39,18 @@ int sys_hostname(char* out, size_t size);
 long long sys_get_disk_space(const char* format, ...) __attribute__((format(printf, 1, 2)));
 
 /* Writes the kernel names of the partitions of `device` (a path), joined by ",", into `out`, which holds at
- * least 1024 characters; names that do not fit are left out. Returns their number; -1 when `device` is no block
- * device or cannot be read. Where the kernel has not read the partition table, it is told of the partitions; they
- * count also when it refuses them, so 0 means that there is no partition on the disk. */
+ * least 1024 characters; names that do not fit are left out. Returns their number; -1 when `device` is no
+ * block device or cannot be read. Where the kernel has not read the partition table, it is told of the
+ * partitions; they count also when it refuses them, so 0 means that there is no partition on the disk. */
 int sys_get_partition_list(char* out, const char* device);
 
 /* Writes a new partition table with one partition that covers the disk. The partition's node is there when
  * the call returns. A disk that carries a signature of its own is refused. Returns 0, or non-zero. */
 int sys_create_1_partition(const char* device);
 
-/* Grows the only partition of `device` (GPT, or primary in a DOS table, which ends at 2 TiB) to the end of the disk and
- * keeps its data; it may be mounted. Returns 0 when the kernel shows the new size, or non-zero. */
+/* Grows the only partition of `device` (GPT, or primary in a DOS table, which ends at 2 TiB) to the end of
+ * the disk and keeps its data; it may be mounted. Returns 0 when the kernel shows the new size, or non-zero.
+ */
 int sys_expand_1_partition(const char* device);
 
 /* Returns the size of a partition by its kernel name, such as sdb1; 0 or less when unknown. */
@@ -63,8 +64,8 @@ int sys_check_dev(const char* node);
  * non-zero when nothing is recognised. */
 int sys_get_fs_type(char* out, const char* node);
 
-/* Returns non-zero when the ext2, ext3 or ext4 file system on `node` says of itself that it wants a check: not
- * cleanly unmounted, errors, a journal to replay, or a damaged superblock. Others, and none, give 0. */
+/* Returns non-zero when the ext2, ext3 or ext4 file system on `node` says of itself that it wants a check:
+ * not cleanly unmounted, errors, a journal to replay, or a damaged superblock. Others, and none, give 0. */
 int sys_check_fs_state(const char* node);
 
 /* Returns non-zero when `path` (links are followed) is a mount point. Nothing is read from the volume. */
