@@ -1,0 +1,102 @@
+// flashrun: runs a command while the configuration flash is writable.
+//
+// Three processes, so that the flash is read-only again whatever is killed: flashrun itself, which only
+// waits; a guard in a process group of its own, which runs the command and closes the flash behind it; the
+// command, in flashrun's group. When flashrun is killed the guard goes on; when the guard is killed flashrun
+// closes the flash.
+#include <sys/wait.h>
+#include <unistd.h>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <initializer_list>
+
+#include "flash.h"
+
+namespace {
+
+constexpr char kFolder[] = "/usr/local/config";
+constexpr int kUsage = 2, kCannotRun = 126, kNotFound = 127, kKilled = 128;
+
+[[noreturn]] void exec_command(char** command) {
+  if (command[1] == nullptr) {
+    execl("/bin/sh", "sh", "-c", command[0], nullptr);
+  } else {
+    execvp(command[0], command);
+  }
+  const int error = errno;
+  fprintf(stderr, "flashrun: %s: %s\n", command[0], strerror(error));
+  _exit(error == ENOENT ? kNotFound : kCannotRun);
+}
+
+// The signals that end flashrun are passed on to the command instead, and waited for like its end.
+sigset_t awaited_signals() {
+  sigset_t set;
+  sigemptyset(&set);
+  for (int number : {SIGCHLD, SIGTERM, SIGINT, SIGHUP, SIGQUIT}) sigaddset(&set, number);
+  return set;
+}
+
+// Waits for `child` and passes signals on to it. Returns its wait status.
+int wait_for(pid_t child) {
+  const sigset_t awaited = awaited_signals();
+  for (;;) {
+    int status = 0;
+    if (waitpid(child, &status, WNOHANG) == child) return status;
+    const int number = sigwaitinfo(&awaited, nullptr);
+    if (number > 0 && number != SIGCHLD) kill(child, number);
+  }
+}
+
+int exit_status(int wait_status) {
+  return WIFSIGNALED(wait_status) ? kKilled + WTERMSIG(wait_status) : WEXITSTATUS(wait_status);
+}
+
+void leave(flash::UserLock& lock) {
+  if (!lock.leave(kFolder)) fprintf(stderr, "flashrun: %s stays writable: %s\n", kFolder, strerror(errno));
+}
+
+[[noreturn]] void run_guard(char** command, flash::UserLock& lock, const sigset_t& callers_mask) {
+  const pid_t group = getpgrp();
+  setpgid(0, 0);
+  const pid_t child = fork();
+  if (child == 0) {
+    setpgid(0, group);
+    sigprocmask(SIG_SETMASK, &callers_mask, nullptr);
+    exec_command(command);
+  }
+  int status = kCannotRun << 8;
+  if (child > 0) {
+    status = wait_for(child);
+  } else {
+    perror("flashrun: fork");
+  }
+  leave(lock);
+  _exit(exit_status(status));
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  if (argc < 2) {
+    fprintf(stderr, "usage: flashrun COMMAND-LINE | COMMAND ARGUMENT...\n");
+    return kUsage;
+  }
+  char** command = argv + 1;
+  if (!flash::is_mount(kFolder)) exec_command(command);
+
+  const sigset_t awaited = awaited_signals();
+  sigset_t callers_mask;
+  sigprocmask(SIG_BLOCK, &awaited, &callers_mask);
+  flash::UserLock lock;
+  if (!lock.enter(kFolder)) {
+    fprintf(stderr, "flashrun: %s cannot be made writable: %s\n", kFolder, strerror(errno));
+  }
+  const pid_t guard = fork();
+  if (guard == 0) run_guard(command, lock, callers_mask);
+  const int status = guard > 0 ? wait_for(guard) : kCannotRun << 8;
+  if (guard < 0) perror("flashrun: fork");
+  if (guard < 0 || WIFSIGNALED(status)) leave(lock);
+  return exit_status(status);
+}
