@@ -96,6 +96,14 @@ int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry) {
   return kOk;
 }
 
+int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry) {
+  *entry = TargetEntry();
+  if (!tree_read(KeyText(key::kTargetName, dbidx), entry->target_name)) return kFailed;
+  entry->db_idx = dbidx;
+  read_target_fields(entry, dbidx);
+  return kOk;
+}
+
 int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx) {
   if (entry == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
   *entry = TargetEntry();

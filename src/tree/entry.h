@@ -19,6 +19,10 @@ int ktree_get_free_dbidx();
 // entry or an unknown target.
 int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry);
 
+// Fills `entry` with the target at `dbidx`, whatever the slots before it hold; missing settings stay zero.
+// Returns 0, or -1 for an empty slot.
+int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry);
+
 // Fills `entry` with the target at `dbidx` and its LUN at `lun_dbidx`. Returns 0, or -1 when an argument is
 // bad (null, below 1) or one of the two slots is empty.
 int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx);
