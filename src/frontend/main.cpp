@@ -21,7 +21,6 @@ using namespace remvol;
 
 namespace {
 
-constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
 constexpr char kResetMark[] = "/tmp/reset_default";  // while it exists, the flash copy stays as it is
 constexpr int kFailureStatus = -1;
 

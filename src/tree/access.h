@@ -13,6 +13,9 @@ namespace remvol {
 // The tree instance that holds the settings and the status.
 inline constexpr char main_socket[] = "/var/run/ktree_sock_vv";
 
+// What it is dumped to after a command, and loaded from at start-up.
+inline constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
+
 // Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns whether the key is present.
 [[nodiscard]] bool tree_read(const char* key, char* buffer, size_t size);
 
