@@ -7,14 +7,20 @@
 
 namespace remvol {
 
+// Results of ktree_update_dev that its callers tell apart.
+enum DeviceResult : int {
+  kTargetNotListed = -1,
+  kNoRunningDisk = -2,
+};
+
 // Empties the stored device names of the target's LUNs, up to the first empty slot. Returns 0; -1 for a null
 // entry or an unknown target; -103 when a write failed.
 int ktree_clean_target_dev(TargetEntry* entry);
 
 // Stores the device names of the target's LUNs as the session shows them; the last one found stays in the
-// entry's dev. Returns 0 (also when there is no session at all: nothing is changed then); -1 the target is in
-// no session; -2 no running disk found; -103 a tree write failed; -106 the listing command failed; or the
-// non-zero result of ktree_clean_target_dev.
+// entry's dev. Returns 0 (also when there is no session at all: nothing is changed then); a DeviceResult when
+// other sessions exist, but none to the target, or its session shows no running disk of a stored LUN; -103 a
+// tree write failed; -106 the listing command failed; or the non-zero result of ktree_clean_target_dev.
 int ktree_update_dev(TargetEntry* entry);
 
 // Waits until the target shows a usable LUN: wait_seconds * 10 polls of 100 ms, one poll for 0. Returns 0

@@ -1,0 +1,41 @@
+#include "iscsi/session_check.h"
+
+#include <cstdlib>
+
+#include "frontend/request.h"
+#include "iscsi/session_listing.h"
+#include "support/command.h"
+#include "support/files.h"
+#include "support/result.h"
+#include "support/text.h"
+
+namespace remvol {
+
+int list_sessions(const char* command, const char* path, Caller caller) {
+  clear_temp_path(path);
+  const int status = system(command);
+  if (status == 0) return 0;
+  if (command_exit_code(status) == kNoSessionExit) return 1;
+  LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
+  log_command_status(status, caller);
+  return kListingFailed;
+}
+
+int check_target_connected(const char* name) {
+  if (name == nullptr || name[0] == '\0') return kFailed;
+  const Text<512> path("/tmp/%s_session.tmp", program_name());
+  const int listed = list_sessions(CommandText("iscsiadm -m session >%s 2>&1", path.c_str()), path);
+  if (listed != 0) return listed < 0 ? listed : kOk;
+  File file(fopen(path, "re"));
+  if (file == nullptr) return 0;
+  char line[kListingLineSize];
+  bool connected = false;
+  while (!connected && fgets(line, sizeof line, file.get()) != nullptr) {
+    connected = session_line_shows(line, name);
+  }
+  file.reset();
+  _remove_file(path);
+  return connected ? 1 : 0;
+}
+
+}  // namespace remvol
