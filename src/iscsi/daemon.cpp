@@ -1,0 +1,65 @@
+#include "iscsi/daemon.h"
+
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "support/command.h"
+#include "support/files.h"
+#include "support/text.h"
+#include "sysaux.h"
+
+namespace remvol {
+
+namespace {
+
+// Returns whether the process that `pid_file` names is a ktree.
+bool find_tree_daemon(const char* pid_file, pid_t* pid) {
+  char text[32] = "";
+  File file(fopen(pid_file, "re"));
+  if (file == nullptr || fgets(text, sizeof text, file.get()) == nullptr) return false;
+  *pid = atoi(text);
+  if (*pid <= 1) return false;
+  file.reset(fopen(Text<64>("/proc/%d/comm", *pid), "re"));
+  return file != nullptr && fgets(text, sizeof text, file.get()) != nullptr && strcmp(text, "ktree\n") == 0;
+}
+
+}  // namespace
+
+// When iscsid (2.1.8) ends on a SIGTERM it sends the signal on to its whole process group. Started in the
+// group of the script that runs the tool, it would take that script and its other children along, this
+// tool's tree daemon among them. The tool itself may be a session leader, which cannot change its group, so a
+// child does.
+int start_daemon(const char* command, Caller caller) {
+  fflush(stdout);
+  const pid_t child = fork();
+  if (child < 0) return run_command(command, caller);
+  if (child == 0) {
+    setpgid(0, 0);
+    _exit(run_command(command, caller) == 0 ? EXIT_SUCCESS : EXIT_FAILURE);
+  }
+  int status = 0;
+  while (waitpid(child, &status, 0) < 0) {
+    if (errno != EINTR) return -1;
+  }
+  return status;
+}
+
+void start_tree_daemon(const char* socket, Caller caller) {
+  start_daemon(CommandText("ktree -n config -s %s 1>/dev/null 2>/dev/null &", socket), caller);
+  sleep(1);
+}
+
+bool stop_tree_daemon(const char* pid_file) {
+  if (System("kill -SIGTERM `cat %s`", pid_file) == 0) return true;
+  // dash, and bash as sh, know the signal only as TERM.
+  pid_t pid = 0;
+  return find_tree_daemon(pid_file, &pid) && kill(pid, SIGTERM) == 0;
+}
+
+}  // namespace remvol

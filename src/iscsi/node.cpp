@@ -1,0 +1,222 @@
+#include "iscsi/node.h"
+
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstring>
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/iface.h"
+#include "iscsi/session.h"
+#include "iscsi/session_check.h"
+#include "support/command.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+#include "volume/mount.h"
+#include "volume/share_services.h"
+#include "volume/unmount.h"
+
+// Some commands put the target name between double quotes and some do not. What watches this tool's commands
+// knows them so.
+
+namespace remvol {
+
+namespace {
+
+constexpr int kMinPort = 1;
+constexpr int kMaxPort = 65535;
+
+// What iscsiadm prints when the node is logged in already; 2.0.874 and later print another text, and the
+// session stays then: logging it out would pull its disks from under mounted volumes.
+constexpr char kAlreadyExists[] = "initiator reported error (15 - already exists)";
+
+// Sets one authentication setting of a node record. Returns 0, or the status of the command that failed.
+int update_auth(const TargetEntry* entry, const char* iface, const char* setting_and_value, Caller caller) {
+  return run_command(
+      CommandText("iscsiadm -m node -I %s -T \"%s\" -p %s:%d -o update -n node.session.auth.%s", iface,
+                  entry->target_name, entry->ip, entry->port, setting_and_value),
+      caller);
+}
+
+// Returns the result of the last setting alone, as 0 or -1.
+int _target_chap_gen(const TargetEntry* entry, const char* iface) {
+  if (entry == nullptr || iface == nullptr || iface[0] == '\0') return kFailed;
+  if (entry->chap != 1) {
+    const CommandText command(
+        "iscsiadm -m node -I %s -T %s -p %s:%d -o update -n node.session.auth.authmethod -v None", iface,
+        entry->target_name, entry->ip, entry->port);
+    return run_command(command) == 0 ? kOk : kFailed;
+  }
+  update_auth(entry, iface, "authmethod -v CHAP", Caller());
+  update_auth(entry, iface, Text<256>("username -v \"%s\"", entry->chap_name), Caller());
+  const int status = update_auth(entry, iface, Text<256>("password -v \"%s\"", entry->chap_pwd), Caller());
+  return status == 0 ? kOk : kFailed;
+}
+
+int _target_chap_apply(TargetEntry* entry) {
+  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
+  _target_chap_gen(entry, entry->iface);
+  return kOk;
+}
+
+int run_node_command(const TargetEntry* entry, const char* operation, Caller caller) {
+  return run_command(CommandText("iscsiadm -m node -I %s -T %s -p %s:%d -o %s", entry->iface,
+                                 entry->target_name, entry->ip, entry->port, operation),
+                     caller);
+}
+
+int log_out(const TargetEntry* entry, Caller caller) {
+  const CommandText command("iscsiadm -m node -T \"%s\" --logout", entry->target_name);
+  return run_command(command, caller) == 0 ? 0 : 1;
+}
+
+// Reads the output of a login until it says that a session to this node is already open.
+bool login_found_session(FILE* output) {
+  char line[512];
+  while (fgets(line, sizeof line, output) != nullptr) {
+    if (strstr(line, kAlreadyExists) != nullptr) return true;
+  }
+  return false;
+}
+
+// Names the requested target, not `name`: at start-up there is none. Returns whether the session is there.
+bool confirm_login(const char* name, Caller caller) {
+  if (check_target_connected(name) == 1) return true;
+  LOG_AT(caller, 0, "Can not find target %s in session\n, connect failed.", request_target.target_name);
+  return false;
+}
+
+int _target_connect_run(const char* name, const char* address, int port, const char* iface,
+                        bool handle_exists) {
+  if (name == nullptr || address == nullptr || iface == nullptr) return kFailed;
+  if (port < kMinPort || port > kMaxPort) return kFailed;
+  const CommandText login("iscsiadm -m node -T %s -p %s:%d -I %s --login", name, address, port, iface);
+  LOG(1, "try to login - cmd: %s \n", login.c_str());
+  FILE* output = popen(login, "r");
+  if (output == nullptr) return 1;
+  if (handle_exists && login_found_session(output)) {
+    run_command(CommandText("iscsiadm -m node -T \"%s\" -p %s:%d --logout", name, address, port));
+    run_command(CommandText("iscsiadm -m node -T \"%s\" -p %s:%d -I %s --login", name, address, port, iface));
+  }
+  pclose(output);
+  return confirm_login(name, Caller()) ? 0 : 1;
+}
+
+// Start-up: the target is logged in, but its session shows no disk that could be mounted. It is logged out
+// and stays so.
+void give_up_target(TargetEntry* entry, int reason, Caller caller) {
+  if (reason == kTargetNotListed) {
+    LOG_AT(caller, 1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
+  } else if (reason == kNoRunningDisk) {
+    LOG_AT(caller, 1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
+  } else if (reason == kTreeFailed) {
+    LOG_AT(caller, 0, "ktree failed");
+  }
+  // Written after a logout that worked; readers of the log know it so.
+  if (Target_Logout(entry) == 0) LOG_AT(caller, 1, "Logout Fail on Target: %s ", entry->target_name);
+  ktree_record_connect_set(entry);
+  ktree_update_all_volume_state(entry, kVolumeLost);
+}
+
+// Logs in to one stored target and mounts its volumes. Returns whether it came to the mounting.
+bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
+  *result = Target_Connect(entry);
+  if (*result != 0) {
+    ktree_set_connect_state(entry->db_idx, kConnectError);
+    return false;
+  }
+  *result = ktree_update_dev(entry);
+  if (*result != 0) {
+    give_up_target(entry, *result, caller);
+    *result = -1;
+    return false;
+  }
+  sleep(1);
+  Target_mount_all_lun(entry, 0, 0);
+  return true;
+}
+
+}  // namespace
+
+int Target_Config_Gen(TargetEntry* entry) {
+  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
+  run_node_command(entry, "delete", Caller());
+  run_node_command(entry, "new", Caller());
+  return _target_chap_apply(entry);
+}
+
+int _target_login(TargetEntry* entry) {
+  if (get_iface_name(entry) != kOk || entry->iface[0] == '\0') return kFailed;
+  return _target_connect_run(entry->target_name, entry->ip, entry->port, entry->iface, true);
+}
+
+int Target_Connect(TargetEntry* entry) {
+  ktree_set_connect_state(entry->db_idx, kConnecting);
+  if (_target_login(entry) != 0) return kFailed;
+  return confirm_login(entry->target_name, Caller()) ? kOk : kFailed;
+}
+
+int Target_Logout(TargetEntry* entry) {
+  const int result = log_out(entry, Caller());
+  entry->conn_set = 0;
+  ktree_set_connect_state(entry->db_idx, kDisconnected);
+  return result;
+}
+
+int _target_disconnect(const TargetEntry* entry) {
+  if (entry->target_name[0] == '\0') {
+    LOG(0, "parameter error");
+    return kFailed;
+  }
+  return log_out(entry, Caller());
+}
+
+int Target_Disconnect(TargetEntry* entry) {
+  LOG(2, "start");
+  if (entry->db_idx < 1) entry->db_idx = ktree_get_dbidx_by_targetname(entry->target_name);
+  if (entry->db_idx < 1) {
+    LOG(0, "target : %s  does not exist in ktree", entry->target_name);
+    return kFailed;
+  }
+  Target_umount_all_lun(entry->db_idx);
+  LOG(1, "update share folder status");
+  reload_share_services();
+  LOG(1, "finish share folder status");
+  LOG(2, "logout start");
+  const int result = log_out(entry, Caller());
+  LOG(2, "logout end ");
+  ktree_set_connect_state(entry->db_idx, kDisconnected);
+  entry->conn_set = 0;
+  ktree_record_connect_set(entry);
+  ktree_update_dev(entry);
+  LOG(2, "end");
+  return result;
+}
+
+int Target_load_all() {
+  LOG(2, "start");
+  int mounted = 0;
+  int result = 0;
+  for (int n = 1; n <= kMaxTargets; n++) {
+    if (!tree_present(KeyText(key::kTargetName, n))) continue;
+    TargetEntry entry;
+    // By slot, not by name: the search for a name would stop at an empty slot before this one.
+    if (ktree_get_entry_by_dbidx(n, &entry) == kOk) {
+      Target_Config_Gen(&entry);
+      if (entry.conn_set != 0 && load_connected_target(&entry, &result, Caller())) mounted++;
+    }
+    ktree_update_status(&entry);
+  }
+  if (mounted > 0) reload_share_services();
+  ktree_update_current_targetcnt();
+  LOG(2, "end");
+  return result;
+}
+
+}  // namespace remvol
