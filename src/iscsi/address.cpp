@@ -1,0 +1,79 @@
+#include "iscsi/address.h"
+
+#include <cstdio>
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/discovery.h"
+#include "iscsi/session_check.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+
+namespace remvol {
+
+namespace {
+
+// Returns whether the request names a target and a portal; logs what is missing.
+bool check_request(const TargetEntry& request, Caller caller) {
+  if (request.target_name[0] == '\0') {
+    LOG_AT(caller, 0, "target name is not given");
+  } else if (request.ip[0] == '\0') {
+    LOG_AT(caller, 0, "ip is not given");
+  } else if (request.port < 1 || request.port > 65535) {
+    LOG_AT(caller, 0, "Port is not valid");
+  } else {
+    return true;
+  }
+  return false;
+}
+
+// The refusals are no failures: what is printed tells them from a change. It has no newline of its own.
+int refuse_connected(const TargetEntry& request) {
+  printf("%s is connecting, disconnect it before modifying its address.", request.target_name);
+  return kOk;
+}
+
+int store_portal(const TargetEntry& request, int dbidx, Caller caller) {
+  if (tree_write(KeyText(key::kTargetIp, dbidx), request.ip) != kOk ||
+      tree_write(KeyText(key::kTargetPort, dbidx), NumberText("%d", request.port)) != kOk) {
+    LOG_AT(caller, 0, "ktreec_set() failed");
+    return kTreeFailed;
+  }
+  return kOk;
+}
+
+int modify_address(const TargetEntry& request, Caller caller) {
+  if (!check_request(request, caller)) return kFailed;
+  const int dbidx = ktree_get_dbidx_by_targetname(request.target_name);
+  if (dbidx <= 0) {
+    printf("Target %s is not existed in config", request.target_name);
+    return kFailed;
+  }
+  if (check_target_connected(request.target_name) != 0) return refuse_connected(request);
+  switch (Portal_search_target(request.target_name, request.ip, request.port)) {
+    case 0:
+      printf("Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
+      return kOk;
+    case 1:
+      return store_portal(request, dbidx, caller);
+    case 2:
+      return refuse_connected(request);
+    default:
+      LOG_AT(caller, 0, "Portal_search_target() failed");
+      return 1;
+  }
+}
+
+}  // namespace
+
+int task_modify_target_address() {
+  LOG(1, "task_modify_target_ip start");
+  const int result = modify_address(request_target, Caller());
+  LOG(1, "task_modify_target_ip end, ret = %d", result);
+  return result;
+}
+
+}  // namespace remvol

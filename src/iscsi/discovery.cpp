@@ -1,0 +1,167 @@
+#include "iscsi/discovery.h"
+
+#include <algorithm>
+#include <cstdio>
+#include <cstring>
+#include <vector>
+
+#include "frontend/log.h"
+#include "frontend/request.h"
+#include "iscsi/iface.h"
+#include "iscsi/result_daemon.h"
+#include "iscsi/session_check.h"
+#include "iscsi/session_listing.h"
+#include "ktreec.h"
+#include "support/command.h"
+#include "support/files.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "tree/access.h"
+#include "tree/keys.h"
+
+namespace remvol {
+
+namespace {
+
+// One discovered name. They come from a remote machine: as many as it sends.
+struct DiscoveredName {
+  char text[kListingLineSize] = "";
+
+  bool operator<(const DiscoveredName& other) const { return strcmp(text, other.text) < 0; }
+};
+
+using DiscoveredNames = std::vector<DiscoveredName>;
+using PathText = Text<512>;
+
+// The name is also that of the listing which ktree_update_dev reads: each use writes it anew.
+PathText discovery_path() {
+  return PathText("/tmp/%s.tmp", program_name());
+}
+
+// Asks the portal for its targets. Returns whether the command succeeded.
+bool discover(const char* address, int port, const char* iface, const char* path, Caller caller) {
+  clear_temp_path(path);
+  return run_command(CommandText("iscsiadm -m discovery -t sendtargets -p %s:%d -I %s > %s", address, port,
+                                 iface, path),
+                     caller) == 0;
+}
+
+// Reads the names that lines of the requested address show, in ascending order. The same name stays as often
+// as it is offered.
+DiscoveredNames read_names(FILE* file, Caller caller) {
+  DiscoveredNames names;
+  DiscoveredName last;
+  char line[kListingLineSize];
+  for (int lines = 0; fgets(line, sizeof line, file) != nullptr;) {
+    if (!is_discovery_line_of(line, request_target.ip)) continue;
+    lines++;
+    if (read_discovered_name(line, last.text)) names.push_back(last);
+    LOG_AT(caller, 3, "line %d: %s", lines, last.text);
+  }
+  std::sort(names.begin(), names.end());
+  LOG_AT(caller, 0, "vector size: %ld", static_cast<long>(names.size()));
+  return names;
+}
+
+// Replaces the stored names. A failed write leaves its place empty.
+void publish_names(const char* socket, const DiscoveredNames& names, Caller caller) {
+  if (ktreec_del(socket, 0, key::kSearch) != 0) {
+    LOG_AT(caller, 0, "ktreec_del() failed, path: '%s'", key::kSearch);
+  }
+  int i = 0;
+  for (const DiscoveredName& name : names) {
+    LOG_AT(caller, 3, "vector(%d): %s", i, name.text);
+    i++;
+    if (tree_write_to(socket, KeyText(key::kSearchName, i), name.text) != kOk) {
+      LOG_AT(caller, 0, "ktreec_set() failed");
+    }
+  }
+}
+
+// The search itself. Returns the result of task_search.
+int search_portal(const char* socket, Caller caller) {
+  const TargetEntry& request = request_target;
+  const PathText path = discovery_path();
+  LOG_AT(caller, 0, "ip: %s, port: %d", request.ip, request.port);
+  int result = discover(request.ip, request.port, request.iface, path, caller) ? 0 : 1;
+  File file(fopen(path, "re"));
+  if (file == nullptr) return 2;
+  publish_names(socket, read_names(file.get(), caller), caller);
+  file.reset();
+  if (tree_write_to(socket, key::kSearchDone, "1") != kOk) {
+    LOG_AT(caller, 0, "ktreec_set() failed");
+    result = 1;
+  }
+  return result;
+}
+
+// Returns whether the arguments name a target and a portal; logs what is wrong.
+bool check_arguments(const char* name, const char* address, int port, Caller caller) {
+  if (name == nullptr || address == nullptr) {
+    LOG_AT(caller, 0, "target name or ip is not given");
+  } else if (name[0] == '\0' || address[0] == '\0') {
+    LOG_AT(caller, 0, "target_name or ip is not valid");
+  } else if (port < 1 || port > 65535) {
+    LOG_AT(caller, 0, "Port is not valid");
+  } else {
+    return true;
+  }
+  return false;
+}
+
+// Names the requested target and portal, not the arguments of the question.
+int not_offered(Caller caller) {
+  const TargetEntry& request = request_target;
+  LOG_AT(caller, 2, "Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
+  return 0;
+}
+
+bool find_offer(FILE* file, const char* name, const char* address, int port, Caller caller) {
+  char line[kListingLineSize];
+  while (fgets(line, sizeof line, file) != nullptr) {
+    if (!discovery_line_offers(line, name, address, port)) continue;
+    LOG_AT(caller, 2, "get target at %s", line);
+    return true;
+  }
+  return false;
+}
+
+}  // namespace
+
+int task_search() {
+  LOG(2, "start");
+  // Without an interface no private daemon is started, and what is dumped at the end is the default tree.
+  const char* socket = nullptr;
+  int result = 1;
+  if (get_iface_name(&request_target) == 0) {
+    socket = open_results(kTargetResults);
+    result = search_portal(socket, Caller());
+  }
+  LOG(2, "end, ret = %d", result);
+  close_results(kTargetResults, socket);
+  return result;
+}
+
+int Portal_search_target(const char* name, const char* address, int port) {
+  if (!check_arguments(name, address, port, Caller())) return kFailed;
+  if (check_target_connected(name) != 0) {
+    LOG(1, "%s is connecting.", name);
+    return 2;
+  }
+  char iface[16];
+  if (_get_iface_name(iface, sizeof iface, address) != 0) return kFailed;
+  LOG(2, "ip: %s, port: %d", address, port);
+  const PathText path = discovery_path();
+  if (!discover(address, port, iface, path, Caller())) return not_offered(Caller());
+  File file(fopen(path, "re"));
+  if (file == nullptr) {
+    LOG(1, "discovery target failed at IP: %s Port: %d", address, port);
+    return 0;
+  }
+  const bool offered = find_offer(file.get(), name, address, port, Caller());
+  file.reset();
+  _remove_file(path);
+  return offered ? 1 : not_offered(Caller());
+}
+
+}  // namespace remvol
