@@ -1,0 +1,68 @@
+// The recover queue.
+#include "tree/recover_queue.h"
+
+#include "fakes.h"
+#include "frontend/log.h"
+
+using namespace remvol;
+
+namespace {
+
+class RecoverQueue : public fakes::Test {
+ protected:
+  ~RecoverQueue() override { debug_level = 0; }
+  char name_[256] = "";
+};
+
+std::string entry(int q) {
+  return "/temp/remvol/recover/queue/id:" + std::to_string(q);
+}
+
+}  // namespace
+
+TEST_F(RecoverQueue, FirstInFirstOut) {
+  EXPECT_EQ(ktree_insert_recover_queue("a"), 0);
+  EXPECT_EQ(ktree_insert_recover_queue("b"), 0);
+  EXPECT_EQ(ktree_pop_recover_queue(name_), 0);
+  EXPECT_STREQ(name_, "a");
+  EXPECT_EQ(fakes::tree_get(entry(1) + "/target_name"), "b");
+  EXPECT_EQ(ktree_pop_recover_queue(name_), 0);
+  EXPECT_STREQ(name_, "b");
+  EXPECT_EQ(ktree_pop_recover_queue(name_), -1);
+}
+
+TEST_F(RecoverQueue, TheHundredAndFirstIsRefused) {
+  for (int q = 1; q <= 100; q++) {
+    EXPECT_EQ(ktree_get_free_recover_queue_db_idx(), q);
+    ASSERT_EQ(ktree_insert_recover_queue(("t" + std::to_string(q)).c_str()), 0);
+  }
+  const std::string log = fakes::output_of([] { EXPECT_EQ(ktree_insert_recover_queue("late"), -1); });
+  EXPECT_NE(log.find("db failed or exceed max queue length"), std::string::npos);
+  EXPECT_EQ(ktree_get_free_recover_queue_db_idx(), -1);
+  EXPECT_EQ(fakes::tree_get(entry(101) + "/target_name"), std::nullopt);
+}
+
+TEST_F(RecoverQueue, ARefusedInsert) {
+  fakes::on("ktreec_set", entry(1) + "/target_name").returns(-1);
+  const std::string log = fakes::output_of([] { EXPECT_EQ(ktree_insert_recover_queue("a"), -103); });
+  EXPECT_NE(log.find("ktreec_set() failed"), std::string::npos);
+  EXPECT_EQ(fakes::writes().size(), 1u);
+}
+
+TEST_F(RecoverQueue, ARefusedDeleteStillGivesTheName) {
+  ktree_insert_recover_queue("a");
+  fakes::on("ktreec_del", entry(1)).returns(-1);
+  const std::string log = fakes::output_of([this] { EXPECT_EQ(ktree_pop_recover_queue(name_), -103); });
+  EXPECT_STREQ(name_, "a");
+  EXPECT_NE(log.find("ktreec_del() of path '/temp/remvol/recover/queue/id:1' failed"), std::string::npos);
+}
+
+TEST_F(RecoverQueue, AnEmptyQueueIsNotLogged) {
+  debug_level = 3;
+  EXPECT_EQ(fakes::output_of([this] { ktree_pop_recover_queue(name_); }), "");
+}
+
+TEST_F(RecoverQueue, AnEmptiedEntryIsReused) {
+  fakes::tree_set({{entry(1) + "/target_name", ""}, {entry(2) + "/target_name", "b"}});
+  EXPECT_EQ(ktree_get_free_recover_queue_db_idx(), 1);
+}

@@ -1,0 +1,160 @@
+// State numbers and their writers.
+#include "tree/state.h"
+
+#include "fakes.h"
+#include "frontend/log.h"
+#include "tree/entry.h"
+
+using namespace remvol;
+
+namespace {
+
+constexpr char kTarget[] = "/iscsi/initiator/id:2";
+constexpr char kLun[] = "/iscsi/initiator/id:2/lun/id:3";
+
+std::string key(const char* base, const char* name) {
+  return std::string(base) + "/" + name;
+}
+
+TargetEntry lun_entry() {
+  TargetEntry entry = {};
+  entry.db_idx = 2;
+  entry.lun_db_idx = 3;
+  return entry;
+}
+
+class State : public fakes::Test {
+ protected:
+  ~State() override { debug_level = 0; }
+};
+
+}  // namespace
+
+TEST_F(State, ConnectStateIsWrittenInOneTry) {
+  fakes::on("ktreec_set", key(kTarget, "conn_state")).returns(-1).times(1);
+  std::string log;
+  log = fakes::output_of([] { EXPECT_EQ(ktree_set_connect_state(2, 3), -103); });
+  EXPECT_NE(log.find("ktreec_set(/iscsi/initiator/id:2/conn_state) failed"), std::string::npos);
+  EXPECT_EQ(fakes::writes().size(), 1u);
+  EXPECT_EQ(ktree_set_connect_state(2, 3), 0);
+  EXPECT_EQ(fakes::tree_get(key(kTarget, "conn_state")), "3");
+}
+
+TEST_F(State, AccessRightOtherThanZeroOrOneIsRefused) {
+  const std::string log = fakes::output_of([] {
+    EXPECT_EQ(ktree_update_lun_vol_access_right(2, 2, 3), -1);
+    EXPECT_EQ(ktree_update_lun_vol_access_right(-1, 2, 3), -1);
+  });
+  EXPECT_NE(log.find("volume access right should be VOL_AC_RW or VOL_AC_RO, but you given 2"),
+            std::string::npos);
+  EXPECT_TRUE(fakes::writes().empty());
+}
+
+TEST_F(State, AccessRightNeedsBothSlots) {
+  int right = 7;
+  const std::string log = fakes::output_of([&right] {
+    EXPECT_EQ(ktree_update_lun_vol_access_right(1, 0, 3), -1);
+    EXPECT_EQ(ktree_update_lun_vol_access_right(1, 2, 0), -1);
+    EXPECT_EQ(ktree_get_lun_vol_access_right(&right, 2, 0), -1);
+    EXPECT_EQ(ktree_get_lun_vol_access_right(&right, 0, 3), -1);
+  });
+  EXPECT_NE(log.find("db index must > 0"), std::string::npos);
+  const std::string null_log =
+      fakes::output_of([] { EXPECT_EQ(ktree_get_lun_vol_access_right(nullptr, 2, 3), -1); });
+  EXPECT_NE(null_log.find("vol_ac is null"), std::string::npos);
+}
+
+TEST_F(State, OnlyAStoredZeroIsReadOnly) {
+  int right = 7;
+  EXPECT_EQ(ktree_get_lun_vol_access_right(&right, 2, 3), 0);
+  EXPECT_EQ(right, VOL_AC_RW);
+  for (const auto& [stored, expected] : fakes::Values{{"0", "0"}, {"1", "1"}, {"5", "1"}, {"", "1"}}) {
+    fakes::tree_set({{key(kLun, "vol_access_right"), stored}});
+    EXPECT_EQ(ktree_get_lun_vol_access_right(&right, 2, 3), 0);
+    EXPECT_EQ(std::to_string(right), expected) << stored;
+  }
+}
+
+TEST_F(State, SingleValuesAreTriedThreeTimes) {
+  const TargetEntry entry = lun_entry();
+  fakes::on("ktreec_set", key(kLun, "format_state")).returns(-1).times(2);
+  fakes::on("ktreec_set", key(kLun, "volume_state")).returns(-1);
+  std::string log = fakes::output_of([&entry] { EXPECT_EQ(ktree_update_formatting_state(&entry, 4), 0); });
+  EXPECT_EQ(fakes::tree_get(key(kLun, "format_state")), "4");
+  EXPECT_EQ(fakes::writes().size(), 3u);
+  log = fakes::output_of([&entry] { EXPECT_EQ(ktree_update_volume_state(&entry, 5), -103); });
+  EXPECT_EQ(fakes::writes().size(), 6u);
+  EXPECT_NE(log.find("(src.cpp:ktree_update_volume_state:"), std::string::npos);
+}
+
+TEST_F(State, FormatStateIsWrittenEvenWithoutSlots) {
+  TargetEntry entry = lun_entry();
+  entry.lun_db_idx = 0;
+  const std::string log = fakes::output_of([&entry] { ktree_update_formatting_state(&entry, 1); });
+  EXPECT_NE(log.find("target or lun db index not given"), std::string::npos);
+  EXPECT_EQ(fakes::writes().at(0), "set /iscsi/initiator/id:2/lun/id:0/format_state=1");
+}
+
+TEST_F(State, FormatProgressNeedsSlots) {
+  const std::string log = fakes::output_of([] { EXPECT_EQ(ktree_update_format_progress(0, 3, 10), -1); });
+  EXPECT_NE(log.find("target or lun db index not given"), std::string::npos);
+  EXPECT_TRUE(fakes::writes().empty());
+  debug_level = 2;
+  const std::string detail = fakes::output_of([] { EXPECT_EQ(ktree_update_format_progress(2, 3, 52), 0); });
+  EXPECT_NE(detail.find("set /iscsi/initiator/id:2/lun/id:3/format_progress = 52"), std::string::npos);
+  EXPECT_EQ(fakes::tree_get(key(kLun, "format_progress")), "52");
+}
+
+TEST_F(State, VolumeStateOfEveryLunUpToAGap) {
+  fakes::tree_set({{"/iscsi/initiator/id:1/target", "t"},
+                   {"/iscsi/initiator/id:1/lun/id:1/lun", "0"},
+                   {"/iscsi/initiator/id:1/lun/id:2/lun", "4"},
+                   {"/iscsi/initiator/id:1/lun/id:4/lun", "5"}});
+  TargetEntry entry = {};
+  strcpy(entry.target_name, "t");
+  EXPECT_EQ(ktree_update_all_volume_state(&entry, 4), 0);
+  EXPECT_EQ(fakes::writes(), (std::vector<std::string>{"set /iscsi/initiator/id:1/lun/id:1/volume_state=4",
+                                                       "set /iscsi/initiator/id:1/lun/id:2/volume_state=4"}));
+}
+
+TEST_F(State, VolumeStateOfEveryLunStopsAtAFailure) {
+  fakes::tree_set({{"/iscsi/initiator/id:1/target", "t"},
+                   {"/iscsi/initiator/id:1/lun/id:1/lun", "0"},
+                   {"/iscsi/initiator/id:1/lun/id:2/lun", "4"}});
+  fakes::on("ktreec_set", "/iscsi/initiator/id:1/lun/id:1/volume_state").returns(-1);
+  TargetEntry entry = {};
+  entry.db_idx = 1;
+  fakes::output_of([&entry] { EXPECT_EQ(ktree_update_all_volume_state(&entry, 3), -103); });
+  EXPECT_EQ(fakes::writes().size(), 3u);
+  EXPECT_EQ(ktree_update_all_volume_state(nullptr, 3), -1);
+  TargetEntry unknown = {};
+  strcpy(unknown.target_name, "nobody");
+  EXPECT_EQ(ktree_update_all_volume_state(&unknown, 3), -1);
+}
+
+TEST_F(State, MountInfoIgnoresRefusedWrites) {
+  TargetEntry entry = lun_entry();
+  fakes::on("ktreec_set", key(kLun, "mnt_dev")).returns(-1);
+  EXPECT_EQ(ktree_update_mount_info(&entry, "/dev/sdb1", "/mnt/VV/a", "ext4"), 0);
+  EXPECT_STREQ(entry.mnt_dev, "/dev/sdb1");
+  EXPECT_STREQ(entry.mnt, "/mnt/VV/a");
+  EXPECT_EQ(fakes::writes(), (std::vector<std::string>{"set " + key(kLun, "mnt_dev") + "=/dev/sdb1",
+                                                       "set " + key(kLun, "mnt") + "=/mnt/VV/a",
+                                                       "set " + key(kLun, "fs_type") + "=ext4"}));
+}
+
+TEST_F(State, ConnectionWishIsWrittenInOneTry) {
+  TargetEntry entry = lun_entry();
+  entry.conn_set = 1;
+  fakes::on("ktreec_set", key(kTarget, "conn_set")).returns(-1).times(1);
+  const std::string log = fakes::output_of([&entry] { EXPECT_EQ(ktree_record_connect_set(&entry), -103); });
+  EXPECT_NE(log.find("): ktreec_set() failed\n"), std::string::npos);
+  EXPECT_EQ(ktree_record_connect_set(&entry), 0);
+  EXPECT_EQ(fakes::tree_get(key(kTarget, "conn_set")), "1");
+}
+
+TEST_F(State, InitiatorName) {
+  fakes::on("ktreec_set", "/iscsi/initiator/iqn").returns(-1).times(2);
+  fakes::output_of([] { EXPECT_EQ(ktree_update_initiator_iqn("iqn.x"), 0); });
+  EXPECT_EQ(fakes::tree_get("/iscsi/initiator/iqn"), "iqn.x");
+}
