@@ -9,7 +9,7 @@
 #include "tree/entry.h"
 #include "tree/keys.h"
 #include "tree/state.h"
-#include "volume/mount.h"
+#include "volume/mount_point.h"
 
 namespace remvol {
 
@@ -88,7 +88,7 @@ int write_recognised(const TargetEntry* entry, const LunState& state, const char
   unsigned long long total = 0;
   unsigned long long used = 0;
   unsigned long long available = 0;
-  const Text<256> mount_point("%s%s", kMountRoot, entry->share);
+  const MountPointText mount_point = mount_point_of(entry->share);
   int result = kOk;
   if (sys_get_df_info(mount_point, &total, &used, &available) == 0) {
     result =

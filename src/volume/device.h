@@ -5,16 +5,21 @@
 namespace remvol {
 
 struct DeviceId {
-  char name[16];
+  char name[16];  // cut to 15 characters
   unsigned major;
   unsigned minor;
 };
 
+// Puts the disk's name into `parent` when `name` is a partition: the text before its first digit, the first
+// two characters not looked at (sdb1 is a partition of sdb; md127 counts as one of md). Returns whether it is
+// one.
+bool get_parent_disk(char (&parent)[256], const char* name);
+
 // Fills `id` (cleared by the caller) for a disk or partition by its kernel name, from sysfs. Returns 0 or -1.
 int _get_dev_id(DeviceId* id, const char* name);
 
-// Makes /dev/<name>, and for a disk the nodes of its partitions. Returns 0 when the step ran, even if
-// mknod(2) failed; -1 when the name is missing or sysfs does not know the device.
+// Makes /dev/<name> unless it is a block device already; anything else there is removed. Returns 0 when the
+// step ran, even if mknod(2) failed; -1 when the name is missing or sysfs does not know the device.
 int _create_device_node(const char* name);
 
 }  // namespace remvol

@@ -6,9 +6,11 @@
 
 namespace remvol {
 
-// Formats the partition node `partition` for the entry's LUN. Returns 0 (also when mke2fs itself failed); -1
-// bad arguments or the wait for the semaphore failed; -2 the partition cannot be written; -103 a state could
-// not be stored; or the result of leaving the semaphore.
+// Formats the partition node `partition` for the entry's LUN, with the ext2, ext3 or ext4 found on it, else
+// with ext4. Returns -1 for bad arguments or when the wait for the semaphore failed; -2 when the partition
+// cannot be written (this run then keeps the semaphore until it ends); else the result of leaving the
+// semaphore, whatever happened before: 0 also when mke2fs could not be started, failed, or a state could not
+// be stored.
 int Target_format(TargetEntry* entry, const char* partition);
 
 // Returns 0 when a mke2fs on a SCSI disk is running, else 1.

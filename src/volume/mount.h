@@ -3,20 +3,9 @@
 #define REMVOL_VOLUME_MOUNT_H
 
 #include "tree/record.h"
+#include "volume/mount_result.h"
 
 namespace remvol {
-
-inline constexpr char kMountRoot[] = "/mnt/VV/";
-
-// Results of Target_mount that its callers tell apart.
-enum MountResult : int {
-  kMountNoPartition = -2,
-  kMountFormatFailed = -3,
-  kMountNoMountPoint = -4,
-  kMountUnsupported = -6,
-  kMountReadOnly = -7,
-  kMountTooSmall = -8,
-};
 
 // Partitions, formats (when `force_format` is non-zero or there is no file system), mounts and records the
 // entry's LUN; reloads the share services when `update_share` is non-zero. Returns 0 (also when the mount

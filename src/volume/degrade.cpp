@@ -1,0 +1,207 @@
+#include "volume/degrade.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cctype>
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "frontend/log.h"
+#include "support/files.h"
+#include "support/text.h"
+#include "sysaux.h"
+#include "volume/mount.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr char kMtab[] = "/etc/mtab";
+constexpr char kProcMounts[] = "/proc/mounts";
+constexpr char kMountInfo[] = "/proc/self/mountinfo";
+constexpr char kSeparators[] = " \t";
+constexpr int kMountLine = 999;       // longest read of a mount table
+constexpr int kMountInfoLine = 8191;  // the lines of layered mounts are long
+constexpr int kRemountWait = 5;       // seconds, for a read-only file system to show after the remount
+
+// Returns whether the first "rw" or "ro" of `field`, at `found`, stands as an option of its own.
+bool is_bounded(const char* field, const char* found, size_t length) {
+  const auto ends = [](char c) { return c == ',' || isspace(static_cast<unsigned char>(c)) != 0; };
+  const char after = found[length];
+  return (found == field || ends(found[-1])) && (after == '\0' || ends(after));
+}
+
+// Returns whether one of the options in `field` is `option`, wherever it stands.
+bool has_option(const char* field, const char* option) {
+  const size_t length = strlen(option);
+  for (const char* found = strstr(field, option); found != nullptr; found = strstr(found + 1, option)) {
+    if (is_bounded(field, found, length)) return true;
+  }
+  return false;
+}
+
+// Returns what one field of a table line says of the access right. Only the first occurrence of each text
+// counts, and an "rw" inside a word hides an "ro" that follows in the same field.
+int field_right(const char* field) {
+  // Kernels from 6.14 on keep "rw" on a file system that refuses every write and add one of these.
+  if (has_option(field, "emergency_ro") || has_option(field, "shutdown")) return kMountedRo;
+  const char* found = strstr(field, "rw");
+  if (found != nullptr) return is_bounded(field, found, 2) ? kMountedRw : kMountedUnclear;
+  found = strstr(field, "ro");
+  return found != nullptr && is_bounded(field, found, 2) ? kMountedRo : kMountedUnclear;
+}
+
+// Returns whether the table line of `source` is one of `device`: the device itself or a partition of it.
+bool is_source_of(const char* source, const char* device, Caller caller = Caller()) {
+  const char* match = strstr(source, device);
+  if (match == nullptr) return false;
+  LOG_AT(caller, 2, "get a possible entry dev = |%s|", match);
+  const char next = match[strlen(device)];
+  if (next == '\0' || isdigit(static_cast<unsigned char>(next)) != 0) return true;
+  LOG_AT(caller, 2, "%s is not under %s, skip", match, device);
+  return false;
+}
+
+// Return the right that one line of a table gives `device`; kNotMounted when it is of another one. They cut
+// the line up.
+using LineReader = int (*)(char* line, const char* device, Caller caller);
+
+int read_mount_line(char* line, const char* device, Caller caller) {
+  char* rest = nullptr;
+  const char* source = strtok_r(line, kSeparators, &rest);
+  if (source == nullptr || !is_source_of(source, device, caller)) return kNotMounted;
+  while (const char* field = strtok_r(nullptr, kSeparators, &rest)) {
+    if (field[0] == '/') continue;
+    const int right = field_right(field);
+    if (right != kMountedUnclear) return right;
+  }
+  return kMountedUnclear;
+}
+
+// A line of /proc/self/mountinfo, see proc_pid_mountinfo(5): the mount's own options are its sixth field, the
+// source is the second one after the separator.
+int read_mountinfo_line(char* line, const char* device, Caller caller) {
+  char* separator = strstr(line, " - ");
+  if (separator == nullptr) return kNotMounted;
+  *separator = '\0';
+  char* rest = nullptr;
+  strtok_r(separator + 3, kSeparators, &rest);
+  const char* source = strtok_r(nullptr, kSeparators, &rest);
+  if (source == nullptr || !is_source_of(source, device, caller)) return kNotMounted;
+  const char* options = strtok_r(line, kSeparators, &rest);
+  for (int field = 1; field < 6 && options != nullptr; field++)
+    options = strtok_r(nullptr, kSeparators, &rest);
+  return options != nullptr ? field_right(options) : kMountedUnclear;
+}
+
+// Reads a table up to the first line that decides, in reads of at most `limit` characters.
+int read_table(const char* device, const char* table, LineReader read_line, int limit,
+               Caller caller = Caller()) {
+  const File file(fopen(table, "re"));
+  if (!file) {
+    LOG_AT(caller, 0, "failed to open mtab file at %s", table);
+    return kTableUnreadable;
+  }
+  int right = kNotMounted;
+  char line[kMountInfoLine + 1];
+  while (right != kMountedRw && right != kMountedRo && fgets(line, limit + 1, file.get()) != nullptr) {
+    const int found = read_line(line, device, caller);
+    if (found != kNotMounted) right = found;
+  }
+  LOG_AT(caller, 2, "get mnt file access right = %d for dev %s", right, device);
+  return right;
+}
+
+bool is_valid(const char* device) {
+  return device != nullptr && device[0] != '\0';
+}
+
+// Where /etc/mtab is a link into /proc (util-linux 2.23 and later leave it so), it says what the kernel says
+// now. What the volume was mounted with are the mount's own options then; they stay "rw" when the file system
+// itself turns read-only.
+bool is_mtab_live() {
+  char target[PATH_MAX];
+  return realpath(kMtab, target) != nullptr && strncmp(target, "/proc/", 6) == 0;
+}
+
+// Kernels 6.1.192, 6.12 and 6.13 show nothing of an ext4 that refuses every write: only a write tells. The
+// file has no name, so it leaves nothing behind. Errors other than a refusal decide nothing: not every file
+// system can make such a file.
+bool refuses_writes(const char* mount_path) {
+  const int fd = open(mount_path, O_TMPFILE | O_WRONLY | O_CLOEXEC, 0600);
+  const bool written = fd >= 0 && write(fd, "", 1) == 1 && fsync(fd) == 0;
+  const int error = written ? 0 : errno;
+  if (fd >= 0) close(fd);
+  return error == EROFS || error == EIO;
+}
+
+}  // namespace
+
+int get_mnt_ac_right_from_mnt_file(const char* device, const char* table) {
+  if (!is_valid(device)) return kTableUnreadable;
+  return read_table(device, table, read_mount_line, kMountLine);
+}
+
+int get_mtab_access_right(const char* device) {
+  if (!is_valid(device)) {
+    LOG(0, "dev is not valid value");
+    return kTableUnreadable;
+  }
+  const int right = is_mtab_live() ? read_table(device, kMountInfo, read_mountinfo_line, kMountInfoLine)
+                                   : get_mnt_ac_right_from_mnt_file(device, kMtab);
+  LOG(2, "get mtab access right = %d for dev %s", right, device);
+  return right;
+}
+
+int get_proc_mount_access_right(const char* device) {
+  if (!is_valid(device)) {
+    LOG(0, "dev is not valid value");
+    return kTableUnreadable;
+  }
+  const int right = get_mnt_ac_right_from_mnt_file(device, kProcMounts);
+  LOG(2, "get proc mounts access right = %d for dev %s", right, device);
+  return right;
+}
+
+int check_mnt_dev_degrade_to_ro(const char* device, const char* mount_path) {
+  if (!is_valid(device)) {
+    LOG(0, "dev is not valid!");
+    return -2;
+  }
+  const int mounted = get_mtab_access_right(device);
+  if (mounted == kNotMounted) {
+    LOG(0, "can not find %s in mtab", device);
+    return -1;
+  }
+  if (mounted < 0) {
+    LOG(0, "failed to get mtab access right");
+    return -2;
+  }
+  if (mounted == kMountedRo) {
+    LOG(1, "%s has been mounted as ro, skip to check degrade", device);
+    return 0;
+  }
+  const bool has_path = mount_path != nullptr && mount_path[0] != '\0';
+  if (has_path) remount_mnt_path(mount_path, kRemountWait);
+  const int now = get_proc_mount_access_right(device);
+  if (now == kNotMounted) {
+    LOG(1, "can not find %s in /proc/mounts", device);
+    return -1;
+  }
+  if (now < 0) {
+    LOG(0, "failed to get proc mounts access right for %s", device);
+    return -2;
+  }
+  if (now == kMountedRo || (has_path && sys_mount_point(mount_path) != 0 && refuses_writes(mount_path))) {
+    LOG(2, "the access right is degrade to ro for dev %s", device);
+    return 1;
+  }
+  LOG(2, "access right in mtab and proc are both rw for dev %s", device);
+  return 0;
+}
+
+}  // namespace remvol

@@ -1,0 +1,170 @@
+#include "volume/format.h"
+
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstring>
+
+#include "frontend/log.h"
+#include "support/locks.h"
+#include "support/text.h"
+#include "sysaux.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+#include "volume/format_progress.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kStartTries = 3;
+constexpr int kNotWritable = -2;
+constexpr char kDefaultFs[] = "ext4";
+using FsName = char[16];
+
+// Blocks of 4096 bytes, none reserved. MKE2FS_SYNC has mke2fs sync after so many block groups; see mke2fs(8).
+struct FormatCommand {
+  const char* fs_type;
+  const char* text;  // the partition's node follows
+};
+constexpr FormatCommand kFormatCommands[] = {
+    {"ext2", "MKE2FS_SYNC=100 mke2fs -m0 -b4096"},
+    {"ext3", "MKE2FS_SYNC=100 mke2fs -j -m0 -b4096"},
+    {"ext4", "MKE2FS_SYNC=100 mke2fs -j -m0 -b4096 -T ext4"},
+};
+
+const char* find_format_command(const char* fs_type) {
+  for (const FormatCommand& command : kFormatCommands) {
+    if (strcmp(command.fs_type, fs_type) == 0) return command.text;
+  }
+  return nullptr;
+}
+
+bool check_arguments(const TargetEntry* entry, const char* partition, Caller caller = Caller()) {
+  if (entry->dev[0] == '\0') {
+    LOG_AT(caller, 0, "dev node name is empty");
+    return false;
+  }
+  if (entry->db_idx <= 0 || entry->lun_db_idx <= 0) {
+    LOG_AT(caller, 0, "target or lun db index is not given");
+    return false;
+  }
+  if (partition == nullptr) {
+    LOG_AT(caller, 0, "no formatting dev to do");
+    return false;
+  }
+  return true;
+}
+
+// A state that could not be stored is logged and forgotten: the format goes on.
+void note_update(int result, Caller caller = Caller()) {
+  if (result != 0) LOG_AT(caller, 0, "Update ktree FAILED");
+}
+
+// A partition that carried ext2 or ext3 keeps its kind.
+void choose_fs(FsName& fs_type, const char* partition, Caller caller = Caller()) {
+  char found[64] = "";
+  if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') {
+    LOG_AT(caller, 2, "set strFS to default fs: %s", kDefaultFs);
+    copy_text(fs_type, kDefaultFs);
+    return;
+  }
+  copy_text(fs_type, found);
+}
+
+CommandText make_format_command(FsName& fs_type, const char* partition, Caller caller = Caller()) {
+  const char* command = find_format_command(fs_type);
+  if (command == nullptr) {
+    LOG_AT(caller, 1, "%s is not supported by this program, set file system type to %s", fs_type, kDefaultFs);
+    copy_text(fs_type, kDefaultFs);
+    command = find_format_command(fs_type);
+  }
+  return CommandText("%s %s", command, partition);
+}
+
+// Returns the running mke2fs, or null when it could not be started three times.
+FILE* start_mke2fs(FsName& fs_type, const char* partition, Caller caller = Caller()) {
+  CommandText command;
+  for (int tries = 0; tries < kStartTries; tries++) {
+    command = make_format_command(fs_type, partition, caller);
+    LOG_AT(caller, 2, "popen(%s)", command.c_str());
+    FILE* output = popen(command, "r");
+    if (output != nullptr) return output;
+    LOG_AT(caller, 0, "popen(%s , ...) failed", command.c_str());
+  }
+  LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
+  return nullptr;
+}
+
+// Publishes the progress until the output ends. How mke2fs ended is not asked: mounting notices a missing
+// file system.
+void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition, Caller caller = Caller()) {
+  FormatProgress progress{};
+  char text[kFormatReadSize];
+  while (fgets(text, sizeof text, output) != nullptr) {
+    if (!update_format_progress(&progress, text)) continue;
+    LOG_AT(caller, 2, "%s : Percent=%d", partition, progress.percent);
+    note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, progress.percent), caller);
+  }
+  pclose(output);
+  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100), caller);
+}
+
+// Returns whether a process whose line in the process list matches `pattern` (for grep) mentions `device`.
+bool is_process_listed(const char* pattern, const char* device, Caller caller = Caller()) {
+  const CommandText command("ps -w | grep %s | grep -v 'grep'", pattern);
+  FILE* list = popen(command, "r");
+  if (list == nullptr) return false;
+  char line[1024];
+  bool found = false;
+  while (!found && fgets(line, sizeof line, list) != nullptr) {
+    LOG_AT(caller, 2, "get ps mke2fs buf = %s", line);
+    found = strstr(line, device) != nullptr;
+  }
+  pclose(list);
+  return found;
+}
+
+}  // namespace
+
+int Target_format(TargetEntry* entry, const char* partition) {
+  if (!check_arguments(entry, partition)) return -1;
+  int sem_id = -1;
+  note_update(ktree_update_formatting_state(entry, kFormatWaiting));
+  if (format_sem_P(&sem_id, 1) != 0) {
+    note_update(ktree_update_formatting_state(entry, kFormatFailed));
+    LOG(0, "wait fmt_sem failed, exit");
+    return -1;
+  }
+  note_update(ktree_update_formatting_state(entry, kFormatting));
+  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0));
+  note_update(ktree_update_lun_status(entry, 1));
+  LOG(2, "format partition %s", partition);
+  System("fuser -mk \"%s\"", partition);
+  FsName fs_type;
+  choose_fs(fs_type, partition);
+  if (System("dd if=/dev/zero of=%s bs=1M count=1", partition) != 0) {
+    LOG(1, "dd %s failed, this device is not able to write.", partition);
+    // The semaphore stays taken and the format state stays "formatting" until this run ends; the kernel then
+    // undoes the semaphore's change.
+    return kNotWritable;
+  }
+  sleep(1);
+  FILE* output = start_mke2fs(fs_type, partition);
+  if (output != nullptr) follow_mke2fs(output, entry, partition);
+  note_update(ktree_update_formatting_state(entry, output != nullptr ? kFormatIdle : kFormatFailed));
+  const int result = format_sem_V(&sem_id);
+  if (result != 0) LOG(0, "release fmt_sem failed, exit");
+  return result;
+}
+
+int check_mkfs_process_existing() {
+  return is_process_listed("mke2fs", "/dev/sd") ? 0 : 1;
+}
+
+int check_resizing_fs(const char* device) {
+  LOG(2, "checking if device %s is resizing...", device);
+  return is_process_listed("resize2fs", device) ? 0 : 1;
+}
+
+}  // namespace remvol

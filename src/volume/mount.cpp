@@ -1,0 +1,301 @@
+#include "volume/mount.h"
+
+#include <unistd.h>
+
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <new>
+
+#include "frontend/log.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "sysaux.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+#include "tree/state.h"
+#include "tree/status_text.h"
+#include "volume/format.h"
+#include "volume/mount_point.h"
+#include "volume/partition.h"
+#include "volume/share_services.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kMountRetries = 3;
+constexpr unsigned kMountRetryWait = 500000;  // microseconds
+constexpr int kShortestRemountWait = 3;       // seconds
+
+constexpr char kUfsdMount[] = "mount -t ufsd -o rw,nls=utf8,fmask=0,dmask=0,force,user_xattr";
+
+struct MountCommand {
+  const char* fs_type;
+  const char* text;  // the partition's node and the quoted mount point follow
+};
+constexpr MountCommand kMountCommands[] = {
+    {"ext2", "mount -t ext2"},
+    {"ext3", "mount -t ext3"},
+    {"ext4", "mount -t ext4"},
+    {"vfat", "mount -t vfat -o umask=0,iocharset=utf8,shortname=winnt"},
+    {"ntfs", kUfsdMount},
+    {"hfsplus", kUfsdMount},
+    {"xfs", "mount -t xfs -o rw,attr2"},
+};
+
+// What the steps of a mount hand on.
+struct Volume {
+  TargetEntry* entry;
+  int force_format;
+  bool looks_empty;  // the format is forced only because no partition carries anything that is recognised
+  PartitionList partitions;
+  Text<64> node;     // of the chosen partition, or of the last one examined
+  char fs_type[64];  // on the node; empty when none is known
+  MountPointText mount_point;
+};
+
+int check_entry(const TargetEntry* entry, Caller caller = Caller()) {
+  if (entry == nullptr || entry->dev[0] == '\0') {
+    LOG_AT(caller, 0, "Error entry");
+    return kFailed;
+  }
+  if (entry->db_idx <= 0 || entry->lun_db_idx <= 0) {
+    LOG_AT(caller, 0, "Error entry - db_idx or lun_db_idx is not given");
+    return kFailed;
+  }
+  if (entry->share[0] == '\0') {
+    LOG_AT(caller, 0, "Error entry - share name is empty");
+    return kFailed;
+  }
+  if (!is_share_inside_root(entry->share, caller)) return kMountNoMountPoint;
+  return kOk;
+}
+
+// Updates a state of the LUN; a failure is logged.
+int note_update(int result, Caller caller = Caller()) {
+  if (result != 0) LOG_AT(caller, 0, "Update ktree FAILED");
+  return result;
+}
+
+int record_access_right(const TargetEntry* entry, int right, Caller caller = Caller()) {
+  const int result = ktree_update_lun_vol_access_right(right, entry->db_idx, entry->lun_db_idx);
+  if (result != 0) {
+    LOG_AT(caller, 0, "ktree_update_lun_vol_access_right to %s, FAILED, ret = %d",
+           right == VOL_AC_RW ? "RW" : "RO", result);
+  }
+  return result;
+}
+
+bool detect_fs(Volume* volume) {
+  memset(volume->fs_type, 0, sizeof volume->fs_type);
+  if (sys_get_fs_type(volume->fs_type, volume->node) != 0) volume->fs_type[0] = '\0';
+  return volume->fs_type[0] != '\0';
+}
+
+// Takes the first usable partition, or the first that carries something recognised. Returns whether there is
+// one.
+bool find_partition(Volume* volume, bool recognised) {
+  PartitionList names;
+  copy_text(names, volume->partitions);
+  char* rest = nullptr;
+  for (char* name = strtok_r(names, " ,", &rest); name != nullptr; name = strtok_r(nullptr, " ,", &rest)) {
+    volume->node = Text<64>("/dev/%s", name);
+    if (sys_check_dev(volume->node) == 0 && (!recognised || detect_fs(volume))) return true;
+  }
+  return false;
+}
+
+int pick_partition(Volume* volume) {
+  if (find_partition(volume, true)) return kOk;
+  volume->looks_empty = volume->force_format == 0;
+  volume->force_format = 1;
+  if (!find_partition(volume, false)) return kMountNoPartition;
+  return kOk;
+}
+
+// Data that nobody asked to overwrite is never formatted: what is recognised on a second look is mounted, and
+// a node that cannot be read any more is not taken for an empty one. Returns whether the node can be used.
+bool protect_data(Volume* volume) {
+  const bool known = volume->fs_type[0] != '\0';
+  if (known && volume->looks_empty) volume->force_format = 0;
+  return known || volume->force_format != 0 || sys_check_dev(volume->node) == 0;
+}
+
+int create_file_system(Volume* volume, Caller caller = Caller()) {
+  LOG_AT(caller, 0, "Got FS type = %s, creating volume", volume->fs_type);
+  const int result = Target_format(volume->entry, volume->node);
+  if (result == 0) return kOk;
+  if (result == -2 && record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
+  LOG_AT(caller, 0, "Create Format FAILED");
+  return kMountFormatFailed;
+}
+
+int keep_file_system(const Volume* volume, Caller caller = Caller()) {
+  LOG_AT(caller, 1, "Got FS type = %s, skip creating volume", volume->fs_type);
+  if (strcmp(volume->fs_type, "ext4") == 0 && sys_check_fs_state(volume->node) != 0) {
+    System("e2fsck -n -f %s", volume->node.c_str());  // a look that changes nothing
+  }
+  const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
+  return note_update(result, caller) != 0 ? kTreeFailed : kOk;
+}
+
+// Leaves the chosen partition with a known file system.
+int prepare_file_system(Volume* volume, Caller caller = Caller()) {
+  LOG_AT(caller, 2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
+  const bool known = detect_fs(volume);
+  if (!protect_data(volume)) return kMountNoPartition;
+  const int result = volume->force_format != 0 || !known ? create_file_system(volume, caller)
+                                                         : keep_file_system(volume, caller);
+  if (result != kOk) return result;
+  return detect_fs(volume) ? kOk : kFailed;
+}
+
+int make_mount_point(Volume* volume, Caller caller = Caller()) {
+  volume->mount_point = mount_point_of(volume->entry->share);
+  const CommandText command = command_on_path("mkdir -p", volume->mount_point);
+  LOG_AT(caller, 1, "cmd = %s", command.c_str());
+  if (system(command) == 0) return kOk;
+  LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
+  return kMountNoMountPoint;
+}
+
+const char* find_mount_command(const char* fs_type) {
+  for (const MountCommand& command : kMountCommands) {
+    if (strcmp(command.fs_type, fs_type) == 0) return command.text;
+  }
+  return nullptr;
+}
+
+void run_mount(const char* command, Caller caller = Caller()) {
+  LOG_AT(caller, 1, "cmd = %s", command);
+  int retries = 0;
+  while (system(command) != 0 && retries < kMountRetries) {
+    retries++;
+    LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
+    LOG_AT(caller, 0, "wait %u micro seconds", kMountRetryWait);
+    usleep(kMountRetryWait);
+  }
+}
+
+int mount_file_system(const Volume* volume, Caller caller = Caller()) {
+  const char* mount = find_mount_command(volume->fs_type);
+  if (mount == nullptr) {
+    LOG_AT(caller, 1, "Unsupported filesystem type %s", volume->fs_type);
+    const int result = ktree_update_volume_state(volume->entry, kVolumeUnsupported);
+    if (note_update(result, caller) != 0) return kTreeFailed;
+    return kMountUnsupported;
+  }
+  const Text<256> verb("%s %s", mount, volume->node.c_str());
+  run_mount(command_on_path(verb, volume->mount_point), caller);
+  return kOk;
+}
+
+// Opens the volume to everybody and records whether that could be written.
+int open_to_everybody(const Volume* volume, Caller caller = Caller()) {
+  if (system(command_on_path("chmod 777", volume->mount_point)) == 0) {
+    record_access_right(volume->entry, VOL_AC_RW, caller);
+    return kOk;
+  }
+  LOG_AT(caller, 1, "change mode 777 to %s failed, this might be a read only filesystem",
+         volume->entry->share);
+  if (record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
+  return kMountReadOnly;
+}
+
+int record_mount(const Volume* volume, Caller caller = Caller()) {
+  ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
+  if (strcmp(volume->fs_type, "ext4") == 0) {
+    // A file system that is older than its partition's growth fills it in the background.
+    System("resize2fs -fp %s &", volume->node.c_str());
+  }
+  note_update(ktree_update_volume_state(volume->entry, kVolumeNormal), caller);
+  return open_to_everybody(volume, caller);
+}
+
+void record_failed_mount(const Volume* volume, Caller caller = Caller()) {
+  note_update(ktree_update_volume_state(volume->entry, kVolumeFailed), caller);
+  const CommandText command = command_on_path("rm -rf", volume->mount_point);
+  if (!is_removal_unsafe(volume->mount_point, caller) && system(command) == 0) return;
+  LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
+}
+
+int record_outcome(const Volume* volume, Caller caller = Caller()) {
+  if (sys_mount_point(volume->mount_point) != 0) return record_mount(volume, caller);
+  record_failed_mount(volume, caller);
+  return kOk;
+}
+
+// Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.
+int bring_up(Volume* volume, Caller caller = Caller()) {
+  int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format);
+  if (result == kOk) result = pick_partition(volume);
+  if (result == kOk) result = prepare_file_system(volume, caller);
+  if (result == kOk) result = make_mount_point(volume, caller);
+  if (result == kOk) result = mount_file_system(volume, caller);
+  if (result == kOk) result = record_outcome(volume, caller);
+  return result;
+}
+
+}  // namespace
+
+int Target_mount(TargetEntry* entry, int force_format, int update_share) {
+  LOG(2, "start");
+  int result = check_entry(entry);
+  if (result != kOk) return result;
+  Volume volume{};
+  volume.entry = entry;
+  volume.force_format = force_format;
+  result = bring_up(&volume);
+  if (result != kOk) return result;
+  LOG(1, "Update_sharefolder_status = %d", update_share);
+  if (update_share != 0) reload_share_services();
+  LOG(2, "end");
+  return kOk;
+}
+
+int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share) {
+  if (entry == nullptr || entry->db_idx < 1) return kFailed;
+  LOG(2, "start");
+  for (int lun = 1; lun <= kMaxLunsPerTarget; lun++) {
+    if (!tree_present(KeyText(key::kLunNumber, entry->db_idx, lun))) break;
+    TargetEntry lun_entry;
+    if (ktree_get_lun_entry_by_dbidx(&lun_entry, entry->db_idx, lun) != 0) continue;
+    Target_mount(&lun_entry, force_format, update_share);
+    ktree_update_lun_status(&lun_entry, 0);
+  }
+  LOG(2, "end");
+  return kOk;
+}
+
+int remount_mnt_path(const char* path, int wait_seconds) {
+  if (path == nullptr) {
+    LOG(0, "mnt_path not vaild");
+    return kFailed;
+  }
+  const size_t size = 2 * (strlen(path) + 25);  // room for a path of which every character is escaped
+  const std::unique_ptr<char[]> escaped(new (std::nothrow) char[size]);
+  const std::unique_ptr<char[]> command(new (std::nothrow) char[size]);
+  if (!escaped || !command) {
+    LOG(0, "malloc failed");
+    return kFailed;
+  }
+  if (sys_mount_point(path) == 0) return kOk;
+  LOG(2, "start remount path %s", path);
+  str_insert_back_slash(escaped.get(), size, path);
+  snprintf(command.get(), size, "mount -o remount \"%s\"", escaped.get());
+  int result = kOk;
+  if (system(command.get()) != 0) {
+    LOG(0, "cmd '%s' failed", command.get());
+    result = kFailed;
+  }
+  if (wait_seconds > 0) {
+    if (wait_seconds <= kShortestRemountWait) wait_seconds = kShortestRemountWait;
+    LOG(2, "sleep %d seconds to wait remount done...", wait_seconds);
+    sleep(static_cast<unsigned>(wait_seconds));
+  }
+  return result;
+}
+
+}  // namespace remvol

@@ -1,0 +1,38 @@
+// Mount points of volumes: their paths, commands on them, and what keeps their removal from reaching a
+// volume.
+#ifndef REMVOL_VOLUME_MOUNT_POINT_H
+#define REMVOL_VOLUME_MOUNT_POINT_H
+
+#include "frontend/log.h"
+#include "support/text.h"
+
+namespace remvol {
+
+inline constexpr char kMountRoot[] = "/mnt/VV/";
+
+// The mount root and a share name.
+using MountPointText = Text<sizeof kMountRoot + 128>;
+
+// Returns the mount point of the share.
+MountPointText mount_point_of(const char* share);
+
+// Returns whether the share's mount point lies below the mount root. It does not when the name has a
+// component
+// "..", or none besides empty ones and "."; that is logged at level 0 in the caller's name.
+bool is_share_inside_root(const char* share, Caller caller = Caller());
+
+// Returns the shell command `verb "path"`, the path escaped. A path too long for that (more
+// than 1,023 characters that all need escaping) gives a command that does nothing and fails.
+CommandText command_on_path(const char* verb, const char* path);
+
+// Detaches what is mounted on `path`, layer by layer, each synced before; see umount2(2), MNT_DETACH.
+// Processes that use a layer keep it until they end. Stops at the first layer that cannot be detached.
+void detach_mounts(const char* path);
+
+// Returns whether "rm -rf" of `path` would run into a mounted file system: one is mounted on the path or
+// below it, or the mount table cannot be read. Logged at level 0 in the caller's name.
+bool is_removal_unsafe(const char* path, Caller caller = Caller());
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,115 @@
+#include "volume/partition.h"
+
+#include <cstdio>
+#include <cstring>
+
+#include "frontend/log.h"
+#include "support/files.h"
+#include "support/text.h"
+#include "sysaux.h"
+#include "tree/state.h"
+#include "volume/device.h"
+#include "volume/mount_result.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr long long kUnusableDiskSize = 1048576;  // bytes; a disk that is not larger may be a fake one
+constexpr long long kExpandMargin = 100000000;    // bytes; alignment and partition tables stay far below it
+
+int list_partitions(const char* device, PartitionList& partitions) {
+  memset(partitions, 0, sizeof partitions);
+  return sys_get_partition_list(partitions, device);
+}
+
+bool create_partition(const TargetEntry* entry, const char* device) {
+  LOG(2, "No partitions found on %s, try to create partition...", device);
+  ktree_update_volume_state(entry, kVolumeCreating);
+  LOG(2, "Creating partition on %s", device);
+  if (sys_create_1_partition(device) != 0) {
+    LOG(0, "Create partition FAILED");
+    ktree_update_volume_state(entry, kVolumeFailed);
+    return false;
+  }
+  ktree_update_volume_state(entry, kVolumeNormal);
+  _create_device_node(entry->dev);
+  return true;
+}
+
+// A partition that could not be grown is used as it is; the volume state then stays "creating" until a later
+// step sets it.
+void expand_partition(const TargetEntry* entry, const char* device) {
+  LOG(2, "%s, try to expand partition...", device);
+  LOG(2, "Expanding partition on %s", device);
+  ktree_update_volume_state(entry, kVolumeCreating);
+  if (sys_expand_1_partition(device) != 0) {
+    LOG(0, "Expand partition FAILED");
+    return;
+  }
+  ktree_update_volume_state(entry, kVolumeNormal);
+  _create_device_node(entry->dev);
+}
+
+// Returns false when an empty disk could not be given its partition.
+bool adjust_partitions(const TargetEntry* entry, const char* device, PartitionList& partitions,
+                       int* force_format) {
+  const int count = list_partitions(device, partitions);
+  if (count == 0) {
+    if (!create_partition(entry, device)) return false;
+    *force_format = 1;
+    list_partitions(device, partitions);
+  } else if (count == 1) {
+    LOG(2, "one partition found on %s", device);
+    if (check_1part_disk_need_to_expand(device) == 1) {
+      expand_partition(entry, device);
+      list_partitions(device, partitions);
+    }
+  }
+  return true;
+}
+
+}  // namespace
+
+int check_1part_disk_need_to_expand(const char* device) {
+  if (device == nullptr || device[0] == '\0') {
+    LOG(0, "dev string error!");
+    return -1;
+  }
+  PartitionList partitions;
+  if (list_partitions(device, partitions) != 1) {
+    LOG(2, "more than 1 partition or no part, skip!");
+    return 0;
+  }
+  partitions[strcspn(partitions, ",")] = '\0';
+  const long long disk_size = sys_get_disk_space("%s", device);
+  const long long part_size = sys_get_partition_size(partitions);
+  LOG(2, "disk_size = %lld, part_size = %lld", disk_size, part_size);
+  return part_size + kExpandMargin < disk_size ? 1 : 0;
+}
+
+int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format) {
+  const Text<64> device("/dev/%s", entry->dev);
+  const long long disk_size = sys_get_disk_space("%s", device.c_str());
+  LOG(2, "get disk_size = %lld", disk_size);
+  if (disk_size <= kUnusableDiskSize) {
+    LOG(0, "The disk size < 1MB, it might be a fake one. treat this disk as offline");
+    return kMountTooSmall;
+  }
+  if (!adjust_partitions(entry, device, partitions, force_format)) return kMountNoPartition;
+  if (partitions[0] == '\0') {
+    LOG(0, "Create partition FAILED");
+    ktree_update_volume_state(entry, kVolumeFailed);
+    return kMountNoPartition;
+  }
+  if (check_path_exist(device) != 0) {
+    const int result = _create_device_node(entry->dev);
+    if (result != 0) {
+      LOG(0, "create device node failed");
+      return result;
+    }
+  }
+  return 0;
+}
+
+}  // namespace remvol

@@ -1,0 +1,163 @@
+#include "volume/unmount.h"
+
+#include <mntent.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "frontend/log.h"
+#include "support/command.h"
+#include "support/files.h"
+#include "support/result.h"
+#include "support/text.h"
+#include "sysaux.h"
+#include "tree/access.h"
+#include "tree/entry.h"
+#include "tree/keys.h"
+#include "tree/status_text.h"
+#include "volume/mount.h"
+#include "volume/mount_point.h"
+#include "volume/share_services.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kFurtherRounds = 3;
+constexpr int kKillTries = 3;
+constexpr int kKillMaxWait = 200000;  // microseconds
+constexpr char kProcMounts[] = "/proc/mounts";
+constexpr char kPublicFtp[] = "/home/Public";
+constexpr size_t kFtpPathSize = 512;
+
+void kill_users(const char* mount_point, Caller caller = Caller()) {
+  LOG_AT(caller, 2, "start fuser");
+  const CommandText command = command_on_path("fuser -mk", mount_point);
+  const int status = process_system_cmd_mt(command, kKillTries, kKillMaxWait);
+  if (status != 0) LOG_AT(caller, 1, "cmd '%s' return code = %d", command.c_str(), status);
+}
+
+bool force_umount(const char* mount_point, Caller caller = Caller()) {
+  LOG_AT(caller, 2, "start umount");
+  const CommandText command = command_on_path("umount -f", mount_point);
+  if (system(command) == 0) return true;
+  LOG_AT(caller, 0, "cmd '%s' failed", command.c_str());
+  return false;
+}
+
+// Unmounts the path with its users killed. Another round starts only while something is mounted there: on a
+// path that another run has unmounted meanwhile, the kill would hit every process that uses the system's own
+// disk.
+void umount_with_rounds(const char* mount_point, Caller caller = Caller()) {
+  kill_users(mount_point, caller);
+  sleep(1);
+  bool done = force_umount(mount_point, caller);
+  for (int round = 0; !done && round < kFurtherRounds && sys_mount_point(mount_point) != 0; round++) {
+    kill_users(mount_point, caller);
+    done = force_umount(mount_point, caller);
+  }
+  LOG_AT(caller, 2, "end umount");
+}
+
+// Removes the mount point, whether or not the unmount worked. What is still mounted is detached first, so
+// that the removal never deletes a volume's files; when that cannot be had, nothing is removed.
+int remove_mount_point(const char* mount_point, Caller caller = Caller()) {
+  const CommandText command = command_on_path("rm -rf", mount_point);
+  if (!is_removal_unsafe(mount_point, caller) && system(command) == 0) return kOk;
+  LOG_AT(caller, 0, "cmd '%s' failed", command.c_str());
+  return kFailed;
+}
+
+// Unmounts every LUN of the target up to the first empty slot.
+void umount_luns(int dbidx) {
+  for (int lun = 1; lun <= kMaxLunsPerTarget; lun++) {
+    if (!tree_present(KeyText(key::kLunNumber, dbidx, lun))) return;
+    TargetEntry entry;
+    if (ktree_get_lun_entry_by_dbidx(&entry, dbidx, lun) != 0) continue;
+    Target_LUN_umount(&entry);
+    ktree_update_lun_status(&entry, 0);
+  }
+}
+
+}  // namespace
+
+int Target_LUN_umount(const TargetEntry* entry) {
+  LOG(2, "start");
+  if (entry == nullptr || entry->share[0] == '\0' || !is_share_inside_root(entry->share)) {
+    LOG(2, "end");
+    return kFailed;
+  }
+  System("fuser -mk %s", entry->mnt_dev);
+  const MountPointText mount_point = mount_point_of(entry->share);
+  if (check_path_exist(mount_point) != 0) return kOk;
+  if (sys_mount_point(mount_point) != 0) {
+    remount_mnt_path(mount_point, 0);
+    umount_with_rounds(mount_point);
+    detach_mounts(mount_point);
+  }
+  const int result = remove_mount_point(mount_point);
+  LOG(2, "end");
+  return result;
+}
+
+int Target_umount_all_lun(int dbidx) {
+  if (!tree_present(KeyText(key::kTargetName, dbidx))) return kFailed;
+  umount_luns(dbidx);
+  return kOk;
+}
+
+int Target_umount_all() {
+  LOG(2, "start");
+  for (int dbidx = 1; dbidx <= kMaxTargets; dbidx++) {
+    if (Target_umount_all_lun(dbidx) != kOk) break;
+  }
+  LOG(2, "end");
+  return kOk;
+}
+
+int get_ftp_share_path(const TargetEntry* entry, char* path) {
+  FILE* table = setmntent(kProcMounts, "re");
+  if (table == nullptr) {
+    LOG(0, "Can not open %s", kProcMounts);
+    return kMountTableUnreadable;
+  }
+  path[0] = '\0';
+  mntent mount;
+  char line[512];
+  while (getmntent_r(table, &mount, line, sizeof line) != nullptr) {
+    if (strcmp(mount.mnt_dir, "/") == 0 || strcmp(mount.mnt_fsname, entry->mnt_dev) != 0) continue;
+    LOG(2, "found pMntInfo->mnt_fsname = %s", mount.mnt_fsname);
+    LOG(2, "--> pMntInfo->mnt_dir = %s", mount.mnt_dir);
+    if (strstr(mount.mnt_dir, kPublicFtp) == nullptr) continue;
+    snprintf(path, kFtpPathSize, "%s", mount.mnt_dir);
+    break;
+  }
+  endmntent(table);
+  return path[0] != '\0' ? kOk : kNoFtpShare;
+}
+
+int Target_umount_ftp(const TargetEntry*, const char* path) {
+  LOG(1, "start umount ftp");
+  const CommandText kill = command_on_path("fuser -mk", path);
+  const int status = system(kill);
+  if (status != 0) LOG(1, "system() of cmd '%s' return code = %d", kill.c_str(), status);
+  const CommandText umount = command_on_path("umount -f", path);
+  if (system(umount) != 0) {
+    LOG(0, "system() of cmd '%s' failed", umount.c_str());
+    return kFailed;
+  }
+  LOG(1, "end umount ftp");
+  return kOk;
+}
+
+int Target_remount_ftp(const TargetEntry*, const char* path) {
+  LOG(1, "start mount ftp");
+  if (path[0] == '\0') return kFailed;
+  reload_share_services();
+  LOG(1, "end mount ftp");
+  return kOk;
+}
+
+}  // namespace remvol
