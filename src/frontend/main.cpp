@@ -56,11 +56,11 @@ const char* failure_message(const Command& command) {
 
 int run(const Command& command, const Options& options, Caller caller) {
   record_result("");
-  if (command.run == nullptr) return fail(false);
   if ((OPT_FLAG & command.required) != command.required) {
     LOG_AT(caller, 1, "OPT_FLAG: %08x", OPT_FLAG);
     return fail(false);
   }
+  if (command.run == nullptr) return fail(false);
   const int result = command.run(options);
   if (result != 0 && !command.reports_value) {
     LOG_AT(caller, 1, "%s", failure_message(command));

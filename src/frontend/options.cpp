@@ -23,6 +23,9 @@ namespace {
 
 constexpr int kVersion = 1;
 constexpr size_t kAddressSize = sizeof(TargetEntry::ip);
+// Reading the command line is main's work, and its messages have always borne main's name.
+#define LOG_AS_MAIN(level, ...) LOG_AT(Caller("main"), level, __VA_ARGS__)
+
 constexpr char kShortOptions[] = "i:p:n:s:vc:U:P:d:l:ho:w:";
 
 // The long options are the rows of the command table.
@@ -37,7 +40,7 @@ const option* long_options() {
 
 ParseEnd choose_command(int index, Options* options) {
   if (options->command >= 0) {
-    LOG(1, "Command parameter check failed, %d & %d", options->command, index);
+    LOG_AS_MAIN(1, "Command parameter check failed, %d & %d", options->command, index);
     return ParseEnd::kFail;
   }
   gs_str_command = kCommands[index].name;
@@ -47,27 +50,27 @@ ParseEnd choose_command(int index, Options* options) {
   return ParseEnd::kReady;
 }
 
-void log_option(int option, Caller caller) {
-  LOG_AT(caller, 1, "opt('%c') with arg '%s'", option, optarg);
-  LOG_AT(caller, 1, "OPT_FLAG: %08x", OPT_FLAG);
+void log_option(int option) {
+  LOG_AS_MAIN(1, "opt('%c') with arg '%s'", option, optarg);
+  LOG_AS_MAIN(1, "OPT_FLAG: %08x", OPT_FLAG);
 }
 
 template <size_t N>
 ParseEnd take_name(int option, unsigned bit, char (&field)[N]) {
   if (check_name(optarg) < 0) {
-    LOG(1, "Command parameter check failed, wrong name: '%s'", optarg);
+    LOG_AS_MAIN(1, "Command parameter check failed, wrong name: '%s'", optarg);
     return ParseEnd::kFail;
   }
   OPT_FLAG |= bit;
   copy_text(field, optarg);
-  log_option(option, Caller());
+  log_option(option);
   return ParseEnd::kReady;
 }
 
 ParseEnd take_number(int option, unsigned bit, int32_t* field) {
   OPT_FLAG |= bit;
   *field = atoi(optarg);
-  log_option(option, Caller());
+  log_option(option);
   return ParseEnd::kReady;
 }
 
@@ -77,7 +80,7 @@ template <size_t N>
 void take_credential(int option, char (&field)[N]) {
   if (request_target.chap != 1) return;
   copy_text(field, optarg);
-  log_option(option, Caller());
+  log_option(option);
 }
 
 ParseEnd take_secret() {
@@ -89,20 +92,20 @@ ParseEnd take_secret() {
 
 ParseEnd take_address() {
   OPT_FLAG |= kOptAddress;
-  log_option('i', Caller());
+  log_option('i');
   if (_resovle_net_address_to_ip(request_target.ip, &request_target.inet_type, optarg) != 0) {
-    LOG(0, "ip address %s -> error", optarg);
+    LOG_AS_MAIN(0, "ip address %s -> error", optarg);
     return ParseEnd::kFail;
   }
-  LOG(1, "get ip address %s = %s, inet_type = %s", optarg, request_target.ip,
-      request_target.inet_type == AF_INET ? "AF_INET" : "AF_INET6");
+  LOG_AS_MAIN(1, "get ip address %s = %s, inet_type = %s", optarg, request_target.ip,
+              request_target.inet_type == AF_INET ? "AF_INET" : "AF_INET6");
   return ParseEnd::kReady;
 }
 
 ParseEnd store_debug_level() {
   const NumberText value("%d", atoi(optarg));
-  LOG(0, "ktreec_set %s=%s", key::kDebugLevel, value.c_str());
-  if (tree_write(key::kDebugLevel, value) != kOk) LOG(0, "ktreec_set(%s) failed ", key::kDebugLevel);
+  LOG_AS_MAIN(0, "ktreec_set %s=%s", key::kDebugLevel, value.c_str());
+  if (tree_write(key::kDebugLevel, value) != kOk) LOG_AS_MAIN(0, "ktreec_set(%s) failed ", key::kDebugLevel);
   return ParseEnd::kExit;
 }
 
@@ -147,18 +150,19 @@ ParseEnd take_option(int option, int index, Options* options) {
   }
 }
 
-int format_ipv4(char* address, const sockaddr_in& socket) {
+int format_ipv4(char* address, const sockaddr_in& socket, Caller caller) {
   char text[kAddressSize] = "";
-  if (inet_ntop(AF_INET, &socket.sin_addr, text, sizeof text) == nullptr) LOG(1, "inet_ntop failed");
+  if (inet_ntop(AF_INET, &socket.sin_addr, text, sizeof text) == nullptr)
+    LOG_AT(caller, 1, "inet_ntop failed");
   memcpy(address, text, sizeof text);
   return kOk;
 }
 
-int format_ipv6(char* address, const sockaddr_in6& socket) {
+int format_ipv6(char* address, const sockaddr_in6& socket, Caller caller) {
   char text[INET6_ADDRSTRLEN] = "";
   if (inet_ntop(AF_INET6, &socket.sin6_addr, text, sizeof text) == nullptr) {
     puts("get address failed");
-    LOG(1, "inet_ntop failed");
+    LOG_AT(caller, 1, "inet_ntop failed");
     return kFailed;
   }
   snprintf(address, kAddressSize, "[%s]", text);
@@ -196,8 +200,9 @@ int _resovle_net_address_to_ip(char* address, int* family, const char* host) {
   sockaddr_storage socket = {};
   memcpy(&socket, found->ai_addr, found->ai_addrlen);
   freeaddrinfo(found);
-  if (*family == AF_INET) return format_ipv4(address, reinterpret_cast<const sockaddr_in&>(socket));
-  if (*family == AF_INET6) return format_ipv6(address, reinterpret_cast<const sockaddr_in6&>(socket));
+  if (*family == AF_INET) return format_ipv4(address, reinterpret_cast<const sockaddr_in&>(socket), Caller());
+  if (*family == AF_INET6)
+    return format_ipv6(address, reinterpret_cast<const sockaddr_in6&>(socket), Caller());
   LOG(1, "get ip address failed\n");
   return kFailed;
 }

@@ -72,11 +72,15 @@ The log, in order:
     box.runs(name)         argument lists of the fake command, with .shell (text of the calling shell), .lc_all
     box.forget()           starts a new log
 
+The tool's own log: messages(done.stdout) gives (file, function, text) of every line of the diagnostic log,
+said(done.stdout) the texts alone; box.debug(2) sets the debug level first.
+
 At its end a test fails for calls without an answer and for reports of the sanitizers. A program that outlives
 its time limit (20 s) is killed and raises.
 """
 
+from .log_lines import messages, said
 from .result import Call, Result, startswith
 from .world import Box
 
-__all__ = ["Box", "Call", "Result", "startswith"]
+__all__ = ["Box", "Call", "Result", "messages", "said", "startswith"]

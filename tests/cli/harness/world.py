@@ -198,6 +198,9 @@ class Box:
     def run(self, argv, *, input=None, env=None, cwd="/", timeout=TIMEOUT):
         return self.start(argv, input=input, env=env, cwd=cwd).wait(timeout)
 
+    def debug(self, level):
+        self.tree.set("/iscsi/initiator/dbg", level)
+
     def remvol(self, *args, **options):
         return self.run(["remvol", *args], **options)
 
