@@ -151,6 +151,12 @@ int Target_Config_Gen(TargetEntry* entry) {
   return _target_chap_apply(entry);
 }
 
+int _target_record_delete(TargetEntry* entry) {
+  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
+  run_node_command(entry, "delete", Caller());
+  return kOk;
+}
+
 int _target_login(TargetEntry* entry) {
   if (get_iface_name(entry) != kOk || entry->iface[0] == '\0') return kFailed;
   return _target_connect_run(entry->target_name, entry->ip, entry->port, entry->iface, true);
