@@ -1,7 +1,16 @@
 #include "frontend/commands.h"
 
 #include "frontend/request.h"
+#include "iscsi/address.h"
+#include "iscsi/discovery.h"
+#include "iscsi/initiator.h"
+#include "iscsi/lun_search.h"
 #include "tasks/add.h"
+#include "tasks/connect.h"
+#include "tasks/format.h"
+#include "tasks/recover.h"
+#include "tasks/remove.h"
+#include "tasks/status.h"
 #include "upgrade/remvol_ver_upgrade.h"
 
 namespace remvol {
@@ -12,8 +21,26 @@ constexpr unsigned kNone = 0;
 constexpr unsigned kPortal = kOptAddress | kOptPort;
 constexpr unsigned kOneLun = kOptName | kOptLun;
 
-int run_version_upgrade(const Options&) {
-  return version_upgrade();
+template <int (*kTask)()>
+int run(const Options&) {
+  return kTask();
+}
+
+int share(const Options&) {
+  return task_share(request_target.share);
+}
+
+int disconnect(const Options&) {
+  return task_disconnect((OPT_FLAG & kOptName) == 0 ? 1 : 0);
+}
+
+template <int kSystemOff>
+int deinit(const Options&) {
+  return task_deinit(kSystemOff);
+}
+
+int recover(const Options& options) {
+  return task_oiscsi_evt_recover(options.wait_seconds);
 }
 
 }  // namespace
@@ -21,24 +48,27 @@ int run_version_upgrade(const Options&) {
 // The failure texts of oiscsi_evt_recover and modify_address are those of other commands: scripts look for
 // them.
 const Command kCommands[kCommandCount] = {
-    {"init", nullptr, kNone, "task_init() failed", false, false, nullptr},
-    {"search", nullptr, kPortal, "task_search() failed", false, false, nullptr},
-    {"add", nullptr, kOneLun | kPortal | kOptShare, "task_add() failed", true, false, nullptr},
-    {"del", nullptr, kOptName, "task_del() failed", true, false, nullptr},
-    {"format", nullptr, kOneLun, "task_format() failed", true, false, nullptr},
-    {"modify", nullptr, kOptName | kOptChap, "task_modify() failed", true, false, nullptr},
-    {"status", nullptr, kNone, "task_status() failed", false, false, nullptr},
-    {"check_share_name", nullptr, kOptShare, "", false, true, nullptr},
-    {"disconnect", nullptr, kNone, "task_disconnect() failed", true, false, "task_disconnect(all) failed"},
-    {"connect", nullptr, kOptName, "task_connect() failed", true, false, nullptr},
-    {"system_off", nullptr, kNone, "system_off failed", false, false, nullptr},
-    {"deinit", nullptr, kNone, "task_deinit failed", false, false, nullptr},
-    {"oiscsi_evt_reopen", nullptr, kNone, "task_oiscsi_evt_reopen failed", false, false, nullptr},
-    {"oiscsi_evt_recover", nullptr, kNone, "task_oiscsi_evt_reopen failed", false, false, nullptr},
-    {"search_lun", nullptr, kOptName | kOptChap | kPortal, "task_search_lun() failed", false, false, nullptr},
-    {"del_lun", nullptr, kOneLun, "task_del_lun() failed", true, false, nullptr},
-    {"verupgrade", run_version_upgrade, kNone, "task_version_upgrade() failed", false, false, nullptr},
-    {"modify_address", nullptr, kOptName | kPortal, "task_modify() failed", false, false, nullptr},
+    {"init", run<task_init>, kNone, "task_init() failed", false, false, nullptr},
+    {"search", run<task_search>, kPortal, "task_search() failed", false, false, nullptr},
+    {"add", run<task_add>, kOneLun | kPortal | kOptShare, "task_add() failed", true, false, nullptr},
+    {"del", run<task_del>, kOptName, "task_del() failed", true, false, nullptr},
+    {"format", run<task_format>, kOneLun, "task_format() failed", true, false, nullptr},
+    {"modify", run<task_modify>, kOptName | kOptChap, "task_modify() failed", true, false, nullptr},
+    {"status", run<task_status>, kNone, "task_status() failed", false, false, nullptr},
+    {"check_share_name", share, kOptShare, "", false, true, nullptr},
+    {"disconnect", disconnect, kNone, "task_disconnect() failed", true, false, "task_disconnect(all) failed"},
+    {"connect", run<task_connect>, kOptName, "task_connect() failed", true, false, nullptr},
+    {"system_off", deinit<1>, kNone, "system_off failed", false, false, nullptr},
+    {"deinit", deinit<0>, kNone, "task_deinit failed", false, false, nullptr},
+    {"oiscsi_evt_reopen", run<task_oiscsi_evt_reopen>, kNone, "task_oiscsi_evt_reopen failed", false, false,
+     nullptr},
+    {"oiscsi_evt_recover", recover, kNone, "task_oiscsi_evt_reopen failed", false, false, nullptr},
+    {"search_lun", run<task_search_lun>, kOptName | kOptChap | kPortal, "task_search_lun() failed", false,
+     false, nullptr},
+    {"del_lun", run<task_del_lun>, kOneLun, "task_del_lun() failed", true, false, nullptr},
+    {"verupgrade", run<version_upgrade>, kNone, "task_version_upgrade() failed", false, false, nullptr},
+    {"modify_address", run<task_modify_target_address>, kOptName | kPortal, "task_modify() failed", false,
+     false, nullptr},
     {"help", nullptr, kNone, "", false, false, nullptr},
 };
 
