@@ -6,6 +6,7 @@ import pytest
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent))
 
+from appliance import Site  # noqa: E402
 from harness import Box  # noqa: E402
 
 
@@ -26,3 +27,9 @@ def box(bare_box):
     """A box: see the text of the package harness."""
     bare_box.tree.start()
     return bare_box
+
+
+@pytest.fixture
+def site(box):
+    """A box with targets: see the text of the module appliance."""
+    return Site(box)
