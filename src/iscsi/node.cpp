@@ -108,22 +108,6 @@ int _target_connect_run(const char* name, const char* address, int port, const c
   return confirm_login(name, Caller()) ? 0 : 1;
 }
 
-// Start-up: the target is logged in, but its session shows no disk that could be mounted. It is logged out
-// and stays so.
-void give_up_target(TargetEntry* entry, int reason, Caller caller) {
-  if (reason == kTargetNotListed) {
-    LOG_AT(caller, 1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
-  } else if (reason == kNoRunningDisk) {
-    LOG_AT(caller, 1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
-  } else if (reason == kTreeFailed) {
-    LOG_AT(caller, 0, "ktree failed");
-  }
-  // Written after a logout that worked; readers of the log know it so.
-  if (Target_Logout(entry) == 0) LOG_AT(caller, 1, "Logout Fail on Target: %s ", entry->target_name);
-  ktree_record_connect_set(entry);
-  ktree_update_all_volume_state(entry, kVolumeLost);
-}
-
 // Logs in to one stored target and mounts its volumes. Returns whether it came to the mounting.
 bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
   *result = Target_Connect(entry);
@@ -133,11 +117,12 @@ bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
   }
   *result = ktree_update_dev(entry);
   if (*result != 0) {
-    give_up_target(entry, *result, caller);
+    if (*result == kTreeFailed) LOG_AT(caller, 0, "ktree failed");
+    give_up_session(entry, *result, kVolumeLost, caller);
     *result = -1;
     return false;
   }
-  sleep(1);
+  sleep(kSettleSeconds);
   Target_mount_all_lun(entry, 0, 0);
   return true;
 }
@@ -145,8 +130,7 @@ bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
 }  // namespace
 
 int Target_Config_Gen(TargetEntry* entry) {
-  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
-  run_node_command(entry, "delete", Caller());
+  if (_target_record_delete(entry) != kOk) return kFailed;
   run_node_command(entry, "new", Caller());
   return _target_chap_apply(entry);
 }
@@ -173,6 +157,18 @@ int Target_Logout(TargetEntry* entry) {
   entry->conn_set = 0;
   ktree_set_connect_state(entry->db_idx, kDisconnected);
   return result;
+}
+
+void give_up_session(TargetEntry* entry, int reason, VolumeState state, Caller caller) {
+  if (reason == kTargetNotListed) {
+    LOG_AT(caller, 1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
+  } else if (reason == kNoRunningDisk) {
+    LOG_AT(caller, 1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
+  }
+  // Written after a logout that worked; readers of the log know it so.
+  if (Target_Logout(entry) == kOk) LOG_AT(caller, 1, "Logout Fail on Target: %s ", entry->target_name);
+  ktree_record_connect_set(entry);
+  ktree_update_all_volume_state(entry, state);
 }
 
 int _target_disconnect(const TargetEntry* entry) {

@@ -2,7 +2,9 @@
 #ifndef REMVOL_ISCSI_NODE_H
 #define REMVOL_ISCSI_NODE_H
 
+#include "frontend/log.h"
 #include "tree/record.h"
+#include "tree/state.h"
 
 namespace remvol {
 
@@ -24,6 +26,11 @@ int Target_Connect(TargetEntry* entry);
 // Logs out, clears conn_set in the entry and sets the connect state "disconnected". Returns 0, or 1 when the
 // command failed.
 int Target_Logout(TargetEntry* entry);
+
+// Gives up a login whose session shows no disk that could be mounted: logs out, stores that the target stays
+// disconnected and `state` for all its LUNs. `reason` is the result of ktree_update_dev; it and the outcome
+// are logged in the caller's name.
+void give_up_session(TargetEntry* entry, int reason, VolumeState state, Caller caller);
 
 // Logs out and changes nothing else. Returns 0, 1 when the command failed, -1 for an empty target name.
 int _target_disconnect(const TargetEntry* entry);

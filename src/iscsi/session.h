@@ -7,6 +7,9 @@
 
 namespace remvol {
 
+// The devices of a fresh session need a moment before they can be mounted.
+inline constexpr unsigned kSettleSeconds = 1;
+
 // Results of ktree_update_dev that its callers tell apart.
 enum DeviceResult : int {
   kTargetNotListed = -1,

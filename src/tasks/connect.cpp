@@ -19,9 +19,6 @@ namespace remvol {
 
 namespace {
 
-// The devices of a fresh session need a moment.
-constexpr unsigned kSettleSeconds = 1;
-
 // A mount that was refused for its entry (-1) or that found the volume read-only leaves the state "normal".
 VolumeState _state_after_mount(int mounted) {
   switch (mounted) {
@@ -60,26 +57,17 @@ int _mount_enabled_luns(TargetEntry* entry, int dbidx) {
   return result;
 }
 
-// Takes the session down again after a login that brought no usable disk; `found` is what ktree_update_dev
-// said. Returns the command's result: a tree that refuses writes counts as success, and the session stays.
-int _give_up_session(TargetEntry* entry, int found) {
-  if (found == kTreeFailed) {
-    LOG(0, "ktree failed, exit...");
-    return kOk;
-  }
-  if (found == -1) LOG(1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
-  if (found == -2) LOG(1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
-  // The message comes when the logout worked. Whoever reads these logs knows it so.
-  if (Target_Logout(entry) == kOk) LOG(1, "Logout Fail on Target: %s ", entry->target_name);
-  ktree_record_connect_set(entry);
-  ktree_update_all_volume_state(entry, kVolumeFailed);
-  return kFailed;
-}
-
 // Finds the disks of a target that was just logged in, and mounts them. Returns the command's result.
 int _present_volumes(TargetEntry* entry) {
   const int found = ktree_update_dev(entry);
-  if (found != kOk) return _give_up_session(entry, found);
+  if (found == kTreeFailed) {
+    LOG(0, "ktree failed, exit...");
+    return kOk;  // the session stays, and so does the user's wish
+  }
+  if (found != kOk) {
+    give_up_session(entry, found, kVolumeFailed, Caller());
+    return kFailed;
+  }
   sleep(kSettleSeconds);
   const int result = _mount_enabled_luns(entry, entry->db_idx);
   ktree_update_status(entry);

@@ -20,9 +20,6 @@ namespace remvol {
 
 namespace {
 
-// The devices of a fresh session need a moment.
-constexpr unsigned kSettleSeconds = 1;
-
 // Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry or no device; 1
 // unknown target or LUN.
 int _read_lun_to_format(TargetEntry* entry) {
