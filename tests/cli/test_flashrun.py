@@ -47,6 +47,20 @@ class Flash:
     def commands(self, name):
         return [pid for pid, argv in self.box.processes().items() if os.path.basename(argv[0]) == name]
 
+    def kill_all(self, name):
+        """Kills every process of that name and waits until they have let go of their files."""
+        processes = self.commands(name)
+        self.sh("kill -9 " + " ".join(map(str, processes)))
+        for pid in processes:
+            self.box.wait_until(lambda: self.is_dead(pid), what=f"the end of {name}")
+
+    def is_dead(self, pid):
+        try:
+            stat = (self.box.root / "proc" / str(pid) / "stat").read_text()
+        except OSError:
+            return True
+        return stat.rsplit(")", 1)[1].split()[0] == "Z"
+
 
 @pytest.fixture
 def flash(bare_box):
@@ -117,7 +131,7 @@ def test_a_killed_flashrun_closes_the_flash_when_its_command_is_through(flash):
     os.kill(host_pid(flash, running.pid), signal.SIGKILL)
     assert running.wait().status == -9
     assert not flash.read_only
-    flash.sh("kill -9 " + " ".join(map(str, flash.commands("sleep"))))
+    flash.kill_all("sleep")
     flash.wait_read_only()
 
 
@@ -145,9 +159,9 @@ def test_when_all_of_it_is_killed_the_next_run_closes_the_flash(flash):
     flash.mount()
     running = flash.start("sleep 1000")
     flash.box.wait_until(lambda: flash.commands("sleep"), what="the command")
-    flash.sh("kill -9 " + " ".join(map(str, flash.commands("flashrun"))))
+    flash.kill_all("flashrun")
     running.wait()
-    flash.sh("kill -9 " + " ".join(map(str, flash.commands("sleep"))))
+    flash.kill_all("sleep")
     assert not flash.read_only
     assert flash.run("true").status == 0
     assert flash.read_only
@@ -188,7 +202,7 @@ def test_a_file_left_open_for_writing_is_reported_and_closed_by_the_next_run(fla
     done = flash.run(f"exec 3>{FOLDER}/f; sleep 1000 >/dev/null 2>&1 &")
     assert done.status == 0
     assert done.stderr == f"flashrun: {FOLDER} stays writable: Device or resource busy\n"
-    flash.sh("kill -9 " + " ".join(map(str, flash.commands("sleep"))))
+    flash.kill_all("sleep")
     assert flash.run("true").status == 0
     assert flash.read_only
 
