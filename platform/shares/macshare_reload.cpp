@@ -1,0 +1,40 @@
+// macshare_reload: makes every mounted volume a netatalk share. Without netatalk there is nothing to do: Macs
+// then use the Samba shares, which winshare_reload prepares for them.
+#include <cerrno>
+#include <cstring>
+
+#include "process.h"
+#include "reload.h"
+#include "server_config.h"
+
+using namespace shares;
+
+namespace {
+
+constexpr char kConfig[] = "/etc/netatalk/afp.conf";
+constexpr char kShares[] = "/run/remvol/afp-shares.conf";
+constexpr char kLock[] = "/run/remvol/afp-shares.lock";
+
+}  // namespace
+
+int main() {
+  open_log("macshare_reload");
+  if (!is_installed("netatalk")) {
+    log_line("netatalk is not installed; Macs use the Samba shares");
+    return 0;
+  }
+  if (!take_turn(kLock)) {
+    log_line("%s: %s", kLock, strerror(errno));
+    return 0;
+  }
+  const ServerConfig config = parse_server_config(read_file(kConfig), kShares);
+  const Reload done = reload_shares({"macshare_reload", kShares, kNetatalkNames, config.names, ""});
+  if (!done.has_tree) {
+    log_line("the configuration tree does not answer; only shares that are gone are taken out");
+  } else if (!config.includes_shares && !done.shares.empty()) {
+    log_line("%s does not include %s; nobody sees the shares", kConfig, kShares);
+  }
+  // netatalk(8): SIGHUP makes it and its servers read the configuration again.
+  if (done.changed && run({"killall", "-q", "-HUP", "netatalk"}) != 0) log_line("netatalk does not run");
+  return 0;
+}

@@ -1,0 +1,85 @@
+#include "process.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cstdarg>
+#include <cstdlib>
+#include <string_view>
+
+namespace shares {
+namespace {
+
+constexpr char kFolder[] = "/run/remvol";
+constexpr int kPatience = 5000;  // milliseconds
+
+pid_t start_quietly(const std::vector<std::string>& words) {
+  std::vector<char*> argv;
+  for (const std::string& word : words) argv.push_back(const_cast<char*>(word.c_str()));
+  argv.push_back(nullptr);
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  for (int stream = 0; stream <= 2; ++stream) {
+    posix_spawn_file_actions_addopen(&actions, stream, "/dev/null", O_RDWR, 0);
+  }
+  pid_t child = -1;
+  if (posix_spawnp(&child, argv[0], &actions, nullptr, argv.data(), environ) != 0) child = -1;
+  posix_spawn_file_actions_destroy(&actions);
+  return child;
+}
+
+void wait_or_kill(pid_t child) {
+  const int handle = static_cast<int>(syscall(SYS_pidfd_open, child, 0));
+  if (handle < 0) return;
+  pollfd ended{handle, POLLIN, 0};
+  if (poll(&ended, 1, kPatience) == 0) kill(child, SIGKILL);
+  close(handle);
+}
+
+}  // namespace
+
+void open_log(const char* program) {
+  openlog(program, LOG_PERROR, LOG_DAEMON);
+}
+
+void log_line(const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  vsyslog(LOG_NOTICE, format, arguments);
+  va_end(arguments);
+}
+
+bool take_turn(const char* lock_file) {
+  mkdir(kFolder, 0755);
+  const int fd = open(lock_file, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+  return fd >= 0 && flock(fd, LOCK_EX) == 0;
+}
+
+int run(const std::vector<std::string>& words) {
+  const pid_t child = start_quietly(words);
+  if (child < 0) return -1;
+  wait_or_kill(child);
+  int status = 0;
+  return waitpid(child, &status, 0) == child && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+bool is_installed(const char* program) {
+  const char* path = getenv("PATH");
+  for (std::string_view rest = path != nullptr ? path : "/usr/sbin:/usr/bin:/sbin:/bin"; !rest.empty();) {
+    const size_t end = rest.find(':');
+    const std::string file = std::string(rest.substr(0, end)) + "/" + program;
+    if (access(file.c_str(), X_OK) == 0) return true;
+    rest.remove_prefix(end == std::string_view::npos ? rest.size() : end + 1);
+  }
+  return false;
+}
+
+}  // namespace shares

@@ -1,0 +1,35 @@
+// The work of a share reload: the mounted volumes of the tree become the sections of a generated file.
+#ifndef PLATFORM_SHARES_RELOAD_H
+#define PLATFORM_SHARES_RELOAD_H
+
+#include <string>
+#include <vector>
+
+#include "share_file.h"
+#include "share_name.h"
+
+namespace shares {
+
+// A file server, as a reload sees it.
+struct Server {
+  const char* reload;  // name of the reload program
+  const char* file;    // the generated file
+  const NameRules& names;
+  std::vector<std::wstring> taken;  // folded names of shares that are not ours
+  std::string attribute_options;    // lines for volumes whose file system keeps user attributes
+};
+
+struct Reload {
+  bool has_tree;                // false: the shares are the earlier ones that are still mounted
+  bool changed;                 // the generated file was replaced
+  std::vector<Section> shares;  // what it holds now
+  std::vector<Section> gone;    // what it held before
+};
+
+// Brings the generated file up to date. A volume whose name the server cannot use is left out with a line in
+// the log, and so is a change that cannot be written.
+Reload reload_shares(const Server& server);
+
+}  // namespace shares
+
+#endif

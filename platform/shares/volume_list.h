@@ -1,0 +1,26 @@
+// The volumes of the configuration tree that are mounted.
+#ifndef PLATFORM_SHARES_VOLUME_LIST_H
+#define PLATFORM_SHARES_VOLUME_LIST_H
+
+#include <string>
+#include <vector>
+
+namespace shares {
+
+struct Volume {
+  std::string name;  // share name, as the tree has it
+  std::string path;  // where it is mounted
+  bool read_only;
+  bool extended_attributes;  // the file system keeps user attributes of files
+};
+
+// Puts the mounted volumes into `volumes`, in the tree's order. Returns false when the tree cannot be
+// reached; the list is then incomplete.
+bool read_mounted_volumes(std::vector<Volume>& volumes);
+
+// True when `path` is a mount point.
+bool is_mounted(const std::string& path);
+
+}  // namespace shares
+
+#endif

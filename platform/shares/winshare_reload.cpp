@@ -1,0 +1,81 @@
+// winshare_reload: makes every mounted volume a Samba share.
+//
+// The shares stand in a file of their own that smb.conf includes. A running server is told only when that
+// file changed, and clients of a share that is gone are cut off, since the folder below it is no volume any
+// more.
+#include <glob.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+
+#include "process.h"
+#include "reload.h"
+#include "server_config.h"
+
+using namespace shares;
+
+namespace {
+
+constexpr char kConfig[] = "/etc/samba/smb.conf";
+constexpr char kShares[] = "/run/remvol/smb-shares.conf";
+constexpr char kLock[] = "/run/remvol/smb-shares.lock";
+constexpr char kPidFile[] = "/run/samba/smbd.pid";
+
+bool has_module(const std::string& name) {
+  glob_t found{};
+  const bool there =
+      glob(("/usr/lib*/*/samba/vfs/" + name + ".so").c_str(), GLOB_NOSORT, nullptr, &found) == 0 ||
+      glob(("/usr/lib*/samba/vfs/" + name + ".so").c_str(), GLOB_NOSORT, nullptr, &found) == 0;
+  globfree(&found);
+  return there;
+}
+
+// What lets Macs keep their file attributes, where they have no server of their own; vfs_fruit(8).
+std::string options_for_macs(const ServerConfig& config) {
+  const bool wanted = !is_installed("netatalk") && !config.sets_vfs_objects && has_module("catia") &&
+                      has_module("fruit") && has_module("streams_xattr");
+  return wanted ? "\tvfs objects = catia fruit streams_xattr\n" : "";
+}
+
+bool samba_runs() {
+  const int pid = atoi(read_file(kPidFile).c_str());
+  return pid > 0 && (kill(pid, 0) == 0 || errno == EPERM);
+}
+
+void tell_samba(const Reload& done) {
+  if (!samba_runs()) log_line("Samba does not run; it finds the shares when it starts");
+  if (run({"smbcontrol", "all", "reload-config"}) != 0)
+    log_line("smbcontrol failed; Samba may not know the shares");
+  for (const Section& share : done.gone) run({"smbcontrol", "smbd", "close-share", share.name});
+}
+
+void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool has_samba) {
+  if (!has_samba && !done.has_tree) {
+    log_line("nothing to do without Samba and without the configuration tree");
+  } else if (!has_samba) {
+    log_line("Samba is not installed; nobody reads %s", kShares);
+  } else if (!done.has_tree) {
+    log_line("the configuration tree does not answer; only shares that are gone are taken out");
+  } else if (!config.includes_shares && !done.shares.empty()) {
+    log_line("%s does not include %s; nobody sees the shares", kConfig, kShares);
+  }
+}
+
+}  // namespace
+
+int main() {
+  open_log("winshare_reload");
+  if (!take_turn(kLock)) {
+    log_line("%s: %s", kLock, strerror(errno));
+    return 0;
+  }
+  const ServerConfig config = parse_server_config(read_file(kConfig), kShares);
+  const Reload done =
+      reload_shares({"winshare_reload", kShares, kSambaNames, config.names, options_for_macs(config)});
+  const bool has_samba = is_installed("smbcontrol");
+  tell_what_is_missing(done, config, has_samba);
+  if (done.changed && has_samba) tell_samba(done);
+  return 0;
+}

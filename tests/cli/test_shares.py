@@ -1,0 +1,396 @@
+"""winshare_reload and macshare_reload: the mounted volumes of the tree are the shares of the file servers."""
+
+import os
+import time
+
+import pytest
+
+SMB_CONF = "/etc/samba/smb.conf"
+SHARES = "/run/remvol/smb-shares.conf"
+AFP_SHARES = "/run/remvol/afp-shares.conf"
+HEAD = "# Made by winshare_reload from the volumes that are mounted. Changes here are lost.\n"
+FOR_MACS = "\tvfs objects = catia fruit streams_xattr\n"
+
+
+def section(name, read_only=False, options=""):
+    return f"[{name}]\n\tpath = /mnt/VV/{name}\n\tread only = {'yes' if read_only else 'no'}\n{options}"
+
+
+class Shares:
+    """A box with Samba (its control program fake, its server the box's first process) and no module for Macs."""
+
+    def __init__(self, box):
+        self.box = box
+        box.write(SMB_CONF, f"[global]\nworkgroup = W\ninclude = {SHARES}\n")
+        box.write("/run/samba/smbd.pid", "1\n")
+        box.default("smbcontrol")
+        self.path = f"/fake/bin:{box.build}/bin"
+        self.volumes = 0
+        self.sh("rm -rf /usr/lib/*/samba/vfs /usr/lib/samba/vfs")
+
+    def sh(self, text):
+        done = self.box.run(["sh", "-c", text], env={"LD_PRELOAD": None, "PATH": "/usr/sbin:/usr/bin:/sbin:/bin"})
+        assert done.status == 0, done.stderr
+        return done.stdout
+
+    def add(self, name, mounted=True, **keys):
+        """Adds a target with one volume to the tree."""
+        self.volumes += 1
+        target = f"/iscsi/initiator/id:{self.volumes}"
+        values = {f"{target}/target": f"iqn.t{self.volumes}", f"{target}/lun/id:1/lun": "0",
+                  f"{target}/lun/id:1/share": name, f"{target}/lun/id:1/fs_type": "ext4"}
+        self.box.tree.set({**values, **{f"{target}/lun/id:1/{key}": value for key, value in keys.items()}})
+        if mounted:
+            self.mount(name)
+
+    def mount(self, name):
+        folder = os.fsencode("/mnt/VV/" + name)
+        done = self.box.run(["/bin/mkdir", "-p", "--", folder.decode("utf-8", "surrogateescape")])
+        assert done.status == 0, done.stderr
+        done = self.box.run(["/bin/mount", "-t", "tmpfs", "vol", "/mnt/VV/" + name], env={"LD_PRELOAD": None})
+        assert done.status == 0, done.stderr
+
+    def umount(self, name):
+        self.sh(f"umount '/mnt/VV/{name}' && rmdir '/mnt/VV/{name}'")
+
+    def reload(self, program="winshare_reload", path=None):
+        env = {"LD_PRELOAD": None, "PATH": path or self.path}
+        done = self.box.run([self.box.build / "bin" / program], env=env)
+        assert (done.status, done.stdout) == (0, "")
+        return done.stderr
+
+    def file(self, path=SHARES):
+        return self.box.path(path).read_text()
+
+    def told(self):
+        calls = [list(call) for call in self.box.runs("smbcontrol")]
+        self.box.forget()
+        return calls
+
+
+@pytest.fixture
+def shares(box):
+    return Shares(box)
+
+
+def test_a_mounted_volume_becomes_a_share(shares):
+    shares.add("Backup")
+    assert shares.reload() == ""
+    assert shares.file() == HEAD + section("Backup")
+    assert shares.told() == [["all", "reload-config"]]
+    mode = shares.box.path(SHARES).stat().st_mode
+    assert mode & 0o777 == 0o644
+
+
+def test_a_volume_that_is_not_mounted_is_not_shared(shares):
+    shares.add("Mounted")
+    shares.add("Absent", mounted=False)
+    shares.sh("mkdir /mnt/VV/Absent")
+    shares.reload()
+    assert shares.file() == HEAD + section("Mounted")
+
+
+def test_every_volume_of_every_target_is_shared(shares):
+    shares.add("A")
+    shares.box.tree.set({"/iscsi/initiator/id:1/lun/id:2/lun": "3", "/iscsi/initiator/id:1/lun/id:2/share": "B"})
+    shares.mount("B")
+    shares.add("C")
+    shares.reload()
+    assert shares.file() == HEAD + section("A") + section("B") + section("C")
+
+
+@pytest.mark.parametrize("right, read_only", [("0", True), ("1", False), ("", False), (None, False)])
+def test_the_access_right_decides_who_may_write(shares, right, read_only):
+    shares.add("V", **({} if right is None else {"vol_access_right": right}))
+    shares.reload()
+    assert shares.file() == HEAD + section("V", read_only)
+
+
+def test_nothing_is_written_or_told_when_nothing_changed(shares):
+    shares.add("V")
+    shares.reload()
+    shares.told()
+    before = shares.box.path(SHARES).stat()
+    assert shares.reload() == ""
+    after = shares.box.path(SHARES).stat()
+    assert (before.st_ino, before.st_mtime_ns) == (after.st_ino, after.st_mtime_ns)
+    assert shares.told() == []
+
+
+def test_a_change_replaces_the_file_in_one_step(shares):
+    shares.add("V")
+    shares.reload()
+    before = shares.box.path(SHARES).stat().st_ino
+    shares.box.tree.set("/iscsi/initiator/id:1/lun/id:1/vol_access_right", "0")
+    shares.reload()
+    assert shares.file() == HEAD + section("V", read_only=True)
+    assert shares.box.path(SHARES).stat().st_ino != before
+    assert sorted(os.listdir(shares.box.path("/run/remvol"))) == ["smb-shares.conf", "smb-shares.lock"]
+
+
+def test_clients_of_a_share_that_is_gone_are_cut_off(shares):
+    for name in ("Stays", "Goes away", "Über"):
+        shares.add(name)
+    shares.reload()
+    shares.told()
+    shares.umount("Goes away")
+    shares.umount("Über")
+    assert shares.reload() == ""
+    assert shares.file() == HEAD + section("Stays")
+    assert shares.told() == [["all", "reload-config"], ["smbd", "close-share", "Goes away"],
+                             ["smbd", "close-share", "Über"]]
+
+
+def test_the_last_share_that_goes_leaves_an_empty_file(shares):
+    shares.add("V")
+    shares.reload()
+    shares.box.tree.delete("/iscsi/initiator/id:1")
+    shares.reload()
+    assert shares.file() == HEAD
+
+
+@pytest.mark.parametrize("name", ["two words", "日本語", "Ünïcode – 3", "C# notes", "it's", "a&b", "$HOME", "-rf",
+                                  "x" * 120, "(1)", "!", "~"])
+def test_unusual_names_are_shared(shares, name):
+    shares.add(name)
+    assert shares.reload() == ""
+    assert shares.file() == HEAD + section(name)
+
+
+RESERVED = "the file server keeps this name for itself"
+FORBIDDEN = "it holds a character that the file server does not allow in names"
+CONTROL = "it holds a control character"
+REFUSED = [
+    *((name, RESERVED) for name in ("global", "GLOBAL", "Glo bal", "globals", "homes", "Printers", "print$", "IPC$",
+                                    "ADMIN$")),
+    *((name, FORBIDDEN) for name in ("a]b", "a[b", "%U", "50%", "back\\", "mid\\dle", "; x", "a=b", "a,b", "*", "a?",
+                                     'a"b', "a:b", "a|b", "<a>")),
+    *((name, CONTROL) for name in ("a\nb", "a\tb", "x\r", "a\x7fb", "\x1b[2J", "a\u0085b", "a\u2028b")),
+    (" lead", "it begins or ends with a blank"),
+    ("trail ", "it begins or ends with a blank"),
+    ("two  blanks", "it holds several blanks in a row"),
+    ("# note", "it begins like a comment"),
+    ("bad\udcff", "it is not UTF-8"),
+    ("V]\n\tpath = /etc\n[x", CONTROL),
+]
+
+
+@pytest.mark.parametrize("name, why", REFUSED)
+def test_a_name_that_cannot_be_carried_is_refused_and_the_others_are_served(shares, name, why):
+    shares.add("First")
+    shares.add(name)
+    shares.add("Last")
+    log = shares.reload()
+    assert shares.file() == HEAD + section("First") + section("Last")
+    assert log.count("\n") == 1 and log.endswith(f'" is not shared: {why}\n'), log
+    assert log.startswith('winshare_reload: volume "') and log.isprintable() is False
+    assert not any(ord(character) < 32 for character in log[:-1])
+
+
+@pytest.mark.parametrize("name", ["..", ".", "a/../../../etc", "a/b", "/"])
+def test_a_name_that_leads_elsewhere_is_never_shared(shares, name):
+    shares.sh("mkdir -p /mnt/VV/a/b /etc && mount -t tmpfs x /mnt/VV/a/b && mount -t tmpfs y /mnt/VV")
+    shares.sh("mkdir -p /mnt/VV/a/b && mount -t tmpfs x /mnt/VV/a/b")
+    shares.add(name, mounted=False)
+    shares.reload()
+    assert not shares.box.path(SHARES).exists()
+
+
+def test_names_that_differ_in_case_alone_are_one_share(shares):
+    shares.add("Straße Ä")
+    shares.add("straße ä")
+    log = shares.reload()
+    assert shares.file() == HEAD + section("Straße Ä")
+    assert log == 'winshare_reload: volume "straße ä" is not shared: another share has this name\n'
+
+
+def test_a_share_of_the_administrator_is_not_taken_over(shares):
+    shares.box.write(SMB_CONF, f"[global]\n include = {SHARES}\n; [Other]\n [ public ]\npath = /srv/public\n")
+    shares.add("Public")
+    shares.add("Other")
+    log = shares.reload()
+    assert shares.file() == HEAD + section("Other")
+    assert log == 'winshare_reload: volume "Public" is not shared: another share has this name\n'
+
+
+def test_eight_volumes_of_which_one_is_broken(shares):
+    names = ["One", "Two", "Three", "bro]ken", "Five", "Six", "Seven", "Eight"]
+    for name in names:
+        shares.add(name)
+    log = shares.reload()
+    assert log.count("\n") == 1
+    assert shares.file() == HEAD + "".join(section(name) for name in names if name != "bro]ken")
+
+
+def test_a_hint_when_smb_conf_does_not_include_the_shares(shares):
+    shares.box.write(SMB_CONF, f"[global]\n# include = {SHARES}\n")
+    shares.add("V")
+    assert shares.reload() == f"winshare_reload: {SMB_CONF} does not include {SHARES}; nobody sees the shares\n"
+    assert shares.file() == HEAD + section("V")
+
+
+# --- what is missing ---
+
+
+def test_without_samba_one_line(shares):
+    shares.add("V")
+    log = shares.reload(path="/nowhere")
+    assert log == f"winshare_reload: Samba is not installed; nobody reads {SHARES}\n"
+    assert shares.file() == HEAD + section("V")
+
+
+def test_without_samba_and_tree_one_line(shares):
+    shares.box.tree.stop()
+    log = shares.reload(path="/nowhere")
+    assert log == "winshare_reload: nothing to do without Samba and without the configuration tree\n"
+    assert not shares.box.path(SHARES).exists()
+
+
+def test_a_stopped_samba_gets_the_file_and_one_line(shares):
+    shares.box.path("/run/samba/smbd.pid").unlink()
+    shares.add("V")
+    assert shares.reload() == "winshare_reload: Samba does not run; it finds the shares when it starts\n"
+    assert shares.file() == HEAD + section("V")
+
+
+def test_a_failing_smbcontrol_is_one_line(shares):
+    shares.box.fake("smbcontrol", status=1)
+    shares.add("V")
+    assert shares.reload() == "winshare_reload: smbcontrol failed; Samba may not know the shares\n"
+
+
+def test_without_the_tree_the_mounted_volumes_stay_shared(shares):
+    shares.add("Stays", vol_access_right="0")
+    shares.add("Goes")
+    shares.reload()
+    shares.told()
+    shares.box.tree.stop()
+    line = "winshare_reload: the configuration tree does not answer; only shares that are gone are taken out\n"
+    assert shares.reload() == line
+    assert shares.told() == []
+    shares.umount("Goes")
+    assert shares.reload() == line
+    assert shares.file() == HEAD + section("Stays", read_only=True)
+    assert shares.told() == [["all", "reload-config"], ["smbd", "close-share", "Goes"]]
+
+
+def test_a_hung_smbcontrol_does_not_hang_the_reload(shares):
+    shares.box.fake("smbcontrol", delay=1000, times=1)
+    shares.add("V")
+    assert shares.reload() == "winshare_reload: smbcontrol failed; Samba may not know the shares\n"
+
+
+def test_nothing_to_do_takes_less_than_50_ms(shares):
+    shares.add("V")
+    shares.reload()
+
+    def took(**options):
+        times = []
+        for _ in range(5):
+            start = time.monotonic()
+            shares.reload(**options)
+            times.append(time.monotonic() - start)
+        return min(times)
+
+    assert took() < 0.05
+    assert took(program="macshare_reload") < 0.05
+    shares.box.tree.stop()
+    assert took() < 0.05
+    assert took(path="/nowhere") < 0.05
+
+
+def test_reloads_at_the_same_time_leave_the_newest_state(shares):
+    shares.add("V")
+    env = {"LD_PRELOAD": None, "PATH": shares.path}
+    runs = [shares.box.start([shares.box.build / "bin/winshare_reload"], env=env) for _ in range(10)]
+    shares.add("W")
+    runs += [shares.box.start([shares.box.build / "bin/winshare_reload"], env=env) for _ in range(10)]
+    assert [run.wait().status for run in runs] == [0] * 20
+    assert shares.file() == HEAD + section("V") + section("W")
+
+
+# --- Macs ---
+
+
+def install_modules(shares, *names):
+    for name in names or ("catia", "fruit", "streams_xattr"):
+        shares.box.write(f"/usr/lib/x86_64-linux-gnu/samba/vfs/{name}.so", "")
+
+
+def test_macs_use_samba_where_it_has_the_modules(shares):
+    install_modules(shares)
+    shares.add("V")
+    shares.reload()
+    assert shares.file() == HEAD + section("V", options=FOR_MACS)
+
+
+def test_a_file_system_without_attributes_gets_no_options_for_macs(shares):
+    install_modules(shares)
+    shares.add("Stick", fs_type="vfat")
+    shares.reload()
+    assert shares.file() == HEAD + section("Stick")
+
+
+def test_a_missing_module_would_make_the_share_unusable(shares):
+    install_modules(shares, "catia", "streams_xattr")
+    shares.add("V")
+    shares.reload()
+    assert shares.file() == HEAD + section("V")
+
+
+def test_modules_that_the_administrator_chose_are_kept(shares):
+    install_modules(shares)
+    shares.box.write(SMB_CONF, f"[global]\nVFS Objects = recycle\ninclude = {SHARES}\n")
+    shares.add("V")
+    shares.reload()
+    assert shares.file() == HEAD + section("V")
+
+
+def test_without_netatalk_one_line_and_nothing_done(shares):
+    shares.add("V")
+    log = shares.reload("macshare_reload")
+    assert log == "macshare_reload: netatalk is not installed; Macs use the Samba shares\n"
+    assert not shares.box.path("/run/remvol").exists()
+
+
+@pytest.fixture
+def netatalk(shares):
+    shares.box.fake("netatalk")
+    shares.box.default("killall")
+    shares.box.write("/etc/netatalk/afp.conf", f"[Global]\ninclude = {AFP_SHARES}\n[Mine]\npath = /srv\n")
+    return shares
+
+
+def afp(netatalk, *sections):
+    return HEAD.replace("winshare", "macshare") + "".join(sections)
+
+
+def test_netatalk_gets_the_shares_of_its_own(netatalk):
+    install_modules(netatalk)
+    netatalk.add("V")
+    netatalk.add("R", vol_access_right="0")
+    assert netatalk.reload("macshare_reload") == ""
+    assert netatalk.file(AFP_SHARES) == afp(netatalk, section("V"), section("R", read_only=True))
+    assert netatalk.box.runs("killall") == [["-q", "-HUP", "netatalk"]]
+    netatalk.reload("macshare_reload")
+    assert len(netatalk.box.runs("killall")) == 1
+    netatalk.reload()
+    assert FOR_MACS not in netatalk.file()
+
+
+def test_netatalk_has_name_rules_of_its_own(netatalk):
+    for name in ("pay$", "mine", "IPC", "Homes"):
+        netatalk.add(name)
+    log = netatalk.reload("macshare_reload")
+    assert netatalk.file(AFP_SHARES) == afp(netatalk, section("IPC"))
+    assert log.splitlines() == [
+        f'macshare_reload: volume "pay$" is not shared: {FORBIDDEN}',
+        'macshare_reload: volume "mine" is not shared: another share has this name',
+        f'macshare_reload: volume "Homes" is not shared: {RESERVED}',
+    ]
+
+
+def test_a_stopped_netatalk_is_one_line(netatalk):
+    netatalk.box.fake("killall", status=1)
+    netatalk.add("V")
+    assert netatalk.reload("macshare_reload") == "macshare_reload: netatalk does not run\n"
