@@ -44,13 +44,15 @@ long long sys_get_disk_space(const char* format, ...) __attribute__((format(prin
  * partitions; they count also when it refuses them, so 0 means that there is no partition on the disk. */
 int sys_get_partition_list(char* out, const char* device);
 
-/* Writes a new partition table with one partition that covers the disk. The partition's node is there when
- * the call returns. A disk that carries a signature of its own is refused. Returns 0, or non-zero. */
+/* Writes a new partition table (GPT) with one aligned partition of the type "Linux filesystem" that covers
+ * the disk. Returns when the partition's node is in /dev, or after 5 seconds. Refused are a disk in use, one
+ * with partitions, one that carries a file system, LVM, RAID, encryption or another signature of its own, and
+ * one that cannot be read. What lies in the new partition's place stays as it is. Returns 0, or non-zero. */
 int sys_create_1_partition(const char* device);
 
-/* Grows the only partition of `device` (GPT, or primary in a DOS table, which ends at 2 TiB) to the end of
- * the disk and keeps its data; it may be mounted. Returns 0 when the kernel shows the new size, or non-zero.
- */
+/* Grows the only partition of `device` (in a GPT, or a primary one in a DOS table, which ends at 2 TiB) to
+ * the end of the disk and keeps its data; it may be mounted. Returns 0 when the kernel shows the new size, or
+ * non-zero. */
 int sys_expand_1_partition(const char* device);
 
 /* Returns the size of a partition by its kernel name, such as sdb1; 0 or less when unknown. */
@@ -59,9 +61,12 @@ long long sys_get_partition_size(const char* name);
 /* Returns 0 when `node` is a block device whose first mebibyte can be read in full, non-zero otherwise. */
 int sys_check_dev(const char* node);
 
-/* Puts the name of the file system on `node` into `out`, which holds at least 16 characters. Another
- * signature (LVM, RAID, encryption ...) counts and gives its name, cut to 15 characters. Returns 0, or
- * non-zero when nothing is recognised. */
+/* Puts the name of the file system on `node` into `out`, which holds at least 16 characters: ext2, ext3,
+ * ext4, vfat, ntfs, hfsplus, xfs, or what libblkid(3) calls it. Another signature (LVM, RAID, encryption,
+ * swap, a partition table ...) counts and gives its name, cut to 15 characters; several that contradict each
+ * other give "ambivalent", a device that reads at its start and fails further on gives "unreadable": neither
+ * is empty. Returns 0; 1 when all places were examined and nothing was recognised; -1 when `node` is no block
+ * device or cannot be read, so that nothing is known of it. `out` is the empty text in both. */
 int sys_get_fs_type(char* out, const char* node);
 
 /* Returns non-zero when the ext2, ext3 or ext4 file system on `node` says of itself that it wants a check:
