@@ -10,8 +10,22 @@ namespace sysaux {
 
 namespace {
 
-// The four answers of blkid_do_safeprobe (libblkid's manual).
-enum Answer { kFound = 0, kNothing = 1, kAmbivalent = -2, kFailed = -1 };
+enum class Answer { found, nothing, ambivalent, failed };
+
+// The answers of blkid_do_safeprobe. Its manual has -1 for an error; the library passes on any negative
+// errno.
+Answer answer_of(int result) {
+  switch (result) {
+    case 0:
+      return Answer::found;
+    case 1:
+      return Answer::nothing;
+    case -2:
+      return Answer::ambivalent;
+    default:
+      return Answer::failed;
+  }
+}
 
 int collect(blkid_partlist table, Extent* extents, int max) {
   const int all = table != nullptr ? blkid_partlist_numof_partitions(table) : 0;
@@ -41,9 +55,9 @@ class Probe {
   Probe& operator=(const Probe&) = delete;
 
   Answer run(int superblock_flags) {
-    if (!ready_) return kFailed;
+    if (!ready_) return Answer::failed;
     blkid_probe_set_superblocks_flags(probe_, BLKID_SUBLKS_TYPE | superblock_flags);
-    return static_cast<Answer>(blkid_do_safeprobe(probe_));
+    return answer_of(blkid_do_safeprobe(probe_));
   }
 
   const char* value(const char* tag) const {
@@ -82,12 +96,12 @@ Content recognise(int device, char name[16]) {
   name[0] = '\0';
   Probe probe(device);
   Answer answer = probe.run(0);
-  if (answer != kAmbivalent && answer != kFailed && probe.value("TYPE") == nullptr) {
+  if (answer != Answer::ambivalent && answer != Answer::failed && probe.value("TYPE") == nullptr) {
     answer = probe.run(BLKID_SUBLKS_BADCSUM);
   }
-  if (answer == kNothing) return Content::nothing;
-  if (answer != kFound && answer != kAmbivalent) return Content::unreadable;
-  const char* type = answer == kFound ? probe.value("TYPE") : "ambivalent";
+  if (answer == Answer::nothing) return Content::nothing;
+  if (answer != Answer::found && answer != Answer::ambivalent) return Content::unreadable;
+  const char* type = answer == Answer::found ? probe.value("TYPE") : "ambivalent";
   const char* found = type != nullptr ? type : probe.value("PTTYPE");
   snprintf(name, 16, "%.15s", found != nullptr ? found : "unknown");
   if (type != nullptr) return Content::signature;
@@ -96,7 +110,7 @@ Content recognise(int device, char name[16]) {
 
 int read_table(int disk, Extent* extents, int max) {
   Probe probe(disk);
-  if (probe.run(0) == kFailed) return -1;
+  if (probe.run(0) == Answer::failed) return -1;
   return probe.partitions(extents, max);
 }
 
