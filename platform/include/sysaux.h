@@ -40,8 +40,9 @@ long long sys_get_disk_space(const char* format, ...) __attribute__((format(prin
 
 /* Writes the kernel names of the partitions of `device` (a path), joined by ",", into `out`, which holds at
  * least 1024 characters; names that do not fit are left out. Returns their number; -1 when `device` is no
- * block device or cannot be read. Where the kernel has not read the partition table, it is told of the
- * partitions; they count also when it refuses them, so 0 means that there is no partition on the disk. */
+ * block device, cannot be read, or has a GPT of which only the protective MBR can be used. Where the kernel
+ * has not read the partition table, it is told of the partitions; they count also when it refuses them, so 0
+ * means that there is no partition on the disk. */
 int sys_get_partition_list(char* out, const char* device);
 
 /* Writes a new partition table (GPT) with one aligned partition of the type "Linux filesystem" that covers

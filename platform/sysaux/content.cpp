@@ -65,6 +65,13 @@ class Probe {
     return blkid_probe_lookup_value(probe_, tag, &text, nullptr) == 0 ? text : nullptr;
   }
 
+  // A protective MBR whose GPT cannot be used: the disk shrank, its sectors changed their size, or the table
+  // is damaged. What partitions there are is not known then.
+  bool has_lost_gpt() const {
+    const char* type = value("PTTYPE");
+    return type != nullptr && strcmp(type, "PMBR") == 0;
+  }
+
   // The partitions in the table. An empty table of another kind may hide a GPT, so that is looked for then.
   int partitions(Extent* extents, int max) {
     if (!ready_) return 0;
@@ -110,7 +117,7 @@ Content recognise(int device, char name[16]) {
 
 int read_table(int disk, Extent* extents, int max) {
   Probe probe(disk);
-  if (probe.run(0) == Answer::failed) return -1;
+  if (probe.run(0) == Answer::failed || probe.has_lost_gpt()) return -1;
   return probe.partitions(extents, max);
 }
 

@@ -22,8 +22,8 @@ enum class Content {
 Content recognise(int device, char name[16]);
 
 // The partitions that the partition table of the open disk has, in the order of their numbers, at most `max`.
-// Returns their number, 0 also when there is no table, -1 when a read failed. A table that is left in the
-// backup GPT alone counts.
+// Returns their number, 0 also when there is no table, -1 when they are not known: a read failed, or only the
+// protective MBR of a GPT is left. A table that is left in the backup GPT alone counts.
 int read_table(int disk, Extent* extents, int max);
 
 }  // namespace sysaux

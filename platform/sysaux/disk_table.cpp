@@ -173,12 +173,16 @@ bool publish(const LockedDisk& disk, const Extent& extent) {
   return true;
 }
 
-// Where the partition could end: at the last aligned sector that the table can describe. A DOS table counts
-// sectors in 32 bits.
+constexpr fdisk_sector_t kDosEnd = UINT32_MAX;  // a DOS table counts sectors in 32 bits
+
+bool too_large_for_table(const Table& table) {
+  return fdisk_is_label(table.context(), DOS) && fdisk_get_last_lba(table.context()) >= kDosEnd;
+}
+
+// Where the partition could end: at the last aligned sector that the table can describe.
 fdisk_sector_t last_possible_end(const Table& table) {
   fdisk_context* context = table.context();
-  fdisk_sector_t end = fdisk_get_last_lba(context) + 1;
-  if (fdisk_is_label(context, DOS) && end > UINT32_MAX) end = UINT32_MAX;
+  const fdisk_sector_t end = too_large_for_table(table) ? kDosEnd : fdisk_get_last_lba(context) + 1;
   return end - end % (fdisk_get_grain_size(context) / fdisk_get_sector_size(context));
 }
 
@@ -217,7 +221,7 @@ bool grow_entry(const LockedDisk& disk, Table* table, fdisk_partition* entry, Ex
   if (!is_plain(*table, entry) || !kernel_agrees(disk, *extent)) return false;
   const fdisk_sector_t start = fdisk_partition_get_start(entry);
   const fdisk_sector_t end = last_possible_end(*table);
-  if (end <= start + fdisk_partition_get_size(entry)) return true;
+  if (end <= start + fdisk_partition_get_size(entry)) return !too_large_for_table(*table);
   if (!set_size(*table, entry, end - start) || !table->write()) return false;
   extent->size = table->to_kernel_units(end - start);
   return true;

@@ -1,0 +1,177 @@
+"""What the platform recognises on a device, and what it never takes for an empty one."""
+
+import pytest
+from sysaux_lib import (
+    MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, run, under_fault,
+)
+
+__all__ = ["loop"]
+
+
+@pytest.mark.parametrize("kind", ["ext2", "ext3", "ext4"])
+def test_ext_file_systems_have_their_names(loop, kind):
+    disk = loop()
+    make_ext(disk, kind=kind)
+    assert call("fs_type", disk.node) == (0, kind)
+
+
+def test_vfat_and_xfs_have_their_names(loop):
+    fat, xfs = loop(), loop(512 * MIB)
+    run("mkfs.vfat", fat.node)
+    run("mkfs.xfs", "-q", xfs.node)
+    assert call("fs_type", fat.node) == (0, "vfat")
+    assert call("fs_type", xfs.node) == (0, "xfs")
+
+
+# The images are the first sectors that mkntfs, pvcreate and cryptsetup luksFormat wrote.
+@pytest.mark.parametrize("name, found", [("ntfs", "ntfs"), ("lvm2", "LVM2_member"), ("luks2", "crypto_LUKS")])
+def test_recorded_signatures_have_their_names(loop, name, found):
+    disk = loop(8 * MIB)
+    disk.write(0, image(name))
+    assert call("fs_type", disk.node) == (0, found)
+
+
+def test_hfsplus_has_its_name(loop):
+    disk = loop()
+    disk.write(*hfsplus())
+    assert call("fs_type", disk.node) == (0, "hfsplus")
+
+
+def test_swap_has_its_name(loop):
+    disk = loop()
+    run("mkswap", disk.node)
+    assert call("fs_type", disk.node) == (0, "swap")
+
+
+@pytest.mark.parametrize("version", ["1.0", "1.2"])
+def test_a_long_name_is_cut_to_15_characters(loop, version):
+    disk = loop()
+    disk.write(*md_member(64 * MIB, version))
+    assert call("fs_type", disk.node) == (0, "linux_raid_memb")
+
+
+@pytest.mark.parametrize("label", ["dos", "gpt"])
+def test_a_partition_table_counts_as_recognised(loop, label):
+    disk = loop()
+    disk.sfdisk(f"label: {label}\n,,L\n")
+    assert call("fs_type", disk.node) == (0, label)
+
+
+def test_an_empty_device_is_told_from_one_that_cannot_be_read(loop, tmp_path):
+    assert call("fs_type", loop().node) == 1
+    assert call("fs_type", "/dev/no_such_node") == -1
+    assert call("fs_type", tmp_path) == -1
+    assert call("fs_type", "/dev/null") == -1
+
+
+def test_two_file_systems_at_once_are_not_empty(loop):
+    disk = loop()
+    make_ambivalent(disk)
+    assert call("fs_type", disk.node) == (0, "ambivalent")
+
+
+def test_a_wrong_checksum_does_not_make_a_signature_invisible(loop):
+    disk = loop(8 * MIB)
+    disk.write(0, image("lvm2"))
+    disk.write(512 + 32, b"another id")
+    assert call("fs_type", disk.node) == (0, "LVM2_member")
+
+
+def test_the_cache_of_blkid_is_never_asked(loop):
+    disk = loop()
+    make_ext(disk)
+    run("blkid", disk.node)
+    run("wipefs", "-qa", disk.node)
+    assert call("fs_type", disk.node) == 1
+
+
+def test_a_device_that_reads_only_at_its_start_is_not_empty(loop):
+    disk = loop()
+    disk.resize(2 * MIB)  # behind the device's back: it keeps its size, and reads beyond fail
+    assert call("check_dev", disk.node) == 0
+    assert call("fs_type", disk.node) == (0, "unreadable")
+
+
+def test_a_device_that_does_not_read_at_its_start_is_not_usable(loop):
+    disk = loop()
+    disk.resize(MIB - 4096)
+    assert call("fs_type", disk.node) == -1
+    assert call("check_dev", disk.node) == -1
+
+
+def test_a_device_is_usable_from_one_mebibyte_on(loop):
+    assert call("check_dev", loop(MIB).node) == 0
+    assert call("check_dev", loop(MIB - 512).node) == -1
+
+
+def test_what_is_no_block_device_is_not_usable(tmp_path):
+    file = tmp_path / "file"
+    file.write_bytes(bytes(2 * MIB))
+    for node in (file, tmp_path, "/dev/zero", "/dev/no_such_node"):
+        assert call("check_dev", node) == -1
+
+
+@pytest.mark.parametrize("fault", ["read", "pread64", "ioctl"])
+def test_no_single_failing_call_makes_a_file_system_look_empty(loop, fault):
+    disk = loop()
+    make_ext(disk)
+    total = len(calls_of("fs_type", disk.node, disk.node, fault))
+    for when in range(1, total + 2):
+        status, words = under_fault("fs_type", disk.node, disk.node, fault, "error=EIO", when)
+        assert status == 0
+        assert words[0] != "1", f"{fault} {when} of {total} failed: {words}"
+
+
+@pytest.mark.parametrize("fault", ["read", "pread64"])
+def test_reads_that_fail_from_one_on_never_make_a_file_system_look_empty(loop, fault):
+    disk = loop()
+    make_ext(disk)
+    total = len(calls_of("fs_type", disk.node, disk.node, fault))
+    for when in range(1, total + 2):
+        status, words = under_fault("fs_type", disk.node, disk.node, fault, "error=EIO", f"{when}+")
+        assert status == 0
+        assert words[0] != "1", f"{fault} from {when} of {total} on failed: {words}"
+
+
+# --- the state of a file system ---
+
+
+def test_a_clean_file_system_wants_no_check(loop):
+    for kind in ("ext2", "ext3", "ext4"):
+        disk = loop()
+        make_ext(disk, kind=kind)
+        assert call("check_fs_state", disk.node) == 0, kind
+
+
+def test_a_mounted_journal_and_one_to_replay_want_a_check(loop, tmp_path):
+    disk = loop()
+    make_ext(disk)
+    (tmp_path / "mnt").mkdir()
+    run("mount", disk.node, tmp_path / "mnt")
+    try:
+        assert call("check_fs_state", disk.node) != 0
+    finally:
+        run("umount", tmp_path / "mnt")
+    assert call("check_fs_state", disk.node) == 0
+
+
+@pytest.mark.parametrize("state", ["0", "3"])  # not cleanly unmounted; with errors
+def test_a_state_that_is_not_valid_wants_a_check(loop, state):
+    disk = loop()
+    make_ext(disk, kind="ext2")
+    run("debugfs", "-w", "-R", f"ssv state {state}", disk.node)
+    assert call("check_fs_state", disk.node) != 0
+
+
+def test_a_damaged_superblock_wants_a_check(loop):
+    disk = loop()
+    run("mke2fs", "-q", "-t", "ext4", "-O", "metadata_csum", disk.node)
+    disk.write(1024 + 120, b"DATA")
+    assert call("check_fs_state", disk.node) != 0
+
+
+def test_other_content_wants_no_check(loop):
+    empty, fat = loop(), loop()
+    run("mkfs.vfat", fat.node)
+    for node in (empty.node, fat.node, "/dev/no_such_node"):
+        assert call("check_fs_state", node) == 0
