@@ -5,7 +5,7 @@ import pathlib
 import subprocess
 
 import pytest
-from sysaux_lib import (
+from harness.sysaux import (
     CALL, MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, run, under_fault,
 )
 

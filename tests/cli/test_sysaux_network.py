@@ -3,7 +3,7 @@
 import subprocess
 
 import pytest
-from sysaux_lib import CALL, run
+from harness.sysaux import CALL, run
 
 
 @pytest.fixture

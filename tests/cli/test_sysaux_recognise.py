@@ -1,7 +1,7 @@
 """What the platform recognises on a device, and what it never takes for an empty one."""
 
 import pytest
-from sysaux_lib import (
+from harness.sysaux import (
     MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, run, under_fault,
 )
 

@@ -10,9 +10,11 @@ import tempfile
 
 import pytest
 
-REPOSITORY = pathlib.Path(__file__).resolve().parents[2]
+REPOSITORY = pathlib.Path(__file__).resolve().parents[3]
 CALL = (REPOSITORY / os.environ.get("REMVOL_BUILD", "build/release")).resolve() / "tests/harness/sysaux_call"
 MIB = 1 << 20
+# The leak sanitizer cannot work in a traced process.
+TRACED = {**os.environ, "ASAN_OPTIONS": "detect_leaks=0"}
 
 
 def run(*argv, check=True, **more):
@@ -22,9 +24,12 @@ def run(*argv, check=True, **more):
     return done.stdout
 
 
-def call(name, argument, before=()):
-    """The library's answer: a number, or a number and words. `before` is a command to run it under."""
-    done = subprocess.run([*map(str, before), CALL, name, str(argument)], capture_output=True, text=True, timeout=60)
+def call(name, argument, tracer=()):
+    """The library's answer: a number, or a number and words."""
+    done = subprocess.run(
+        [*tracer, CALL, name, str(argument)],
+        capture_output=True, text=True, timeout=60, env=TRACED if tracer else None,
+    )
     assert done.returncode == 0, f"{name} {argument}: exits {done.returncode}: {done.stderr}"
     number, *words = done.stdout.split()
     return (int(number), *words) if words else int(number)
@@ -122,7 +127,7 @@ def loop(tmp_path):
 
 
 def image(name):
-    return lzma.decompress((pathlib.Path(__file__).parent / "images" / f"{name}.img.xz").read_bytes())
+    return lzma.decompress((pathlib.Path(__file__).parents[1] / "images" / f"{name}.img.xz").read_bytes())
 
 
 def hfsplus():
@@ -168,7 +173,7 @@ def squashfs_head():
 def calls_of(name, argument, path, syscalls):
     """The system calls of these kinds that the call makes on that path, as text."""
     with tempfile.NamedTemporaryFile("r") as trace:
-        run("strace", "-f", "-qq", "-o", trace.name, "-P", path, "-e", f"trace={syscalls}", CALL, name, argument)
+        run("strace", "-f", "-qq", "-o", trace.name, "-P", path, "-e", f"trace={syscalls}", CALL, name, argument, env=TRACED)
         return [line for line in trace if "(" in line]
 
 
@@ -176,7 +181,7 @@ def under_fault(name, argument, path, syscalls, fault, when):
     """Runs the call with one of these system calls failing (or killing it); gives its exit status and words."""
     done = subprocess.run(
         ["strace", "-f", "-qq", "-o", "/dev/null", "-P", str(path), "-e", f"trace={syscalls}", "-e", f"inject={syscalls}:{fault}:when={when}", CALL, name, str(argument)],
-        capture_output=True, text=True, timeout=60,
+        capture_output=True, text=True, timeout=60, env=TRACED,
     )
     return done.returncode, done.stdout.split()
 
