@@ -1,0 +1,140 @@
+"""`--deinit` and `--system_off`: the initiator taken down."""
+
+import pytest
+from harness.initiator import RELOAD, T1, Initiator, store
+
+MODULES = ["iscsi_tcp.ko", "libiscsi_tcp.ko", "libiscsi.ko", "scsi_transport_iscsi.ko"]
+LOGOUT_ALL = "system iscsiadm -m node -u"
+STOP_ISCSID = "system killall -SIGTERM iscsid"
+STOP_TREE = "system kill -SIGTERM `cat /var/run/ktree_sock_vv_config.pid`"
+PID_FILE = "/var/run/ktree_sock_vv_config.pid"
+ROAD = {
+    "--deinit": [
+        LOGOUT_ALL,
+        STOP_ISCSID,
+        f"system {RELOAD}",
+        *(f"system rmmod {module}" for module in MODULES),
+        STOP_TREE,
+    ],
+    "--system_off": [LOGOUT_ALL, STOP_ISCSID, STOP_TREE],
+}
+
+
+@pytest.fixture
+def initiator(box):
+    box.default("killall")
+    box.default("rmmod")
+    return Initiator(box)
+
+
+def take_down(box, command, *args):
+    done = box.remvol(*args, command)
+    box.wait_until(lambda: not tree_runs(box), what="the end of the tree's daemon")
+    return done
+
+
+def tree_runs(box):
+    return any(argv[0].endswith("ktree") for argv in box.processes().values())
+
+
+@pytest.mark.parametrize("command", ROAD)
+def test_the_steps_in_their_order(box, initiator, command):
+    done = take_down(box, command)
+    assert done.status == 0
+    assert [call for call in box.trace() if "flashrun" not in call] == ROAD[command]
+
+
+@pytest.mark.parametrize("command", ROAD)
+def test_every_volume_is_unmounted_before_the_logout(box, initiator, command):
+    store(box, 1, T1, luns=[{"lun": 1, "mnt": "/mnt/VV/share1", "mnt_dev": "/dev/sdb1"}])
+    box.path("/mnt/VV/share1").mkdir(parents=True)
+    box.default("fuser")
+    box.default("umount")
+    assert take_down(box, command).status == 0
+    calls = box.trace()
+    unmounted = next(at for at, call in enumerate(calls) if "umount" in call)
+    assert unmounted < calls.index(LOGOUT_ALL)
+    assert not box.path("/mnt/VV/share1").exists()
+
+
+@pytest.mark.parametrize("command", ROAD)
+def test_all_sessions_are_closed(box, initiator, command):
+    initiator.target(T1, {1: "sdb"})
+    initiator.log_in(T1)
+    assert take_down(box, command).status == 0
+    assert initiator.sessions() == []
+
+
+@pytest.mark.parametrize("command", ROAD)
+def test_without_a_session_the_logout_fails_and_nothing_else(box, initiator, command):
+    box.fake("iscsiadm", "-m node -u", status=21)
+    done = take_down(box, command)
+    assert done.status == 0
+    assert "system() of cmd 'iscsiadm -m node -u' failed" in done.stdout
+
+
+# The last command of the teardown alone decides.
+@pytest.mark.parametrize(
+    "command, failing, status",
+    [
+        ("--system_off", {"killall": None}, 255),
+        ("--deinit", {"killall": None}, 0),
+        ("--deinit", {"rmmod": "scsi_transport_iscsi.ko"}, 255),
+        ("--deinit", {"rmmod": "iscsi_tcp.ko"}, 0),
+        ("--deinit", {"rmmod": "libiscsi.ko"}, 0),
+    ],
+)
+def test_the_status_is_that_of_the_last_command(box, initiator, command, failing, status):
+    for name, args in failing.items():
+        box.fake(name, args, status=1)
+    done = take_down(box, command)
+    assert done.status == status
+    name, args = next(iter(failing.items()))
+    words = f"rmmod {args}" if name == "rmmod" else "killall -SIGTERM iscsid"
+    assert f"system() of cmd '{words}' failed" in done.stdout
+    assert [call for call in box.trace() if call != "system winshare_reload"] == ROAD[command]
+
+
+def test_the_log_tells_the_steps(box, initiator):
+    box.tree.set("/iscsi/initiator/dbg", "2")
+    done = take_down(box, "--deinit")
+    steps = ["deinit start", "killall -SIGTERM iscsid ", "deinit end", "update share folder status",
+             "finish share folder status"]
+    assert [line.split("): ", 1)[1] for line in done.lines if ":task_deinit:" in line] == steps
+
+
+def test_the_log_of_a_system_off(box, initiator):
+    box.tree.set("/iscsi/initiator/dbg", "2")
+    done = take_down(box, "--system_off")
+    steps = ["system off", "killall -SIGTERM iscsid ", "deinit end"]
+    assert [line.split("): ", 1)[1] for line in done.lines if ":task_deinit:" in line] == steps
+
+
+@pytest.mark.parametrize("shell", ["dash", "bash"])
+def test_the_trees_daemon_is_stopped_whatever_the_shell(box, initiator, shell):
+    box.run(["ln", "-sf", shell, "/usr/bin/sh"])
+    take_down(box, "--system_off")
+    assert not box.path(PID_FILE).exists()
+
+
+def test_another_process_in_the_pid_file_is_left_alone(box, initiator):
+    other = box.start(["sleep", "60"])
+    box.path(PID_FILE).write_text(f"{other.pid}\n")
+    assert box.remvol("--system_off").status == 0
+    assert tree_runs(box)
+    assert other.pid in box.processes()
+    other.kill()
+    other.wait()
+
+
+@pytest.mark.parametrize("text", ["", "none\n", "0\n", "-1\n", "1\n", "99999999\n"])
+def test_a_pid_file_without_a_process_harms_nobody(box, initiator, text):
+    box.path(PID_FILE).write_text(text)
+    assert box.remvol("--system_off").status == 0
+    assert tree_runs(box)
+
+
+def test_the_settings_are_saved_no_more(box, initiator):
+    box.write("/etc/NAS_CFG/vv.xml", "saved before\n")
+    take_down(box, "--deinit")
+    assert box.path("/etc/NAS_CFG/vv.xml").read_text() == "saved before\n"
