@@ -1,6 +1,7 @@
 // What the listings of iscsiadm say: on samples of both systems, and on what no system should print.
 #include <gtest/gtest.h>
 
+#include <cstring>
 #include <fstream>
 #include <sstream>
 #include <string>
@@ -51,6 +52,10 @@ Texts usable_luns(const std::string& text, const char* name, DetailedListing lis
   return found;
 }
 
+std::string lun(int host, int number, const char* device) {
+  return std::to_string(host) + ":" + std::to_string(number) + " " + device;
+}
+
 // The block of one logged-in target with what `luns` says about its disks.
 std::string block(const std::string& target_line, const std::string& luns,
                   const std::string& state = "LOGGED_IN") {
@@ -99,6 +104,44 @@ TEST(DetailedListing, LunsWithoutDiskHideNeitherTheNextLunNorTheNextTarget) {
   const std::string text = sample("written-controllers-P3.txt");
   EXPECT_EQ(usable_luns(text, kT1), (Texts{"3:1 sdb", "3:10 sdl", "4:1 sdm"}));
   EXPECT_EQ(usable_luns(text, kT10), (Texts{"5:1 sdc", "5:2 sdd"}));
+}
+
+TEST(DetailedListing, TwelveLunsInTheOrderOfTheirText) {
+  EXPECT_EQ(usable_luns(sample("two-targets-session-P3.out"), kT1),
+            (Texts{lun(1, 1, "sda"), lun(1, 10, "sdj"), lun(1, 11, "sdk"), lun(1, 12, "sdl"),
+                   lun(1, 2, "sdb"), lun(1, 3, "sdc"), lun(1, 4, "sdd"), lun(1, 5, "sde"), lun(1, 6, "sdf"),
+                   lun(1, 7, "sdg"), lun(1, 8, "sdh"), lun(1, 9, "sdi")}));
+}
+
+// Its only line is directly followed by the line of the next target.
+TEST(DetailedListing, TargetWithAControllerAloneHasNoLun) {
+  for (const char* name : {"controller-only", "two-targets", "four-targets", "two-interfaces"}) {
+    const std::string text = sample(std::string(name) + "-session-P3.out");
+    EXPECT_EQ(usable_luns(text, "iqn.2026-01.org.example:controller-only"), Texts{}) << name;
+  }
+}
+
+TEST(DetailedListing, NamesThatBeginAlike) {
+  const std::string text = sample("four-targets-session-P3.out");
+  EXPECT_EQ(usable_luns(text, kT1).size(), 12u);
+  EXPECT_EQ(usable_luns(text, kT10), (Texts{lun(2, 1, "sdm"), lun(2, 2, "sdn")}));
+  EXPECT_EQ(usable_luns(text, "iqn.2026-01.org.example:t1-x"), (Texts{lun(3, 1, "sdo")}));
+}
+
+TEST(DetailedListing, AllSessionsOfATargetCount) {
+  EXPECT_EQ(
+      usable_luns(sample("two-interfaces-session-P3.out"), kT10),
+      (Texts{lun(2, 1, "sdm"), lun(2, 2, "sdn"), lun(3, 1, "sdo"), lun(3, 2, "sdp"), lun(4, 1, "sdq"),
+             lun(4, 2, "sdr"), lun(5, 1, "sds"), lun(5, 2, "sdt"), lun(6, 1, "sdu"), lun(6, 2, "sdv")}));
+}
+
+TEST(DetailedListing, LostSessionsShowNoLun) {
+  for (const char* name : {"cable-cut", "cable-cut-given-up", "target-killed"}) {
+    const std::string text = sample(std::string(name) + "-session-P3.out");
+    EXPECT_EQ(usable_luns(text, kT1), Texts{}) << name;
+    EXPECT_EQ(usable_luns(text, kT1, kDeviceListing), Texts{}) << name;
+  }
+  EXPECT_EQ(usable_luns(sample("cable-back-session-P3.out"), kT1).size(), 12u);
 }
 
 TEST(DetailedListing, DisksOfTheNextTargetAreNeverTaken) {
@@ -160,7 +203,8 @@ TEST(DetailedListing, HostAndLunAreReported) {
 }
 
 TEST(DetailedListing, CutAnywhereGivesTheFirstLunsAndNeverAnother) {
-  for (const char* name : {"written-older-P3.txt", "written-controllers-P3.txt"}) {
+  for (const char* name :
+       {"written-older-P3.txt", "written-controllers-P3.txt", "four-targets-session-P3.out"}) {
     const std::string text = sample(name);
     const Texts all = usable_luns(text, kT1);
     for (size_t length = 0; length <= text.size(); length++) {
@@ -216,6 +260,15 @@ TEST(PlainListing, OlderSystem) {
   EXPECT_TRUE(shows(text, "iqn.2026-01.org.example:t3"));
 }
 
+TEST(PlainListing, CurrentSystem) {
+  const std::string text = sample("four-targets-session.out");
+  EXPECT_TRUE(shows(text, kT1));
+  EXPECT_TRUE(shows(text, kT10));
+  EXPECT_TRUE(shows(text, "iqn.2026-01.org.example:controller"));
+  EXPECT_FALSE(shows(text, "iqn.2026-01.org.example:t"));
+  EXPECT_FALSE(shows(text, "iqn.2026-01.org.example:t2"));
+}
+
 std::string discovered(const std::string& line) {
   char name[kListingLineSize] = "before";
   return read_discovered_name(line.c_str(), name) ? name : "no blank";
@@ -246,6 +299,22 @@ TEST(Discovery, LongNamesAreCut) {
   EXPECT_EQ(discovered("p " + name), name.substr(0, kListingLineSize - 1));
   const std::string doubled = std::string(400, 'n') + "%s";
   EXPECT_EQ(discovered("p " + doubled), (std::string(400, 'n') + doubled).substr(0, kListingLineSize - 1));
+}
+
+TEST(Discovery, CurrentSystem) {
+  const std::pair<const char*, const char*> kSamples[] = {
+      {"discovery-iface0.out", "10.9.0.2"},
+      {"discovery-ipv6-iface0.out", "[fd00:9::2]"},
+      {"discovery-link-local.out", "[fe80::2]"},
+  };
+  for (const auto& [file, address] : kSamples) {
+    Texts names;
+    for (const std::string& line : pieces(sample(file))) {
+      EXPECT_TRUE(is_discovery_line_of(line.c_str(), address)) << line;
+      names.push_back(discovered(line).substr(strlen("iqn.2026-01.org.example:")));
+    }
+    EXPECT_EQ(names, (Texts{"t1", "t10", "t1-x", "controller-only", "secret"})) << file;
+  }
 }
 
 TEST(Discovery, LinesBeginWithTheAddress) {
