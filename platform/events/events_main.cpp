@@ -1,0 +1,210 @@
+// remvol-events: tells the tool when the connection of an iSCSI session is lost and when it is back.
+#include <poll.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/signalfd.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <initializer_list>
+#include <string_view>
+
+#include "kernel_event.h"
+#include "netlink.h"
+#include "sessions.h"
+#include "targets.h"
+
+namespace events {
+namespace {
+
+constexpr char kTool[] = "remvol";
+constexpr int kMuchHurry = 50, kSomeHurry = 1000;  // milliseconds between looks
+
+struct Daemon {
+  int signals = -1;
+  int devices = -1;
+  int iscsi = -1;
+  bool deaf = false;  // there are sessions, but their events cannot be had
+  bool gap = false;   // events were lost
+  bool ended = false;
+  int status = 0;
+  Targets targets;
+};
+
+void complain(const char* what) {
+  fprintf(stderr, "remvol-events: %s: %s\n", what, strerror(errno));
+}
+
+int open_signals() {
+  sigset_t set;
+  sigemptyset(&set);
+  for (int number : {SIGCHLD, SIGTERM, SIGINT}) sigaddset(&set, number);
+  sigprocmask(SIG_BLOCK, &set, nullptr);
+  return signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK);
+}
+
+// Starts the tool with the signals as usual, in a process group of its own: it goes on when the listener is
+// stopped. Returns its process number, or -1.
+pid_t start_tool(const Order& order) {
+  const bool reopen = order.action == Action::kReopen;
+  const char* option = reopen ? "--oiscsi_evt_reopen" : "--oiscsi_evt_recover";
+  const char* argv[] = {kTool, option, "-n", order.target.c_str(), nullptr};
+  posix_spawnattr_t attributes;
+  sigset_t none;
+  sigemptyset(&none);
+  posix_spawnattr_init(&attributes);
+  posix_spawnattr_setsigmask(&attributes, &none);
+  posix_spawnattr_setpgroup(&attributes, 0);
+  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETPGROUP);
+  pid_t process = -1;
+  const int error =
+      posix_spawnp(&process, kTool, nullptr, &attributes, const_cast<char* const*>(argv), environ);
+  posix_spawnattr_destroy(&attributes);
+  fprintf(stderr, "remvol-events: %s: %s\n", order.target.c_str(),
+          error != 0 ? strerror(error)
+          : reopen   ? "the connection is lost"
+                     : "the session is back");
+  return error != 0 ? -1 : process;
+}
+
+void give_orders(Daemon& daemon) {
+  Order order;
+  while (daemon.targets.next(order)) daemon.targets.started(order.target, start_tool(order));
+}
+
+// The socket is open only while there is a session, so that the kernel module can be unloaded after the last
+// one.
+void follow_sessions(Daemon& daemon, bool any) {
+  if (!any && daemon.iscsi >= 0) close(daemon.iscsi);
+  if (!any) daemon.iscsi = -1;
+  if (any && daemon.iscsi < 0) daemon.iscsi = open_iscsi_events();
+  const bool deaf = any && daemon.iscsi < 0;
+  if (deaf && !daemon.deaf) complain("no connection events, looking every second instead");
+  daemon.deaf = deaf;
+}
+
+void look(Daemon& daemon) {
+  follow_sessions(daemon, !read_sessions().empty());
+  // Read again: a connection may have been lost before the socket was open.
+  daemon.targets.look(read_sessions());
+}
+
+void look_after_a_gap(Daemon& daemon) {
+  daemon.gap = false;
+  follow_sessions(daemon, !read_sessions().empty());
+  daemon.targets.look_after_a_gap(read_sessions());
+}
+
+void take_signals(Daemon& daemon) {
+  signalfd_siginfo info;
+  while (read(daemon.signals, &info, sizeof info) == sizeof info) {
+    if (info.ssi_signo != SIGCHLD) daemon.ended = true;
+  }
+  for (pid_t child; (child = waitpid(-1, nullptr, WNOHANG)) > 0;) daemon.targets.ended(child);
+}
+
+// Takes all that waits on a socket; `take(message, size)` gets each message.
+template <typename Take>
+void take_messages(Daemon& daemon, int socket, Take take) {
+  static unsigned char buffer[1 << 16];
+  size_t size = 0;
+  for (;;) {
+    switch (receive(socket, buffer, sizeof buffer, size)) {
+      case Received::kMessage:
+        take(buffer, size);
+        break;
+      case Received::kOverrun:
+        fputs("remvol-events: events were lost, looking at all sessions\n", stderr);
+        daemon.gap = true;
+        break;
+      case Received::kFailed:
+        complain("events");
+        daemon.ended = true;
+        daemon.status = 1;
+        return;
+      case Received::kNothing:
+        return;
+    }
+  }
+}
+
+void take_device_events(Daemon& daemon) {
+  bool changed = false;
+  take_messages(daemon, daemon.devices, [&changed](const unsigned char* message, size_t size) {
+    changed = changed || is_session_event(message, size);
+  });
+  if (changed) look(daemon);
+}
+
+void take_iscsi_events(Daemon& daemon) {
+  take_messages(daemon, daemon.iscsi, [&daemon](const unsigned char* message, size_t size) {
+    KernelEvent event{};
+    while (take_kernel_event(message, size, event)) {
+      if (event.kind != Kind::kOther) daemon.targets.take(event, read_sessions());
+    }
+  });
+}
+
+int patience(const Daemon& daemon) {
+  switch (daemon.targets.hurry()) {
+    case Hurry::kMuch:
+      return kMuchHurry;
+    case Hurry::kSome:
+      return kSomeHurry;
+    default:
+      return daemon.deaf ? kSomeHurry : -1;
+  }
+}
+
+void run(Daemon& daemon) {
+  look_after_a_gap(daemon);
+  while (!daemon.ended) {
+    give_orders(daemon);
+    pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}, {daemon.iscsi, POLLIN, 0}};
+    if (poll(inputs, 3, patience(daemon)) == 0) look(daemon);
+    if (inputs[0].revents != 0) take_signals(daemon);
+    if (inputs[2].revents != 0) take_iscsi_events(daemon);
+    if (inputs[1].revents != 0) take_device_events(daemon);
+    if (daemon.gap) look_after_a_gap(daemon);
+  }
+}
+
+int serve() {
+  Daemon daemon;
+  daemon.signals = open_signals();
+  daemon.devices = open_device_events();
+  if (daemon.signals < 0 || daemon.devices < 0) {
+    complain("device events");
+    return 1;
+  }
+  run(daemon);
+  return daemon.status;
+}
+
+constexpr char kHelp[] =
+    "usage: remvol-events\n"
+    "Runs \"remvol --oiscsi_evt_reopen -n TARGET\" when the connection of an iSCSI session is lost and\n"
+    "\"remvol --oiscsi_evt_recover -n TARGET\" when the session is back. Stays in the foreground.\n"
+    "  -h, --help     this text\n"
+    "  -V, --version  the version\n";
+
+}  // namespace
+}  // namespace events
+
+int main(int argc, char** argv) {
+  const std::string_view option = argc > 1 ? argv[1] : "";
+  if (option.empty()) return events::serve();
+  if (option == "-h" || option == "--help") {
+    fputs(events::kHelp, stdout);
+    return 0;
+  }
+  if (option == "-V" || option == "--version") {
+    puts("remvol-events " REMVOL_VERSION);
+    return 0;
+  }
+  fputs(events::kHelp, stderr);
+  return 2;
+}

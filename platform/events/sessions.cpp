@@ -1,0 +1,71 @@
+#include "sessions.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <string_view>
+
+namespace events {
+namespace {
+
+constexpr char kFolder[] = "/sys/class/iscsi_session";
+constexpr std::string_view kSession = "session";
+constexpr std::string_view kScsiTarget = "target";
+
+std::string read_line(const std::string& path) {
+  char text[512];
+  const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  if (fd < 0) return {};
+  const ssize_t size = read(fd, text, sizeof text);
+  close(fd);
+  const std::string_view line(text, size > 0 ? static_cast<size_t>(size) : 0);
+  return std::string(line.substr(0, line.find('\n')));
+}
+
+// Calls `take(name)` for the entries of a folder until it returns false.
+template <typename Take>
+void for_entries(const std::string& path, Take take) {
+  DIR* folder = opendir(path.c_str());
+  if (folder == nullptr) return;
+  while (const dirent* entry = readdir(folder)) {
+    if (!take(std::string_view(entry->d_name))) break;
+  }
+  closedir(folder);
+}
+
+// A session gets a SCSI target when the first login is through and a LUN was found; without one no volume
+// depends on it.
+bool had_luns(const std::string& session) {
+  bool found = false;
+  for_entries(session + "/device", [&found](std::string_view name) {
+    found = name.starts_with(kScsiTarget);
+    return !found;
+  });
+  return found;
+}
+
+// The state "FREE" is both the first one and that of a session whose recovery took too long.
+Link link_of(const std::string& session) {
+  if (read_line(session + "/state") == "LOGGED_IN") return Link::kUp;
+  return had_luns(session) ? Link::kDown : Link::kNew;
+}
+
+}  // namespace
+
+std::vector<Session> read_sessions() {
+  std::vector<Session> sessions;
+  for_entries(kFolder, [&sessions](std::string_view name) {
+    if (!name.starts_with(kSession)) return true;
+    const std::string path = std::string(kFolder) + "/" + std::string(name);
+    const std::string target = read_line(path + "/targetname");
+    const auto number = static_cast<uint32_t>(strtoul(name.data() + kSession.size(), nullptr, 10));
+    if (!target.empty()) sessions.push_back({number, target, link_of(path)});
+    return true;
+  });
+  return sessions;
+}
+
+}  // namespace events

@@ -1,0 +1,124 @@
+#include "targets.h"
+
+#include <algorithm>
+
+namespace events {
+namespace {
+
+// After a connection error of a session that stays logged in all the same: 30 seconds of looks in much hurry,
+// more than a logout may take.
+constexpr int kSuspectLooks = 600;
+
+struct Links {
+  bool any = false, any_down = false, all_up = true;
+};
+
+Links links_of(const std::string& target, const std::vector<Session>& sessions) {
+  Links links;
+  for (const Session& session : sessions) {
+    if (session.target != target) continue;
+    links.any = true;
+    links.any_down = links.any_down || session.link == Link::kDown;
+    links.all_up = links.all_up && session.link == Link::kUp;
+  }
+  return links;
+}
+
+}  // namespace
+
+Targets::Target& Targets::find(const std::string& name) {
+  for (Target& target : targets_) {
+    if (target.name == name) return target;
+  }
+  targets_.push_back({});
+  targets_.back().name = name;
+  return targets_.back();
+}
+
+// A recovery that has not begun is pointless once the connection is lost again.
+void Targets::order_reopen(Target& target) {
+  target.wants_reopen = true;
+  target.wants_recover = false;
+}
+
+void Targets::take(const KernelEvent& event, const std::vector<Session>& sessions) {
+  const auto session = std::find_if(sessions.begin(), sessions.end(),
+                                    [&event](const Session& other) { return other.number == event.session; });
+  if (event.kind != Kind::kOther && session != sessions.end() && session->link != Link::kNew) {
+    Target& target = find(session->target);
+    target.answered = event.kind == Kind::kLoggedIn && (target.suspect > 0 || target.lost);
+    // A logout ends in a connection error as well: the session is then gone a moment later.
+    if (event.kind == Kind::kConnectionLost && !target.lost) target.suspect = kSuspectLooks;
+  }
+  look(sessions);
+}
+
+void Targets::settle(Target& target, const std::vector<Session>& sessions) {
+  const Links links = links_of(target.name, sessions);
+  target.present = links.any;
+  if (target.suspect > 0) --target.suspect;
+  if (!links.any) {
+    target.suspect = 0;
+    target.answered = false;
+  } else if (links.any_down) {
+    if (!target.lost) order_reopen(target);
+    target.lost = true;
+    target.suspect = 0;
+  } else if (links.all_up && (target.lost || (target.suspect > 0 && target.answered))) {
+    // The connection may be back before its loss was seen.
+    if (!target.lost) order_reopen(target);
+    target.wants_recover = true;
+    target.lost = target.answered = false;
+    target.suspect = 0;
+  }
+}
+
+void Targets::look(const std::vector<Session>& sessions) {
+  for (const Session& session : sessions) find(session.target);
+  for (Target& target : targets_) settle(target, sessions);
+  std::erase_if(targets_, [](const Target& target) {
+    return !target.present && !target.lost && !target.busy && !target.wants_reopen && !target.wants_recover;
+  });
+}
+
+void Targets::look_after_a_gap(const std::vector<Session>& sessions) {
+  look(sessions);
+  for (Target& target : targets_) {
+    if (target.present && links_of(target.name, sessions).all_up) target.wants_recover = true;
+  }
+}
+
+bool Targets::next(Order& order) {
+  for (Target& target : targets_) {
+    if (target.busy || (!target.wants_reopen && !target.wants_recover)) continue;
+    order = {target.name, target.wants_reopen ? Action::kReopen : Action::kRecover};
+    (target.wants_reopen ? target.wants_reopen : target.wants_recover) = false;
+    target.busy = true;
+    return true;
+  }
+  return false;
+}
+
+void Targets::started(const std::string& target, pid_t process) {
+  Target& chosen = find(target);
+  chosen.process = process;
+  chosen.busy = process > 0;
+}
+
+void Targets::ended(pid_t process) {
+  for (Target& target : targets_) {
+    if (target.busy && target.process == process) target.busy = false;
+  }
+}
+
+Hurry Targets::hurry() const {
+  Hurry hurry = Hurry::kNone;
+  for (const Target& target : targets_) {
+    if (!target.present) continue;
+    if (target.suspect > 0 || target.answered) return Hurry::kMuch;
+    if (target.lost) hurry = Hurry::kSome;
+  }
+  return hurry;
+}
+
+}  // namespace events

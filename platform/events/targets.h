@@ -1,0 +1,70 @@
+// Which targets lost their connection and which have it back: decides what is to be run, without running it.
+#ifndef PLATFORM_EVENTS_TARGETS_H
+#define PLATFORM_EVENTS_TARGETS_H
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "kernel_event.h"
+#include "sessions.h"
+
+namespace events {
+
+enum class Action { kReopen, kRecover };
+
+struct Order {
+  std::string target;
+  Action action;
+};
+
+// How soon the sessions must be looked at again although no event came.
+enum class Hurry { kNone, kSome, kMuch };
+
+class Targets {
+ public:
+  // Takes an event; `sessions` is what the machine has now.
+  void take(const KernelEvent& event, const std::vector<Session>& sessions);
+
+  // Compares with what the machine has now.
+  void look(const std::vector<Session>& sessions);
+
+  // As look(), and has every connected target recovered: events may have been missed. Recovering a target
+  // that is not waiting for it changes nothing.
+  void look_after_a_gap(const std::vector<Session>& sessions);
+
+  // Takes the next order that may be run now: one at a time a target, in the order of the events. Returns
+  // false when there is none. The caller says with started() which process does it.
+  bool next(Order& order);
+  void started(const std::string& target, pid_t process);
+
+  // The process has ended (or could not be started: -1 as given to started()).
+  void ended(pid_t process);
+
+  Hurry hurry() const;
+
+ private:
+  struct Target {
+    std::string name;
+    bool present = false;       // it has a session
+    int suspect = 0;            // a connection error came, the session still counts as logged in: looks left
+    bool answered = false;      // the target accepted a login since then
+    bool lost = false;          // reopening, as the tool was told
+    bool wants_reopen = false;  // orders not yet given, in this order
+    bool wants_recover = false;
+    bool busy = false;  // an order is being run
+    pid_t process = -1;
+  };
+
+  Target& find(const std::string& name);
+  static void order_reopen(Target& target);
+  static void settle(Target& target, const std::vector<Session>& sessions);
+
+  std::vector<Target> targets_;
+};
+
+}  // namespace events
+
+#endif

@@ -1,0 +1,373 @@
+"""remvol-events: the tool is told when a session loses its connection and when it has it back."""
+
+import fcntl
+import signal
+import socket
+import struct
+import termios
+
+import pytest
+
+DEVICE_EVENTS, ISCSI_EVENTS = 15, 8
+LOST, PDU = 102, 101
+SESSIONS = "/sys/class/iscsi_session"
+
+
+def message(kind, session, rest=b""):
+    """A message as the kernel lays it out: the netlink header, struct iscsi_uevent, a PDU."""
+    event = struct.pack("=IIQ24xIIQ", kind, 0, 0xFFFF0000, session, 0, 1011) + rest
+    return struct.pack("=IHHII", 16 + len(event), 3, 0, 0, 0) + event
+
+
+def login_response(session, flags=0x87, status=0):
+    pdu = bytearray(48)
+    pdu[0], pdu[1], pdu[36] = 0x23, flags, status
+    return message(PDU, session, bytes(pdu))
+
+
+class Events:
+    """A box with sessions in its sysfs and a running listener whose netlink sockets the test writes to."""
+
+    def __init__(self, box):
+        self.box = box
+        done = box.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None})
+        assert done.status == 0, done.stderr
+        self.daemon = None
+        box.default("remvol")
+
+    def session(self, number, target, state="LOGGED_IN", luns=True):
+        folder = self.box.path(f"{SESSIONS}/session{number}")
+        (folder / "device" / (f"target{number}:0:0" if luns else "power")).mkdir(parents=True, exist_ok=True)
+        self.box.write(f"{SESSIONS}/session{number}/targetname", target + "\n")
+        self.state(number, state)
+
+    def state(self, number, state):
+        self.box.write(f"{SESSIONS}/session{number}/state", state + "\n")
+
+    def remove(self, number):
+        folder = self.box.path(f"{SESSIONS}/session{number}")
+        folder.rename(self.box.path(f"/sys/class/gone{number}"))
+
+    def start(self):
+        preload = self.box.tools / "libnetlink.so"
+        self.daemon = self.box.start([self.box.build / "bin" / "remvol-events"], env={"LD_PRELOAD": str(preload)})
+        self.box.wait_until(self.place(DEVICE_EVENTS).exists, what="the listener")
+        self.sync()
+
+    def place(self, protocol):
+        return self.box.path(f"/run/netlink-{protocol}")
+
+    def send(self, data, protocol=ISCSI_EVENTS):
+        self.box.wait_until(self.place(protocol).exists, what=f"the socket {protocol}")
+        with socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as sender:
+            sender.sendto(data, str(self.place(protocol)))
+            self.box.wait_until(lambda: self.unread(sender) == 0, what="the message being read")
+
+    @staticmethod
+    def unread(sender):
+        """The bytes sent that the receiver has not read yet."""
+        return struct.unpack("i", fcntl.ioctl(sender, termios.TIOCOUTQ, bytes(4)))[0]
+
+    def uevent(self, action="add", subsystem="iscsi_session"):
+        self.send(f"{action}@/devices/x\0ACTION={action}\0SUBSYSTEM={subsystem}\0SEQNUM=1\0".encode(), DEVICE_EVENTS)
+
+    def sync(self):
+        """Returns when the listener sleeps: what was sent so far has been taken in."""
+
+        def idle():
+            stat = self.box.path(f"/proc/{self.daemon.pid}/stat").read_text()
+            return stat.rsplit(")", 1)[1].split()[0] == "S"
+
+        self.box.wait_until(idle, what="the listener being idle")
+
+    def wait_runs(self, *expected):
+        """Waits until the tool has been run that often, and compares."""
+        self.box.wait_until(lambda: len(self.runs) >= len(expected), what=f"{expected}, ran {self.runs}")
+        assert self.runs == list(expected)
+
+    @property
+    def runs(self):
+        return [tuple(call) for call in self.box.runs("remvol")]
+
+    def stop(self):
+        self.daemon.kill(signal.SIGTERM)
+        return self.daemon.wait()
+
+
+def reopen(target):
+    return ("--oiscsi_evt_reopen", "-n", target)
+
+
+def recover(target):
+    return ("--oiscsi_evt_recover", "-n", target)
+
+
+@pytest.fixture
+def events(bare_box):
+    events = Events(bare_box)
+    yield events
+    if events.daemon is not None and events.daemon.result is None:
+        assert events.stop().status == 0
+
+
+@pytest.fixture
+def connected(events):
+    """A listener with one connected target, whose first look is over."""
+    events.session(1, "iqn.a")
+    events.start()
+    events.wait_runs(recover("iqn.a"))
+    events.box.forget()
+    return events
+
+
+def test_a_loss_and_a_return_are_told(connected):
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    connected.send(login_response(1))
+    connected.state(1, "LOGGED_IN")
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_the_return_is_told_when_the_session_is_usable_again(connected):
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    connected.send(login_response(1))
+    connected.sync()
+    assert connected.runs == [reopen("iqn.a")]
+    connected.state(1, "LOGGED_IN")
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_a_state_that_follows_the_event_late_is_waited_for(connected):
+    connected.send(message(LOST, 1))
+    connected.sync()
+    assert connected.runs == []
+    connected.state(1, "FAILED")
+    connected.wait_runs(reopen("iqn.a"))
+
+
+def test_a_loss_that_is_over_before_it_was_seen_is_told(connected):
+    connected.send(message(LOST, 1))
+    connected.send(login_response(1))
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_a_session_given_up_by_the_kernel_is_still_lost(connected):
+    connected.state(1, "FREE")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    connected.state(1, "LOGGED_IN")
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_the_error_that_ends_a_logout_is_no_loss(connected):
+    connected.session(2, "iqn.b")
+    connected.uevent()
+    connected.send(message(LOST, 1))
+    connected.remove(1)
+    connected.uevent("remove")
+    connected.state(2, "FAILED")
+    connected.send(message(LOST, 2))
+    connected.wait_runs(reopen("iqn.b"))
+
+
+def test_a_first_login_is_neither_loss_nor_return(events):
+    events.start()
+    events.session(1, "iqn.a", state="FREE", luns=False)
+    events.uevent()
+    events.send(message(LOST, 1))
+    events.send(login_response(1))
+    events.session(1, "iqn.a")
+    events.uevent()
+    events.state(1, "FAILED")
+    events.send(message(LOST, 1))
+    events.wait_runs(reopen("iqn.a"))
+
+
+@pytest.mark.parametrize("answer", [
+    login_response(1, status=2),
+    login_response(1, flags=0x81),
+    login_response(1, flags=0x04),
+    message(PDU, 1, b"\x26" + bytes(47)),
+    message(PDU, 1, b"\x23" + bytes(20)),
+], ids=["refused", "a step on the way", "no step", "a logout response", "cut short"])
+def test_only_an_accepted_login_proves_a_return(connected, answer):
+    connected.send(message(LOST, 1))
+    connected.send(answer)
+    connected.sync()
+    assert connected.runs == []
+
+
+@pytest.mark.parametrize("noise", [
+    b"", b"\0", bytes(16), message(LOST, 1)[:30], message(LOST, 9), message(104, 1), message(LOST, 1)[:60],
+    b"\xff" * 4096, struct.pack("=IHHII", 4, 3, 0, 0, 0), b"foreign " + message(LOST, 1),
+], ids=["empty", "a byte", "an empty header", "cut in the event", "another session", "another type", "cut at the end",
+        "garbage", "a length too small", "another sender"])
+def test_noise_does_nothing(connected, noise):
+    connected.state(1, "LOGGED_IN")
+    connected.send(noise)
+    connected.send(login_response(1))
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+
+
+def test_one_event_at_a_time_a_target(connected):
+    connected.box.fake("remvol", "--oiscsi_evt_reopen", effect="until [ -e /go ]; do sleep 0.01; done", times=1)
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    for _ in range(3):
+        connected.send(login_response(1))
+        connected.state(1, "LOGGED_IN")
+        connected.send(message(0, 1))
+        connected.sync()
+    assert connected.runs == [reopen("iqn.a")]
+    connected.box.write("/go", "")
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_targets_do_not_wait_for_each_other(events):
+    events.session(1, "iqn.a", state="FAILED")
+    events.box.fake("remvol", "--oiscsi_evt_reopen -n iqn.a", effect="until [ -e /go ]; do sleep 0.01; done", times=1)
+    events.session(2, "iqn.b", state="FAILED")
+    events.start()
+    events.box.wait_until(lambda: len(events.runs) == 2, what="both targets")
+    assert sorted(events.runs) == [reopen("iqn.a"), reopen("iqn.b")]
+    events.state(2, "LOGGED_IN")
+    events.box.wait_until(lambda: recover("iqn.b") in events.runs, what="the return of one")
+    events.box.write("/go", "")
+
+
+def test_a_recovery_that_the_next_loss_overtakes_is_left_out(connected):
+    connected.box.fake("remvol", "--oiscsi_evt_reopen", effect="until [ -e /go ]; do sleep 0.01; done", times=1)
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    for state in ("LOGGED_IN", "FAILED", "LOGGED_IN", "FAILED"):
+        connected.state(1, state)
+        connected.send(login_response(1) if state == "LOGGED_IN" else message(LOST, 1))
+        connected.sync()
+    connected.box.write("/go", "")
+    connected.wait_runs(reopen("iqn.a"), reopen("iqn.a"))
+    connected.state(1, "LOGGED_IN")
+    connected.wait_runs(reopen("iqn.a"), reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_a_burst_of_eight_targets_loses_nothing(events):
+    names = [f"iqn.{number}" for number in range(1, 9)]
+    for number, name in enumerate(names, 1):
+        events.session(number, name)
+    events.start()
+    events.box.wait_until(lambda: len(events.runs) == 8, what="the first look")
+    events.box.forget()
+    for number in range(1, 9):
+        events.state(number, "FAILED")
+    for _ in range(50):
+        for number in range(1, 9):
+            events.send(message(LOST, number))
+    events.box.wait_until(lambda: len(events.runs) >= 8, what="all losses")
+    for number in range(1, 9):
+        events.state(number, "LOGGED_IN")
+        events.send(login_response(number))
+    events.box.wait_until(lambda: len(events.runs) >= 16, what="all returns")
+    assert sorted(events.runs) == sorted([reopen(n) for n in names] + [recover(n) for n in names])
+    for name in names:
+        own = [run for run in events.runs if run[2] == name]
+        assert own == [reopen(name), recover(name)]
+
+
+def test_lost_events_are_made_up_for_by_a_look_at_all_sessions(connected):
+    connected.session(2, "iqn.b")
+    connected.uevent()
+    connected.state(1, "FAILED")
+    connected.send(b"overrun")
+    connected.box.wait_until(lambda: len(connected.runs) >= 2, what="the look")
+    assert sorted(connected.runs) == [recover("iqn.b"), reopen("iqn.a")]
+
+
+def test_a_restart_finds_what_happened_meanwhile(events):
+    events.session(1, "iqn.up")
+    events.session(2, "iqn.down", state="FAILED")
+    events.session(3, "iqn.new", state="FREE", luns=False)
+    events.start()
+    events.box.wait_until(lambda: len(events.runs) >= 2, what="the first look")
+    assert sorted(events.runs) == [recover("iqn.up"), reopen("iqn.down")]
+    events.state(2, "LOGGED_IN")
+    events.box.wait_until(lambda: recover("iqn.down") in events.runs, what="the return")
+
+
+def test_the_module_can_be_unloaded_after_the_last_session(events):
+    events.start()
+    assert not events.place(ISCSI_EVENTS).exists()
+    events.session(1, "iqn.a")
+    events.uevent()
+    events.box.wait_until(events.place(ISCSI_EVENTS).exists, what="the socket")
+    descriptors = events.box.path(f"/proc/{events.daemon.pid}/fd")
+    before = len(list(descriptors.iterdir()))
+    events.remove(1)
+    events.uevent("remove")
+    events.box.wait_until(lambda: len(list(descriptors.iterdir())) == before - 1, what="the socket being closed")
+
+
+def test_other_devices_are_not_looked_at(events):
+    events.start()
+    events.session(1, "iqn.a")
+    events.uevent(subsystem="block")
+    events.sync()
+    assert not events.place(ISCSI_EVENTS).exists()
+
+
+def test_without_connection_events_the_sessions_are_watched(events):
+    events.box.write(f"/run/netlink-{ISCSI_EVENTS}-refused", "")
+    events.session(1, "iqn.a")
+    events.start()
+    events.wait_runs(recover("iqn.a"))
+    events.state(1, "FAILED")
+    events.wait_runs(recover("iqn.a"), reopen("iqn.a"))
+    events.state(1, "LOGGED_IN")
+    events.wait_runs(recover("iqn.a"), reopen("iqn.a"), recover("iqn.a"))
+    assert events.daemon.stderr.count("no connection events") == 1
+
+
+def test_a_target_name_is_one_argument_whatever_it_holds(events):
+    name = "iqn.x $(touch /bad) 'q' \"p\" -n"
+    events.session(1, name, state="FAILED")
+    events.start()
+    events.wait_runs(reopen(name))
+    assert not events.box.path("/bad").exists()
+
+
+def test_a_tool_that_cannot_be_started_ends_nothing(events):
+    events.session(1, "iqn.a", state="FAILED")
+    events.box.environment["PATH"] = "/nowhere"
+    events.start()
+    events.box.wait_until(lambda: "No such file" in events.daemon.stderr, what="the complaint")
+    assert events.daemon.result is None
+
+
+def test_it_ends_without_taking_the_tool_along(connected):
+    connected.box.fake("remvol", "--oiscsi_evt_reopen", effect="until [ -e /go ]; do sleep 0.01; done; touch /done",
+                       times=1)
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    assert connected.stop().status == 0
+    connected.box.write("/go", "")
+    connected.box.wait_until(connected.box.path("/done").exists, what="the tool going on")
+
+
+def test_a_broken_socket_ends_it_so_that_it_is_started_again(connected):
+    connected.send(b"broken")
+    assert connected.daemon.wait().status != 0
+
+
+def test_help_version_and_usage(bare_box):
+    program = bare_box.build / "bin" / "remvol-events"
+    for option in ("-h", "--help"):
+        done = bare_box.run([program, option])
+        assert done.status == 0 and done.stdout.startswith("usage: remvol-events") and done.stderr == ""
+    assert bare_box.run([program, "--version"]).stdout == "remvol-events 1.0.0\n"
+    assert bare_box.run([program, "--what"]).status == 2
