@@ -39,7 +39,7 @@ static struct {
   pid_t pid;
 } programs[PROGRAMS];
 
-static void answer(const char* format, ...) {
+__attribute__((format(printf, 1, 2))) static void answer(const char* format, ...) {
   char text[512];
   va_list list;
   va_start(list, format);
