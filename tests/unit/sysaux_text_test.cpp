@@ -80,7 +80,7 @@ std::vector<std::string> sample_texts() {
   for (int i = 0; i < 2000; ++i) {
     std::string text(random() % 120, ' ');
     for (char& each : text)
-      each = static_cast<char>(random() % 4 == 0 ? "\"\\$`!\n"[random() % 6] : 1 + random() % 255);
+      each = random() % 4 == 0 ? "\"\\$`!\n"[random() % 6] : static_cast<char>(1 + random() % 255);
     texts.push_back(text);
   }
   return texts;

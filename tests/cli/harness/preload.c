@@ -351,7 +351,7 @@ PUBLIC int str_insert_back_slash(char* out, size_t size, const char* text) {
   return (int)take_result(&rule);
 }
 
-long long sys_get_disk_space(const char* format, ...);
+long long sys_get_disk_space(const char* format, ...) __attribute__((format(printf, 1, 2)));
 PUBLIC long long sys_get_disk_space(const char* format, ...) {
   char path[4096];
   long long result;
