@@ -12,7 +12,9 @@ inline constexpr int kFormatReadSize = 1024;
 struct FormatProgress {
   bool groups_seen;  // "Allocating group tables" was announced
   bool inodes_seen;  // "Writing inode tables" was announced
-  int percent;       // 10 to 30 while group tables are allocated, 30 to 100 while inode tables are written
+  // 10 to 30 while group tables are allocated, 30 to 100 while inode tables are written. The counter of the
+  // superblocks, which follows, runs from 30 to 100 again.
+  int percent;
 };
 
 // Takes the text of one read (at most kFormatReadSize - 1 characters) into `progress`. Returns whether it

@@ -1,0 +1,116 @@
+// Mount points: which share names are refused, how commands quote a path, and what a removal must not reach.
+#include "volume/mount_point.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "volume_fixture.h"
+
+using namespace remvol;
+
+namespace {
+
+class MountPoint : public VolumeTest {};
+
+// A file system of the test's own below /mnt.
+class MountedPath : public VolumeTest {
+ protected:
+  MountedPath() {
+    cover("/mnt");
+    std::filesystem::create_directories(path);
+  }
+  ~MountedPath() override { uncover("/mnt"); }
+
+  void put_layer() {
+    cover(path.c_str());
+    std::ofstream(path + "/file") << "data";
+  }
+
+  const std::string path = "/mnt/VV/Data";
+};
+
+}  // namespace
+
+TEST_F(MountPoint, NamesThatLeaveTheRootAreRefused) {
+  for (const char* share : {"..", "../x", "a/..", "a/../../etc", "a/b/../c", "../../etc/passwd", ".", "/",
+                            "./", "//", "/..", "a/../", "/./", "./."}) {
+    const std::string log = fakes::output_of([share] { EXPECT_FALSE(is_share_inside_root(share)) << share; });
+    EXPECT_TRUE(has(log, std::string("share name ") + share + " leaves /mnt/VV/"));
+  }
+}
+
+TEST_F(MountPoint, OtherNamesAreTaken) {
+  for (const char* share :
+       {"Data", "a b", "..a", "a..", "...", "a/b", "./a", "/a", "a.b", ".hidden", "\"$`\\", "-rf"}) {
+    EXPECT_TRUE(is_share_inside_root(share)) << share;
+  }
+}
+
+TEST_F(MountPoint, ThePathIsTheRootAndTheShare) {
+  EXPECT_STREQ(mount_point_of("Backup"), "/mnt/VV/Backup");
+  const std::string longest(127, 'x');
+  EXPECT_EQ(std::string(mount_point_of(longest.c_str())), "/mnt/VV/" + longest);
+}
+
+TEST_F(MountPoint, ACommandQuotesThePath) {
+  EXPECT_STREQ(command_on_path("rm -rf", "/mnt/VV/a b"), "rm -rf \"/mnt/VV/a b\"");
+  EXPECT_STREQ(command_on_path("rm -rf", "/mnt/VV/\"$`\\"), "rm -rf \"/mnt/VV/\\\"\\$\\`\\\\\"");
+}
+
+TEST_F(MountPoint, ACommandIsNeverCut) {
+  const std::string longest(1023, '$');
+  std::string escaped;
+  for (size_t i = 0; i < longest.size(); i++) escaped += "\\$";
+  EXPECT_EQ(std::string(command_on_path("umount -f", longest.c_str())), "umount -f \"" + escaped + "\"");
+  EXPECT_STREQ(command_on_path("umount -f", std::string(3000, 'a').c_str()), "false");
+}
+
+TEST_F(MountedPath, AFolderThatIsNotMountedMayBeRemoved) {
+  EXPECT_FALSE(is_removal_unsafe(path.c_str()));
+  EXPECT_FALSE(is_removal_unsafe("/mnt/VV/never made"));
+}
+
+TEST_F(MountedPath, AMountIsNotRemoved) {
+  put_layer();
+  const std::string log = fakes::output_of([this] { EXPECT_TRUE(is_removal_unsafe(path.c_str())); });
+  EXPECT_TRUE(has(log, path + " is not removed, tmpfs is mounted on " + path));
+  EXPECT_TRUE(is_removal_unsafe("/mnt/VV//./Data/")) << "by another name of the same path";
+}
+
+TEST_F(MountedPath, AMountBelowIsNotRemoved) {
+  std::filesystem::create_directories(path + "/deeper/with a blank");
+  cover((path + "/deeper/with a blank").c_str());
+  EXPECT_TRUE(is_removal_unsafe(path.c_str()));
+  EXPECT_FALSE(is_removal_unsafe("/mnt/VV/Dat"));
+  EXPECT_FALSE(is_removal_unsafe((path + "/deeper/with").c_str()));
+}
+
+TEST_F(MountedPath, ALinkToAMountIsNotRemovedThrough) {
+  put_layer();
+  std::filesystem::create_symlink("/mnt/VV", "/mnt/link");
+  EXPECT_TRUE(is_removal_unsafe("/mnt/link/Data"));
+}
+
+TEST_F(MountedPath, EveryLayerIsDetachedEvenWhenItIsInUse) {
+  put_layer();
+  put_layer();
+  const int user = open((path + "/file").c_str(), O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(user, 0);
+  fakes::on("sys_mount_point", path).returns(1);
+  detach_mounts(path.c_str());
+  EXPECT_FALSE(is_removal_unsafe(path.c_str()));
+  EXPECT_TRUE(std::filesystem::is_empty(path));
+  char text[8] = "";
+  EXPECT_EQ(read(user, text, sizeof text), 4) << "the file of the detached layer lives on";
+  close(user);
+}
+
+TEST_F(MountedPath, DetachingStopsAtThePlatformsWord) {
+  put_layer();
+  fakes::on("sys_mount_point", path).returns(0);
+  detach_mounts(path.c_str());
+  EXPECT_TRUE(is_removal_unsafe(path.c_str()));
+}
