@@ -89,12 +89,8 @@ class Probe {
 };
 
 bool table_has_partitions(Probe& probe) {
-  // A protective MBR whose GPT cannot be used: the disk shrank, its sectors changed their size, or the table
-  // is damaged.
-  const char* type = probe.value("PTTYPE");
-  if (type != nullptr && strcmp(type, "PMBR") == 0) return true;
   Extent first;
-  return probe.partitions(&first, 1) > 0;
+  return probe.has_lost_gpt() || probe.partitions(&first, 1) > 0;
 }
 
 }  // namespace
