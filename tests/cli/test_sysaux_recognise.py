@@ -2,7 +2,7 @@
 
 import pytest
 from harness.sysaux import (
-    MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, run, under_fault,
+    MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, mounted, run, under_fault,
 )
 
 __all__ = ["loop"]
@@ -143,15 +143,11 @@ def test_a_clean_file_system_wants_no_check(loop):
         assert call("check_fs_state", disk.node) == 0, kind
 
 
-def test_a_mounted_journal_and_one_to_replay_want_a_check(loop, tmp_path):
+def test_a_mounted_journal_wants_a_check(loop):
     disk = loop()
     make_ext(disk)
-    (tmp_path / "mnt").mkdir()
-    run("mount", disk.node, tmp_path / "mnt")
-    try:
+    with mounted(disk.node):
         assert call("check_fs_state", disk.node) != 0
-    finally:
-        run("umount", tmp_path / "mnt")
     assert call("check_fs_state", disk.node) == 0
 
 

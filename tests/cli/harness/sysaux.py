@@ -44,7 +44,10 @@ class Loop:
         self.node = run("losetup", "--show", *options, "-f", self.file).strip()
         self.name = self.node.removeprefix("/dev/")
         self.part = self.node + "p1"
-        assert not self.partitions(), f"{self.node} has partitions of an earlier user"
+        # Detached by the kernel when the last user is gone, so nothing is left behind by a test that is killed.
+        self.held = os.open(self.node, os.O_RDONLY | os.O_CLOEXEC)
+        run("losetup", "-d", self.node)
+        self.forget()
 
     def resize(self, size):
         with open(self.file, "ab") as file:
@@ -106,10 +109,33 @@ class Loop:
         return whole.hexdigest()
 
     def close(self):
-        subprocess.run(["umount", "-q", self.part], capture_output=True)
         self.forget()
         run("blockdev", "--setrw", self.node, check=False)  # the next user of the device would inherit it
-        run("losetup", "-d", self.node)
+        os.close(self.held)
+
+
+class mounted:
+    """A device mounted for a while; gives the folder. It is mounted in a namespace of its own: the boxes of tests
+    that run at the same time take copies of all mounts, and would keep the device busy."""
+
+    def __init__(self, node):
+        self.node = node
+
+    def __enter__(self):
+        folder = tempfile.mkdtemp()
+        self.holder = subprocess.Popen(
+            ["unshare", "--mount", "sh", "-c", 'mount "$0" "$1" && echo ready && read end; umount "$1"',
+             self.node, folder],
+            stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True,
+        )
+        assert self.holder.stdout.readline() == "ready\n"
+        self.folder = folder
+        return pathlib.Path(f"/proc/{self.holder.pid}/root{folder}")
+
+    def __exit__(self, *_):
+        self.holder.communicate(timeout=60)
+        assert self.holder.returncode == 0
+        os.rmdir(self.folder)
 
 
 @pytest.fixture
