@@ -1,5 +1,6 @@
 """The command line of remvol: options, the command table, and the paths of success and failure."""
 
+import re
 import signal
 
 import pytest
@@ -325,6 +326,125 @@ class TestSuccessPath:
         assert messages(done.stdout)[-1] == ("src.cpp", "main", "task_version_upgrade() failed")
         assert (done.status, box.tree.get("/result/verupgrade")) == (255, "-1")
         assert box.trace("dump", "system") == ["system winshare_reload"]
+
+
+SHARES = "system winshare_reload ; macshare_reload"
+FLASH = 'system flashrun "cp -f /etc/NAS_CFG/vv.xml /usr/local/config/"'
+
+
+def done_by_main(box, command):
+    """What happens from the final result on."""
+    trace = box.trace("set", "dump", "system")
+    return trace[trace.index(f"set /result/{command}=0"):]
+
+
+class TestSuccessOfChangingCommands:
+    """--disconnect without targets logs out of everything, which here works."""
+
+    @pytest.fixture(autouse=True)
+    def initiator(self, box):
+        box.fake("iscsiadm")
+
+    def test_settings_go_to_flash_and_shares_are_reloaded(self, box):
+        assert box.remvol("--disconnect").status == 0
+        assert done_by_main(box, "disconnect") == [
+            "set /result/disconnect=0", "dump /etc/NAS_CFG/vv.xml", FLASH, SHARES]
+        assert box.runs("flashrun") == [["cp -f /etc/NAS_CFG/vv.xml /usr/local/config/"]]
+
+    def test_a_reset_to_defaults_keeps_the_flash_as_it_is(self, box):
+        box.write("/tmp/reset_default", "")
+        assert box.remvol("--disconnect").status == 0
+        assert done_by_main(box, "disconnect") == [
+            "set /result/disconnect=0", "dump /etc/NAS_CFG/vv.xml", SHARES]
+
+    def test_failing_helpers_do_not_matter(self, box):
+        box.fake("flashrun", status=1, first=True)
+        box.fake("winshare_reload", status=1, first=True)
+        box.fake("macshare_reload", status=1, first=True)
+        box.hook("ktreec_dump", ret=-1)
+        done = box.remvol("--disconnect")
+        assert (done.status, box.tree.get("/result/disconnect")) == (0, "0")
+        assert done_by_main(box, "disconnect")[1:] == ["dump /etc/NAS_CFG/vv.xml", FLASH, SHARES]
+
+    def test_the_result_is_empty_while_the_handler_runs(self, box):
+        box.tree.set("/result/disconnect", "-1")
+        box.fake("iscsiadm", first=True, effect="ktreec -S /var/run/ktree_sock_vv -g /result/disconnect >/tmp/seen")
+        box.remvol("--disconnect")
+        assert box.path("/tmp/seen").read_text() == "\n"
+        assert box.tree.get("/result/disconnect") == "0"
+
+    def test_an_empty_result_that_is_refused_does_not_stop_the_handler(self, box):
+        box.hook("ktreec_set", "/result/disconnect", value="", ret=-1)
+        assert box.remvol("--disconnect").status == 0
+        assert box.tree.get("/result/disconnect") == "0"
+
+    @pytest.mark.parametrize("command,args", [
+        ("add", []), ("del", []), ("del_lun", []), ("format", []), ("modify", []), ("connect", []),
+        ("disconnect", ["-n", "iqn.t"]), ("modify_address", [])])
+    def test_a_command_that_failed_changes_no_settings(self, box, command, args):
+        box.debug(1)
+        box.tree.set("/iscsi/initiator/id:1/target", "")
+        box.hook("ktreec_set", re.compile("^/iscsi/"), ret=-1)
+        given = args or options_for(NEEDS[command])
+        done = box.remvol(f"--{command}", *given)
+        assert done.status == 255
+        assert box.trace("dump") == []
+        assert FLASH not in box.trace("system")
+        text = {"modify_address": "task_modify() failed"}.get(command, f"task_{command}() failed")
+        assert messages(done.stdout)[-1] == ("src.cpp", "main", text)
+        assert box.trace("set", "system")[-2:] == ["system winshare_reload", f"set /result/{command}=-1"]
+
+    def test_a_failed_logout_of_everything_has_its_own_message(self, box):
+        box.debug(1)
+        box.fake("iscsiadm", status=21, first=True)
+        done = box.remvol("--disconnect")
+        assert messages(done.stdout)[-1] == ("src.cpp", "main", "task_disconnect(all) failed")
+        assert done.status == 255
+
+
+class TestSuccessOfOtherCommands:
+    def test_status_prints_one_empty_line_first_and_copies_nothing(self, box):
+        box.tree.set("/iscsi/initiator/count", "0")
+        done = box.remvol("--status")
+        assert (done.status, done.stdout[:1]) == (0, "\n")
+        assert done_by_main(box, "status") == ["set /result/status=0", "dump /etc/NAS_CFG/vv.xml"]
+        assert box.trace("set")[0] == "set /result/status="
+
+    @pytest.mark.parametrize("share,status", [("taken", 1), ("free", 0), ("Taken", 0)])
+    def test_check_share_name_gives_its_answer(self, box, share, status):
+        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t", "/iscsi/initiator/id:1/lun/id:1/lun": "0",
+                      "/iscsi/initiator/id:1/lun/id:1/share": "taken"})
+        done = box.remvol("--check_share_name", "-s", share)
+        assert done.status == status
+        assert box.tree.get("/result/check_share_name") == str(status)
+        assert box.trace("dump", "system") == ["dump /etc/NAS_CFG/vv.xml"]
+
+
+class TestFieldSizes:
+    """Texts are cut to what their field holds."""
+
+    @pytest.mark.parametrize("length,status", [(126, 0), (127, 1), (128, 1), (5000, 1)])
+    def test_a_share_name_holds_127_bytes(self, box, length, status):
+        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t", "/iscsi/initiator/id:1/lun/id:1/lun": "0",
+                      "/iscsi/initiator/id:1/lun/id:1/share": "s" * 127})
+        assert box.remvol("--check_share_name", "-s", "s" * length).status == status
+
+    @pytest.mark.parametrize("length", [255, 256, 5000])
+    def test_a_target_name_holds_255_bytes_and_chap_texts_127(self, box, length):
+        box.fake("iscsiadm", status=21)
+        box.remvol("--add", "-n", "n" * length, "-l", "0", "-i", "10.0.0.1", "-p", "3260", "-s", "s", "-c", "1",
+                   "-U", "u" * length, "-P", "p" * length)
+        target = "/iscsi/initiator/id:1"
+        assert box.tree.get(f"{target}/target") == "n" * 255
+        assert box.tree.get(f"{target}/chap_name") == "u" * 127
+        assert box.tree.get(f"{target}/chap_pwd") == "p" * 127
+
+    def test_user_and_secret_before_chap_are_not_stored(self, box):
+        box.fake("iscsiadm", status=21)
+        box.remvol("--add", "-U", "u", "-P", "p", "-n", "iqn.t", "-l", "0", "-i", "::1", "-p", "3260", "-s", "s")
+        target = "/iscsi/initiator/id:1"
+        assert box.tree.get(f"{target}/ip") == "[::1]"
+        assert (box.tree.get(f"{target}/chap_name"), box.tree.get(f"{target}/chap_pwd")) == ("", "")
 
 
 class TestStrangeValues:
