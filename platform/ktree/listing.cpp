@@ -8,13 +8,13 @@
 namespace ktree {
 namespace {
 
-void append_element(std::string& path, const Element& element) {
+void append_element(std::string& path, std::string_view name, unsigned number) {
   path += '/';
-  path += element.name;
-  if (element.number > 1 || element.name == "id") {
-    char number[16];
-    snprintf(number, sizeof number, ":%u", element.number);
-    path += number;
+  path += name;
+  if (number > 1 || name == "id") {
+    char text[16];
+    snprintf(text, sizeof text, ":%u", number);
+    path += text;
   }
 }
 
@@ -41,7 +41,7 @@ void list_node(Output& out, const Node& node, std::string& path) {
   }
   const size_t length = path.size();
   for_each_child(node, [&](const Node& child, unsigned number) {
-    append_element(path, {child.group->name, number});
+    append_element(path, child.group->name, number);
     list_node(out, child, path);
     path.resize(length);
   });
@@ -52,7 +52,7 @@ void list_node(Output& out, const Node& node, std::string& path) {
 bool write_listing(const Node& node, const Path& path, int fd) {
   std::string text;
   for (size_t i = 0; i < path.depth; i++) {
-    append_element(text, path.elements[i]);
+    append_element(text, path.elements[i].name(), path.elements[i].number);
   }
   Output out(fd);
   list_node(out, node, text);

@@ -12,7 +12,7 @@ bool is_name_part(char c) {
 }
 
 // "1" to "4096" without leading zeros; 0 for anything else.
-unsigned parse_number(std::string_view text) {
+uint16_t parse_number(std::string_view text) {
   constexpr size_t kMaxDigits = 4;
   if (text.empty() || text.size() > kMaxDigits || text.front() == '0') {
     return 0;
@@ -24,14 +24,16 @@ unsigned parse_number(std::string_view text) {
     }
     number = number * 10 + static_cast<unsigned>(c - '0');
   }
-  return number <= kMaxNumber ? number : 0;
+  return number <= kMaxNumber ? static_cast<uint16_t>(number) : uint16_t{0};
 }
 
 bool parse_element(std::string_view text, Element& element) {
-  size_t colon = text.find(':');
-  element.name = text.substr(0, colon);
-  element.number = colon == std::string_view::npos ? 1 : parse_number(text.substr(colon + 1));
-  return element.number != 0 && valid_name(element.name);
+  const size_t colon = text.find(':');
+  const std::string_view name = text.substr(0, colon);
+  element.text = name.data();
+  element.length = static_cast<uint16_t>(name.size());
+  element.number = colon == std::string_view::npos ? uint16_t{1} : parse_number(text.substr(colon + 1));
+  return element.number != 0 && valid_name(name);
 }
 
 }  // namespace
@@ -68,7 +70,7 @@ bool parse_path(std::string_view text, Path& path) {
   return true;
 }
 
-size_t number_length(unsigned number) {
+size_t number_length(size_t number) {
   if (number == 1) {
     return 0;
   }

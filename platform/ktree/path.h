@@ -6,15 +6,21 @@
 
 #include <array>
 #include <cstddef>
+#include <cstdint>
 #include <string_view>
 
 #include "ktree/limits.h"
 
 namespace ktree {
 
+// Neither this record nor the next one sets anything by itself: a path is taken apart in every request, and
+// has a few elements out of the many that it may have.
 struct Element {
-  std::string_view name;
-  unsigned number;
+  const char* text;
+  uint16_t length;
+  uint16_t number;
+
+  [[nodiscard]] std::string_view name() const { return {text, length}; }
 };
 
 // A path taken apart. The names point into the text that was parsed.
@@ -31,6 +37,6 @@ struct Path {
 [[nodiscard]] bool parse_path(std::string_view text, Path& path);
 
 // Digits that ":N" adds to an element in its shortest spelling: none for 1.
-[[nodiscard]] size_t number_length(unsigned number);
+[[nodiscard]] size_t number_length(size_t number);
 
 }  // namespace ktree

@@ -166,8 +166,8 @@ void SettingsReader::start_node(std::string_view name) {
     refuse("more than 4096 elements of one name, or a tree that is too large");
     return;
   }
-  const auto number = static_cast<unsigned>(node->group->members.size());
-  const size_t path_length = parent.path_length + 1 + name.size() + number_length(number);
+  const size_t path_length =
+      parent.path_length + 1 + name.size() + number_length(node->group->members.size());
   if (path_length > kMaxPathBytes) {
     refuse("a path of more than 1023 bytes");
     return;

@@ -25,7 +25,7 @@ size_t members_of(const Node& parent, std::string_view name) {
 }
 
 Node* find_child(const Node& parent, const Element& element) {
-  Group* group = find_group(parent, element.name);
+  Group* group = find_group(parent, element.name());
   return group == nullptr || element.number > group->members.size() ? nullptr
                                                                     : group->members[element.number - 1];
 }
@@ -76,9 +76,9 @@ bool Tree::set(const Path& path, std::string_view value) {
   Growth growth = {0, existing == path.depth && value.size() <= node->size ? 0 : value.size()};
   for (size_t i = existing; i < path.depth; i++) {
     const Element& element = path.elements[i];
-    size_t made = element.number - (i == existing ? members_of(*node, element.name) : 0);
+    size_t made = element.number - (i == existing ? members_of(*node, element.name()) : 0);
     growth.nodes += made;
-    growth.bytes += made * element.name.size();
+    growth.bytes += made * element.name().size();
   }
   if (!fits(growth)) {
     return false;
@@ -86,8 +86,8 @@ bool Tree::set(const Path& path, std::string_view value) {
   for (size_t i = existing; i < path.depth; i++) {
     const Element& element = path.elements[i];
     Node* child = nullptr;
-    for (size_t have = members_of(*node, element.name); have < element.number; have++) {
-      child = make_child(*node, element.name);
+    for (size_t have = members_of(*node, element.name()); have < element.number; have++) {
+      child = make_child(*node, element.name());
     }
     node = child;
   }

@@ -1,0 +1,275 @@
+// Measures round trips to the configuration tree beside two peers, in one run: a bare echo between two
+// processes, which is the floor that the machine sets, and redis-server.
+//
+// Usage: bench_tree KTREE_SOCKET REDIS_SOCKET OWN_CPU ECHO_CPU
+//
+// It runs on the processor OWN_CPU, the echoes on ECHO_CPU, where its caller has put the two servers as well.
+// Both servers get the same full tree first. Then every round makes the same few calls of every kind, one
+// kind after the other. A round is shorter than the time slices of the scheduler, so whatever else the
+// machine does disturbs a few rounds wholly instead of all of them a little: the figure of a kind is the
+// median of its rounds, and two kinds are compared by the median of what their ratio is within a round. Exits
+// 1 when a check failed.
+
+#include <sched.h>
+#include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "full_tree.h"
+#include "ktree/protocol.h"
+#include "ktreec.h"
+
+namespace {
+
+constexpr char kPath[] = "/iscsi/initiator/id:3/status";
+constexpr char kValue[] = "Connected, the volume is mounted and in use";
+constexpr double kMostOverEcho = 1.2;
+constexpr int kRounds = 1001;
+constexpr int kCalls = 32;
+
+[[noreturn]] void fail(const char* what) {
+  perror(what);
+  exit(2);
+}
+
+void write_all(int fd, const char* data, size_t size) {
+  if (write(fd, data, size) != static_cast<ssize_t>(size)) {
+    fail("write");
+  }
+}
+
+void read_all(int fd, char* data, size_t size) {
+  for (size_t have = 0; have < size;) {
+    const ssize_t n = read(fd, data + have, size - have);
+    if (n <= 0) {
+      fail("read");
+    }
+    have += static_cast<size_t>(n);
+  }
+}
+
+void pin_to(int cpu) {
+  cpu_set_t set;
+  CPU_ZERO(&set);
+  CPU_SET(static_cast<size_t>(cpu), &set);
+  if (sched_setaffinity(0, sizeof set, &set) != 0) {
+    fail("sched_setaffinity");
+  }
+}
+
+int connect_to(const char* path) {
+  sockaddr_un address = {};
+  address.sun_family = AF_UNIX;
+  snprintf(address.sun_path, sizeof address.sun_path, "%s", path);
+  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (fd < 0 || connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    fail(path);
+  }
+  return fd;
+}
+
+// A process that answers every `request` bytes with `reply` bytes, blocking in both, and its caller's side.
+class Echo {
+ public:
+  Echo(size_t request, size_t reply, int cpu) : request_(request), reply_(reply) {
+    int fds[2];
+    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds) != 0) {
+      fail("socketpair");
+    }
+    fflush(stdout);
+    child_ = fork();
+    if (child_ == 0) {
+      prctl(PR_SET_PDEATHSIG, SIGKILL);
+      close(fds[0]);
+      pin_to(cpu);
+      answer(fds[1]);
+    }
+    close(fds[1]);
+    fd_ = fds[0];
+  }
+  Echo(const Echo&) = delete;
+  Echo& operator=(const Echo&) = delete;
+  ~Echo() {
+    close(fd_);
+    waitpid(child_, nullptr, 0);
+  }
+
+  void call() {
+    write_all(fd_, request_.data(), request_.size());
+    read_all(fd_, reply_.data(), reply_.size());
+  }
+
+ private:
+  [[noreturn]] void answer(int fd) {
+    for (;;) {
+      if (read(fd, request_.data(), request_.size()) <= 0) {
+        _exit(0);
+      }
+      write_all(fd, reply_.data(), reply_.size());
+    }
+  }
+
+  std::vector<char> request_;
+  std::vector<char> reply_;
+  int fd_ = -1;
+  pid_t child_ = -1;
+};
+
+// A client of redis-server that does no more than it must: the request is made beforehand, one write, one
+// read.
+class Redis {
+ public:
+  explicit Redis(const char* socket) : fd_(connect_to(socket)) {}
+  Redis(const Redis&) = delete;
+  Redis& operator=(const Redis&) = delete;
+  ~Redis() { close(fd_); }
+
+  static std::string bulk(const std::string& word) {
+    std::string text = "$";
+    return text.append(std::to_string(word.size())).append("\r\n").append(word).append("\r\n");
+  }
+
+  static std::string command(const std::vector<std::string>& words) {
+    std::string text = "*";
+    text.append(std::to_string(words.size())).append("\r\n");
+    for (const std::string& word : words) {
+      text.append(bulk(word));
+    }
+    return text;
+  }
+
+  void call(const std::string& command, const std::string& reply) {
+    std::array<char, 1024> buffer;
+    write_all(fd_, command.data(), command.size());
+    read_all(fd_, buffer.data(), reply.size());
+    if (memcmp(buffer.data(), reply.data(), reply.size()) != 0) {
+      fprintf(stderr, "redis-server answered something else\n");
+      exit(2);
+    }
+  }
+
+ private:
+  int fd_;
+};
+
+struct Kind {
+  const char* name;
+  std::function<void()> call;
+  std::vector<double> rounds;  // microseconds a call
+
+  void measure(int calls) {
+    const auto start = std::chrono::steady_clock::now();
+    for (int i = 0; i < calls; i++) {
+      call();
+    }
+    const std::chrono::duration<double, std::micro> time = std::chrono::steady_clock::now() - start;
+    rounds.push_back(time.count() / calls);
+  }
+
+  [[nodiscard]] double percentile(double part) const { return percentile_of(rounds, part); }
+
+  [[nodiscard]] double ratio_to(const Kind& other) const {
+    std::vector<double> ratios;
+    for (size_t i = 0; i < rounds.size(); i++) {
+      ratios.push_back(rounds[i] / other.rounds[i]);
+    }
+    return percentile_of(ratios, 0.5);
+  }
+
+  static double percentile_of(std::vector<double> values, double part) {
+    std::sort(values.begin(), values.end());
+    return values[static_cast<size_t>(static_cast<double>(values.size() - 1) * part)];
+  }
+};
+
+void fill(const char* ktree, Redis& redis) {
+  for_each_entry_of_full_tree([&](const std::string& path, const std::string& value) {
+    if (ktreec_set(ktree, 0, path.c_str(), value.c_str()) != 0) {
+      fail(path.c_str());
+    }
+    redis.call(Redis::command({"SET", path, value}), "+OK\r\n");
+  });
+}
+
+void set_tree(const char* socket) {
+  if (ktreec_set(socket, 0, kPath, kValue) != 0) {
+    fail("ktreec_set");
+  }
+}
+
+void get_tree(const char* socket) {
+  char buffer[256];
+  if (ktreec_get_wb(socket, 0, kPath, buffer, sizeof buffer) != static_cast<int>(strlen(kValue))) {
+    fail("ktreec_get_wb");
+  }
+}
+
+bool check(const Kind& ours, const Kind& theirs, double most) {
+  const double ratio = ours.ratio_to(theirs);
+  const bool passed = ratio <= most;
+  char what[64];
+  snprintf(what, sizeof what, "%s / %s", ours.name, theirs.name);
+  printf("%-32s %5.2f   (at most %.2f)  %s\n", what, ratio, most, passed ? "pass" : "FAIL");
+  return passed;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  if (argc != 5) {
+    fprintf(stderr, "Usage: bench_tree KTREE_SOCKET REDIS_SOCKET OWN_CPU ECHO_CPU\n");
+    return 2;
+  }
+  const char* ktree = argv[1];
+  const int echo_cpu = atoi(argv[4]);
+  pin_to(atoi(argv[3]));
+
+  Redis redis(argv[2]);
+  fill(ktree, redis);
+  const std::string value = kValue;
+  const std::string redis_set = Redis::command({"SET", kPath, value});
+  const std::string redis_get = Redis::command({"GET", kPath});
+  const std::string redis_value = Redis::bulk(value);
+  Echo set_echo(sizeof(ktree::RequestHeader) + strlen(kPath) + value.size(), sizeof(ktree::ReplyHeader),
+                echo_cpu);
+  Echo get_echo(sizeof(ktree::RequestHeader) + strlen(kPath) + sizeof(uint32_t),
+                sizeof(ktree::ReplyHeader) + value.size(), echo_cpu);
+
+  std::array<Kind, 6> kinds = {{
+      {"echo of a set", [&] { set_echo.call(); }, {}},
+      {"ktreec_set", [&] { set_tree(ktree); }, {}},
+      {"redis SET", [&] { redis.call(redis_set, "+OK\r\n"); }, {}},
+      {"echo of a get", [&] { get_echo.call(); }, {}},
+      {"ktreec_get_wb", [&] { get_tree(ktree); }, {}},
+      {"redis GET", [&] { redis.call(redis_get, redis_value); }, {}},
+  }};
+  for (int i = 0; i < kRounds; i++) {
+    for (Kind& kind : kinds) {
+      kind.measure(kCalls);
+    }
+  }
+  printf("%-20s %10s %10s %10s   (microseconds a round trip, %d rounds of %d)\n", "", "median", "10 %",
+         "90 %", kRounds, kCalls);
+  for (const Kind& kind : kinds) {
+    printf("%-20s %10.2f %10.2f %10.2f\n", kind.name, kind.percentile(0.5), kind.percentile(0.1),
+           kind.percentile(0.9));
+  }
+  bool passed = check(kinds[1], kinds[0], kMostOverEcho);
+  passed &= check(kinds[4], kinds[3], kMostOverEcho);
+  passed &= check(kinds[1], kinds[2], 1.0);
+  passed &= check(kinds[4], kinds[5], 1.0);
+  return passed ? 0 : 1;
+}
