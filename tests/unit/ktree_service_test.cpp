@@ -1,0 +1,188 @@
+// Frames and what the daemon answers to them.
+#include "ktree/service.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <string>
+
+#include "ktree/protocol.h"
+
+namespace ktree {
+namespace {
+
+std::string frame(uint32_t length, uint8_t operation, uint8_t zero, uint16_t path_length,
+                  const std::string& rest) {
+  RequestHeader header = {length, operation, zero, path_length};
+  std::string bytes(sizeof header, '\0');
+  memcpy(bytes.data(), &header, sizeof header);
+  return bytes + rest;
+}
+
+std::string request(Operation operation, const std::string& path, const std::string& value = "") {
+  return frame(static_cast<uint32_t>(4 + path.size() + value.size()), static_cast<uint8_t>(operation), 0,
+               static_cast<uint16_t>(path.size()), path + value);
+}
+
+std::string limit(uint32_t bytes) {
+  return {reinterpret_cast<const char*>(&bytes), sizeof bytes};
+}
+
+class ServiceTest : public testing::Test {
+ protected:
+  Status call(const std::string& bytes, int document = -1) {
+    Request request = {};
+    if (!parse_request(bytes, request)) {
+      ADD_FAILURE() << "not a request";
+      return Status::failed;
+    }
+    request.document = document;
+    const Service::Answer answer = service_.handle(request);
+    body_ = answer.body;
+    return answer.status;
+  }
+  Status set(const std::string& path, const std::string& value) {
+    return call(request(Operation::set, path, value));
+  }
+  Status get(const std::string& path, uint32_t bytes = 65535) {
+    return call(request(Operation::get, path, limit(bytes)));
+  }
+
+  Service service_;
+  std::string body_;
+};
+
+TEST(Frame, SizeIsKnownFromFourBytes) {
+  const std::string bytes = request(Operation::get, "/a", limit(1));
+  EXPECT_EQ(request_size(bytes), bytes.size());
+  EXPECT_EQ(request_size(bytes.substr(0, 4)), bytes.size());
+  for (size_t size = 0; size < 4; size++) {
+    EXPECT_EQ(request_size(bytes.substr(0, size)), kMoreNeeded);
+  }
+}
+
+TEST(Frame, OfAnImpossibleSizeIsNone) {
+  for (uint32_t length : {0U, 1U, 3U, 66563U, 70000U, 0x7FFFFFFFU, 0xFFFFFFFBU, 0xFFFFFFFCU, 0xFFFFFFFFU}) {
+    EXPECT_EQ(request_size(frame(length, 1, 0, 0, "")), kNoRequest) << length;
+  }
+  EXPECT_EQ(request_size(frame(4, 1, 0, 0, "")), 8U);
+  EXPECT_EQ(request_size(frame(66562, 1, 0, 0, "")), kMaxRequestBytes);
+}
+
+TEST(Frame, ThatDoesNotHoldTogetherIsNone) {
+  Request request = {};
+  EXPECT_FALSE(parse_request("", request));
+  EXPECT_FALSE(parse_request("abcdefgh", request));
+  EXPECT_FALSE(parse_request(frame(4, 0, 0, 0, ""), request));
+  EXPECT_FALSE(parse_request(frame(4, 7, 0, 0, ""), request));
+  EXPECT_FALSE(parse_request(frame(4, 255, 0, 0, ""), request));
+  EXPECT_FALSE(parse_request(frame(4, 1, 1, 0, ""), request));
+  EXPECT_FALSE(parse_request(frame(6, 1, 0, 3, "/a"), request));
+  EXPECT_FALSE(parse_request(frame(6, 1, 0, 65535, "/a"), request));
+  EXPECT_FALSE(parse_request(frame(7, 1, 0, 2, "/a"), request));
+  EXPECT_FALSE(parse_request(frame(5, 1, 0, 2, "/a"), request));
+  EXPECT_TRUE(parse_request(frame(6, 1, 0, 2, "/a"), request));
+  EXPECT_EQ(request.path, "/a");
+  EXPECT_EQ(request.value, "");
+}
+
+TEST_F(ServiceTest, SetsAndGets) {
+  EXPECT_EQ(get("/a"), Status::missing);
+  EXPECT_EQ(set("/a", "value"), Status::done);
+  EXPECT_EQ(get("/a"), Status::done);
+  EXPECT_EQ(body_, "value");
+  EXPECT_EQ(get("/a", 3), Status::done);
+  EXPECT_EQ(body_, "val");
+  EXPECT_EQ(get("/a", 0), Status::done);
+  EXPECT_EQ(body_, "");
+}
+
+TEST_F(ServiceTest, RefusesBadPathsAndChangesNothing) {
+  EXPECT_EQ(set("/a/b:0", "x"), Status::refused);
+  EXPECT_EQ(get("/a"), Status::missing);
+  EXPECT_EQ(set("/", "x"), Status::refused);
+  EXPECT_EQ(set("", "x"), Status::refused);
+  EXPECT_EQ(get("/a:4097"), Status::refused);
+  EXPECT_EQ(call(request(Operation::del, "/")), Status::refused);
+}
+
+TEST_F(ServiceTest, RefusesValuesThatATreeCannotHold) {
+  EXPECT_EQ(set("/a", std::string("x\0y", 3)), Status::refused);
+  EXPECT_EQ(set("/a", std::string(65536, 'x')), Status::refused);
+  EXPECT_EQ(get("/a"), Status::missing);
+  EXPECT_EQ(set("/a", std::string(65535, 'x')), Status::done);
+}
+
+TEST_F(ServiceTest, RefusesAGetWithoutItsLimit) {
+  ASSERT_EQ(set("/a", "x"), Status::done);
+  EXPECT_EQ(call(request(Operation::get, "/a")), Status::refused);
+  EXPECT_EQ(call(request(Operation::get, "/a", "123")), Status::refused);
+}
+
+TEST_F(ServiceTest, Deletes) {
+  ASSERT_EQ(set("/a/b", "x"), Status::done);
+  EXPECT_EQ(call(request(Operation::del, "/a")), Status::done);
+  EXPECT_EQ(call(request(Operation::del, "/a")), Status::missing);
+  EXPECT_EQ(get("/a/b"), Status::missing);
+}
+
+TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
+  const int null = open("/dev/null", O_RDWR | O_CLOEXEC);
+  int pipes[2];
+  ASSERT_EQ(pipe(pipes), 0);
+  const int sealed = memfd_create("sealed", MFD_CLOEXEC | MFD_ALLOW_SEALING);
+  ASSERT_EQ(fcntl(sealed, F_ADD_SEALS, F_SEAL_WRITE), 0);
+  for (int document : {-1, null, pipes[1]}) {
+    EXPECT_EQ(call(request(Operation::dump, ""), document), Status::failed);
+    EXPECT_EQ(call(request(Operation::load, ""), document), Status::failed);
+    EXPECT_EQ(call(request(Operation::list, "/"), document), Status::failed);
+  }
+  EXPECT_EQ(call(request(Operation::dump, ""), sealed), Status::failed);
+  for (int fd : {null, pipes[0], pipes[1], sealed}) {
+    close(fd);
+  }
+}
+
+TEST_F(ServiceTest, LoadsWhatItDumped) {
+  const int document = memfd_create("document", MFD_CLOEXEC);
+  ASSERT_EQ(set("/a", "x"), Status::done);
+  ASSERT_EQ(call(request(Operation::dump, ""), document), Status::done);
+  ASSERT_EQ(set("/a", "y"), Status::done);
+  ASSERT_EQ(set("/b", "z"), Status::done);
+  ASSERT_EQ(call(request(Operation::load, ""), document), Status::done);
+  EXPECT_EQ(get("/a"), Status::done);
+  EXPECT_EQ(body_, "x");
+  EXPECT_EQ(get("/b"), Status::missing);
+  close(document);
+}
+
+TEST_F(ServiceTest, ADamagedDocumentLeavesTheTreeAsItWas) {
+  const int document = memfd_create("document", MFD_CLOEXEC);
+  const std::string text = "<config>\n<a>new</a>\n<b>\n</config>";
+  ASSERT_EQ(write(document, text.data(), text.size()), static_cast<ssize_t>(text.size()));
+  ASSERT_EQ(set("/a", "old"), Status::done);
+  EXPECT_EQ(call(request(Operation::load, ""), document), Status::damaged);
+  EXPECT_EQ(body_, "line 4: mismatched tag");
+  EXPECT_EQ(get("/a"), Status::done);
+  EXPECT_EQ(body_, "old");
+  close(document);
+}
+
+TEST_F(ServiceTest, ListsTheRootAndNodes) {
+  const int document = memfd_create("document", MFD_CLOEXEC);
+  ASSERT_EQ(set("/a", "x"), Status::done);
+  EXPECT_EQ(call(request(Operation::list, "/"), document), Status::done);
+  EXPECT_EQ(call(request(Operation::list, "/a:1"), document), Status::done);
+  EXPECT_EQ(call(request(Operation::list, "/b"), document), Status::missing);
+  EXPECT_EQ(call(request(Operation::list, ""), document), Status::refused);
+  char text[64] = "";
+  EXPECT_EQ(pread(document, text, sizeof text, 0), 10);
+  EXPECT_STREQ(text, "/a=x\n/a=x\n");
+  close(document);
+}
+
+}  // namespace
+}  // namespace ktree
