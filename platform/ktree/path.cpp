@@ -56,7 +56,7 @@ bool parse_path(std::string_view text, Path& path) {
     return false;
   }
   while (!text.empty()) {
-    if (text.front() != '/') {
+    if (text.front() != '/' || path.depth == path.elements.size()) {
       return false;
     }
     text.remove_prefix(1);

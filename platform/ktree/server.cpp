@@ -127,8 +127,13 @@ void Server::keep_time() {
   }
 }
 
+// When all places are taken, one client gets in a turn: the first of them is known to be there, and the
+// requests of those that came before it are looked at in between.
 void Server::accept_clients() {
   for (int i = 0; i < kEventsATurn; i++) {
+    if (clients_ >= max_clients_ && (i > 0 || !make_room())) {
+      return;
+    }
     const int fd = accept4(listener_, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC);
     if (fd >= 0) {
       welcome(fd);
@@ -146,8 +151,7 @@ void Server::accept_clients() {
 void Server::welcome(int fd) {
   auto connection = std::make_unique<Connection>();
   connection->fd = fd;
-  if (!is_welcome(fd) || (clients_ >= max_clients_ && !make_room()) ||
-      !watch(fd, connection.get(), EPOLLIN, EPOLL_CTL_ADD)) {
+  if (!is_welcome(fd) || !watch(fd, connection.get(), EPOLLIN, EPOLL_CTL_ADD)) {
     return;
   }
   clients_++;
@@ -257,7 +261,7 @@ void Server::answer(Connection& connection, std::string_view bytes) {
   header.length = static_cast<uint32_t>(sizeof header - kLengthBytes + answer.body.size());
   header.status = static_cast<uint8_t>(answer.status);
   memcpy(reply_.data(), &header, sizeof header);
-  memcpy(reply_.data() + sizeof header, answer.body.data(), answer.body.size());
+  answer.body.copy(reply_.data() + sizeof header, answer.body.size());
   send_reply(connection, {reply_.data(), sizeof header + answer.body.size()});
 }
 

@@ -1,0 +1,385 @@
+"""The client library: what a program that uses it meets when its daemon is slow, gone, new or hostile."""
+import os
+import signal
+import socket
+import struct
+import subprocess
+import tempfile
+import threading
+import time
+
+import pytest
+
+from harness.ktree_daemon import BUILD, DEL, GET, KTREEC, Daemon, until
+
+
+class Caller:
+    """A program that makes one call of the library a line."""
+
+    def __init__(self, target):
+        self.process = subprocess.Popen([BUILD / "tests/harness/ktree_call", target], stdin=subprocess.PIPE,
+                                        stdout=subprocess.PIPE, text=True)
+        assert self.process.stdout.readline() == "ready\n"
+
+    def send(self, line):
+        self.process.stdin.write(line + "\n")
+        self.process.stdin.flush()
+
+    def answer(self):
+        return self.process.stdout.readline()[:-1]
+
+    def __call__(self, line):
+        self.send(line)
+        return self.answer()
+
+    def close(self):
+        self.process.stdin.close()
+        assert self.process.wait(20) == 0
+        self.process.stdout.close()
+
+
+@pytest.fixture
+def daemon():
+    daemon = Daemon()
+    yield daemon
+    daemon.close()
+
+
+@pytest.fixture
+def caller(daemon):
+    caller = Caller(daemon.socket)
+    yield caller
+    caller.close()
+
+
+class Listener:
+    """A socket where something else than a daemon listens: serve(connection, number) is called for every connection."""
+
+    def __init__(self, serve=None, backlog=16):
+        self.folder = tempfile.TemporaryDirectory(prefix="ktree.")
+        self.path = self.folder.name + "/sock"
+        self.socket = socket.socket(socket.AF_UNIX)
+        self.socket.bind(self.path)
+        self.socket.listen(backlog)
+        self.accepted = []
+        self.serve = serve
+        if serve is not None:
+            threading.Thread(target=self.run, daemon=True).start()
+
+    def run(self):
+        while True:
+            try:
+                connection, _ = self.socket.accept()
+            except OSError:
+                return
+            self.accepted.append(connection)
+            self.serve(connection, len(self.accepted))
+
+    def close(self):
+        self.socket.close()
+        for connection in self.accepted:
+            connection.close()
+        self.folder.cleanup()
+
+
+def read_request(connection):
+    data = b""
+    while len(data) < 4 or len(data) < 4 + struct.unpack_from("=I", data)[0]:
+        try:
+            part = connection.recv(1 << 17)
+        except ConnectionResetError:
+            return None
+        if not part:
+            return None
+        data += part
+    return data
+
+
+def reply(status, body=b""):
+    return struct.pack("=IB3x", 4 + len(body), status) + body
+
+
+@pytest.fixture
+def listen():
+    made = []
+
+    def make(*args, **options):
+        made.append((Listener(*args, **options)))
+        return made[-1]
+
+    yield make
+    for listener in made:
+        listener.close()
+
+
+# Calls and their results
+
+
+def test_calls_and_results(daemon, caller):
+    assert caller("get /a 100") == "-1 "
+    assert caller("set /a hello world") == "0"
+    assert caller("get /a 100") == "11 hello world"
+    assert caller("get /a 6") == "5 hello"
+    assert caller("get /a 1") == "0 "
+    assert caller("get /a 0") == "-1 "
+    assert caller("set /a ") == "0"
+    assert caller("get /a 100") == "0 "
+    assert caller("set /d/x 1") == "0"
+    assert caller("get /d 100") == "-1 "
+    assert caller("del /d") == "0"
+    assert caller("del /d") == "-1"
+    for path in ["a", "/", "/a:0", "/a:4097", "/" + "x" * 1023, "/" + "x" * 5000]:
+        assert caller(f"set {path} x") == "-1"
+        assert caller(f"get {path} 100") == "-1 "
+        assert caller(f"del {path}") == "-1"
+    assert daemon.listing() == ["/a="]
+
+
+def test_the_longest_value_and_one_more(daemon, caller):
+    longest = "x" * 65535
+    assert caller(f"set /a {longest}") == "0"
+    assert caller(f"set /a {longest}x") == "-1"
+    assert caller("get /a 65536") == f"65535 {longest}"
+    assert caller("get /a 70000") == f"65535 {longest}"
+    assert caller("get /a 65535") == f"65534 {longest[1:]}"
+
+
+def test_dump_and_load(daemon, caller):
+    file = daemon.folder / "vv.xml"
+    caller("set /a x")
+    assert caller(f"dump {file}") == "0"
+    caller("set /a y")
+    assert caller(f"load {file}") == "0"
+    assert caller("get /a 10") == "1 x"
+    file.write_text("<config><a>cut")
+    assert caller(f"load {file}") == "-1"
+    assert caller(f"load {file}.missing") == "-1"
+    assert caller(f"dump {daemon.folder}/missing/vv.xml") == "-1"
+    assert caller("get /a 10") == "1 x"
+
+
+def test_a_missing_daemon_is_an_error_at_once():
+    caller = Caller("/tmp/ktree.nobody/sock")
+    start = time.monotonic()
+    assert caller("set /a x") == "-1"
+    assert caller("get /a 10") == "-1 "
+    assert caller("del /a") == "-1"
+    assert time.monotonic() - start < 2
+    caller.close()
+
+
+def test_the_library_needs_nothing_but_the_c_library():
+    if os.environ.get("REMVOL_BUILD", "").endswith("asan"):
+        pytest.skip("a sanitizer brings its own")
+    library = BUILD / "lib/libktreec.so"
+    needed = subprocess.run(["readelf", "-d", library], capture_output=True, text=True, check=True).stdout
+    assert [line.split("[")[1] for line in needed.splitlines() if "NEEDED" in line] == ["libc.so.6]"]
+
+
+def test_the_library_exports_its_five_functions_and_nothing_else():
+    names = subprocess.run(["nm", "-D", "--defined-only", BUILD / "lib/libktreec.so"], capture_output=True, text=True,
+                           check=True).stdout
+    exported = sorted(line.split()[-1] for line in names.splitlines())
+    exported = [name for name in exported if not name.startswith(("__odr_asan", "__asan", "__ubsan"))]
+    assert exported == ["ktreec_del", "ktreec_dump", "ktreec_get_wb", "ktreec_load", "ktreec_set"]
+
+
+# One connection
+
+
+def test_one_connection_serves_a_process(listen):
+    def serve(connection, _):
+        while read_request(connection):
+            connection.sendall(reply(0))
+
+    listener = listen(serve)
+    caller = Caller(listener.path)
+    for i in range(20):
+        assert caller(f"set /a {i}") == "0"
+    assert len(listener.accepted) == 1
+    caller.close()
+
+
+def test_a_child_has_a_connection_of_its_own(daemon, caller):
+    caller("set /a x")
+    for _ in range(20):
+        caller.send("fork /a")
+        assert [caller.answer(), caller.answer()] == ["1 x", "1 x"]
+    assert caller("get /a 10") == "1 x"
+
+
+def test_no_descriptor_goes_to_a_child_program(daemon, caller):
+    caller("set /a x")
+    caller(f"dump {daemon.folder}/vv.xml")
+    assert "socket" not in caller("sh ls -l /proc/self/fd | grep -v pipe")
+    assert "socket" in caller("sh ls -l /proc/$PPID/fd")
+
+
+def test_threads_share_it(daemon, caller):
+    assert caller("threads /t 200") == "1600"
+
+
+# A daemon that was restarted
+
+
+@pytest.mark.parametrize("number", [signal.SIGTERM, signal.SIGKILL])
+def test_a_restart_is_survived(daemon, caller, number):
+    for i in range(3):
+        assert caller(f"set /a {i}") == "0"
+        daemon.stop(number)
+        assert caller("set /a x") == "-1"
+        assert caller("get /a 10") == "-1 "
+        daemon.start()
+        assert caller("get /a 10") == "-1 "
+        assert caller(f"set /b {i}") == "0"
+        daemon.stop(number)
+        daemon.start()
+        assert caller("set /a again") == "0"
+        assert caller("get /a 10") == "5 again"
+        daemon.stop(number)
+        daemon.start()
+        assert caller("del /a") == "-1"
+        assert caller(f"dump {daemon.folder}/vv.xml") == "0"
+
+
+def closes_the_first(answer_later):
+    """Reads a request and closes, the first time; answers from then on."""
+    requests = []
+
+    def serve(connection, number):
+        while request := read_request(connection):
+            requests.append(request)
+            if number == 1:
+                connection.close()
+                return
+            connection.sendall(answer_later)
+
+    return serve, requests
+
+
+def test_a_lost_get_is_sent_again(listen):
+    serve, requests = closes_the_first(reply(0, b"value"))
+    caller = Caller(listen(serve).path)
+    assert caller("get /a 100") == "5 value"
+    assert [request[4] for request in requests] == [GET, GET]
+    caller.close()
+
+
+def test_a_delete_that_may_have_been_done_is_not_sent_again(listen):
+    serve, requests = closes_the_first(reply(0))
+    caller = Caller(listen(serve).path)
+    assert caller("del /id:2") == "-1"
+    assert [request[4] for request in requests] == [DEL]
+    assert caller("del /id:2") == "0"
+    caller.close()
+
+
+def test_a_delete_that_was_never_read_is_sent_again(listen):
+    requests = []
+
+    def serve(connection, number):
+        if number == 1:
+            # There is something to read, and it is closed unread.
+            connection.recv(1, socket.MSG_PEEK)
+            connection.close()
+            return
+        while request := read_request(connection):
+            requests.append(request)
+            connection.sendall(reply(0))
+
+    caller = Caller(listen(serve).path)
+    assert caller("del /id:2") == "0"
+    assert len(requests) == 1
+    caller.close()
+
+
+NONSENSE = {
+    "too long for any reply": b"\xff\xff\xff\xff\0\0\0\0",
+    "too short for a reply": b"\0\0\0\0\0\0\0\0",
+    "more than was asked for": reply(0, b"x" * 101),
+    "much more than was asked for": reply(0, b"x" * 50000),
+    "more than it says": reply(0, b"x") + b"more",
+    "no such status": reply(77),
+}
+
+
+@pytest.mark.parametrize("answer", NONSENSE.values(), ids=NONSENSE)
+def test_nonsense_from_the_other_side_is_an_error(listen, answer):
+    def serve(connection, _):
+        while read_request(connection):
+            connection.sendall(answer)
+
+    caller = Caller(listen(serve).path)
+    assert caller("get /a 101") == "-1 "
+    assert caller("get /a 101") == "-1 "
+    caller.close()
+
+
+# A daemon that does not answer
+
+
+def test_a_daemon_that_does_not_answer_is_given_up_after_5_seconds(listen, daemon):
+    def trickle(connection, _):
+        read_request(connection)
+        for byte in reply(0, b"x" * 50):
+            try:
+                connection.sendall(bytes([byte]))
+            except OSError:
+                return
+            time.sleep(1)
+
+    def read_nothing(connection, _):
+        connection.setsockopt(socket.SOL_SOCKET, socket.SO_RCVBUF, 1)
+
+    full = listen(backlog=0)
+    waiting = []
+    while len(waiting) < 100:
+        client = socket.socket(socket.AF_UNIX)
+        client.setblocking(False)
+        waiting.append(client)
+        if client.connect_ex(full.path) != 0:
+            break
+    daemon.process.send_signal(signal.SIGSTOP)
+    callers = [Caller(listen().path), Caller(full.path), Caller(listen(trickle).path), Caller(daemon.socket),
+               Caller(listen(read_nothing).path), Caller(daemon.socket), Caller(daemon.socket)]
+    lines = ["get /a 100", "get /a 100", "get /a 100", "get /a 100", "set /a " + "x" * 65000, "del /a",
+             f"dump {daemon.folder}/vv.xml"]
+    start = time.monotonic()
+    for caller, line in zip(callers, lines):
+        caller.send(line)
+    for caller, line in zip(callers, lines):
+        assert caller.answer() in ("-1", "-1 "), line
+        assert 4.5 < time.monotonic() - start < 8, line
+    assert not (daemon.folder / "vv.xml").exists()
+    daemon.process.send_signal(signal.SIGCONT)
+    # What comes late belongs to nobody: the next answer is the answer to the next question.
+    assert callers[3]("set /b x") == "0"
+    assert callers[3]("get /b 10") == "1 x"
+    for caller in callers:
+        caller.close()
+    for client in waiting:
+        client.close()
+
+
+def test_the_tool_says_that_the_daemon_does_not_answer(listen):
+    start = time.monotonic()
+    path = listen().path
+    done = subprocess.run([KTREEC, "-S", path, "-g", "/a"], capture_output=True, text=True, timeout=60)
+    assert (done.returncode, done.stdout, done.stderr) == (3, "", f"ktreec: {path}: the daemon cannot be reached\n")
+    assert 4.5 < time.monotonic() - start < 8
+
+
+def test_a_connection_that_the_daemon_dropped_is_made_anew(daemon):
+    small = Daemon(prefix=["prlimit", "--nofile=24:24"])
+    callers = []
+    try:
+        callers = [Caller(small.socket) for _ in range(10)]
+        for i in range(3):
+            for number, caller in enumerate(callers):
+                assert caller(f"set /c{number} {i}") == "0"
+                assert caller(f"get /c{number} 10") == f"1 {i}"
+                assert caller(f"del /c{number}") == "0"
+    finally:
+        for caller in callers:
+            caller.close()
+        small.close()
