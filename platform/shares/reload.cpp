@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "process.h"
+#include "utf8.h"
 #include "volume_list.h"
 
 namespace shares {
@@ -26,7 +27,7 @@ std::vector<Section> shares_of(const std::vector<Volume>& volumes, const Server&
       why = "another share has this name";
     }
     if (why != nullptr) {
-      log_line("volume \"%s\" is not shared: %s", printable_name(volume.name).c_str(), why);
+      log_line("volume \"%s\" is not shared: %s", platform::printable(volume.name).c_str(), why);
       continue;
     }
     taken.push_back(folded);

@@ -23,10 +23,6 @@ const char* name_refusal(std::string_view name, const NameRules& rules);
 // UTF-8.
 std::wstring folded_name(std::string_view name);
 
-// `name` as it may stand in a log line: control characters as \xHH, and all that is not ASCII as well when it
-// is not UTF-8.
-std::string printable_name(std::string_view name);
-
 }  // namespace shares
 
 #endif

@@ -1,0 +1,28 @@
+// Text of users as UTF-8, whatever locale the program runs in.
+#ifndef PLATFORM_COMMON_UTF8_H
+#define PLATFORM_COMMON_UTF8_H
+
+#include <string>
+#include <string_view>
+
+namespace platform {
+
+// Puts the characters of `text` into `characters`. Returns false when it is not UTF-8; there are none then.
+bool decode(std::string_view text, std::wstring& characters);
+
+// True for what moves a cursor or ends a line instead of being shown.
+bool is_control(wchar_t character);
+
+// The character in lower case.
+wchar_t lower_case(wchar_t character);
+
+// The terminal cells that the text takes.
+size_t cells(std::string_view text);
+
+// `text` as it may stand on a line: control characters as \xHH, and all that is not ASCII as well when it is
+// not UTF-8.
+std::string printable(std::string_view text);
+
+}  // namespace platform
+
+#endif

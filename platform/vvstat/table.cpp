@@ -1,0 +1,138 @@
+#include "table.h"
+
+#include <algorithm>
+#include <array>
+#include <cstdio>
+#include <string_view>
+
+#include "utf8.h"
+
+namespace vvstat {
+namespace {
+
+constexpr size_t kColumns = 6;
+constexpr size_t kStatusColumn = 2;
+constexpr size_t kBarWidth = 20;
+constexpr std::string_view kGap = "  ";
+
+constexpr char kGood[] = "\x1b[32m", kBusy[] = "\x1b[33m", kBad[] = "\x1b[31m", kPlain[] = "\x1b[0m";
+
+struct Row {
+  std::array<std::string, kColumns> cells;
+  const char* colour;  // of the status; null for none
+};
+
+Row header() {
+  return {{"TARGET / SHARE", "PORTAL / LUN", "STATUS", "USED", "SIZE", "USE"}, nullptr};
+}
+
+const char* colour_of(const Target& target) {
+  if (is_connected(target)) return kGood;
+  if (target.connect_state == 2 || target.connect_state == 3) return kBusy;
+  return target.wanted ? kBad : nullptr;
+}
+
+const char* colour_of(const Volume& volume) {
+  if (!volume.enabled) return nullptr;
+  if (volume.format_state == kFormatRunning || volume.format_state == 4 || volume.volume_state == 1)
+    return kBusy;
+  if (volume.format_state == 3 || volume.volume_state == 3 || volume.volume_state == 5) return kBad;
+  return volume.status.starts_with("Running") ? kGood : nullptr;
+}
+
+std::string bar(int progress) {
+  const size_t done = kBarWidth * static_cast<size_t>(progress) / 100;
+  return "[" + std::string(done, '#') + std::string(kBarWidth - done, '-') + "] " + std::to_string(progress) +
+         "%";
+}
+
+std::string share_of_size(const Volume& volume) {
+  if (volume.format_state == kFormatRunning) return bar(volume.progress);
+  if (volume.size == 0) return "-";
+  const double percent = 100.0 * static_cast<double>(volume.used) / static_cast<double>(volume.size);
+  char text[16];
+  snprintf(text, sizeof text, "%.0f%%", percent);
+  return text;
+}
+
+std::string or_dash(const std::string& text) {
+  return text.empty() ? "-" : platform::printable(text);
+}
+
+std::vector<Row> rows_of(const Status& status) {
+  std::vector<Row> rows{header()};
+  for (const Target& target : status.targets) {
+    const std::string portal = or_dash(target.address) + ":" + std::to_string(target.port);
+    rows.push_back(
+        {{platform::printable(target.name), portal, or_dash(target.status), "", "", ""}, colour_of(target)});
+    for (const Volume& volume : target.volumes) {
+      const bool sized = volume.size != 0;
+      rows.push_back({{"  " + or_dash(volume.share), "LUN " + std::to_string(volume.lun),
+                       or_dash(volume.status), sized ? readable_size(volume.used) : "-",
+                       sized ? readable_size(volume.size) : "-", share_of_size(volume)},
+                      colour_of(volume)});
+    }
+  }
+  return rows;
+}
+
+// The longest start of `text` that takes at most that many cells.
+std::string_view fitting(std::string_view text, size_t columns) {
+  size_t size = text.size();
+  while (size > 0 && platform::cells(text.substr(0, size)) > columns) {
+    do {
+      --size;
+    } while (size > 0 && (static_cast<unsigned char>(text[size]) & 0xc0) == 0x80);
+  }
+  return text.substr(0, size);
+}
+
+std::string line_of(const Row& row, const std::array<size_t, kColumns>& widths, const Screen& screen) {
+  std::string line;
+  size_t left = screen.columns == 0 ? SIZE_MAX : screen.columns;
+  size_t pending = 0;  // blanks that go before the next cell, if there is one
+  for (size_t column = 0; column < kColumns && pending < left; ++column) {
+    const std::string_view text = fitting(row.cells[column], left - pending);
+    const size_t width = platform::cells(text);
+    const bool coloured = screen.colour && column == kStatusColumn && row.colour != nullptr && !text.empty();
+    if (!text.empty()) {
+      line.append(pending, ' ');
+      left -= pending + width;
+      pending = 0;
+    }
+    line += coloured ? row.colour : "";
+    line += text;
+    line += coloured ? kPlain : "";
+    pending += widths[column] - std::min(width, widths[column]) + kGap.size();
+  }
+  return line + "\n";
+}
+
+}  // namespace
+
+std::string readable_size(unsigned long long bytes) {
+  constexpr const char* kUnits[] = {"B", "KiB", "MiB", "GiB", "TiB", "PiB", "EiB"};
+  auto size = static_cast<double>(bytes);
+  size_t unit = 0;
+  for (; size >= 1024 && unit + 1 < std::size(kUnits); ++unit) size /= 1024;
+  char text[32];
+  snprintf(text, sizeof text, unit == 0 || size >= 99.95 ? "%.0f %s" : "%.1f %s", size, kUnits[unit]);
+  return text;
+}
+
+std::string table(const Status& status, const Screen& screen) {
+  if (status.targets.empty()) return "No targets are configured.\n";
+  const std::vector<Row> rows = rows_of(status);
+  std::array<size_t, kColumns> widths{};
+  for (const Row& row : rows) {
+    for (size_t column = 0; column < kColumns; ++column) {
+      widths[column] = std::max(widths[column], platform::cells(row.cells[column]));
+    }
+  }
+  std::string text;
+  const size_t shown = screen.lines == 0 ? rows.size() : std::min(rows.size(), screen.lines);
+  for (size_t row = 0; row < shown; ++row) text += line_of(rows[row], widths, screen);
+  return text;
+}
+
+}  // namespace vvstat
