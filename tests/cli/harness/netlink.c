@@ -23,7 +23,7 @@ static int refuse(int error) {
 
 int socket(int domain, int type, int protocol) {
   struct sockaddr_un place = {.sun_family = AF_UNIX};
-  char refused[64];
+  char refused[sizeof place.sun_path + 16];
   if (domain != AF_NETLINK) return (int)syscall(SYS_socket, domain, type, protocol);
   snprintf(place.sun_path, sizeof place.sun_path, "/run/netlink-%d", protocol);
   snprintf(refused, sizeof refused, "%s-refused", place.sun_path);
