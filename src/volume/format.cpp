@@ -12,6 +12,7 @@
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/format_progress.h"
+#include "volume/process_check.h"
 
 namespace remvol {
 
@@ -110,21 +111,6 @@ void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition
   note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100), caller);
 }
 
-// Returns whether a process whose line in the process list matches `pattern` (for grep) mentions `device`.
-bool is_process_listed(const char* pattern, const char* device, Caller caller = Caller()) {
-  const CommandText command("ps -w | grep %s | grep -v 'grep'", pattern);
-  FILE* list = popen(command, "r");
-  if (list == nullptr) return false;
-  char line[1024];
-  bool found = false;
-  while (!found && fgets(line, sizeof line, list) != nullptr) {
-    LOG_AT(caller, 2, "get ps mke2fs buf = %s", line);
-    found = strstr(line, device) != nullptr;
-  }
-  pclose(list);
-  return found;
-}
-
 }  // namespace
 
 int Target_format(TargetEntry* entry, const char* partition) {
@@ -159,12 +145,12 @@ int Target_format(TargetEntry* entry, const char* partition) {
 }
 
 int check_mkfs_process_existing() {
-  return is_process_listed("mke2fs", "/dev/sd") ? 0 : 1;
+  return is_command_running_on("mke2fs", "/dev/sd") ? 0 : 1;
 }
 
 int check_resizing_fs(const char* device) {
   LOG(2, "checking if device %s is resizing...", device);
-  return is_process_listed("resize2fs", device) ? 0 : 1;
+  return is_command_running_on("resize2fs", device) ? 0 : 1;
 }
 
 }  // namespace remvol

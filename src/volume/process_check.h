@@ -1,0 +1,15 @@
+// Whether a command works on a disk just now, started by whichever run.
+#ifndef REMVOL_VOLUME_PROCESS_CHECK_H
+#define REMVOL_VOLUME_PROCESS_CHECK_H
+
+#include "frontend/log.h"
+
+namespace remvol {
+
+// Returns whether a process whose line in the process list matches `name` (for grep) has `device` in it.
+// Every line looked at is logged at level 2 in the caller's name.
+bool is_command_running_on(const char* name, const char* device, Caller caller = Caller());
+
+}  // namespace remvol
+
+#endif
