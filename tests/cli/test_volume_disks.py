@@ -1,0 +1,511 @@
+"""From a bare LUN to a mounted folder and back, on real disks with the real commands."""
+
+import os
+import signal
+
+import pytest
+from harness.sysaux import image, make_ambivalent, make_ext, md_member, mounted, run
+from harness.volumes import drive, luns
+
+__all__ = ["luns"]
+
+MIB = 1 << 20
+ONE_PARTITION = "label: gpt\nstart=2048,type=L\n"
+TWO_PARTITIONS = "label: gpt\nstart=2048,size=200000,type=L\nstart=204800,size=200000,type=L\n"
+FILES = {"a file": b"contents\n", "large": os.urandom(3 * MIB)}
+
+
+def partition(lun, script=ONE_PARTITION):
+    """A table that another system wrote; the kernel knows it."""
+    lun.disk.sfdisk(script)
+    run("partx", "-a", lun.disk.node)
+
+
+def fill(node):
+    """Files on a file system that is not mounted in the box."""
+    with mounted(node) as folder:
+        for name, data in FILES.items():
+            (folder / name).write_bytes(data)
+
+
+def keep_files(lun):
+    for name, data in FILES.items():
+        lun.write_file(name, data)
+
+
+def assert_files(lun):
+    for name, data in FILES.items():
+        assert lun.read_file(name) == data
+
+
+def assert_mounted(lun, kind, node=None):
+    assert lun.mounted()
+    assert lun.path().stat().st_mode & 0o7777 == 0o777
+    wanted = {"mnt_dev": node or lun.disk.part, "mnt": lun.mount_point, "fs_type": kind, "format_state": "0",
+              "volume_state": "0", "vol_access_right": "1"}
+    assert {name: lun.key(name) for name in wanted} == wanted
+
+
+def assert_gone(lun):
+    assert not lun.mounts()
+    assert not lun.box.path(lun.mount_point).exists()
+
+
+def formatted(lun):
+    """Whether a mke2fs ran."""
+    return any("mke2fs" in command for command in lun.box.shell())
+
+
+# --- from a fresh disk, and back ---
+
+
+def test_a_fresh_disk_is_partitioned_formatted_and_mounted(luns):
+    lun = luns(300 * MIB)
+    assert lun.mount().result == 0
+    assert_mounted(lun, "ext4")
+    assert lun.key("format_progress") == "100"
+    assert len(lun.disk.partitions()) == 1
+    assert lun.disk.table()["label"] == "gpt"
+    keep_files(lun)
+    assert lun.unmount().result == 0
+    assert_gone(lun)
+    lun.box.forget()
+    assert lun.mount().result == 0
+    assert not formatted(lun)
+    assert_mounted(lun, "ext4")
+    assert_files(lun)
+
+
+def test_a_second_mount_of_a_mounted_volume_changes_nothing(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    keep_files(lun)
+    assert lun.mount().result == 0
+    assert not lun.box.runs("e2fsck") or lun.box.runs("e2fsck")[-1][:2] == ["-n", "-f"]
+    assert_files(lun)
+
+
+def test_the_status_follows(luns):
+    lun = luns(300 * MIB)
+    assert lun.mount().result == 0
+    drive(lun.box, "unmount_all")
+    assert (lun.key("status"), lun.key("size")) == ("Offline", "0/0")
+    assert_gone(lun)
+
+
+def test_two_luns_of_a_target(luns):
+    first, second = luns(300 * MIB), luns(200 * MIB)
+    assert first.mount().result == 0
+    assert second.mount().result == 0
+    assert_mounted(first, "ext4")
+    assert_mounted(second, "ext4")
+    keep_files(second)
+    assert first.unmount().result == 0
+    assert_files(second)
+
+
+# --- what is there already ---
+
+
+@pytest.mark.parametrize("kind", ["ext2", "ext3", "ext4", "xfs"])
+def test_a_partition_with_a_file_system_is_mounted_as_it_is(luns, kind):
+    lun = luns(400 * MIB)
+    partition(lun)
+    run("mkfs.xfs", "-q", lun.disk.part) if kind == "xfs" else make_ext(lun.disk, lun.disk.part, kind)
+    fill(lun.disk.part)
+    known = lun.disk.partitions()
+    assert lun.mount().result == 0
+    assert not formatted(lun)
+    assert_mounted(lun, kind)
+    assert_files(lun)
+    assert lun.disk.partitions() == known
+    assert lun.unmount().result == 0
+    assert_gone(lun)
+
+
+def test_vfat_is_mounted_with_its_options_or_left_as_it_is(luns):
+    """Where the kernel has no vfat the mount fails as any other."""
+    lun = luns(300 * MIB)
+    partition(lun)
+    run("mkfs.vfat", lun.disk.part)
+    before = lun.disk.digest()
+    lun.box.fake("mount", "-t vfat", status=32)
+    assert lun.mount().result == 0
+    assert [list(call) for call in lun.box.runs("mount")] == 4 * [
+        ["-t", "vfat", "-o", "umask=0,iocharset=utf8,shortname=winnt", lun.disk.part, lun.mount_point]]
+    assert lun.key("volume_state") == "3"
+    assert not formatted(lun)
+    assert_gone(lun)
+    assert lun.disk.digest() == before
+
+
+@pytest.mark.parametrize("kind", ["ext2", "ext3"])
+def test_a_format_keeps_ext2_and_ext3(luns, kind):
+    lun = luns(300 * MIB)
+    partition(lun)
+    make_ext(lun.disk, lun.disk.part, kind)
+    fill(lun.disk.part)
+    assert lun.mount(force=1).result == 0
+    assert_mounted(lun, kind)
+    assert os.listdir(lun.path()) == ["lost+found"]
+
+
+def test_an_empty_partition_is_formatted(luns):
+    lun = luns(300 * MIB)
+    partition(lun)
+    assert lun.mount().result == 0
+    assert formatted(lun)
+    assert_mounted(lun, "ext4")
+
+
+def test_of_two_partitions_the_recognised_one_is_taken(luns):
+    lun = luns(300 * MIB)
+    partition(lun, TWO_PARTITIONS)
+    lun.disk.write(2048 * 512, b"no file system, but somebody's" * 100)
+    second = f"{lun.disk.node}p2"
+    make_ext(lun.disk, second)
+    fill(second)
+    known = lun.disk.partitions()
+    assert lun.mount().result == 0
+    assert not formatted(lun)
+    assert_mounted(lun, "ext4", second)
+    assert_files(lun)
+    assert lun.disk.partitions() == known
+    with open(lun.disk.part, "rb") as first:
+        assert first.read(3000) == b"no file system, but somebody's" * 100
+
+
+@pytest.mark.parametrize("name", ["lvm2", "luks2"])
+def test_a_partition_with_another_signature_is_unsupported(luns, name):
+    lun = luns(300 * MIB)
+    partition(lun)
+    lun.disk.write(MIB, image(name))
+    before = lun.disk.digest()
+    assert lun.mount().result == -6
+    assert lun.key("volume_state") == "5"
+    assert not formatted(lun)
+    assert lun.disk.digest() == before
+
+
+def test_a_partition_that_may_be_two_things_is_unsupported(luns):
+    lun = luns(300 * MIB)
+    partition(lun)
+    make_ambivalent(lun.disk, lun.disk.part)
+    before = lun.disk.digest()
+    assert lun.mount().result == -6
+    assert lun.disk.digest() == before
+
+
+@pytest.mark.parametrize("name", ["lvm2", "luks2", "ext4", "xfs", "raid"])
+def test_a_disk_without_a_table_that_carries_something_is_kept(luns, name):
+    lun = luns(400 * MIB)
+    if name == "ext4":
+        make_ext(lun.disk)
+    elif name == "xfs":
+        run("mkfs.xfs", "-q", lun.disk.node)
+    elif name == "raid":
+        lun.disk.write(*md_member(400 * MIB, "1.2"))
+    else:
+        lun.disk.write(0, image(name))
+    before = lun.disk.digest()
+    assert lun.mount().result == -2
+    assert lun.key("volume_state") == "3"
+    assert lun.disk.digest() == before
+    assert not lun.box.shell()
+
+
+# --- disks that grew ---
+
+
+def test_a_disk_that_grew_a_little_is_left_alone(luns):
+    lun = luns(400 * MIB)
+    lun.mount()
+    keep_files(lun)
+    lun.unmount()
+    known = lun.disk.partitions()
+    lun.disk.grow(450 * MIB)
+    assert lun.mount().result == 0
+    assert lun.disk.partitions() == known
+    assert_files(lun)
+
+
+def test_a_disk_that_grew_gets_its_partition_grown(luns):
+    lun = luns(400 * MIB)
+    lun.mount()
+    keep_files(lun)
+    lun.unmount()
+    (start, size), = lun.disk.partitions().values()
+    lun.disk.grow(600 * MIB)
+    lun.box.forget()
+    assert lun.mount().result == 0
+    assert lun.disk.partitions()[1][0] == start
+    assert lun.disk.partitions()[1][1] - size >= 199 * MIB // 512
+    assert_files(lun)
+    assert_mounted(lun, "ext4")
+    assert not formatted(lun)
+    lun.box.wait_quiet()
+    [resize] = lun.box.runs("resize2fs")
+    assert resize == ["-fp", lun.disk.part]
+    run("sfdisk", "--verify", lun.disk.node)
+
+
+# --- disks with faults ---
+
+
+def test_a_disk_of_a_mebibyte_is_offline(luns):
+    lun = luns(MIB)
+    assert lun.mount().result == -8
+    assert lun.key("volume_state") is None
+    assert not lun.box.shell()
+
+
+def test_the_next_larger_disk_is_tried(luns):
+    """It holds no partition of a usable size."""
+    lun = luns(MIB + 512)
+    assert lun.mount().result == -2
+    assert not lun.box.shell()
+
+
+def test_a_fresh_disk_that_cannot_be_written_fails(luns):
+    lun = luns(300 * MIB)
+    run("blockdev", "--setro", lun.disk.node)
+    assert lun.mount().result == -2
+    assert lun.key("volume_state") == "3"
+    run("blockdev", "--setrw", lun.disk.node)
+
+
+def test_an_empty_partition_that_cannot_be_written_becomes_read_only(luns):
+    lun = luns(300 * MIB)
+    partition(lun)
+    run("blockdev", "--setro", lun.disk.part)
+    assert lun.mount().result == -3
+    assert lun.key("vol_access_right") == "0"
+    assert (lun.key("format_state"), lun.key("format_progress")) == ("1", "0")
+    assert lun.mount().result == -3, "the semaphore went with the run that kept it"
+
+
+def test_a_volume_that_cannot_be_written_is_mounted_read_only(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    keep_files(lun)
+    lun.unmount()
+    run("blockdev", "--setro", lun.disk.part)
+    assert lun.mount().result == -7
+    assert lun.key("vol_access_right") == "0"
+    assert lun.mounted()
+    assert_files(lun)
+
+
+def test_a_disk_that_cannot_be_read_is_not_taken_for_an_empty_one(luns):
+    lun = luns(300 * MIB)
+    lun.disk.resize(0)
+    os.truncate(lun.disk.file, 0)  # reads beyond the end of the backing file fail
+    assert lun.mount().result == -2
+    assert lun.key("volume_state") == "3"
+    assert not lun.box.shell()
+    assert os.stat(lun.disk.file).st_size == 0
+
+
+def test_a_partition_that_cannot_be_read_is_not_formatted(luns):
+    lun = luns(300 * MIB)
+    partition(lun)
+    os.truncate(lun.disk.file, MIB + 4096)
+    assert lun.mount().result in (-2, -6)
+    assert not formatted(lun)
+    assert os.stat(lun.disk.file).st_size == MIB + 4096
+
+
+# --- share names ---
+
+NAMES = [
+    "two words", " blank at both ends ", "it's", 'say "yes"', "$HOME", "$(touch /tmp/broken-out)",
+    "`touch /tmp/broken-out`", "back\\slash", "\\", "a;touch /tmp/broken-out", "a&b|c>d<e", "*?[a]", "#!~%",
+    "ümläut 名前", "-rf", "--", "-", "...", "..x", "x" * 120, "$`\"\\" * 30, "new\nline", "tab\tstop", "a/b", "./c",
+]
+
+
+@pytest.mark.parametrize("name", NAMES, ids=range(len(NAMES)))
+def test_any_share_name(luns, name):
+    lun = luns(64 * MIB, name)
+    box = lun.box
+    bystander = box.write("/mnt/VV/bystander", "stays")
+    assert lun.mount().result == 0
+    assert os.path.normpath(lun.mount_point) in lun.mounts()
+    assert lun.key("mnt") == lun.mount_point
+    keep_files(lun)
+    assert lun.unmount().result == 0
+    assert_gone(lun)
+    assert lun.mount().result == 0
+    assert_files(lun)
+    assert lun.unmount().result == 0
+    assert not box.path("/tmp/broken-out").exists()
+    assert bystander.read_text() == "stays"
+
+
+@pytest.mark.parametrize("name", ["..", "../../etc", "a/../..", "/", ".", "../VV", "a/.."])
+def test_a_share_name_that_leads_out_is_refused(luns, name):
+    lun = luns(64 * MIB, name)
+    kept = lun.box.write("/mnt/VV/kept", "stays")
+    before = lun.disk.digest()
+    assert lun.mount().result == -4
+    assert lun.unmount().result == -1
+    assert not lun.box.shell()
+    assert lun.disk.digest() == before
+    assert kept.read_text() == "stays"
+
+
+# --- volumes in use ---
+
+USERS = {
+    "open file": "import time; f = open('a file'); print('ready', flush=True); time.sleep(600)",
+    "working folder": "import os, time; os.chdir('.'); print('ready', flush=True); time.sleep(600)",
+    "mapping": "import mmap, os, time; fd = os.open('a file', os.O_RDONLY); m = mmap.mmap(fd, 0, prot=mmap.PROT_READ);"
+               "os.close(fd); os.chdir('/'); print('ready', flush=True); time.sleep(600)",
+}
+
+
+def use(lun, code, folder=None):
+    user = lun.box.start(["/usr/bin/python3", "-c", code], cwd=folder or lun.mount_point, env={"LD_PRELOAD": None})
+    lun.box.wait_until(lambda: "ready" in user.stdout)
+    return user
+
+
+@pytest.mark.parametrize("kind", USERS)
+def test_the_users_of_a_volume_are_killed(luns, kind):
+    lun = luns(300 * MIB)
+    lun.mount()
+    keep_files(lun)
+    user = use(lun, USERS[kind])
+    assert lun.unmount().result == 0
+    assert user.wait().status == -signal.SIGKILL
+    assert_gone(lun)
+    assert lun.mount().result == 0
+    assert_files(lun)
+
+
+def test_nobody_else_is_killed(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    other = lun.box.start(["/usr/bin/python3", "-c", "import time; time.sleep(600)"], cwd="/tmp")
+    assert lun.unmount().result == 0
+    assert other.result is None and lun.box.pump(0.05) is False
+    lun.box.path("/mnt/VV/share1").mkdir()
+    assert lun.unmount().result == 0
+    assert other.result is None and lun.box.pump(0.05) is False
+    other.kill()
+
+
+@pytest.mark.parametrize("kind", USERS)
+def test_a_volume_that_stays_in_use_loses_no_file(luns, kind):
+    """The kill does not reach the user: the volume is detached before the mount point is removed."""
+    lun = luns(300 * MIB)
+    lun.mount()
+    keep_files(lun)
+    lun.box.fake("fuser", first=True)
+    user = use(lun, USERS[kind])
+    lun.box.forget()
+    assert lun.unmount().result == 0
+    assert len(lun.box.runs("umount")) == 4
+    assert_gone(lun)
+    assert user.result is None
+    user.kill()
+    user.wait()
+    assert lun.mount().result == 0
+    assert_files(lun)
+
+
+def test_a_volume_mounted_twice_on_its_mount_point(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    keep_files(lun)
+    assert lun.box.run(["/usr/bin/mount", "--bind", lun.mount_point, lun.mount_point]).status == 0
+    assert lun.mounts() == 2 * [lun.mount_point]
+    lun.box.fake("fuser", first=True)
+    user = use(lun, USERS["open file"])
+    assert lun.unmount().result == 0
+    assert_gone(lun)
+    user.kill()
+    user.wait()
+    assert lun.mount().result == 0
+    assert_files(lun)
+
+
+def test_the_mount_in_the_ftp_area(luns):
+    lun = luns(300 * MIB, "Data")
+    lun.mount()
+    keep_files(lun)
+    assert lun.call("ftp_path").result == -104
+    ftp = "/home/Public/the \"Data\" $x"
+    lun.box.path(ftp).mkdir(parents=True)
+    assert lun.box.run(["/usr/bin/mount", lun.disk.part, ftp]).status == 0
+    done = lun.call("ftp_path")
+    assert (done.result, f"path = {ftp}" in done.lines) == (0, True)
+    assert lun.unmount().result == 0
+    assert lun.mounts() == [ftp], "the volume's files are safe behind the other mount"
+    user = use(lun, USERS["open file"], ftp)
+    assert drive(lun.box, "unmount_ftp", ftp).result == 0
+    assert user.wait().status == -signal.SIGKILL
+    assert not lun.mounts()
+    assert lun.box.path(ftp).is_dir()
+    assert lun.mount().result == 0
+    assert_files(lun)
+
+
+def test_a_volume_below_another_keeps_its_files(luns):
+    """It is detached with the one above it."""
+    outer, inner = luns(300 * MIB, "outer"), luns(200 * MIB, "outer/inner")
+    outer.mount()
+    inner.mount()
+    keep_files(outer)
+    keep_files(inner)
+    assert outer.unmount().result == 0
+    assert_gone(outer)
+    assert outer.mount().result == 0
+    assert inner.mount().result == 0
+    assert_files(outer)
+    assert_files(inner)
+
+
+def test_a_volume_below_a_folder_is_in_the_way_of_its_removal(luns):
+    outer, inner = luns(300 * MIB, "outer"), luns(200 * MIB, "outer/inner")
+    inner.mount()
+    keep_files(inner)
+    assert outer.unmount().result == -1
+    assert inner.mounted()
+    assert_files(inner)
+
+
+# --- volumes that turned read-only ---
+
+
+def degraded(lun):
+    return drive(lun.box, "degraded", lun.disk.part, lun.mount_point).result
+
+
+def test_a_volume_that_is_fine_is_not_degraded(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    assert degraded(lun) == 0
+    assert os.listdir(lun.path()) == ["lost+found"]
+
+
+def test_a_volume_whose_journal_was_aborted_is_degraded(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    lun.box.run(["/usr/bin/mount", "-o", "remount,abort", lun.mount_point])
+    assert lun.box.run(["touch", f"{lun.mount_point}/x"]).status != 0
+    assert degraded(lun) == 1
+    assert lun.unmount().result == 0
+    assert lun.mount().result == 0
+    assert degraded(lun) == 0, "a new mount helps"
+
+
+def test_a_volume_that_was_mounted_read_only_is_not_degraded(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    lun.unmount()
+    lun.box.path(lun.mount_point).mkdir()
+    lun.box.run(["/usr/bin/mount", "-o", "ro", lun.disk.part, lun.mount_point])
+    assert degraded(lun) == 0
+    lun.box.run(["/usr/bin/umount", lun.mount_point])
+    assert degraded(lun) == -1
