@@ -192,7 +192,8 @@ TEST(DetailedListing, ReadingEndsBehindTheTargetsBlock) {
 TEST(DetailedListing, HostAndLunAreReported) {
   DetailedListing listing = kLunListing;
   std::vector<ListingLine> seen;
-  for (const std::string& line : pieces(block(target(kT1), disk(12, "sdb")))) {
+  const Texts lines = pieces(block(target(kT1), disk(12, "sdb")));
+  for (const std::string& line : lines) {
     const ListingLine what = read_listing_line(&listing, line.c_str(), kT1);
     if (what != ListingLine::kOther) seen.push_back(what);
   }
