@@ -91,6 +91,7 @@ def test_a_check_that_fails_is_refused_as_well(box):
     done = modify(box)
     assert REFUSAL in done.stdout
     assert nothing_written(box)
+    assert box.shell() == [CHECK]
 
 
 def test_a_target_that_connects_meanwhile_is_refused(box):
