@@ -126,6 +126,14 @@ def test_a_stale_session_of_the_older_system_is_replaced(box, initiator):
     assert box.tree.get(f"{ROOT}/status") == "Connected"
 
 
+def test_the_end_of_the_first_login_is_waited_for(box, initiator):
+    late = f"echo '{EXISTS.strip()}'; sleep 0.3; cp /fake/targets/* /fake/sessions/"
+    box.fake("iscsiadm", re.compile("--login$"), effect=late, times=1)
+    box.fake("iscsiadm", re.compile("--log(in|out)$"))
+    connect(box)
+    assert box.tree.get(f"{ROOT}/status") == "Connected"
+
+
 def test_failures_of_the_replacement_are_logged_and_stop_nothing(box, initiator):
     box.fake("iscsiadm", re.compile("--login$"), stdout=EXISTS)
     box.fake("iscsiadm", re.compile("--logout$"), status=10)
