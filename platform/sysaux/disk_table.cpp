@@ -72,7 +72,8 @@ class Table {
   bool ready() const { return ready_; }
   fdisk_context* context() const { return context_; }
 
-  // Errors that a write into the page cache did not see come with the sync.
+  // Errors that a write into the page cache did not see come with the sync; libfdisk does not sync a DOS
+  // table.
   bool write() { return fdisk_write_disklabel(context_) == 0 && fsync(device_) == 0; }
 
   long long to_kernel_units(fdisk_sector_t sectors) const {
@@ -158,7 +159,6 @@ bool write_new_table(const char* path, Extent* extent) {
     fdisk_unref_partition(only);
     return false;
   }
-  fdisk_enable_wipe(table.context(), 1);  // what is left of an empty table of another kind
   return fdisk_create_disklabel(table.context(), "gpt") == 0 && add_whole_disk_partition(table, extent) &&
          table.write();
 }

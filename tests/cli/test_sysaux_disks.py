@@ -3,6 +3,8 @@
 import os
 import pathlib
 import subprocess
+import time
+import zlib
 
 import pytest
 from harness.sysaux import (
@@ -243,6 +245,95 @@ def test_a_locked_disk_is_waited_for(loop):
             assert disk.partitions() == {}
             holder.stdin.close()
             assert creator.communicate(timeout=20)[0] == b"0\n"
+    assert len(disk.partitions()) == 1
+
+
+def test_a_bad_spot_in_the_first_mebibyte_is_enough_to_refuse(loop):
+    """Where no signature is looked for, too."""
+    disk = loop()
+    assert under_fault("create", disk.node, disk.node, "pread64", "error=EIO", "12+") == (0, ["-1"])
+    assert disk.partitions() == {} and disk.digest() == loop().digest()
+
+
+def test_an_entry_that_recognition_takes_for_invalid_is_kept(loop):
+    """libblkid passes over an entry beyond the usable sectors; libfdisk lists it."""
+    disk = loop()
+    disk.sfdisk(ONE_LINUX.format("gpt"))
+    for header_at in (512, 64 * MIB - 512):
+        header = bytearray(read_at(disk, header_at, 512))
+        header[48:56] = (20000).to_bytes(8, "little")  # the last usable sector
+        header[16:20] = bytes(4)
+        header[16:20] = zlib.crc32(header[:92]).to_bytes(4, "little")
+        disk.write(header_at, header)
+    assert "start=        2048, size=       40960" in run("sfdisk", "-d", disk.node)
+    assert call("partition_list", disk.node) == 0
+    refused(disk)
+
+
+def read_at(disk, offset, size):
+    with open(disk.node, "rb", buffering=0) as device:
+        device.seek(offset)
+        return device.read(size)
+
+
+@pytest.mark.parametrize("label", ["dos", "gpt"])
+def test_no_failing_sync_is_overlooked(loop, label):
+    """But for the last, which libfdisk makes when it lets go of the disk: all is on the disk by then."""
+    disk = loop()
+    disk.sfdisk(ONE_LINUX.format(label))
+    assert call("partition_list", disk.node) == (1, f"{disk.name}p1")
+    head = read_at(disk, 0, MIB)
+    total = len(calls_of("expand", disk.node, disk.node, "fsync"))
+    assert total > 1
+    for when in range(1, total):
+        disk.forget()
+        disk.wipe_ends()
+        disk.write(0, head)
+        assert call("partition_list", disk.node) == (1, f"{disk.name}p1")
+        assert under_fault("expand", disk.node, disk.node, "fsync", "error=EIO", f"{when}+") == (0, ["-1"]), when
+        assert disk.partitions() == {1: (2048, 40960)}
+
+
+# --- the node in /dev ---
+
+
+def in_a_bare_dev(disk, script):
+    """Runs a script where /dev has nothing but a few harmless nodes; $1 is sysaux_call, $2 the disk's name and $3 its number."""
+    number = os.stat(disk.node).st_rdev
+    return run(
+        "unshare", "--mount", "sh", "-ec",
+        "mount -t tmpfs tmpfs /dev; mknod /dev/null c 1 3; mknod /dev/urandom c 1 9\n" + script,
+        "sh", CALL, disk.name, f"{os.major(number)} {os.minor(number)}",
+    )
+
+
+def test_a_node_that_comes_late_is_waited_for(loop):
+    disk = loop()
+    out = in_a_bare_dev(disk, """
+        mknod /dev/$2 b $3
+        (while ! numbers=$(cat /sys/class/block/$2p1/dev 2>/dev/null); do sleep 0.01; done
+         sleep 0.5; mknod /dev/$2p1 b ${numbers%:*} ${numbers#*:}) &
+        $1 create /dev/$2
+        test -b /dev/$2p1 && echo there
+        wait
+        """)
+    assert out == "0\nthere\n"
+
+
+def test_a_node_that_never_comes_is_waited_for_5_seconds(loop):
+    disk = loop()
+    begun = time.monotonic()
+    assert in_a_bare_dev(disk, "mknod /dev/$2 b $3; $1 create /dev/$2") == "0\n"
+    assert 5 <= time.monotonic() - begun < 8
+    assert len(disk.partitions()) == 1
+
+
+def test_a_dev_that_nobody_fills_is_not_waited_for(loop):
+    """The disk goes by a name of the caller's own there."""
+    disk = loop()
+    begun = time.monotonic()
+    assert in_a_bare_dev(disk, "mknod /dev/sdb b $3; $1 create /dev/sdb") == "0\n"
+    assert time.monotonic() - begun < 4
     assert len(disk.partitions()) == 1
 
 

@@ -99,6 +99,13 @@ def test_a_device_that_does_not_read_at_its_start_is_not_usable(loop):
     assert call("check_dev", disk.node) == -1
 
 
+def test_what_was_read_before_does_not_make_a_device_usable(loop):
+    disk = loop()
+    assert call("check_dev", disk.node) == 0  # the pages stay: the test holds the device open
+    disk.resize(MIB - 4096)
+    assert call("check_dev", disk.node) == -1
+
+
 def test_a_device_is_usable_from_one_mebibyte_on(loop):
     assert call("check_dev", loop(MIB).node) == 0
     assert call("check_dev", loop(MIB - 512).node) == -1
