@@ -7,7 +7,19 @@ import pytest
 sys.path.insert(0, str(pathlib.Path(__file__).parent))
 
 from appliance import Site  # noqa: E402
-from harness import Box  # noqa: E402
+from harness import Box, build_folder  # noqa: E402
+
+
+def pytest_configure(config):
+    config.addinivalue_line("markers", "unsanitized: says nothing about a build with sanitizers, and is left out there")
+
+
+def pytest_collection_modifyitems(config, items):
+    if "REMVOL_SANITIZE:STRING=\n" in build_folder().joinpath("CMakeCache.txt").read_text():
+        return
+    left_out = [item for item in items if item.get_closest_marker("unsanitized")]
+    config.hook.pytest_deselected(items=left_out)
+    items[:] = [item for item in items if item not in left_out]
 
 
 @pytest.fixture

@@ -142,7 +142,7 @@ def test_killing_the_whole_group_closes_the_flash(flash):
     running.kill(signal.SIGKILL)
     running.wait()
     flash.wait_read_only()
-    assert not flash.commands("sleep")
+    flash.box.wait_until(lambda: not flash.commands("sleep"), what="the end of the command")
 
 
 def test_a_killed_guard_is_replaced_by_flashrun(flash):

@@ -75,12 +75,13 @@ The log, in order:
 The tool's own log: messages(done.stdout) gives (file, function, text) of every line of the diagnostic log,
 said(done.stdout) the texts alone; box.debug(2) sets the debug level first.
 
-At its end a test fails for calls without an answer and for reports of the sanitizers. A program that outlives
+At its end a test fails for calls without an answer and for reports of the sanitizers (box.leaks_unchecked() when it
+takes /proc away, which the leak check needs; a test marked `unsanitized` is left out of sanitized builds). A program that outlives
 its time limit (20 s) is killed and raises.
 """
 
 from .log_lines import messages, said
 from .result import Call, Result, startswith
-from .world import Box
+from .world import Box, build_folder
 
-__all__ = ["Box", "Call", "Result", "messages", "said", "startswith"]
+__all__ = ["Box", "Call", "Result", "build_folder", "messages", "said", "startswith"]

@@ -74,6 +74,7 @@ class Box:
         self.disks = []
         self.environment = {}
         self.allowed_unscripted = False
+        self.check_leaks = True
         self._open()
         self.root = pathlib.Path(f"/proc/{self.pid}/root")
         self._prepare_fakes()
@@ -150,7 +151,7 @@ class Box:
             "PATH": f"/fake/bin:{self.build}/bin:{SYSTEM_PATH}",
             "HOME": "/root",
             "LD_PRELOAD": str(self.tools / "libpreload.so"),
-            "ASAN_OPTIONS": f"verify_asan_link_order=0:{sanitizers}",
+            "ASAN_OPTIONS": f"verify_asan_link_order=0:detect_leaks={int(self.check_leaks)}:{sanitizers}",
             "UBSAN_OPTIONS": f"print_stacktrace=1:{sanitizers}",
             **self.environment,
             **(extra or {}),
@@ -265,6 +266,9 @@ class Box:
 
     def unscripted_ok(self):
         self.allowed_unscripted = True
+
+    def leaks_unchecked(self):
+        self.check_leaks = False
 
     def sleep_takes(self, milliseconds):
         self.environment["FAKE_SLEEP_MS"] = str(milliseconds)
