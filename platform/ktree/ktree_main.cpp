@@ -1,6 +1,5 @@
 // ktree: the daemon of the configuration tree.
 
-#include <fcntl.h>
 #include <getopt.h>
 #include <sys/resource.h>
 #include <sys/signalfd.h>
@@ -17,6 +16,7 @@
 
 #include "ktree/endpoint.h"
 #include "ktree/server.h"
+#include "ktree/standard_descriptors.h"
 
 namespace {
 
@@ -70,16 +70,6 @@ int parse_options(int argc, char** argv, Options& options) {
   return -1;
 }
 
-// What the starting process left open is not the daemon's: a lock file among it would stay locked for as long
-// as the daemon lives. The standard descriptors stay, or become /dev/null when there are none.
-void leave_foreign_descriptors() {
-  int fd = 0;
-  do {
-    fd = open("/dev/null", O_RDWR | O_CLOEXEC);
-  } while (fd >= 0 && fd <= STDERR_FILENO);
-  close_range(STDERR_FILENO + 1, ~0U, 0);
-}
-
 // The tree holds secrets, which no core file may carry to a disk.
 void limit_process() {
   const rlimit no_core = {0, 0};
@@ -124,13 +114,20 @@ int main(int argc, char** argv) {
   if (status >= 0) {
     return status;
   }
-  leave_foreign_descriptors();
+  // What the starting process left open is not the daemon's: a lock file would stay locked for as long as it
+  // lives. Nor is the folder that it was started in: a volume would stay busy.
+  ktree::fill_standard_descriptors();
+  close_range(STDERR_FILENO + 1, ~0U, 0);
   limit_process();
   const int signals = open_signals();
   ktree::Endpoint endpoint;
   std::string error;
   if (signals < 0 || !endpoint.open(options.socket, options.name, error)) {
     fprintf(stderr, "ktree: %s\n", error.empty() ? strerror(errno) : error.c_str());
+    return EXIT_FAILURE;
+  }
+  if (chdir("/") != 0) {
+    fprintf(stderr, "ktree: /: %s\n", strerror(errno));
     return EXIT_FAILURE;
   }
   auto server = std::make_unique<ktree::Server>(endpoint.listener(), signals, client_limit());

@@ -169,6 +169,11 @@ def test_it_keeps_no_lock_of_the_process_that_started_it(place):
         fcntl.flock(free, fcntl.LOCK_EX | fcntl.LOCK_NB)
 
 
+def test_it_does_not_stay_in_the_folder_that_it_was_started_in(place):
+    place.start(cwd=place.folder)
+    assert os.readlink(f"/proc/{place.process.pid}/cwd") == "/"
+
+
 def test_it_writes_no_core(daemon):
     assert resource.prlimit(daemon.process.pid, resource.RLIMIT_CORE) == (0, 0)
 
@@ -339,6 +344,18 @@ def test_a_full_standard_output_is_a_failure(daemon):
             done = subprocess.run([KTREEC, "-S", daemon.socket, *arguments], stdout=full, stderr=subprocess.PIPE,
                                   timeout=60)
         assert done.returncode == 1 and b"No space left on device" in done.stderr, arguments
+
+
+@pytest.mark.parametrize("arguments", ["-g /a", "-t", "-D -", "-D vv.xml"])
+def test_without_standard_descriptors_nothing_goes_astray(daemon, arguments):
+    daemon.set("/a", "x")
+    status = run("sh", "-c", f"{KTREEC} -S {daemon.socket} {arguments} <&- >&- 2>&-", cwd=daemon.folder).returncode
+    file = daemon.folder / "vv.xml"
+    if file.exists():
+        assert status == 0 and file.read_bytes() == daemon.run("-D", "-").stdout
+    else:
+        assert status == 1
+    assert daemon.listing() == ["/a=x"]
 
 
 # Dump and load

@@ -129,8 +129,17 @@ int open_socket() {
   return above;
 }
 
-// The socket's own time limits bound the connect (which waits while the daemon's backlog is full) and the
-// usual receive.
+// Connects `fd`, which waits while the daemon's backlog is full. A signal may interrupt that.
+bool connect_to(int fd, const sockaddr_un& address, const Deadline& deadline) {
+  while (connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    if (errno != EINTR || deadline.left() == 0) {
+      return false;
+    }
+  }
+  return true;
+}
+
+// The socket's own time limits bound the connect and the usual receive.
 bool connect_channel(Channel& channel, Deadline& deadline) {
   const int64_t left = deadline.left();
   const timeval limit = {left / 1000, (left % 1000) * 1000 + 1};
@@ -140,7 +149,7 @@ bool connect_channel(Channel& channel, Deadline& deadline) {
   }
   if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit) != 0 ||
       setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit) != 0 ||
-      connect(fd, reinterpret_cast<const sockaddr*>(&channel.address), sizeof channel.address) != 0) {
+      !connect_to(fd, channel.address, deadline)) {
     close(fd);
     return false;
   }

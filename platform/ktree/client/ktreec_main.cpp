@@ -8,6 +8,7 @@
 #include <cstring>
 
 #include "ktree/client/calls.h"
+#include "ktree/standard_descriptors.h"
 
 namespace {
 
@@ -173,6 +174,7 @@ bool is_one_of(const char* word, const char* one, const char* other) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  ktree::fill_standard_descriptors();
   if (argc == 2 && is_one_of(argv[1], "-h", "--help")) {
     fputs(kUsage, stdout);
     return EXIT_SUCCESS;
