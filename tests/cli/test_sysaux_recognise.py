@@ -166,10 +166,12 @@ def test_a_state_that_is_not_valid_wants_a_check(loop, state):
     assert call("check_fs_state", disk.node) != 0
 
 
-def test_a_damaged_superblock_wants_a_check(loop):
+@pytest.mark.parametrize("feature, at", [("metadata_csum", 120), ("^metadata_csum", 24)])
+def test_a_damaged_superblock_wants_a_check(loop, feature, at):
+    """The label does not fit the checksum; the block size is none."""
     disk = loop()
-    run("mke2fs", "-q", "-t", "ext4", "-O", "metadata_csum", disk.node)
-    disk.write(1024 + 120, b"DATA")
+    run("mke2fs", "-q", "-t", "ext4", "-O", feature, disk.node)
+    disk.write(1024 + at, b"DATA")
     assert call("check_fs_state", disk.node) != 0
 
 
