@@ -32,6 +32,7 @@ struct Module {
 
 Module probe_module{"libsysaux_probe.so", nullptr};
 Module disk_module{"libsysaux_disk.so", nullptr};
+Module state_module{"libsysaux_state.so", nullptr};
 
 template <typename Function>
 Function* find(Module& module, const char* symbol) {
@@ -75,7 +76,7 @@ int sys_expand_1_partition(const char* device) {
 }
 
 int sys_check_fs_state(const char* node) {
-  const auto call = find<decltype(sysaux_disk_check_fs_state)>(disk_module, "sysaux_disk_check_fs_state");
+  const auto call = find<decltype(sysaux_state_check_fs_state)>(state_module, "sysaux_state_check_fs_state");
   return call != nullptr ? call(node) : 0;
 }
 

@@ -13,11 +13,12 @@ extern "C" {
 SYSAUX_EXPORT int sysaux_probe_fs_type(char* out, const char* node);
 SYSAUX_EXPORT int sysaux_probe_partition_list(char* out, const char* device);
 
-// libsysaux_disk.so: changes partition tables, by libfdisk, and reads the state of a file system, by
-// libext2fs.
+// libsysaux_disk.so: changes partition tables, by libfdisk.
 SYSAUX_EXPORT int sysaux_disk_create_1_partition(const char* device);
 SYSAUX_EXPORT int sysaux_disk_expand_1_partition(const char* device);
-SYSAUX_EXPORT int sysaux_disk_check_fs_state(const char* node);
+
+// libsysaux_state.so: reads the state of a file system, by libext2fs.
+SYSAUX_EXPORT int sysaux_state_check_fs_state(const char* node);
 
 }  // extern "C"
 

@@ -4,6 +4,7 @@
 #include <stdio.h>
 #include <string.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include "block.h"
 #include "content.h"
@@ -60,6 +61,15 @@ int list_unread_table(const char* device, int block_dir, NameList* names) {
   return count;
 }
 
+// Has the disk read at once what the recognition then takes in some thirty pieces, a round trip each: it
+// looks at the start and, for RAID, at the end.
+void read_ahead(int device) {
+  constexpr off_t kTail = 192 << 10;
+  const off_t end = lseek(device, 0, SEEK_END);
+  posix_fadvise(device, 0, kFirstMebibyte, POSIX_FADV_WILLNEED);
+  if (end > kTail) posix_fadvise(device, end - kTail, kTail, POSIX_FADV_WILLNEED);
+}
+
 }  // namespace
 
 int sysaux_probe_fs_type(char* out, const char* node) {
@@ -68,6 +78,7 @@ int sysaux_probe_fs_type(char* out, const char* node) {
   if (node == nullptr || stat(node, &info) != 0 || !S_ISBLK(info.st_mode)) return -1;
   const Fd device(open(node, O_RDONLY | O_CLOEXEC));
   if (!device.ok()) return -1;
+  read_ahead(device.get());
   const Content content = recognise(device.get(), out);
   if (content == Content::nothing) return 1;
   if (content != Content::unreadable) return 0;
