@@ -1,5 +1,6 @@
 #include "volume/mount.h"
 
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -45,13 +46,38 @@ constexpr MountCommand kMountCommands[] = {
     {"xfs", "mount -t xfs -o rw,attr2"},
 };
 
+// A device node held open.
+class HeldNode {
+ public:
+  HeldNode() = default;
+  ~HeldNode() { release(); }
+  HeldNode(const HeldNode&) = delete;
+  HeldNode& operator=(const HeldNode&) = delete;
+
+  void hold(const char* node) {
+    release();
+    fd_ = open(node, O_RDONLY | O_CLOEXEC);
+  }
+  void release() {
+    if (fd_ >= 0) close(fd_);
+    fd_ = -1;
+  }
+
+ private:
+  int fd_ = -1;
+};
+
 // What the steps of a mount hand on.
 struct Volume {
   TargetEntry* entry;
   int force_format;
   bool looks_empty;  // the format is forced only because no partition carries anything that is recognised
   PartitionList partitions;
-  Text<64> node;     // of the chosen partition, or of the last one examined
+  Text<64> node;  // of the chosen partition, or of the last one examined
+  // While a node is open the kernel keeps what was read of it, so that the looks at a file system which
+  // follow one another read the disk once. It is not open during a format, which kills whoever uses the node,
+  // nor longer than the looks, since an unmount by another run does that too.
+  HeldNode held;
   char fs_type[64];  // on the node; empty when none is known
   MountPointText mount_point;
 };
@@ -102,6 +128,7 @@ bool find_partition(Volume* volume, bool recognised) {
   char* rest = nullptr;
   for (char* name = strtok_r(names, " ,", &rest); name != nullptr; name = strtok_r(nullptr, " ,", &rest)) {
     volume->node = Text<64>("/dev/%s", name);
+    volume->held.hold(volume->node);
     if (sys_check_dev(volume->node) == 0 && (!recognised || detect_fs(volume))) return true;
   }
   return false;
@@ -125,6 +152,7 @@ bool protect_data(Volume* volume) {
 
 int create_file_system(Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 0, "Got FS type = %s, creating volume", volume->fs_type);
+  volume->held.release();
   const int result = Target_format(volume->entry, volume->node);
   if (result == 0) return kOk;
   if (result == -2 && record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
@@ -149,7 +177,9 @@ int prepare_file_system(Volume* volume, Caller caller = Caller()) {
   const int result = volume->force_format != 0 || !known ? create_file_system(volume, caller)
                                                          : keep_file_system(volume, caller);
   if (result != kOk) return result;
-  return detect_fs(volume) ? kOk : kFailed;
+  const bool found = detect_fs(volume);
+  volume->held.release();
+  return found ? kOk : kFailed;
 }
 
 int make_mount_point(Volume* volume, Caller caller = Caller()) {

@@ -7,6 +7,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <ctime>
 
 #include "frontend/log.h"
 #include "frontend/remvol_debug.h"
@@ -40,8 +41,18 @@ void wait_for_test(const char* word) {
   if (fgets(line, sizeof line, stdin) == nullptr) return;
 }
 
+long microseconds() {
+  timespec now{};
+  clock_gettime(CLOCK_MONOTONIC, &now);
+  return now.tv_sec * 1000000 + now.tv_nsec / 1000;
+}
+
 int do_mount(char** arguments) {
-  return load(arguments) ? Target_mount(&entry, number(arguments[2]), number(arguments[3])) : -999;
+  if (!load(arguments)) return -999;
+  const long began = microseconds();
+  const int result = Target_mount(&entry, number(arguments[2]), number(arguments[3]));
+  printf("took = %ld microseconds\n", microseconds() - began);
+  return result;
 }
 int do_format(char** arguments) {
   return load(arguments) ? Target_format(&entry, arguments[2]) : -999;
