@@ -1,7 +1,7 @@
 #include "support/files.h"
 
+#include <dirent.h>
 #include <fcntl.h>
-#include <ftw.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -21,8 +21,21 @@ char* last_slash(char* path) {
   return slash == path ? nullptr : slash;
 }
 
-int remove_entry(const char* path, const struct stat*, int, FTW*) {
-  return remove(path);
+constexpr int kDeepestFolder = 32;
+
+// Removes `name` in the open folder, a folder with all that is in it. Every step goes by descriptor and
+// follows no link: the owner of a planted folder may exchange what is below it meanwhile.
+void remove_at(int folder, const char* name, int depth) {
+  if (unlinkat(folder, name, 0) == 0 || depth == kDeepestFolder) return;
+  const int fd = openat(folder, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  DIR* entries = fd >= 0 ? fdopendir(fd) : nullptr;
+  if (entries == nullptr) return;
+  while (const dirent* entry = readdir(entries)) {
+    if (strcmp(entry->d_name, ".") == 0 || strcmp(entry->d_name, "..") == 0) continue;
+    remove_at(fd, entry->d_name, depth + 1);
+  }
+  closedir(entries);
+  unlinkat(folder, name, AT_REMOVEDIR);
 }
 
 }  // namespace
@@ -65,8 +78,7 @@ void clear_temp_path(const char* path) {
   struct stat found;
   if (lstat(path, &found) != 0) return;
   const bool own_file = S_ISREG(found.st_mode) && found.st_uid == geteuid() && found.st_nlink == 1;
-  constexpr int kOpenFolders = 16;
-  if (!own_file) nftw(path, remove_entry, kOpenFolders, FTW_DEPTH | FTW_PHYS);
+  if (!own_file) remove_at(AT_FDCWD, path, 0);
 }
 
 }  // namespace remvol

@@ -170,6 +170,9 @@ TEST_F(Files, ATemporaryPathIsClearedOfWhatIsNotOurs) {
   std::filesystem::create_symlink(at("victim"), at("link"));
   std::filesystem::create_hard_link(at("victim"), at("hard"));
   std::filesystem::create_directories(at("tree/below"));
+  std::filesystem::create_directories(at("outside"));
+  std::ofstream(at("outside/file")) << "kept";
+  std::filesystem::create_directory_symlink(at("outside"), at("tree/below/link"));
   ASSERT_EQ(mkfifo(at("fifo").c_str(), 0600), 0);
   std::ofstream(at("own")) << "kept";
   for (const char* name : {"link", "hard", "tree", "fifo", "own", "absent"})
@@ -179,6 +182,7 @@ TEST_F(Files, ATemporaryPathIsClearedOfWhatIsNotOurs) {
   }
   EXPECT_EQ(std::filesystem::file_size(at("victim")), 4U);
   EXPECT_EQ(std::filesystem::file_size(at("own")), 4U);
+  EXPECT_EQ(std::filesystem::file_size(at("outside/file")), 4U);
 }
 
 TEST_F(Files, ATemporaryFileOfAnotherUserIsCleared) {
