@@ -57,18 +57,18 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
 }
 
 // Stores the requested target and LUN. Returns 0 with both slots, or -1.
-int _store_requested_lun(int* dbidx, int* lun_dbidx) {
+int _store_requested_lun(int* dbidx, int* lun_dbidx, Caller caller = Caller()) {
   TargetEntry* const entry = &request_target;
   *dbidx = ktree_add_entry(entry);
   if (*dbidx <= 0) return kFailed;
   if (ktree_get_dbidx_by_lun(*dbidx, entry->lun) > 0) return kFailed;
   if (ktree_check_duplicate_share_name(entry->share) != 0) {
-    LOG(0, "share name %s has benn used", entry->share);
+    LOG_AT(caller, 0, "share name %s has benn used", entry->share);
     return kFailed;
   }
   *lun_dbidx = ktree_add_lun_entry(entry);
   if (*lun_dbidx <= 0) {
-    LOG(0, "can not add target %s with lun %d", entry->target_name, entry->lun);
+    LOG_AT(caller, 0, "can not add target %s with lun %d", entry->target_name, entry->lun);
     return kFailed;
   }
   return kOk;

@@ -58,14 +58,14 @@ int _mount_enabled_luns(TargetEntry* entry, int dbidx) {
 }
 
 // Finds the disks of a target that was just logged in, and mounts them. Returns the command's result.
-int _present_volumes(TargetEntry* entry) {
+int _present_volumes(TargetEntry* entry, Caller caller = Caller()) {
   const int found = ktree_update_dev(entry);
   if (found == kTreeFailed) {
-    LOG(0, "ktree failed, exit...");
+    LOG_AT(caller, 0, "ktree failed, exit...");
     return kOk;  // the session stays, and so does the user's wish
   }
   if (found != kOk) {
-    give_up_session(entry, found, kVolumeFailed, Caller());
+    give_up_session(entry, found, kVolumeFailed, caller);
     return kFailed;
   }
   sleep(kSettleSeconds);
@@ -75,12 +75,12 @@ int _present_volumes(TargetEntry* entry) {
   return result;
 }
 
-int _disconnect_all() {
+int _disconnect_all(Caller caller = Caller()) {
   Target_umount_all();
-  LOG(1, "update share folder status");
+  LOG_AT(caller, 1, "update share folder status");
   reload_share_services();
-  LOG(1, "finish share folder status");
-  return run_command("iscsiadm -m node -u") == 0 ? kOk : 1;
+  LOG_AT(caller, 1, "finish share folder status");
+  return run_command("iscsiadm -m node -u", caller) == 0 ? kOk : 1;
 }
 
 int _disconnect_requested() {

@@ -22,15 +22,15 @@ namespace {
 
 // Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry or no device; 1
 // unknown target or LUN.
-int _read_lun_to_format(TargetEntry* entry) {
+int _read_lun_to_format(TargetEntry* entry, Caller caller = Caller()) {
   if (request_target.target_name[0] == '\0' || request_target.lun < 0) return kFailed;
   int dbidx = 0;
   int lun_dbidx = 0;
-  const int found = find_requested_lun(&dbidx, &lun_dbidx);
+  const int found = find_requested_lun(&dbidx, &lun_dbidx, caller);
   if (found != kOk) return found;
-  if (read_requested_lun(entry, dbidx, lun_dbidx) != kOk) return kFailed;
+  if (read_requested_lun(entry, dbidx, lun_dbidx, caller) != kOk) return kFailed;
   if (entry->dev[0] == '\0') {
-    LOG(2, "Can not get device");
+    LOG_AT(caller, 2, "Can not get device");
     return kFailed;
   }
   return kOk;
@@ -38,13 +38,13 @@ int _read_lun_to_format(TargetEntry* entry) {
 
 // Formats and mounts the LUN anew, with its FTP share taken down meanwhile. Returns -1 when the mount table
 // cannot be read, else the result of the mount.
-int _remake_volume(TargetEntry* entry) {
+int _remake_volume(TargetEntry* entry, Caller caller = Caller()) {
   ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0);
   ktree_update_lun_status(entry, 1);
   ktree_update_volume_state(entry, kVolumeCreating);
 
   FtpPath ftp_path;
-  if (take_ftp_share_down(entry, ftp_path) != kOk) {
+  if (take_ftp_share_down(entry, ftp_path, caller) != kOk) {
     ktree_update_volume_state(entry, kVolumeNormal);
     return kFailed;
   }
@@ -54,7 +54,7 @@ int _remake_volume(TargetEntry* entry) {
     ktree_update_volume_state(entry, kVolumeFailed);
   }
   if (ftp_path[0] != '\0') {
-    LOG(1, "mount_ftp : FTP SHARE PATH = %s", ftp_path);
+    LOG_AT(caller, 1, "mount_ftp : FTP SHARE PATH = %s", ftp_path);
     Target_remount_ftp(entry, ftp_path);
   }
   ktree_update_lun_status(entry, 0);
@@ -72,9 +72,9 @@ void _store_chap(TargetEntry* entry) {
 
 // Logs the target in with its new settings and mounts its volumes. A failure is stored, not returned: the
 // settings are to be kept either way.
-void _reconnect(TargetEntry* entry, int conn_set) {
+void _reconnect(TargetEntry* entry, int conn_set, Caller caller = Caller()) {
   if (Target_Connect(entry) != kOk) {
-    LOG(0, "Reconnect failed , target name = %s", entry->target_name);
+    LOG_AT(caller, 0, "Reconnect failed , target name = %s", entry->target_name);
     entry->conn_set = 0;
     ktree_record_connect_set(entry);
     ktree_set_connect_state(entry->db_idx, kConnectError);

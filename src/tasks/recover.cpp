@@ -51,34 +51,34 @@ bool _is_formatting(const TargetEntry* lun) {
   return _is_running(check_mkfs_process_existing);
 }
 
-void _log_busy(const TargetEntry* lun, const char* work) {
-  LOG(1, "One of target:%s 's LUN is %s", lun->target_name, work);
-  LOG(1, "Skip it now, and kick it back to recover queue");
+void _log_busy(const TargetEntry* lun, const char* work, Caller caller) {
+  LOG_AT(caller, 1, "One of target:%s 's LUN is %s", lun->target_name, work);
+  LOG_AT(caller, 1, "Skip it now, and kick it back to recover queue");
 }
 
-void _check_lun(const TargetEntry* lun, TargetHealth* health) {
+void _check_lun(const TargetEntry* lun, TargetHealth* health, Caller caller) {
   const char* device = lun->dev[0] != '\0' ? lun->dev : lun->mnt_dev;
   const int degraded = check_mnt_dev_degrade_to_ro(device, lun->mnt);
   if (degraded == 1 || degraded == -1) {
-    LOG(1, "dev %s access right is degraded to ro", device);
+    LOG_AT(caller, 1, "dev %s access right is degraded to ro", device);
     health->degraded = true;
   }
   if (_is_formatting(lun)) {
-    _log_busy(lun, "formatting or waitting for format");
+    _log_busy(lun, "formatting or waitting for format", caller);
     health->busy = true;
   }
   if (_is_running([device] { return check_resizing_fs(device); })) {
-    _log_busy(lun, "resizing");
+    _log_busy(lun, "resizing", caller);
     health->busy = true;
   }
 }
 
-TargetHealth _check_luns(int dbidx) {
+TargetHealth _check_luns(int dbidx, Caller caller) {
   TargetHealth health;
   TargetEntry lun;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
     if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) break;
-    _check_lun(&lun, &health);
+    _check_lun(&lun, &health, caller);
   }
   return health;
 }
@@ -91,27 +91,28 @@ void _keep_volumes(TargetEntry* entry) {
 }
 
 // Starts a run in the background that comes back for the target after a while.
-void _postpone(const TargetEntry* entry) {
+void _postpone(const TargetEntry* entry, Caller caller) {
   run_command(CommandText("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds,
-                          entry->target_name));
+                          entry->target_name),
+              caller);
 }
 
 // Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one
 // ends the walk.
-void _unmount_luns(int dbidx) {
+void _unmount_luns(int dbidx, Caller caller) {
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
     if (!tree_present(KeyText(key::kLunNumber, dbidx, slot))) break;
     TargetEntry lun;
     if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) continue;
     FtpPath ftp_path;
-    take_ftp_share_down(&lun, ftp_path);
+    take_ftp_share_down(&lun, ftp_path, caller);
     Target_LUN_umount(&lun);
   }
 }
 
 // Unmounts everything, logs out and connects the target again. Returns the result of the connection.
-int _rebuild(TargetEntry* entry) {
-  _unmount_luns(entry->db_idx);
+int _rebuild(TargetEntry* entry, Caller caller) {
+  _unmount_luns(entry->db_idx, caller);
   Target_Logout(entry);
   entry->conn_set = 1;
   ktree_set_connect_state(entry->db_idx, kConnecting);
@@ -125,24 +126,24 @@ int _rebuild(TargetEntry* entry) {
 }
 
 // Recovers the target named in the request record. Returns its result.
-int _recover_requested_target() {
+int _recover_requested_target(Caller caller) {
   const char* name = request_target.target_name;
-  LOG(1, "==> Processing - %s", name);
+  LOG_AT(caller, 1, "==> Processing - %s", name);
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
-    LOG(1, "Can not find: %s", name);
+    LOG_AT(caller, 1, "Can not find: %s", name);
     return kNotStored;
   }
   int state = kDisconnected;
   ktree_get_connect_state(entry.db_idx, &state);
   if (entry.conn_set == 0 || state != kRecovering) {
-    LOG(1, "This target %s has not been set to connect", name);
+    LOG_AT(caller, 1, "This target %s has not been set to connect", name);
     return kOk;
   }
-  const TargetHealth health = _check_luns(entry.db_idx);
-  if (health.degraded && !health.busy) return _rebuild(&entry);
+  const TargetHealth health = _check_luns(entry.db_idx, caller);
+  if (health.degraded && !health.busy) return _rebuild(&entry, caller);
   if (health.degraded) {
-    _postpone(&entry);
+    _postpone(&entry, caller);
   } else {
     _keep_volumes(&entry);
   }
@@ -150,10 +151,10 @@ int _recover_requested_target() {
 }
 
 // Recovers the requested target and then whatever is queued. Returns the result of the last one.
-int _drain_queue() {
+int _drain_queue(Caller caller = Caller()) {
   int result = kOk;
   do {
-    result = _recover_requested_target();
+    result = _recover_requested_target(caller);
     request_target = TargetEntry{};
   } while (ktree_pop_recover_queue(request_target.target_name) == kOk &&
            request_target.target_name[0] != '\0');
@@ -161,12 +162,12 @@ int _drain_queue() {
 }
 
 // Leaves the requested target to the run that is recovering. Returns 0, -1 or -103.
-int _queue_requested_target() {
+int _queue_requested_target(Caller caller = Caller()) {
   const char* name = request_target.target_name;
-  LOG(1, "==> insert queue - %s", name);
+  LOG_AT(caller, 1, "==> insert queue - %s", name);
   const int lock = wait_flock(kRecoverQueueLock, kQueueLockRetries, kQueueLockWaitUs);
   if (lock < 0) {
-    LOG(0, "lock failed for %s, skip and exit", name);
+    LOG_AT(caller, 0, "lock failed for %s, skip and exit", name);
     return kFailed;
   }
   const int result = ktree_insert_recover_queue(name);

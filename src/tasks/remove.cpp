@@ -26,16 +26,16 @@ int reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
 }
 
 // Deletes a slot; the tree moves the slots behind it down. Returns 0 or kNotDeleted.
-int _delete_slot(const char* key) {
+int _delete_slot(const char* key, Caller caller) {
   for (int tries = 0; tries < kDeleteTries; tries++) {
     if (tree_delete(key) == kOk) return kOk;
-    LOG(0, "ktreec_del() of path '%s' failed", key);
+    LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", key);
   }
   return kNotDeleted;
 }
 
 // Removes the target in `entry`, volumes, session and node record first. Returns 0 or kNotDeleted.
-int _remove_target(TargetEntry* entry) {
+int _remove_target(TargetEntry* entry, Caller caller = Caller()) {
   TargetEntry lun;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
     if (ktree_get_lun_entry_by_dbidx(&lun, entry->db_idx, slot) != kOk) break;
@@ -43,16 +43,16 @@ int _remove_target(TargetEntry* entry) {
   }
   Target_Disconnect(entry);
   _target_record_delete(entry);
-  return _delete_slot(KeyText(key::kTarget, entry->db_idx));
+  return _delete_slot(KeyText(key::kTarget, entry->db_idx), caller);
 }
 
 // Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
-int _remove_lun(int dbidx, int lun_dbidx) {
+int _remove_lun(int dbidx, int lun_dbidx, Caller caller = Caller()) {
   TargetEntry lun;
-  if (read_requested_lun(&lun, dbidx, lun_dbidx) != kOk) return kFailed;
+  if (read_requested_lun(&lun, dbidx, lun_dbidx, caller) != kOk) return kFailed;
   reload_lun_share(&lun);
   Target_LUN_umount(&lun);
-  return _delete_slot(KeyText(key::kLun, dbidx, lun_dbidx));
+  return _delete_slot(KeyText(key::kLun, dbidx, lun_dbidx), caller);
 }
 
 }  // namespace

@@ -29,16 +29,16 @@ void _refresh_luns(TargetEntry* entry, int dbidx) {
 }
 
 // Refreshes the target called `name` at `dbidx`. Returns 0, also when it had to be skipped, or -103.
-int _refresh_target(const char* name, int dbidx) {
+int _refresh_target(const char* name, int dbidx, Caller caller) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) return kOk;
   const int found = ktree_update_dev(&entry);
   if (found == kListingFailed) {
-    LOG(2, "iscsiadm -m session failed. Skip this target.");
+    LOG_AT(caller, 2, "iscsiadm -m session failed. Skip this target.");
     return kOk;
   }
   if (found == kTreeFailed) {
-    LOG(0, "set value to ktree failed. Exit.");
+    LOG_AT(caller, 0, "set value to ktree failed. Exit.");
     return kTreeFailed;
   }
   ktree_update_status(&entry);
@@ -49,25 +49,25 @@ int _refresh_target(const char* name, int dbidx) {
 // Refreshes the targets and deletes slots without a name, garbage of an interrupted add or delete. The slot
 // that moves into a deleted one's place is visited next; no more slots are visited than were counted. Returns
 // 0 or -103.
-int _refresh_targets(int count) {
+int _refresh_targets(int count, Caller caller = Caller()) {
   int slot = 1;
   for (int visited = 0; visited < count; visited++) {
     char name[sizeof TargetEntry::target_name];
     if (tree_read(KeyText(key::kTargetName, slot), name)) {
-      if (_refresh_target(name, slot) != kOk) return kTreeFailed;
+      if (_refresh_target(name, slot, caller) != kOk) return kTreeFailed;
       slot++;
       continue;
     }
     const KeyText path(key::kTarget, slot);
     if (tree_delete(path) == kOk) continue;
-    LOG(0, "ktreec_del() of path '%s' failed", path.c_str());
+    LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", path.c_str());
     slot++;
   }
   return kOk;
 }
 
 // Deletes the nameless slots behind the counted ones, up to the first without a status.
-void _prune_slots_behind(int count) {
+void _prune_slots_behind(int count, Caller caller = Caller()) {
   int slot = count + 1;
   for (int visited = count; visited < kMaxTargets; visited++) {
     if (!tree_present(KeyText(key::kTargetStatus, slot))) return;
@@ -76,7 +76,7 @@ void _prune_slots_behind(int count) {
       continue;
     }
     const KeyText path(key::kTarget, slot);
-    LOG(0, "ktreec_del() of path '%s'", path.c_str());
+    LOG_AT(caller, 0, "ktreec_del() of path '%s'", path.c_str());
     if (tree_delete(path) != kOk) slot++;
   }
 }
