@@ -54,30 +54,30 @@ int change_semaphore(int sem_id, short by) {
 // Makes the semaphore set and gives it its value. The create is not exclusive: two runs that found it missing
 // at the same moment may both set the value, and both format then. That costs memory and time, not data,
 // since they format different volumes.
-int create_format_sem(int initial) {
-  LOG(2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
+int create_format_sem(int initial, Caller caller) {
+  LOG_AT(caller, 2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
   const int sem_id = semget(kFormatSemKey, 1, IPC_CREAT | kFormatSemMode);
   if (sem_id == -1) {
-    LOG(0, "semget(..., IPC_CREATE ) failed");
+    LOG_AT(caller, 0, "semget(..., IPC_CREATE ) failed");
     return -1;
   }
   semun value{};
   value.val = initial > 0 ? initial : 1;
-  LOG(2, "try to semctl(%d,0,SETVAL, %d )", sem_id, value.val);
+  LOG_AT(caller, 2, "try to semctl(%d,0,SETVAL, %d )", sem_id, value.val);
   if (semctl(sem_id, 0, SETVAL, value) != -1) return sem_id;
-  LOG(0, "semctl() failed, errno = %d", errno);
+  LOG_AT(caller, 0, "semctl() failed, errno = %d", errno);
   semctl(sem_id, 0, IPC_RMID);
   return -1;
 }
 
 // Returns the id of the format semaphore, made when missing, or -1.
-int find_format_sem(int initial) {
+int find_format_sem(int initial, Caller caller) {
   const int sem_id = semget(kFormatSemKey, 1, kFormatSemMode);
   if (sem_id != -1) return sem_id;
   const int error = errno;
-  LOG(0, "semget(...) == -1, errno = %d", error);
-  if (error == ENOENT || error == EIDRM) return create_format_sem(initial);
-  LOG(0, "semget() failed");
+  LOG_AT(caller, 0, "semget(...) == -1, errno = %d", error);
+  if (error == ENOENT || error == EIDRM) return create_format_sem(initial, caller);
+  LOG_AT(caller, 0, "semget() failed");
   return -1;
 }
 
@@ -148,7 +148,7 @@ int unlock_flock(int fd) {
 }
 
 int format_sem_P(int* sem_id, int initial) {
-  const int found = find_format_sem(initial);
+  const int found = find_format_sem(initial, Caller());
   if (found == -1) return -1;
   *sem_id = found;
   LOG(2, "get sem_id = %d", found);

@@ -56,7 +56,7 @@ class HeldNode {
 
   void hold(const char* node) {
     release();
-    fd_ = open(node, O_RDONLY | O_CLOEXEC);
+    fd_ = open(node, O_RDONLY | O_NONBLOCK | O_CLOEXEC);  // it may be no disk but a pipe
   }
   void release() {
     if (fd_ >= 0) close(fd_);
@@ -143,11 +143,12 @@ int pick_partition(Volume* volume) {
 }
 
 // Data that nobody asked to overwrite is never formatted: what is recognised on a second look is mounted, and
-// a node that cannot be read any more is not taken for an empty one. Returns whether the node can be used.
+// what was recognised on the first is not taken for empty on the second, which only a fault can make of it.
+// Returns whether the node can be used.
 bool protect_data(Volume* volume) {
   const bool known = volume->fs_type[0] != '\0';
   if (known && volume->looks_empty) volume->force_format = 0;
-  return known || volume->force_format != 0 || sys_check_dev(volume->node) == 0;
+  return known || volume->force_format != 0;
 }
 
 int create_file_system(Volume* volume, Caller caller = Caller()) {
@@ -160,10 +161,11 @@ int create_file_system(Volume* volume, Caller caller = Caller()) {
   return kMountFormatFailed;
 }
 
-int keep_file_system(const Volume* volume, Caller caller = Caller()) {
+int keep_file_system(Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 1, "Got FS type = %s, skip creating volume", volume->fs_type);
   if (strcmp(volume->fs_type, "ext4") == 0 && sys_check_fs_state(volume->node) != 0) {
-    System("e2fsck -n -f %s", volume->node.c_str());  // a look that changes nothing
+    volume->held.release();  // the look takes its time, and another run may kill who holds the node
+    System("e2fsck -n -f %s", volume->node.c_str());  // changes nothing
   }
   const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
   return note_update(result, caller) != 0 ? kTreeFailed : kOk;
@@ -172,10 +174,10 @@ int keep_file_system(const Volume* volume, Caller caller = Caller()) {
 // Leaves the chosen partition with a known file system.
 int prepare_file_system(Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
-  const bool known = detect_fs(volume);
+  detect_fs(volume);
   if (!protect_data(volume)) return kMountNoPartition;
-  const int result = volume->force_format != 0 || !known ? create_file_system(volume, caller)
-                                                         : keep_file_system(volume, caller);
+  const int result =
+      volume->force_format != 0 ? create_file_system(volume, caller) : keep_file_system(volume, caller);
   if (result != kOk) return result;
   const bool found = detect_fs(volume);
   volume->held.release();
@@ -259,7 +261,7 @@ int record_outcome(const Volume* volume, Caller caller = Caller()) {
 
 // Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.
 int bring_up(Volume* volume, Caller caller = Caller()) {
-  int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format);
+  int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format, caller);
   if (result == kOk) result = pick_partition(volume);
   if (result == kOk) result = prepare_file_system(volume, caller);
   if (result == kOk) result = make_mount_point(volume, caller);

@@ -23,12 +23,12 @@ int list_partitions(const char* device, PartitionList& partitions) {
   return sys_get_partition_list(partitions, device);
 }
 
-bool create_partition(const TargetEntry* entry, const char* device) {
-  LOG(2, "No partitions found on %s, try to create partition...", device);
+bool create_partition(const TargetEntry* entry, const char* device, Caller caller) {
+  LOG_AT(caller, 2, "No partitions found on %s, try to create partition...", device);
   ktree_update_volume_state(entry, kVolumeCreating);
-  LOG(2, "Creating partition on %s", device);
+  LOG_AT(caller, 2, "Creating partition on %s", device);
   if (sys_create_1_partition(device) != 0) {
-    LOG(0, "Create partition FAILED");
+    LOG_AT(caller, 0, "Create partition FAILED");
     ktree_update_volume_state(entry, kVolumeFailed);
     return false;
   }
@@ -39,12 +39,12 @@ bool create_partition(const TargetEntry* entry, const char* device) {
 
 // A partition that could not be grown is used as it is; the volume state then stays "creating" until a later
 // step sets it.
-void expand_partition(const TargetEntry* entry, const char* device) {
-  LOG(2, "%s, try to expand partition...", device);
-  LOG(2, "Expanding partition on %s", device);
+void expand_partition(const TargetEntry* entry, const char* device, Caller caller) {
+  LOG_AT(caller, 2, "%s, try to expand partition...", device);
+  LOG_AT(caller, 2, "Expanding partition on %s", device);
   ktree_update_volume_state(entry, kVolumeCreating);
   if (sys_expand_1_partition(device) != 0) {
-    LOG(0, "Expand partition FAILED");
+    LOG_AT(caller, 0, "Expand partition FAILED");
     return;
   }
   ktree_update_volume_state(entry, kVolumeNormal);
@@ -53,16 +53,16 @@ void expand_partition(const TargetEntry* entry, const char* device) {
 
 // Returns false when an empty disk could not be given its partition.
 bool adjust_partitions(const TargetEntry* entry, const char* device, PartitionList& partitions,
-                       int* force_format) {
+                       int* force_format, Caller caller) {
   const int count = list_partitions(device, partitions);
   if (count == 0) {
-    if (!create_partition(entry, device)) return false;
+    if (!create_partition(entry, device, caller)) return false;
     *force_format = 1;
     list_partitions(device, partitions);
   } else if (count == 1) {
-    LOG(2, "one partition found on %s", device);
+    LOG_AT(caller, 2, "one partition found on %s", device);
     if (check_1part_disk_need_to_expand(device) == 1) {
-      expand_partition(entry, device);
+      expand_partition(entry, device, caller);
       list_partitions(device, partitions);
     }
   }
@@ -88,24 +88,25 @@ int check_1part_disk_need_to_expand(const char* device) {
   return part_size + kExpandMargin < disk_size ? 1 : 0;
 }
 
-int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format) {
+int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format,
+                       Caller caller) {
   const Text<64> device("/dev/%s", entry->dev);
   const long long disk_size = sys_get_disk_space("%s", device.c_str());
-  LOG(2, "get disk_size = %lld", disk_size);
+  LOG_AT(caller, 2, "get disk_size = %lld", disk_size);
   if (disk_size <= kUnusableDiskSize) {
-    LOG(0, "The disk size < 1MB, it might be a fake one. treat this disk as offline");
+    LOG_AT(caller, 0, "The disk size < 1MB, it might be a fake one. treat this disk as offline");
     return kMountTooSmall;
   }
-  if (!adjust_partitions(entry, device, partitions, force_format)) return kMountNoPartition;
+  if (!adjust_partitions(entry, device, partitions, force_format, caller)) return kMountNoPartition;
   if (partitions[0] == '\0') {
-    LOG(0, "Create partition FAILED");
+    LOG_AT(caller, 0, "Create partition FAILED");
     ktree_update_volume_state(entry, kVolumeFailed);
     return kMountNoPartition;
   }
   if (check_path_exist(device) != 0) {
     const int result = _create_device_node(entry->dev);
     if (result != 0) {
-      LOG(0, "create device node failed");
+      LOG_AT(caller, 0, "create device node failed");
       return result;
     }
   }

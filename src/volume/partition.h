@@ -2,6 +2,7 @@
 #ifndef REMVOL_VOLUME_PARTITION_H
 #define REMVOL_VOLUME_PARTITION_H
 
+#include "frontend/log.h"
 #include "tree/record.h"
 
 namespace remvol {
@@ -17,7 +18,8 @@ int check_1part_disk_need_to_expand(const char* device);
 // partition that falls well short of the disk's end is grown, several are left as they are. Lists the
 // partitions and makes the disk's node when missing. Keeps the volume state meanwhile. Returns 0,
 // kMountTooSmall, kMountNoPartition, or -1 when the node could not be made.
-int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format);
+int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format,
+                       Caller caller = Caller());
 
 }  // namespace remvol
 
