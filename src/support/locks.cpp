@@ -113,7 +113,11 @@ int unlock_recover_cri_flock(int fd) {
 }
 
 int wait_flock(const char* path, int max_retries, int max_wait_us) {
-  srand(static_cast<unsigned>(time(nullptr)));
+  // Of the current time the part that differs between runs which one event started in the same second: with
+  // the same waits they would meet again at every try.
+  timespec now;
+  clock_gettime(CLOCK_REALTIME, &now);
+  srand(static_cast<unsigned>(now.tv_nsec));
   if (max_retries < 0) max_retries = 0;
   if (max_wait_us < 0) max_wait_us = 0;
   const int fd = open_lock_file(path);

@@ -186,7 +186,6 @@ class TestDegradedVolumes:
     def test_a_mount_table_that_cannot_be_read_any_more(self, lost, box):
         degrade(box, "b")
         lost.debug(2)
-        box.leaks_unchecked()
         box.hook("popen", "ps -w | grep resize2fs | grep -v 'grep'", through=True, skip=3, times=1,
                  effect="mount -t tmpfs none /proc")
         said = messages(recover(box))
@@ -413,6 +412,18 @@ class TestQueue:
         assert box.tree.get(QUEUE % 1) is None
         waits = box.trace("usleep")
         assert len(waits) == 4 and all(int(line.split()[1]) < 100000 for line in waits)
+
+    def test_runs_of_the_same_second_do_not_wait_alike(self, lost, box):
+        holders = [self.hold(box, path) for path in (RECOVER_LOCK, QUEUE_LOCK)]
+        waits = []
+        for _ in range(3):
+            box.forget()
+            recover(box)
+            waits.append(tuple(box.trace("usleep")))
+        for holder in holders:
+            holder.kill()
+            holder.wait()
+        assert len(set(waits)) == 3
 
     def test_a_full_queue(self, lost, box):
         self.queue(box, *(f"iqn.q{n}" for n in range(100)))
