@@ -14,7 +14,6 @@ int take_ftp_share_down(const TargetEntry* entry, FtpPath& path, Caller caller) 
       LOG_AT(caller, 2, "Can not read /proc/mounts");
       return kMountTableUnreadable;
     case kNoFtpShare:
-      memset(path, 0, sizeof path);
       LOG_AT(caller, 2, "Can not find ftp share folder");
       return kOk;
     default:
