@@ -192,6 +192,38 @@ tree_set() { ktreec -S "$TREE_SOCKET" -s "$1" "$2"; }
 # result COMMAND: what the last run of remvol --COMMAND left in the tree.
 result() { tree_get "/result/$1"; }
 
+# works OPTION...: runs remvol, which must succeed and say so in the tree. What it prints is in /tmp/remvol.out.
+works() { expect_result 0 0 "$@"; }
+
+# refuses OPTION...: the same for a command that must fail.
+refuses() { expect_result 255 -1 "$@"; }
+
+expect_result() {
+    wanted=$1 outcome=$2
+    shift 2
+    status=0
+    remvol "$@" >/tmp/remvol.out 2>&1 || status=$?
+    if [ "$status" != "$wanted" ]; then
+        cat /tmp/remvol.out
+        fail "remvol $* gave status $status instead of $wanted"
+    fi
+    expect_equal "the result of $1" "$outcome" "$(result "${1#--}")"
+}
+
+# settings: every value of the tree but the results of commands.
+settings() { ktreec -S "$TREE_SOCKET" -t | grep -v '^/result/'; }
+
+# target_key SLOT KEY, lun_key SLOT LUNSLOT KEY: what the tree holds of a target or a LUN.
+target_key() { tree_get "/iscsi/initiator/id:$1/$2"; }
+
+lun_key() { target_key "$1" "lun/id:$2/$3"; }
+
+# mounted SHARE: the volume is mounted.
+mounted() { grep -q " /mnt/VV/$1 " /proc/mounts; }
+
+# logged_in TARGETNAME: the target has a session.
+logged_in() { grep -qsx "$1" /sys/class/iscsi_session/session*/targetname; }
+
 # disk_of TARGETNAME LUN: the kernel name of a LUN's disk, such as sdb.
 disk_of() {
     for session in /sys/class/iscsi_session/session*; do
