@@ -186,6 +186,7 @@ class TestDegradedVolumes:
     def test_a_mount_table_that_cannot_be_read_any_more(self, lost, box):
         degrade(box, "b")
         lost.debug(2)
+        box.leaks_unchecked()
         box.hook("popen", "ps -w | grep resize2fs | grep -v 'grep'", through=True, skip=3, times=1,
                  effect="mount -t tmpfs none /proc")
         said = messages(recover(box))
