@@ -1,6 +1,5 @@
 #include "utf8.h"
 
-#include <limits.h>
 #include <locale.h>
 
 #include <cstdio>
@@ -10,21 +9,39 @@
 namespace platform {
 namespace {
 
+// What the characters are is known from this locale. A small system may lack it; only ASCII is known then.
 locale_t utf8_locale() {
   static const locale_t locale = newlocale(LC_CTYPE_MASK, "C.UTF-8", nullptr);
   return locale;
 }
 
-class Utf8Scope {
- public:
-  Utf8Scope() : before_(uselocale(utf8_locale())) {}
-  ~Utf8Scope() { uselocale(before_); }
-  Utf8Scope(const Utf8Scope&) = delete;
-  Utf8Scope& operator=(const Utf8Scope&) = delete;
+// How a character begins that takes N bytes: its first byte, the bits of it that tell so, the smallest
+// character that needs N bytes.
+constexpr struct {
+  unsigned char first, mask;
+  wchar_t smallest;
+} kForms[] = {{0x00, 0x80, 0}, {0xc0, 0xe0, 0x80}, {0xe0, 0xf0, 0x800}, {0xf0, 0xf8, 0x10000}};
 
- private:
-  locale_t before_;
-};
+bool is_character(wchar_t character) {
+  return character < 0xd800 || (character > 0xdfff && character <= 0x10ffff);
+}
+
+// Reads the character at the front of `text`. Returns the bytes that it takes, 0 when there is none.
+size_t first_character(std::string_view text, wchar_t& character) {
+  const auto first = static_cast<unsigned char>(text.front());
+  for (size_t size = 1; size <= std::size(kForms); ++size) {
+    const auto& form = kForms[size - 1];
+    if ((first & form.mask) != form.first) continue;
+    if (text.size() < size) return 0;
+    character = first & ~form.mask;
+    for (const char next : text.substr(1, size - 1)) {
+      if ((next & 0xc0) != 0x80) return 0;
+      character = (character << 6) | (next & 0x3f);
+    }
+    return character >= form.smallest && is_character(character) ? size : 0;
+  }
+  return 0;
+}
 
 void append_escaped(std::string& text, std::string_view bytes) {
   for (const char byte : bytes) {
@@ -34,21 +51,25 @@ void append_escaped(std::string& text, std::string_view bytes) {
   }
 }
 
-bool is_plain(char byte) {
-  return byte >= 0x20 && byte < 0x7f;
+bool is_plain(std::string_view bytes, wchar_t character, bool utf8) {
+  return !bytes.empty() && !is_control(character) && (utf8 || bytes.size() == 1);
 }
 
 }  // namespace
 
 bool decode(std::string_view text, std::wstring& characters) {
-  const Utf8Scope scope;
-  characters.resize(text.size());
-  const char* next = text.data();
-  mbstate_t state{};
-  const size_t count = mbsnrtowcs(characters.data(), &next, text.size(), characters.size(), &state);
-  const bool whole = count != static_cast<size_t>(-1) && mbsinit(&state) != 0;
-  characters.resize(whole ? count : 0);
-  return whole;
+  characters.clear();
+  while (!text.empty()) {
+    wchar_t character = 0;
+    const size_t size = first_character(text, character);
+    if (size == 0) {
+      characters.clear();
+      return false;
+    }
+    characters += character;
+    text.remove_prefix(size);
+  }
+  return true;
 }
 
 bool is_control(wchar_t character) {
@@ -57,36 +78,36 @@ bool is_control(wchar_t character) {
 }
 
 wchar_t lower_case(wchar_t character) {
+  if (character >= L'A' && character <= L'Z') return character + (L'a' - L'A');
+  if (character < 0x80 || utf8_locale() == nullptr) return character;
   return static_cast<wchar_t>(towlower_l(static_cast<wint_t>(character), utf8_locale()));
 }
 
 size_t cells(std::string_view text) {
   std::wstring characters;
   if (!decode(text, characters)) return text.size();
-  const Utf8Scope scope;
+  if (utf8_locale() == nullptr) return characters.size();
+  const locale_t before = uselocale(utf8_locale());
   size_t sum = 0;
   for (const wchar_t character : characters) {
     const int width = wcwidth(character);
     sum += width > 0 ? static_cast<size_t>(width) : 0;
   }
+  uselocale(before);
   return sum;
 }
 
 std::string printable(std::string_view text) {
   std::wstring characters;
+  const bool utf8 = decode(text, characters);
   std::string shown;
-  if (!decode(text, characters)) {
-    for (const char& byte : text) {
-      is_plain(byte) ? static_cast<void>(shown += byte) : append_escaped(shown, {&byte, 1});
-    }
-    return shown;
-  }
-  const Utf8Scope scope;
-  for (const wchar_t character : characters) {
-    char bytes[MB_LEN_MAX];
-    mbstate_t state{};
-    const std::string_view encoded(bytes, wcrtomb(bytes, character, &state));
-    is_control(character) ? append_escaped(shown, encoded) : static_cast<void>(shown += encoded);
+  while (!text.empty()) {
+    wchar_t character = 0;
+    const size_t size = first_character(text, character);
+    const std::string_view bytes = text.substr(0, size);
+    is_plain(bytes, character, utf8) ? static_cast<void>(shown += bytes)
+                                     : append_escaped(shown, text.substr(0, size == 0 ? 1 : size));
+    text.remove_prefix(size == 0 ? 1 : size);
   }
   return shown;
 }

@@ -394,3 +394,12 @@ def test_a_stopped_netatalk_is_one_line(netatalk):
     netatalk.box.fake("killall", status=1)
     netatalk.add("V")
     assert netatalk.reload("macshare_reload") == "macshare_reload: netatalk does not run\n"
+
+
+def test_a_system_without_the_utf8_locale_serves_the_same_names(shares):
+    shares.sh("rm -rf /usr/lib/locale")
+    for name in ("Ünï 日本", "50%", "GLOBAL", "bad\udcff", "A", "a"):
+        shares.add(name)
+    log = shares.reload()
+    assert shares.file() == HEAD + section("Ünï 日本") + section("A")
+    assert len(log.splitlines()) == 4

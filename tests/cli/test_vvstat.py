@@ -300,3 +300,11 @@ def test_watch_ends_when_nobody_reads(example):
     assert done.status == 0
     example.wait_until(lambda: not any("vvstat" in argv[0] for argv in example.processes().values()),
                        what="the end of vvstat")
+
+
+def test_a_system_without_the_utf8_locale(example):
+    done = example.run(["rm", "-rf", "/usr/lib/locale"])
+    assert done.status == 0
+    done = vvstat(example)
+    assert done.status == 0 and "  Fotos 日本 " in done.stdout
+    assert json.loads(vvstat(example, "-j").stdout)["targets"][0]["volumes"][1]["share"] == "Fotos 日本"

@@ -1,0 +1,258 @@
+"""What the package puts beside the programs: helpers of the units, the units' sandbox, completion."""
+
+import configparser
+import pathlib
+import shlex
+
+import pytest
+
+PACKAGING = pathlib.Path(__file__).resolve().parents[2] / "packaging"
+SMB_CONF = "/etc/samba/smb.conf"
+BLOCK = """
+# Begin: shares of remote volumes, added by remvol
+[global]
+   include = /run/remvol/smb-shares.conf
+# End: shares of remote volumes
+"""
+
+
+def helper(box, name, *args):
+    return box.run([PACKAGING / "helpers" / name, *args], env={"LD_PRELOAD": None})
+
+
+# --- smb.conf ---
+
+
+@pytest.mark.parametrize("text", ["", "[global]\n", "[global]\n workgroup = W\n\n[homes]\n\n\n", "a\n\n\nb\n\n", "\n"])
+def test_the_include_comes_and_goes_without_a_trace(bare_box, text):
+    path = bare_box.write(SMB_CONF, text, mode=0o640)
+    assert helper(bare_box, "samba-include", "add").status == 0
+    assert path.read_text() == text + BLOCK
+    assert helper(bare_box, "samba-include", "add").status == 0
+    assert path.read_text() == text + BLOCK
+    assert path.stat().st_mode & 0o777 == 0o640
+    assert helper(bare_box, "samba-include", "remove").status == 0
+    assert path.read_text() == text
+    assert sorted(p.name for p in path.parent.iterdir() if p.name.startswith("smb.conf")) == ["smb.conf"]
+
+
+def test_what_came_after_the_include_stays(bare_box):
+    path = bare_box.write(SMB_CONF, "[global]\n" + BLOCK + "\n[mine]\npath = /srv\n")
+    helper(bare_box, "samba-include", "remove")
+    assert path.read_text() == "[global]\n\n[mine]\npath = /srv\n"
+
+
+def test_an_include_of_the_administrator_is_left_alone(bare_box):
+    text = "[global]\n\tinclude=/run/remvol/smb-shares.conf\n"
+    path = bare_box.write(SMB_CONF, text)
+    for action in ("add", "remove"):
+        assert helper(bare_box, "samba-include", action).status == 0
+        assert path.read_text() == text
+
+
+def test_without_samba_nothing_is_included(bare_box):
+    bare_box.run(["rm", "-rf", "/etc/samba"])
+    for action in ("add", "remove"):
+        assert helper(bare_box, "samba-include", action).status == 0
+    assert not bare_box.path("/etc/samba").exists()
+
+
+def test_samba_include_wants_to_know_what_to_do(bare_box):
+    bare_box.write(SMB_CONF, "")
+    assert helper(bare_box, "samba-include").status == 2
+
+
+# --- kernel modules ---
+
+DRIVERS = ["scsi_transport_iscsi", "libiscsi", "libiscsi_tcp", "iscsi_tcp"]
+FOLDER = "/usr/local/modules/driver"
+
+
+@pytest.fixture
+def kernel(bare_box):
+    """A box whose kernel has the modules, one of them compressed and one built in."""
+    for name in DRIVERS:
+        path = f"/lib/modules/x/{name}.ko"
+        answer = {"libiscsi": path + ".xz", "libiscsi_tcp": "(builtin)"}.get(name, path)
+        bare_box.fake("modinfo", f"-n {name}", stdout=answer + "\n", exact=True)
+    bare_box.default("modprobe")
+    bare_box.fake("modprobe", "-D iscsi_tcp", stdout="insmod /lib/modules/x/scsi_common.ko \n"
+                  "insmod /lib/modules/x/scsi_mod.ko.xz a=1\ninsmod /lib/modules/x/scsi_transport_iscsi.ko \n"
+                  "builtin crc32c\ninsmod /lib/modules/x/iscsi_tcp.ko \n")
+    return bare_box
+
+
+def test_modules_are_linked_and_what_they_need_is_loaded(kernel):
+    done = helper(kernel, "modules")
+    assert (done.status, done.stderr) == (0, "")
+    links = {path.name: str(path.readlink()) for path in kernel.path(FOLDER).iterdir()}
+    assert links == {"scsi_transport_iscsi.ko": "/lib/modules/x/scsi_transport_iscsi.ko",
+                     "libiscsi.ko": "/lib/modules/x/libiscsi.ko.xz", "iscsi_tcp.ko": "/lib/modules/x/iscsi_tcp.ko"}
+    assert kernel.runs("modprobe")[1:] == [["-q", "scsi_common"], ["-q", "scsi_mod"], ["-q", "sd_mod"]]
+
+
+def test_modules_of_an_earlier_kernel_are_replaced(kernel):
+    kernel.path(FOLDER).mkdir(parents=True)
+    for name in ("libiscsi_tcp", "iscsi_tcp"):
+        kernel.path(f"{FOLDER}/{name}.ko").symlink_to("/lib/modules/old/x.ko")
+    helper(kernel, "modules")
+    assert not kernel.path(f"{FOLDER}/libiscsi_tcp.ko").is_symlink()
+    assert str(kernel.path(f"{FOLDER}/iscsi_tcp.ko").readlink()) == "/lib/modules/x/iscsi_tcp.ko"
+
+
+def test_a_missing_module_is_said(bare_box):
+    bare_box.fake("modinfo", status=1)
+    bare_box.fake("modprobe", status=1)
+    done = helper(bare_box, "modules")
+    assert done.status == 0
+    assert [line.split()[-1] for line in done.stderr.splitlines()] == DRIVERS
+
+
+def test_modules_are_taken_away_again(kernel):
+    helper(kernel, "modules")
+    kernel.write(f"{FOLDER}/of-somebody-else.ko", "")
+    assert helper(kernel, "modules", "remove").status == 0
+    assert [path.name for path in kernel.path(FOLDER).iterdir()] == ["of-somebody-else.ko"]
+    kernel.path(f"{FOLDER}/of-somebody-else.ko").unlink()
+    helper(kernel, "modules", "remove")
+    assert not kernel.path("/usr/local/modules").exists()
+
+
+# --- the tree at start ---
+
+SAVED, COPY = "/etc/NAS_CFG/vv.xml", "/usr/local/config/vv.xml"
+
+
+def settings(share):
+    return f"<config><iscsi><initiator><prefix>{share}</prefix></initiator></iscsi></config>"
+
+
+@pytest.mark.parametrize("saved, copy, loaded", [
+    (settings("saved"), settings("copy"), "saved"),
+    (settings("saved"), None, "saved"),
+    (None, settings("copy"), "copy"),
+    ("<config><cut", settings("copy"), "copy"),
+    ("<config><cut", "rubbish", None),
+    (None, None, None),
+])
+def test_the_tree_gets_the_saved_settings_or_their_copy(box, saved, copy, loaded):
+    for path, text in ((SAVED, saved), (COPY, copy)):
+        if text is not None:
+            box.write(path, text)
+    assert helper(box, "load-tree").status == 0
+    assert box.tree.get("/iscsi/initiator/prefix") == loaded
+    damaged = box.path(SAVED + ".damaged")
+    assert damaged.exists() == (saved is not None and loaded is None)
+
+
+def test_load_tree_waits_for_the_daemon(bare_box):
+    bare_box.write(SAVED, settings("late"))
+    loading = bare_box.start([PACKAGING / "helpers" / "load-tree"], env={"LD_PRELOAD": None})
+    bare_box.tree.start()
+    assert loading.wait().status == 0
+    assert bare_box.tree.get("/iscsi/initiator/prefix") == "late"
+
+
+# --- units ---
+
+# Each of these gives a unit a mount namespace of its own, systemd.exec(5): what it mounts is seen by nobody else.
+PRIVATE_MOUNTS = """PrivateMounts PrivateTmp PrivateDevices ProtectSystem ProtectHome ProtectKernelTunables
+    ProtectKernelModules ProtectKernelLogs ProtectControlGroups ProtectProc ProcSubset ReadOnlyPaths ReadWritePaths
+    InaccessiblePaths NoExecPaths ExecPaths BindPaths BindReadOnlyPaths TemporaryFileSystem MountFlags MountAPIVFS
+    RootDirectory RootImage MountImages ExtensionImages DynamicUser PrivateUsers PrivateIPC NetworkNamespacePath
+    ProtectClock DeviceAllow DevicePolicy RuntimeDirectory StateDirectory""".split()
+
+
+class Unit(configparser.RawConfigParser):
+    def __init__(self, name):
+        super().__init__(strict=False, comment_prefixes="#", inline_comment_prefixes=None, delimiters="=")
+        self.optionxform = str
+        self.read(PACKAGING / "units" / name)
+
+
+@pytest.mark.parametrize("name", ["remvol.service", "remvol-events.service"])
+def test_a_unit_that_mounts_for_others_has_no_mounts_of_its_own(name):
+    service = Unit(name)["Service"]
+    assert not set(PRIVATE_MOUNTS) & set(service)
+    assert service["NoNewPrivileges"] == "yes" and service["UMask"] == "0077"
+    assert {"CapabilityBoundingSet", "SystemCallFilter", "RestrictNamespaces", "MemoryDenyWriteExecute"} <= set(service)
+
+
+@pytest.mark.parametrize("path", sorted((PACKAGING / "units").iterdir()), ids=lambda path: path.name)
+def test_what_a_unit_starts_is_installed(path):
+    unit = Unit(path.name)
+    programs = {p.name for p in (PACKAGING / "helpers").iterdir()}
+    for key in ("ExecStartPre", "ExecStart", "ExecStartPost", "ExecStop"):
+        if key in unit["Service"]:
+            program = pathlib.PurePath(shlex.split(unit["Service"][key])[0])
+            if program.parent == pathlib.PurePath("/usr/lib/remvol"):
+                assert program.name in programs
+            else:
+                assert str(program) in ("/usr/bin/remvol", "/usr/bin/ktree", "/usr/bin/remvol-events")
+
+
+# --- completion ---
+
+
+class Completion:
+    def __init__(self, box):
+        self.box = box
+
+    def __call__(self, line):
+        """The completions that bash offers at the end of `line`, whose words are parted by single blanks."""
+        words = line.split(" ")
+        script = f"""
+            . {PACKAGING}/completion/{words[0]}
+            COMP_WORDS=({shlex.join(words)})
+            COMP_CWORD={len(words) - 1} COMP_LINE={shlex.quote(line)} COMP_POINT={len(line)}
+            function=$(complete -p {words[0]} | sed -n 's/.*-F \\([^ ]*\\).*/\\1/p')
+            $function {words[0]} "${{COMP_WORDS[COMP_CWORD]}}" "${{COMP_WORDS[COMP_CWORD-1]}}"
+            printf '%s\\n' "${{COMPREPLY[@]}}" """
+        done = self.box.run(["bash", "--norc", "-c", script], env={"LD_PRELOAD": None})
+        assert (done.status, done.stderr) == (0, ""), done.stderr
+        return [word for word in done.stdout.split("\n") if word]
+
+
+@pytest.fixture
+def complete(box):
+    box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/ip": "10.9.0.2",
+                  "/iscsi/initiator/id:1/lun/id:1/lun": "3", "/iscsi/initiator/id:1/lun/id:1/share": "Two words",
+                  "/iscsi/initiator/id:2/target": "iqn.t2", "/iscsi/initiator/id:2/lun/id:1/lun": "3",
+                  "/iscsi/initiator/id:2/lun/id:1/share": "q'uote"})
+    return Completion(box)
+
+
+def test_every_command_is_completed(complete):
+    usage = complete.box.remvol("--help").stdout
+    offered = complete("remvol --")
+    for word in usage.split():
+        if word.startswith("--"):
+            assert word in offered
+    assert {"--oiscsi_evt_reopen", "--oiscsi_evt_recover", "--check_share_name", "--help"} <= set(offered)
+
+
+@pytest.mark.parametrize("line, offered", [
+    ("remvol --del_l", ["--del_lun"]),
+    ("remvol --add ", ["-n", "-l", "-i", "-p", "-s", "-c"]),
+    ("remvol --add -n iqn.t1 -c 1 ", ["-l", "-i", "-p", "-s", "-U", "-P"]),
+    ("remvol --connect -n ", ["iqn.t1", "iqn.t2"]),
+    ("remvol --connect -n iqn.t2", ["iqn.t2"]),
+    ("remvol --connect -n iqn.t1 ", []),
+    ("remvol --del_lun -l ", ["3"]),
+    ("remvol --check_share_name -s ", ["Two\\ words", "q\\'uote"]),
+    ("remvol --search -p ", ["3260"]),
+    ("remvol --search -i ", ["10.9.0.2"]),
+    ("remvol --modify -c ", ["0", "1"]),
+    ("remvol -d ", ["0", "1", "2", "3"]),
+    ("remvol --add -P ", []),
+    ("remvol --init ", []),
+    ("ktreec -", ["-S", "-g", "-s", "-d", "-t", "-l", "-D", "-h", "--help", "-V", "--version"]),
+    ("ktreec -S ", ["/var/run/ktree_sock_vv"]),
+])
+def test_completion(complete, line, offered):
+    assert complete(line) == offered
+
+
+def test_completion_without_the_tree(complete):
+    complete.box.tree.stop()
+    assert complete("remvol --connect -n ") == []
