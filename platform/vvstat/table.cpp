@@ -2,7 +2,9 @@
 
 #include <algorithm>
 #include <array>
+#include <cstdarg>
 #include <cstdio>
+#include <cstring>
 #include <string_view>
 
 #include "utf8.h"
@@ -40,38 +42,57 @@ const char* colour_of(const Volume& volume) {
   return volume.status.starts_with("Running") ? kGood : nullptr;
 }
 
+// The text that snprintf(format, ...) would print; short.
+std::string formatted(const char* format, ...) __attribute__((format(printf, 1, 2)));
+
+std::string formatted(const char* format, ...) {
+  char text[64];
+  va_list arguments;
+  va_start(arguments, format);
+  vsnprintf(text, sizeof text, format, arguments);
+  va_end(arguments);
+  return text;
+}
+
 std::string bar(int progress) {
-  const size_t done = kBarWidth * static_cast<size_t>(progress) / 100;
-  return "[" + std::string(done, '#') + std::string(kBarWidth - done, '-') + "] " + std::to_string(progress) +
-         "%";
+  char cells[kBarWidth + 1];
+  memset(cells, '-', kBarWidth);
+  memset(cells, '#', kBarWidth * static_cast<size_t>(progress) / 100);
+  cells[kBarWidth] = '\0';
+  return formatted("[%s] %d%%", cells, progress);
 }
 
 std::string share_of_size(const Volume& volume) {
   if (volume.format_state == kFormatRunning) return bar(volume.progress);
   if (volume.size == 0) return "-";
-  const double percent = 100.0 * static_cast<double>(volume.used) / static_cast<double>(volume.size);
-  char text[16];
-  snprintf(text, sizeof text, "%.0f%%", percent);
-  return text;
+  return formatted("%.0f%%", 100.0 * static_cast<double>(volume.used) / static_cast<double>(volume.size));
 }
 
 std::string or_dash(const std::string& text) {
   return text.empty() ? "-" : platform::printable(text);
 }
 
+Row row_of(const Target& target) {
+  std::string portal = or_dash(target.address);
+  portal += formatted(":%d", target.port);
+  return {{platform::printable(target.name), portal, or_dash(target.status), "", "", ""}, colour_of(target)};
+}
+
+Row row_of(const Volume& volume) {
+  std::string share(2, ' ');
+  share += or_dash(volume.share);
+  const bool sized = volume.size != 0;
+  return {{share, formatted("LUN %d", volume.lun), or_dash(volume.status),
+           sized ? readable_size(volume.used) : "-", sized ? readable_size(volume.size) : "-",
+           share_of_size(volume)},
+          colour_of(volume)};
+}
+
 std::vector<Row> rows_of(const Status& status) {
   std::vector<Row> rows{header()};
   for (const Target& target : status.targets) {
-    const std::string portal = or_dash(target.address) + ":" + std::to_string(target.port);
-    rows.push_back(
-        {{platform::printable(target.name), portal, or_dash(target.status), "", "", ""}, colour_of(target)});
-    for (const Volume& volume : target.volumes) {
-      const bool sized = volume.size != 0;
-      rows.push_back({{"  " + or_dash(volume.share), "LUN " + std::to_string(volume.lun),
-                       or_dash(volume.status), sized ? readable_size(volume.used) : "-",
-                       sized ? readable_size(volume.size) : "-", share_of_size(volume)},
-                      colour_of(volume)});
-    }
+    rows.push_back(row_of(target));
+    for (const Volume& volume : target.volumes) rows.push_back(row_of(volume));
   }
   return rows;
 }
@@ -105,7 +126,7 @@ std::string line_of(const Row& row, const std::array<size_t, kColumns>& widths, 
     line += coloured ? kPlain : "";
     pending += widths[column] - std::min(width, widths[column]) + kGap.size();
   }
-  return line + "\n";
+  return line += "\n";
 }
 
 }  // namespace
@@ -115,9 +136,8 @@ std::string readable_size(unsigned long long bytes) {
   auto size = static_cast<double>(bytes);
   size_t unit = 0;
   for (; size >= 1024 && unit + 1 < std::size(kUnits); ++unit) size /= 1024;
-  char text[32];
-  snprintf(text, sizeof text, unit == 0 || size >= 99.95 ? "%.0f %s" : "%.1f %s", size, kUnits[unit]);
-  return text;
+  const bool whole = unit == 0 || size >= 99.95;
+  return whole ? formatted("%.0f %s", size, kUnits[unit]) : formatted("%.1f %s", size, kUnits[unit]);
 }
 
 std::string table(const Status& status, const Screen& screen) {

@@ -1,8 +1,8 @@
 /* Preloaded into a program of a test box: its netlink sockets are datagram sockets that a test writes to.
  *
- * The socket of protocol N is the file /run/netlink-N; while /run/netlink-N-refused exists it cannot be opened.
- * Three datagrams are no message: "overrun" makes the call fail with ENOBUFS, "broken" with EIO, and what begins
- * with "foreign " comes from another process than the kernel. */
+ * The socket of protocol N is the file /run/netlink-N; while /run/netlink-N-refused exists it cannot be
+ * opened. Three datagrams are no message: "overrun" makes the call fail with ENOBUFS, "broken" with EIO, and
+ * what begins with "foreign " comes from another process than the kernel. */
 #undef _GNU_SOURCE /* would declare these functions with a union as their address */
 #define _DEFAULT_SOURCE
 #include <errno.h>
@@ -40,7 +40,8 @@ int bind(int fd, const struct sockaddr* address, socklen_t size) {
   return (int)syscall(SYS_bind, fd, address, size);
 }
 
-ssize_t recvfrom(int fd, void* buffer, size_t size, int flags, struct sockaddr* sender, socklen_t* sender_size) {
+ssize_t recvfrom(int fd, void* buffer, size_t size, int flags, struct sockaddr* sender,
+                 socklen_t* sender_size) {
   ssize_t got = syscall(SYS_recvfrom, fd, buffer, size, flags, NULL, NULL);
   if (got < 0 || sender == NULL || *sender_size < sizeof(struct sockaddr_nl)) return got;
   struct sockaddr_nl from = {.nl_family = AF_NETLINK};
