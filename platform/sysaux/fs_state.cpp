@@ -40,7 +40,7 @@ errcode_t set_block_size(io_channel of, int size) {
 
 // A negative count is one of bytes.
 errcode_t read_blocks(io_channel of, unsigned long long block, int count, void* data) {
-  const size_t size = count < 0 ? static_cast<size_t>(-count) : static_cast<size_t>(count) * of->block_size;
+  const size_t size = static_cast<size_t>(count < 0 ? -count : count * of->block_size);
   const off_t at = static_cast<off_t>(block) * of->block_size;
   const ssize_t got = pread(channel_fd, data, size, at);
   if (got < 0) return errno;

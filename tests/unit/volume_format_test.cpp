@@ -92,7 +92,7 @@ TEST_F(Format, EveryReadWithACounterIsPublished) {
 }
 
 TEST_F(Format, BadArgumentsTouchNothing) {
-  const auto refused = [this](TargetEntry bad, const char* node, const char* message) {
+  const auto refused = [](TargetEntry bad, const char* node, const char* message) {
     const std::string log = fakes::output_of([&] { EXPECT_EQ(Target_format(&bad, node), -1); });
     EXPECT_TRUE(has(log, message));
   };

@@ -219,7 +219,7 @@ TEST_F(Mount, AnotherFileSystemIsNotChecked) {
 }
 
 TEST_F(Mount, BadEntriesTouchNothing) {
-  const auto refused = [this](TargetEntry* bad, const char* message) {
+  const auto refused = [](TargetEntry* bad, const char* message) {
     const std::string said = fakes::output_of([&] { EXPECT_EQ(Target_mount(bad, 0, 1), -1); });
     EXPECT_TRUE(has(said, message));
   };
