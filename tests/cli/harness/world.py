@@ -39,11 +39,11 @@ class Running:
 
     @property
     def stdout(self):
-        return _read_all(self.out)
+        return _read_all(self.out) if self.result is None else self.result.stdout
 
     @property
     def stderr(self):
-        return _read_all(self.err)
+        return _read_all(self.err) if self.result is None else self.result.stderr
 
     def kill(self, number=signal.SIGKILL):
         self.box.send(["kill", self.number, int(number)])
