@@ -184,6 +184,9 @@ target_chap() {
 
 # ---- the appliance ----
 
+# The names of the scenarios' targets begin with this.
+IQN=iqn.2026-01.org.example
+
 # tree_get KEY: the value, nothing when there is none.
 tree_get() { ktreec -S "$TREE_SOCKET" -g "$1"; }
 
@@ -210,6 +213,13 @@ expect_result() {
     expect_equal "the result of $1" "$outcome" "$(result "${1#--}")"
 }
 
+# volume_add TARGET LUN SHARE [ADDRESS [OPTION...]]: remvol --add of a LUN of the target IQN:TARGET, which must succeed.
+volume_add() {
+    add_target=$1 add_lun=$2 add_share=$3 add_address=${4:-10.9.0.2}
+    shift $(($# < 4 ? $# : 4))
+    works --add -n "$IQN:$add_target" -l "$add_lun" -i "$add_address" -p 3260 -s "$add_share" "$@"
+}
+
 # settings: every value of the tree but the results of commands.
 settings() { ktreec -S "$TREE_SOCKET" -t | grep -v '^/result/'; }
 
@@ -218,11 +228,25 @@ target_key() { tree_get "/iscsi/initiator/id:$1/$2"; }
 
 lun_key() { target_key "$1" "lun/id:$2/$3"; }
 
+# expect_key KEY VALUE: the tree holds the value below /iscsi/initiator; "" stands for none as well.
+expect_key() { expect_equal "$1" "$2" "$(tree_get "/iscsi/initiator/$1")"; }
+
 # mounted SHARE: the volume is mounted.
 mounted() { grep -q " /mnt/VV/$1 " /proc/mounts; }
 
 # logged_in TARGETNAME: the target has a session.
 logged_in() { grep -qsx "$1" /sys/class/iscsi_session/session*/targetname; }
+
+# sessions: the names of the targets that have a session, as iscsiadm lists them, sorted.
+sessions() { iscsiadm -m session 2>/dev/null | sed 's/.*,1 \([^ ]*\).*/\1/' | sort; }
+
+# session_is TARGETNAME STATE: LOGGED_IN, FAILED or FREE, as the kernel says.
+session_is() {
+    for session in /sys/class/iscsi_session/session*; do
+        [ "$(cat "$session/targetname")" = "$1" ] && [ "$(cat "$session/state")" = "$2" ] && return 0
+    done
+    return 1
+}
 
 # disk_of TARGETNAME LUN: the kernel name of a LUN's disk, such as sdb.
 disk_of() {

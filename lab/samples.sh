@@ -1,7 +1,6 @@
 # Runs open-iscsi by hand in the virtual appliance and keeps what it prints; lab/record-samples starts it.
 # timeout: 300
 OUT=/data/output
-BASE=iqn.2026-01.org.example
 mkdir -p $OUT
 
 # record NAME COMMAND...: its standard output into NAME.out, its standard error (if any) into NAME.err.
@@ -20,7 +19,7 @@ listings() {
 }
 
 target_with_luns() {
-    target_add "$1" "$BASE:$2" || fail "target $2"
+    target_add "$1" "$IQN:$2" || fail "target $2"
     lun=1
     while [ $lun -le "$3" ]; do
         lun_add "$1" $lun 64M
@@ -28,8 +27,8 @@ target_with_luns() {
     done
 }
 
-node_record() { iscsiadm -m node -T "$BASE:$1" -p "$2" -I "$3" -o new; }
-login() { iscsiadm -m node -T "$BASE:$1" -p "$2" -I "$3" --login; }
+node_record() { iscsiadm -m node -T "$IQN:$1" -p "$2" -I "$3" -o new; }
+login() { iscsiadm -m node -T "$IQN:$1" -p "$2" -I "$3" --login; }
 state_is() { [ "$(cat /sys/class/iscsi_session/session*/state | sort -u)" = "$1" ]; }
 
 for module in scsi_transport_iscsi libiscsi libiscsi_tcp iscsi_tcp; do
@@ -46,7 +45,7 @@ node.conn[0].timeo.noop_out_timeout = 5
 node.session.err_timeo.abort_timeout = 15
 node.session.err_timeo.lu_reset_timeout = 20
 END
-echo "InitiatorName=$BASE:nas-box:initiator-1b2c3d" >/etc/iscsi/initiatorname.iscsi
+echo "InitiatorName=$IQN:nas-box:initiator-1b2c3d" >/etc/iscsi/initiatorname.iscsi
 record iscsid-absent iscsiadm -m session
 iscsid
 for port in 0 1; do
@@ -78,7 +77,7 @@ done
 login controller-only 10.9.0.2:3260 default
 listings controller-only
 record login login t1 10.9.0.2:3260 default
-wait_for 20 disk_of $BASE:t1 12
+wait_for 20 disk_of $IQN:t1 12
 record login-again login t1 10.9.0.2:3260 default
 listings two-targets
 login t10 10.9.0.2:3260 default
@@ -86,14 +85,14 @@ login t1-x 10.9.0.2:3260 default
 record login-no-secret login secret 10.9.0.2:3260 default
 record login-unknown-target login no-such-record 10.9.0.2:3260 default
 listings four-targets
-disk=/dev/$(disk_of $BASE:t1-x 1)
+disk=/dev/$(disk_of $IQN:t1-x 1)
 echo , | sfdisk -q -X gpt "$disk" || fail "partition"
 record mke2fs-ext2 env MKE2FS_SYNC=100 mke2fs -m0 -b4096 "$disk"1
 record mke2fs-ext3 env MKE2FS_SYNC=100 mke2fs -j -m0 -b4096 "$disk"1
 record mke2fs-ext4 env MKE2FS_SYNC=100 mke2fs -j -m0 -b4096 -T ext4 "$disk"1
-record logout iscsiadm -m node -T $BASE:t1-x --logout
-record logout-again iscsiadm -m node -T $BASE:t1-x --logout
-record delete-in-use iscsiadm -m node -I default -T $BASE:t10 -p 10.9.0.2:3260 -o delete
+record logout iscsiadm -m node -T $IQN:t1-x --logout
+record logout-again iscsiadm -m node -T $IQN:t1-x --logout
+record delete-in-use iscsiadm -m node -I default -T $IQN:t10 -p 10.9.0.2:3260 -o delete
 
 # Two interfaces, two portals, and IPv6.
 for way in 'iface0 10.9.0.2:3260 iface0' 'iface1 10.9.1.2:3260 iface1' 'iface0 [fd00:9:0::2]:3260 ipv6' \
@@ -106,8 +105,8 @@ done
 listings two-interfaces
 
 # The cable is cut, first while the kernel still waits for the session, then after it gave up.
-iscsiadm -m node -T $BASE:t10 --logout >/dev/null
-iscsiadm -m node -T $BASE:controller-only --logout >/dev/null
+iscsiadm -m node -T $IQN:t10 --logout >/dev/null
+iscsiadm -m node -T $IQN:controller-only --logout >/dev/null
 cable_cut 0
 wait_for 60 state_is FAILED
 listings cable-cut

@@ -1,7 +1,6 @@
 # The lab itself: what a target can do to its initiators.
-T=iqn.2026-01.org.example:t1
+T=$IQN:t1
 login() { iscsiadm -m node -T $T -p 10.9.0.2:3260 --login; }
-session_state() { [ "$(cat /sys/class/iscsi_session/session*/state)" = "$1" ]; }
 
 for module in scsi_transport_iscsi libiscsi libiscsi_tcp iscsi_tcp; do
     expect "load the module" insmod "/usr/local/modules/driver/$module.ko"
@@ -26,28 +25,28 @@ expect_status 24 login
 expect "name the secret" iscsiadm -m node -T $T -o update -n node.session.auth.authmethod -v CHAP \
     -n node.session.auth.username -v user -n node.session.auth.password -v secret-of-12-
 expect "log in" login
-wait_for 10 disk_of $T 2
-disk1=$(disk_of $T 1)
+wait_for 10 disk_of $IQN:t1 2
+disk1=$(disk_of $IQN:t1 1)
 expect_equal "LUN 1 is writable" 0 "$(cat "/sys/block/$disk1/ro")"
-expect_equal "LUN 2 is write-protected" 1 "$(cat "/sys/block/$(disk_of $T 2)/ro")"
+expect_equal "LUN 2 is write-protected" 1 "$(cat "/sys/block/$(disk_of $IQN:t1 2)/ro")"
 
 # A LUN grows; a new login sees it.
 expect "log out" iscsiadm -m node -u
 expect "grow" lun_grow 1 1 96M
 expect "log in" login
-wait_for 10 disk_of $T 1
-expect_equal "sectors" $((96 * 2048)) "$(cat "/sys/block/$(disk_of $T 1)/size")"
+wait_for 10 disk_of $IQN:t1 1
+expect_equal "sectors" $((96 * 2048)) "$(cat "/sys/block/$(disk_of $IQN:t1 1)/size")"
 
 # The cable is cut and put back: the session heals. The target dies: it does not, until the target is back.
 expect "cut the cable" cable_cut 0
-wait_for 30 session_state FREE
+wait_for 30 session_is $IQN:t1 FREE
 expect "put the cable back" cable_plug 0
-wait_for 60 session_state LOGGED_IN
+wait_for 60 session_is $IQN:t1 LOGGED_IN
 expect "kill the target" target_kill
-wait_for 30 session_state FREE
+wait_for 30 session_is $IQN:t1 FREE
 target_start
 expect "add the target again" target_add 1 $T
 expect "add its LUN again" lun_add 1 1 96M
 expect "ask for the secret again" target_chap 1 user secret-of-12-
-wait_for 60 session_state LOGGED_IN
+wait_for 60 session_is $IQN:t1 LOGGED_IN
 expect "read" dd if="/dev/$disk1" of=/dev/null bs=4k count=1
