@@ -117,7 +117,7 @@ watch() {
     running=$!
     while kill -0 $running 2>/dev/null; do
         show_changes
-        sleep 0.1
+        sleep 0.2
     done
     status=0
     wait $running || status=$?
@@ -141,7 +141,9 @@ target_add 1 iqn.2026-01.org.example:backup
 lun_add 1 1 512M
 target_add 2 $TARGET
 lun_add 2 1 2G
-# Have mke2fs write the inode tables itself: the format takes longer and shows its progress.
+# A format that takes a while and shows its progress: mke2fs writes the inode tables itself, and the machine, small as
+# an appliance, keeps little of them in its memory.
+echo $((8 << 20)) >/proc/sys/vm/dirty_bytes
 sed -i 's/^\[defaults\]/&\n\tlazy_itable_init = 0/' /etc/mke2fs.conf
 
 headline "Start the initiator"
