@@ -4,7 +4,8 @@
  * SOCKET is the number of an inherited SOCK_SEQPACKET socket; KEEP are folders that stay visible as they are
  * (the repository, the build). The box has mount, IPC, network, host name and process namespaces of its own;
  * its root is the machine's root with a layer in memory on top, so nothing that is done in it stays. /run,
- * /tmp, /mnt, /root and /dev start empty (/dev with the harmless devices), /sys/block shows no disk.
+ * /tmp, /mnt, /root and /dev start empty (/dev with the harmless devices), /sys/block shows no disk, and
+ * /etc/mtab is there as on any booted system.
  *
  * First answer: "ready PID" (seen from outside), or "failed TEXT". Then a request is fields separated by NUL,
  *   run ID FOLDER ARGUMENTS-COUNT ARGUMENT... VARIABLE...   with three descriptors: the standard streams
@@ -111,6 +112,7 @@ static void make_root(char** keep) {
   memory_at("mnt", "mode=755");
   memory_at("root", "mode=700");
   mkdir("run/lock", 01777);
+  if (symlink("../proc/self/mounts", "etc/mtab") < 0 && errno != EEXIST) must(-1, "etc/mtab");
   make_devices();
   must(mkdir("fake", 0777), "fake");
   for (int i = 0; i < count; i++) {
