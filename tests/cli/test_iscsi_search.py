@@ -210,7 +210,7 @@ def test_with_an_output_file_a_private_tree_holds_the_names(box):
     search(box, "-o", "/tmp/out.xml")
     assert box.trace() == daemon_road("search", f"system {DISCOVER}")
     box.wait_until(lambda: not box.path("/var/run/ktree_sock_vv_search").exists(), what="the daemon's end")
-    assert len(box.processes()) == 1
+    box.wait_until(lambda: len(box.processes()) == 1, what="the end of all but the settings daemon")
     load(box, "/tmp/out.xml")
     assert box.tree.dump() == {
         "/temp/vv_search/id:1/name": "iqn.x:a",
