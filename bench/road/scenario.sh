@@ -1,5 +1,6 @@
 # The road through remvol and through a plain script, in turns. bench/road.sh says what for.
 # timeout: 900
+# clock: virtual
 T=iqn.2026-01.org.example:t1
 ROUNDS=5
 node="iscsiadm -m node -I default -T $T -p 10.9.0.2:3260"
