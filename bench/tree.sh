@@ -54,11 +54,10 @@ wait_for_socket "$work/ktree"
 wait_for_socket "$work/redis"
 redis_empty=$(resident "$redis_pid")
 
-# Measures with the servers on processor $1 and the client on processor $2. Where the scheduler puts two processes that
-# talk to each other decides the figures more than anything else, so it is not left to it.
+# Measures with the servers and the echo on the processors of the list $2, and the client on those of $1.
 measure() {
-  taskset -apc "$1" "$ktree_pid" >/dev/null && taskset -apc "$1" "$redis_pid" >/dev/null || exit 2
-  "$build/bin/bench_tree" "$work/ktree" "$work/redis" "$2" "$1"
+  taskset -apc "$2" "$ktree_pid" >/dev/null && taskset -apc "$2" "$redis_pid" >/dev/null || exit 2
+  "$build/bin/bench_tree" "$work/ktree" "$work/redis" "$1" "$2"
   case $? in
     0) ;;
     1) status=1 ;;
@@ -66,7 +65,13 @@ measure() {
   esac
 }
 
+# Where two processes that talk to each other run decides the figures more than anything else: so the scheduler's
+# choice, which is what a user gets, and both choices that it has.
 status=0
+all=0-$(($(nproc) - 1))
+echo "Client and servers where the scheduler puts them:"
+measure "$all" "$all"
+echo
 echo "Client and servers on one processor:"
 measure 0 0
 if [ "$(nproc)" -gt 1 ]; then

@@ -1,9 +1,10 @@
 // Measures round trips to the configuration tree beside two peers, in one run: a bare echo between two
 // processes, which is the floor that the machine sets, and redis-server.
 //
-// Usage: bench_tree KTREE_SOCKET REDIS_SOCKET OWN_CPU ECHO_CPU
+// Usage: bench_tree KTREE_SOCKET REDIS_SOCKET OWN_CPUS ECHO_CPUS
 //
-// It runs on the processor OWN_CPU, the echoes on ECHO_CPU, where its caller has put the two servers as well.
+// It runs on the processors OWN_CPUS, "1" or "0-1", the echoes on ECHO_CPUS, where its caller has put the two
+// servers as well.
 // Both servers get the same full tree first. Then every round makes the same few calls of every kind, one
 // kind after the other. A round is shorter than the time slices of the scheduler, so whatever else the
 // machine does disturbs a few rounds wholly instead of all of them a little: the figure of a kind is the
@@ -61,10 +62,15 @@ void read_all(int fd, char* data, size_t size) {
   }
 }
 
-void pin_to(int cpu) {
+void pin_to(const char* cpus) {
+  char* end = nullptr;
+  unsigned long cpu = strtoul(cpus, &end, 10);
+  const unsigned long last = *end == '-' ? strtoul(end + 1, nullptr, 10) : cpu;
   cpu_set_t set;
   CPU_ZERO(&set);
-  CPU_SET(static_cast<size_t>(cpu), &set);
+  for (; cpu <= last; cpu++) {
+    CPU_SET(cpu, &set);
+  }
   if (sched_setaffinity(0, sizeof set, &set) != 0) {
     fail("sched_setaffinity");
   }
@@ -84,7 +90,7 @@ int connect_to(const char* path) {
 // A process that answers every `request` bytes with `reply` bytes, blocking in both, and its caller's side.
 class Echo {
  public:
-  Echo(size_t request, size_t reply, int cpu) : request_(request), reply_(reply) {
+  Echo(size_t request, size_t reply, const char* cpus) : request_(request), reply_(reply) {
     int fds[2];
     if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds) != 0) {
       fail("socketpair");
@@ -94,7 +100,7 @@ class Echo {
     if (child_ == 0) {
       prctl(PR_SET_PDEATHSIG, SIGKILL);
       close(fds[0]);
-      pin_to(cpu);
+      pin_to(cpus);
       answer(fds[1]);
     }
     close(fds[1]);
@@ -232,19 +238,19 @@ bool check(const Kind& ours, const Kind& theirs, double most) {
 
 int main(int argc, char** argv) {
   if (argc != 5) {
-    fprintf(stderr, "Usage: bench_tree KTREE_SOCKET REDIS_SOCKET OWN_CPU ECHO_CPU\n");
+    fprintf(stderr, "Usage: bench_tree KTREE_SOCKET REDIS_SOCKET OWN_CPUS ECHO_CPUS\n");
     return 2;
   }
   const char* ktree = argv[1];
-  const int echo_cpu = atoi(argv[4]);
-  pin_to(atoi(argv[3]));
+  const char* echo_cpus = argv[4];
+  pin_to(argv[3]);
 
   Redis redis(argv[2]);
   fill(ktree, redis);
   Echo set_echo(sizeof(ktree::RequestHeader) + strlen(kPath) + strlen(kValue), sizeof(ktree::ReplyHeader),
-                echo_cpu);
+                echo_cpus);
   Echo get_echo(sizeof(ktree::RequestHeader) + strlen(kPath) + sizeof(uint32_t),
-                sizeof(ktree::ReplyHeader) + strlen(kValue), echo_cpu);
+                sizeof(ktree::ReplyHeader) + strlen(kValue), echo_cpus);
 
   std::array<Kind, 6> kinds = {{
       {"echo of a set", [&] { set_echo.call(); }, {}},

@@ -13,7 +13,15 @@
 namespace ktree {
 namespace {
 
-constexpr int64_t kAcceptPause = 100;      // milliseconds without accepting when descriptors ran out
+constexpr int64_t kAcceptPause = 100;  // milliseconds without accepting when descriptors ran out
+// Every event of a client is told once, when it happens.
+constexpr uint32_t kNextRequest = EPOLLIN | EPOLLET;
+constexpr uint32_t kReplyTaken = EPOLLOUT | EPOLLET;
+
+constexpr int kTrust = 64;        // of a client whose next request is expected at once
+constexpr int kWorth = 8;         // requests that came as expected make up for one that did not
+constexpr int kMostProof = 1024;  // requests of a client, at most, before the next one is expected again
+
 constexpr int64_t kEvictableAfter = 1000;  // a client in the middle of a request is left alone for so long
 
 int64_t now_milliseconds() {
@@ -90,7 +98,7 @@ void Server::take_turn(const epoll_event* events, int count) {
     } else if (tag == &signals_) {
       running_ = false;
     } else {
-      serve(*static_cast<Connection*>(tag));
+      serve(*static_cast<Connection*>(tag), events[i].events);
     }
   }
   if (accepting) {
@@ -151,7 +159,7 @@ void Server::accept_clients() {
 void Server::welcome(int fd) {
   auto connection = std::make_unique<Connection>();
   connection->fd = fd;
-  if (!is_welcome(fd) || !watch(fd, connection.get(), EPOLLIN, EPOLL_CTL_ADD)) {
+  if (!is_welcome(fd) || !watch(fd, connection.get(), kNextRequest, EPOLL_CTL_ADD)) {
     return;
   }
   clients_++;
@@ -188,49 +196,51 @@ Connection* Server::idle_for_longest() const {
   return connection;
 }
 
-void Server::serve(Connection& connection) {
+void Server::serve(Connection& connection, uint32_t events) {
   if (connection.sending) {
     continue_reply(connection);
-  } else if (connection.bytes != nullptr) {
-    continue_request(connection);
-  } else {
-    start_request(connection);
+    return;
+  }
+  if (connection.in_series) {
+    weigh_series(connection, events != EPOLLOUT);
+  }
+  while (receive_part(connection)) {
   }
 }
 
-void Server::start_request(Connection& connection) {
-  const int64_t n = receive(connection, request_.data(), request_.size());
+// Returns true when there may be more of the request to receive.
+bool Server::receive_part(Connection& connection) {
+  const bool started = connection.bytes != nullptr;
+  char* buffer = started ? connection.bytes.get() : request_.data();
+  const size_t room = started ? connection.size : request_.size();
+  const int64_t n = receive(connection, buffer + connection.used, room - connection.used);
   if (n < 0) {
     drop(connection);
-  } else if (n > 0) {
-    take_request(connection, {request_.data(), static_cast<size_t>(n)});
   }
-}
-
-void Server::continue_request(Connection& connection) {
-  const int64_t n =
-      receive(connection, connection.bytes.get() + connection.used, connection.size - connection.used);
-  if (n < 0) {
-    drop(connection);
-  } else if (n > 0) {
-    connection.used += static_cast<size_t>(n);
-    take_request(connection, {connection.bytes.get(), connection.used});
+  if (n <= 0) {
+    return false;
   }
+  const size_t have = connection.used + static_cast<size_t>(n);
+  if (started) {
+    connection.used = have;
+  }
+  return take_request(connection, {buffer, have});
 }
 
 // Looks at what has come of a request. More than one at a time is not in the protocol, so no client can make
-// the daemon work on its requests while others wait.
-void Server::take_request(Connection& connection, std::string_view bytes) {
+// the daemon work on its requests while others wait. Returns true when more is needed.
+bool Server::take_request(Connection& connection, std::string_view bytes) {
   const size_t size = request_size(bytes);
   if (size == bytes.size()) {
     answer(connection, bytes);
-  } else if (size == kMoreNeeded) {
-    keep_part(connection, bytes, sizeof(RequestHeader));
-  } else if (size != kNoRequest && size > bytes.size()) {
-    keep_part(connection, bytes, size);
-  } else {
-    drop(connection);
+    return false;
   }
+  if (size != kMoreNeeded && (size == kNoRequest || size < bytes.size())) {
+    drop(connection);
+    return false;
+  }
+  keep_part(connection, bytes, size == kMoreNeeded ? sizeof(RequestHeader) : size);
+  return true;
 }
 
 // Keeps the part of a request that has come, with room for `size` bytes in all.
@@ -250,6 +260,11 @@ void Server::keep_part(Connection& connection, std::string_view bytes, size_t si
 void Server::answer(Connection& connection, std::string_view bytes) {
   Request request = {};
   if (!parse_request(bytes, request)) {
+    drop(connection);
+    return;
+  }
+  // A receive stops at a passed descriptor, so what follows the request may not have been seen yet.
+  if (connection.document >= 0 && has_input(connection.fd)) {
     drop(connection);
     return;
   }
@@ -285,7 +300,7 @@ void Server::keep_reply(Connection& connection, std::string_view rest) {
   connection.size = rest.size();
   connection.sending = true;
   mark_stuck(connection);
-  if (!watch(connection.fd, &connection, EPOLLOUT, EPOLL_CTL_MOD)) {
+  if (!watch(connection.fd, &connection, kReplyTaken, EPOLL_CTL_MOD)) {
     drop(connection);
   }
 }
@@ -305,7 +320,7 @@ void Server::continue_reply(Connection& connection) {
 
 // The reply has gone: the client is idle, and the last one to be dropped for others.
 void Server::settle(Connection& connection) {
-  if (connection.sending && !watch(connection.fd, &connection, EPOLLIN, EPOLL_CTL_MOD)) {
+  if (connection.sending && !watch(connection.fd, &connection, kNextRequest, EPOLL_CTL_MOD)) {
     drop(connection);
     return;
   }
@@ -314,6 +329,24 @@ void Server::settle(Connection& connection) {
   connection.used = connection.size = 0;
   connection.sending = connection.stuck = false;
   idle_.append(connection);
+  if (!connection.in_series && ++connection.answers >= connection.proof) {
+    connection.in_series = watch(connection.fd, &connection, kNextRequest | kReplyTaken, EPOLL_CTL_MOD);
+    connection.trust = kTrust;
+  }
+}
+
+// A client that asks one thing after the other sends its next request as soon as it has taken a reply. Woken
+// by that, as a process that blocks in read(2) is (unix_write_space() in the kernel), the daemon's processor
+// is out of its sleep when the request is there, which saves a sixth of the round trip between two
+// processors. When the daemon wakes in vain too often, because the client does not go on at once or both
+// share a processor, it stops, and waits twice as long before it tries again.
+void Server::weigh_series(Connection& connection, bool came) {
+  connection.trust = came ? std::min(connection.trust + 1, kTrust) : connection.trust - kWorth;
+  if (connection.trust <= 0 && watch(connection.fd, &connection, kNextRequest, EPOLL_CTL_MOD)) {
+    connection.in_series = false;
+    connection.answers = 0;
+    connection.proof = std::min(connection.proof * 2, kMostProof);
+  }
 }
 
 void Server::mark_stuck(Connection& connection) {

@@ -43,16 +43,16 @@ class Server {
   [[nodiscard]] bool make_room();
   [[nodiscard]] Connection* idle_for_longest() const;
 
-  void serve(Connection& connection);
-  void start_request(Connection& connection);
-  void continue_request(Connection& connection);
-  void take_request(Connection& connection, std::string_view bytes);
+  void serve(Connection& connection, uint32_t events);
+  [[nodiscard]] bool receive_part(Connection& connection);
+  [[nodiscard]] bool take_request(Connection& connection, std::string_view bytes);
   void keep_part(Connection& connection, std::string_view bytes, size_t size);
   void answer(Connection& connection, std::string_view bytes);
   void send_reply(Connection& connection, std::string_view reply);
   void keep_reply(Connection& connection, std::string_view rest);
   void continue_reply(Connection& connection);
   void settle(Connection& connection);
+  void weigh_series(Connection& connection, bool came);
   void mark_stuck(Connection& connection);
   void drop(Connection& connection);
   [[nodiscard]] ConnectionList& list_of(const Connection& connection);

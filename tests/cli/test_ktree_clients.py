@@ -2,6 +2,7 @@
 import array
 import os
 import pathlib
+import signal
 import socket
 import struct
 import subprocess
@@ -164,6 +165,20 @@ def test_a_request_may_come_byte_by_byte(daemon):
         assert receive(client) == reply
 
 
+def test_a_client_may_ask_in_a_row_and_with_pauses(daemon):
+    client = daemon.connect()
+    number = 0
+    for in_a_row, pause in [(300, 0.0), (30, 0.002), (300, 0.0), (3, 0.1)]:
+        for _ in range(in_a_row):
+            number += 1
+            assert ask(client, frame(SET, b"/a", str(number).encode())) == (0, b"")
+            time.sleep(pause)
+    assert ask(client, get_frame(b"/a")) == (0, str(number).encode())
+    before = daemon.cpu_ticks()
+    time.sleep(1)
+    assert daemon.cpu_ticks() - before <= 1
+
+
 def test_a_reply_is_kept_for_a_slow_reader(daemon):
     daemon.set("/large", "y" * 65535)
     client = daemon.connect()
@@ -281,6 +296,29 @@ def test_documents_travel_as_memory_files(daemon):
     os.ftruncate(document, 20)
     status, text = send_document(client, frame(LOAD), document)
     assert status == 3 and text.startswith(b"line 1: ")
+
+
+def send_parts_at_once(daemon, client, *parts):
+    """The parts are all there when the daemon looks; the kernel hands out the first, with a descriptor, by itself."""
+    memory = os.memfd_create("memory")
+    os.write(memory, b"<config><a>loaded</a></config>")
+    os.kill(daemon.pid(), signal.SIGSTOP)
+    client.sendmsg([parts[0]], [(socket.SOL_SOCKET, socket.SCM_RIGHTS, array.array("i", [memory]))])
+    for part in parts[1:]:
+        client.sendall(part)
+    os.kill(daemon.pid(), signal.SIGCONT)
+    os.close(memory)
+    return receive(client)
+
+
+def test_the_rest_of_a_request_may_come_behind_its_file(daemon):
+    assert send_parts_at_once(daemon, daemon.connect(), frame(LOAD)[:3], frame(LOAD)[3:5], frame(LOAD)[5:]) == (0, b"")
+    assert daemon.listing() == ["/a=loaded"]
+
+
+def test_a_request_that_follows_one_with_a_file_ends_the_connection(daemon):
+    assert send_parts_at_once(daemon, daemon.connect(), frame(LOAD), get_frame(b"/a")) is None
+    assert daemon.listing() == []
 
 
 def test_other_files_are_refused_and_closed(daemon, tmp_path):
