@@ -6,6 +6,8 @@
 #include <memory>
 #include <string_view>
 
+#include "ktree/series.h"
+
 namespace ktree {
 
 struct Connection {
@@ -20,11 +22,7 @@ struct Connection {
   size_t used = 0;
   size_t size = 0;
 
-  // Whether the daemon wakes when the client takes its reply already (Server::weigh_series).
-  bool in_series = false;
-  int trust = 0;    // how sure it is that the next request comes at once
-  int answers = 0;  // since it was not in a series
-  int proof = 64;   // answers after which it is taken to be in one
+  Series series;
 
   int64_t since = 0;  // since when it is stuck, in milliseconds of CLOCK_MONOTONIC
   Connection* previous = nullptr;

@@ -18,10 +18,6 @@ constexpr int64_t kAcceptPause = 100;  // milliseconds without accepting when de
 constexpr uint32_t kNextRequest = EPOLLIN | EPOLLET;
 constexpr uint32_t kReplyTaken = EPOLLOUT | EPOLLET;
 
-constexpr int kTrust = 64;        // of a client whose next request is expected at once
-constexpr int kWorth = 8;         // requests that came as expected make up for one that did not
-constexpr int kMostProof = 1024;  // requests of a client, at most, before the next one is expected again
-
 constexpr int64_t kEvictableAfter = 1000;  // a client in the middle of a request is left alone for so long
 
 int64_t now_milliseconds() {
@@ -201,8 +197,10 @@ void Server::serve(Connection& connection, uint32_t events) {
     continue_reply(connection);
     return;
   }
-  if (connection.in_series) {
-    weigh_series(connection, events != EPOLLOUT);
+  if (connection.series.running() && connection.series.ends(events != EPOLLOUT) &&
+      !await_request(connection)) {
+    drop(connection);
+    return;
   }
   while (receive_part(connection)) {
   }
@@ -320,7 +318,7 @@ void Server::continue_reply(Connection& connection) {
 
 // The reply has gone: the client is idle, and the last one to be dropped for others.
 void Server::settle(Connection& connection) {
-  if (connection.sending && !watch(connection.fd, &connection, kNextRequest, EPOLL_CTL_MOD)) {
+  if ((connection.series.starts() || connection.sending) && !await_request(connection)) {
     drop(connection);
     return;
   }
@@ -329,24 +327,12 @@ void Server::settle(Connection& connection) {
   connection.used = connection.size = 0;
   connection.sending = connection.stuck = false;
   idle_.append(connection);
-  if (!connection.in_series && ++connection.answers >= connection.proof) {
-    connection.in_series = watch(connection.fd, &connection, kNextRequest | kReplyTaken, EPOLL_CTL_MOD);
-    connection.trust = kTrust;
-  }
 }
 
-// A client that asks one thing after the other sends its next request as soon as it has taken a reply. Woken
-// by that, as a process that blocks in read(2) is (unix_write_space() in the kernel), the daemon's processor
-// is out of its sleep when the request is there, which saves a sixth of the round trip between two
-// processors. When the daemon wakes in vain too often, because the client does not go on at once or both
-// share a processor, it stops, and waits twice as long before it tries again.
-void Server::weigh_series(Connection& connection, bool came) {
-  connection.trust = came ? std::min(connection.trust + 1, kTrust) : connection.trust - kWorth;
-  if (connection.trust <= 0 && watch(connection.fd, &connection, kNextRequest, EPOLL_CTL_MOD)) {
-    connection.in_series = false;
-    connection.answers = 0;
-    connection.proof = std::min(connection.proof * 2, kMostProof);
-  }
+// Has the daemon woken by the client's next request, and in a series already by the client taking the reply.
+bool Server::await_request(Connection& connection) const {
+  const uint32_t events = connection.series.running() ? kNextRequest | kReplyTaken : kNextRequest;
+  return watch(connection.fd, &connection, events, EPOLL_CTL_MOD);
 }
 
 void Server::mark_stuck(Connection& connection) {

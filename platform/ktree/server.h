@@ -52,7 +52,7 @@ class Server {
   void keep_reply(Connection& connection, std::string_view rest);
   void continue_reply(Connection& connection);
   void settle(Connection& connection);
-  void weigh_series(Connection& connection, bool came);
+  [[nodiscard]] bool await_request(Connection& connection) const;
   void mark_stuck(Connection& connection);
   void drop(Connection& connection);
   [[nodiscard]] ConnectionList& list_of(const Connection& connection);
