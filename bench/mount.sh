@@ -2,8 +2,8 @@
 # Measures the mounting of a LUN that is formatted already, on a loop device, beside a shell loop that runs the same
 # shell commands as system(3) does and nothing else: bench/mount.sh [BUILD FOLDER]. The two take turns; the figure is
 # the median of their ratio within a turn. No step of such a mount waits; the start of the process that mounts is not
-# counted, a run mounts many LUNs. Exits 1 when the tool costs more than 1.1 times the loop. As root; it runs in namespaces of its own, on one processor and before all other processes, and
-# leaves nothing behind.
+# counted, a run mounts many LUNs. Exits 1 when the tool costs more than 1.1 times the loop. As root; it runs in
+# namespaces of its own, on one processor and before all other processes, and leaves nothing behind.
 set -euo pipefail
 limit=1.1
 turns=${TURNS:-101}
@@ -25,7 +25,7 @@ socket=/run/ktree_sock_vv
 truncate -s 1G "$work/disk"
 disk=$(losetup --show -f "$work/disk")
 finish() {
-  umount -q /mnt/VV/Data || :
+  ! mountpoint -q /mnt/VV/Data || umount /mnt/VV/Data
   partx -d "$disk"
   losetup -d "$disk"
   rm -r "$work"

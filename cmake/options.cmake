@@ -17,7 +17,13 @@ set(CMAKE_C_VISIBILITY_PRESET hidden)
 set(CMAKE_VISIBILITY_INLINES_HIDDEN ON)
 # Installed programs find the private libraries beside them, wherever the prefix is.
 file(RELATIVE_PATH _bin_to_lib "/${CMAKE_INSTALL_BINDIR}" "/${CMAKE_INSTALL_LIBDIR}")
-set(CMAKE_INSTALL_RPATH "$ORIGIN/${_bin_to_lib};$ORIGIN")
+set(CMAKE_INSTALL_RPATH "$ORIGIN/${_bin_to_lib}")
+
+# Libraries need no other of this project. A search path of theirs would only be walked in vain for every one of the
+# system's that they load.
+function(without_search_path)
+  set_target_properties(${ARGV} PROPERTIES SKIP_BUILD_RPATH ON INSTALL_RPATH "")
+endfunction()
 
 add_compile_definitions(_GNU_SOURCE)
 add_compile_options(

@@ -60,6 +60,12 @@ bool read_number_at(int dir, const char* name, long long* value) {
   return errno == 0 && end != text && *end == '\0';
 }
 
+bool start_readable(int fd) {
+  char page[4096];
+  posix_fadvise(fd, 0, sizeof page, POSIX_FADV_DONTNEED);  // the disk is asked, not what was read before
+  return lseek(fd, 0, SEEK_END) >= off_t{kFirstMebibyte} && pread(fd, page, sizeof page, 0) == sizeof page;
+}
+
 bool first_mebibyte_readable(int fd) {
   char chunk[65536];
   posix_fadvise(fd, 0, kFirstMebibyte, POSIX_FADV_DONTNEED);

@@ -20,7 +20,7 @@ void* load_module(const char* file) {
   const int folder = slash != nullptr ? static_cast<int>(slash - self.dli_fname) + 1 : 0;
   const int length = snprintf(path, sizeof path, "%.*s%s", folder, self.dli_fname, file);
   if (length < 0 || static_cast<size_t>(length) >= sizeof path) return nullptr;
-  return dlopen(path, RTLD_NOW | RTLD_LOCAL);
+  return dlopen(path, RTLD_LAZY | RTLD_LOCAL);
 }
 
 // A module and its handle. Two threads that load it at once get the same handle from dlopen, so the loser's

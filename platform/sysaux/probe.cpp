@@ -61,13 +61,20 @@ int list_unread_table(const char* device, int block_dir, NameList* names) {
   return count;
 }
 
-// Has the disk read at once what the recognition then takes in some thirty pieces, a round trip each: it
-// looks at the start and, for RAID, at the end.
+// Has the disk read at once what the recognition then takes in some forty pieces, a round trip each. Where it
+// looks is what libblkid 2.38 does (strace); a piece that is missing here is read when it is asked for.
 void read_ahead(int device) {
-  constexpr off_t kTail = 192 << 10;
+  constexpr off_t kHead = 68 << 10;
+  constexpr off_t kTail = 136 << 10;
+  constexpr off_t kPage = 4096;
+  constexpr off_t kFromStart[] = {128 << 10, 256 << 10, 512 << 10, 1 << 20, 2 << 20, 4 << 20};
+  constexpr off_t kFromEnd[] = {204288, 302592, 345600, 376320, 466432, 486912, 498688, 507392, 1580544};
   const off_t end = lseek(device, 0, SEEK_END);
-  posix_fadvise(device, 0, kFirstMebibyte, POSIX_FADV_WILLNEED);
-  if (end > kTail) posix_fadvise(device, end - kTail, kTail, POSIX_FADV_WILLNEED);
+  posix_fadvise(device, 0, kHead, POSIX_FADV_WILLNEED);
+  for (const off_t at : kFromStart) posix_fadvise(device, at, kPage, POSIX_FADV_WILLNEED);
+  if (end <= kFromEnd[8]) return;
+  for (const off_t at : kFromEnd) posix_fadvise(device, end - at, kPage, POSIX_FADV_WILLNEED);
+  posix_fadvise(device, end - kTail, kTail, POSIX_FADV_WILLNEED);
 }
 
 }  // namespace
@@ -80,11 +87,10 @@ int sysaux_probe_fs_type(char* out, const char* node) {
   if (!device.ok()) return -1;
   read_ahead(device.get());
   const Content content = recognise(device.get(), out);
-  if (content == Content::nothing) return 1;
-  if (content != Content::unreadable) return 0;
-  // sys_check_dev accepts a node that reads well at its start. Where a read failed further on, the node must
-  // not look empty then, because an empty one is formatted.
-  if (!first_mebibyte_readable(device.get())) return -1;
+  if (content != Content::nothing && content != Content::unreadable) return 0;
+  if (!start_readable(device.get())) return -1;  // sys_check_dev does not accept it either
+  // Where a read failed further on, the node must not look empty, because an empty one is formatted.
+  if (content == Content::nothing && first_mebibyte_readable(device.get())) return 1;
   strcpy(out, "unreadable");
   return 0;
 }

@@ -1,5 +1,7 @@
 """What the platform recognises on a device, and what it never takes for an empty one."""
 
+import struct
+
 import pytest
 from harness.sysaux import (
     MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, mounted, run, under_fault,
@@ -64,6 +66,28 @@ def test_an_empty_device_is_told_from_one_that_cannot_be_read(loop, tmp_path):
     assert call("fs_type", "/dev/null") == -1
 
 
+def write_zfs_labels(disk, *places):
+    """The rings of uberblocks of the labels at these places; zdb and libblkid look for their magic."""
+    for place in places:
+        for i in range(8):
+            uberblock = struct.pack("<QQQQQ", 0x00BAB10C, 5000, i + 1, 1, 1700000000)
+            disk.write(place + 128 * 1024 + i * 1024, uberblock)
+
+
+def test_zfs_labels_at_either_end_are_recognised(loop):
+    for places in ([0, 256 * 1024], [64 * MIB - 512 * 1024, 64 * MIB - 256 * 1024]):
+        disk = loop()
+        write_zfs_labels(disk, *places)
+        assert call("fs_type", disk.node) == (0, "zfs_member")
+
+
+def test_zfs_labels_that_outlived_a_format_hide_nothing(loop):
+    disk = loop()
+    make_ext(disk, kind="ext4")
+    write_zfs_labels(disk, 64 * MIB - 512 * 1024, 64 * MIB - 256 * 1024)
+    assert call("fs_type", disk.node) == (0, "ext4")
+
+
 def test_two_file_systems_at_once_are_not_empty(loop):
     disk = loop()
     make_ambivalent(disk)
@@ -87,14 +111,15 @@ def test_the_cache_of_blkid_is_never_asked(loop):
 
 def test_a_device_that_reads_only_at_its_start_is_not_empty(loop):
     disk = loop()
-    disk.resize(2 * MIB)  # behind the device's back: it keeps its size, and reads beyond fail
-    assert call("check_dev", disk.node) == 0
-    assert call("fs_type", disk.node) == (0, "unreadable")
+    for size in (2 * MIB, MIB - 4096, 4096):
+        disk.resize(size)  # behind the device's back: it keeps its size, and reads beyond fail
+        assert call("check_dev", disk.node) == 0
+        assert call("fs_type", disk.node) == (0, "unreadable")
 
 
 def test_a_device_that_does_not_read_at_its_start_is_not_usable(loop):
     disk = loop()
-    disk.resize(MIB - 4096)
+    disk.resize(0)
     assert call("fs_type", disk.node) == -1
     assert call("check_dev", disk.node) == -1
 
@@ -102,7 +127,7 @@ def test_a_device_that_does_not_read_at_its_start_is_not_usable(loop):
 def test_what_was_read_before_does_not_make_a_device_usable(loop):
     disk = loop()
     assert call("check_dev", disk.node) == 0  # the pages stay: the test holds the device open
-    disk.resize(MIB - 4096)
+    disk.resize(0)
     assert call("check_dev", disk.node) == -1
 
 
