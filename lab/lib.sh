@@ -234,6 +234,12 @@ expect_key() { expect_equal "$1" "$2" "$(tree_get "/iscsi/initiator/$1")"; }
 # mounted SHARE: the volume is mounted.
 mounted() { grep -q " /mnt/VV/$1 " /proc/mounts; }
 
+# initiators: the processes of the initiator's daemon. Each forks a child that takes over the sessions it finds, which is
+# there for some seconds and is none of them.
+initiators() { pgrep -P 1 -x iscsid; }
+
+one_initiator() { [ "$(initiators | wc -l)" = 1 ]; }
+
 # logged_in TARGETNAME: the target has a session.
 logged_in() { grep -qsx "$1" /sys/class/iscsi_session/session*/targetname; }
 
@@ -253,7 +259,7 @@ disk_of() {
     for session in /sys/class/iscsi_session/session*; do
         [ "$(cat "$session/targetname")" = "$1" ] || continue
         for disk in "$session"/device/target*/*:*:*:"$2"/block/*; do
-            [ -e "$disk" ] && echo "${disk##*/}" && return 0
+            [ -b "/dev/${disk##*/}" ] && echo "${disk##*/}" && return 0
         done
     done
     return 1

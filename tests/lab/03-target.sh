@@ -26,6 +26,7 @@ expect "name the secret" iscsiadm -m node -T $T -o update -n node.session.auth.a
     -n node.session.auth.username -v user -n node.session.auth.password -v secret-of-12-
 expect "log in" login
 wait_for 10 disk_of $IQN:t1 2
+wait_for 10 disk_of $IQN:t1 1
 disk1=$(disk_of $IQN:t1 1)
 expect_equal "LUN 1 is writable" 0 "$(cat "/sys/block/$disk1/ro")"
 expect_equal "LUN 2 is write-protected" 1 "$(cat "/sys/block/$(disk_of $IQN:t1 2)/ro")"
@@ -49,4 +50,4 @@ expect "add the target again" target_add 1 $T
 expect "add its LUN again" lun_add 1 1 96M
 expect "ask for the secret again" target_chap 1 user secret-of-12-
 wait_for 60 session_is $IQN:t1 LOGGED_IN
-expect "read" dd if="/dev/$disk1" of=/dev/null bs=4k count=1
+wait_for 10 dd if="/dev/$disk1" of=/dev/null bs=4k count=1

@@ -24,7 +24,7 @@ done
 for module in scsi_transport_iscsi libiscsi libiscsi_tcp iscsi_tcp; do
     expect "module $module" grep -q "^$module " /proc/modules
 done
-expect_equal "initiator's daemons" 1 "$(pgrep -xc iscsid)"
+wait_for 10 one_initiator
 expect_equal "the settings daemon's process" "$(pgrep -x ktree)" "$(cat /var/run/ktree_sock_vv_config.pid)"
 
 expect_key ver 1
