@@ -1,3 +1,4 @@
+# timeout: 150
 # The lab itself: a real initiator logs in to a real target, by the commands alone.
 for module in scsi_transport_iscsi libiscsi libiscsi_tcp iscsi_tcp; do
     expect "load the module" insmod "/usr/local/modules/driver/$module.ko"

@@ -1,3 +1,4 @@
+# timeout: 150
 # The lab itself: what outlives a pulled power cable and what does not.
 case $PHASE in
 1)

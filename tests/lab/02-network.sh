@@ -1,3 +1,4 @@
+# timeout: 150
 # The lab itself: cables, packets and addresses between the appliance and the target.
 reaches() { ping -c 1 -W 1 "$1"; }
 loses() { ! reaches "$1"; }

@@ -1,3 +1,4 @@
+# timeout: 150
 # --init on a bare appliance: daemon, modules, the initiator's files and interface records.
 rm -rf /etc/iscsi/*
 works --init

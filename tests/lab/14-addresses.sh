@@ -1,3 +1,4 @@
+# timeout: 500
 # Portals: IPv4, global IPv6, and link-local IPv6 behind either port, each through the right interface.
 session_line() { # NAME TEXT
     iscsiadm -m session -P 1 | sed -n "/^Target: $IQN:$1 /,/^Target/s/^[[:space:]]*$2: *//p" | head -n 1

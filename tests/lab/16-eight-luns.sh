@@ -1,3 +1,4 @@
+# timeout: 500
 # A target with eight volumes whose LUN numbers do not sort as texts: every one gets its own disk. A ninth is refused.
 LUNS='1 2 3 4 10 11 12 20'
 target_start

@@ -1,4 +1,3 @@
-# timeout: 600
 # Volumes are added to targets that are connected and to targets that are not; what cannot be added changes nothing.
 T=iqn.2026-01.org.example:t
 portal="-i 10.9.0.2 -p 3260"

@@ -1,4 +1,3 @@
-# timeout: 600
 # A target that asks for a secret.
 T=iqn.2026-01.org.example:t1
 target_start

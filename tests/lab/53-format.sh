@@ -1,4 +1,3 @@
-# timeout: 600
 # A volume that somebody uses is formatted; meanwhile its status shows the progress.
 T=iqn.2026-01.org.example:t1
 LUN_DIR=/data/luns

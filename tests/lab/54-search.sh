@@ -1,4 +1,3 @@
-# timeout: 600
 # What a portal offers, with and without a result file, for targets in use and for others.
 T=iqn.2026-01.org.example:
 LISTS=/var/run/ktree_sock

@@ -1,4 +1,3 @@
-# timeout: 600
 # A target moves to another portal.
 T=iqn.2026-01.org.example:t1
 target_start

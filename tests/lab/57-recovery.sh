@@ -1,4 +1,4 @@
-# timeout: 600
+# timeout: 500
 # The cable is cut: briefly, and nobody notices; long, and the volume comes back writable with what was synced.
 T=iqn.2026-01.org.example:t1
 session_state() { [ "$(cat /sys/class/iscsi_session/session*/state)" = "$1" ]; }

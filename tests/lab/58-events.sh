@@ -1,4 +1,4 @@
-# timeout: 600
+# timeout: 800
 # Twenty recover events for eight targets at once: one run does the work, the others queue their targets. A run that
 # cannot get at the queue in its four waits (on a busy machine) says that its event is lost; the event sent again then
 # does it. In the end every target is connected.

@@ -1,4 +1,3 @@
-# timeout: 600
 # What the administration pages see while volumes are made: 20 looks a second at the tree.
 T=iqn.2026-01.org.example:t1
 LUN_DIR=/data/luns
