@@ -39,6 +39,8 @@ Target read_target(TreeReader& tree, int index) {
   target.wanted = tree.number(0, TARGET "conn_set", index) != 0;
   target.connect_state = tree.number(-1, TARGET "conn_state", index);
   target.status = tree.value(TARGET "status", index);
+  // At a loss of the connection the tool sets the state alone; its text follows with the next command.
+  if (target.wanted && target.connect_state == kRecovering) target.status = "Reconnecting";
   for (int lun = 1; lun <= platform::kLuns; ++lun) {
     if (tree.value(LUN "lun", index, lun).empty()) break;
     target.volumes.push_back(read_volume(tree, index, lun));

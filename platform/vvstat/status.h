@@ -39,6 +39,7 @@ struct Status {
 };
 
 inline constexpr int kFormatRunning = 1;
+inline constexpr int kRecovering = 3;
 
 Status read_status();
 

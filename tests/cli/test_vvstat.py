@@ -79,6 +79,14 @@ def test_the_exit_status_says_whether_all_is_connected(example, wanted, state, s
     assert json.loads(done.stdout)["all_connected"] == (status == 0)
 
 
+@pytest.mark.parametrize("wanted, state, text", [("1", "3", "Reconnecting"), ("0", "3", "Disconnected"),
+                                                 ("1", "1", "Disconnected"), ("1", "2", "Disconnected")])
+def test_a_lost_connection_is_told_although_the_text_in_the_tree_is_older(example, wanted, state, text):
+    example.tree.set({f"{T2}/conn_set": wanted, f"{T2}/conn_state": state})
+    assert vvstat(example).stdout.splitlines()[-1].endswith("  " + text)
+    assert json.loads(vvstat(example, "--json").stdout)["targets"][1]["status"] == text
+
+
 def test_without_the_tree(box):
     box.tree.stop()
     done = vvstat(box)
