@@ -1,0 +1,58 @@
+# timeout: 150
+# needs: package
+# The Debian packages are installed, started, used, stopped and removed. There is no service manager here: the lines
+# of the units are run as they stand.
+units=/lib/systemd/system
+
+# unit NAME KEY: the command of a unit.
+unit() { sed -n "s/^$2=//p" "$units/$1.service"; }
+
+start() {
+    $(unit remvol-tree ExecStart) &
+    $(unit remvol-tree ExecStartPost)
+    $(unit remvol ExecStartPre)
+    $(unit remvol ExecStart)
+    expect_equal "the result of the start" 0 "$(result init)"
+    $(unit remvol-events ExecStart) &
+    listener=$!
+}
+
+tree_is_gone() { ! pgrep -x ktree; }
+
+stop() {
+    kill $listener
+    wait $listener || : # 143 when it had not begun to listen
+    $(unit remvol ExecStop)
+    wait_for 10 tree_is_gone
+    expect_equal "what is mounted" "" "$(grep /mnt/VV/ /proc/mounts)"
+    expect_status 21 iscsiadm -m session
+}
+
+expect_not "the project is here already" command -v remvol
+rm -r /usr/local/modules
+mkdir /var/log
+target_start
+target_add 1 $IQN:t1
+lun_add 1 1 64M
+
+expect "the packages are installed" dpkg -i /packages/*.deb
+for program in ktree ktreec remvol remvol-events vvstat winshare_reload macshare_reload flashrun; do
+    expect "$program is in its place" test -x /usr/bin/$program
+done
+start
+volume_add t1 1 Photos
+works --connect -n $IQN:t1
+echo text >/mnt/VV/Photos/file
+expect_has "what the operator sees" Running "$(vvstat)"
+stop
+
+start
+expect_equal "the file after a start" text "$(cat /mnt/VV/Photos/file)"
+stop
+
+expect "the packages are removed" dpkg -r remvol libremvol1
+expect_equal "what is left of the programs" "" "$(ls /usr/bin/remvol* /usr/bin/ktree* /usr/lib/remvol $units/remvol* 2>/dev/null)"
+expect_not "the module folder is gone" test -e /usr/local/modules
+expect "the settings are there" grep -q Photos /etc/NAS_CFG/vv.xml
+expect "so is their copy" grep -q Photos /usr/local/config/vv.xml
+expect_equal "the user's data" text "$(debugfs -R 'cat file' "$(lun_file 1 1)?offset=1048576" 2>/dev/null)"
