@@ -13,12 +13,14 @@
 #include "support/command.h"
 #include "support/result.h"
 #include "support/text.h"
+#include "sysaux.h"
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/mount.h"
+#include "volume/mount_point.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
@@ -31,6 +33,9 @@ namespace {
 
 constexpr int kMinPort = 1;
 constexpr int kMaxPort = 65535;
+
+// After so long without its target (replacement_timeout of the daemon's settings) the kernel gives a disk up.
+constexpr int kTakeOverSeconds = 30;
 
 // What iscsiadm prints when the node is logged in already; 2.0.874 and later print another text, and the
 // session stays then: logging it out would pull its disks from under mounted volumes.
@@ -108,6 +113,29 @@ int _target_connect_run(const char* name, const char* address, int port, const c
   return confirm_login(name, Caller()) ? 0 : 1;
 }
 
+// Returns whether one of the target's volumes is mounted: the appliance is running, and the session was there
+// before.
+bool has_mounted_volume(int db_idx) {
+  for (int lun = 1; lun <= kMaxLunsPerTarget; lun++) {
+    TargetEntry volume;
+    if (ktree_get_lun_entry_by_dbidx(&volume, db_idx, lun) != kOk) return false;
+    if (sys_mount_point(mount_point_of(volume.share)) != 0) return true;
+  }
+  return false;
+}
+
+// Stores the devices of a target's session at start-up. Results as ktree_update_dev.
+//
+// A new iscsid (seen with 2.1.8) takes over the sessions that it finds by connecting each anew, and for some
+// seconds they show no running disk. Logging such a session out would pull the disks from under mounted
+// volumes.
+int update_dev_at_start(TargetEntry* entry) {
+  const int result = ktree_update_dev(entry);
+  if (result != kNoRunningDisk || !has_mounted_volume(entry->db_idx)) return result;
+  if (_wait_sess_lun_ready(entry->target_name, kTakeOverSeconds) != 0) return result;
+  return ktree_update_dev(entry);
+}
+
 // Logs in to one stored target and mounts its volumes. Returns whether it came to the mounting.
 bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
   *result = Target_Connect(entry);
@@ -115,7 +143,7 @@ bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
     ktree_set_connect_state(entry->db_idx, kConnectError);
     return false;
   }
-  *result = ktree_update_dev(entry);
+  *result = update_dev_at_start(entry);
   if (*result != 0) {
     if (*result == kTreeFailed) LOG_AT(caller, 0, "ktree failed");
     give_up_session(entry, *result, kVolumeLost, caller);

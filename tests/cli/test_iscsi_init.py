@@ -12,6 +12,7 @@ from harness.initiator import (
     T2,
     T3,
     Initiator,
+    block,
     login_command,
     logout_command,
     record_commands,
@@ -426,3 +427,25 @@ def test_init_again_on_a_running_appliance(box, initiator):
     init(box)
     assert state(box, 1) == ["1", "Connected", "1"]
     assert logout_command(T1) not in box.shell()
+
+
+def test_sessions_that_the_new_daemon_takes_over_are_waited_for(box, initiator):
+    initiator.target(T1, {1: "sdb"})
+    box.hook("sys_check_dev", ret=1)
+    box.hook("sys_mount_point", "/mnt/VV/share1", ret=1)
+    lost = block(T1, {1: ("sdb", "blocked")}, state="FAILED")
+    box.fake("iscsiadm", "-m session -P3", stdout=lost, times=1)
+    box.fake("iscsiadm", "-m session -P 3", stdout=lost, times=3)
+    load(box, {1: (T1, {"luns": LUN1})})
+    assert state(box, 1) == ["1", "Connected", "1"]
+    assert box.tree.get("/iscsi/initiator/id:1/lun/id:1/dev") == "sdb"
+    assert logout_command(T1) not in box.shell()
+    assert len([call for call in box.shell() if "-m session -P 3 " in call]) == 4
+
+
+def test_sessions_that_do_not_come_back_are_given_up_after_thirty_seconds(box, initiator):
+    initiator.target(T1, {1: ("sdb", "blocked")}, state="FAILED")
+    box.hook("sys_mount_point", "/mnt/VV/share1", ret=1)
+    load(box, {1: (T1, {"luns": LUN1})})
+    assert state(box, 1) == ["0", "Disconnected", "0"]
+    assert len([call for call in box.shell() if "-m session -P 3 " in call]) == 300

@@ -18,7 +18,11 @@ expect_not "the initiator's daemon is a new one" [ "$iscsid" = "$(initiators)" ]
 expect_key iqn iqn.2000-01.org.example:nas-box:initiator-1b2c3d
 expect_equal "sessions" "$IQN:t1" "$(sessions)"
 expect_key id:1/status Connected
+expect_key id:1/conn_state 1
+expect_key id:1/conn_set 1
 expect_key id:1/lun/id:1/status Running
+expect_key id:1/lun/id:1/volume_state 0
+expect_key id:1/lun/id:1/dev "$(disk_of $IQN:t1 1)"
 expect "the volume is mounted" mounted Data
 expect_equal "mounts of the disk" 1 "$(grep -c ' /mnt/VV/Data ' /proc/self/mounts)"
 echo after >&7
