@@ -39,3 +39,22 @@ expect_equal "the same file system" "$uuid" \
     "$(dumpe2fs -h "/dev/$(disk_of $IQN:t1 1)1" 2>/dev/null | sed -n 's/^Filesystem UUID: *//p')"
 expect_has "the settings file" "<conn_set>1</conn_set>" "$(cat /etc/NAS_CFG/vv.xml)"
 expect_equal "the flash's copy" "$(cat /etc/NAS_CFG/vv.xml)" "$(cat /usr/local/config/vv.xml)"
+
+# A volume that was formatted elsewhere, with vfat.
+works --disconnect -n $IQN:t1
+fat=$(lun_file 1 2)
+truncate -s 64M "$fat"
+echo 'label: gpt
+,' | sfdisk -q "$fat"
+expect "format" mkfs.vfat --offset=2048 "$fat" 60000 >/tmp/mkfs.out 2>&1
+expect "LUN" lun_add 1 2 64M
+volume_add t1 2 Fat
+works --connect -n $IQN:t1
+expect_equal "what is mounted" "/dev/$(disk_of $IQN:t1 2)1 vfat" "$(findmnt -n -o SOURCE,FSTYPE /mnt/VV/Fat)"
+expect_key id:1/lun/id:2/status Running
+expect_key id:1/lun/id:2/fs_type vfat
+echo text >/mnt/VV/Fat/Grüße.txt
+works --disconnect -n $IQN:t1
+works --connect -n $IQN:t1
+expect_equal "its file" text "$(cat /mnt/VV/Fat/Grüße.txt)"
+expect_equal "everybody may write" 777 "$(stat -c %a /mnt/VV/Fat/Grüße.txt)"

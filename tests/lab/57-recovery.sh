@@ -4,6 +4,13 @@ T=iqn.2026-01.org.example:t1
 session_state() { [ "$(cat /sys/class/iscsi_session/session*/state)" = "$1" ]; }
 mounts() { dmesg | grep -c "EXT4-fs (.*1): mounted filesystem"; }
 refuses_writes() { ! dd if=/dev/zero of=/mnt/VV/a/probe bs=4k count=1 conv=fsync; }
+# recover: the event that the session is back, with the course of it in /tmp/remvol.out.
+recover() {
+    tree_set /iscsi/initiator/dbg 1
+    works --oiscsi_evt_recover -n $T
+    tree_set /iscsi/initiator/dbg 0
+}
+degraded="access right is degraded to ro"
 
 target_start
 target_add 1 $T
@@ -26,7 +33,8 @@ works --oiscsi_evt_reopen -n $T
 expect_equal "connect state" 3 "$(target_key 1 conn_state)"
 cable_plug 0
 wait_for 60 session_state LOGGED_IN
-works --oiscsi_evt_recover -n $T
+recover
+expect_lacks "what is found" "$degraded" "$(cat /tmp/remvol.out)"
 expect_equal "connect state" 1 "$(target_key 1 conn_state)"
 expect_equal "target" Connected "$(target_key 1 status)"
 expect_equal "nothing was mounted anew" "$before" "$(mounts)"
@@ -43,11 +51,15 @@ expect_equal "nothing was mounted anew" "$before" "$(mounts)"
 cable_cut 0
 dd if=/dev/zero of=/mnt/VV/a/lost bs=64k count=32 conv=fsync 2>/dev/null && fail "a write went through a cut cable"
 works --oiscsi_evt_reopen -n $T
+works --status
+expect_equal "target" Reconnecting "$(target_key 1 status)"
 expect "the volume takes no writes" refuses_writes
 cable_plug 0
 wait_for 60 session_state LOGGED_IN
 expect "nor does it now" refuses_writes
-works --oiscsi_evt_recover -n $T
+recover
+expect_has "what is found" "$degraded" "$(cat /tmp/remvol.out)"
+expect_equal "target" Connected "$(target_key 1 status)"
 expect_equal "connect state" 1 "$(target_key 1 conn_state)"
 expect_equal "volume" Running "$(lun_key 1 1 status)"
 expect_equal "the volume was mounted anew" $((before + 1)) "$(mounts)"
