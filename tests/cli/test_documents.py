@@ -1,0 +1,119 @@
+"""The documents: their worked examples work, and they know every command, option and status text."""
+
+import os
+import pathlib
+import re
+import subprocess
+
+import pytest
+
+from harness.ktree_daemon import BUILD, Daemon
+
+TOP = pathlib.Path(__file__).resolve().parents[2]
+DOCS = TOP / "docs"
+
+
+@pytest.fixture
+def daemon():
+    daemon = Daemon()
+    yield daemon
+    daemon.close()
+
+
+def block(document, language=""):
+    """The first block of a document."""
+    return re.search(f"^```{language}\n(.*?)^```", document.read_text(), re.M | re.S).group(1)
+
+
+def test_the_settings_file_of_the_example_is_what_the_tree_writes(daemon, tmp_path):
+    example = block(DOCS / "settings-file.md", "xml")
+    (tmp_path / "example.xml").write_text(example)
+    assert daemon.run("-l", tmp_path / "example.xml").returncode == 0
+    assert daemon.get("/iscsi/initiator/id:1/chap_pwd") == b"a<b"
+    assert daemon.get("/iscsi/initiator/id:1/lun/id:1/share") == b"Photos \r"
+    assert daemon.run("-D", tmp_path / "again.xml").returncode == 0
+    assert (tmp_path / "again.xml").read_text() == example
+
+
+def test_the_bytes_of_the_example_are_what_goes_over_the_wire(daemon):
+    text = (DOCS / "wire-protocol.md").read_text()
+    lines = re.findall(r"^(->|<-) ((?:[0-9a-f]{2} *)+)", text, re.M)
+    assert [direction for direction, _ in lines] == ["->", "<-", "->", "<-"]
+    with daemon.connect() as client:
+        for direction, numbers in lines:
+            message = bytes.fromhex(numbers)
+            if direction == "->":
+                client.sendall(message)
+            else:
+                assert client.recv(100) == message
+
+
+def test_the_tree_of_the_example_can_be_set_up(daemon):
+    lines = re.findall(r"^/\w\S*=.*$", (DOCS / "tree-layout.md").read_text(), re.M)
+    assert len(lines) > 20
+    for line in lines:
+        path, _, value = line.partition("=")
+        daemon.set(path, value)
+    assert daemon.listing() == lines
+
+
+def test_the_operators_guide_explains_every_status_text():
+    texts = set(re.findall(r'"([A-Z][A-Za-z ]+)"', (TOP / "src/tree/status_text.cpp").read_text()))
+    guide = (DOCS / "operators-guide.md").read_text()
+    explained = re.findall(r"^\| ([^|]+?) \| [^|]+ \| [^|]*\|$", guide, re.M)
+    assert {"Connected", "Running", "Offline"} <= texts
+    for text in texts - {"Read Only"}:
+        assert any(line.startswith(text) for line in explained), text
+    assert "Running ( Read Only )" in explained
+
+
+def plain(page):
+    """The words of a manual page without its fonts and escapes."""
+    text = (DOCS / "man" / page).read_text()
+    return re.sub(r"\\f[BRI]|\"", "", text).replace("\\-", "-")
+
+
+COMMANDS = re.findall(r'^    \{"(\w+)", ', (TOP / "src/frontend/commands.cpp").read_text(), re.M)
+
+
+def test_the_manual_page_has_every_command_and_option_of_the_tool():
+    page = plain("remvol.8")
+    assert len(COMMANDS) == 19
+    for word in ["--" + command for command in COMMANDS] + [f"-{letter}" for letter in "ipnsvcUPdlhow"]:
+        assert re.search(rf"^\.[BI]\w* .*(?<![\w-]){word}(?![\w-])", page, re.M), word
+
+
+@pytest.mark.parametrize("program, page", [("vvstat", "vvstat.1"), ("ktree", "ktree.8"), ("ktreec", "ktreec.1"),
+                                           ("remvol-events", "remvol-events.8")])
+def test_a_manual_page_has_every_option_of_its_program(program, page):
+    help_text = subprocess.run([BUILD / "bin" / program, "--help"], stdout=subprocess.PIPE, text=True, check=True).stdout
+    options = set(re.findall(r"(?<![\w-])(--?[A-Za-z][\w-]*)", help_text)) - set(re.findall(r"remvol (--\w+)", help_text))
+    assert "--help" in options
+    for option in options:
+        assert re.search(rf"(?<![\w-]){option}(?![\w-])", plain(page)), option
+
+
+PROGRAM = """
+#include <stdio.h>
+#include <ktreec.h>
+#include <ostel_common.h>
+#include <sysaux.h>
+int main(void) {
+  char text[] = "  word  ";
+  printf("[%s]\\n", strtrim(text, " "));
+  return ktreec_set("/nowhere", 0, "/a", "b") == -1 ? 0 : 1;
+}
+"""
+
+
+@pytest.mark.unsanitized
+def test_a_program_is_built_with_what_pkg_config_says(tmp_path):
+    subprocess.run(["cmake", "--install", BUILD, "--prefix", tmp_path / "usr"], check=True, stdout=subprocess.DEVNULL)
+    (tmp_path / "program.c").write_text(PROGRAM)
+    folder = next(tmp_path.rglob("remvol-platform.pc")).parent
+    flags = subprocess.run(["pkg-config", "--define-prefix", "--cflags", "--libs", "remvol-platform"], check=True,
+                           stdout=subprocess.PIPE, text=True, env={**os.environ, "PKG_CONFIG_PATH": str(folder)}).stdout
+    subprocess.run(["cc", tmp_path / "program.c", "-o", tmp_path / "program", *flags.split()], check=True)
+    done = subprocess.run([tmp_path / "program"], stdout=subprocess.PIPE, text=True,
+                          env={**os.environ, "LD_LIBRARY_PATH": str(folder.parent)})
+    assert (done.returncode, done.stdout) == (0, "[word]\n")
