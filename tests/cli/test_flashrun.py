@@ -2,6 +2,7 @@
 
 import os
 import signal
+import time
 
 import pytest
 
@@ -73,6 +74,21 @@ def test_a_plain_folder_is_simply_written(flash):
     assert (done.status, done.stdout, done.stderr) == (0, "", "")
     assert flash.box.path(f"{FOLDER}/vv.xml").read_text() == "settings"
     assert not flash.box.path("/run/flashrun.door").exists()
+
+
+@pytest.mark.unsanitized
+def test_it_adds_less_than_50_ms_to_its_command(flash):
+    def took():
+        times = []
+        for _ in range(5):
+            start = time.monotonic()
+            assert flash.run("true").status == 0
+            times.append(time.monotonic() - start)
+        return min(times)
+
+    assert took() < 0.05
+    flash.mount()
+    assert took() < 0.05
 
 
 def test_the_flash_is_writable_for_the_command_alone(flash):
