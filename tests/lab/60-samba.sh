@@ -138,3 +138,7 @@ expect_equal "the status" 0 $status
 expect_equal "the line" "winshare_reload: Samba does not run; it finds the shares when it starts" "$line"
 samba_start
 expect_has "a share" " file " "$(client Renamed ls)"
+
+# A target that is deleted takes its shares along.
+works --del -n $IQN:t2
+expect_no_share Renamed

@@ -1,19 +1,28 @@
 # timeout: 150
 # needs: package
 # The Debian packages are installed, started, used, stopped and removed. There is no service manager here: the lines
-# of the units are run as they stand.
+# of the units are run as they stand, with the capabilities that the units leave them.
 units=/lib/systemd/system
 
-# unit NAME KEY: the command of a unit.
+# unit NAME KEY: the values of a unit.
 unit() { sed -n "s/^$2=//p" "$units/$1.service"; }
 
+# as_unit NAME KEY: runs the command of a unit.
+as_unit() {
+    capabilities=$(unit "$1" CapabilityBoundingSet | tr 'A-Z ' 'a-z\n' | sed -n 's/^cap_/,+/p' | tr -d '\n')
+    # shellcheck disable=SC2046 # a list
+    exec setpriv --no-new-privs --bounding-set "-all$capabilities" $(unit "$1" "$2")
+}
+
 start() {
-    $(unit remvol-tree ExecStart) &
-    $(unit remvol-tree ExecStartPost)
-    $(unit remvol ExecStartPre)
-    $(unit remvol ExecStart)
+    (as_unit remvol-tree ExecStart) &
+    (as_unit remvol-tree ExecStartPost)
+    (as_unit remvol ExecStartPre)
+    (as_unit remvol ExecStart)
     expect_equal "the result of the start" 0 "$(result init)"
-    $(unit remvol-events ExecStart) &
+    expect_equal "the capabilities of the tree" 0000000000000000 \
+        "$(sed -n 's/^CapBnd:[[:space:]]*//p' "/proc/$(pgrep -x ktree)/status")"
+    (as_unit remvol-events ExecStart) &
     listener=$!
 }
 
@@ -22,7 +31,7 @@ tree_is_gone() { ! pgrep -x ktree; }
 stop() {
     kill $listener
     wait $listener || : # 143 when it had not begun to listen
-    $(unit remvol ExecStop)
+    (as_unit remvol ExecStop)
     wait_for 10 tree_is_gone
     expect_equal "what is mounted" "" "$(grep /mnt/VV/ /proc/mounts)"
     expect_status 21 iscsiadm -m session
