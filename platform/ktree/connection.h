@@ -14,6 +14,7 @@ struct Connection {
   int fd = -1;
   int document = -1;  // the memory file that came with the request, or -1
   bool sending = false;
+  bool last = false;   // the client has shut down its side: nothing comes after this request
   bool stuck = false;  // in the middle of a request or a reply
 
   // Receiving: `used` of the `size` bytes of a request that came in part. Sending: the bytes from `used` to

@@ -15,7 +15,7 @@ namespace {
 
 constexpr int64_t kAcceptPause = 100;  // milliseconds without accepting when descriptors ran out
 // Every event of a client is told once, when it happens.
-constexpr uint32_t kNextRequest = EPOLLIN | EPOLLET;
+constexpr uint32_t kNextRequest = EPOLLIN | EPOLLRDHUP | EPOLLET;
 constexpr uint32_t kReplyTaken = EPOLLOUT | EPOLLET;
 
 constexpr int64_t kEvictableAfter = 1000;  // a client in the middle of a request is left alone for so long
@@ -202,6 +202,7 @@ void Server::serve(Connection& connection, uint32_t events) {
     drop(connection);
     return;
   }
+  connection.last = (events & EPOLLRDHUP) != 0;
   while (receive_part(connection)) {
   }
 }
@@ -261,8 +262,11 @@ void Server::answer(Connection& connection, std::string_view bytes) {
     drop(connection);
     return;
   }
-  // A receive stops at a passed descriptor, so what follows the request may not have been seen yet.
-  if (connection.document >= 0 && has_input(connection.fd)) {
+  // A receive stops at a passed descriptor and where its buffer is full. What came behind the request by then
+  // is not told of again.
+  const bool stopped =
+      connection.document >= 0 || connection.bytes != nullptr || bytes.size() == request_.size();
+  if (stopped && has_input(connection.fd)) {
     drop(connection);
     return;
   }
@@ -316,9 +320,10 @@ void Server::continue_reply(Connection& connection) {
   }
 }
 
-// The reply has gone: the client is idle, and the last one to be dropped for others.
+// The reply has gone: the client is idle, and the last one to be dropped for others, unless it has said that
+// it sends no more.
 void Server::settle(Connection& connection) {
-  if ((connection.series.starts() || connection.sending) && !await_request(connection)) {
+  if (connection.last || ((connection.series.starts() || connection.sending) && !await_request(connection))) {
     drop(connection);
     return;
   }

@@ -149,6 +149,51 @@ def test_a_broken_frame_ends_the_connection_and_changes_nothing(daemon, request_
     assert daemon.listing() == ["/a=x"]
 
 
+@pytest.mark.parametrize("first_piece", [1, 8, 20])
+def test_the_next_request_right_behind_one_in_pieces_ends_the_connection(daemon, first_piece):
+    client = daemon.connect()
+    request_bytes = frame(SET, b"/a", b"x" * 20)
+    client.sendall(request_bytes[:first_piece])
+    assert daemon.get("/b") is None  # so the piece has been taken, and the rest comes by itself
+    client.sendall(request_bytes[first_piece:] + get_frame(b"/a"))
+    assert receive(client) is None
+    assert daemon.listing() == []
+
+
+def test_the_next_request_right_behind_the_longest_one_ends_the_connection(daemon):
+    client = daemon.connect()
+    client.setsockopt(socket.SOL_SOCKET, socket.SO_SNDBUF, 1 << 20)
+    os.kill(daemon.pid(), signal.SIGSTOP)
+    client.sendall(frame(SET, b"/" + b"x" * 1022, b"y" * 65535) + get_frame(b"/a"))
+    os.kill(daemon.pid(), signal.SIGCONT)
+    assert receive(client) is None
+    assert daemon.listing() == []
+
+
+@pytest.mark.parametrize("requests_before", [0, 100])
+def test_a_client_that_will_send_no_more_gets_its_reply_and_the_end(daemon, requests_before):
+    client = daemon.connect()
+    daemon.set("/a", "x")
+    for _ in range(requests_before):
+        assert ask(client, get_frame(b"/a")) == (0, b"x")
+    os.kill(daemon.pid(), signal.SIGSTOP)
+    client.sendall(get_frame(b"/a"))
+    client.shutdown(socket.SHUT_WR)
+    os.kill(daemon.pid(), signal.SIGCONT)
+    assert receive(client) == (0, b"x")
+    assert client.recv(1) == b""
+
+
+def test_a_client_that_will_send_no_more_gets_a_long_reply_whole(daemon):
+    daemon.set("/large", "y" * 65535)
+    client = daemon.connect()
+    client.setsockopt(socket.SOL_SOCKET, socket.SO_RCVBUF, 1)
+    client.sendall(get_frame(b"/large"))
+    client.shutdown(socket.SHUT_WR)
+    assert receive(client) == (0, b"y" * 65535)
+    assert client.recv(1) == b""
+
+
 def test_the_longest_request_is_served(daemon):
     client = daemon.connect()
     path = b"/" + b"x" * 1022
