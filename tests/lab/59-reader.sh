@@ -1,4 +1,4 @@
-# What the administration pages see while volumes are made: 20 looks a second at the tree.
+# What the administration pages see while volumes are made: some 20 looks a second at the tree.
 T=iqn.2026-01.org.example:t1
 LUN_DIR=/data/luns
 target_start
@@ -10,22 +10,22 @@ works --add -n $T -l 1 -i 10.9.0.2 -p 3260 -s s1
 works --connect -n $T
 sed -i 's/^\[defaults\]/&\n\tlazy_itable_init = 0/' /etc/mke2fs.conf # a format that takes a while
 
-# read_tree FILE: a line for every change, until the file "stop" exists.
+# read_tree FILE: the whole tree over and over until the file "stop" exists. A look takes as long as the emulated processor
+# needs to start a program, so there is no pause, and what was seen is made out afterwards.
 read_tree() {
-    last=
     until [ -e /tmp/stop ]; do
-        ktreec -S $TREE_SOCKET -t >/tmp/tree
-        now=
-        while IFS= read -r line; do
-            case $line in */id:1/lun/id:2/status=* | */id:1/lun/id:2/format_progress=* | */id:1/status=* | "$result_key="*)
-                now="$now${line#/iscsi/initiator/}
-" ;;
-            esac
-        done </tmp/tree
-        if [ "$now" != "$last" ]; then printf '%s' "$now"; fi
-        last=$now
-        sleep 0.03
+        ktreec -S $TREE_SOCKET -t
+        echo "end of look"
     done >"$1"
+}
+
+# changes FILE: of the looks, a line for every change of what the pages show.
+changes() {
+    awk -v result="$result_key=" '
+        /^end of look$/ { if (now != last) printf "%s", now; last = now; now = ""; next }
+        /\/id:1\/lun\/id:2\/(status|format_progress)=/ || /\/id:1\/status=/ || index($0, result) == 1 {
+            sub("^/iscsi/initiator/", ""); now = now $0 "\n"
+        }' "$1"
 }
 
 # watched OPTION...: runs a command that must succeed while the tree is read.
@@ -33,13 +33,17 @@ watched() {
     rm -f /tmp/stop
     result_key=/result/${1#--}
     tree_set "$result_key" "from before"
-    read_tree /tmp/seen &
+    read_tree /tmp/looks &
     reader=$!
     sleep 0.5
+    began=$(uptime_seconds)
     works "$@"
+    took=$(($(uptime_seconds) - began))
     sleep 0.5
     : >/tmp/stop
     wait $reader
+    changes /tmp/looks >/tmp/seen
+    say "$1: $(grep -c '^end of look$' /tmp/looks) looks in $took seconds"
     grep "^$result_key=" /tmp/seen | uniq >/tmp/results
     expect_equal "the result of $1 over time" "from before,,0," "$(sed 's/.*=//' /tmp/results | tr '\n' ',')"
     progress_never_falls
