@@ -22,7 +22,8 @@ std::vector<Section> shares_of(const std::vector<Volume>& volumes, const Server&
   std::vector<std::wstring> taken = server.taken;
   for (const Volume& volume : volumes) {
     const std::wstring folded = folded_name(volume.name);
-    const char* why = name_refusal(volume.name, server.names);
+    const char* why = volume.failure;
+    if (why == nullptr) why = name_refusal(volume.name, server.names);
     if (why == nullptr && std::find(taken.begin(), taken.end(), folded) != taken.end()) {
       why = "another share has this name";
     }
@@ -55,7 +56,7 @@ Reload reload_shares(const Server& server) {
   const std::vector<Section> before = parse_sections(read_file(server.file));
   std::vector<Volume> volumes;
   Reload done{};
-  done.has_tree = read_mounted_volumes(volumes);
+  done.has_tree = read_volumes(volumes);
   done.shares = done.has_tree ? shares_of(volumes, server) : still_mounted(before);
   done.gone = missing_from(done.shares, before);
   done.changed = done.shares != before;

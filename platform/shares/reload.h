@@ -26,8 +26,8 @@ struct Reload {
   std::vector<Section> gone;    // what it held before
 };
 
-// Brings the generated file up to date. A volume whose name the server cannot use is left out with a line in
-// the log, and so is a change that cannot be written.
+// Brings the generated file up to date. A volume that failed or whose name the server cannot use is left out
+// with a line in the log, and so is a change that cannot be written.
 Reload reload_shares(const Server& server);
 
 }  // namespace shares

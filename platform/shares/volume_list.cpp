@@ -14,13 +14,33 @@ bool keeps_user_attributes(const std::string& file_system) {
   return file_system != "vfat";
 }
 
+// Why a volume that is not mounted should be; null when nothing is wrong with that.
+const char* failure_of(platform::TreeReader& tree, int target, int lun) {
+  constexpr int kConnected = 1, kFailed = 3, kUnsupported = 5;
+  if (tree.number(0, "/iscsi/initiator/id:%d/conn_state", target) != kConnected) return nullptr;
+  if (tree.number(0, "/iscsi/initiator/id:%d/lun/id:%d/enable", target, lun) == 0) return nullptr;
+  switch (tree.number(0, "/iscsi/initiator/id:%d/lun/id:%d/volume_state", target, lun)) {
+    case kFailed:
+      return "it could not be made or mounted";
+    case kUnsupported:
+      return "its file system is not supported";
+    default:
+      return nullptr;
+  }
+}
+
 void read_volume(platform::TreeReader& tree, int target, int lun, std::vector<Volume>& volumes) {
   const std::string name = tree.value("/iscsi/initiator/id:%d/lun/id:%d/share", target, lun);
   const std::string path = kMountRoot + name;
-  if (name.empty() || !is_mounted(path)) return;
+  if (name.empty()) return;
+  if (!is_mounted(path)) {
+    const char* failure = failure_of(tree, target, lun);
+    if (failure != nullptr) volumes.push_back({name, path, true, false, failure});
+    return;
+  }
   const bool writable = tree.number(1, "/iscsi/initiator/id:%d/lun/id:%d/vol_access_right", target, lun) != 0;
   const std::string type = tree.value("/iscsi/initiator/id:%d/lun/id:%d/fs_type", target, lun);
-  volumes.push_back({name, path, !writable, keeps_user_attributes(type)});
+  volumes.push_back({name, path, !writable, keeps_user_attributes(type), nullptr});
 }
 
 }  // namespace
@@ -31,13 +51,14 @@ bool is_mounted(const std::string& path) {
          (entry.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
 }
 
-bool read_mounted_volumes(std::vector<Volume>& volumes) {
+bool read_volumes(std::vector<Volume>& volumes) {
   platform::TreeReader tree;
   if (!tree.answered()) return false;
+  // The slots in use are the first ones; one that was damaged must not hide those behind it.
   for (int target = 1; target <= platform::kTargets; ++target) {
-    if (tree.value("/iscsi/initiator/id:%d/target", target).empty()) break;
+    if (tree.value("/iscsi/initiator/id:%d/target", target).empty()) continue;
     for (int lun = 1; lun <= platform::kLuns; ++lun) {
-      if (tree.value("/iscsi/initiator/id:%d/lun/id:%d/lun", target, lun).empty()) break;
+      if (tree.value("/iscsi/initiator/id:%d/lun/id:%d/lun", target, lun).empty()) continue;
       read_volume(tree, target, lun, volumes);
     }
   }

@@ -12,11 +12,12 @@ struct Volume {
   std::string path;  // where it is mounted
   bool read_only;
   bool extended_attributes;  // the file system keeps user attributes of files
+  const char* failure;       // why it is not mounted although its target is connected; null when it is
 };
 
-// Puts the mounted volumes into `volumes`, in the tree's order. Returns false when the tree cannot be
-// reached; the list is then incomplete.
-bool read_mounted_volumes(std::vector<Volume>& volumes);
+// Puts the volumes that are mounted, and those that should be and failed, into `volumes`, in the tree's
+// order. Returns false when the tree cannot be reached; the list is then incomplete.
+bool read_volumes(std::vector<Volume>& volumes);
 
 // True when `path` is a mount point.
 bool is_mounted(const std::string& path);

@@ -222,6 +222,35 @@ def test_eight_volumes_of_which_one_is_broken(shares):
     assert shares.file() == HEAD + "".join(section(name) for name in names if name != "bro]ken")
 
 
+@pytest.mark.parametrize("state, why", [("3", "it could not be made or mounted"), ("5", "its file system is not supported")])
+def test_a_volume_that_failed_is_said_and_the_others_are_served(shares, state, why):
+    names = [f"V{number}" for number in range(1, 9)]
+    for name in names:
+        shares.add(name, mounted=name != "V4", enable="1", volume_state=state if name == "V4" else "0")
+        shares.box.tree.set(f"/iscsi/initiator/id:{shares.volumes}/conn_state", "1")
+    assert shares.reload() == f'winshare_reload: volume "V4" is not shared: {why}\n'
+    assert shares.file() == HEAD + "".join(section(name) for name in names if name != "V4")
+
+
+@pytest.mark.parametrize("keys", [{"conn_state": "0"}, {"conn_state": "3"}, {"lun/id:1/enable": "0"},
+                                  {"lun/id:1/volume_state": "1"}, {"lun/id:1/volume_state": "2"}])
+def test_a_volume_that_is_not_to_be_there_is_nothing_to_say(shares, keys):
+    shares.add("V", mounted=False, enable="1", volume_state="3")
+    for key, value in {"conn_state": "1", **keys}.items():
+        shares.box.tree.set(f"/iscsi/initiator/id:1/{key}", value)
+    assert shares.reload() == ""
+
+
+def test_slots_that_lost_what_was_in_them_hide_no_others(shares):
+    for name in ("A", "B", "C"):
+        shares.add(name)
+    shares.box.tree.set({"/iscsi/initiator/id:1/lun/id:3/lun": "5", "/iscsi/initiator/id:1/lun/id:3/share": "D"})
+    shares.mount("D")
+    shares.box.tree.set("/iscsi/initiator/id:2/target", "")
+    assert shares.reload() == ""
+    assert shares.file() == HEAD + section("A") + section("D") + section("C")
+
+
 def test_a_hint_when_smb_conf_does_not_include_the_shares(shares):
     shares.box.write(SMB_CONF, f"[global]\n# include = {SHARES}\n")
     shares.add("V")

@@ -19,6 +19,7 @@ expect_key id:1/lun/id:1/vol_access_right 0
 expect_key id:1/lun/id:1/status "Running ( Read Only )"
 expect_key id:1/lun/id:1/volume_state 0
 expect_not "the bare one is not mounted" mounted Bare
+expect_has "what the share service says" 'volume "Bare" is not shared: it could not be made or mounted' "$(winshare_reload 2>&1)"
 expect_key id:1/lun/id:2/volume_state 3
 expect_key id:1/lun/id:2/status "Create Volume Failed"
 expect_equal "bytes that are not zero on the bare one" 0 "$(tr -d '\0' <"$(lun_file 1 2)" | wc -c)"
