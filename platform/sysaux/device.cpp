@@ -44,7 +44,7 @@ int sys_check_dev(const char* node) {
   struct stat info;
   if (node == nullptr || stat(node, &info) != 0 || !S_ISBLK(info.st_mode)) return -1;
   const Fd device(open(node, O_RDONLY | O_CLOEXEC));
-  return device.ok() && sysaux::start_readable(device.get()) ? 0 : -1;
+  return device.ok() && sysaux::first_mebibyte_readable(device.get()) ? 0 : -1;
 }
 
 }  // extern "C"

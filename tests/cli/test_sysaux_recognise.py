@@ -111,23 +111,30 @@ def test_the_cache_of_blkid_is_never_asked(loop):
 
 def test_a_device_that_reads_only_at_its_start_is_not_empty(loop):
     disk = loop()
-    for size in (2 * MIB, MIB - 4096, 4096):
+    for size, usable in ((2 * MIB, 0), (MIB - 4096, -1), (4096, -1)):
         disk.resize(size)  # behind the device's back: it keeps its size, and reads beyond fail
-        assert call("check_dev", disk.node) == 0
+        assert call("check_dev", disk.node) == usable
         assert call("fs_type", disk.node) == (0, "unreadable")
 
 
-def test_a_device_that_does_not_read_at_its_start_is_not_usable(loop):
+@pytest.mark.parametrize("size", [MIB - 4096, MIB // 2, 4096, 0])
+def test_a_device_without_a_whole_mebibyte_to_read_is_not_usable(loop, size):
+    disk = loop()
+    make_ext(disk)  # also where the part that reads would be recognised
+    disk.resize(size)
+    assert call("check_dev", disk.node) == -1
+
+
+def test_a_device_that_does_not_read_at_its_start_has_no_type(loop):
     disk = loop()
     disk.resize(0)
     assert call("fs_type", disk.node) == -1
-    assert call("check_dev", disk.node) == -1
 
 
 def test_what_was_read_before_does_not_make_a_device_usable(loop):
     disk = loop()
     assert call("check_dev", disk.node) == 0  # the pages stay: the test holds the device open
-    disk.resize(0)
+    disk.resize(MIB - 4096)
     assert call("check_dev", disk.node) == -1
 
 
