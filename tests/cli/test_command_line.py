@@ -402,7 +402,36 @@ class TestSuccessOfChangingCommands:
         assert done.status == 255
 
 
+class TestFailureOfOtherCommands:
+    """Those that change no settings: each has its message, some that of another command."""
+
+    @pytest.mark.parametrize("command,args,text", [
+        ("search", ["-i", "10.0.0.1", "-p", "0"], "task_search() failed"),
+        ("search_lun", ["-n", "", "-c", "0", "-i", "10.0.0.1", "-p", "3260"], "task_search_lun() failed"),
+        ("system_off", [], "system_off failed"),
+        ("deinit", [], "task_deinit failed"),
+        ("oiscsi_evt_reopen", [], "task_oiscsi_evt_reopen failed"),
+        ("oiscsi_evt_recover", [], "task_oiscsi_evt_reopen failed"),
+    ])
+    def test_it_is_told_and_nothing_is_dumped(self, box, command, args, text):
+        box.debug(1)
+        for tool in ("iscsiadm", "killall", "rmmod"):
+            box.fake(tool, status=1)
+        done = box.remvol(f"--{command}", *args)
+        assert messages(done.stdout)[-1] == ("src.cpp", "main", text)
+        assert (done.status, done.lines[-1]) == (255, "execute failed.")
+        assert box.trace("dump") == []
+        assert box.trace("set", "system")[-2:] == ["system winshare_reload", f"set /result/{command}=-1"]
+
+
 class TestSuccessOfOtherCommands:
+    @pytest.mark.parametrize("command", ["init", "system_off", "deinit"])
+    def test_starting_and_stopping_copies_nothing(self, box, command):
+        for tool in ("iscsiadm", "iscsid", "killall", "rmmod", "insmod"):
+            box.fake(tool)
+        assert box.remvol(f"--{command}").status == 0
+        assert done_by_main(box, command) == [f"set /result/{command}=0", "dump /etc/NAS_CFG/vv.xml"]
+
     def test_status_prints_one_empty_line_first_and_copies_nothing(self, box):
         box.tree.set("/iscsi/initiator/count", "0")
         done = box.remvol("--status")
