@@ -1,6 +1,8 @@
 // Device numbers from sysfs, and device nodes.
 #include "volume/device.h"
 
+#include <dirent.h>
+#include <dlfcn.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -9,6 +11,18 @@
 #include "volume_fixture.h"
 
 using namespace remvol;
+
+namespace {
+
+std::string unopenable;  // a folder that cannot be opened
+
+}  // namespace
+
+// In front of the C library's.
+extern "C" DIR* opendir(const char* path) {
+  if (path == unopenable) return nullptr;
+  return reinterpret_cast<DIR* (*)(const char*)>(dlsym(RTLD_NEXT, "opendir"))(path);
+}
 
 namespace {
 
@@ -161,4 +175,13 @@ TEST_F(Device, AnAnswerThatFailsLeavesTheOneBeforeInForce) {
   std::filesystem::current_path(before);
   EXPECT_TRUE(has(log, "fail to make device node : sdb1"));
   EXPECT_TRUE(has(log, "fail to make device node : sdb2"));
+}
+
+TEST_F(Device, ADiskWhoseFolderCannotBeOpenedStillHasItsNode) {
+  write("/sys/block/sdb/dev", "8:16\n");
+  unopenable = "/sys/block/sdb";
+  const std::string log = fakes::output_of([] { EXPECT_EQ(_create_device_node("sdb"), 0); });
+  unopenable.clear();
+  EXPECT_TRUE(has(log, "can not open directory : /sys/block/sdb"));
+  EXPECT_EQ(fakes::calls(), Texts{"mknod /dev/sdb 60666 8:16"});
 }

@@ -2,10 +2,24 @@
 #include "volume/mount.h"
 
 #include <filesystem>
+#include <new>
 
 #include "volume_fixture.h"
 
 using namespace remvol;
+
+namespace {
+
+int allocations = -1;  // how many allocations that may fail are left before they do; -1: none fails
+
+}  // namespace
+
+// In front of the library's.
+void* operator new[](size_t size, const std::nothrow_t&) noexcept {
+  if (allocations == 0) return nullptr;
+  if (allocations > 0) allocations--;
+  return ::operator new[](size);
+}
 
 namespace {
 
@@ -490,4 +504,14 @@ TEST_F(Mount, ARemountOfTheLongestPathIsNotCut) {
   std::string escaped;
   for (size_t i = 0; i < path.size(); i++) escaped += "\\$";
   EXPECT_EQ(fakes::commands(), Texts{"mount -o remount \"" + escaped + "\""});
+}
+
+TEST_F(Mount, ARemountWithoutMemoryDoesNothing) {
+  for (const int left : {0, 1}) {
+    allocations = left;
+    log = fakes::output_of([] { EXPECT_EQ(remount_mnt_path("/mnt/VV/Data", 5), -1); });
+    allocations = -1;
+    EXPECT_TRUE(has(log, "malloc failed")) << left;
+    EXPECT_TRUE(fakes::calls().empty());
+  }
 }
