@@ -172,6 +172,31 @@ def test_reads_that_fail_from_one_on_never_make_a_file_system_look_empty(loop, f
         assert words[0] != "1", f"{fault} from {when} of {total} on failed: {words}"
 
 
+def write_backup_table(disk):
+    disk.sfdisk("label: gpt\n,,L\n")
+    disk.write(0, bytes(MIB))
+
+
+AT_THE_END = {
+    "raid": lambda disk: disk.write(*md_member(64 * MIB, "1.0")),
+    "zfs": lambda disk: write_zfs_labels(disk, 64 * MIB - 512 * 1024, 64 * MIB - 256 * 1024),
+    "table": write_backup_table,
+}
+
+
+@pytest.mark.parametrize("times", ["", "+"])
+@pytest.mark.parametrize("content", AT_THE_END)
+def test_failing_reads_never_hide_what_lies_at_the_end(loop, content, times):
+    disk = loop()
+    AT_THE_END[content](disk)
+    assert call("fs_type", disk.node)[0] == 0
+    total = len(calls_of("fs_type", disk.node, disk.node, "read"))
+    for when in range(1, total + 2):
+        status, words = under_fault("fs_type", disk.node, disk.node, "read", "error=EIO", f"{when}{times}")
+        assert status == 0
+        assert words[0] != "1", f"read {when}{times} of {total} failed: {words}"
+
+
 # --- the state of a file system ---
 
 
