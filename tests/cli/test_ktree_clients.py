@@ -86,7 +86,26 @@ def slow(daemon):
     return client
 
 
-BAD = [garbage, huge_length, half_a_frame, half_a_length, hang_up, hang_up_before_the_reply, silent, not_reading, slow]
+def half_closed(daemon):
+    client = daemon.connect()
+    client.sendall(get_frame(b"/good"))
+    client.shutdown(socket.SHUT_WR)
+    return client
+
+
+def too_eager(daemon):
+    """In one piece with the end of a request comes the next one."""
+    client = daemon.connect()
+    client.sendall(get_frame(b"/good")[:10])
+    try:
+        client.sendall(get_frame(b"/good")[10:] + get_frame(b"/good"))
+    except BrokenPipeError:
+        pass
+    return client
+
+
+BAD = [garbage, huge_length, half_a_frame, half_a_length, hang_up, hang_up_before_the_reply, silent, not_reading, slow,
+       half_closed, too_eager]
 
 
 def test_200_bad_clients_at_once_cost_a_good_one_nothing(daemon):
@@ -293,6 +312,21 @@ def test_when_descriptors_run_out_the_stuck_and_the_idle_make_room():
         # A connection that was dropped while idle costs its client nothing.
         assert daemon.get("/a") == b"x"
         for client in idle + more + [good, fresh]:
+            client.close()
+    finally:
+        daemon.close()
+
+
+@pytest.mark.parametrize("bad", [half_closed, too_eager])
+def test_clients_that_went_too_far_leave_their_places(bad):
+    daemon = Daemon(prefix=["prlimit", "--nofile=40:40"])
+    try:
+        crowd = [bad(daemon) for _ in range(40)]
+        good = daemon.connect()
+        assert ask(good, frame(SET, b"/a", b"x")) == (0, b"")
+        assert ask(good, get_frame(b"/a")) == (0, b"x")
+        until(lambda: open_descriptors(daemon) < 16)
+        for client in crowd + [good]:
             client.close()
     finally:
         daemon.close()
