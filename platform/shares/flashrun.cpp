@@ -4,6 +4,8 @@
 // waits; a guard in a process group of its own, which runs the command and closes the flash behind it; the
 // command, in flashrun's group. When flashrun is killed the guard goes on; when the guard is killed flashrun
 // closes the flash.
+#include <fcntl.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 #include <cerrno>
@@ -17,9 +19,24 @@
 namespace {
 
 constexpr char kFolder[] = "/usr/local/config";
+constexpr char kSettings[] = "/usr/local/config/vv.xml";
 constexpr int kUsage = 2, kCannotRun = 126, kNotFound = 127, kKilled = 128;
 
+// The settings hold secrets. A copy that is there already keeps its mode when cp writes into it, so it is
+// taken from everybody but its owner before it gets new ones.
+void protect_settings() {
+  struct stat info = {};
+  const int fd = open(kSettings, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
+  if (fd < 0) return;
+  if (fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && (info.st_mode & 077) != 0 &&
+      fchmod(fd, info.st_mode & 0700) != 0) {
+    fprintf(stderr, "flashrun: %s stays readable for others: %s\n", kSettings, strerror(errno));
+  }
+  close(fd);
+}
+
 [[noreturn]] void exec_command(char** command) {
+  protect_settings();
   if (command[1] == nullptr) {
     execl("/bin/sh", "sh", "-c", command[0], nullptr);
   } else {

@@ -68,6 +68,24 @@ def flash(bare_box):
     return Flash(bare_box)
 
 
+COPY_SETTINGS = f"cp -f /etc/NAS_CFG/vv.xml {FOLDER}/"
+
+
+@pytest.mark.parametrize("mounted", [False, True])
+@pytest.mark.parametrize("before", [None, 0o644, 0o600])
+def test_the_copy_of_the_settings_is_for_root_alone(flash, mounted, before):
+    """Also where one that everybody could read is there already, which cp would leave as open as it was."""
+    if mounted:
+        flash.mount("rw")
+    if before is not None:
+        flash.sh(f"echo old >{FOLDER}/vv.xml; chmod {before:o} {FOLDER}/vv.xml")
+    if mounted:
+        flash.sh(f"/bin/mount -o remount,ro {FOLDER}")
+    flash.sh("mkdir -p /etc/NAS_CFG; umask 077; echo new >/etc/NAS_CFG/vv.xml")
+    assert flash.run(COPY_SETTINGS).status == 0
+    assert flash.sh(f"cat {FOLDER}/vv.xml; stat -c %a {FOLDER}/vv.xml") == "new\n600\n"
+
+
 def test_a_plain_folder_is_simply_written(flash):
     flash.box.write("/vv.xml", "settings")
     done = flash.run(f"cp -f /vv.xml {FOLDER}/")
