@@ -1,4 +1,3 @@
-# timeout: 150
 # needs: samba
 # Volumes as Samba shares: a client on another machine writes and reads over the network, is refused what it may not
 # do, and is put off when a volume goes. Samba is set up as the operator's guide says.

@@ -1,4 +1,4 @@
-# timeout: 240
+# timeout: 500
 # The event listener alone: nobody runs a command while the cable is cut and put back, and the volume is writable again.
 # Also when the listener died in the meantime.
 T=$IQN:t1

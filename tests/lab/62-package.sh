@@ -1,4 +1,3 @@
-# timeout: 150
 # needs: package
 # The Debian packages are installed, started, used, stopped and removed. There is no service manager here: the lines
 # of the units are run as they stand, with the capabilities that the units leave them.
