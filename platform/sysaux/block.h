@@ -28,12 +28,8 @@ bool read_line_at(int dir, const char* name, char* text, size_t size);
 // Reads the decimal number in the file `name` in the directory `dir`. Returns false when there is none.
 bool read_number_at(int dir, const char* name, long long* value);
 
-// Reads the first page of the open device from the device itself (what was read of it before is dropped).
-// Returns true when it came and the device has a mebibyte at least.
-bool start_readable(int fd);
-
-// Reads the first mebibyte of the open device from the device itself (pages that were read before are
-// dropped). Returns true when all of it came; a device that is smaller gives false.
+// Reads the first mebibyte of the open device from the device itself, whatever was read of it before. Returns
+// true when all of it came; a device that is smaller gives false.
 bool first_mebibyte_readable(int fd);
 
 }  // namespace sysaux

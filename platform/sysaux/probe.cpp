@@ -88,9 +88,9 @@ int sysaux_probe_fs_type(char* out, const char* node) {
   read_ahead(device.get());
   const Content content = recognise(device.get(), out);
   if (content != Content::nothing && content != Content::unreadable) return 0;
-  if (!start_readable(device.get())) return -1;  // sys_check_dev does not accept it either
-  // Where a read failed further on, the node must not look empty, because an empty one is formatted.
-  if (content == Content::nothing && first_mebibyte_readable(device.get())) return 1;
+  if (!first_mebibyte_readable(device.get())) return -1;  // sys_check_dev does not accept it either
+  if (content == Content::nothing) return 1;
+  // A read failed further on: the node must not look empty, because an empty one is formatted.
   strcpy(out, "unreadable");
   return 0;
 }

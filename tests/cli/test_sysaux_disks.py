@@ -251,7 +251,7 @@ def test_a_locked_disk_is_waited_for(loop):
 def test_a_bad_spot_in_the_first_mebibyte_is_enough_to_refuse(loop):
     """Where no signature is looked for, too."""
     disk = loop()
-    assert under_fault("create", disk.node, disk.node, "pread64", "error=EIO", "12+") == (0, ["-1"])
+    assert under_fault("create", disk.node, disk.node, "preadv", "error=EIO", "1") == (0, ["-1"])
     assert disk.partitions() == {} and disk.digest() == loop().digest()
 
 
@@ -626,7 +626,7 @@ def test_a_write_protected_disk_is_not_grown(loop):
 
 # --- faults and kills at every system call ---
 
-SYSCALLS = ["openat", "read", "pread64", "write", "fsync", "ioctl", "flock"]
+SYSCALLS = ["openat", "read", "pread64", "preadv", "write", "fsync", "ioctl", "flock"]
 
 
 @pytest.mark.parametrize("fault", SYSCALLS)
