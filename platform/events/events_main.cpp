@@ -103,7 +103,8 @@ void take_signals(Daemon& daemon) {
   while (read(daemon.signals, &info, sizeof info) == sizeof info) {
     if (info.ssi_signo != SIGCHLD) daemon.ended = true;
   }
-  for (pid_t child; (child = waitpid(-1, nullptr, WNOHANG)) > 0;) daemon.targets.ended(child);
+  int status = 0;
+  for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) daemon.targets.ended(child, status != 0);
 }
 
 // Takes all that waits on a socket; `take(message, size)` gets each message.

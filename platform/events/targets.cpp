@@ -9,6 +9,9 @@ namespace {
 // more than a logout may take.
 constexpr int kSuspectLooks = 600;
 
+constexpr int kMostRetries = 3;
+constexpr int kRetryPause = 3;  // looks, a second apart when nothing else happens
+
 struct Links {
   bool any = false, any_down = false, all_up = true;
 };
@@ -39,6 +42,7 @@ Targets::Target& Targets::find(const std::string& name) {
 void Targets::order_reopen(Target& target) {
   target.wants_reopen = true;
   target.wants_recover = false;
+  target.retries = target.pause = 0;
 }
 
 void Targets::take(const KernelEvent& event, const std::vector<Session>& sessions) {
@@ -57,8 +61,9 @@ void Targets::settle(Target& target, const std::vector<Session>& sessions) {
   const Links links = links_of(target.name, sessions);
   target.present = links.any;
   if (target.suspect > 0) --target.suspect;
+  if (target.pause > 0 && --target.pause == 0) target.wants_recover = links.any;
   if (!links.any) {
-    target.suspect = 0;
+    target.suspect = target.pause = 0;
     target.answered = false;
   } else if (links.any_down) {
     if (!target.lost) order_reopen(target);
@@ -94,6 +99,7 @@ bool Targets::next(Order& order) {
     order = {target.name, target.wants_reopen ? Action::kReopen : Action::kRecover};
     (target.wants_reopen ? target.wants_reopen : target.wants_recover) = false;
     target.busy = true;
+    target.recovering = order.action == Action::kRecover;
     return true;
   }
   return false;
@@ -105,9 +111,17 @@ void Targets::started(const std::string& target, pid_t process) {
   chosen.busy = process > 0;
 }
 
-void Targets::ended(pid_t process) {
+void Targets::ended(pid_t process, bool failed) {
   for (Target& target : targets_) {
-    if (target.busy && target.process == process) target.busy = false;
+    if (!target.busy || target.process != process) continue;
+    target.busy = false;
+    if (!target.recovering) continue;
+    if (!failed) {
+      target.retries = 0;
+    } else if (!target.lost && target.retries < kMostRetries) {
+      target.retries++;
+      target.pause = kRetryPause;
+    }
   }
 }
 
@@ -116,7 +130,7 @@ Hurry Targets::hurry() const {
   for (const Target& target : targets_) {
     if (!target.present) continue;
     if (target.suspect > 0 || target.answered) return Hurry::kMuch;
-    if (target.lost) hurry = Hurry::kSome;
+    if (target.lost || target.pause > 0) hurry = Hurry::kSome;
   }
   return hurry;
 }

@@ -40,8 +40,9 @@ class Targets {
   bool next(Order& order);
   void started(const std::string& target, pid_t process);
 
-  // The process has ended (or could not be started: -1 as given to started()).
-  void ended(pid_t process);
+  // The process has ended. A recovery that failed is tried again some seconds later, a few times: runs that
+  // come together wait for each other only so long.
+  void ended(pid_t process, bool failed);
 
   Hurry hurry() const;
 
@@ -54,7 +55,10 @@ class Targets {
     bool lost = false;          // reopening, as the tool was told
     bool wants_reopen = false;  // orders not yet given, in this order
     bool wants_recover = false;
-    bool busy = false;  // an order is being run
+    int retries = 0;          // of a recovery that failed
+    int pause = 0;            // looks until it is tried again; 0: it is not to be
+    bool busy = false;        // an order is being run
+    bool recovering = false;  // the order is a recovery
     pid_t process = -1;
   };
 

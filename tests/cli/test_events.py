@@ -80,6 +80,11 @@ class Events:
 
         self.box.wait_until(idle, what="the listener being idle")
 
+    def asleep_for_good(self):
+        """True when only an event can wake the listener: it has no time limit to its poll(2)."""
+        call = self.box.path(f"/proc/{self.daemon.pid}/syscall").read_text().split()
+        return len(call) > 3 and int(call[3], 16) & 0xFFFFFFFF == 0xFFFFFFFF
+
     def wait_runs(self, *expected):
         """Waits until the tool has been run that often, and compares."""
         self.box.wait_until(lambda: len(self.runs) >= len(expected), what=f"{expected}, ran {self.runs}")
@@ -254,6 +259,28 @@ def test_a_recovery_that_the_next_loss_overtakes_is_left_out(connected):
     connected.wait_runs(reopen("iqn.a"), reopen("iqn.a"))
     connected.state(1, "LOGGED_IN")
     connected.wait_runs(reopen("iqn.a"), reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_a_recovery_that_failed_is_tried_again(connected):
+    connected.box.fake("remvol", "--oiscsi_evt_recover", status=255, times=2)
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    connected.state(1, "LOGGED_IN")
+    connected.send(login_response(1))
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"), recover("iqn.a"), recover("iqn.a"))
+    connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end of the retries")
+
+
+def test_a_reopen_that_failed_is_not_tried_again(connected):
+    connected.box.fake("remvol", "--oiscsi_evt_reopen", status=255)
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    connected.state(1, "LOGGED_IN")
+    connected.send(login_response(1))
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+    connected.box.wait_until(lambda: connected.asleep_for_good(), what="no retry")
 
 
 def test_a_burst_of_eight_targets_loses_nothing(events):
