@@ -76,6 +76,9 @@ Endpoint::~Endpoint() {
     remove(pid_);
     close(folder_);
   }
+  if (pid_file_ >= 0) {
+    close(pid_file_);
+  }
   if (listener_ >= 0) {
     close(listener_);
   }
@@ -145,19 +148,18 @@ bool Endpoint::listen_on(const std::string& socket_path) {
 }
 
 // Writes the number into a file of another name first: whoever sees the pid file finds a whole number in it.
+// The file stays open, or a successor's could get the number of its inode.
 bool Endpoint::write_pid() {
   char text[24];
   const int length = snprintf(text, sizeof text, "%ld\n", static_cast<long>(getpid()));
   const std::string temporary = pid_.name + ".new";
   unlinkat(folder_, temporary.c_str(), 0);
-  const int fd =
-      openat(folder_, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
-  if (fd < 0) {
+  pid_file_ = openat(folder_, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
+  if (pid_file_ < 0) {
     return false;
   }
-  const bool written = write(fd, text, static_cast<size_t>(length)) == length;
-  const bool closed = close(fd) == 0;
-  if (written && closed && renameat(folder_, temporary.c_str(), folder_, pid_.name.c_str()) == 0) {
+  const bool written = write(pid_file_, text, static_cast<size_t>(length)) == length;
+  if (written && renameat(folder_, temporary.c_str(), folder_, pid_.name.c_str()) == 0) {
     return remember(pid_, pid_.name);
   }
   const int reason = errno;

@@ -39,6 +39,7 @@ class Endpoint {
 
   int folder_ = -1;
   int listener_ = -1;
+  int pid_file_ = -1;
   OwnFile socket_;
   OwnFile pid_;
 };

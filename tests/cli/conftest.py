@@ -12,9 +12,11 @@ from harness import Box, build_folder  # noqa: E402
 
 def pytest_configure(config):
     config.addinivalue_line("markers", "unsanitized: says nothing about a build with sanitizers, and is left out there")
+    config.addinivalue_line("markers", "long: waits for half a minute, and starts first so that nothing waits for it")
 
 
 def pytest_collection_modifyitems(config, items):
+    items.sort(key=lambda item: item.get_closest_marker("long") is None)
     if "REMVOL_SANITIZE:STRING=\n" in build_folder().joinpath("CMakeCache.txt").read_text():
         return
     left_out = [item for item in items if item.get_closest_marker("unsanitized")]

@@ -258,6 +258,7 @@ def test_a_reply_is_kept_for_a_slow_reader(daemon):
         assert data[8:] == b"y" * 65535
 
 
+@pytest.mark.long
 def test_a_half_frame_or_an_unread_reply_is_given_up_after_30_seconds(daemon):
     daemon.set("/large", "y" * 65535)
     patient = daemon.connect()

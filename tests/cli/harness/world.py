@@ -212,9 +212,10 @@ class Box:
             if entry.name.isdigit() and entry.name != "1":
                 try:
                     words = (entry / "cmdline").read_bytes().rstrip(b"\0").split(b"\0")
+                    ended = (entry / "stat").read_text().rpartition(") ")[2][0] in "ZX"
                 except OSError:
                     continue
-                if words != [b""]:
+                if not ended:  # one that is about to execute a program has no words for a moment
                     found[int(entry.name)] = [word.decode("utf-8", "replace") for word in words]
         return found
 
@@ -226,10 +227,11 @@ class Box:
             time.sleep(0.002)
 
     def wait_quiet(self, timeout=TIMEOUT):
-        def quiet():
+        def only_trees():
             return all(os.path.basename(argv[0]) == "ktree" for argv in self.processes().values())
 
-        self.wait_until(quiet, timeout, "quiet")
+        # A process may start another and end while they are being listed, and neither is seen; but not again and again.
+        self.wait_until(lambda: all(only_trees() for _ in range(3)), timeout, "quiet")
 
     # --- the script ---
 
