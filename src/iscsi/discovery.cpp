@@ -8,6 +8,7 @@
 #include "frontend/log.h"
 #include "frontend/request.h"
 #include "iscsi/iface.h"
+#include "iscsi/iscsiadm.h"
 #include "iscsi/result_daemon.h"
 #include "iscsi/session_check.h"
 #include "iscsi/session_listing.h"
@@ -41,9 +42,7 @@ PathText discovery_path() {
 // Asks the portal for its targets. Returns whether the command succeeded.
 bool discover(const char* address, int port, const char* iface, const char* path, Caller caller) {
   clear_temp_path(path);
-  return run_command(CommandText("iscsiadm -m discovery -t sendtargets -p %s:%d -I %s > %s", address, port,
-                                 iface, path),
-                     caller) == 0;
+  return run_command(discovery_command(address, port, iface, path), caller) == 0;
 }
 
 // Reads the names that lines of the requested address show, in ascending order. The same name stays as often

@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "frontend/log.h"
+#include "iscsi/iscsiadm.h"
 #include "support/command.h"
 #include "support/lan.h"
 #include "support/net.h"
@@ -39,10 +40,8 @@ constexpr IfaceRecord kIfaceRecords[] = {
 // used.
 int _set_iface_config(const char* iface, const char* /*mac*/, const char* netif) {
   if (iface == nullptr || iface[0] == '\0' || netif == nullptr || netif[0] == '\0') return kFailed;
-  run_command(CommandText("iscsiadm -m iface -I %s --op=new", iface));
-  const CommandText update("iscsiadm -m iface -I %s --op=update -n iface.net_ifacename -v \"%s\"", iface,
-                           netif);
-  return run_command(update) == 0 ? kOk : kFailed;
+  run_command(new_iface_command(iface));
+  return run_command(bind_iface_command(iface, netif)) == 0 ? kOk : kFailed;
 }
 
 bool answers_from(const char* address, const char* netif, Caller caller) {

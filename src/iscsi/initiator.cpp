@@ -7,6 +7,7 @@
 #include "iscsi/daemon.h"
 #include "iscsi/iface.h"
 #include "iscsi/initiator_name.h"
+#include "iscsi/iscsiadm.h"
 #include "iscsi/node.h"
 #include "support/command.h"
 #include "support/files.h"
@@ -139,7 +140,7 @@ int task_init() {
 int task_deinit(int system_off) {
   LOG(2, system_off != 0 ? "system off" : "deinit start");
   Target_umount_all();
-  run_command("iscsiadm -m node -u");
+  run_command(kLogoutAllCommand);
   LOG(1, "killall -SIGTERM iscsid ");
   bool succeeded = run_command("killall -SIGTERM iscsid") == 0;
   LOG(2, "deinit end");

@@ -8,6 +8,7 @@
 #include "frontend/log.h"
 #include "frontend/request.h"
 #include "iscsi/iface.h"
+#include "iscsi/iscsiadm.h"
 #include "iscsi/session.h"
 #include "iscsi/session_check.h"
 #include "support/command.h"
@@ -24,9 +25,6 @@
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
-// Some commands put the target name between double quotes and some do not. What watches this tool's commands
-// knows them so.
-
 namespace remvol {
 
 namespace {
@@ -41,44 +39,23 @@ constexpr int kTakeOverSeconds = 30;
 // session stays then: logging it out would pull its disks from under mounted volumes.
 constexpr char kAlreadyExists[] = "initiator reported error (15 - already exists)";
 
-// Sets one authentication setting of a node record. Returns 0, or the status of the command that failed.
-int update_auth(const TargetEntry* entry, const char* iface, const char* setting_and_value, Caller caller) {
-  return run_command(
-      CommandText("iscsiadm -m node -I %s -T \"%s\" -p %s:%d -o update -n node.session.auth.%s", iface,
-                  entry->target_name, entry->ip, entry->port, setting_and_value),
-      caller);
-}
-
 // Returns the result of the last setting alone, as 0 or -1.
-int _target_chap_gen(const TargetEntry* entry, const char* iface) {
-  if (entry == nullptr || iface == nullptr || iface[0] == '\0') return kFailed;
-  if (entry->chap != 1) {
-    const CommandText command(
-        "iscsiadm -m node -I %s -T %s -p %s:%d -o update -n node.session.auth.authmethod -v None", iface,
-        entry->target_name, entry->ip, entry->port);
-    return run_command(command) == 0 ? kOk : kFailed;
-  }
-  update_auth(entry, iface, "authmethod -v CHAP", Caller());
-  update_auth(entry, iface, Text<256>("username -v \"%s\"", entry->chap_name), Caller());
-  const int status = update_auth(entry, iface, Text<256>("password -v \"%s\"", entry->chap_pwd), Caller());
-  return status == 0 ? kOk : kFailed;
+int _target_chap_gen(const TargetEntry* entry) {
+  if (entry == nullptr || entry->iface[0] == '\0') return kFailed;
+  if (entry->chap != 1) return run_command(no_auth_command(*entry)) == 0 ? kOk : kFailed;
+  run_command(chap_method_command(*entry));
+  run_command(chap_user_command(*entry));
+  return run_command(chap_secret_command(*entry)) == 0 ? kOk : kFailed;
 }
 
 int _target_chap_apply(TargetEntry* entry) {
   if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
-  _target_chap_gen(entry, entry->iface);
+  _target_chap_gen(entry);
   return kOk;
 }
 
-int run_node_command(const TargetEntry* entry, const char* operation, Caller caller) {
-  return run_command(CommandText("iscsiadm -m node -I %s -T %s -p %s:%d -o %s", entry->iface,
-                                 entry->target_name, entry->ip, entry->port, operation),
-                     caller);
-}
-
 int log_out(const TargetEntry* entry, Caller caller) {
-  const CommandText command("iscsiadm -m node -T \"%s\" --logout", entry->target_name);
-  return run_command(command, caller) == 0 ? 0 : 1;
+  return run_command(logout_command(entry->target_name), caller) == 0 ? 0 : 1;
 }
 
 // Reads the output of a login until it says that a session to this node is already open.
@@ -97,20 +74,18 @@ bool confirm_login(const char* name, Caller caller) {
   return false;
 }
 
-int _target_connect_run(const char* name, const char* address, int port, const char* iface,
-                        bool handle_exists) {
-  if (name == nullptr || address == nullptr || iface == nullptr) return kFailed;
-  if (port < kMinPort || port > kMaxPort) return kFailed;
-  const CommandText login("iscsiadm -m node -T %s -p %s:%d -I %s --login", name, address, port, iface);
+int _target_connect_run(const TargetEntry& entry) {
+  if (entry.port < kMinPort || entry.port > kMaxPort) return kFailed;
+  const CommandText login = login_command(entry);
   LOG(1, "try to login - cmd: %s \n", login.c_str());
   FILE* output = popen(login, "r");
   if (output == nullptr) return 1;
-  if (handle_exists && login_found_session(output)) {
-    run_command(CommandText("iscsiadm -m node -T \"%s\" -p %s:%d --logout", name, address, port));
-    run_command(CommandText("iscsiadm -m node -T \"%s\" -p %s:%d -I %s --login", name, address, port, iface));
+  if (login_found_session(output)) {
+    run_command(portal_logout_command(entry));
+    run_command(login_again_command(entry));
   }
   pclose(output);
-  return confirm_login(name, Caller()) ? 0 : 1;
+  return confirm_login(entry.target_name, Caller()) ? 0 : 1;
 }
 
 // Returns whether one of the target's volumes is mounted: the appliance is running, and the session was there
@@ -159,19 +134,19 @@ bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
 
 int Target_Config_Gen(TargetEntry* entry) {
   if (_target_record_delete(entry) != kOk) return kFailed;
-  run_node_command(entry, "new", Caller());
+  run_command(new_node_command(*entry));
   return _target_chap_apply(entry);
 }
 
 int _target_record_delete(TargetEntry* entry) {
   if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
-  run_node_command(entry, "delete", Caller());
+  run_command(delete_node_command(*entry));
   return kOk;
 }
 
 int _target_login(TargetEntry* entry) {
   if (get_iface_name(entry) != kOk || entry->iface[0] == '\0') return kFailed;
-  return _target_connect_run(entry->target_name, entry->ip, entry->port, entry->iface, true);
+  return _target_connect_run(*entry);
 }
 
 int Target_Connect(TargetEntry* entry) {

@@ -7,6 +7,7 @@
 
 #include "frontend/log.h"
 #include "frontend/request.h"
+#include "iscsi/iscsiadm.h"
 #include "iscsi/session_check.h"
 #include "iscsi/session_listing.h"
 #include "support/files.h"
@@ -72,7 +73,7 @@ PathText draw_temp_path(const char* user) {
 // Lists the sessions in detail into the drawn file `path`, which a listing without result does not leave
 // behind.
 int list_in_detail(const char* path, Caller caller) {
-  const CommandText command("iscsiadm -m session -P 3 >%s 2>&1", path);
+  const CommandText command = session_luns_command(path);
   LOG_AT(caller, 2, "run cmd: %s", command.c_str());
   const int listed = list_sessions(command, path, caller);
   if (listed != 0) _remove_file(path);
@@ -156,7 +157,7 @@ int ktree_update_dev(TargetEntry* entry) {
   const Caller caller;
   LOG(2, "start");
   const PathText path("/tmp/%s.tmp", program_name());
-  const int listed = list_sessions(CommandText("iscsiadm -m session -P3 >%s 2>&1", path.c_str()), path);
+  const int listed = list_sessions(session_devices_command(path), path);
   // No session at all changes nothing: the stored device names stay.
   if (listed != 0) return listed < 0 ? listed : kOk;
   const int cleaned = ktree_clean_target_dev(entry);

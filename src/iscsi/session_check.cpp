@@ -3,6 +3,7 @@
 #include <cstdlib>
 
 #include "frontend/request.h"
+#include "iscsi/iscsiadm.h"
 #include "iscsi/session_listing.h"
 #include "support/command.h"
 #include "support/files.h"
@@ -24,7 +25,7 @@ int list_sessions(const char* command, const char* path, Caller caller) {
 int check_target_connected(const char* name) {
   if (name == nullptr || name[0] == '\0') return kFailed;
   const Text<512> path("/tmp/%s_session.tmp", program_name());
-  const int listed = list_sessions(CommandText("iscsiadm -m session >%s 2>&1", path.c_str()), path);
+  const int listed = list_sessions(sessions_command(path), path);
   if (listed != 0) return listed < 0 ? listed : kOk;
   File file(fopen(path, "re"));
   if (file == nullptr) return 0;

@@ -4,6 +4,7 @@
 
 #include "frontend/log.h"
 #include "frontend/request.h"
+#include "iscsi/iscsiadm.h"
 #include "iscsi/node.h"
 #include "iscsi/session.h"
 #include "support/command.h"
@@ -80,7 +81,7 @@ int _disconnect_all(Caller caller = Caller()) {
   LOG_AT(caller, 1, "update share folder status");
   reload_share_services();
   LOG_AT(caller, 1, "finish share folder status");
-  return run_command("iscsiadm -m node -u", caller) == 0 ? kOk : 1;
+  return run_command(kLogoutAllCommand, caller) == 0 ? kOk : 1;
 }
 
 int _disconnect_requested() {

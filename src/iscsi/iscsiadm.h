@@ -1,0 +1,49 @@
+// The commands that drive iscsiadm(8): every text of them stands here.
+//
+// Some put the target name between double quotes and some do not. What watches this tool's commands knows
+// them so.
+#ifndef REMVOL_ISCSI_ISCSIADM_H
+#define REMVOL_ISCSI_ISCSIADM_H
+
+#include "support/text.h"
+#include "tree/record.h"
+
+namespace remvol {
+
+// Logs out of every session.
+inline constexpr char kLogoutAllCommand[] = "iscsiadm -m node -u";
+
+// Makes an interface record, and binds it to the network port `netif`.
+CommandText new_iface_command(const char* iface);
+CommandText bind_iface_command(const char* iface, const char* netif);
+
+// Writes the targets that the portal offers into the file `path`.
+CommandText discovery_command(const char* address, int port, const char* iface, const char* path);
+
+// Writes the sessions into the file `path`: a line each; with their disks, for the stored device names; with
+// their disks, for a target's LUNs.
+CommandText sessions_command(const char* path);
+CommandText session_devices_command(const char* path);
+CommandText session_luns_command(const char* path);
+
+// Makes or deletes the node record of the entry's target, portal and interface.
+CommandText new_node_command(const TargetEntry& entry);
+CommandText delete_node_command(const TargetEntry& entry);
+
+// Set one authentication setting of the node record each.
+CommandText no_auth_command(const TargetEntry& entry);
+CommandText chap_method_command(const TargetEntry& entry);
+CommandText chap_user_command(const TargetEntry& entry);
+CommandText chap_secret_command(const TargetEntry& entry);
+
+// Logs in to the target; the second form is the one after `portal_logout_command` gave up a stale session.
+CommandText login_command(const TargetEntry& entry);
+CommandText portal_logout_command(const TargetEntry& entry);
+CommandText login_again_command(const TargetEntry& entry);
+
+// Logs out of every session to the target called `name`.
+CommandText logout_command(const char* name);
+
+}  // namespace remvol
+
+#endif
