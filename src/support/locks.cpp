@@ -1,8 +1,6 @@
 #include "support/locks.h"
 
 #include <fcntl.h>
-#include <sys/ipc.h>
-#include <sys/sem.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -21,16 +19,6 @@ namespace {
 // Results of the record-lock operations.
 enum LockResult : int { kHeldElsewhere = -1, kBadDescriptor = -2, kLockError = -10 };
 
-constexpr key_t kFormatSemKey = 90111;
-constexpr int kFormatSemMode = 0666;
-
-// semctl(2) leaves the definition of its fourth argument to the caller.
-union semun {
-  int val;
-  semid_ds* buf;
-  unsigned short* array;
-};
-
 // Sets `type` (F_WRLCK or F_UNLCK) on the whole file without blocking. Returns 0 or a LockResult; errno
 // stays.
 int set_record_lock(int fd, short type) {
@@ -44,41 +32,6 @@ int set_record_lock(int fd, short type) {
 
 int open_lock_file(const char* path) {
   return open(path, O_RDWR | O_CREAT | O_CLOEXEC, 0600);
-}
-
-int change_semaphore(int sem_id, short by) {
-  sembuf operation{0, by, SEM_UNDO};
-  return semop(sem_id, &operation, 1);
-}
-
-// Makes the semaphore set and gives it its value. The create is not exclusive: two runs that found it missing
-// at the same moment may both set the value, and both format then. That costs memory and time, not data,
-// since they format different volumes.
-int create_format_sem(int initial, Caller caller) {
-  LOG_AT(caller, 2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
-  const int sem_id = semget(kFormatSemKey, 1, IPC_CREAT | kFormatSemMode);
-  if (sem_id == -1) {
-    LOG_AT(caller, 0, "semget(..., IPC_CREATE ) failed");
-    return -1;
-  }
-  semun value{};
-  value.val = initial > 0 ? initial : 1;
-  LOG_AT(caller, 2, "try to semctl(%d,0,SETVAL, %d )", sem_id, value.val);
-  if (semctl(sem_id, 0, SETVAL, value) != -1) return sem_id;
-  LOG_AT(caller, 0, "semctl() failed, errno = %d", errno);
-  semctl(sem_id, 0, IPC_RMID);
-  return -1;
-}
-
-// Returns the id of the format semaphore, made when missing, or -1.
-int find_format_sem(int initial, Caller caller) {
-  const int sem_id = semget(kFormatSemKey, 1, kFormatSemMode);
-  if (sem_id != -1) return sem_id;
-  const int error = errno;
-  LOG_AT(caller, 0, "semget(...) == -1, errno = %d", error);
-  if (error == ENOENT || error == EIDRM) return create_format_sem(initial, caller);
-  LOG_AT(caller, 0, "semget() failed");
-  return -1;
 }
 
 }  // namespace
@@ -149,37 +102,6 @@ int unlock_flock(int fd) {
   if (result == kLockError) LOG(2, "others fail");
   close(fd);
   return result;
-}
-
-int format_sem_P(int* sem_id, int initial) {
-  const int found = find_format_sem(initial, Caller());
-  if (found == -1) return -1;
-  *sem_id = found;
-  LOG(2, "get sem_id = %d", found);
-  LOG(2, "try to get a sem, sem_id = %d, trying......", found);
-  if (change_semaphore(found, -1) != 0) {
-    LOG(0, "set sem failed");
-    return -2;
-  }
-  LOG(1, "pid = %lu, go into format critical section ...", static_cast<unsigned long>(getpid()));
-  return 0;
-}
-
-int format_sem_V(int* sem_id) {
-  const int waiting = semctl(*sem_id, 0, GETNCNT);
-  LOG(2, "fmt_semncnt = %d", waiting);
-  if (waiting < 1) {
-    LOG(2, "try to remove a sem,sem_key = %d, using sem_id = %d, trying......", kFormatSemKey, *sem_id);
-    if (semctl(*sem_id, 0, IPC_RMID) == 0) {
-      *sem_id = -1;
-      return 0;
-    }
-    LOG(0, "remove sem_id failed, errno = %d", errno);
-  }
-  LOG(2, "try to RELEASE a sem, sem_id = %d, trying......", *sem_id);
-  if (change_semaphore(*sem_id, 1) == 0) return 0;
-  LOG(0, "release sem failed");
-  return -2;
 }
 
 }  // namespace remvol

@@ -1,5 +1,4 @@
-// Exclusion between runs of the tool: record locks on files, and the format semaphore. The kernel releases
-// all of them when a process dies.
+// Exclusion between runs of the tool: record locks on files. The kernel releases them when a process dies.
 #ifndef REMVOL_SUPPORT_LOCKS_H
 #define REMVOL_SUPPORT_LOCKS_H
 
@@ -26,13 +25,6 @@ int wait_flock(const char* path, int max_retries, int max_wait_us);
 
 // Releases a lock of wait_flock and closes `fd` in every case. Returns 0, -1, -2 or -10.
 int unlock_flock(int fd);
-
-// Makes the format semaphore when missing and waits for it. Returns 0; -1 when it cannot be had, -2 when the
-// wait failed.
-int format_sem_P(int* sem_id, int initial);
-
-// Leaves the format semaphore, or removes it when nobody waits (`sem_id` is then -1). Returns 0 or -2.
-int format_sem_V(int* sem_id);
 
 }  // namespace remvol
 

@@ -6,7 +6,7 @@
 #include <cstring>
 
 #include "frontend/log.h"
-#include "support/locks.h"
+#include "support/format_semaphore.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/state.h"

@@ -86,6 +86,35 @@ def test_a_new_format_after_the_last(box):
     assert box.trace("semctl").count("semctl SETVAL 1") == 3
 
 
+def test_a_strangers_semaphore_is_no_hindrance(box):
+    """It has the value 0, so whoever waited for it would wait for ever."""
+    stranger = "import ctypes, os; os.setuid(12345); print(ctypes.CDLL(None).semget(90111, 1, 0o1666))"
+    assert box.run(["/usr/bin/python3", "-c", stranger]).stdout != "-1\n"
+    assert drive(box, "pass", "/tmp/inside").result == 0
+    assert semaphores(box) == []
+
+
+def test_a_second_lun_is_not_kept_waiting_by_the_first(box):
+    """A format that could not write leaves the semaphore to its process, which has the next one to do."""
+    box.tree.set({f"/iscsi/initiator/id:1/{key}": value for key, value in {
+        "target": "iqn.t1", "lun/id:1/lun": 0, "lun/id:1/share": "a", "lun/id:1/dev": "sdb",
+        "lun/id:2/lun": 1, "lun/id:2/share": "b", "lun/id:2/dev": "sdc"}.items()})
+    for disk in ("sdb", "sdc"):
+        box.hook("sys_get_disk_space", f"/dev/{disk}", ret=256 << 20)
+        box.hook("sys_get_partition_list", f"/dev/{disk}", ret=1, out=f"{disk}1")
+        box.hook("sys_get_partition_size", f"{disk}1", ret=256 << 20)
+        box.hook("sys_check_dev", f"/dev/{disk}1")
+        box.hook("sys_get_fs_type", f"/dev/{disk}1", ret=1)
+        box.write(f"/dev/{disk}", "")
+    box.fake("fuser")
+    box.fake("dd", "if=/dev/zero of=/dev/sdb1", status=1)
+    box.fake("dd")
+    box.fake("mke2fs")
+    drive(box, "mount_all", 1)
+    assert [call[-1] for call in box.runs("mke2fs")] == ["/dev/sdc1"]
+    assert semaphores(box) == []
+
+
 # --- the recover lock and that of its queue ---
 
 

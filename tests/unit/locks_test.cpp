@@ -1,5 +1,4 @@
-// Record locks and the format semaphore: results, messages, tries. Several real runs at once are in the
-// command line tests.
+// Record locks: results, messages, tries. Several real runs at once are in the command line tests.
 #include "support/locks.h"
 
 #include <fcntl.h>
@@ -185,92 +184,4 @@ TEST_F(Locks, NegativeBoundsCountAsZero) {
 TEST_F(Locks, AFileThatCannotBeOpened) {
   EXPECT_EQ(call([] { return wait_flock(kPath, 3, 100000); }), -108);
   EXPECT_EQ(errors, "");
-}
-
-// --- the format semaphore ---
-
-TEST_F(Locks, TheFirstFormatMakesTheSemaphoreAndTheLastRemovesIt) {
-  int sem_id = -1;
-  EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), 0);
-  EXPECT_EQ(fakes::calls(),
-            (Texts{"semget 90111 1 666", "semget 90111 1 1666", "semctl SETVAL 1", "semop -1 SEM_UNDO"}));
-  EXPECT_GE(sem_id, 0);
-  EXPECT_TRUE(has(log, "semget(...) == -1, errno = 2"));
-  EXPECT_TRUE(has(log, "try to semget(90111 1, 0666 | IPC_CREATE )"));
-  EXPECT_TRUE(has(log, "get sem_id = " + std::to_string(sem_id)));
-  EXPECT_TRUE(has(log, "try to get a sem, sem_id = " + std::to_string(sem_id) + ", trying......"));
-  EXPECT_TRUE(has(log, "pid = " + std::to_string(getpid()) + ", go into format critical section ..."));
-  semid_ds status{};
-  EXPECT_EQ(semctl(sem_id, 0, IPC_STAT, &status), 0);
-  EXPECT_EQ(status.sem_perm.mode & 0777, 0666);
-  EXPECT_EQ(semctl(sem_id, 0, GETVAL), 0);
-  EXPECT_EQ(call([&] { return format_sem_V(&sem_id); }), 0);
-  EXPECT_EQ(sem_id, -1);
-  EXPECT_EQ(fakes::calls({"semop"}).size(), 1u) << "it is removed, not released";
-  EXPECT_TRUE(has(log, "fmt_semncnt = 0"));
-  EXPECT_EQ(semget(90111, 1, 0666), -1);
-}
-
-TEST_F(Locks, AnInitialValueBelowOneCountsAsOne) {
-  for (const int initial : {0, -7, 3}) {
-    int sem_id = -1;
-    EXPECT_EQ(format_sem_P(&sem_id, initial), 0);
-    EXPECT_EQ(semctl(sem_id, 0, GETVAL), initial > 0 ? initial - 1 : 0);
-    EXPECT_EQ(format_sem_V(&sem_id), 0);
-  }
-}
-
-TEST_F(Locks, ASemaphoreThatExistsIsNotSetAgain) {
-  int sem_id = -1;
-  ASSERT_EQ(format_sem_P(&sem_id, 2), 0);
-  EXPECT_EQ(format_sem_P(&sem_id, 2), 0);
-  EXPECT_EQ(fakes::calls({"semctl"}), Texts{"semctl SETVAL 2"});
-}
-
-TEST_F(Locks, ASemaphoreThatCannotBeHad) {
-  int sem_id = -7;
-  fakes::on("semget", "90111 1 666").returns(-1).error(EACCES).times(1);
-  EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), -1);
-  EXPECT_TRUE(has(log, "semget() failed"));
-  fakes::on("semget", "90111 1 666").returns(-1).error(EIDRM).times(1);
-  fakes::on("semget", "90111 1 1666").returns(-1).error(ENOSPC).times(1);
-  EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), -1);
-  EXPECT_TRUE(has(log, "semget(..., IPC_CREATE ) failed"));
-  fakes::on("semctl", "SETVAL").returns(-1).error(ERANGE).times(1);
-  EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), -1);
-  EXPECT_TRUE(has(log, "semctl() failed, errno = 34"));
-  EXPECT_EQ(fakes::calls({"semctl"}).back(), "semctl IPC_RMID");
-  EXPECT_EQ(sem_id, -7);
-  EXPECT_TRUE(fakes::calls({"semop"}).empty());
-}
-
-TEST_F(Locks, AFailedWait) {
-  int sem_id = -1;
-  fakes::on("semop").returns(-1).error(EINTR);
-  EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), -2);
-  EXPECT_TRUE(has(log, "set sem failed"));
-}
-
-TEST_F(Locks, WhileAnotherWaitsTheSemaphoreIsReleased) {
-  int sem_id = -1;
-  ASSERT_EQ(format_sem_P(&sem_id, 1), 0);
-  fakes::on("semctl", "GETNCNT").returns(1);
-  EXPECT_EQ(call([&] { return format_sem_V(&sem_id); }), 0);
-  EXPECT_EQ(fakes::calls({"semop"}).back(), "semop 1 SEM_UNDO");
-  EXPECT_EQ(semctl(sem_id, 0, GETVAL), 1);
-  EXPECT_TRUE(has(log, "try to RELEASE a sem, sem_id = " + std::to_string(sem_id) + ", trying......"));
-}
-
-TEST_F(Locks, ARemovalThatFailsFallsBackToTheRelease) {
-  int sem_id = -1;
-  ASSERT_EQ(format_sem_P(&sem_id, 1), 0);
-  fakes::on("semctl", "IPC_RMID").returns(-1).error(EPERM).times(2);
-  EXPECT_EQ(call([&] { return format_sem_V(&sem_id); }), 0);
-  EXPECT_TRUE(has(log, "try to remove a sem,sem_key = 90111, using sem_id = " + std::to_string(sem_id) +
-                           ", trying......"));
-  EXPECT_TRUE(has(log, "remove sem_id failed, errno = 1"));
-  EXPECT_EQ(semctl(sem_id, 0, GETVAL), 1);
-  fakes::on("semop", "1 SEM_UNDO").returns(-1).error(EINVAL);
-  EXPECT_EQ(call([&] { return format_sem_V(&sem_id); }), -2);
-  EXPECT_TRUE(has(log, "release sem failed"));
 }

@@ -12,6 +12,7 @@
 
 #include "fakes.h"
 #include "frontend/log.h"
+#include "support/format_semaphore.h"
 #include "support/text.h"
 #include "tree/record.h"
 
@@ -28,6 +29,7 @@ class VolumeTest : public fakes::Test {
   ~VolumeTest() override {
     remvol::debug_level = 0;
     // A format that could not write keeps the semaphore until its process ends; the tests are one process.
+    remvol::format_sem_release_leftover();
     const int left = semget(90111, 1, 0666);
     if (left != -1) semctl(left, 0, IPC_RMID);
   }

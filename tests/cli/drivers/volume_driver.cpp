@@ -11,6 +11,7 @@
 
 #include "frontend/log.h"
 #include "frontend/remvol_debug.h"
+#include "support/format_semaphore.h"
 #include "support/locks.h"
 #include "tree/entry.h"
 #include "volume/degrade.h"
@@ -53,6 +54,11 @@ int do_mount(char** arguments) {
   const int result = Target_mount(&entry, number(arguments[2]), number(arguments[3]));
   printf("took = %ld microseconds\n", microseconds() - began);
   return result;
+}
+int do_mount_all(char** arguments) {
+  TargetEntry target{};
+  target.db_idx = number(arguments[0]);
+  return Target_mount_all_lun(&target, 0, 0);
 }
 int do_format(char** arguments) {
   return load(arguments) ? Target_format(&entry, arguments[2]) : -999;
@@ -128,9 +134,10 @@ const struct {
   int arguments;
   int (*call)(char** arguments);
 } operations[] = {
-    {"mount", 4, do_mount},      // TARGET LUN FORCE-FORMAT UPDATE-SHARE
-    {"format", 3, do_format},    // TARGET LUN NODE
-    {"unmount", 2, do_unmount},  // TARGET LUN
+    {"mount", 4, do_mount},          // TARGET LUN FORCE-FORMAT UPDATE-SHARE
+    {"mount_all", 1, do_mount_all},  // TARGET
+    {"format", 3, do_format},        // TARGET LUN NODE
+    {"unmount", 2, do_unmount},      // TARGET LUN
     {"unmount_all", 0, do_unmount_all},
     {"ftp_path", 2, do_ftp_path},        // TARGET LUN
     {"unmount_ftp", 1, do_unmount_ftp},  // PATH

@@ -186,10 +186,14 @@ PUBLIC int semctl(int id, int number, int command, ...) {
   const char* what = command == SETVAL     ? "SETVAL"
                      : command == GETNCNT  ? "GETNCNT"
                      : command == IPC_RMID ? "IPC_RMID"
+                     : command == IPC_STAT ? "IPC_STAT"
+                     : command == IPC_SET  ? "IPC_SET"
                                            : "other";
   char value[32] = "";
   if (command == SETVAL) number_text(value, (int)(intptr_t)argument);
-  log_call("semctl", what, value, (char*)NULL);
+  if (command == IPC_SET)
+    snprintf(value, sizeof value, "%o", ((const struct semid_ds*)argument)->sem_perm.mode);
+  if (command != IPC_STAT) log_call("semctl", what, value, (char*)NULL);
   if (answered_number("semctl", what, value, &result)) return (int)result;
   return REAL(semctl)(id, number, command, argument);
 }

@@ -93,8 +93,8 @@ Rule& otherwise(const std::string& function, Subject subject = Subject());
 
 // The log as text, in order, without reads: "system CMD", "popen CMD", "sleep 1", "usleep 100",
 // "mknod PATH MODE MAJOR:MINOR", "sys_create_1_partition DEV", "sys_expand_1_partition DEV", "fcntl lock",
-// "fcntl unlock", "fcntl wait", "semget KEY COUNT FLAGS", "semctl SETVAL 1", "semop -1 SEM_UNDO",
-// "getaddrinfo NAME". `kinds` empty: all of these. Writes of the tree are in writes().
+// "fcntl unlock", "fcntl wait", "semget KEY COUNT FLAGS", "semctl SETVAL 1", "semctl IPC_SET MODE", "semop -1
+// SEM_UNDO", "getaddrinfo NAME". `kinds` empty: all of these. Writes of the tree are in writes().
 std::vector<std::string> calls(const std::vector<std::string>& kinds = {});
 
 // The texts given to system and popen.

@@ -163,12 +163,19 @@ int semctl(int id, int number, int command, ...) noexcept {
   std::string what = command == SETVAL     ? "SETVAL"
                      : command == GETNCNT  ? "GETNCNT"
                      : command == IPC_RMID ? "IPC_RMID"
+                     : command == IPC_STAT ? "IPC_STAT"
+                     : command == IPC_SET  ? "IPC_SET"
                                            : "other";
   std::vector<std::string> fields = {what};
   if (command == SETVAL) {
     fields.push_back(std::to_string(static_cast<int>(reinterpret_cast<intptr_t>(argument))));
   }
-  fakes::record("semctl", fields);
+  if (command == IPC_SET) {
+    char mode[16];
+    snprintf(mode, sizeof mode, "%o", static_cast<const semid_ds*>(argument)->sem_perm.mode);
+    fields.push_back(mode);
+  }
+  if (command != IPC_STAT) fakes::record("semctl", fields);
   if (answered_number("semctl", fields, &result)) return result;
   return real<decltype(semctl)>("semctl")(id, number, command, argument);
 }

@@ -1,0 +1,147 @@
+#include "support/format_semaphore.h"
+
+#include <sys/ipc.h>
+#include <sys/sem.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "frontend/log.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr key_t kFormatSemKey = 90111;
+constexpr int kFormatSemMode = 0666;
+constexpr int kOwnMode = 0600;    // what a set of ours is left with
+constexpr int kMaxReplaced = 16;  // a stranger may be quick to make another one
+
+int held_sem_id = -1;  // the set that this process has taken and not left
+
+// semctl(2) leaves the definition of its fourth argument to the caller.
+union semun {
+  int val;
+  semid_ds* buf;
+  unsigned short* array;
+};
+
+int change_semaphore(int sem_id, short by) {
+  sembuf operation{0, by, SEM_UNDO};
+  return semop(sem_id, &operation, 1);
+}
+
+bool read_status(int sem_id, semid_ds* status) {
+  semun argument{};
+  argument.buf = status;
+  return semctl(sem_id, 0, IPC_STAT, argument) == 0;
+}
+
+// Removes a set that another user made or was given: whoever may change it can keep every format waiting.
+// Returns whether it was one.
+bool remove_stranger(int sem_id, Caller caller) {
+  semid_ds status{};
+  if (!read_status(sem_id, &status)) return false;
+  if (status.sem_perm.uid == geteuid() && status.sem_perm.cuid == geteuid()) return false;
+  LOG_AT(caller, 0, "the format semaphore belongs to user %u, it is replaced", status.sem_perm.cuid);
+  semctl(sem_id, 0, IPC_RMID);
+  return true;
+}
+
+// Takes a set of ours from all other users. It has no value yet, so nobody has it.
+void close_to_others(int sem_id) {
+  semid_ds status{};
+  if (!read_status(sem_id, &status)) return;
+  status.sem_perm.mode = kOwnMode;
+  semun argument{};
+  argument.buf = &status;
+  semctl(sem_id, 0, IPC_SET, argument);
+}
+
+// Returns the id of a set that no other user made, or -1 with errno.
+int get_own_set(int flags, Caller caller) {
+  for (int i = 0; i < kMaxReplaced; i++) {
+    const int sem_id = semget(kFormatSemKey, 1, flags);
+    if (sem_id == -1 || !remove_stranger(sem_id, caller)) return sem_id;
+  }
+  errno = EACCES;
+  return -1;
+}
+
+// Makes the semaphore set and gives it its value. The create is not exclusive: two runs that found it missing
+// at the same moment may both set the value, and both format then. That costs memory and time, not data,
+// since they format different volumes.
+int create_format_sem(int initial, Caller caller) {
+  LOG_AT(caller, 2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
+  const int sem_id = get_own_set(IPC_CREAT | kFormatSemMode, caller);
+  if (sem_id == -1) {
+    LOG_AT(caller, 0, "semget(..., IPC_CREATE ) failed");
+    return -1;
+  }
+  close_to_others(sem_id);
+  semun value{};
+  value.val = initial > 0 ? initial : 1;
+  LOG_AT(caller, 2, "try to semctl(%d,0,SETVAL, %d )", sem_id, value.val);
+  if (semctl(sem_id, 0, SETVAL, value) != -1) return sem_id;
+  LOG_AT(caller, 0, "semctl() failed, errno = %d", errno);
+  semctl(sem_id, 0, IPC_RMID);
+  return -1;
+}
+
+// Returns the id of the format semaphore, made when missing, or -1.
+int find_format_sem(int initial, Caller caller) {
+  const int sem_id = get_own_set(kFormatSemMode, caller);
+  if (sem_id != -1) return sem_id;
+  const int error = errno;
+  LOG_AT(caller, 0, "semget(...) == -1, errno = %d", error);
+  if (error == ENOENT || error == EIDRM) return create_format_sem(initial, caller);
+  LOG_AT(caller, 0, "semget() failed");
+  return -1;
+}
+
+}  // namespace
+
+int format_sem_P(int* sem_id, int initial) {
+  if (held_sem_id != -1) {  // left by a format that could not write: waiting for it would never end
+    *sem_id = held_sem_id;
+    LOG(1, "pid = %lu, is in format critical section still", static_cast<unsigned long>(getpid()));
+    return 0;
+  }
+  const int found = find_format_sem(initial, Caller());
+  if (found == -1) return -1;
+  *sem_id = found;
+  LOG(2, "get sem_id = %d", found);
+  LOG(2, "try to get a sem, sem_id = %d, trying......", found);
+  if (change_semaphore(found, -1) != 0) {
+    LOG(0, "set sem failed");
+    return -2;
+  }
+  held_sem_id = found;
+  LOG(1, "pid = %lu, go into format critical section ...", static_cast<unsigned long>(getpid()));
+  return 0;
+}
+
+int format_sem_V(int* sem_id) {
+  held_sem_id = -1;
+  const int waiting = semctl(*sem_id, 0, GETNCNT);
+  LOG(2, "fmt_semncnt = %d", waiting);
+  if (waiting < 1) {
+    LOG(2, "try to remove a sem,sem_key = %d, using sem_id = %d, trying......", kFormatSemKey, *sem_id);
+    if (semctl(*sem_id, 0, IPC_RMID) == 0) {
+      *sem_id = -1;
+      return 0;
+    }
+    LOG(0, "remove sem_id failed, errno = %d", errno);
+  }
+  LOG(2, "try to RELEASE a sem, sem_id = %d, trying......", *sem_id);
+  if (change_semaphore(*sem_id, 1) == 0) return 0;
+  LOG(0, "release sem failed");
+  return -2;
+}
+
+void format_sem_release_leftover() {
+  int sem_id = held_sem_id;
+  if (sem_id != -1) format_sem_V(&sem_id);
+}
+
+}  // namespace remvol
