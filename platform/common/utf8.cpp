@@ -52,7 +52,7 @@ void append_escaped(std::string& text, std::string_view bytes) {
 }
 
 bool is_plain(std::string_view bytes, wchar_t character, bool utf8) {
-  return !bytes.empty() && !is_control(character) && (utf8 || bytes.size() == 1);
+  return !bytes.empty() && !is_control(character) && !is_invisible(character) && (utf8 || bytes.size() == 1);
 }
 
 }  // namespace
@@ -75,6 +75,22 @@ bool decode(std::string_view text, std::wstring& characters) {
 bool is_control(wchar_t character) {
   return character < 0x20 || (character >= 0x7f && character < 0xa0) || character == 0x2028 ||
          character == 0x2029;
+}
+
+// Unicode's Default_Ignorable_Code_Point (DerivedCoreProperties.txt), which has the direction marks in it,
+// and the annotation marks.
+bool is_invisible(wchar_t character) {
+  constexpr struct {
+    wchar_t first, last;
+  } kRanges[] = {{0xad, 0xad},      {0x34f, 0x34f},   {0x61c, 0x61c},     {0x115f, 0x1160},
+                 {0x17b4, 0x17b5},  {0x180b, 0x180f}, {0x200b, 0x200f},   {0x202a, 0x202e},
+                 {0x2060, 0x206f},  {0x3164, 0x3164}, {0xfe00, 0xfe0f},   {0xfeff, 0xfeff},
+                 {0xffa0, 0xffa0},  {0xfff0, 0xfffb}, {0x1bca0, 0x1bca3}, {0x1d173, 0x1d17a},
+                 {0xe0000, 0xe0fff}};
+  for (const auto& range : kRanges) {
+    if (character >= range.first && character <= range.last) return true;
+  }
+  return false;
 }
 
 wchar_t lower_case(wchar_t character) {

@@ -13,14 +13,18 @@ bool decode(std::string_view text, std::wstring& characters);
 // True for what moves a cursor or ends a line instead of being shown.
 bool is_control(wchar_t character);
 
+// True for what has no shape of its own or turns the text around it: two texts that differ in such characters
+// alone look the same, or one looks like another.
+bool is_invisible(wchar_t character);
+
 // The character in lower case.
 wchar_t lower_case(wchar_t character);
 
 // The terminal cells that the text takes.
 size_t cells(std::string_view text);
 
-// `text` as it may stand on a line: control characters as \xHH, and all that is not ASCII as well when it is
-// not UTF-8.
+// `text` as it may stand on a line: control and invisible characters as \xHH, and all that is not ASCII as
+// well when it is not UTF-8.
 std::string printable(std::string_view text);
 
 }  // namespace platform

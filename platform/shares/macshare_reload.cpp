@@ -27,7 +27,7 @@ int main() {
     log_line("%s: %s", kLock, strerror(errno));
     return 0;
   }
-  const ServerConfig config = parse_server_config(read_file(kConfig), kShares);
+  const ServerConfig config = read_server_config(kConfig, kShares);
   const Reload done = reload_shares({"macshare_reload", kShares, kNetatalkNames, config.names, ""});
   if (!done.has_tree) {
     log_line("the configuration tree does not answer; only shares that are gone are taken out");

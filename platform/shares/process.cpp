@@ -5,6 +5,7 @@
 #include <signal.h>
 #include <spawn.h>
 #include <sys/file.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -21,7 +22,8 @@ namespace {
 constexpr char kFolder[] = "/run/remvol";
 constexpr int kPatience = 5000;  // milliseconds
 
-pid_t start_quietly(const std::vector<std::string>& words) {
+// `output` is where the program's output goes; nowhere when it is negative.
+pid_t start_quietly(const std::vector<std::string>& words, int output) {
   std::vector<char*> argv;
   for (const std::string& word : words) argv.push_back(const_cast<char*>(word.c_str()));
   argv.push_back(nullptr);
@@ -30,6 +32,7 @@ pid_t start_quietly(const std::vector<std::string>& words) {
   for (int stream = 0; stream <= 2; ++stream) {
     posix_spawn_file_actions_addopen(&actions, stream, "/dev/null", O_RDWR, 0);
   }
+  if (output >= 0) posix_spawn_file_actions_adddup2(&actions, output, STDOUT_FILENO);
   pid_t child = -1;
   if (posix_spawnp(&child, argv[0], &actions, nullptr, argv.data(), environ) != 0) child = -1;
   posix_spawn_file_actions_destroy(&actions);
@@ -42,6 +45,16 @@ void wait_or_kill(pid_t child) {
   pollfd ended{handle, POLLIN, 0};
   if (poll(&ended, 1, kPatience) == 0) kill(child, SIGKILL);
   close(handle);
+}
+
+void take_output(int sink, std::string& output) {
+  char block[4096];
+  off_t at = 0;
+  output.clear();
+  for (ssize_t size; (size = pread(sink, block, sizeof block, at)) > 0; at += size) {
+    output.append(block, static_cast<size_t>(size));
+  }
+  if (sink >= 0) close(sink);
 }
 
 }  // namespace
@@ -63,12 +76,16 @@ bool take_turn(const char* lock_file) {
   return fd >= 0 && flock(fd, LOCK_EX) == 0;
 }
 
-int run(const std::vector<std::string>& words) {
-  const pid_t child = start_quietly(words);
-  if (child < 0) return -1;
-  wait_or_kill(child);
-  int status = 0;
-  return waitpid(child, &status, 0) == child && WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+int run(const std::vector<std::string>& words, std::string* output) {
+  const int sink = output != nullptr ? memfd_create("output", MFD_CLOEXEC) : -1;
+  const pid_t child = start_quietly(words, sink);
+  int status = -1;
+  if (child >= 0) {
+    wait_or_kill(child);
+    if (waitpid(child, &status, 0) != child || !WIFEXITED(status)) status = -1;
+  }
+  if (output != nullptr) take_output(sink, *output);
+  return status < 0 ? -1 : WEXITSTATUS(status);
 }
 
 bool is_installed(const char* program) {

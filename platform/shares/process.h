@@ -15,9 +15,9 @@ void log_line(const char* format, ...) __attribute__((format(printf, 1, 2)));
 // Makes the folder of the generated files. Returns false, with errno, when it cannot be used.
 bool take_turn(const char* lock_file);
 
-// Runs a program found through PATH, without its output. Returns its exit status; -1 when it is not there,
-// when a signal ended it, or when it took longer than 5 seconds (it is then killed).
-int run(const std::vector<std::string>& words);
+// Runs a program found through PATH; what it prints goes into `output`, or nowhere. Returns its exit status;
+// -1 when it is not there, when a signal ended it, or when it took longer than 5 seconds (it is then killed).
+int run(const std::vector<std::string>& words, std::string* output = nullptr);
 
 // True when a program of this name is found through PATH.
 bool is_installed(const char* program);

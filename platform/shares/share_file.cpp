@@ -11,6 +11,7 @@ namespace shares {
 namespace {
 
 constexpr std::string_view kPathOption = "\tpath = ";
+constexpr size_t kMaxText = 1 << 20;
 
 // Takes the first line, with its newline, off `text`.
 std::string_view take_line(std::string_view& text) {
@@ -61,11 +62,16 @@ std::string compose(const char* maker, const std::vector<Section>& sections) {
 
 std::string read_file(const char* path) {
   std::string text;
-  const int fd = open(path, O_RDONLY | O_CLOEXEC);
+  const int fd = open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
   if (fd < 0) return text;
+  struct stat info {};
+  const bool regular = fstat(fd, &info) == 0 && S_ISREG(info.st_mode);
   char block[4096];
-  ssize_t size;
-  while ((size = read(fd, block, sizeof block)) > 0) text.append(block, static_cast<size_t>(size));
+  ssize_t size = regular ? 1 : 0;
+  while (size > 0 && text.size() < kMaxText) {
+    size = read(fd, block, sizeof block);
+    if (size > 0) text.append(block, static_cast<size_t>(size));
+  }
   close(fd);
   return text;
 }

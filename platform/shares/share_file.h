@@ -25,7 +25,8 @@ std::vector<Section> parse_sections(std::string_view text);
 // The file with a comment on top that says who made it; `maker` is a program's name.
 std::string compose(const char* maker, const std::vector<Section>& sections);
 
-// The whole content of a file, empty when it cannot be read.
+// The content of a file, a mebibyte of it at most; empty when it cannot be read or is no regular file, which
+// might never come to an end.
 std::string read_file(const char* path);
 
 // Replaces `path` in one step by a file with this text, readable by everybody. Returns false, with errno.

@@ -6,20 +6,25 @@
 
 namespace shares {
 
+// The administrative shares are those that clients take for a Windows server's own: C$ and every other drive.
 // The characters are those that Samba's own "net conf addshare" refuses, and the brackets around a section's
 // name. Its parser knows [global] by two names, whatever blanks are in them.
-const NameRules kSambaNames = {L"%<>*?|/\\+=;:\",[]",
-                               {L"global", L"globals", L"homes", L"printers", L"print$", L"ipc$", L"admin$"}};
+const NameRules kSambaNames = {
+    L"%<>*?|/\\+=;:\",[]",
+    {L"global", L"globals", L"homes", L"printers", L"print$", L"ipc$", L"admin$", L"netlogon", L"sysvol"},
+    true};
 
 // afp.conf(5): a dollar sign starts a variable.
-const NameRules kNetatalkNames = {L"%<>*?|/\\+=;:\",[]$", {L"global", L"homes"}};
+const NameRules kNetatalkNames = {L"%<>*?|/\\+=;:\",[]$", {L"global", L"homes"}, false};
 
 namespace {
 
 bool is_reserved(std::string_view name, const NameRules& rules) {
   std::wstring plain = folded_name(name);
   plain.erase(std::remove(plain.begin(), plain.end(), L' '), plain.end());
-  return std::find(rules.reserved.begin(), rules.reserved.end(), plain) != rules.reserved.end();
+  const bool drive =
+      rules.keeps_drives && plain.size() == 2 && plain[1] == L'$' && plain[0] >= L'a' && plain[0] <= L'z';
+  return drive || std::find(rules.reserved.begin(), rules.reserved.end(), plain) != rules.reserved.end();
 }
 
 }  // namespace
@@ -30,6 +35,8 @@ const char* name_refusal(std::string_view name, const NameRules& rules) {
   if (!platform::decode(name, characters)) return "it is not UTF-8";
   if (std::any_of(characters.begin(), characters.end(), platform::is_control))
     return "it holds a control character";
+  if (std::any_of(characters.begin(), characters.end(), platform::is_invisible))
+    return "it holds a character that is not seen or that turns the text around";
   if (characters.find_first_of(rules.forbidden) != std::wstring::npos) {
     return "it holds a character that the file server does not allow in names";
   }

@@ -12,6 +12,7 @@ namespace shares {
 struct NameRules {
   std::wstring_view forbidden;              // characters that its names may not hold
   std::vector<std::wstring_view> reserved;  // names, in lower case and without blanks
+  bool keeps_drives;                        // a letter and a dollar sign
 };
 
 extern const NameRules kSambaNames, kNetatalkNames;

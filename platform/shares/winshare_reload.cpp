@@ -5,14 +5,18 @@
 // more.
 #include <glob.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
+#include <string>
+#include <string_view>
 
 #include "process.h"
 #include "reload.h"
 #include "server_config.h"
+#include "share_name.h"
 
 using namespace shares;
 
@@ -37,6 +41,20 @@ std::string options_for_macs(const ServerConfig& config) {
   const bool wanted = !is_installed("netatalk") && !config.sets_vfs_objects && has_module("catia") &&
                       has_module("fruit") && has_module("streams_xattr");
   return wanted ? "\tvfs objects = catia fruit streams_xattr\n" : "";
+}
+
+// Samba prefers a share of smb.conf to one of the same name in its registry, so ours would take its place.
+void add_registry_shares(ServerConfig& config) {
+  std::string output;
+  if (run({"net", "conf", "listshares"}, &output) != 0) {
+    log_line("net failed; the shares in Samba's registry are not known");
+    return;
+  }
+  for (std::string_view rest = output; !rest.empty();) {
+    const size_t end = std::min(rest.find('\n'), rest.size());
+    config.names.push_back(folded_name(rest.substr(0, end)));
+    rest.remove_prefix(std::min(end + 1, rest.size()));
+  }
 }
 
 bool samba_runs() {
@@ -71,7 +89,8 @@ int main() {
     log_line("%s: %s", kLock, strerror(errno));
     return 0;
   }
-  const ServerConfig config = parse_server_config(read_file(kConfig), kShares);
+  ServerConfig config = read_server_config(kConfig, kShares);
+  if (config.uses_registry) add_registry_shares(config);
   const Reload done =
       reload_shares({"winshare_reload", kShares, kSambaNames, config.names, options_for_macs(config)});
   const bool has_samba = is_installed("smbcontrol");

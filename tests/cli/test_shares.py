@@ -160,12 +160,17 @@ def test_unusual_names_are_shared(shares, name):
 RESERVED = "the file server keeps this name for itself"
 FORBIDDEN = "it holds a character that the file server does not allow in names"
 CONTROL = "it holds a control character"
+INVISIBLE = "it holds a character that is not seen or that turns the text around"
 REFUSED = [
     *((name, RESERVED) for name in ("global", "GLOBAL", "Glo bal", "globals", "homes", "Printers", "print$", "IPC$",
-                                    "ADMIN$")),
+                                    "ADMIN$", "C$", "z$", "netlogon", "NetLogon", "SYSVOL", "sys vol")),
     *((name, FORBIDDEN) for name in ("a]b", "a[b", "%U", "50%", "back\\", "mid\\dle", "; x", "a=b", "a,b", "*", "a?",
                                      'a"b', "a:b", "a|b", "<a>")),
     *((name, CONTROL) for name in ("a\nb", "a\tb", "x\r", "a\x7fb", "\x1b[2J", "a\u0085b", "a\u2028b")),
+    *((f"a{mark}b", INVISIBLE) for mark in (
+        *map(chr, range(0x202a, 0x202f)), *map(chr, range(0x2066, 0x206a)), "\u200e", "\u200f", "\u061c", "\u200b",
+        "\u200c", "\u200d", "\u2060", "\ufeff", "\u00ad", "\u034f", "\u3164", "\ufe0f", "\U000e0041")),
+    ("\u200bIPC$", INVISIBLE),
     (" lead", "it begins or ends with a blank"),
     ("trail ", "it begins or ends with a blank"),
     ("two  blanks", "it holds several blanks in a row"),
@@ -185,6 +190,11 @@ def test_a_name_that_cannot_be_carried_is_refused_and_the_others_are_served(shar
     assert log.count("\n") == 1 and log.endswith(f'" is not shared: {why}\n'), log
     assert log.startswith('winshare_reload: volume "') and log.isprintable() is False
     assert not any(ord(character) < 32 for character in log[:-1])
+
+
+def test_the_reload_log_shows_what_is_not_seen(shares):
+    shares.add("pay\u202exls.exe")
+    assert shares.reload() == f'winshare_reload: volume "pay\\xE2\\x80\\xAExls.exe" is not shared: {INVISIBLE}\n'
 
 
 @pytest.mark.parametrize("name", ["..", ".", "a/../../../etc", "a/b", "/"])
@@ -211,6 +221,98 @@ def test_a_share_of_the_administrator_is_not_taken_over(shares):
     log = shares.reload()
     assert shares.file() == HEAD + section("Other")
     assert log == 'winshare_reload: volume "Public" is not shared: another share has this name\n'
+
+
+TAKEN = 'winshare_reload: volume "{}" is not shared: another share has this name\n'
+
+
+def refuses(shares, *names):
+    """Of volumes with these names and one more, the one more is shared; each of the others has its line."""
+    for name in (*names, "Free"):
+        shares.add(name)
+    assert shares.reload() == "".join(TAKEN.format(name) for name in names)
+    assert shares.file() == HEAD + section("Free")
+
+
+def test_a_share_in_an_included_file_is_not_taken_over(shares):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\nINCLUDE=/etc/samba/more.conf\n[Own]\n")
+    shares.box.write("/etc/samba/more.conf", "[Public]\npath = /srv\ninclude = /etc/samba/deep/end.conf\n[Later]\n")
+    shares.box.write("/etc/samba/deep/end.conf", "[ Nested ]\npath = /srv/n\n")
+    refuses(shares, "public", "LATER", "nested", "own")
+
+
+def test_a_share_in_a_file_that_takes_the_place_of_smb_conf_is_not_taken_over(shares):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\nconfig file = /etc/samba/other.conf\n")
+    shares.box.write("/etc/samba/other.conf", "[Other]\n")
+    refuses(shares, "Other")
+
+
+def test_lines_that_go_on_are_one(shares):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\n include = \\\n  /etc/samba/more.conf\n"
+                               "comment = a \\\n[Free]\\\n\n")
+    shares.box.write("/etc/samba/more.conf", "[Two \\\nwords]\n")
+    refuses(shares, "two words")
+
+
+def test_files_that_include_each_other_come_to_an_end(shares):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\ninclude = /etc/samba/a.conf\n[S]\n")
+    shares.box.write("/etc/samba/a.conf", f"[A]\ninclude = /etc/samba/b.conf\ninclude = {SMB_CONF}\n")
+    shares.box.write("/etc/samba/b.conf", "[B]\ninclude = /etc/samba/a.conf\ninclude = /etc/samba/b.conf\n")
+    refuses(shares, "A", "B", "S")
+
+
+def test_an_include_that_differs_from_client_to_client_is_left_alone(shares):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\ninclude = /etc/samba/%m.conf\n[S]\n")
+    shares.box.write("/etc/samba/%m.conf", "[M]\n")
+    shares.add("M")
+    assert shares.reload() == ""
+    assert shares.file() == HEAD + section("M")
+
+
+@pytest.mark.parametrize("what", ["/etc/samba/absent.conf", "/etc/samba", "/etc/samba/pipe", "/dev/zero", ""])
+def test_an_include_that_is_no_file_holds_nothing_up(shares, what):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {what}\ninclude = {SHARES}\n[S]\n")
+    shares.sh("mkfifo /etc/samba/pipe")
+    refuses(shares, "S")
+
+
+def test_the_generated_file_is_known_by_any_path_to_it(shares):
+    """Its own shares are nobody else's, also where a link or a further file leads to it."""
+    shares.box.write(SMB_CONF, "[global]\ninclude = /etc/samba/more.conf\n")
+    shares.box.write("/etc/samba/more.conf", "include = /etc/samba/link.conf\n")
+    shares.sh(f"ln -s {SHARES} /etc/samba/link.conf")
+    shares.add("V")
+    for _ in range(2):
+        shares.reload()
+        assert shares.file() == HEAD + section("V")
+    assert shares.reload() == ""
+
+
+REGISTRY = ["include = registry", "registry shares = Yes", "config backend = registry"]
+
+
+@pytest.mark.parametrize("line", REGISTRY)
+def test_a_share_in_the_registry_is_not_taken_over(shares, line):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\n{line}\n")
+    shares.box.fake("net", stdout="global\nStored\nAuch Größe\n")
+    refuses(shares, "stored", "auch größe")
+    assert shares.box.runs("net") == [["conf", "listshares"]]
+
+
+def test_the_registry_is_not_asked_where_it_is_not_used(shares):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\nregistry shares = no\n[x]\npath = registry\n")
+    shares.box.fake("net", stdout="V\n")
+    shares.add("V")
+    assert shares.reload() == ""
+    assert shares.box.runs("net") == []
+
+
+def test_a_registry_that_cannot_be_read_is_one_line(shares):
+    shares.box.write(SMB_CONF, f"[global]\ninclude = {SHARES}\ninclude = registry\n")
+    shares.box.fake("net", status=255)
+    shares.add("V")
+    assert shares.reload() == "winshare_reload: net failed; the shares in Samba's registry are not known\n"
+    assert shares.file() == HEAD + section("V")
 
 
 def test_eight_volumes_of_which_one_is_broken(shares):
@@ -419,6 +521,17 @@ def test_netatalk_has_name_rules_of_its_own(netatalk):
         'macshare_reload: volume "mine" is not shared: another share has this name',
         f'macshare_reload: volume "Homes" is not shared: {RESERVED}',
     ]
+
+
+def test_netatalk_shares_in_included_files_are_not_taken_over(netatalk):
+    netatalk.box.write("/etc/netatalk/afp.conf", f"[Global]\ninclude = {AFP_SHARES}\ninclude = /etc/netatalk/a.conf\n")
+    netatalk.box.write("/etc/netatalk/a.conf", "[Time Machine]\ninclude = /etc/netatalk/b.conf\n")
+    netatalk.box.write("/etc/netatalk/b.conf", "[Media]\n")
+    for name in ("time machine", "MEDIA", "pay\u202e", "Free"):
+        netatalk.add(name)
+    log = netatalk.reload("macshare_reload")
+    assert netatalk.file(AFP_SHARES) == afp(netatalk, section("Free"))
+    assert [line.split(": ", 2)[2] for line in log.splitlines()] == ["another share has this name"] * 2 + [INVISIBLE]
 
 
 def test_a_stopped_netatalk_is_one_line(netatalk):

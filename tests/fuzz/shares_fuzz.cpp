@@ -10,7 +10,8 @@
 
 extern "C" int LLVMFuzzerTestOneInput(const unsigned char* data, size_t size) {
   const std::string text(reinterpret_cast<const char*>(data), size);
-  shares::parse_server_config(text, "/run/remvol/smb-shares.conf");
+  shares::ServerConfig any;
+  shares::parse_server_config(text, true, any);
   shares::parse_sections(text);
   for (const char byte : platform::printable(text)) {
     if (static_cast<unsigned char>(byte) < 0x20 || byte == 0x7f) abort();
@@ -21,7 +22,9 @@ extern "C" int LLVMFuzzerTestOneInput(const unsigned char* data, size_t size) {
   const shares::Section after = shares::make_section("after", "/mnt/VV/after", "");
   const auto read = shares::parse_sections(shares::compose("fuzz", {section, after}));
   if (read.size() != 2 || !(read[0] == section) || !(read[1] == after)) abort();
-  const auto config = shares::parse_server_config(section.text, "x");
-  if (config.names.size() != 1 || config.names[0] != shares::folded_name(text)) abort();
+  shares::ServerConfig config;
+  shares::parse_server_config(section.text, true, config);
+  if (config.names.size() != 1 || config.names[0] != shares::folded_name(text) || !config.includes.empty())
+    abort();
   return 0;
 }

@@ -45,7 +45,18 @@ TEST(Utf8, PrintableTextHasNoControlCharacter) {
   EXPECT_EQ(printable("é\xff"
                       "b"),
             "\\xC3\\xA9\\xFFb");
+  EXPECT_EQ(printable("a\u202eb\u200d"), "a\\xE2\\x80\\xAEb\\xE2\\x80\\x8D");
   EXPECT_EQ(printable(""), "");
+}
+
+TEST(Utf8, WhatIsNotSeenIsKnown) {
+  for (const wchar_t character :
+       L"\u00ad\u034f\u061c\u200b\u200e\u200f\u202a\u202e\u2060\u2066\u2069\u3164\ufeff") {
+    EXPECT_EQ(is_invisible(character), character != L'\0') << std::hex << static_cast<unsigned>(character);
+  }
+  for (const wchar_t character : L"a é日ا\u0301\u2010\u202f\u3000😀") {
+    EXPECT_FALSE(is_invisible(character)) << std::hex << static_cast<unsigned>(character);
+  }
 }
 
 TEST(Utf8, CellsAreWhatATerminalTakes) {
