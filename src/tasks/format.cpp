@@ -13,6 +13,7 @@
 #include "tree/entry.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
+#include "volume/disk_identity.h"
 #include "volume/mount.h"
 #include "volume/unmount.h"
 
@@ -20,8 +21,8 @@ namespace remvol {
 
 namespace {
 
-// Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry or no device; 1
-// unknown target or LUN.
+// Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry, no device or
+// another disk's; 1 unknown target or LUN.
 int _read_lun_to_format(TargetEntry* entry, Caller caller = Caller()) {
   if (request_target.target_name[0] == '\0' || request_target.lun < 0) return kFailed;
   int dbidx = 0;
@@ -33,6 +34,7 @@ int _read_lun_to_format(TargetEntry* entry, Caller caller = Caller()) {
     LOG_AT(caller, 2, "Can not get device");
     return kFailed;
   }
+  if (is_foreign_disk(entry, entry->dev, caller)) return kFailed;
   return kOk;
 }
 

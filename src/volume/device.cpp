@@ -89,6 +89,13 @@ bool get_parent_disk(char (&parent)[256], const char* name) {
   return true;
 }
 
+Text<256> disk_of_node(const char* node) {
+  const char* slash = strrchr(node, '/');
+  const char* name = slash != nullptr ? slash + 1 : node;
+  char parent[256];
+  return Text<256>("%s", get_parent_disk(parent, name) ? parent : name);
+}
+
 int _get_dev_id(DeviceId* id, const char* name) {
   if (name == nullptr || name[0] == '\0') return -1;
   const PathText path("%s/dev", sysfs_dir(name).c_str());

@@ -2,6 +2,8 @@
 #ifndef REMVOL_VOLUME_DEVICE_H
 #define REMVOL_VOLUME_DEVICE_H
 
+#include "support/text.h"
+
 namespace remvol {
 
 struct DeviceId {
@@ -14,6 +16,9 @@ struct DeviceId {
 // two characters not looked at (sdb1 is a partition of sdb; md127 counts as one of md). Returns whether it is
 // one.
 bool get_parent_disk(char (&parent)[256], const char* name);
+
+// Returns the name of the disk of `node`, a disk or partition with or without "/dev/" in front.
+Text<256> disk_of_node(const char* node);
 
 // Fills `id` (cleared by the caller) for a disk or partition by its kernel name, from sysfs. Returns 0 or -1.
 int _get_dev_id(DeviceId* id, const char* name);

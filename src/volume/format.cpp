@@ -11,6 +11,7 @@
 #include "sysaux.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
+#include "volume/disk_identity.h"
 #include "volume/format_progress.h"
 #include "volume/process_check.h"
 
@@ -19,7 +20,9 @@ namespace remvol {
 namespace {
 
 constexpr int kStartTries = 3;
+constexpr int kRefused = -1;
 constexpr int kNotWritable = -2;
+constexpr int kNotStarted = -3;
 constexpr char kDefaultFs[] = "ext4";
 using FsName = char[16];
 
@@ -111,9 +114,56 @@ void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition
   note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100), caller);
 }
 
+// Whether the partition, chosen a while ago, may still be formatted. Returns 0, kRefused or kFormatLeftAlone.
+int look_again(const TargetEntry* entry, const char* partition, ContentMark seen_empty,
+               Caller caller = Caller()) {
+  if (is_foreign_disk(entry, partition, caller)) return kRefused;
+  if (is_node_mounted(partition)) {
+    LOG_AT(caller, 0, "%s is mounted by now, it is not formatted", partition);
+    return kFormatLeftAlone;
+  }
+  if (seen_empty == kNoMark || content_mark(partition) == seen_empty) return 0;
+  char found[64] = "";
+  if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') return 0;
+  LOG_AT(caller, 0, "%s carries %s by now, it is not formatted", partition, found);
+  return kFormatLeftAlone;
+}
+
+// Whether nothing but the entry's own disk would be overwritten, in this moment, and nobody uses it.
+bool may_overwrite(const TargetEntry* entry, const char* partition, Caller caller) {
+  if (is_foreign_disk(entry, partition, caller)) return false;
+  if (!is_node_claimed(partition)) return true;
+  LOG_AT(caller, 0, "%s is in use, it is not formatted", partition);
+  return false;
+}
+
+// Makes the file system, everybody else on the partition ended and its beginning wiped before. Returns 0,
+// kRefused, kNotWritable, or kNotStarted.
+int make_file_system(TargetEntry* entry, const char* partition, Caller caller = Caller()) {
+  note_update(ktree_update_formatting_state(entry, kFormatting), caller);
+  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0), caller);
+  note_update(ktree_update_lun_status(entry, 1), caller);
+  LOG_AT(caller, 2, "format partition %s", partition);
+  wait_for_udev(partition);
+  System("fuser -mk \"%s\"", partition);
+  FsName fs_type;
+  choose_fs(fs_type, partition, caller);
+  if (!may_overwrite(entry, partition, caller)) return kRefused;
+  if (System("dd if=/dev/zero of=%s bs=1M count=1", partition) != 0) {
+    LOG_AT(caller, 1, "dd %s failed, this device is not able to write.", partition);
+    return kNotWritable;
+  }
+  sleep(1);
+  if (!may_overwrite(entry, partition, caller)) return kRefused;
+  FILE* output = start_mke2fs(fs_type, partition, caller);
+  if (output == nullptr) return kNotStarted;
+  follow_mke2fs(output, entry, partition, caller);
+  return 0;
+}
+
 }  // namespace
 
-int Target_format(TargetEntry* entry, const char* partition) {
+int Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty) {
   if (!check_arguments(entry, partition)) return -1;
   int sem_id = -1;
   note_update(ktree_update_formatting_state(entry, kFormatWaiting));
@@ -122,26 +172,16 @@ int Target_format(TargetEntry* entry, const char* partition) {
     LOG(0, "wait fmt_sem failed, exit");
     return -1;
   }
-  note_update(ktree_update_formatting_state(entry, kFormatting));
-  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0));
-  note_update(ktree_update_lun_status(entry, 1));
-  LOG(2, "format partition %s", partition);
-  System("fuser -mk \"%s\"", partition);
-  FsName fs_type;
-  choose_fs(fs_type, partition);
-  if (System("dd if=/dev/zero of=%s bs=1M count=1", partition) != 0) {
-    LOG(1, "dd %s failed, this device is not able to write.", partition);
-    // The semaphore stays taken and the format state stays "formatting" until this run ends; the kernel then
-    // undoes the semaphore's change.
-    return kNotWritable;
-  }
-  sleep(1);
-  FILE* output = start_mke2fs(fs_type, partition);
-  if (output != nullptr) follow_mke2fs(output, entry, partition);
-  note_update(ktree_update_formatting_state(entry, output != nullptr ? kFormatIdle : kFormatFailed));
-  const int result = format_sem_V(&sem_id);
-  if (result != 0) LOG(0, "release fmt_sem failed, exit");
-  return result;
+  int result = look_again(entry, partition, seen_empty);
+  if (result == 0) result = make_file_system(entry, partition);
+  // The semaphore stays taken and the format state stays "formatting" until this run ends; the kernel then
+  // undoes the semaphore's change.
+  if (result == kNotWritable) return result;
+  const FormatState state = result == 0 || result == kFormatLeftAlone ? kFormatIdle : kFormatFailed;
+  note_update(ktree_update_formatting_state(entry, state));
+  const int left = format_sem_V(&sem_id);
+  if (left != 0) LOG(0, "release fmt_sem failed, exit");
+  return result == kRefused || result == kFormatLeftAlone ? result : left;
 }
 
 int check_mkfs_process_existing() {

@@ -71,6 +71,7 @@ class HeldNode {
 struct Volume {
   TargetEntry* entry;
   int force_format;
+  bool asked;        // for a format, whatever there is
   bool looks_empty;  // the format is forced only because no partition carries anything that is recognised
   PartitionList partitions;
   Text<64> node;  // of the chosen partition, or of the last one examined
@@ -78,7 +79,8 @@ struct Volume {
   // follow one another read the disk once. It is not open during a format, which kills whoever uses the node,
   // nor longer than the looks, since an unmount by another run does that too.
   HeldNode held;
-  char fs_type[64];  // on the node; empty when none is known
+  char fs_type[64];        // on the node; empty when none is known
+  ContentMark seen_empty;  // the node's mark when the format was decided; kNoMark when it was asked for
   MountPointText mount_point;
 };
 
@@ -154,8 +156,8 @@ bool protect_data(Volume* volume) {
 int create_file_system(Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 0, "Got FS type = %s, creating volume", volume->fs_type);
   volume->held.release();
-  const int result = Target_format(volume->entry, volume->node);
-  if (result == 0) return kOk;
+  const int result = Target_format(volume->entry, volume->node, volume->seen_empty);
+  if (result == 0 || (result == kFormatLeftAlone && !volume->asked)) return kOk;
   if (result == -2 && record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
   LOG_AT(caller, 0, "Create Format FAILED");
   return kMountFormatFailed;
@@ -174,6 +176,7 @@ int keep_file_system(Volume* volume, Caller caller = Caller()) {
 // Leaves the chosen partition with a known file system.
 int prepare_file_system(Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
+  if (!volume->asked) volume->seen_empty = content_mark(volume->node);
   detect_fs(volume);
   if (!protect_data(volume)) return kMountNoPartition;
   const int result =
@@ -278,6 +281,7 @@ int Target_mount(TargetEntry* entry, int force_format, int update_share) {
   if (result != kOk) return result;
   Volume volume{};
   volume.entry = entry;
+  volume.asked = force_format != 0;
   volume.force_format = force_format;
   result = bring_up(&volume);
   if (result != kOk) return result;

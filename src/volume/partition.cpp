@@ -9,6 +9,8 @@
 #include "sysaux.h"
 #include "tree/state.h"
 #include "volume/device.h"
+#include "volume/disk_identity.h"
+#include "volume/disk_use.h"
 #include "volume/mount_result.h"
 
 namespace remvol {
@@ -27,7 +29,7 @@ bool create_partition(const TargetEntry* entry, const char* device, Caller calle
   LOG_AT(caller, 2, "No partitions found on %s, try to create partition...", device);
   ktree_update_volume_state(entry, kVolumeCreating);
   LOG_AT(caller, 2, "Creating partition on %s", device);
-  if (sys_create_1_partition(device) != 0) {
+  if (is_foreign_disk(entry, device, caller) || sys_create_1_partition(device) != 0) {
     LOG_AT(caller, 0, "Create partition FAILED");
     ktree_update_volume_state(entry, kVolumeFailed);
     return false;
@@ -43,7 +45,7 @@ void expand_partition(const TargetEntry* entry, const char* device, Caller calle
   LOG_AT(caller, 2, "%s, try to expand partition...", device);
   LOG_AT(caller, 2, "Expanding partition on %s", device);
   ktree_update_volume_state(entry, kVolumeCreating);
-  if (sys_expand_1_partition(device) != 0) {
+  if (is_foreign_disk(entry, device, caller) || sys_expand_1_partition(device) != 0) {
     LOG_AT(caller, 0, "Expand partition FAILED");
     return;
   }
@@ -51,13 +53,23 @@ void expand_partition(const TargetEntry* entry, const char* device, Caller calle
   _create_device_node(entry->dev);
 }
 
+// Gives an empty disk its partition, which is to be formatted then. A partition that the kernel did not have
+// (`had_one`) and has by now is another run's: it is taken as it is. Returns false when there is none.
+bool fill_disk(const TargetEntry* entry, const char* device, bool had_one, int* force_format, Caller caller) {
+  const auto filled_elsewhere = [&] { return !had_one && has_partition(entry->dev); };
+  if (filled_elsewhere()) return true;
+  if (!create_partition(entry, device, caller)) return filled_elsewhere();
+  *force_format = 1;
+  return true;
+}
+
 // Returns false when an empty disk could not be given its partition.
 bool adjust_partitions(const TargetEntry* entry, const char* device, PartitionList& partitions,
                        int* force_format, Caller caller) {
+  const bool had_one = has_partition(entry->dev);
   const int count = list_partitions(device, partitions);
   if (count == 0) {
-    if (!create_partition(entry, device, caller)) return false;
-    *force_format = 1;
+    if (!fill_disk(entry, device, had_one, force_format, caller)) return false;
     list_partitions(device, partitions);
   } else if (count == 1) {
     LOG_AT(caller, 2, "one partition found on %s", device);
@@ -91,6 +103,7 @@ int check_1part_disk_need_to_expand(const char* device) {
 int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format,
                        Caller caller) {
   const Text<64> device("/dev/%s", entry->dev);
+  if (is_foreign_disk(entry, device, caller)) return kMountTooSmall;  // the LUN itself has no disk here
   const long long disk_size = sys_get_disk_space("%s", device.c_str());
   LOG_AT(caller, 2, "get disk_size = %lld", disk_size);
   if (disk_size <= kUnusableDiskSize) {

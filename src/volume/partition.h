@@ -17,7 +17,8 @@ int check_1part_disk_need_to_expand(const char* device);
 // Makes the entry's disk ready: an empty one gets one partition (`force_format` is then set to 1), a single
 // partition that falls well short of the disk's end is grown, several are left as they are. Lists the
 // partitions and makes the disk's node when missing. Keeps the volume state meanwhile. Returns 0,
-// kMountTooSmall, kMountNoPartition, or -1 when the node could not be made.
+// kMountTooSmall (also for a disk that is not the entry's: the LUN is offline then), kMountNoPartition, or -1
+// when the node could not be made.
 int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format,
                        Caller caller = Caller());
 

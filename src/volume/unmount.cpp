@@ -17,6 +17,8 @@
 #include "tree/entry.h"
 #include "tree/keys.h"
 #include "tree/status_text.h"
+#include "volume/disk_identity.h"
+#include "volume/disk_use.h"
 #include "volume/mount.h"
 #include "volume/mount_point.h"
 #include "volume/share_services.h"
@@ -31,6 +33,13 @@ constexpr int kKillMaxWait = 200000;  // microseconds
 constexpr char kProcMounts[] = "/proc/mounts";
 constexpr char kPublicFtp[] = "/home/Public";
 constexpr size_t kFtpPathSize = 512;
+
+// Ends the users of the node that was mounted, unless its name belongs to another disk by now.
+void kill_node_users(const TargetEntry* entry, Caller caller = Caller()) {
+  if (is_foreign_disk(entry, entry->mnt_dev, caller)) return;
+  wait_for_udev(entry->mnt_dev);
+  System("fuser -mk %s", entry->mnt_dev);
+}
 
 void kill_users(const char* mount_point, Caller caller = Caller()) {
   LOG_AT(caller, 2, "start fuser");
@@ -89,7 +98,7 @@ int Target_LUN_umount(const TargetEntry* entry) {
     LOG(2, "end");
     return kFailed;
   }
-  System("fuser -mk %s", entry->mnt_dev);
+  kill_node_users(entry);
   const MountPointText mount_point = mount_point_of(entry->share);
   if (check_path_exist(mount_point) != 0) return kOk;
   if (sys_mount_point(mount_point) != 0) {
@@ -118,6 +127,10 @@ int Target_umount_all() {
 }
 
 int get_ftp_share_path(const TargetEntry* entry, char* path) {
+  if (is_foreign_disk(entry, entry->mnt_dev)) {  // a mount of that node is another volume's
+    path[0] = '\0';
+    return kNoFtpShare;
+  }
   FILE* table = setmntent(kProcMounts, "re");
   if (table == nullptr) {
     LOG(0, "Can not open %s", kProcMounts);

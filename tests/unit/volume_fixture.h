@@ -21,12 +21,14 @@ using Texts = std::vector<std::string>;
 class VolumeTest : public fakes::Test {
  protected:
   VolumeTest() {
+    cover("/sys/block");  // the machine may have an sdb of its own
     remvol::copy_text(entry.dev, "sdb");
     remvol::copy_text(entry.share, "Data");
     entry.db_idx = 2;
     entry.lun_db_idx = 3;
   }
   ~VolumeTest() override {
+    uncover("/sys/block");
     remvol::debug_level = 0;
     // A format that could not write keeps the semaphore until its process ends; the tests are one process.
     remvol::format_sem_release_leftover();

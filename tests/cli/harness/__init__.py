@@ -34,6 +34,8 @@ Running
     box.wait_quiet()       waits until nothing but the tree's daemon runs (commands started with & are through).
     box.path(p)            pathlib.Path of the box's file p; box.write(p, text) makes its folders as well.
     box.disk(name, size)   a loop device as /dev/NAME of the box (and in its /sys/block with `sysfs=True`).
+    box.session_disk(name, target, lun=0, session=1)   what the box's sysfs says: NAME is this LUN,
+    box.local_disk(name)                               or a disk of the machine; neither said: nothing is known
     box.tree               get(path) -> text or None, set(path, value) or set({path: value}), delete(path),
                            dump(path="") -> dict of every value, restart(), stop().
 

@@ -1,4 +1,4 @@
-"""Loop devices as the disks of a box."""
+"""Loop devices as the disks of a box, and whose disk its /sys/block says one is."""
 
 import fcntl
 import os
@@ -19,6 +19,26 @@ def attach(box, name, size, sysfs):
         box.write(f"/sys/block/{name}/dev", f"{os.major(device)}:{os.minor(device)}\n")
         box.write(f"/sys/block/{name}/size", f"{size // 512}\n")
     return backing, loop
+
+
+def lead_to_session(box, name, target, lun, session):
+    """The `device` link that the kernel gives the disk of an iSCSI session."""
+    root = f"/fake/devices/platform/host{session + 1}/session{session}"
+    box.write(f"{root}/iscsi_session/session{session}/targetname", f"{target}\n")
+    _link_device(box, name, f"{root}/target{session + 1}:0:0/{session + 1}:0:0:{lun}")
+
+
+def lead_to_controller(box, name):
+    """The `device` link of a disk of the machine."""
+    _link_device(box, name, "/fake/devices/pci0000:00/0000:00:1f.2/ata1/host0/target0:0:0/0:0:0:0")
+
+
+def _link_device(box, name, device):
+    box.path(device).mkdir(parents=True, exist_ok=True)
+    link = box.path(f"/sys/block/{name}/device")
+    link.parent.mkdir(parents=True, exist_ok=True)
+    link.unlink(missing_ok=True)
+    link.symlink_to(device)
 
 
 def _free_loop(backing):

@@ -11,7 +11,7 @@ import socket
 import subprocess
 import time
 
-from .disks import attach, detach
+from .disks import attach, detach, lead_to_controller, lead_to_session
 from .result import Arguments, Call, Result, escape, matcher, unescape
 from .tree import Tree
 
@@ -142,6 +142,14 @@ class Box:
         backing, loop = attach(self, name, size, sysfs)
         self.disks.append(loop)
         return backing
+
+    def session_disk(self, name, target, lun=0, session=1):
+        """From now on sysfs says that NAME is this LUN of the target."""
+        lead_to_session(self, name, target, lun, session)
+
+    def local_disk(self, name):
+        """From now on sysfs says that NAME is a disk of the machine."""
+        lead_to_controller(self, name)
 
     # --- programs ---
 

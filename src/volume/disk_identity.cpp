@@ -1,0 +1,74 @@
+#include "volume/disk_identity.h"
+
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "support/files.h"
+#include "support/text.h"
+#include "volume/device.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr char kSession[] = "/session";
+
+using SysfsPath = char[PATH_MAX];
+
+// Resolves the disk's `device` link: .../host2/session1/target2:0:0/2:0:0:1 for a LUN. A virtual device has
+// none.
+bool find_device(const char* node, SysfsPath& path) {
+  const Text<256> disk = disk_of_node(node);
+  return !disk.empty() && realpath(Text<512>("/sys/block/%s/device", disk.c_str()), path) != nullptr;
+}
+
+// Returns the end of the path's component sessionN, or null when it has none.
+const char* find_session_end(const char* path) {
+  for (const char* at = path; (at = strstr(at, kSession)) != nullptr; at++) {
+    const char* number = at + strlen(kSession);
+    const char* end = number + strspn(number, "0123456789");
+    if (end != number && *end == '/') return end;
+  }
+  return nullptr;
+}
+
+// Reads the target's name from sessionN/iscsi_session/sessionN/targetname. Returns whether it has one.
+bool read_target_name(const char* path, const char* session_end, char (&name)[256]) {
+  const Text<PATH_MAX> session("%.*s", static_cast<int>(session_end - path), path);
+  const char* session_name = strrchr(session, '/');
+  const Text<2 * PATH_MAX> file_path("%s/iscsi_session%s/targetname", session.c_str(), session_name);
+  const File file(fopen(file_path, "re"));
+  if (!file || fgets(name, sizeof name, file.get()) == nullptr) return false;
+  name[strcspn(name, "\n")] = '\0';
+  return name[0] != '\0';
+}
+
+// Reads the LUN from the last component, H:C:T:L. It is the number that the session listing shows and the
+// tree holds: of a LUN above 255 with the bits of its addressing method (256 is 16640, 0x4100).
+bool read_lun(const char* path, long long* lun) {
+  return sscanf(strrchr(path, '/'), "/%*u:%*u:%*u:%lld", lun) == 1;
+}
+
+}  // namespace
+
+DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
+  SysfsPath path;
+  if (entry->target_name[0] == '\0' || !find_device(node, path)) return kDiskUnknown;
+  const char* session_end = find_session_end(path);
+  if (session_end == nullptr) return kDiskForeign;
+  char name[256];
+  long long lun = 0;
+  if (!read_target_name(path, session_end, name) || !read_lun(path, &lun)) return kDiskUnknown;
+  return strcmp(name, entry->target_name) == 0 && lun == entry->lun ? kDiskOurs : kDiskForeign;
+}
+
+bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller) {
+  if (disk_owner(entry, node) != kDiskForeign) return false;
+  LOG_AT(caller, 0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun,
+         entry->target_name);
+  return true;
+}
+
+}  // namespace remvol

@@ -1,0 +1,27 @@
+// Whether a disk is the one that a LUN's entry means. Kernel names (sdb) are given anew at every login and
+// after a restart, while those in the tree stay: a stored name may be another target's disk by now, or a disk
+// of the machine itself.
+#ifndef REMVOL_VOLUME_DISK_IDENTITY_H
+#define REMVOL_VOLUME_DISK_IDENTITY_H
+
+#include "frontend/log.h"
+#include "tree/record.h"
+
+namespace remvol {
+
+enum DiskOwner : int {
+  kDiskOurs,     // the session of the entry's target, the entry's LUN number
+  kDiskForeign,  // another session's, another LUN, or no session's at all: a disk of the machine
+  kDiskUnknown,  // sysfs tells nothing: no such disk, a virtual one such as a loop device, no target given
+};
+
+// Asks sysfs for the disk of `node`, a disk or partition with or without "/dev/" in front.
+DiskOwner disk_owner(const TargetEntry* entry, const char* node);
+
+// Returns whether the disk of `node` is known to be another one than the entry's; then nothing that changes
+// it or ends its users may be done. That is logged at level 0 in the caller's name.
+bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller = Caller());
+
+}  // namespace remvol
+
+#endif

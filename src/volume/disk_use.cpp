@@ -1,0 +1,122 @@
+#include "volume/disk_use.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <memory>
+
+#include "support/files.h"
+#include "support/text.h"
+#include "volume/device.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr size_t kMarkedSize = 4096;
+constexpr useconds_t kLookPause = 100000;  // microseconds
+constexpr int kClaimLooks = 10;            // a second
+constexpr int kUdevLooks = 50;             // 5 seconds
+constexpr char kMountInfo[] = "/proc/self/mountinfo";
+constexpr char kUdev[] = "/run/udev";
+constexpr char kUdevQueue[] = "/run/udev/queue";  // there while events are pending; see udevadm(8), settle
+
+struct DirCloser {
+  void operator()(DIR* directory) const { closedir(directory); }
+};
+
+// A descriptor that closes itself.
+struct Descriptor {
+  explicit Descriptor(const char* path, int flags) : fd(open(path, flags | O_CLOEXEC | O_NONBLOCK)) {}
+  ~Descriptor() {
+    if (fd >= 0) close(fd);
+  }
+  Descriptor(const Descriptor&) = delete;
+  Descriptor& operator=(const Descriptor&) = delete;
+
+  const int fd;
+};
+
+bool is_block_device(const char* node, struct stat* status) {
+  return stat(node, status) == 0 && S_ISBLK(status->st_mode);
+}
+
+bool is_claimed_now(const char* node) {
+  const Descriptor device(node, O_RDONLY | O_EXCL);  // of a block device: fails while it is in use
+  return device.fd < 0 && errno == EBUSY;
+}
+
+// udev holds a shared lock on the whole disk while it looks at the disk or at a partition of it; see
+// https://systemd.io/BLOCK_DEVICE_LOCKING.
+bool is_udev_at(const char* disk) {
+  if (access(kUdevQueue, F_OK) == 0) return true;
+  struct stat status;
+  if (!is_block_device(disk, &status)) return false;
+  const Descriptor device(disk, O_RDONLY);
+  return device.fd >= 0 && flock(device.fd, LOCK_EX | LOCK_NB) != 0 && errno == EWOULDBLOCK;
+}
+
+}  // namespace
+
+ContentMark content_mark(const char* node) {
+  struct stat status;
+  if (!is_block_device(node, &status)) return kNoMark;
+  const Descriptor device(node, O_RDONLY);
+  unsigned char content[kMarkedSize];
+  if (device.fd < 0 || pread(device.fd, content, sizeof content, 0) != sizeof content) return kNoMark;
+  ContentMark mark = 0xcbf29ce484222325;  // FNV-1a
+  for (const unsigned char byte : content) mark = (mark ^ byte) * 0x100000001b3;
+  return mark != kNoMark ? mark : 1;
+}
+
+bool is_node_mounted(const char* node) {
+  struct stat status;
+  if (!is_block_device(node, &status)) return false;
+  const File table(fopen(kMountInfo, "re"));
+  if (!table) return false;
+  char line[8192];
+  while (fgets(line, sizeof line, table.get()) != nullptr) {
+    unsigned major_number = 0;
+    unsigned minor_number = 0;
+    if (sscanf(line, "%*d %*d %u:%u ", &major_number, &minor_number) == 2 &&
+        makedev(major_number, minor_number) == status.st_rdev) {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool is_node_claimed(const char* node) {
+  struct stat status;
+  if (!is_block_device(node, &status)) return false;
+  for (int look = 0; is_claimed_now(node); look++) {
+    if (look == kClaimLooks) return true;
+    usleep(kLookPause);
+  }
+  return false;
+}
+
+bool has_partition(const char* name) {
+  const std::unique_ptr<DIR, DirCloser> directory(opendir(Text<512>("/sys/block/%s", name)));
+  if (!directory) return false;
+  while (const dirent* entry = readdir(directory.get())) {
+    if (strncmp(entry->d_name, name, strlen(name)) != 0) continue;
+    if (check_path_exist(Text<1024>("/sys/block/%s/%s/partition", name, entry->d_name)) == 0) return true;
+  }
+  return false;
+}
+
+void wait_for_udev(const char* node) {
+  if (access(kUdev, F_OK) != 0) return;
+  const Text<512> disk("/dev/%s", disk_of_node(node).c_str());
+  for (int look = 0; look < kUdevLooks && is_udev_at(disk); look++) usleep(kLookPause);
+}
+
+}  // namespace remvol

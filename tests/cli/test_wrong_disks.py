@@ -1,0 +1,265 @@
+"""Nothing destructive reaches a disk that is not the LUN's own, or that somebody else has put to use."""
+
+import re
+
+import pytest
+from appliance import messages, settings
+from harness.volumes import drive, luns
+
+__all__ = ["luns"]
+
+MIB = 1 << 20
+LEFT_ALONE = "is not the disk of LUN 0 of iqn.t1, it is left alone"
+OTHERS = ["another target", "another LUN", "a disk of the machine"]
+
+
+def turn_into(box, whose, disk="sdb"):
+    if whose == "another target":
+        box.session_disk(disk, "iqn.t2")
+    if whose == "another LUN":
+        box.session_disk(disk, "iqn.t1", lun=1)
+    if whose == "a disk of the machine":
+        box.local_disk(disk)
+    if whose == "the LUN's own":
+        box.session_disk(disk, "iqn.t1", lun=0)
+
+
+def turns_into_another(disk="sdb"):
+    """Shell text: the name belongs to another target from now on."""
+    return f"ln -sfn /fake/other/host9/session9/target9:0:0/9:0:0:0 /sys/block/{disk}/device"
+
+
+@pytest.fixture
+def volume(site, box):
+    """A connected target with one mounted volume."""
+    site.store("iqn.t1", conn_set=1, conn_state=1,
+               luns=[("data", 0, {"dev": "sdb", "mnt_dev": "/dev/sdb1", "mnt": "/mnt/VV/data"})])
+    site.offer("iqn.t1", {0: "sdb"})
+    site.log_in("iqn.t1")
+    site.disk("sdb")
+    site.mount("sdb", "/mnt/VV/data")
+    box.fake("dd")
+    box.fake("mke2fs")
+    other = "/fake/other/host9/session9"
+    box.write(f"{other}/iscsi_session/session9/targetname", "iqn.t2\n")
+    box.path(f"{other}/target9:0:0/9:0:0:0").mkdir(parents=True)
+    box.forget()
+    return site
+
+
+def ran(box, *words):
+    return [line for line in box.shell() if any(word in line for word in words)]
+
+
+class TestNamesThatMoved:
+    @pytest.mark.parametrize("whose", OTHERS)
+    def test_a_format_fails_and_touches_nothing(self, volume, box, whose):
+        turn_into(box, whose)
+        before = settings(box)
+        done = box.remvol("--format", "-n", "iqn.t1", "-l", "0")
+        assert (done.status, messages(done)) == (255, [f"sdb {LEFT_ALONE}"])
+        assert settings(box) == before
+        assert box.shell() == ["winshare_reload"]
+        assert volume.mounted("data")
+
+    @pytest.mark.parametrize("whose", ["the LUN's own", "nobody's, as far as known"])
+    def test_its_own_disk_is_formatted(self, volume, box, whose):
+        turn_into(box, whose)
+        assert box.remvol("--format", "-n", "iqn.t1", "-l", "0").status == 0
+        assert [words[-1] for words in box.runs("mke2fs")] == ["/dev/sdb1"]
+
+    @pytest.mark.parametrize("whose", OTHERS)
+    def test_a_disconnect_does_not_end_the_others_users(self, volume, box, whose):
+        turn_into(box, whose)
+        done = box.remvol("--disconnect", "-n", "iqn.t1")
+        assert done.status == 0
+        assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
+        assert ran(box, "fuser") == ['fuser -mk "/mnt/VV/data"']
+        assert not volume.mounted("data")
+
+    def test_a_disconnect_ends_its_own_users(self, volume, box):
+        turn_into(box, "the LUN's own")
+        assert box.remvol("--disconnect", "-n", "iqn.t1").status == 0
+        assert ran(box, "fuser") == ["fuser -mk /dev/sdb1", 'fuser -mk "/mnt/VV/data"']
+
+    @pytest.mark.parametrize("whose", OTHERS)
+    def test_another_volumes_ftp_mount_stays(self, volume, box, whose):
+        volume.mount("sdb", "/home/Public/other")
+        assert drive(box, "ftp_path", 1, 1).result == 0
+        turn_into(box, whose)
+        assert drive(box, "ftp_path", 1, 1).result == -104
+
+    @pytest.mark.parametrize("whose", OTHERS)
+    def test_a_wrong_disk_is_not_mounted_but_counts_as_offline(self, site, box, whose):
+        site.store("iqn.t1", luns=[("data", 0)])
+        site.offer("iqn.t1", {0: "sdb"})
+        site.disk("sdb", parts=0)
+        turn_into(box, whose)
+        done = box.remvol("--connect", "-n", "iqn.t1")
+        assert done.status == 0
+        assert f"/dev/sdb {LEFT_ALONE}" in messages(done)
+        assert site.lun("volume_state") == "2"
+        assert not ran(box, "mkdir", "mount ", "fuser", "dd", "mke2fs")
+        assert not box.trace("sys_create_1_partition")
+
+    @pytest.mark.parametrize("parts, call", [(0, "sys_create_1_partition"), (1, "sys_expand_1_partition")])
+    def test_a_disk_that_moves_away_is_not_partitioned(self, volume, box, parts, call):
+        box.session_disk("sdb", "iqn.t1")
+        box.hook("sys_get_partition_list", "/dev/sdb", ret=parts, out="sdb1" if parts else "",
+                 effect=turns_into_another(), first=True)
+        box.hook("sys_get_partition_size", "sdb1", ret=8 * MIB, first=True)
+        box.fake("mount", first=True)
+        drive(box, "mount", 1, 1, 0, 0)
+        assert not box.trace(call)
+
+    @pytest.mark.parametrize("step, reached", [("semop", []), ("fuser", ["fuser"]), ("dd", ["fuser", "dd"])])
+    def test_a_disk_that_moves_away_during_a_format(self, volume, box, step, reached):
+        box.session_disk("sdb", "iqn.t1")
+        if step == "semop":
+            box.hook("semop", re.compile("^-1"), through=True, effect=turns_into_another())
+        else:
+            box.fake(step, effect=turns_into_another(), first=True)
+        done = drive(box, "format", 1, 1, "/dev/sdb1")
+        assert done.result == -1
+        assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
+        assert [line.split()[0] for line in ran(box, "fuser", "dd if", "mke2fs")] == reached
+        assert volume.lun("format_state") == "3"
+        assert box.run(["cat", "/proc/sysvipc/sem"]).lines[1:] == [], "the semaphore is left"
+
+
+def while_waiting(box, effect):
+    """What another run does before this one gets the semaphore."""
+    box.hook("semop", re.compile("^-1"), through=True, effect=effect)
+
+
+def formatted(box):
+    return ran(box, "dd if", "mke2fs")
+
+
+class TestOtherRuns:
+    """Two runs found the same LUN empty; the other one was quicker."""
+
+    @pytest.fixture
+    def lun(self, luns):
+        lun = luns(64 * MIB)
+        lun.disk.sfdisk("label: gpt\nstart=2048,type=L\n")
+        lun.box.run(["/usr/bin/partx", "-a", lun.disk.node])
+        return lun
+
+    def make(self, lun):
+        return f"mke2fs -q -t ext4 -L theirs {lun.disk.part}"
+
+    def label(self, lun):
+        return lun.box.run(["/usr/sbin/blkid", "-p", "-o", "value", "-s", "LABEL", lun.disk.part]).stdout.strip()
+
+    def test_what_was_formatted_meanwhile_is_mounted(self, lun):
+        while_waiting(lun.box, self.make(lun))
+        done = lun.mount()
+        assert done.result == 0
+        assert f"{lun.disk.part} carries ext4 by now, it is not formatted" in messages(done)
+        assert not formatted(lun.box)
+        assert not ran(lun.box, "fuser")
+        assert (self.label(lun), lun.mounted()) == ("theirs", True)
+        assert [lun.key(key) for key in ("format_state", "volume_state")] == ["0", "0"]
+
+    def test_a_new_partition_that_was_formatted_meanwhile_too(self, luns):
+        lun = luns(64 * MIB)
+        while_waiting(lun.box, self.make(lun))
+        assert lun.mount().result == 0
+        assert not formatted(lun.box)
+        assert self.label(lun) == "theirs"
+
+    def test_what_was_mounted_meanwhile_stays(self, lun):
+        while_waiting(lun.box, f"{self.make(lun)}; mkdir -p {lun.mount_point}; mount {lun.disk.part} {lun.mount_point}; "
+                               f"echo data >{lun.mount_point}/file")
+        done = lun.mount()
+        assert done.result == 0
+        assert f"{lun.disk.part} is mounted by now, it is not formatted" in messages(done)
+        assert not formatted(lun.box)
+        assert not ran(lun.box, "fuser")
+        assert lun.read_file("file") == b"data\n"
+        assert [lun.key(key) for key in ("format_state", "volume_state")] == ["0", "0"]
+
+    def test_a_format_that_was_asked_for_goes_on(self, lun):
+        while_waiting(lun.box, self.make(lun))
+        assert lun.mount(force=1).result == 0
+        assert self.label(lun) == ""
+        assert lun.mounted()
+
+    def test_not_even_that_formats_a_mounted_disk(self, lun):
+        while_waiting(lun.box, f"{self.make(lun)}; mkdir /mnt/other; mount {lun.disk.part} /mnt/other")
+        assert lun.mount(force=1).result == -3
+        assert not formatted(lun.box)
+        assert self.label(lun) == "theirs"
+
+    def test_nor_one_that_is_in_use_unseen(self, lun):
+        lun.box.fake("fuser")
+        hold = f"import os, time; os.open('{lun.disk.part}', os.O_RDONLY | os.O_EXCL); print('held', flush=True); time.sleep(99)"
+        holder = lun.box.start(["/usr/bin/python3", "-c", hold], env={"LD_PRELOAD": None})
+        lun.box.wait_until(lambda: "held" in holder.stdout)
+        done = lun.mount(force=1)
+        assert done.result == -3
+        assert f"{lun.disk.part} is in use, it is not formatted" in messages(done)
+        assert not formatted(lun.box)
+        assert len(lun.box.trace("usleep")) == 10
+
+    def test_a_written_partition_that_carries_nothing_is_formatted(self, lun):
+        while_waiting(lun.box, f"head -c 4096 /dev/urandom >{lun.disk.part}")
+        assert lun.mount().result == 0
+        assert formatted(lun.box)
+        assert lun.mounted()
+
+    def other_partitions(self, volume, box, effect_at):
+        box.write("/sys/block/sdb/size", "1\n")
+        box.hook("sys_get_partition_list", "/dev/sdb", ret=0, out="", times=1, first=True,
+                 effect="mkdir /sys/block/sdb/sdb1; : >/sys/block/sdb/sdb1/partition" if effect_at == "list" else None)
+        box.hook("sys_create_1_partition", "/dev/sdb", ret=1,
+                 effect="mkdir /sys/block/sdb/sdb1; : >/sys/block/sdb/sdb1/partition" if effect_at == "create" else None)
+        return drive(box, "mount", 1, 1, 0, 0)
+
+    @pytest.mark.parametrize("effect_at, creates", [("list", 0), ("create", 1)])
+    def test_a_disk_that_was_partitioned_meanwhile(self, volume, box, effect_at, creates):
+        assert self.other_partitions(volume, box, effect_at).result == 0
+        assert len(box.trace("sys_create_1_partition")) == creates
+        assert not formatted(box), "what the other run's partition carries is kept"
+        assert volume.lun("volume_state") == "0"
+
+    def test_a_partition_that_nobody_made_stays_a_failure(self, volume, box):
+        assert self.other_partitions(volume, box, "never").result == -2
+
+
+class TestUdev:
+    """udev looks at a new partition: whoever uses the node then is not to be killed."""
+
+    def waits(self, box):
+        return box.trace("usleep").count("usleep 100000")
+
+    @pytest.mark.parametrize("argv", [("format", 1, 1, "/dev/sdb1"), ("unmount", 1, 1)])
+    def test_its_pending_events_are_waited_for(self, volume, box, argv):
+        box.write("/run/udev/queue", "")
+        box.hook("usleep", "100000", skip=2, times=1, through=True, effect="rm /run/udev/queue")
+        drive(box, *argv)
+        assert self.waits(box) == 3
+        trace = box.trace()
+        assert trace.index("usleep 100000") < min(i for i, line in enumerate(trace) if "fuser -mk" in line)
+
+    def test_but_not_for_ever(self, volume, box):
+        box.write("/run/udev/queue", "")
+        drive(box, "unmount", 1, 1)
+        assert self.waits(box) == 50
+        assert ran(box, "fuser")
+
+    def test_its_lock_on_the_disk_is_waited_for(self, volume, box):
+        box.path("/run/udev").mkdir()
+        box.path("/dev/sdb").unlink()
+        box.disk("sdb", 4 * MIB)
+        look = "import fcntl, time; f = open('/dev/sdb'); fcntl.flock(f, fcntl.LOCK_SH); print('looks', flush=True); time.sleep(99)"
+        worker = box.start(["/usr/bin/python3", "-c", look], env={"LD_PRELOAD": None})
+        box.wait_until(lambda: "looks" in worker.stdout)
+        box.hook("usleep", "100000", skip=2, times=1, through=True, effect=f"kill {worker.pid}; while kill -0 {worker.pid}; do :; done")
+        drive(box, "unmount", 1, 1)
+        assert 3 <= self.waits(box) < 50
+
+    def test_without_udev_nothing_is_waited_for(self, volume, box):
+        drive(box, "unmount", 1, 1)
+        assert self.waits(box) == 0
