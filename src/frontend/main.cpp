@@ -1,5 +1,6 @@
 // remvol: one command of the appliance a run. main reads the command line, runs the command's handler and
 // records the outcome.
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cstdio>
@@ -15,6 +16,7 @@
 #include "sysaux.h"
 #include "tree/access.h"
 #include "tree/keys.h"
+#include "tree/settings_file.h"
 #include "volume/share_services.h"
 
 using namespace remvol;
@@ -39,12 +41,23 @@ int fail(bool show_usage) {
   return kFailureStatus;
 }
 
-int succeed(const Command& command, int result) {
+// Anybody can make a file in /tmp. The mark of another user than root is none.
+bool is_strangers_file(const char* path) {
+  struct stat info;
+  if (lstat(path, &info) != 0) return false;
+  return !S_ISREG(info.st_mode) || (info.st_uid != 0 && info.st_uid != geteuid());
+}
+
+void copy_to_flash(Caller caller) {
+  if (access(kResetMark, F_OK) == 0 && !is_strangers_file(kResetMark)) return;
+  if (System("flashrun \"cp -f %s /usr/local/config/\"", kSettingsFile) == 0) return;
+  LOG_AT(caller, 0, "%s could not be copied to the configuration flash", kSettingsFile);
+}
+
+int succeed(const Command& command, int result, Caller caller) {
   record_result(NumberText("%d", result));
-  ktreec_dump(main_socket, 0, kSettingsFile);
-  if (command.persists && access(kResetMark, F_OK) != 0) {
-    System("flashrun \"cp -f %s /usr/local/config/\"", kSettingsFile);
-  }
+  const bool stored = store_settings(caller);
+  if (command.persists && stored) copy_to_flash(caller);
   if (command.persists) reload_share_services();
   return result;
 }
@@ -66,7 +79,7 @@ int run(const Command& command, const Options& options, Caller caller) {
     LOG_AT(caller, 1, "%s", failure_message(command));
     return fail(false);
   }
-  return succeed(command, result);
+  return succeed(command, result, caller);
 }
 
 void keep_program_path(int argc, char** argv) {

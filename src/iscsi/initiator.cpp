@@ -1,5 +1,7 @@
 #include "iscsi/initiator.h"
 
+#include <unistd.h>
+
 #include <cstdio>
 #include <cstring>
 
@@ -14,6 +16,8 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
+#include "tree/keys.h"
+#include "tree/settings_file.h"
 #include "tree/state.h"
 #include "upgrade/remvol_ver_upgrade.h"
 #include "volume/share_services.h"
@@ -24,9 +28,15 @@ namespace remvol {
 namespace {
 
 constexpr char kSettingsPidFile[] = "/var/run/ktree_sock_vv_config.pid";
+constexpr char kFlashCopy[] = "/usr/local/config/vv.xml";
 constexpr char kModuleFolder[] = "/usr/local/modules/driver";
 constexpr char kIscsidConf[] = "/etc/iscsi/iscsid.conf";
 constexpr char kNameFile[] = "/etc/iscsi/initiatorname.iscsi";
+
+// Exit statuses of ktreec.
+constexpr int kSettingsRefused = 1;
+constexpr int kTreeUnreachable = 3;
+constexpr int kLoadTries = 10;  // one a second
 
 // Top of the stack first: the order of unloading.
 constexpr const char* kModules[] = {"iscsi_tcp.ko", "libiscsi_tcp.ko", "libiscsi.ko",
@@ -89,10 +99,35 @@ void write_daemon_configuration(Caller caller) {
   LOG_AT(caller, 0, "write %s failed", kIscsidConf);
 }
 
+// Returns the exit status of the command that loads `file` into the tree.
+int load_tree(const char* file, Caller caller) {
+  return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", main_socket, file), caller));
+}
+
+// A daemon that a busy machine has not started in its second is waited for: without its settings the tree
+// would count as fresh, and be dumped over them.
+int load_saved_settings(Caller caller) {
+  int ended = load_tree(kSettingsFile, caller);
+  for (int i = 0; i < kLoadTries && ended == kTreeUnreachable && access(kSettingsFile, F_OK) == 0; i++) {
+    sleep(1);
+    ended = load_tree(kSettingsFile, caller);
+  }
+  return ended;
+}
+
+// Settings that are missing or damaged are replaced by their copy on the configuration flash.
+void load_settings(Caller caller) {
+  if (load_saved_settings(caller) != kSettingsRefused) return;
+  keep_damaged_settings(caller);
+  if (access(kFlashCopy, F_OK) != 0 || load_tree(kFlashCopy, caller) != 0) return;
+  LOG_AT(caller, 0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
+}
+
+// A killed daemon leaves its pid file behind. The result key was set a moment ago.
 void start_settings_daemon(Caller caller) {
-  if (check_path_exist(kSettingsPidFile) == 0) return;
+  if (check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult))) return;
   start_tree_daemon(main_socket, caller);
-  run_command(CommandText("ktreec -S %s -l %s", main_socket, kSettingsFile), caller);
+  load_settings(caller);
 }
 
 // A module that is not loaded is no failure here.

@@ -16,6 +16,9 @@ inline constexpr char main_socket[] = "/var/run/ktree_sock_vv";
 // What it is dumped to after a command, and loaded from at start-up.
 inline constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
 
+// Returns whether a daemon serves the tree: it has `key`, also with an empty value, or takes a connection.
+[[nodiscard]] bool tree_answers(const char* key);
+
 // Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns whether the key is present.
 [[nodiscard]] bool tree_read(const char* key, char* buffer, size_t size);
 

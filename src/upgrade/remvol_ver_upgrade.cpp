@@ -61,11 +61,22 @@ int move_share(int n, Caller caller) {
   return set_value(KeyText(key::kLunShare, n, kLunSlot), share, caller);
 }
 
+// A conversion would make the first LUN of such a target its number 0 and forget the others. One that was
+// interrupted left number 0 and no share: it goes on.
+bool is_in_todays_form(int n) {
+  return tree_read_number(KeyText(key::kLunNumber, n, kLunSlot), 0) != 0 ||
+         tree_present(KeyText(key::kLunShare, n, kLunSlot));
+}
+
 int upgrade_target(int n, Caller caller) {
   const KeyText name(key::kTargetName, n);
   if (tree_slot_is_free(name)) {
     LOG_AT(caller, 2, "get %s fail", name.c_str());
     return kFailed;
+  }
+  if (is_in_todays_form(n)) {
+    LOG_AT(caller, 1, "%s is in today's form", name.c_str());
+    return kOk;
   }
   if (set_value(KeyText(key::kTargetLunCount, n), "1", caller) != kOk ||
       set_value(KeyText(key::kLunNumber, n, kLunSlot), "0", caller) != kOk ||

@@ -189,6 +189,24 @@ TEST_F(Conversion, AMissingShareStopsItWithTheTextOfAFailedWrite) {
   EXPECT_EQ(fakes::tree_get(at(3, "lun/count")), std::nullopt);
 }
 
+TEST_F(Conversion, LunsInTodaysFormAreLeftAlone) {
+  put_old_targets(3);
+  fakes::tree_set(
+      {{at(1, "lun/id:1/lun"), "5"}, {at(2, "lun/id:1/lun"), "0"}, {at(2, "lun/id:1/share"), "renamed"}});
+  const auto before = fakes::tree_dump();
+  EXPECT_EQ(version_upgrade_v0_to_v1(), 0);
+  for (const auto& [key, value] : before) EXPECT_EQ(fakes::tree_get(key), value) << key;
+  EXPECT_EQ(fakes::tree_get(at(2, "lun/count")), std::nullopt);
+  expect_converted(3);
+}
+
+TEST_F(Conversion, OneThatWasInterruptedBeforeTheShareGoesOn) {
+  put_old_targets(1);
+  fakes::tree_set({{at(1, "lun/id:1/lun"), "0"}});
+  EXPECT_EQ(version_upgrade_v0_to_v1(), 0);
+  expect_converted(1);
+}
+
 class RefusedWrite : public fakes::Test, public testing::WithParamInterface<const char*> {};
 
 TEST_P(RefusedWrite, StopsTheConversion) {

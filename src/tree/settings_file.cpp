@@ -1,0 +1,122 @@
+#include "tree/settings_file.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "ktreec.h"
+#include "support/files.h"
+#include "tree/access.h"
+#include "tree/keys.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr long kMostRead = 4L << 20;  // the settings of all targets are some ten kibibytes
+constexpr const char* kVersionPath[] = {"config", "iscsi", "initiator", "ver"};
+constexpr int kVersionDepth = sizeof kVersionPath / sizeof *kVersionPath;
+constexpr char kSettingsFolder[] = "/etc/NAS_CFG";
+constexpr char kFileEnd[] = "</config>";
+
+// A tag of the file: its text, cut to the size, and its last character.
+struct Tag {
+  char text[32];
+  char last;
+
+  bool is_named(const char* name) const {
+    const size_t length = strlen(name);
+    return strncmp(text, name, length) == 0 && strchr(" \t\r\n/", text[length]) != nullptr;
+  }
+  bool is_markup() const { return text[0] == '?' || text[0] == '!'; }
+  bool closes() const { return text[0] == '/'; }
+  bool opens() const { return !is_markup() && !closes() && last != '/'; }
+};
+
+// Reads on to the next tag. Returns whether there is one.
+bool next_tag(FILE* file, Tag* tag) {
+  *tag = Tag();
+  bool inside = false;
+  size_t length = 0;
+  for (int c; ftell(file) < kMostRead && (c = getc(file)) != EOF;) {
+    if (inside && c == '>') return true;
+    if (inside) {
+      tag->last = static_cast<char>(c);
+      if (length < sizeof tag->text - 1) tag->text[length++] = tag->last;
+    }
+    inside = inside || c == '<';
+  }
+  return false;
+}
+
+// Returns whether text follows, not the next tag.
+bool has_text(FILE* file) {
+  const int c = getc(file);
+  return c != EOF && c != '<';
+}
+
+bool find_version(FILE* file) {
+  int depth = 0;
+  int on_path = 0;  // how many of the open elements lead to the version
+  for (Tag tag; depth >= 0 && next_tag(file, &tag);) {
+    if (tag.opens() && on_path == depth && tag.is_named(kVersionPath[depth])) on_path++;
+    if (on_path == kVersionDepth) return has_text(file);
+    if (tag.opens()) depth++;
+    if (tag.closes()) depth--;
+    if (on_path > depth) on_path = depth;
+  }
+  return false;
+}
+
+// Where the folder is missing nobody keeps settings: that is no line of the log, which programs read.
+void tell_failed_dump(Caller caller) {
+  if (access(kSettingsFolder, F_OK) == 0) {
+    LOG_AT(caller, 0, "ktreec_dump(%s) failed", kSettingsFile);
+  } else {
+    fprintf(stderr, "remvol: the settings are not saved, there is no %s\n", kSettingsFolder);
+  }
+}
+
+}  // namespace
+
+bool settings_file_has_version(const char* path) {
+  const File file(fopen(path, "re"));
+  return file != nullptr && find_version(file.get());
+}
+
+bool settings_file_is_torn(const char* path) {
+  char end[64];
+  const File file(fopen(path, "re"));
+  if (file == nullptr) return false;
+  if (fseek(file.get(), -static_cast<long>(sizeof end), SEEK_END) != 0) rewind(file.get());
+  size_t length = fread(end, 1, sizeof end, file.get());
+  while (length > 0 && strchr(" \t\r\n", end[length - 1]) != nullptr) length--;
+  constexpr size_t kEndLength = sizeof kFileEnd - 1;
+  return length < kEndLength || memcmp(end + length - kEndLength, kFileEnd, kEndLength) != 0;
+}
+
+bool dump_would_bury_settings() {
+  return !tree_present(key::kVersion) && settings_file_has_version(kSettingsFile);
+}
+
+bool store_settings(Caller caller) {
+  if (dump_would_bury_settings()) {
+    LOG_AT(caller, 0, "%s is kept as it is: the tree was never loaded from it", kSettingsFile);
+    return false;
+  }
+  if (ktreec_dump(main_socket, 0, kSettingsFile) == 0) return true;
+  tell_failed_dump(caller);
+  return !settings_file_is_torn(kSettingsFile);
+}
+
+// By a link, so that there is a settings file at every moment; a file system without links gets it renamed.
+void keep_damaged_settings(Caller caller) {
+  unlink(kDamagedSettingsFile);
+  if (link(kSettingsFile, kDamagedSettingsFile) == 0 || errno == ENOENT) return;
+  if (rename(kSettingsFile, kDamagedSettingsFile) == 0) return;
+  LOG_AT(caller, 0, "%s cannot be kept as %s", kSettingsFile, kDamagedSettingsFile);
+}
+
+}  // namespace remvol

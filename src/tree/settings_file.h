@@ -1,0 +1,32 @@
+// The settings file on disk beside the tree that it is made of: no dump may cost settings.
+#ifndef REMVOL_TREE_SETTINGS_FILE_H
+#define REMVOL_TREE_SETTINGS_FILE_H
+
+#include "frontend/log.h"
+
+namespace remvol {
+
+// Returns whether the settings file at `path` holds a settings version. A look at the first mebibytes of its
+// text, not a check of the file.
+[[nodiscard]] bool settings_file_has_version(const char* path);
+
+// Returns whether there is a file at `path` that does not end like a settings file: it is empty or cut off.
+[[nodiscard]] bool settings_file_is_torn(const char* path);
+
+// Returns whether a dump would lose settings: the tree has no settings version and kSettingsFile has one, so
+// the tree was started and never loaded.
+[[nodiscard]] bool dump_would_bury_settings();
+
+// Dumps the tree to kSettingsFile. A dump that is withheld or fails is logged at level 0 in the caller's
+// name; one for which there is no folder is told on standard error. Returns whether what kSettingsFile holds
+// then may go to the configuration flash.
+[[nodiscard]] bool store_settings(Caller caller = Caller());
+
+// Keeps kSettingsFile, which could not be loaded, under the name kDamagedSettingsFile as well.
+void keep_damaged_settings(Caller caller = Caller());
+
+inline constexpr char kDamagedSettingsFile[] = "/etc/NAS_CFG/vv.xml.damaged";
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,210 @@
+"""Settings are never lost: a tree that was never loaded, a daemon that died, settings that are damaged."""
+
+import os
+import re
+
+import pytest
+from test_iscsi_init import START_TREE, appliance, bring_up, init
+
+SAVED, COPY, DAMAGED = "/etc/NAS_CFG/vv.xml", "/usr/local/config/vv.xml", "/etc/NAS_CFG/vv.xml.damaged"
+FLASH = f'system flashrun "cp -f {SAVED} /usr/local/config/"'
+LOAD_COPY = f"system ktreec -S /var/run/ktree_sock_vv -l {COPY}"
+MARK = "/tmp/reset_default"
+
+
+def settings(prefix, version="<ver>1</ver>"):
+    return f"<config>\n <iscsi>\n  <initiator>{version}<prefix>{prefix}</prefix></initiator>\n </iscsi>\n</config>\n"
+
+
+def prefix(box):
+    return box.tree.get("/iscsi/initiator/prefix")
+
+
+# --- a dump over settings that were never loaded ---
+
+
+def test_a_restarted_tree_is_not_dumped_over_the_settings(box):
+    box.tree.set({"/iscsi/initiator/ver": "1", "/iscsi/initiator/prefix": "precious"})
+    box.path("/etc/NAS_CFG").mkdir()
+    assert box.remvol("--check_share_name", "-s", "x").status == 0
+    saved = box.path(SAVED).read_text()
+    assert "precious" in saved
+    box.tree.restart()
+    box.forget()
+    done = box.remvol("--check_share_name", "-s", "x")
+    assert done.status == 0
+    assert f"{SAVED} is kept as it is: the tree was never loaded from it" in done.stdout
+    assert box.path(SAVED).read_text() == saved
+    assert box.trace("dump") == []
+    assert box.tree.get("/result/check_share_name") == "0"
+
+
+def test_what_was_not_dumped_is_not_copied_to_flash(box):
+    box.write(SAVED, settings("precious"))
+    box.fake("iscsiadm")
+    assert box.remvol("--disconnect").status == 0
+    assert box.trace("dump") == [] and FLASH not in box.trace("system")
+    assert "system winshare_reload ; macshare_reload" in box.trace("system")
+
+
+# What a file must hold to count as settings: the version, where it belongs.
+VERSIONS = {
+    "one line": ('<?xml version="1.0"?><config><iscsi><initiator><ver>1</ver></initiator></iscsi></config>', True),
+    "attributes": ('<config a="b"><x/><iscsi\n b="1"><id>t</id><initiator c="d"><id><a/></id><ver z="1">1</ver>', True),
+    "torn behind it": ("<config><iscsi><initiator><ver>1", True),
+    "long tag": (f'<config><iscsi><initiator><x y="{"z" * 99}"/><ver>1</ver></initiator></iscsi></config>', True),
+    "empty": ("", False),
+    "no version": ("<config><iscsi><initiator><prefix>p</prefix></initiator></iscsi></config>", False),
+    "an empty version": ("<config><iscsi><initiator><ver></ver></initiator></iscsi></config>", False),
+    "an empty element": ("<config><iscsi><initiator><ver/></initiator></iscsi></config>", False),
+    "elsewhere": ("<config><ver>1</ver><iscsi><ver>1</ver><initiator><id><ver>1</ver></id><vers>1</vers>"
+                  "</initiator></iscsi></config>", False),
+    "rubbish": ("</a></b><config><iscsi><initiator><ver>1</ver>", False),
+}
+
+
+@pytest.mark.parametrize("text, withheld", VERSIONS.values(), ids=VERSIONS)
+def test_only_settings_with_a_version_are_kept(box, text, withheld):
+    box.write(SAVED, text)
+    assert box.remvol("--check_share_name", "-s", "x").status == 0
+    assert (box.trace("dump") == []) == withheld
+    assert (box.path(SAVED).read_text() == text) == withheld
+
+
+def test_a_failed_dump_is_told(box):
+    box.path("/etc/NAS_CFG").mkdir()
+    box.hook("ktreec_dump", ret=-1)
+    done = box.remvol("--verupgrade")
+    assert done.status == 0
+    assert f"ktreec_dump({SAVED}) failed" in done.stdout
+
+
+def test_settings_that_nobody_made_a_place_for_are_told_beside_the_log(box):
+    done = box.remvol("--verupgrade")
+    assert (done.status, done.stdout) == (0, "\n")
+    assert done.stderr == "remvol: the settings are not saved, there is no /etc/NAS_CFG\n"
+
+
+@pytest.mark.parametrize("text, copied", [(settings("whole"), True), ("<config><iscsi>", False), ("", False)])
+def test_after_a_failed_dump_only_a_whole_file_goes_to_flash(box, text, copied):
+    box.tree.set("/iscsi/initiator/ver", "1")
+    box.write(SAVED, text)
+    box.fake("iscsiadm")
+    box.hook("ktreec_dump", ret=-1)
+    assert box.remvol("--disconnect").status == 0
+    assert (FLASH in box.trace("system")) == copied
+
+
+# --- the flash copy ---
+
+
+@pytest.mark.parametrize("plant, copied", [("touch", False), ("mkdir", True), ("ln -s /etc/passwd", True),
+                                           ("mkfifo", True)])
+def test_a_mark_that_is_no_file_of_root_does_not_stop_the_copying(box, plant, copied):
+    box.run(["sh", "-c", f"{plant} {MARK}"], env={"LD_PRELOAD": None})
+    box.fake("iscsiadm")
+    assert box.remvol("--disconnect").status == 0
+    assert (FLASH in box.trace("system")) == copied
+
+
+def test_the_mark_of_another_user_does_not_stop_the_copying(box):
+    os.chown(box.write(MARK, ""), 1234, 1234)
+    box.fake("iscsiadm")
+    assert box.remvol("--disconnect").status == 0
+    assert FLASH in box.trace("system")
+
+
+def test_settings_that_cannot_be_copied_to_flash_are_spoken_of(box):
+    box.fake("iscsiadm")
+    box.fake("flashrun", status=1, first=True)
+    done = box.remvol("--disconnect")
+    assert done.status == 0
+    assert f"{SAVED} could not be copied to the configuration flash" in done.stdout
+
+
+# --- start-up ---
+
+
+def test_a_daemon_that_was_killed_is_started_again(box):
+    appliance(box)
+    box.write(SAVED, settings("saved"))
+    assert box.tree.get("/x") is None
+    box.tree.daemon.kill(9)
+    box.tree.daemon.wait()
+    assert box.path("/var/run/ktree_sock_vv_config.pid").exists()
+    box.hook("sleep", "1", first=True, times=1, effect="until ktreec -S /var/run/ktree_sock_vv -t >/dev/null 2>&1 || "
+             "[ $? -ne 3 ]; do sleep 0.01; done")
+    init(box)
+    assert box.trace()[: len(START_TREE)] == START_TREE
+    assert prefix(box) == "saved"
+    assert "saved" in box.path(SAVED).read_text()
+
+
+def test_a_daemon_that_is_stopped_is_not_started_twice(box):
+    """It has the connection taken by the kernel, so it lives."""
+    box.tree.set("/a", "1")
+    appliance(box)
+    box.hook("ktreec_get_wb", "/result/init", ret=-1)
+    init(box)
+    assert START_TREE[0] not in box.trace()
+
+
+@pytest.mark.parametrize("saved", [None, "", "<config><iscsi><initi", "<config><a></b></config>"])
+def test_settings_that_are_lost_come_from_the_flash(bare_box, saved):
+    box = bare_box
+    appliance(box)
+    box.write(COPY, settings("copy"))
+    if saved is not None:
+        box.write(SAVED, saved, mode=0o600)
+    else:
+        box.path("/etc/NAS_CFG").mkdir()
+    done = init(box)
+    assert box.trace() == START_TREE + [LOAD_COPY] + bring_up("copynas-box:initiator-1b2c3d")
+    assert f"{SAVED} is missing or damaged, {COPY} was loaded instead" in done.stdout
+    assert "copy" in box.path(SAVED).read_text()
+    kept = box.path(DAMAGED)
+    assert (kept.read_text() if kept.exists() else None) == saved
+    if saved is not None:
+        assert kept.stat().st_mode & 0o777 == 0o600
+
+
+def test_damaged_settings_without_a_copy_are_kept(bare_box):
+    box = bare_box
+    appliance(box)
+    box.write(SAVED, "<config><precious")
+    box.write(DAMAGED, "an earlier one")
+    init(box)
+    assert box.trace() == START_TREE + bring_up()
+    assert box.path(DAMAGED).read_text() == "<config><precious"
+
+
+def test_a_daemon_that_is_slow_to_start_is_waited_for(bare_box):
+    """Its tree would count as fresh and be dumped over the settings."""
+    box = bare_box
+    box.hook("sleep", "1", times=1)
+    box.hook("sleep", "1", times=1, effect="until ktreec -S /var/run/ktree_sock_vv -t >/dev/null 2>&1 || [ $? -ne 3 ]; "
+             "do sleep 0.01; done")
+    appliance(box)
+    slow = "sleep 0.5; exec $REAL"
+    box.write("/fake/bin/ktree", f"#!/bin/sh\nunset LD_PRELOAD\n{slow}\n".replace("$REAL", f'{box.build}/bin/ktree "$@"'),
+              mode=0o755)
+    box.write(SAVED, settings("saved"))
+    done = init(box)
+    assert box.trace("system")[:3] == [START_TREE[0], START_TREE[2], START_TREE[2]]
+    assert prefix(box) == "saved"
+    assert "saved" in box.path(SAVED).read_text()
+    assert re.findall(r"cmd '(ktreec .*)' failed", done.stdout) == [START_TREE[2].removeprefix("system ")]
+
+
+def test_luns_in_todays_form_are_not_converted_without_a_version(box):
+    appliance(box)
+    lun = "/iscsi/initiator/id:1/lun/id:"
+    values = {"/iscsi/initiator/count": "1", "/iscsi/initiator/id:1/target": "iqn.t1",
+              "/iscsi/initiator/id:1/share": "old", "/iscsi/initiator/id:1/lun/count": "2",
+              "/iscsi/initiator/id:1/conn_set": "0", lun + "1/lun": "5", lun + "1/share": "five",
+              lun + "1/vol_access_right": "0", lun + "2/lun": "7", lun + "2/share": "seven"}
+    box.tree.set(values)
+    box.default("iscsiadm")
+    init(box)
+    assert {key: box.tree.get(key) for key in values} == values
+    assert box.tree.get("/iscsi/initiator/ver") == "1"
