@@ -9,11 +9,13 @@
 #include <unistd.h>
 #include <cerrno>
 
+#include "lock_file.h"
+
 namespace flash {
 namespace {
 
-constexpr char kDoor[] = "/run/flashrun.door";
-constexpr char kUsers[] = "/run/flashrun.users";
+constexpr char kDoor[] = "flash.door";
+constexpr char kUsers[] = "flash.users";
 constexpr int kBusyTries = 100;
 constexpr long kBusyWait = 20'000'000;  // nanoseconds
 
@@ -45,13 +47,6 @@ void write_out(const char* folder) {
   if (fd < 0) return;
   syncfs(fd);
   close(fd);
-}
-
-bool lock(int fd, int how) {
-  int done;
-  while ((done = flock(fd, how)) != 0 && errno == EINTR) {
-  }
-  return done == 0;
 }
 
 }  // namespace
@@ -88,9 +83,8 @@ UserLock::~UserLock() {
 }
 
 bool UserLock::open_files() {
-  constexpr int kFlags = O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW;
-  door_ = open(kDoor, kFlags, 0600);
-  users_ = open(kUsers, kFlags, 0600);
+  door_ = open_lock_file(kDoor);
+  users_ = open_lock_file(kUsers);
   return door_ >= 0 && users_ >= 0;
 }
 
@@ -111,23 +105,23 @@ void UserLock::record(Opened opened) const {
 }
 
 bool UserLock::enter(const char* folder) {
-  if (!open_files() || !lock(door_, LOCK_EX)) return false;
-  const bool entered = lock(users_, LOCK_SH);
+  if (!open_files() || !take_lock(door_, LOCK_EX)) return false;
+  const bool entered = take_lock(users_, LOCK_SH);
   Opened opened = Opened::kNot;
   const bool writable = make_writable(folder, opened);
   const int error = errno;
   // A record that is there already says how it was opened by somebody who is still inside, or who died.
   if (opened != Opened::kNot) record(opened);
-  lock(door_, LOCK_UN);
+  take_lock(door_, LOCK_UN);
   errno = error;
   return entered && writable;
 }
 
 bool UserLock::leave(const char* folder) {
-  if (users_ < 0 || !lock(door_, LOCK_EX)) return false;
+  if (users_ < 0 || !take_lock(door_, LOCK_EX)) return false;
   bool closed = true;
   Opened opened = Opened::kNot;
-  if (lock(users_, LOCK_EX | LOCK_NB) && recall(opened)) {
+  if (take_lock(users_, LOCK_EX | LOCK_NB) && recall(opened)) {
     const timespec wait{0, kBusyWait};
     for (int tries = 0; !(closed = make_read_only(folder, opened)) && errno == EBUSY && tries < kBusyTries;
          ++tries) {
@@ -136,10 +130,10 @@ bool UserLock::leave(const char* folder) {
     if (closed) record(Opened::kNot);
   }
   const int error = errno;
-  lock(users_, LOCK_UN);  // for the forked copies as well
+  take_lock(users_, LOCK_UN);  // for the forked copies as well
   close(users_);
   users_ = -1;
-  lock(door_, LOCK_UN);
+  take_lock(door_, LOCK_UN);
   errno = error;
   return closed;
 }

@@ -15,12 +15,13 @@
 #include <initializer_list>
 
 #include "flash.h"
+#include "settings_copy.h"
 
 namespace {
 
-constexpr char kFolder[] = "/usr/local/config";
+using flash::kFolder;
 constexpr char kSettings[] = "/usr/local/config/vv.xml";
-constexpr int kUsage = 2, kCannotRun = 126, kNotFound = 127, kKilled = 128;
+constexpr int kTorn = 1, kUsage = 2, kCannotRun = 126, kNotFound = 127, kKilled = 128;
 
 // The settings hold secrets. A copy that is there already keeps its mode when cp writes into it, so it is
 // taken from everybody but its owner before it gets new ones.
@@ -74,23 +75,32 @@ void leave(flash::UserLock& lock) {
   if (!lock.leave(kFolder)) fprintf(stderr, "flashrun: %s stays writable: %s\n", kFolder, strerror(errno));
 }
 
-[[noreturn]] void run_guard(char** command, flash::UserLock& lock, const sigset_t& callers_mask) {
-  const pid_t group = getpgrp();
-  setpgid(0, 0);
-  const pid_t child = fork();
+// Starts the command in the process group `group`, waits for its end and puts back settings that it left
+// torn. Returns an exit status. A command that is to take the place of this process where nothing has to be
+// watched does so.
+int run_command(char** command, pid_t group, const sigset_t& callers_mask, bool may_replace) {
+  flash::SettingsCopy copy;
+  const bool is_copy = copy.parse(command);
+  flash::KeptSettings kept;
+  const bool watched = is_copy || kept.keep() || !may_replace;
+  const pid_t child = watched ? fork() : 0;
   if (child == 0) {
     setpgid(0, group);
     sigprocmask(SIG_SETMASK, &callers_mask, nullptr);
+    if (is_copy) _exit(copy.run());
     exec_command(command);
   }
-  int status = kCannotRun << 8;
-  if (child > 0) {
-    status = wait_for(child);
-  } else {
-    perror("flashrun: fork");
-  }
+  if (child < 0) perror("flashrun: fork");
+  const int status = child < 0 ? kCannotRun : exit_status(wait_for(child));
+  return kept.settle() || status != 0 ? status : kTorn;
+}
+
+[[noreturn]] void run_guard(char** command, flash::UserLock& lock, const sigset_t& callers_mask) {
+  const pid_t group = getpgrp();
+  setpgid(0, 0);
+  const int status = run_command(command, group, callers_mask, false);
   leave(lock);
-  _exit(exit_status(status));
+  _exit(status);
 }
 
 }  // namespace
@@ -101,11 +111,10 @@ int main(int argc, char** argv) {
     return kUsage;
   }
   char** command = argv + 1;
-  if (!flash::is_mount(kFolder)) exec_command(command);
-
   const sigset_t awaited = awaited_signals();
   sigset_t callers_mask;
   sigprocmask(SIG_BLOCK, &awaited, &callers_mask);
+  if (!flash::is_mount(kFolder)) return run_command(command, getpgrp(), callers_mask, true);
   flash::UserLock lock;
   if (!lock.enter(kFolder)) {
     fprintf(stderr, "flashrun: %s cannot be made writable: %s\n", kFolder, strerror(errno));

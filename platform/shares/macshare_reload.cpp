@@ -13,7 +13,7 @@ namespace {
 
 constexpr char kConfig[] = "/etc/netatalk/afp.conf";
 constexpr char kShares[] = "/run/remvol/afp-shares.conf";
-constexpr char kLock[] = "/run/remvol/afp-shares.lock";
+constexpr char kLock[] = "afp-shares.lock";
 
 }  // namespace
 

@@ -16,10 +16,11 @@
 #include <cstdlib>
 #include <string_view>
 
+#include "lock_file.h"
+
 namespace shares {
 namespace {
 
-constexpr char kFolder[] = "/run/remvol";
 constexpr int kPatience = 5000;  // milliseconds
 
 // `output` is where the program's output goes; nowhere when it is negative.
@@ -71,9 +72,8 @@ void log_line(const char* format, ...) {
 }
 
 bool take_turn(const char* lock_file) {
-  mkdir(kFolder, 0755);
-  const int fd = open(lock_file, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
-  return fd >= 0 && flock(fd, LOCK_EX) == 0;
+  const int fd = open_lock_file(lock_file);
+  return fd >= 0 && take_lock(fd, LOCK_EX);
 }
 
 int run(const std::vector<std::string>& words, std::string* output) {

@@ -24,7 +24,7 @@ namespace {
 
 constexpr char kConfig[] = "/etc/samba/smb.conf";
 constexpr char kShares[] = "/run/remvol/smb-shares.conf";
-constexpr char kLock[] = "/run/remvol/smb-shares.lock";
+constexpr char kLock[] = "smb-shares.lock";
 constexpr char kPidFile[] = "/run/samba/smbd.pid";
 
 bool has_module(const std::string& name) {

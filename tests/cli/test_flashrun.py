@@ -91,7 +91,7 @@ def test_a_plain_folder_is_simply_written(flash):
     done = flash.run(f"cp -f /vv.xml {FOLDER}/")
     assert (done.status, done.stdout, done.stderr) == (0, "", "")
     assert flash.box.path(f"{FOLDER}/vv.xml").read_text() == "settings"
-    assert not flash.box.path("/run/flashrun.door").exists()
+    assert not flash.box.path("/run/remvol/flash.door").exists()
 
 
 @pytest.mark.unsanitized
@@ -239,6 +239,213 @@ def test_a_file_left_open_for_writing_is_reported_and_closed_by_the_next_run(fla
     flash.kill_all("sleep")
     assert flash.run("true").status == 0
     assert flash.read_only
+
+
+# --- the copy of the settings is whole at every moment ---
+
+OLD = "<config>" + "<a>old</a>" * 900 + "</config>\n"
+NEW = "<config>" + "<a>newer</a>" * 900 + "</config>\n"
+SAVED, COPY = "/etc/NAS_CFG/vv.xml", f"{FOLDER}/vv.xml"
+
+
+@pytest.fixture
+def copied(flash):
+    """A flash with an old copy beside new settings."""
+    flash.box.write(SAVED, NEW, mode=0o600)
+    flash.box.write(COPY, OLD, mode=0o600)
+    return flash
+
+
+def names(flash):
+    return sorted(os.listdir(flash.box.path(FOLDER)))
+
+
+def content(flash):
+    return flash.box.path(COPY).read_text()
+
+
+def traced(flash, option, *words):
+    log = "/fake/trace"
+    return flash.box.run(["strace", "-f", "-y", "-o", log, *option, *flash.argv(*words)],
+                         env={"LD_PRELOAD": None, "ASAN_OPTIONS": "detect_leaks=0"})
+
+
+STEPS = ["openat", "fchmod", "pread64", "write", "fsync", "rename,renameat,renameat2", "close", "unlink,unlinkat"]
+
+
+@pytest.mark.unsanitized
+@pytest.mark.parametrize("step", STEPS)
+def test_a_copy_that_dies_at_any_moment_leaves_the_old_one_or_the_new_one(copied, step):
+    deaths = 0
+    while True:
+        copied.box.write(COPY, OLD)
+        done = traced(copied, ["-e", f"inject={step}:signal=SIGKILL:when={deaths + 1}"], COPY_SETTINGS)
+        if done.status == 0:
+            break
+        deaths += 1
+        assert content(copied) in (OLD, NEW)
+    assert deaths > 0
+    assert content(copied) == NEW
+    assert copied.run(COPY_SETTINGS).status == 0
+    assert names(copied) == ["vv.xml"]
+
+
+@pytest.mark.unsanitized
+@pytest.mark.parametrize("fault", ["fchmod:error=EIO", "write:error=ENOSPC", "write:error=EIO", "fsync:error=EIO",
+                                   "rename,renameat,renameat2:error=EROFS", "pread64:error=EIO"])
+def test_a_copy_that_fails_leaves_the_old_one_and_says_so(copied, fault):
+    of_the_settings = ["-P", SAVED] if "pread64" in fault else []  # the loader of programs reads in this way as well
+    done = traced(copied, [*of_the_settings, "-e", f"inject={fault}:when=1"], COPY_SETTINGS)
+    assert done.status == 1
+    assert done.stderr.startswith(f"flashrun: {SAVED} is not copied to {FOLDER}: ")
+    assert content(copied) == OLD
+    assert names(copied) == ["vv.xml"]
+
+
+def test_a_full_flash_keeps_the_old_copy(flash):
+    flash.mount("rw,size=64k")
+    flash.box.write(SAVED, NEW)
+    flash.box.write("/old", OLD)
+    flash.sh(f"cp /old {COPY}; cat /dev/zero >{FOLDER}/fill 2>/dev/null; /bin/mount -o remount,ro {FOLDER}")
+    done = flash.run(COPY_SETTINGS)
+    assert (done.status, done.stderr) == (
+        1, f"flashrun: {SAVED} is not copied to {FOLDER}: No space left on device\n")
+    assert flash.sh(f"cat {COPY}") == OLD
+    assert flash.sh(f"ls -A {FOLDER}").split() == ["fill", "vv.xml"]
+    assert flash.read_only
+
+
+@pytest.mark.unsanitized
+def test_the_copy_is_on_the_disk_before_it_gets_the_name_and_the_folder_after_it(copied):
+    assert traced(copied, ["-e", "trace=fsync,rename,renameat,renameat2"], COPY_SETTINGS).status == 0
+    lines = [line for line in copied.box.path("/fake/trace").read_text().splitlines() if FOLDER in line]
+    assert [line.split("(")[0].split()[-1] for line in lines] == ["fsync", "renameat", "fsync"]
+    assert ".new>" in lines[0] and f"{FOLDER}>" in lines[2]
+
+
+@pytest.mark.parametrize("line", [f"cp -f {SAVED} {FOLDER}/", f"cp {SAVED} {FOLDER}", f" cp  -f {SAVED}\t{COPY} ",
+                                  ("cp", "-f", SAVED, f"{FOLDER}/"), ("cp", SAVED, COPY)])
+@pytest.mark.parametrize("mounted", [False, True])
+def test_every_plain_copy_is_one_step(copied, line, mounted):
+    if mounted:
+        copied.mount("rw")
+        copied.sh(f"echo '{OLD.strip()}' >{COPY}; /bin/mount -o remount,ro {FOLDER}")
+    before = copied.sh(f"stat -c %i {COPY}")
+    done = copied.run(*(line if isinstance(line, tuple) else (line,)))
+    assert (done.status, done.stdout, done.stderr) == (0, "", "")
+    assert copied.sh(f"cat {COPY}") == NEW
+    assert copied.sh(f"stat -c %i {COPY}") != before
+    assert copied.sh(f"stat -c %a {COPY}") == "600\n"
+
+
+@pytest.mark.parametrize("line", [f"cp -f {SAVED} {FOLDER}/; exit 3", f"X=1 cp {SAVED} {FOLDER}/ && exit 3",
+                                  f"cp $PWD{SAVED} {FOLDER}/; exit 3"])
+def test_other_lines_are_the_shells(copied, line):
+    assert copied.run(line).status == 3
+    assert content(copied) == NEW
+
+
+def test_settings_that_are_missing_are_said(flash):
+    done = flash.run(COPY_SETTINGS)
+    assert (done.status, done.stderr) == (1, f"flashrun: {SAVED}: No such file or directory\n")
+    assert names(flash) == []
+
+
+def test_a_link_in_the_place_of_the_copy_is_replaced(copied):
+    copied.box.write("/precious", "precious")
+    copied.sh(f"ln -sf /precious {COPY}")
+    assert copied.run(COPY_SETTINGS).status == 0
+    assert content(copied) == NEW and not copied.box.path(COPY).is_symlink()
+    assert copied.box.path("/precious").read_text() == "precious"
+
+
+@pytest.mark.parametrize("mounted", [False, True])
+@pytest.mark.parametrize("line", [f"head -c 100 {SAVED} >{COPY}", f": >{COPY}; exit 5", f": >{COPY}; kill -9 $$"])
+def test_settings_that_another_command_leaves_torn_are_put_back(copied, line, mounted):
+    if mounted:
+        copied.mount("rw")
+        copied.sh(f"echo '{OLD.strip()}' >{COPY}; /bin/mount -o remount,ro {FOLDER}")
+    done = copied.run(line)
+    assert done.status == (5 if "exit" in line else 128 + 9 if "kill" in line else 1)
+    assert done.stderr == f"flashrun: {COPY} was torn, the former one is back\n"
+    assert copied.sh(f"cat {COPY}; ls -A {FOLDER}") == OLD + "vv.xml\n"
+
+
+@pytest.mark.parametrize("line, left", [(f"cat {SAVED} >{COPY}", NEW), (f"rm {COPY}", None), ("exit 0", OLD)])
+def test_what_another_command_does_on_purpose_stays(copied, line, left):
+    done = copied.run(line)
+    assert (done.status, done.stderr) == (0, "")
+    assert names(copied) == ([] if left is None else ["vv.xml"])
+    assert left is None or content(copied) == left
+
+
+def test_settings_that_a_killed_command_left_torn_are_put_back_by_the_next_run(copied):
+    running = copied.start(f": >{COPY}; sleep 1000")
+    copied.box.wait_until(lambda: copied.commands("sleep"), what="the command")
+    copied.kill_all("flashrun")
+    copied.kill_all("sleep")
+    running.wait()
+    assert content(copied) == ""
+    assert copied.run("true").status == 0
+    assert content(copied) == OLD and names(copied) == ["vv.xml"]
+
+
+def test_what_a_running_command_keeps_is_left_to_it(copied):
+    running = copied.start(f": >{COPY}; until [ -e /go ]; do sleep 0.01; done")
+    copied.box.wait_until(lambda: content(copied) == "", what="the command")
+    assert copied.run("true").status == 0
+    assert len(names(copied)) == 2 and content(copied) == ""
+    copied.box.write("/go", "")
+    assert running.wait().status == 1
+    assert content(copied) == OLD and names(copied) == ["vv.xml"]
+
+
+def test_many_copies_at_once_are_all_whole(copied):
+    runs = [copied.start(COPY_SETTINGS) for _ in range(20)]
+    while any(run.result is None for run in runs):
+        assert content(copied) in (OLD, NEW)
+        copied.box.pump(0.01)
+    assert [run.wait().status for run in runs] == [0] * 20
+    assert content(copied) == NEW and names(copied) == ["vv.xml"]
+
+
+# --- locks ---
+
+LOCKS = "/run/remvol"
+
+
+def test_the_locks_are_roots_alone(flash):
+    flash.mount()
+    assert flash.run("true").status == 0
+    assert flash.sh(f"stat -c '%a %u' {LOCKS}/flash.door {LOCKS}/flash.users") == "600 0\n600 0\n"
+
+
+@pytest.mark.parametrize("plant", [f"mkdir {LOCKS}; touch {LOCKS}/x; chown 1234 {LOCKS}", f"ln -s /tmp {LOCKS}",
+                                   f"touch {LOCKS}", f"mkdir -m 777 {LOCKS}"])
+def test_a_lock_folder_that_others_made_is_not_used(flash, plant):
+    flash.sh(plant)
+    flash.mount()
+    done = flash.run(f"touch {FOLDER}/f")
+    assert (done.status, done.stderr) == (0, "")
+    assert flash.sh(f"stat -c '%F %a %u' {LOCKS}") == "directory 755 0\n"
+    assert flash.read_only
+
+
+@pytest.mark.parametrize("plant", ["touch {0}; chmod 644 {0}", "touch {0}; chown 1234 {0}", "ln -s /precious {0}",
+                                   "mkfifo {0}"])
+def test_a_lock_that_others_can_hold_is_not_waited_for(flash, plant):
+    flash.mount()
+    flash.sh(f"mkdir -m 755 {LOCKS}; touch /precious")
+    for name in ("flash.door", "flash.users"):
+        flash.sh(plant.format(f"{LOCKS}/{name}"))
+    holder = flash.start("true") if "fifo" in plant else flash.box.start(
+        ["flock", f"{LOCKS}/flash.door", "sleep", "1000"], env={"LD_PRELOAD": None})
+    if "fifo" not in plant:
+        flash.box.wait_until(lambda: flash.commands("sleep"), what="the holder")
+    assert flash.run("true", timeout=10).status == 0
+    assert flash.sh(f"stat -c '%F %a %u' {LOCKS}/flash.door") == "regular empty file 600 0\n"
+    flash.sh("pkill -x sleep || :")
+    holder.wait()
 
 
 def host_pid(flash, inside):
