@@ -1,0 +1,80 @@
+"""scripts/torture: see there."""
+
+import argparse
+import collections
+import pathlib
+import random
+import sys
+import time
+
+sys.path.insert(0, str(pathlib.Path(__file__).parent))
+
+from many import Round  # noqa: E402
+from pairs import PAIRS, torment  # noqa: E402
+
+
+def kinds(found):
+    return ", ".join(f"{kind} {count}" for kind, count in sorted(collections.Counter(f.split(":")[0] for f in found).items()))
+
+
+def run_many(options):
+    seed = options.seed if options.seed is not None else random.SystemRandom().randrange(1 << 30)
+    print(f"many: seed {seed}", flush=True)
+    begin, bad, number = time.monotonic(), 0, 0
+    while number < options.rounds and (options.seconds is None or time.monotonic() - begin < options.seconds):
+        this = Round(seed + number, options.runs, not options.no_restarts)
+        found = this.play()
+        number += 1
+        if not found:
+            continue
+        bad += 1
+        print(f"round with seed {this.seed}: {kinds(found)}", flush=True)
+        for text in found:
+            print(f"  {text}")
+        if options.stories:
+            folder = pathlib.Path(options.stories)
+            folder.mkdir(parents=True, exist_ok=True)
+            (folder / f"many-{this.seed}.txt").write_text("\n".join(found) + "\n\n" + this.story)
+    seconds = time.monotonic() - begin
+    print(f"many: {number - bad} passed, {bad} failed ({number} rounds of {options.runs} runs, {seconds:.0f} s)")
+    return bad == 0
+
+
+def run_pairs(options):
+    good = bad = 0
+    begin = time.monotonic()
+    for name, pair in PAIRS.items():
+        if options.only not in name:
+            continue
+        stories = pathlib.Path(options.stories) / name if options.stories else None
+        failing = torment(pair, rounds=options.rounds, seed=options.seed, stories=stories)
+        texts = [text for found in failing.values() for text in found]
+        print(f"{name}: {len(failing)} of {options.rounds} rounds{': ' + kinds(texts) if texts else ''}", flush=True)
+        bad += bool(failing)
+        good += not failing
+    print(f"pairs: {good} passed, {bad} failed ({options.rounds} rounds each, {time.monotonic() - begin:.0f} s)")
+    return bad == 0
+
+
+def main():
+    parser = argparse.ArgumentParser(prog="torture")
+    forms = parser.add_subparsers(required=True)
+    many = forms.add_parser("many", help="rounds of many runs at once")
+    many.add_argument("--rounds", type=int, default=200)
+    many.add_argument("--seconds", type=float, help="begin no round after so long")
+    many.add_argument("--seed", type=int, help="of the first round; the next has the next number")
+    many.add_argument("--runs", type=int, default=64)
+    many.add_argument("--no-restarts", action="store_true")
+    many.add_argument("--stories", help="folder for the whole story of a round with findings")
+    many.set_defaults(run=run_many)
+    pairs = forms.add_parser("pairs", help="two commands at every distance from each other")
+    pairs.add_argument("--rounds", type=int, default=24, help="of every pair")
+    pairs.add_argument("--only", default="", help="pairs whose name contains this")
+    pairs.add_argument("--seed", type=int, default=1)
+    pairs.add_argument("--stories", help="folder for the whole story of a round with findings")
+    pairs.set_defaults(run=run_pairs)
+    options = parser.parse_args()
+    sys.exit(0 if options.run(options) else 1)
+
+
+main()

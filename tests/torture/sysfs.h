@@ -1,0 +1,17 @@
+/* What the kernel shows of a disk: its nodes in /dev, and /sys as far as anybody asks. */
+#ifndef TORTURE_SYSFS_H
+#define TORTURE_SYSFS_H
+
+#include "world.h"
+
+enum { DISK_MAJOR = 250 }; /* one that no driver has */
+
+void sysfs_add(int target, int number, const struct lun* lun, int session);
+
+/* A partition was made on the disk. */
+void sysfs_add_partition(const struct lun* lun);
+
+void sysfs_remove(const struct lun* lun);
+void sysfs_remove_session(int session);
+
+#endif
