@@ -17,8 +17,11 @@
 #include "tree/keys.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
+#include "volume/bare_folder.h"
 #include "volume/format.h"
+#include "volume/mount_command.h"
 #include "volume/mount_point.h"
+#include "volume/mount_table.h"
 #include "volume/partition.h"
 #include "volume/share_services.h"
 
@@ -26,25 +29,7 @@ namespace remvol {
 
 namespace {
 
-constexpr int kMountRetries = 3;
-constexpr unsigned kMountRetryWait = 500000;  // microseconds
-constexpr int kShortestRemountWait = 3;       // seconds
-
-constexpr char kUfsdMount[] = "mount -t ufsd -o rw,nls=utf8,fmask=0,dmask=0,force,user_xattr";
-
-struct MountCommand {
-  const char* fs_type;
-  const char* text;  // the partition's node and the quoted mount point follow
-};
-constexpr MountCommand kMountCommands[] = {
-    {"ext2", "mount -t ext2"},
-    {"ext3", "mount -t ext3"},
-    {"ext4", "mount -t ext4"},
-    {"vfat", "mount -t vfat -o umask=0,iocharset=utf8,shortname=winnt"},
-    {"ntfs", kUfsdMount},
-    {"hfsplus", kUfsdMount},
-    {"xfs", "mount -t xfs -o rw,attr2"},
-};
+constexpr int kShortestRemountWait = 3;  // seconds
 
 // A device node held open.
 class HeldNode {
@@ -122,35 +107,53 @@ bool detect_fs(Volume* volume) {
   return volume->fs_type[0] != '\0';
 }
 
-// Takes the first usable partition, or the first that carries something recognised. Returns whether there is
-// one.
-bool find_partition(Volume* volume, bool recognised) {
+bool is_usable(Volume* volume) {
+  volume->held.hold(volume->node);
+  return sys_check_dev(volume->node) == 0;
+}
+
+bool is_recognised(Volume* volume) {
+  return is_usable(volume) && detect_fs(volume);
+}
+
+// Returns whether the node is mounted on the volume's own mount point already.
+bool is_standing(Volume* volume) {
+  MountLine mount;
+  if (!is_mounted_from(volume->node, volume->mount_point, &mount)) return false;
+  if (!detect_fs(volume)) copy_text(volume->fs_type, mount.type);
+  return true;
+}
+
+// Takes the first partition that passes the test. Returns whether there is one.
+bool find_partition(Volume* volume, bool (*passes)(Volume*)) {
   PartitionList names;
   copy_text(names, volume->partitions);
   char* rest = nullptr;
   for (char* name = strtok_r(names, " ,", &rest); name != nullptr; name = strtok_r(nullptr, " ,", &rest)) {
     volume->node = Text<64>("/dev/%s", name);
-    volume->held.hold(volume->node);
-    if (sys_check_dev(volume->node) == 0 && (!recognised || detect_fs(volume))) return true;
+    if (passes(volume)) return true;
   }
   return false;
 }
 
 int pick_partition(Volume* volume) {
-  if (find_partition(volume, true)) return kOk;
+  if (find_partition(volume, is_recognised)) return kOk;
   volume->looks_empty = volume->force_format == 0;
   volume->force_format = 1;
-  if (!find_partition(volume, false)) return kMountNoPartition;
+  if (!find_partition(volume, is_usable)) return kMountNoPartition;
   return kOk;
 }
 
 // Data that nobody asked to overwrite is never formatted: what is recognised on a second look is mounted, and
 // what was recognised on the first is not taken for empty on the second, which only a fault can make of it.
 // Returns whether the node can be used.
-bool protect_data(Volume* volume) {
+bool protect_data(Volume* volume, Caller caller) {
   const bool known = volume->fs_type[0] != '\0';
   if (known && volume->looks_empty) volume->force_format = 0;
-  return known || volume->force_format != 0;
+  if (known || volume->force_format != 0) return true;
+  LOG_AT(caller, 0, "%s carried a file system a moment ago and shows none now, it is left alone",
+         volume->node.c_str());
+  return false;
 }
 
 int create_file_system(Volume* volume, Caller caller = Caller()) {
@@ -178,7 +181,7 @@ int prepare_file_system(Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
   if (!volume->asked) volume->seen_empty = content_mark(volume->node);
   detect_fs(volume);
-  if (!protect_data(volume)) return kMountNoPartition;
+  if (!protect_data(volume, caller)) return kMountNoPartition;
   const int result =
       volume->force_format != 0 ? create_file_system(volume, caller) : keep_file_system(volume, caller);
   if (result != kOk) return result;
@@ -188,43 +191,23 @@ int prepare_file_system(Volume* volume, Caller caller = Caller()) {
 }
 
 int make_mount_point(Volume* volume, Caller caller = Caller()) {
-  volume->mount_point = mount_point_of(volume->entry->share);
   const CommandText command = command_on_path("mkdir -p", volume->mount_point);
   LOG_AT(caller, 1, "cmd = %s", command.c_str());
+  make_bare_folder(volume->mount_point);
   if (system(command) == 0) return kOk;
   LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
   return kMountNoMountPoint;
 }
 
-const char* find_mount_command(const char* fs_type) {
-  for (const MountCommand& command : kMountCommands) {
-    if (strcmp(command.fs_type, fs_type) == 0) return command.text;
-  }
-  return nullptr;
-}
-
-void run_mount(const char* command, Caller caller = Caller()) {
-  LOG_AT(caller, 1, "cmd = %s", command);
-  int retries = 0;
-  while (system(command) != 0 && retries < kMountRetries) {
-    retries++;
-    LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
-    LOG_AT(caller, 0, "wait %u micro seconds", kMountRetryWait);
-    usleep(kMountRetryWait);
-  }
-}
-
 int mount_file_system(const Volume* volume, Caller caller = Caller()) {
-  const char* mount = find_mount_command(volume->fs_type);
-  if (mount == nullptr) {
-    LOG_AT(caller, 1, "Unsupported filesystem type %s", volume->fs_type);
-    const int result = ktree_update_volume_state(volume->entry, kVolumeUnsupported);
-    if (note_update(result, caller) != 0) return kTreeFailed;
-    return kMountUnsupported;
+  if (is_mountable(volume->fs_type)) {
+    run_mount(volume->fs_type, volume->node, volume->mount_point, caller);
+    return kOk;
   }
-  const Text<256> verb("%s %s", mount, volume->node.c_str());
-  run_mount(command_on_path(verb, volume->mount_point), caller);
-  return kOk;
+  LOG_AT(caller, 1, "Unsupported filesystem type %s", volume->fs_type);
+  const int result = ktree_update_volume_state(volume->entry, kVolumeUnsupported);
+  if (note_update(result, caller) != 0) return kTreeFailed;
+  return kMountUnsupported;
 }
 
 // Opens the volume to everybody and records whether that could be written.
@@ -252,7 +235,9 @@ int record_mount(const Volume* volume, Caller caller = Caller()) {
 void record_failed_mount(const Volume* volume, Caller caller = Caller()) {
   note_update(ktree_update_volume_state(volume->entry, kVolumeFailed), caller);
   const CommandText command = command_on_path("rm -rf", volume->mount_point);
-  if (!is_removal_unsafe(volume->mount_point, caller) && system(command) == 0) return;
+  if (is_removal_unsafe(volume->mount_point, caller)) return;
+  drop_bare_folder(volume->mount_point);
+  if (system(command) == 0) return;
   LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
 }
 
@@ -262,9 +247,18 @@ int record_outcome(const Volume* volume, Caller caller = Caller()) {
   return kOk;
 }
 
+// A volume that is in use where it belongs is neither checked, formatted nor mounted over: its state is
+// recorded as after a mount, with all that follows one (its partition may have grown).
+int keep_standing(const Volume* volume, Caller caller = Caller()) {
+  LOG_AT(caller, 1, "%s is mounted on %s already", volume->node.c_str(), volume->mount_point.c_str());
+  const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
+  return note_update(result, caller) != 0 ? kTreeFailed : record_mount(volume, caller);
+}
+
 // Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.
 int bring_up(Volume* volume, Caller caller = Caller()) {
   int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format, caller);
+  if (result == kOk && find_partition(volume, is_standing)) return keep_standing(volume, caller);
   if (result == kOk) result = pick_partition(volume);
   if (result == kOk) result = prepare_file_system(volume, caller);
   if (result == kOk) result = make_mount_point(volume, caller);
@@ -283,6 +277,7 @@ int Target_mount(TargetEntry* entry, int force_format, int update_share) {
   volume.entry = entry;
   volume.asked = force_format != 0;
   volume.force_format = force_format;
+  volume.mount_point = mount_point_of(entry->share);
   result = bring_up(&volume);
   if (result != kOk) return result;
   LOG(1, "Update_sharefolder_status = %d", update_share);

@@ -1,14 +1,13 @@
 #include "volume/mount_point.h"
 
 #include <fcntl.h>
-#include <mntent.h>
 #include <sys/mount.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <climits>
 #include <cstdlib>
 #include <cstring>
-#include <memory>
 
 #include "sysaux.h"
 
@@ -16,12 +15,7 @@ namespace remvol {
 
 namespace {
 
-constexpr char kMountTable[] = "/proc/self/mounts";
 constexpr int kMaxLayers = 32;
-
-struct TableCloser {
-  void operator()(FILE* table) const { endmntent(table); }
-};
 
 // Writes out what the file system mounted on `path` holds. A path that cannot be opened is left to the
 // kernel, which syncs a detached file system when its last user ends.
@@ -32,18 +26,15 @@ void sync_mount(const char* path) {
   close(fd);
 }
 
-bool is_at_or_below(const char* path, const char* root) {
-  const size_t length = strlen(root);
-  return strncmp(path, root, length) == 0 && (path[length] == '\0' || path[length] == '/');
+// Returns whether the path lies on the file system of the mount root, or either cannot be looked at.
+bool is_on_root_file_system(const char* path) {
+  struct stat root;
+  struct stat own;
+  return stat(kMountRoot, &root) != 0 || lstat(path, &own) != 0 || own.st_dev == root.st_dev;
 }
 
-}  // namespace
-
-MountPointText mount_point_of(const char* share) {
-  return MountPointText("%s%s", kMountRoot, share);
-}
-
-bool is_share_inside_root(const char* share, Caller caller) {
+// Returns whether a component of the share's name is ".." or every one is "." or empty.
+bool leaves_root(const char* share) {
   bool named = false;
   bool climbs = false;
   for (const char* component = share; *component != '\0';) {
@@ -54,9 +45,44 @@ bool is_share_inside_root(const char* share, Caller caller) {
     component += length;
     component += strspn(component, "/");
   }
-  if (named && !climbs) return true;
-  LOG_AT(caller, 0, "share name %s leaves %s", share, kMountRoot);
+  return climbs || !named;
+}
+
+// Returns whether the first `length` characters of the path name a symbolic link.
+bool is_link(const char* path, size_t length) {
+  const Text<PATH_MAX> prefix("%.*s", static_cast<int>(length), path);
+  struct stat found;
+  return lstat(prefix, &found) == 0 && S_ISLNK(found.st_mode);
+}
+
+// Returns whether a component of the path below the mount root is a symbolic link: whoever planted it would
+// choose what is mounted over and what is removed.
+bool has_link_below_root(const char* path) {
+  const char* component = path + strlen(kMountRoot);
+  while (*component != '\0') {
+    component += strcspn(component, "/");
+    if (is_link(path, static_cast<size_t>(component - path))) return true;
+    component += strspn(component, "/");
+  }
   return false;
+}
+
+}  // namespace
+
+MountPointText mount_point_of(const char* share) {
+  return MountPointText("%s%s", kMountRoot, share);
+}
+
+bool is_share_inside_root(const char* share, Caller caller) {
+  if (leaves_root(share)) {
+    LOG_AT(caller, 0, "share name %s leaves %s", share, kMountRoot);
+    return false;
+  }
+  if (has_link_below_root(mount_point_of(share))) {
+    LOG_AT(caller, 0, "share name %s leads through a symbolic link below %s", share, kMountRoot);
+    return false;
+  }
+  return true;
 }
 
 CommandText command_on_path(const char* verb, const char* path) {
@@ -65,26 +91,37 @@ CommandText command_on_path(const char* verb, const char* path) {
   return CommandText("%s \"%s\"", verb, escaped);
 }
 
+bool is_mounted_from(const char* node, const char* path, MountLine* mount) {
+  struct stat device;
+  struct stat folder;
+  char real[PATH_MAX];
+  if (stat(node, &device) != 0 || !S_ISBLK(device.st_mode)) return false;
+  if (stat(path, &folder) != 0 || folder.st_dev != device.st_rdev) return false;
+  return realpath(path, real) != nullptr && find_mount_of(device.st_rdev, real, mount) == Mounted::yes;
+}
+
 void detach_mounts(const char* path) {
   for (int layer = 0; layer < kMaxLayers && sys_mount_point(path) != 0; layer++) {
     sync_mount(path);
-    if (umount2(path, MNT_DETACH) != 0) return;
+    if (umount2(path, MNT_DETACH | UMOUNT_NOFOLLOW) != 0) return;
   }
 }
 
 bool is_removal_unsafe(const char* path, Caller caller) {
   char real[PATH_MAX];
-  const char* root = realpath(path, real) != nullptr ? real : path;
-  const std::unique_ptr<FILE, TableCloser> table(setmntent(kMountTable, "re"));
-  if (!table) {
-    LOG_AT(caller, 0, "%s is not removed, Can not open %s", path, kMountTable);
+  const char* name = realpath(path, real) != nullptr ? real : path;
+  MountLine mount;
+  const Mounted mounted = find_mount_below(name, &mount);
+  if (mounted == Mounted::yes) {
+    LOG_AT(caller, 0, "%s is not removed, %s is mounted on %s", path, mount.source, mount.path);
     return true;
   }
-  mntent entry;
-  char line[3 * PATH_MAX];
-  while (getmntent_r(table.get(), &entry, line, sizeof line) != nullptr) {
-    if (!is_at_or_below(entry.mnt_dir, root)) continue;
-    LOG_AT(caller, 0, "%s is not removed, %s is mounted on %s", path, entry.mnt_fsname, entry.mnt_dir);
+  if (mounted == Mounted::unknown && sys_mount_point(path) != 0) {
+    LOG_AT(caller, 0, "%s is not removed, it is a mount point", path);
+    return true;
+  }
+  if (!is_on_root_file_system(name)) {
+    LOG_AT(caller, 0, "%s is not removed, it is not on the file system of %s", path, kMountRoot);
     return true;
   }
   return false;

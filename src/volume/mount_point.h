@@ -5,6 +5,7 @@
 
 #include "frontend/log.h"
 #include "support/text.h"
+#include "volume/mount_table.h"
 
 namespace remvol {
 
@@ -17,20 +18,25 @@ using MountPointText = Text<sizeof kMountRoot + 128>;
 MountPointText mount_point_of(const char* share);
 
 // Returns whether the share's mount point lies below the mount root. It does not when the name has a
-// component
-// "..", or none besides empty ones and "."; that is logged at level 0 in the caller's name.
+// component "..", or none besides empty ones and ".", or when a component of the path below the root is a
+// symbolic link; that is logged at level 0 in the caller's name.
 bool is_share_inside_root(const char* share, Caller caller = Caller());
 
 // Returns the shell command `verb "path"`, the path escaped. A path too long for that (more
 // than 1,023 characters that all need escaping) gives a command that does nothing and fails.
 CommandText command_on_path(const char* verb, const char* path);
 
+// Returns whether the kernel's table shows the block device `node`, by its number and whatever its name, as
+// mounted on `path`, and nothing else covers it there; `mount` is the table's line then.
+bool is_mounted_from(const char* node, const char* path, MountLine* mount);
+
 // Detaches what is mounted on `path`, layer by layer, each synced before; see umount2(2), MNT_DETACH.
 // Processes that use a layer keep it until they end. Stops at the first layer that cannot be detached.
 void detach_mounts(const char* path);
 
 // Returns whether "rm -rf" of `path` would run into a mounted file system: one is mounted on the path or
-// below it, or the mount table cannot be read. Logged at level 0 in the caller's name.
+// below it, or the path lies inside another volume. Where the kernel's table cannot be read, the path itself
+// is asked. Logged at level 0 in the caller's name.
 bool is_removal_unsafe(const char* path, Caller caller = Caller());
 
 }  // namespace remvol

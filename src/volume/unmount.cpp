@@ -17,6 +17,7 @@
 #include "tree/entry.h"
 #include "tree/keys.h"
 #include "tree/status_text.h"
+#include "volume/bare_folder.h"
 #include "volume/disk_identity.h"
 #include "volume/disk_use.h"
 #include "volume/mount.h"
@@ -73,8 +74,10 @@ void umount_with_rounds(const char* mount_point, Caller caller = Caller()) {
 // Removes the mount point, whether or not the unmount worked. What is still mounted is detached first, so
 // that the removal never deletes a volume's files; when that cannot be had, nothing is removed.
 int remove_mount_point(const char* mount_point, Caller caller = Caller()) {
+  if (is_removal_unsafe(mount_point, caller)) return kFailed;
+  drop_bare_folder(mount_point);
   const CommandText command = command_on_path("rm -rf", mount_point);
-  if (!is_removal_unsafe(mount_point, caller) && system(command) == 0) return kOk;
+  if (system(command) == 0) return kOk;
   LOG_AT(caller, 0, "cmd '%s' failed", command.c_str());
   return kFailed;
 }

@@ -2,9 +2,10 @@
 
 import os
 import signal
+import stat
 
 import pytest
-from harness.sysaux import image, make_ambivalent, make_ext, md_member, mounted, run
+from harness.sysaux import Loop, image, make_ambivalent, make_ext, md_member, mounted, run
 from harness.volumes import drive, luns
 
 __all__ = ["luns"]
@@ -76,13 +77,56 @@ def test_a_fresh_disk_is_partitioned_formatted_and_mounted(luns):
     assert_files(lun)
 
 
-def test_a_second_mount_of_a_mounted_volume_changes_nothing(luns):
+@pytest.mark.parametrize("share", ["Data", "two words", "tab\tnew\nline \\ #", "a/b"])
+def test_a_volume_in_use_is_neither_checked_nor_mounted_again(luns, share):
+    lun = luns(300 * MIB, share)
+    lun.mount()
+    keep_files(lun)
+    lun.path().chmod(0o700)
+    lun.box.tree.delete(f"/iscsi/initiator/id:1/lun/id:{lun.slot}/mnt_dev")
+    lun.box.forget()
+    assert lun.mount().result == 0
+    assert [command.split()[0] for command in lun.box.shell()] == ["resize2fs", "chmod"]
+    assert lun.mounts() == [lun.mount_point]
+    assert_mounted(lun, "ext4")
+    assert_files(lun)
+
+
+def test_a_volume_in_use_is_known_by_its_device_not_by_a_name(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    lun.unmount()
+    other = f"/tmp/{lun.disk.name}"
+    lun.box.path(lun.mount_point).mkdir()
+    device = os.stat(lun.disk.part).st_rdev
+    os.mknod(lun.box.path(other), stat.S_IFBLK | 0o600, device)
+    assert lun.box.run(["/usr/bin/mount", other, lun.mount_point]).status == 0
+    lun.box.forget()
+    assert lun.mount().result == 0
+    assert not lun.box.runs("mount")
+    assert lun.box.run(["/usr/bin/umount", lun.mount_point]).status == 0
+
+
+def test_a_volume_in_use_is_not_formatted_when_its_disk_shows_nothing(luns):
     lun = luns(300 * MIB)
     lun.mount()
     keep_files(lun)
+    lun.box.forget()
+    lun.box.hook("sys_get_fs_type", lun.disk.part, ret=-1)
     assert lun.mount().result == 0
-    assert not lun.box.runs("e2fsck") or lun.box.runs("e2fsck")[-1][:2] == ["-n", "-f"]
+    assert not formatted(lun)
+    assert_mounted(lun, "ext4")
     assert_files(lun)
+
+
+def test_a_volume_that_is_mounted_elsewhere_is_mounted(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    lun.unmount()
+    lun.box.path("/mnt/elsewhere").mkdir()
+    assert lun.box.run(["/usr/bin/mount", lun.disk.part, "/mnt/elsewhere"]).status == 0
+    assert lun.mount().result == 0
+    assert lun.mounts() == ["/mnt/elsewhere", lun.mount_point]
 
 
 def test_the_status_follows(luns):
@@ -352,6 +396,42 @@ def test_a_share_name_that_leads_out_is_refused(luns, name):
     assert not lun.box.shell()
     assert lun.disk.digest() == before
     assert kept.read_text() == "stays"
+
+
+# --- the folder below a mount ---
+
+@pytest.fixture
+def ext4_root(luns):
+    """The mount root on an ext4 of its own, as on a machine."""
+    lun = luns(300 * MIB)
+    root = Loop(lun.disk.file.parent / "root", 64 * MIB)
+    make_ext(root)
+    lun.box.path("/mnt/VV").mkdir(exist_ok=True)
+    assert lun.box.run(["/usr/bin/mount", root.node, "/mnt/VV"]).status == 0
+    yield lun
+    lun.box.run(["/bin/sh", "-c", "kill -9 -1"])
+    for path in [*reversed(lun.mounts()), "/mnt/VV"]:
+        lun.box.run(["/usr/bin/umount", "-l", path])
+    root.close()
+
+
+def immutable(lun, path):
+    return "i" in lun.box.run(["/usr/bin/lsattr", "-d", path]).stdout.split()[0]
+
+
+def test_a_bare_folder_takes_nothing(ext4_root):
+    lun = ext4_root
+    lun.box.fake("mount", "-t ext4", first=True,
+                 effect=f'touch "{lun.mount_point}/stray" && touch /tmp/stray; mount "$@"')
+    assert lun.mount().result == 0
+    assert not immutable(lun, lun.mount_point), "not the root of the volume"
+    lun.box.run(["/usr/bin/umount", lun.mount_point])
+    assert immutable(lun, lun.mount_point)
+    assert lun.box.run(["/usr/bin/touch", f"{lun.mount_point}/stray"]).status != 0
+    assert not lun.box.path("/tmp/stray").exists()
+    assert lun.mount().result == 0, "used again"
+    assert lun.unmount().result == 0
+    assert_gone(lun)
 
 
 # --- volumes in use ---

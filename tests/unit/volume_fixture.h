@@ -3,6 +3,7 @@
 #ifndef TESTS_VOLUME_FIXTURE_H
 #define TESTS_VOLUME_FIXTURE_H
 
+#include <fcntl.h>
 #include <sys/mount.h>
 #include <sys/sem.h>
 #include <sys/stat.h>
@@ -47,6 +48,13 @@ class VolumeTest : public fakes::Test {
     ASSERT_EQ(mount("tmpfs", path, "tmpfs", 0, nullptr), 0) << path << ": the tests of volumes need root";
   }
   static void uncover(const char* path) { umount2(path, MNT_DETACH); }
+
+  // Whether the folder takes no files, nobody's.
+  static bool is_immutable(const std::string& path) {
+    struct statx found {};
+    return statx(AT_FDCWD, path.c_str(), 0, 0, &found) == 0 &&
+           (found.stx_attributes & STATX_ATTR_IMMUTABLE) != 0;
+  }
 
   static std::string lun(const std::string& key) { return "/iscsi/initiator/id:2/lun/id:3/" + key; }
 

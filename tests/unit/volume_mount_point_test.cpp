@@ -1,12 +1,14 @@
 // Mount points: which share names are refused, how commands quote a path, and what a removal must not reach.
 #include "volume/mount_point.h"
 
+#include <dlfcn.h>
 #include <fcntl.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
 
+#include "volume/bare_folder.h"
 #include "volume_fixture.h"
 
 using namespace remvol;
@@ -14,6 +16,7 @@ using namespace remvol;
 namespace {
 
 int synced = 0;
+int empty_reads = 0;  // so many readings of the mount table that come show nothing
 
 }  // namespace
 
@@ -21,6 +24,13 @@ int synced = 0;
 extern "C" int syncfs(int) noexcept {
   synced++;
   return 0;
+}
+
+// In front of the C library's: the kernel may skip lines of the table while another process unmounts.
+extern "C" FILE* fopen(const char* path, const char* mode) {
+  static const auto real = reinterpret_cast<FILE* (*)(const char*, const char*)>(dlsym(RTLD_NEXT, "fopen"));
+  const bool hidden = std::string(path) == "/proc/self/mountinfo" && empty_reads-- > 0;
+  return real(hidden ? "/dev/null" : path, mode);
 }
 
 namespace {
@@ -104,6 +114,92 @@ TEST_F(MountedPath, ALinkToAMountIsNotRemovedThrough) {
   put_layer();
   std::filesystem::create_symlink("/mnt/VV", "/mnt/link");
   EXPECT_TRUE(is_removal_unsafe("/mnt/link/Data"));
+}
+
+// The table writes such characters as octal numbers, and /proc/mounts shifts its columns without a source.
+TEST_F(MountedPath, AMountWhosePathOrSourceIsOddIsNotRemoved) {
+  const std::string odd = "/mnt/VV/a b\tc\nd\\e#f";
+  std::filesystem::create_directories(odd);
+  ASSERT_EQ(mount("", odd.c_str(), "tmpfs", 0, nullptr), 0);
+  EXPECT_TRUE(is_removal_unsafe(odd.c_str()));
+  EXPECT_FALSE(is_removal_unsafe("/mnt/VV/a"));
+}
+
+TEST_F(MountedPath, AFolderInsideAnotherVolumeIsNotRemoved) {
+  put_layer();
+  const std::string inner = path + "/inner";
+  std::filesystem::create_directory(inner);
+  const std::string log = fakes::output_of([&inner] { EXPECT_TRUE(is_removal_unsafe(inner.c_str())); });
+  EXPECT_TRUE(has(log, inner + " is not removed, it is not on the file system of /mnt/VV/"));
+}
+
+TEST_F(MountedPath, ATableThatMissesALineIsReadAgain) {
+  put_layer();
+  empty_reads = 1;
+  EXPECT_TRUE(is_removal_unsafe(path.c_str()));
+  empty_reads = 0;
+}
+
+TEST_F(MountedPath, WithoutATableThePathIsAsked) {
+  cover("/proc");
+  fakes::on("sys_mount_point", path).returns(1).times(1);
+  const std::string log = fakes::output_of([this] { EXPECT_TRUE(is_removal_unsafe(path.c_str())); });
+  fakes::on("sys_mount_point", path).returns(0);
+  const bool removed = !is_removal_unsafe(path.c_str());
+  uncover("/proc");
+  EXPECT_TRUE(has(log, path + " is not removed, it is a mount point"));
+  EXPECT_TRUE(removed);
+}
+
+TEST_F(MountedPath, LinksBelowTheRootAreRefused) {
+  std::filesystem::create_directory_symlink("/tmp", "/mnt/VV/link");
+  std::filesystem::create_symlink("/nowhere", path + "/dangling");
+  for (const char* share : {"link", "link/", "/link", "link/a", "./link/a/b", "Data/dangling"}) {
+    const std::string log = fakes::output_of([share] { EXPECT_FALSE(is_share_inside_root(share)) << share; });
+    EXPECT_TRUE(
+        has(log, std::string("share name ") + share + " leads through a symbolic link below /mnt/VV/"));
+  }
+  for (const char* share : {"lin", "links", "Data", "Data/link"}) EXPECT_TRUE(is_share_inside_root(share));
+}
+
+// --- the bare folder ---
+
+TEST_F(MountedPath, ABareFolderTakesNoFile) {
+  make_bare_folder(path.c_str());
+  std::ofstream file(path + "/file");
+  EXPECT_FALSE(file.is_open()) << "not even root's";
+  make_bare_folder(path.c_str());
+  drop_bare_folder(path.c_str());
+  EXPECT_FALSE(std::filesystem::exists(path));
+}
+
+TEST_F(MountedPath, ABareFolderWithFilesIsLeftToTheRemoval) {
+  std::ofstream(path + "/file") << "data";
+  make_bare_folder(path.c_str());
+  drop_bare_folder(path.c_str());
+  EXPECT_FALSE(is_immutable(path));
+  EXPECT_TRUE(std::filesystem::exists(path + "/file"));
+}
+
+TEST_F(MountedPath, TheRootOfAVolumeIsNeverFlagged) {
+  put_layer();
+  make_bare_folder(path.c_str());
+  EXPECT_FALSE(is_immutable(path));
+  make_bare_folder((path + "/inner").c_str());
+  EXPECT_FALSE(is_immutable(path + "/inner")) << "nor a folder in it";
+  drop_bare_folder(path.c_str());
+  drop_bare_folder((path + "/inner").c_str());
+  EXPECT_TRUE(std::filesystem::exists(path + "/inner"));
+}
+
+TEST_F(MountedPath, SharesBelowAFolderThatAKilledRunLeft) {
+  make_bare_folder(path.c_str());
+  make_bare_folder((path + "/a/b").c_str());
+  EXPECT_FALSE(is_immutable(path));
+  EXPECT_TRUE(is_immutable(path + "/a/b"));
+  make_bare_folder(path.c_str());
+  drop_bare_folder((path + "/a/b").c_str());
+  EXPECT_FALSE(std::filesystem::exists(path + "/a/b"));
 }
 
 TEST_F(MountedPath, EveryLayerIsDetachedEvenWhenItIsInUse) {

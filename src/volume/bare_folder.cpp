@@ -1,0 +1,93 @@
+#include "volume/bare_folder.h"
+
+#include <fcntl.h>
+#include <ftw.h>
+#include <linux/fs.h>
+#include <sys/ioctl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <climits>
+#include <cstring>
+
+#include "support/text.h"
+#include "volume/mount_point.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kOpenFolders = 16;  // that a walk may hold open
+using Path = Text<PATH_MAX>;
+
+// The folder held open, so that what is asked and what is done concern the same one.
+class Folder {
+ public:
+  explicit Folder(const char* path) : fd_(open(path, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC)) {}
+  ~Folder() {
+    if (fd_ >= 0) close(fd_);
+  }
+  Folder(const Folder&) = delete;
+  Folder& operator=(const Folder&) = delete;
+
+  // Whether it is a folder of the mount root's file system, and not the root of one mounted there.
+  bool is_bare() const {
+    struct stat root;
+    struct stat own;
+    struct statx place;
+    if (fd_ < 0 || stat(kMountRoot, &root) != 0 || fstat(fd_, &own) != 0) return false;
+    if (statx(fd_, "", AT_EMPTY_PATH | AT_STATX_DONT_SYNC, 0, &place) != 0) return false;
+    return own.st_dev == root.st_dev && (place.stx_attributes & STATX_ATTR_MOUNT_ROOT) == 0;
+  }
+
+  void set_immutable(bool on) const {
+    int flags = 0;
+    if (ioctl(fd_, FS_IOC_GETFLAGS, &flags) != 0) return;
+    const int wanted = on ? flags | FS_IMMUTABLE_FL : flags & ~FS_IMMUTABLE_FL;
+    if (wanted != flags) ioctl(fd_, FS_IOC_SETFLAGS, &wanted);
+  }
+
+ private:
+  int fd_;
+};
+
+void release(const char* path) {
+  const Folder folder(path);
+  if (folder.is_bare()) folder.set_immutable(false);
+}
+
+int release_below(const char* path, const struct stat*, int type, struct FTW* place) {
+  if (type == FTW_D && place->level > 0) release(path);
+  return 0;
+}
+
+// Calls `act` with every folder between the mount root and the path: a share's name may hold slashes.
+template <typename Act>
+void walk_to(const char* path, Act act) {
+  for (const char* end = strchr(path + strlen(kMountRoot), '/'); end != nullptr; end = strchr(end + 1, '/')) {
+    act(Path("%.*s", static_cast<int>(end - path), path).c_str());
+  }
+}
+
+}  // namespace
+
+void make_bare_folder(const char* path) {
+  walk_to(path, [](const char* parent) {
+    release(parent);  // a killed run may have left it, of a share that is named so
+    mkdir(parent, 0777);
+  });
+  mkdir(path, 0777);
+  const Folder folder(path);
+  if (folder.is_bare()) folder.set_immutable(true);
+}
+
+void drop_bare_folder(const char* path) {
+  walk_to(path, release);
+  nftw(path, release_below, kOpenFolders, FTW_PHYS | FTW_MOUNT);
+  const Folder folder(path);
+  if (!folder.is_bare()) return;
+  folder.set_immutable(false);
+  rmdir(path);
+}
+
+}  // namespace remvol
