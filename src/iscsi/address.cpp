@@ -11,6 +11,7 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
 
 namespace remvol {
 
@@ -37,8 +38,9 @@ int refuse_connected(const TargetEntry& request) {
 }
 
 int store_portal(const TargetEntry& request, int dbidx, Caller caller) {
-  if (tree_write(KeyText(key::kTargetIp, dbidx), request.ip) != kOk ||
-      tree_write(KeyText(key::kTargetPort, dbidx), NumberText("%d", request.port)) != kOk) {
+  const HeldSlot slot(dbidx);
+  if (!slot || tree_write(KeyText(key::kTargetIp, slot.target()), request.ip) != kOk ||
+      tree_write(KeyText(key::kTargetPort, slot.target()), NumberText("%d", request.port)) != kOk) {
     LOG_AT(caller, 0, "ktreec_set() failed");
     return kTreeFailed;
   }

@@ -16,6 +16,7 @@
 #include "support/command.h"
 #include "support/files.h"
 #include "support/result.h"
+#include "support/temp_file.h"
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/keys.h"
@@ -41,7 +42,6 @@ PathText discovery_path() {
 
 // Asks the portal for its targets. Returns whether the command succeeded.
 bool discover(const char* address, int port, const char* iface, const char* path, Caller caller) {
-  clear_temp_path(path);
   return run_command(discovery_command(address, port, iface, path), caller) == 0;
 }
 
@@ -80,7 +80,7 @@ void publish_names(const char* socket, const DiscoveredNames& names, Caller call
 // The search itself. Returns the result of task_search.
 int search_portal(const char* socket, Caller caller) {
   const TargetEntry& request = request_target;
-  const PathText path = discovery_path();
+  const TempFile path(discovery_path());
   LOG_AT(caller, 0, "ip: %s, port: %d", request.ip, request.port);
   int result = discover(request.ip, request.port, request.iface, path, caller) ? 0 : 1;
   File file(fopen(path, "re"));
@@ -150,7 +150,7 @@ int Portal_search_target(const char* name, const char* address, int port) {
   char iface[16];
   if (_get_iface_name(iface, sizeof iface, address) != 0) return kFailed;
   LOG(2, "ip: %s, port: %d", address, port);
-  const PathText path = discovery_path();
+  const TempFile path(discovery_path());
   if (!discover(address, port, iface, path, Caller())) return not_offered(Caller());
   File file(fopen(path, "re"));
   if (file == nullptr) {

@@ -1,5 +1,7 @@
 #include "iscsi/lun_search.h"
 
+#include <optional>
+
 #include "frontend/log.h"
 #include "frontend/request.h"
 #include "iscsi/node.h"
@@ -8,6 +10,7 @@
 #include "iscsi/session_check.h"
 #include "support/lun_list.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "tree/search_results.h"
 
 namespace remvol {
@@ -29,10 +32,9 @@ bool log_in() {
   return _target_login(target) == 0 && check_target_connected(target->target_name) != 0;
 }
 
-// Makes sure of a session; `logged_in` tells whether it was opened here. Returns 0 or -1.
-int open_session(const char* socket, bool* logged_in, Caller caller) {
-  const char* name = request_target.target_name;
-  const int connected = check_target_connected(name);
+// Makes sure of a session, given whether the target is connected; `logged_in` tells whether it was opened
+// here. Returns 0 or -1.
+int open_session(const char* socket, int connected, bool* logged_in, Caller caller) {
   if (connected == 1) return kOk;
   if (connected != 0) {
     LOG_AT(caller, 0, "check_target_connected failed");
@@ -40,7 +42,7 @@ int open_session(const char* socket, bool* logged_in, Caller caller) {
   }
   *logged_in = log_in();
   if (*logged_in) return kOk;
-  LOG_AT(caller, 0, "Target_Connect %s failed", name);
+  LOG_AT(caller, 0, "Target_Connect %s failed", request_target.target_name);
   ktree_update_search_lun_err_code(socket, kSearchLoginFailed);
   return kFailed;
 }
@@ -71,16 +73,28 @@ int publish_luns(const char* socket, Caller caller) {
   return kOk;
 }
 
+// The search itself. While it is logged in for its own sake no other run brings the target up: the session
+// would be closed under that run's volumes.
+int search_luns(const char* socket, Caller caller) {
+  const char* name = request_target.target_name;
+  std::optional<TargetHold> hold;
+  int connected = check_target_connected(name);
+  if (connected == 0) hold.emplace(name);
+  if (hold && hold->waited()) connected = check_target_connected(name);
+  bool logged_in = false;
+  int result = open_session(socket, connected, &logged_in, caller);
+  if (result == kOk) result = publish_luns(socket, caller);
+  if (logged_in) _target_disconnect(&request_target);
+  return result;
+}
+
 }  // namespace
 
 int task_search_lun() {
   LOG(2, "start");
   if (request_target.target_name[0] == '\0') return kFailed;
   const char* socket = open_results(kLunResults);
-  bool logged_in = false;
-  int result = open_session(socket, &logged_in, Caller());
-  if (result == kOk) result = publish_luns(socket, Caller());
-  if (logged_in) _target_disconnect(&request_target);
+  const int result = search_luns(socket, Caller());
   close_results(kLunResults, socket);
   LOG(2, "end, ret = %d", result);
   return result;

@@ -13,11 +13,13 @@
 #include "iscsi/session_check.h"
 #include "support/command.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/mount.h"
@@ -130,6 +132,21 @@ bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
   return true;
 }
 
+// Brings up what is stored of the target at slot `n`. Returns whether it came to the mounting.
+bool load_target(int n, int* result, Caller caller) {
+  TargetEntry entry;
+  bool mounted = false;
+  // By slot, not by name: the search for a name would stop at an empty slot before this one.
+  if (ktree_get_entry_by_dbidx(n, &entry) == kOk) {
+    const TargetHold hold(entry.target_name);
+    if (hold.waited() && ktree_get_entry_by_dbidx(n, &entry) != kOk) return false;
+    Target_Config_Gen(&entry);
+    mounted = entry.conn_set != 0 && load_connected_target(&entry, result, caller);
+  }
+  ktree_update_status(&entry);
+  return mounted;
+}
+
 }  // namespace
 
 int Target_Config_Gen(TargetEntry* entry) {
@@ -208,15 +225,9 @@ int Target_load_all() {
   LOG(2, "start");
   int mounted = 0;
   int result = 0;
+  remember_all_targets();
   for (int n = 1; n <= kMaxTargets; n++) {
-    if (!tree_present(KeyText(key::kTargetName, n))) continue;
-    TargetEntry entry;
-    // By slot, not by name: the search for a name would stop at an empty slot before this one.
-    if (ktree_get_entry_by_dbidx(n, &entry) == kOk) {
-      Target_Config_Gen(&entry);
-      if (entry.conn_set != 0 && load_connected_target(&entry, &result, Caller())) mounted++;
-    }
-    ktree_update_status(&entry);
+    if (is_target_stored(n) && load_target(n, &result, Caller())) mounted++;
   }
   if (mounted > 0) reload_share_services();
   ktree_update_current_targetcnt();

@@ -12,11 +12,14 @@
 #include "iscsi/session_listing.h"
 #include "support/files.h"
 #include "support/result.h"
+#include "support/run_lock.h"
+#include "support/temp_file.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
 #include "volume/device.h"
 
 namespace remvol {
@@ -27,6 +30,7 @@ constexpr int kPollsPerSecond = 10;
 constexpr useconds_t kPollInterval = 1'000'000 / kPollsPerSecond;
 constexpr long long kMinLunSize = 1048577;  // bytes; a smaller LUN holds no volume
 constexpr int kDrawnNumbers = 100;          // in the names of temporary files
+constexpr char kDevicesLock[] = "devices.lock";
 constexpr int kMaxDraws = 100 * kDrawnNumbers;
 
 using PathText = Text<512>;
@@ -75,7 +79,7 @@ PathText draw_temp_path(const char* user) {
 int list_in_detail(const char* path, Caller caller) {
   const CommandText command = session_luns_command(path);
   LOG_AT(caller, 2, "run cmd: %s", command.c_str());
-  const int listed = list_sessions(command, path, caller);
+  const int listed = list_sessions(command, caller);
   if (listed != 0) _remove_file(path);
   return listed;
 }
@@ -99,11 +103,37 @@ void store_device(TargetEntry* entry, const DetailedListing& listing, DeviceUpda
   if (lun_dbidx < 1) return;
   log_disk(listing, caller);
   copy_text(entry->dev, device_name(listing));
-  if (tree_write(KeyText(key::kLunDev, entry->db_idx, lun_dbidx), entry->dev) != kOk) {
+  const HeldSlot slot(entry->db_idx, lun_dbidx);
+  if (!slot || tree_write(KeyText(key::kLunDev, slot.target(), slot.lun()), entry->dev) != kOk) {
     LOG_AT(caller, 0, "ktreec_set() failed");
     update->result = kTreeFailed;
   }
   update->found = true;
+}
+
+// Replaces the stored device names of the target by those in the listing at `path`, in one step for other
+// runs: a LUN that is attached never reads as if it had no disk.
+int store_listed_devices(TargetEntry* entry, const char* path, Caller caller) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  const int cleaned = ktree_clean_target_dev(entry);
+  if (cleaned != kOk) {
+    LOG_AT(caller, 0, "ktree_clean_target_dev for %s failed", entry != nullptr ? entry->target_name : "");
+    return cleaned;
+  }
+  copy_text(entry->dev, "");
+  const File file(fopen(path, "re"));
+  if (file == nullptr) return kOk;
+
+  DetailedListing listing = kDeviceListing;
+  char line[kListingLineSize];
+  DeviceUpdate update;
+  while (next_usable_lun(file.get(), &listing, line, entry->target_name, caller)) {
+    store_device(entry, listing, &update, caller);
+  }
+  if (update.result == kOk && listing.match == 0) update.result = kTargetNotListed;
+  if (update.result == kOk && !update.found) update.result = kNoRunningDisk;
+  LOG_AT(caller, 2, "end");
+  return update.result;
 }
 
 // Makes a node for one usable LUN. Returns null when it is too small, or out of memory.
@@ -144,9 +174,12 @@ int ktree_clean_target_dev(TargetEntry* entry) {
     entry->db_idx = ktree_get_dbidx_by_targetname(entry->target_name);
     if (entry->db_idx < 1) return kFailed;
   }
+  const HeldSlot slot(entry->db_idx);
+  if (!slot) return kFailed;
+  const int n = slot.target();
   int result = kOk;
-  for (int m = 1; m <= kMaxLunsPerTarget && tree_present(KeyText(key::kLunNumber, entry->db_idx, m)); m++) {
-    if (tree_write(KeyText(key::kLunDev, entry->db_idx, m), "") == kOk) continue;
+  for (int m = 1; m <= kMaxLunsPerTarget && tree_present(KeyText(key::kLunNumber, n, m)); m++) {
+    if (tree_write(KeyText(key::kLunDev, n, m), "") == kOk) continue;
     LOG(0, "ktreec_set() failed");
     result = kTreeFailed;
   }
@@ -154,42 +187,28 @@ int ktree_clean_target_dev(TargetEntry* entry) {
 }
 
 int ktree_update_dev(TargetEntry* entry) {
-  const Caller caller;
   LOG(2, "start");
-  const PathText path("/tmp/%s.tmp", program_name());
-  const int listed = list_sessions(session_devices_command(path), path);
+  // One run after another lists and stores, so that what is stored is the newest listing. It lasts no longer
+  // than the listing.
+  RunLock devices;
+  devices.take(kDevicesLock, LockMode::kExclusive);
+  const TempFile path(PathText("/tmp/%s.tmp", program_name()));
+  const int listed = list_sessions(session_devices_command(path));
   // No session at all changes nothing: the stored device names stay.
   if (listed != 0) return listed < 0 ? listed : kOk;
-  const int cleaned = ktree_clean_target_dev(entry);
-  if (cleaned != kOk) {
-    LOG(0, "ktree_clean_target_dev for %s failed", entry != nullptr ? entry->target_name : "");
-    return cleaned;
-  }
-  copy_text(entry->dev, "");
-  const File file(fopen(path, "re"));
-  if (file == nullptr) return kOk;
-
-  DetailedListing listing = kDeviceListing;
-  char line[kListingLineSize];
-  DeviceUpdate update;
-  while (next_usable_lun(file.get(), &listing, line, entry->target_name, caller)) {
-    store_device(entry, listing, &update, caller);
-  }
-  if (update.result == kOk && listing.match == 0) update.result = kTargetNotListed;
-  if (update.result == kOk && !update.found) update.result = kNoRunningDisk;
-  LOG(2, "end");
-  return update.result;
+  return store_listed_devices(entry, path, Caller());
 }
 
 int _wait_sess_lun_ready(const char* name, int wait_seconds) {
   if (check_name(name, Caller()) != kOk) return kFailed;
-  const PathText path = draw_temp_path("wait");
+  const PathText drawn = draw_temp_path("wait");
   DetailedListing listing = kLunListing;
   bool ready = false;
   for (int polls = wait_seconds == 0 ? 1 : wait_seconds * kPollsPerSecond; !ready && polls > 0;) {
     usleep(kPollInterval);
     polls--;
     LOG(1, "wait lun ready iter = %d", polls);
+    const TempFile path(drawn);
     const int listed = list_in_detail(path, Caller());
     if (listed != 0) return listed < 0 ? listed : kOk;
     const File file(fopen(path, "re"));
@@ -207,7 +226,7 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
 int _get_sess_lun_list(LunNode** head, const char* name) {
   const Caller caller;
   if (check_name(head != nullptr ? name : nullptr, caller) != kOk) return kFailed;
-  const PathText path = draw_temp_path("get");
+  const TempFile path(draw_temp_path("get"));
   const int listed = list_in_detail(path, caller);
   if (listed != 0) return listed < 0 ? listed : kOk;
   *head = nullptr;

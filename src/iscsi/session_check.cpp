@@ -8,12 +8,12 @@
 #include "support/command.h"
 #include "support/files.h"
 #include "support/result.h"
+#include "support/temp_file.h"
 #include "support/text.h"
 
 namespace remvol {
 
-int list_sessions(const char* command, const char* path, Caller caller) {
-  clear_temp_path(path);
+int list_sessions(const char* command, Caller caller) {
   const int status = system(command);
   if (status == 0) return 0;
   if (command_exit_code(status) == kNoSessionExit) return 1;
@@ -24,8 +24,8 @@ int list_sessions(const char* command, const char* path, Caller caller) {
 
 int check_target_connected(const char* name) {
   if (name == nullptr || name[0] == '\0') return kFailed;
-  const Text<512> path("/tmp/%s_session.tmp", program_name());
-  const int listed = list_sessions(sessions_command(path), path);
+  const TempFile path(Text<512>("/tmp/%s_session.tmp", program_name()));
+  const int listed = list_sessions(sessions_command(path));
   if (listed != 0) return listed < 0 ? listed : kOk;
   File file(fopen(path, "re"));
   if (file == nullptr) return 0;

@@ -10,9 +10,9 @@ namespace remvol {
 // all, or the listing could not be read); -1 for a null or empty name; -106 when the listing command failed.
 int check_target_connected(const char* name);
 
-// Runs `command`, which lists the sessions into the temporary file `path`. Returns 0; 1 when there is no
-// session at all; -106 when the command failed, which is logged in the caller's name.
-int list_sessions(const char* command, const char* path, Caller caller = Caller());
+// Runs `command`, which lists the sessions. Returns 0; 1 when there is no session at all; -106 when the
+// command failed, which is logged in the caller's name.
+int list_sessions(const char* command, Caller caller = Caller());
 
 }  // namespace remvol
 

@@ -6,10 +6,12 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 #include <cstdlib>
 #include <cstring>
 
 #include "frontend/log.h"
+#include "support/text.h"
 
 namespace remvol {
 
@@ -36,6 +38,12 @@ void remove_at(int folder, const char* name, int depth) {
   }
   closedir(entries);
   unlinkat(folder, name, AT_REMOVEDIR);
+}
+
+constexpr int kClaimTries = 10;
+
+bool is_own_folder(const struct stat& found) {
+  return S_ISDIR(found.st_mode) && found.st_uid == geteuid();
 }
 
 }  // namespace
@@ -74,11 +82,31 @@ int _remove_file(const char* path) {
   return unlink(path) == 0 || errno == ENOENT ? 0 : -1;
 }
 
-void clear_temp_path(const char* path) {
+void remove_path(const char* path) {
+  remove_at(AT_FDCWD, path, 0);
+}
+
+void drop_foreign_folder(const char* path) {
   struct stat found;
-  if (lstat(path, &found) != 0) return;
-  const bool own_file = S_ISREG(found.st_mode) && found.st_uid == geteuid() && found.st_nlink == 1;
-  if (!own_file) remove_at(AT_FDCWD, path, 0);
+  if (lstat(path, &found) != 0 || is_own_folder(found)) return;
+  remove_path(path);
+  // What its owner fills as fast as it is emptied is put aside.
+  rename(path, Text<PATH_MAX>("%s.foreign-%d", path, static_cast<int>(getpid())));
+}
+
+bool claim_folder(const char* path) {
+  for (int tries = 0; tries < kClaimTries; tries++) {
+    drop_foreign_folder(path);
+    (void)mkdir(path, 0700);
+    struct stat found;
+    const int fd = open(path, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+    const bool own = fd >= 0 && fstat(fd, &found) == 0 && is_own_folder(found);
+    const bool closed = own && ((found.st_mode & 077) == 0 || fchmod(fd, found.st_mode & 07700) == 0);
+    if (fd >= 0) close(fd);
+    if (closed) return true;
+    if (fd < 0 && errno != ENOENT && errno != ELOOP && errno != ENOTDIR) return false;
+  }
+  return false;
 }
 
 }  // namespace remvol

@@ -26,10 +26,15 @@ int make_dir_include_parent(const char* path, mode_t mode);
 // Removes the file `path`. Returns 0 when it is gone or was absent, else -1.
 int _remove_file(const char* path);
 
-// Prepares a temporary file with a name that others can guess: removes anything at `path` that is not a
-// regular file of our own user, so that what is written next neither follows a planted link nor is refused by
-// fs.protected_regular (proc_sys_fs(5)).
-void clear_temp_path(const char* path);
+// Removes whatever is at `path`, a folder with all that is in it. Follows no link.
+void remove_path(const char* path);
+
+// Removes what is at `path`, or puts it aside, unless it is a folder of our own user.
+void drop_foreign_folder(const char* path);
+
+// Makes sure that `path` is a folder of our own user which nobody else may enter: what is there and is not is
+// replaced. Its parent has to exist. Returns whether it is.
+bool claim_folder(const char* path);
 
 }  // namespace remvol
 

@@ -11,6 +11,7 @@
 #include "frontend/log.h"
 #include "support/files.h"
 #include "support/result.h"
+#include "support/text.h"
 
 namespace remvol {
 
@@ -18,6 +19,9 @@ namespace {
 
 // Results of the record-lock operations.
 enum LockResult : int { kHeldElsewhere = -1, kBadDescriptor = -2, kLockError = -10 };
+
+// An error that does not go away, such as a lock table that is full, must not keep a run for ever.
+constexpr int kMaxLockErrors = 100;
 
 // Sets `type` (F_WRLCK or F_UNLCK) on the whole file without blocking. Returns 0 or a LockResult; errno
 // stays.
@@ -31,12 +35,14 @@ int set_record_lock(int fd, short type) {
 }
 
 int open_lock_file(const char* path) {
-  return open(path, O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+  return open(path, O_RDWR | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0600);
 }
 
 }  // namespace
 
 int make_lock_dir() {
+  // Where everybody may make folders (a /var/lock of mode 1777) it may be somebody else's.
+  drop_foreign_folder(Text<sizeof kLockDir>("%.*s", static_cast<int>(sizeof kLockDir - 2), kLockDir));
   if (make_dir_include_parent(kLockDir, 0700) == 0) return kOk;
   perror(kLockDir);
   return kLockFileFailed;
@@ -76,10 +82,12 @@ int wait_flock(const char* path, int max_retries, int max_wait_us) {
   const int fd = open_lock_file(path);
   if (fd < 0) return kLockFileFailed;
   int retries = 0;
+  int errors = 0;
   int error = kOk;
   for (int result; (result = set_record_lock(fd, F_WRLCK)) != kOk && retries <= max_retries;) {
     if (result != kHeldElsewhere) {
       error = kLockError;
+      if (++errors == kMaxLockErrors) break;
       continue;
     }
     retries++;

@@ -6,11 +6,15 @@
 #include "iscsi/session.h"
 #include "iscsi/session_check.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "tree/entry.h"
+#include "tree/half_made.h"
 #include "tree/search_results.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/mount.h"
+#include "volume/unmount.h"
 
 namespace remvol {
 
@@ -52,13 +56,16 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
   const MountOutcome& outcome = _mount_outcome(Target_mount(entry, 0, 0));
   ktree_update_volume_state(entry, outcome.state);
   ktree_update_lun_status(entry, 0);
+  unmount_if_deleted(entry);
   *result = outcome.result;
   return &outcome != &kMountBroken;
 }
 
-// Stores the requested target and LUN. Returns 0 with both slots, or -1.
+// Stores the requested target and LUN, in one step for other runs. Returns 0 with both slots, or -1.
 int _store_requested_lun(int* dbidx, int* lun_dbidx, Caller caller = Caller()) {
   TargetEntry* const entry = &request_target;
+  const SlotsHeld held(SlotsHeld::kChange);
+  drop_half_made_luns();
   *dbidx = ktree_add_entry(entry);
   if (*dbidx <= 0) return kFailed;
   if (ktree_get_dbidx_by_lun(*dbidx, entry->lun) > 0) return kFailed;
@@ -84,6 +91,7 @@ int task_add() {
   ktree_update_lun_status(&request_target, 0);
   ktree_update_status(&request_target);
 
+  const TargetHold hold(request_target.target_name, request_target.lun);
   int result = kOk;
   if (check_target_connected(request_target.target_name) == 0) {
     Target_Config_Gen(&request_target);  // no login: the volume is mounted when the target is next connected

@@ -9,7 +9,9 @@
 #include "iscsi/session.h"
 #include "support/command.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "tree/entry.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/mount.h"
@@ -43,13 +45,14 @@ void _mount_connected_lun(TargetEntry* entry) {
   if (entry->dev[0] != '\0') state = _state_after_mount(Target_mount(entry, 0, 0));
   ktree_update_volume_state(entry, state);
   ktree_update_lun_status(entry, 0);
+  unmount_if_deleted(entry);
 }
 
 // Mounts the enabled LUNs of the target at `dbidx`, with `entry` as the record for each. Returns 0, or why
 // the last LUN visited could not be asked whether it is enabled.
 int _mount_enabled_luns(TargetEntry* entry, int dbidx) {
   int result = kOk;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
     if (ktree_get_lun_entry_by_dbidx(entry, dbidx, slot) != kOk) break;
     int enable = 0;
     result = ktree_get_lun_enable(&enable, dbidx, slot);
@@ -87,6 +90,7 @@ int _disconnect_all(Caller caller = Caller()) {
 int _disconnect_requested() {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(request_target.target_name, &entry) != kOk) return kFailed;
+  const BriefTargetHold hold(entry.target_name, is_no_lun_formatting, entry.db_idx);
   Target_Disconnect(&entry);
   ktree_update_status(&entry);
   return kOk;
@@ -96,6 +100,7 @@ int _disconnect_requested() {
 
 int task_connect() {
   LOG(2, "start");
+  const TargetHold hold(request_target.target_name);
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(request_target.target_name, &entry) != kOk) {
     LOG(1, "Can not find: %s", request_target.target_name);
@@ -114,6 +119,7 @@ int task_connect() {
   ktree_record_connect_set(&entry);
   ktree_set_connect_state(entry.db_idx, kConnected);
   const int result = _present_volumes(&entry);
+  if (!HeldSlot(entry.db_idx)) Target_Logout(&entry);  // deleted meanwhile
   LOG(2, "end, ret = %d", result);
   return result;
 }

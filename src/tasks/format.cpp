@@ -7,10 +7,12 @@
 #include "iscsi/node.h"
 #include "iscsi/session.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/ftp_share.h"
 #include "tasks/requested_lun.h"
 #include "tree/entry.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/disk_identity.h"
@@ -60,7 +62,14 @@ int _remake_volume(TargetEntry* entry, Caller caller = Caller()) {
     Target_remount_ftp(entry, ftp_path);
   }
   ktree_update_lun_status(entry, 0);
+  unmount_if_deleted(entry);
   return mounted;
+}
+
+// Writes the entry to its slot. A target that was deleted meanwhile is not stored again.
+void _update_stored_target(TargetEntry* entry) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  if (HeldSlot(entry->db_idx)) ktree_add_entry(entry);
 }
 
 // Puts the requested CHAP settings into the target's entry, its slot and its node record.
@@ -68,7 +77,7 @@ void _store_chap(TargetEntry* entry) {
   entry->chap = request_target.chap;
   copy_text(entry->chap_name, request_target.chap_name);
   copy_text(entry->chap_pwd, request_target.chap_pwd);
-  ktree_add_entry(entry);
+  _update_stored_target(entry);
   Target_Config_Gen(entry);
 }
 
@@ -94,6 +103,7 @@ void _reconnect(TargetEntry* entry, int conn_set, Caller caller = Caller()) {
 int task_format() {
   TargetEntry entry = {};
   LOG(2, "start");
+  const TargetHold hold(request_target.target_name, request_target.lun);
   int result = _read_lun_to_format(&entry);
   if (result == kOk) result = _remake_volume(&entry);
   LOG(2, "end");
@@ -102,6 +112,7 @@ int task_format() {
 
 int task_modify() {
   LOG(2, "start");
+  const TargetHold hold(request_target.target_name);
   int result = kFailed;
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {

@@ -8,14 +8,14 @@
 #include "support/command.h"
 #include "support/locks.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/connect.h"
 #include "tasks/ftp_share.h"
 #include "tasks/requested_lun.h"
-#include "tree/access.h"
 #include "tree/entry.h"
-#include "tree/keys.h"
 #include "tree/recover_queue.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/degrade.h"
@@ -76,7 +76,7 @@ void _check_lun(const TargetEntry* lun, TargetHealth* health, Caller caller) {
 TargetHealth _check_luns(int dbidx, Caller caller) {
   TargetHealth health;
   TargetEntry lun;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
     if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) break;
     _check_lun(&lun, &health, caller);
   }
@@ -100,8 +100,8 @@ void _postpone(const TargetEntry* entry, Caller caller) {
 // Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one
 // ends the walk.
 void _unmount_luns(int dbidx, Caller caller) {
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
-    if (!tree_present(KeyText(key::kLunNumber, dbidx, slot))) break;
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
+    if (!is_lun_stored(dbidx, slot)) break;
     TargetEntry lun;
     if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) continue;
     FtpPath ftp_path;
@@ -112,6 +112,7 @@ void _unmount_luns(int dbidx, Caller caller) {
 
 // Unmounts everything, logs out and connects the target again. Returns the result of the connection.
 int _rebuild(TargetEntry* entry, Caller caller) {
+  const TargetHold hold(entry->target_name);
   _unmount_luns(entry->db_idx, caller);
   Target_Logout(entry);
   entry->conn_set = 1;

@@ -4,11 +4,14 @@
 #include "frontend/request.h"
 #include "iscsi/node.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/requested_lun.h"
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
+#include "tree/state.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
@@ -25,34 +28,42 @@ int reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
   return reload_share_services();
 }
 
-// Deletes a slot; the tree moves the slots behind it down. Returns 0 or kNotDeleted.
-int _delete_slot(const char* key, Caller caller) {
+// Deletes a slot, or the whole target's when `lun_dbidx` is 0; the tree moves the slots behind it down. What
+// another run has deleted meanwhile is deleted. Returns 0 or kNotDeleted.
+int _delete_slot(int dbidx, int lun_dbidx, Caller caller) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  const HeldSlot slot(dbidx, lun_dbidx);
+  if (!slot) return kOk;
+  const KeyText key =
+      lun_dbidx > 0 ? KeyText(key::kLun, slot.target(), slot.lun()) : KeyText(key::kTarget, slot.target());
   for (int tries = 0; tries < kDeleteTries; tries++) {
     if (tree_delete(key) == kOk) return kOk;
-    LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", key);
+    LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", key.c_str());
   }
   return kNotDeleted;
 }
 
 // Removes the target in `entry`, volumes, session and node record first. Returns 0 or kNotDeleted.
 int _remove_target(TargetEntry* entry, Caller caller = Caller()) {
+  const BriefTargetHold hold(entry->target_name, is_no_lun_formatting, entry->db_idx);
   TargetEntry lun;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
     if (ktree_get_lun_entry_by_dbidx(&lun, entry->db_idx, slot) != kOk) break;
     reload_lun_share(&lun);
   }
   Target_Disconnect(entry);
   _target_record_delete(entry);
-  return _delete_slot(KeyText(key::kTarget, entry->db_idx), caller);
+  return _delete_slot(entry->db_idx, 0, caller);
 }
 
 // Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
 int _remove_lun(int dbidx, int lun_dbidx, Caller caller = Caller()) {
   TargetEntry lun;
   if (read_requested_lun(&lun, dbidx, lun_dbidx, caller) != kOk) return kFailed;
+  const BriefTargetHold hold(lun.target_name, is_no_lun_formatting, dbidx);
   reload_lun_share(&lun);
   Target_LUN_umount(&lun);
-  return _delete_slot(KeyText(key::kLun, dbidx, lun_dbidx), caller);
+  return _delete_slot(dbidx, lun_dbidx, caller);
 }
 
 }  // namespace

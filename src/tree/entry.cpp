@@ -9,6 +9,7 @@
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 
 namespace remvol {
@@ -33,9 +34,9 @@ void read_target_fields(TargetEntry* entry, int dbidx) {
   entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
 }
 
-int read_state(const char* key, int* value, int missing) {
+int read_state(const char* key, bool stored, int* value, int missing) {
   char text[128];
-  const bool present = tree_read(key, text);
+  const bool present = stored && tree_read(key, text);
   *value = present ? atoi(text) : missing;
   return present ? kOk : kTreeFailed;
 }
@@ -55,6 +56,7 @@ bool set_value(const char* key, int value, Caller caller) {
 
 int ktree_get_dbidx_by_targetname(const char* target_name) {
   if (target_name == nullptr) return kFailed;
+  const SlotsHeld held;
   int dbidx = kFailed;
   for (int n = 1; n <= kMaxTargets && dbidx == kFailed; n++) {
     const KeyText key(key::kTargetName, n);
@@ -65,6 +67,7 @@ int ktree_get_dbidx_by_targetname(const char* target_name) {
     }
     if (strcmp(name, target_name) == 0) dbidx = n;
   }
+  if (dbidx >= 1) remember_target(dbidx, target_name);
   LOG(1, "get %s db_idx=%d", target_name, dbidx);
   return dbidx;
 }
@@ -84,6 +87,7 @@ int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry) {
     return kFailed;
   }
   *entry = TargetEntry();
+  const SlotsHeld held;
   const int dbidx = ktree_get_dbidx_by_targetname(target_name);
   if (dbidx < 1) {
     LOG(0, "Can not get entry from %s", target_name != nullptr ? target_name : "");
@@ -98,43 +102,64 @@ int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry) {
 
 int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry) {
   *entry = TargetEntry();
-  if (!tree_read(KeyText(key::kTargetName, dbidx), entry->target_name)) return kFailed;
+  const HeldSlot slot(dbidx);
+  if (!slot || !tree_read(KeyText(key::kTargetName, slot.target()), entry->target_name)) return kFailed;
+  remember_target(dbidx, entry->target_name);
   entry->db_idx = dbidx;
-  read_target_fields(entry, dbidx);
+  read_target_fields(entry, slot.target());
   return kOk;
+}
+
+bool is_target_stored(int dbidx) {
+  const HeldSlot slot(dbidx);
+  return slot && tree_present(KeyText(key::kTargetName, slot.target()));
+}
+
+bool is_lun_stored(int dbidx, int lun_dbidx) {
+  const HeldSlot slot(dbidx);
+  char lun[kValueSize];
+  if (!slot || !tree_read(KeyText(key::kLunNumber, slot.target(), lun_dbidx), lun)) return false;
+  remember_lun(dbidx, lun_dbidx, atoi(lun));
+  return true;
 }
 
 int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx) {
   if (entry == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
   *entry = TargetEntry();
+  const HeldSlot slot(dbidx);
+  const int n = slot.target();
   char value[kValueSize];
-  if (!tree_read(KeyText(key::kTargetName, dbidx), value)) {
+  if (!slot || !tree_read(KeyText(key::kTargetName, n), value)) {
     LOG(0, "Can not get entry from %d", dbidx);
     return kFailed;
   }
+  remember_target(dbidx, value);
   copy_text(entry->target_name, value);
   entry->db_idx = dbidx;
-  if (!tree_read(KeyText(key::kLunNumber, dbidx, lun_dbidx), value)) {
+  if (!tree_read(KeyText(key::kLunNumber, n, lun_dbidx), value)) {
     LOG(2, "Can not get lun from %d", lun_dbidx);
     return kFailed;
   }
   entry->lun = atoi(value);
   entry->lun_db_idx = lun_dbidx;
-  read_field(KeyText(key::kLunShare, dbidx, lun_dbidx), entry->share);
-  read_field(KeyText(key::kLunDev, dbidx, lun_dbidx), entry->dev);
-  read_field(KeyText(key::kLunMntDev, dbidx, lun_dbidx), entry->mnt_dev);
-  read_field(KeyText(key::kLunMnt, dbidx, lun_dbidx), entry->mnt);
-  read_target_fields(entry, dbidx);
+  remember_lun(dbidx, lun_dbidx, entry->lun);
+  read_field(KeyText(key::kLunShare, n, lun_dbidx), entry->share);
+  read_field(KeyText(key::kLunDev, n, lun_dbidx), entry->dev);
+  read_field(KeyText(key::kLunMntDev, n, lun_dbidx), entry->mnt_dev);
+  read_field(KeyText(key::kLunMnt, n, lun_dbidx), entry->mnt);
+  read_target_fields(entry, n);
   return kOk;
 }
 
 int ktree_update_current_targetcnt() {
+  const SlotsHeld held;
   int count = 0;
   for (int n = 1; n <= kMaxTargets; n++) count += tree_present(KeyText(key::kTargetName, n)) ? 1 : 0;
   return tree_write_with_tries(key::kTargetCount, NumberText("%d", count));
 }
 
 int ktree_get_total_luncnt() {
+  const SlotsHeld held;
   int total = 0;
   for (int n = 1; n <= kMaxTargets && !tree_slot_is_free(KeyText(key::kTargetName, n)); n++) {
     total += ktree_count_target_luns(n);
@@ -150,41 +175,51 @@ int ktree_count_target_luns(int dbidx) {
 }
 
 int ktree_refresh_total_luncnt() {
+  const SlotsHeld held;
   return tree_write_with_tries(key::kTotalLunCount, NumberText("%d", ktree_get_total_luncnt()));
 }
 
 int ktree_update_current_luncnt(int dbidx) {
+  const HeldSlot slot(dbidx);
+  if (!slot) return kTreeFailed;
+  const int n = slot.target();
   int count = 0;
   for (int m = 1; m <= kMaxLunsPerTarget; m++) {
-    count += tree_present(KeyText(key::kLunNumber, dbidx, m)) ? 1 : 0;
+    count += tree_present(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
   }
-  const int result = tree_write_with_tries(KeyText(key::kTargetLunCount, dbidx), NumberText("%d", count));
+  const int result = tree_write_with_tries(KeyText(key::kTargetLunCount, n), NumberText("%d", count));
   const int total_result = ktree_refresh_total_luncnt();
   return result != kOk ? result : total_result;
 }
 
 int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value) {
-  return read_state(KeyText(key::kLunFormatState, dbidx, lun_dbidx), value, -1);
+  const HeldSlot slot(dbidx, lun_dbidx);
+  return read_state(KeyText(key::kLunFormatState, slot.target(), slot.lun()), bool(slot), value, -1);
 }
 
 int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value) {
-  return read_state(KeyText(key::kLunFormatProgress, dbidx, lun_dbidx), value, 0);
+  const HeldSlot slot(dbidx, lun_dbidx);
+  return read_state(KeyText(key::kLunFormatProgress, slot.target(), slot.lun()), bool(slot), value, 0);
 }
 
 int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value) {
-  return read_state(KeyText(key::kLunVolumeState, dbidx, lun_dbidx), value, -1);
+  const HeldSlot slot(dbidx, lun_dbidx);
+  return read_state(KeyText(key::kLunVolumeState, slot.target(), slot.lun()), bool(slot), value, -1);
 }
 
 int ktree_get_connect_state(int dbidx, int* value) {
-  return read_state(KeyText(key::kTargetConnState, dbidx), value, -1);
+  const HeldSlot slot(dbidx);
+  return read_state(KeyText(key::kTargetConnState, slot.target()), bool(slot), value, -1);
 }
 
 int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
   if (enable == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
   *enable = 0;
+  const HeldSlot slot(dbidx, lun_dbidx);
+  if (!slot) return kTreeFailed;
   char value[128] = "";
   const int length =
-      ktreec_get_wb(main_socket, 0, KeyText(key::kLunEnable, dbidx, lun_dbidx), value, sizeof value);
+      ktreec_get_wb(main_socket, 0, KeyText(key::kLunEnable, slot.target(), slot.lun()), value, sizeof value);
   if (length > 0 && value[0] != '\0') {
     *enable = atoi(value) != 0 ? 1 : 0;
     return kOk;
@@ -210,9 +245,11 @@ int ktree_get_free_lun_dbidx(int dbidx) {
 
 int ktree_get_dbidx_by_lun(int dbidx, int lun) {
   if (lun < 0) return kFailed;
+  const HeldSlot slot(dbidx);
+  if (!slot) return kFailed;
   int lun_dbidx = kFailed;
   for (int m = 1; m <= kMaxLunsPerTarget && lun_dbidx == kFailed; m++) {
-    const KeyText key(key::kLunNumber, dbidx, m);
+    const KeyText key(key::kLunNumber, slot.target(), m);
     char value[kValueSize];
     if (!tree_read(key, value)) {
       LOG(1, "ktreec_get(%s) failed", key.c_str());
@@ -220,17 +257,20 @@ int ktree_get_dbidx_by_lun(int dbidx, int lun) {
     }
     if (atoi(value) == lun) lun_dbidx = m;
   }
+  if (lun_dbidx >= 1) remember_lun(dbidx, lun_dbidx, lun);
   LOG(1, "get lun: %d at db_idx=%d", lun, lun_dbidx);
   return lun_dbidx;
 }
 
 int ktree_add_lun_entry(TargetEntry* entry) {
   if (entry == nullptr) return kFailed;
+  const SlotsHeld held(SlotsHeld::kChange);
   const int n = entry->db_idx >= 1 ? entry->db_idx : ktree_get_dbidx_by_targetname(entry->target_name);
   if (n < 1 || ktree_get_dbidx_by_lun(n, entry->lun) >= 1) return kFailed;
   const int m = ktree_get_free_lun_dbidx(n);
   if (m <= 0) return kFailed;
   entry->lun_db_idx = m;
+  remember_lun(n, m, entry->lun);
   const Caller here;
   const bool stored = set_value(KeyText(key::kLunNumber, n, m), entry->lun, here) &&
                       set_value(KeyText(key::kLunShare, n, m), entry->share, here) &&
@@ -246,6 +286,7 @@ int ktree_add_entry(TargetEntry* entry) {
     return kFailed;
   }
   if (entry->chap != 0 && (entry->chap_name[0] == '\0' || entry->chap_pwd[0] == '\0')) return kFailed;
+  const SlotsHeld held(SlotsHeld::kChange);
   int n = ktree_get_dbidx_by_targetname(entry->target_name);
   if (n < 1) n = ktree_get_free_dbidx();
   if (n < 1) {
@@ -253,6 +294,7 @@ int ktree_add_entry(TargetEntry* entry) {
     return kFailed;
   }
   entry->db_idx = n;
+  remember_target(n, entry->target_name);
   const Caller here;
   bool stored = set_value(KeyText(key::kTargetName, n), entry->target_name, here);
   stored &= set_value(KeyText(key::kTargetChap, n), entry->chap, here);

@@ -9,6 +9,7 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
 
 namespace remvol {
 
@@ -66,6 +67,7 @@ int ktree_update_search_lun_err_code(const char* socket, int code) {
 }
 
 int ktree_check_duplicate_share_name(const char* share) {
+  const SlotsHeld held;
   for (int n = 1; n <= kMaxTargets; n++) {
     if (!share_is_used_in(n, share)) continue;
     LOG(1, "Found %s", share);

@@ -6,11 +6,15 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
 
 namespace remvol {
 
 int ktree_set_connect_state(int dbidx, int state) {
-  const KeyText key(key::kTargetConnState, dbidx);
+  const SlotsHeld held(SlotsHeld::kChange);  // not between the looks of a run that composes the status
+  const HeldSlot slot(dbidx);
+  if (!slot) return kTreeFailed;
+  const KeyText key(key::kTargetConnState, slot.target());
   if (tree_write(key, NumberText("%d", state)) == kOk) return kOk;
   LOG(0, "ktreec_set(%s) failed", key.c_str());
   return kTreeFailed;
@@ -25,7 +29,10 @@ int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx) {
     LOG(0, "db index must > 0");
     return kFailed;
   }
-  return tree_write_with_tries(KeyText(key::kLunAccessRight, dbidx, lun_dbidx), NumberText("%d", right));
+  const HeldSlot slot(dbidx, lun_dbidx);
+  if (!slot) return kTreeFailed;
+  return tree_write_with_tries(KeyText(key::kLunAccessRight, slot.target(), slot.lun()),
+                               NumberText("%d", right));
 }
 
 int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx) {
@@ -37,7 +44,9 @@ int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx) {
     LOG(0, "db index must > 0");
     return kFailed;
   }
-  const int stored = tree_read_number(KeyText(key::kLunAccessRight, dbidx, lun_dbidx), VOL_AC_RW);
+  const HeldSlot slot(dbidx, lun_dbidx);
+  const KeyText key(key::kLunAccessRight, slot.target(), slot.lun());
+  const int stored = slot ? tree_read_number(key, VOL_AC_RW) : VOL_AC_RW;
   *right = stored == VOL_AC_RO ? VOL_AC_RO : VOL_AC_RW;
   return kOk;
 }
@@ -47,8 +56,20 @@ int ktree_update_formatting_state(const TargetEntry* entry, int state) {
     // Only a warning: the tree itself refuses a slot below 1.
     LOG(0, "target or lun db index not given");
   }
-  return tree_write_with_tries(KeyText(key::kLunFormatState, entry->db_idx, entry->lun_db_idx),
+  const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+  if (!slot) return kTreeFailed;
+  return tree_write_with_tries(KeyText(key::kLunFormatState, slot.target(), slot.lun()),
                                NumberText("%d", state));
+}
+
+bool is_no_lun_formatting(int dbidx) {
+  const SlotsHeld held;
+  for (int m = 1; m <= kMaxLunsPerTarget && is_lun_stored(dbidx, m); m++) {
+    int state = kFormatIdle;
+    ktree_get_lun_format_state(dbidx, m, &state);
+    if (state == kFormatting || state == kFormatWaiting) return false;
+  }
+  return true;
 }
 
 int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent) {
@@ -56,14 +77,18 @@ int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent) {
     LOG(0, "target or lun db index not given");
     return kFailed;
   }
-  const KeyText key(key::kLunFormatProgress, dbidx, lun_dbidx);
+  const HeldSlot slot(dbidx, lun_dbidx);
+  if (!slot) return kTreeFailed;
+  const KeyText key(key::kLunFormatProgress, slot.target(), slot.lun());
   const NumberText value("%d", percent);
   LOG(2, "set %s = %s", key.c_str(), value.c_str());
   return tree_write_with_tries(key, value);
 }
 
 int ktree_update_volume_state(const TargetEntry* entry, int state) {
-  const KeyText key(key::kLunVolumeState, entry->db_idx, entry->lun_db_idx);
+  const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+  if (!slot) return kTreeFailed;
+  const KeyText key(key::kLunVolumeState, slot.target(), slot.lun());
   const NumberText value("%d", state);
   LOG(1, "set %s=%s", key.c_str(), value.c_str());
   return tree_write_with_tries(key, value);
@@ -73,8 +98,9 @@ int ktree_update_all_volume_state(TargetEntry* entry, int state) {
   if (entry == nullptr) return kFailed;
   if (entry->db_idx < 1) entry->db_idx = ktree_get_dbidx_by_targetname(entry->target_name);
   if (entry->db_idx < 1) return kFailed;
+  const SlotsHeld held;
   for (int m = 1; m <= kMaxLunsPerTarget; m++) {
-    if (!tree_present(KeyText(key::kLunNumber, entry->db_idx, m))) break;
+    if (!is_lun_stored(entry->db_idx, m)) break;
     entry->lun_db_idx = m;
     const int result = ktree_update_volume_state(entry, state);
     if (result != kOk) return result;
@@ -86,8 +112,10 @@ int ktree_update_mount_info(TargetEntry* entry, const char* node, const char* mo
                             const char* fs_type) {
   copy_text(entry->mnt_dev, node);
   copy_text(entry->mnt, mount_point);
-  const int n = entry->db_idx;
-  const int m = entry->lun_db_idx;
+  const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+  if (!slot) return kOk;
+  const int n = slot.target();
+  const int m = slot.lun();
   (void)tree_write(KeyText(key::kLunMntDev, n, m), entry->mnt_dev);
   (void)tree_write(KeyText(key::kLunMnt, n, m), entry->mnt);
   (void)tree_write(KeyText(key::kLunFsType, n, m), fs_type);
@@ -99,7 +127,9 @@ int ktree_update_initiator_iqn(const char* name) {
 }
 
 int ktree_record_connect_set(const TargetEntry* entry) {
-  const KeyText key(key::kTargetConnSet, entry->db_idx);
+  const HeldSlot slot(entry->db_idx);
+  if (!slot) return kTreeFailed;
+  const KeyText key(key::kTargetConnSet, slot.target());
   const NumberText value("%d", entry->conn_set);
   LOG(1, "ktreec_set %s=%s", key.c_str(), value.c_str());
   if (tree_write(key, value) == kOk) return kOk;

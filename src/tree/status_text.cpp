@@ -1,5 +1,7 @@
 #include "tree/status_text.h"
 
+#include <utility>
+
 #include "frontend/log.h"
 #include "iscsi/session_check.h"
 #include "support/result.h"
@@ -8,6 +10,7 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/mount_point.h"
 
@@ -16,6 +19,8 @@ namespace remvol {
 namespace {
 
 using StatusText = Text<64>;
+
+constexpr int kStatusTries = 3;
 
 // What the status text of a LUN is made of.
 struct LunState {
@@ -65,6 +70,7 @@ StatusText unformatted_text(const LunState& state) {
 }
 
 LunState read_lun_state(int n, int m, int right) {
+  const SlotsHeld held;
   LunState state = {right, 0, 0, 0};
   ktree_get_lun_format_state(n, m, &state.format);
   ktree_get_lun_volume_state(n, m, &state.volume);
@@ -74,17 +80,24 @@ LunState read_lun_state(int n, int m, int right) {
 
 // Writes a status text and a size; both are tried even when the first fails.
 int write_status(const TargetEntry* entry, const char* text, const char* size, Caller caller) {
-  const int n = entry->db_idx;
-  const int m = entry->lun_db_idx;
+  const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+  if (!slot) return kTreeFailed;
+  const int n = slot.target();
+  const int m = slot.lun();
   const int status_result = write_logged(KeyText(key::kLunStatus, n, m), text, caller);
   const int size_result = write_logged(KeyText(key::kLunSize, n, m), size, caller);
   return status_result != kOk ? status_result : size_result;
 }
 
+int write_fs_type(const TargetEntry* entry, const char* fs_type, Caller caller) {
+  const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+  if (!slot) return kTreeFailed;
+  return write_logged(KeyText(key::kLunFsType, slot.target(), slot.lun()), fs_type, caller);
+}
+
 // The text of a LUN on which the file system `fs_type` was recognised.
 int write_recognised(const TargetEntry* entry, const LunState& state, const char* fs_type, Caller caller) {
-  const int type_result =
-      write_logged(KeyText(key::kLunFsType, entry->db_idx, entry->lun_db_idx), fs_type, caller);
+  const int type_result = write_fs_type(entry, fs_type, caller);
   unsigned long long total = 0;
   unsigned long long used = 0;
   unsigned long long available = 0;
@@ -105,7 +118,9 @@ int compose_lun_status(const TargetEntry* entry, int formatting, int right, Call
   int enable = 0;
   if (ktree_get_lun_enable(&enable, n, m) != kOk || enable == 0) {
     // The size of a disabled LUN stays as it was.
-    return write_logged(KeyText(key::kLunStatus, n, m), "Disable", caller);
+    const HeldSlot slot(n, m);
+    return slot ? write_logged(KeyText(key::kLunStatus, slot.target(), slot.lun()), "Disable", caller)
+                : kTreeFailed;
   }
   const LunState state = read_lun_state(n, m, right);
   if (formatting != 0) return write_status(entry, progress_text(state), "0/0", caller);
@@ -117,37 +132,52 @@ int compose_lun_status(const TargetEntry* entry, int formatting, int right, Call
   return write_status(entry, unformatted_text(state), "0/0", caller);
 }
 
-// Writes the connect state that goes with a status text. `printed` is the state that a failure names: those
-// who read the log know it as 1 for a connected target and 0 for every other.
-int follow_connect_state(int dbidx, int state, int printed, Caller caller) {
+int write_target_status(int dbidx, const char* text, Caller caller) {
+  const HeldSlot slot(dbidx);
+  if (!slot) return kTreeFailed;
+  return write_logged(KeyText(key::kTargetStatus, slot.target()), text, caller);
+}
+
+// Writes a status text and the connect state that goes with it; the result of the latter hides that of the
+// former. `printed` is the state that a failure names: those who read the log know it as 1 for a connected
+// target and 0 for every other.
+int write_with_state(int dbidx, const char* text, int state, int printed, Caller caller) {
+  write_target_status(dbidx, text, caller);
   const int result = ktree_set_connect_state(dbidx, state);
   if (result != kOk) LOG_AT(caller, 0, "ktree_set_connect_state(%d, %d) failed", dbidx, printed);
   return result;
+}
+
+int read_connect_state(int dbidx) {
+  int state = -1;
+  ktree_get_connect_state(dbidx, &state);
+  return state;
+}
+
+int write_target_state(int n, bool connected, int state, Caller caller) {
+  if (connected) return write_with_state(n, "Connected", kConnected, 1, caller);
+  if (state == kConnecting) return write_with_state(n, "Connecting", kConnecting, 0, caller);
+  if (state != kConnectError) return write_with_state(n, "Disconnected", kDisconnected, 0, caller);
+  return write_target_status(n, "Connect Error", caller);
 }
 
 }  // namespace
 
 int ktree_update_status(const TargetEntry* entry) {
   const int n = entry->db_idx;
-  const KeyText key(key::kTargetStatus, n);
   const Caller here;
-  int state = -1;
-  ktree_get_connect_state(n, &state);
-  if (state == kRecovering && entry->conn_set == 1) return write_logged(key, "Reconnecting", here);
-  // The result of the connect-state write hides that of the text.
-  if (check_target_connected(entry->target_name) == 1) {
-    write_logged(key, "Connected", here);
-    return follow_connect_state(n, kConnected, 1, here);
+  int state = read_connect_state(n);
+  bool connected = false;
+  // While the sessions are listed another run may bring the target up, or fail to: what it wrote counts then.
+  for (int tries = 0; tries < kStatusTries; tries++) {
+    if (state == kRecovering && entry->conn_set == 1) return write_target_status(n, "Reconnecting", here);
+    connected = check_target_connected(entry->target_name) == 1;
+    const SlotsHeld held(SlotsHeld::kChange);
+    const int seen = std::exchange(state, read_connect_state(n));
+    if (state == seen) return write_target_state(n, connected, state, here);
   }
-  if (state == kConnecting) {
-    write_logged(key, "Connecting", here);
-    return follow_connect_state(n, kConnecting, 0, here);
-  }
-  if (state != kConnectError) {
-    write_logged(key, "Disconnected", here);
-    return follow_connect_state(n, kDisconnected, 0, here);
-  }
-  return write_logged(key, "Connect Error", here);
+  const SlotsHeld held(SlotsHeld::kChange);
+  return write_target_state(n, connected, state, here);
 }
 
 int ktree_update_lun_status(const TargetEntry* entry, int formatting) {

@@ -12,9 +12,8 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "sysaux.h"
-#include "tree/access.h"
 #include "tree/entry.h"
-#include "tree/keys.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/bare_folder.h"
@@ -289,8 +288,8 @@ int Target_mount(TargetEntry* entry, int force_format, int update_share) {
 int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share) {
   if (entry == nullptr || entry->db_idx < 1) return kFailed;
   LOG(2, "start");
-  for (int lun = 1; lun <= kMaxLunsPerTarget; lun++) {
-    if (!tree_present(KeyText(key::kLunNumber, entry->db_idx, lun))) break;
+  for (int lun = 1; lun <= kMaxLunsPerTarget; lun = lun_slot_after(entry->db_idx, lun)) {
+    if (!is_lun_stored(entry->db_idx, lun)) break;
     TargetEntry lun_entry;
     if (ktree_get_lun_entry_by_dbidx(&lun_entry, entry->db_idx, lun) != 0) continue;
     Target_mount(&lun_entry, force_format, update_share);

@@ -45,8 +45,8 @@ bool read_process(const char* pid, const char* field, char (&text)[4096]) {
   return true;
 }
 
-// The `ps -w` of procps lists no arguments, and only processes of the caller's own terminal: there the device
-// is found in the process's own files, see proc_pid_comm(5) and proc_pid_cmdline(5).
+}  // namespace
+
 bool has_process(const char* name, const char* device) {
   const std::unique_ptr<DIR, DirCloser> processes(opendir("/proc"));
   if (!processes) return false;
@@ -59,8 +59,8 @@ bool has_process(const char* name, const char* device) {
   return false;
 }
 
-}  // namespace
-
+// The `ps -w` of procps lists no arguments, and only processes of the caller's own terminal: there the device
+// is found in the process's own files.
 bool is_command_running_on(const char* name, const char* device, Caller caller) {
   return is_listed(name, device, caller) || has_process(name, device);
 }

@@ -10,6 +10,10 @@ namespace remvol {
 // Every line looked at is logged at level 2 in the caller's name.
 bool is_command_running_on(const char* name, const char* device, Caller caller = Caller());
 
+// Returns whether a process called `name` has `device` in its arguments, by its own files; see
+// proc_pid_comm(5) and proc_pid_cmdline(5).
+bool has_process(const char* name, const char* device);
+
 }  // namespace remvol
 
 #endif

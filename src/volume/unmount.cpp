@@ -13,9 +13,8 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "sysaux.h"
-#include "tree/access.h"
 #include "tree/entry.h"
-#include "tree/keys.h"
+#include "tree/slots.h"
 #include "tree/status_text.h"
 #include "volume/bare_folder.h"
 #include "volume/disk_identity.h"
@@ -84,8 +83,8 @@ int remove_mount_point(const char* mount_point, Caller caller = Caller()) {
 
 // Unmounts every LUN of the target up to the first empty slot.
 void umount_luns(int dbidx) {
-  for (int lun = 1; lun <= kMaxLunsPerTarget; lun++) {
-    if (!tree_present(KeyText(key::kLunNumber, dbidx, lun))) return;
+  for (int lun = 1; lun <= kMaxLunsPerTarget; lun = lun_slot_after(dbidx, lun)) {
+    if (!is_lun_stored(dbidx, lun)) return;
     TargetEntry entry;
     if (ktree_get_lun_entry_by_dbidx(&entry, dbidx, lun) != 0) continue;
     Target_LUN_umount(&entry);
@@ -114,14 +113,19 @@ int Target_LUN_umount(const TargetEntry* entry) {
   return result;
 }
 
+void unmount_if_deleted(const TargetEntry* entry) {
+  if (!HeldSlot(entry->db_idx, entry->lun_db_idx)) Target_LUN_umount(entry);
+}
+
 int Target_umount_all_lun(int dbidx) {
-  if (!tree_present(KeyText(key::kTargetName, dbidx))) return kFailed;
+  if (!is_target_stored(dbidx)) return kFailed;
   umount_luns(dbidx);
   return kOk;
 }
 
 int Target_umount_all() {
   LOG(2, "start");
+  remember_all_targets();
   for (int dbidx = 1; dbidx <= kMaxTargets; dbidx++) {
     if (Target_umount_all_lun(dbidx) != kOk) break;
   }

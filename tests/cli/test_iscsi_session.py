@@ -188,7 +188,7 @@ def test_old_device_names_are_cleared_first(box):
 
 def test_clearing_stops_at_the_first_empty_slot(box):
     show(box, plain=session(T1), detailed=HEADER + block(T1, {}))
-    box.tree.set({f"{ROOT}/lun/id:3/lun": "7", f"{ROOT}/lun/id:3/dev": "sdq"})
+    box.tree.set({f"{ROOT}/lun/id:3/lun": "7", f"{ROOT}/lun/id:3/share": "c", f"{ROOT}/lun/id:3/dev": "sdq"})
     status(box, luns=[{"lun": 1, "dev": "sdb"}])
     assert devices(box)[0] == ""
     assert box.tree.get(f"{ROOT}/lun/id:3/dev") == "sdq"

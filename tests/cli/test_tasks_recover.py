@@ -203,9 +203,8 @@ class TestDegradedVolumes:
 
     def test_a_target_that_vanishes_ends_disconnected(self, lost, box):
         degrade(box, "a")
-        # The connection looks the target up again and does not find it.
-        box.hook("system", LOGOUT, through=True,
-                 effect="ktreec -S /var/run/ktree_sock_vv -s /iscsi/initiator/id:1/target iqn.other")
+        # The connection looks the target up again and does not find it: so many reads come before that one.
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=23, times=1)
         assert recover(box).status == 255
         assert lost.target("conn_state") == "0"
         assert_order(lost.trace(), "set id:1/conn_state=2", "set id:1/conn_state=0")
@@ -223,8 +222,9 @@ class TestDegradedVolumes:
     def test_a_lun_that_cannot_be_read_is_passed_over(self, lost, box):
         degrade(box, "b")
         key = f"{INITIATOR}/id:1/lun/id:1/lun"
-        # Read: by the first walk, by the presence check of the second, then by the entry.
-        box.hook("ktreec_get_wb", key, ret=-1, skip=2, times=1)
+        # Read: by the first walk, its look at the format state and its step to the next slot, by the presence check
+        # of the second walk, then by the entry.
+        box.hook("ktreec_get_wb", key, ret=-1, skip=4, times=1)
         recover(box)
         umounts = [line for line in box.shell() if line.startswith("umount")]
         assert umounts == ['umount -f "/mnt/VV/b"']

@@ -165,7 +165,7 @@ TEST_F(Files, RemovalOfAFile) {
   EXPECT_EQ(_remove_file(at("").c_str()), -1);
 }
 
-TEST_F(Files, ATemporaryPathIsClearedOfWhatIsNotOurs) {
+TEST_F(Files, ARemovedPathTakesNothingBehindLinksAlong) {
   std::ofstream(at("victim")) << "kept";
   std::filesystem::create_symlink(at("victim"), at("link"));
   std::filesystem::create_hard_link(at("victim"), at("hard"));
@@ -175,21 +175,40 @@ TEST_F(Files, ATemporaryPathIsClearedOfWhatIsNotOurs) {
   std::filesystem::create_directory_symlink(at("outside"), at("tree/below/link"));
   ASSERT_EQ(mkfifo(at("fifo").c_str(), 0600), 0);
   std::ofstream(at("own")) << "kept";
-  for (const char* name : {"link", "hard", "tree", "fifo", "own", "absent"})
-    clear_temp_path(at(name).c_str());
-  for (const char* name : {"link", "hard", "tree", "fifo"}) {
+  for (const char* name : {"link", "hard", "tree", "fifo", "own", "absent"}) remove_path(at(name).c_str());
+  for (const char* name : {"link", "hard", "tree", "fifo", "own"}) {
     EXPECT_FALSE(std::filesystem::exists(std::filesystem::symlink_status(at(name)))) << name;
   }
   EXPECT_EQ(std::filesystem::file_size(at("victim")), 4U);
-  EXPECT_EQ(std::filesystem::file_size(at("own")), 4U);
   EXPECT_EQ(std::filesystem::file_size(at("outside/file")), 4U);
 }
 
-TEST_F(Files, ATemporaryFileOfAnotherUserIsCleared) {
-  std::ofstream(at("foreign")) << "x";
+TEST_F(Files, AClaimedFolderIsOurOwnAlone) {
+  ASSERT_TRUE(claim_folder(at("new").c_str()));
+  EXPECT_EQ(std::filesystem::status(at("new")).permissions(), std::filesystem::perms::owner_all);
+  std::ofstream(at("new/file")) << "kept";
+  std::filesystem::permissions(at("new"), std::filesystem::perms(0755));
+  ASSERT_TRUE(claim_folder(at("new").c_str()));
+  EXPECT_EQ(std::filesystem::status(at("new")).permissions(), std::filesystem::perms::owner_all);
+  EXPECT_TRUE(std::filesystem::exists(at("new/file")));
+  EXPECT_FALSE(claim_folder(at("absent/below").c_str()));
+}
+
+TEST_F(Files, WhatStandsInAClaimedFoldersPlaceIsReplaced) {
+  std::filesystem::create_directory(at("elsewhere"));
+  std::ofstream(at("elsewhere/file")) << "kept";
+  std::filesystem::create_directory_symlink(at("elsewhere"), at("link"));
+  std::ofstream(at("plain")) << "x";
+  for (const char* name : {"link", "plain"}) {
+    ASSERT_TRUE(claim_folder(at(name).c_str())) << name;
+    EXPECT_TRUE(std::filesystem::is_directory(std::filesystem::symlink_status(at(name)))) << name;
+  }
+  EXPECT_TRUE(std::filesystem::exists(at("elsewhere/file")));
+  std::filesystem::create_directory(at("foreign"));
+  std::ofstream(at("foreign/file")) << "x";
   if (chown(at("foreign").c_str(), 12345, 12345) != 0) GTEST_SKIP() << "needs root";
-  clear_temp_path(at("foreign").c_str());
-  EXPECT_FALSE(std::filesystem::exists(at("foreign")));
+  ASSERT_TRUE(claim_folder(at("foreign").c_str()));
+  EXPECT_FALSE(std::filesystem::exists(at("foreign/file")));
 }
 
 struct PingCase {

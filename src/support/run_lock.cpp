@@ -1,0 +1,62 @@
+#include "support/run_lock.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "support/files.h"
+#include "support/text.h"
+
+namespace remvol {
+
+namespace {
+
+int operation_of(LockMode mode) {
+  return mode == LockMode::kShared ? LOCK_SH : LOCK_EX;
+}
+
+// Locks, however often a signal comes in between.
+bool lock_file(int fd, int operation) {
+  while (flock(fd, operation) != 0) {
+    if (errno != EINTR) return false;
+  }
+  return true;
+}
+
+}  // namespace
+
+LockTry RunLock::open_and_lock(const char* name, int open_flags, int operation) {
+  release();
+  if ((open_flags & O_CREAT) != 0 && !claim_folder(kRunDir)) return LockTry::kNone;
+  const Text<256> path("%s/%s", kRunDir, name);
+  fd_ = open(path, O_RDWR | O_NOFOLLOW | O_CLOEXEC | open_flags, 0600);
+  if (fd_ < 0) return LockTry::kNone;
+  if (lock_file(fd_, operation)) return LockTry::kTaken;
+  const bool busy = errno == EWOULDBLOCK;
+  release();
+  return busy ? LockTry::kBusy : LockTry::kNone;
+}
+
+LockTry RunLock::take(const char* name, LockMode mode) {
+  return open_and_lock(name, O_CREAT, operation_of(mode));
+}
+
+LockTry RunLock::try_take(const char* name, LockMode mode) {
+  return open_and_lock(name, O_CREAT, operation_of(mode) | LOCK_NB);
+}
+
+LockTry RunLock::try_existing(const char* name, LockMode mode) {
+  return open_and_lock(name, 0, operation_of(mode) | LOCK_NB);
+}
+
+// Unlocked by name, not by closing alone: a child that was forked meanwhile shares the open file.
+void RunLock::release() {
+  if (fd_ < 0) return;
+  flock(fd_, LOCK_UN);
+  close(fd_);
+  fd_ = -1;
+}
+
+}  // namespace remvol

@@ -1,0 +1,49 @@
+// Locks between runs of the tool: flock(2) on files in a folder that only root may enter, so that no stranger
+// can hold one. The kernel lets go of a lock when its run ends, however it ends.
+//
+// They come on top of the record locks and the semaphore of support/locks.h. Where the folder cannot be had
+// (a run without root's rights, a /run that cannot be written) nothing is locked and the work goes on.
+#ifndef REMVOL_SUPPORT_RUN_LOCK_H
+#define REMVOL_SUPPORT_RUN_LOCK_H
+
+namespace remvol {
+
+inline constexpr char kRunDir[] = "/run/remvol";
+
+enum class LockMode { kShared, kExclusive };
+
+enum class LockTry {
+  kTaken,
+  kBusy,  // another run holds it
+  kNone,  // there is no such lock, and none could be made
+};
+
+class RunLock {
+ public:
+  RunLock() = default;
+  RunLock(const RunLock&) = delete;
+  RunLock& operator=(const RunLock&) = delete;
+  ~RunLock() { release(); }
+
+  // Takes the lock called `name` (a file name), waiting for as long as others hold it. One that is held
+  // already is let go before. Returns kTaken or kNone.
+  LockTry take(const char* name, LockMode mode);
+
+  // The same without waiting.
+  [[nodiscard]] LockTry try_take(const char* name, LockMode mode);
+
+  // The same for a lock that some run has taken before: without one, kNone, and none is made.
+  [[nodiscard]] LockTry try_existing(const char* name, LockMode mode);
+
+  void release();
+  bool is_held() const { return fd_ >= 0; }
+
+ private:
+  LockTry open_and_lock(const char* name, int open_flags, int operation);
+
+  int fd_ = -1;
+};
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,66 @@
+// Bringing a target up, one run after another.
+//
+// Every run that logs a target in, makes its node record, or formats or mounts one of its LUNs holds the
+// target meanwhile. A run that takes something away holds it when that can be had soon, and goes on without
+// when it cannot: it may end a format. A run that was killed holds nothing, and what it left half done can be
+// told by that.
+#ifndef REMVOL_SUPPORT_TARGET_HOLD_H
+#define REMVOL_SUPPORT_TARGET_HOLD_H
+
+#include "support/run_lock.h"
+
+namespace remvol {
+
+class TargetHold {
+ public:
+  // For the whole target. Waits for every run that brings it, or a LUN of it, up. A target that this run
+  // holds already is held on.
+  explicit TargetHold(const char* target_name);
+
+  // For one LUN of the target. Runs that bring other LUNs of it up go on meanwhile.
+  TargetHold(const char* target_name, int lun);
+
+  TargetHold(const TargetHold&) = delete;
+  TargetHold& operator=(const TargetHold&) = delete;
+  ~TargetHold();
+
+  // Whether another run held it: what was read before may have changed.
+  bool waited() const { return waited_; }
+
+ private:
+  bool enter(const char* target_name);
+
+  RunLock target_;
+  RunLock lun_;
+  bool outermost_ = false;
+  bool waited_ = false;
+};
+
+// Holds the whole target for a run that takes something away, unless that needs a long wait.
+class BriefTargetHold {
+ public:
+  // Waits for as long as `may_wait` says of the target's slot, asked again and again, and never longer than a
+  // minute.
+  BriefTargetHold(const char* target_name, bool (*may_wait)(int dbidx), int dbidx);
+
+ private:
+  RunLock target_;
+};
+
+// Holds the whole target, or one LUN of it (0 or more), when a run has held it before and none does now.
+class IdleTarget {
+ public:
+  explicit IdleTarget(const char* target_name);
+  IdleTarget(const char* target_name, int lun);
+
+  explicit operator bool() const { return idle_; }
+
+ private:
+  RunLock target_;
+  RunLock lun_;
+  bool idle_;
+};
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,39 @@
+#include "tasks/repair.h"
+
+#include "support/target_hold.h"
+#include "support/text.h"
+#include "tree/entry.h"
+#include "tree/state.h"
+#include "volume/process_check.h"
+
+namespace remvol {
+
+namespace {
+
+bool is_format_under_way(int state) {
+  return state == kFormatting || state == kFormatWaiting;
+}
+
+}  // namespace
+
+void repair_target_state(const TargetEntry* target) {
+  int state = kDisconnected;
+  ktree_get_connect_state(target->db_idx, &state);
+  if (state != kConnecting || !IdleTarget(target->target_name)) return;
+  ktree_set_connect_state(target->db_idx, kDisconnected);
+}
+
+void repair_lun_state(const TargetEntry* lun) {
+  int format_state = kFormatIdle;
+  int volume_state = kVolumeNormal;
+  ktree_get_lun_format_state(lun->db_idx, lun->lun_db_idx, &format_state);
+  ktree_get_lun_volume_state(lun->db_idx, lun->lun_db_idx, &volume_state);
+  if (!is_format_under_way(format_state) && volume_state != kVolumeCreating) return;
+  const IdleTarget idle(lun->target_name, lun->lun);
+  if (!idle) return;
+  if (lun->dev[0] != '\0' && has_process("mke2fs", Text<32>("/dev/%s", lun->dev))) return;
+  if (is_format_under_way(format_state)) ktree_update_formatting_state(lun, kFormatIdle);
+  if (volume_state == kVolumeCreating) ktree_update_volume_state(lun, kVolumeNormal);
+}
+
+}  // namespace remvol

@@ -1,0 +1,18 @@
+// Putting right what a killed run has left in the tree: states of work that nobody does.
+#ifndef REMVOL_TASKS_REPAIR_H
+#define REMVOL_TASKS_REPAIR_H
+
+#include "tree/record.h"
+
+namespace remvol {
+
+// Ends a "connecting" that no run stands behind: one has held the target, and none does now.
+void repair_target_state(const TargetEntry* target);
+
+// The same for the formatting, the waiting for it and the creating of the LUN in `lun`; a mke2fs that
+// outlived its run is work too.
+void repair_lun_state(const TargetEntry* lun);
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,17 @@
+// Slots that a killed run has left half made. Adding is one step for other runs, so a slot that is seen half
+// made belongs to nobody.
+#ifndef REMVOL_TREE_HALF_MADE_H
+#define REMVOL_TREE_HALF_MADE_H
+
+namespace remvol {
+
+// Deletes the LUN slots of stored targets that have a number, but no share.
+void drop_half_made_luns();
+
+// The same, and the target slots that have a name, but neither an address nor a LUN. Returns whether a target
+// slot was deleted: the count of targets is another one then.
+bool drop_half_made_slots();
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,60 @@
+// What the slot numbers of this run stand for.
+//
+// Deleting a slot moves the later ones down, so a number that a run has read may stand for another target or
+// LUN a moment later. Each run therefore remembers which target and LUN it found in a slot, and whoever reads
+// or writes by a number asks where they are now: a HeldSlot finds them again, or says that they are stored no
+// more, and keeps every slot in its place while it lives. So a number stands for what it stood for when this
+// run last read it.
+#ifndef REMVOL_TREE_SLOTS_H
+#define REMVOL_TREE_SLOTS_H
+
+#include "frontend/log.h"
+
+namespace remvol {
+
+// Keeps the slots as they are while it lives. Runs that use them share this; one that adds or deletes slots
+// has it alone. It may be taken again inside of itself, but not changed from using to changing. Held for some
+// reads and writes of the tree, never while a command runs.
+class SlotsHeld {
+ public:
+  enum Purpose { kUse, kChange };
+
+  explicit SlotsHeld(Purpose purpose = kUse);
+  SlotsHeld(const SlotsHeld&) = delete;
+  SlotsHeld& operator=(const SlotsHeld&) = delete;
+  ~SlotsHeld();
+};
+
+// A slot of a target, or of one of its LUNs, by the number that this run knows it by.
+class HeldSlot {
+ public:
+  // `m` 0: the target's slot alone. A slot that is stored no more is logged at level 1 in the caller's name.
+  explicit HeldSlot(int n, int m = 0, Caller caller = Caller());
+
+  // False when what the slot stood for is stored no more. A number that this run has read nothing from, and
+  // one in a tree that does not answer, is taken as it is.
+  explicit operator bool() const { return found_; }
+  int target() const { return target_; }  // where the target is now
+  int lun() const { return lun_; }        // where the LUN is now
+
+ private:
+  SlotsHeld held_;
+  bool found_;
+  int target_;
+  int lun_;
+};
+
+// Remember what a slot holds, as this run has just read or written it.
+void remember_target(int n, const char* target_name);
+void remember_lun(int n, int m, int lun);
+
+// Remembers the target of each of the eight slots, for a walk over all of them.
+void remember_all_targets();
+
+// Returns the LUN slot to visit after slot `m` of the target at `n`: the one behind the LUN that was read
+// there, or, when that has been deleted meanwhile, the one that has taken its place.
+int lun_slot_after(int n, int m);
+
+}  // namespace remvol
+
+#endif

@@ -1,0 +1,283 @@
+// Locks between runs: the lock files, holding a target, and temporary files for one run at a time.
+#include <poll.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+
+#include "support/run_lock.h"
+#include "support/target_hold.h"
+#include "support/temp_file.h"
+#include "tree/slots.h"
+#include "volume_fixture.h"
+
+using namespace remvol;
+
+namespace {
+
+class RunLocks : public VolumeTest {
+ protected:
+  RunLocks() { cover("/run"); }
+  ~RunLocks() override {
+    if (run_ > 0) end_run();
+    uncover("/run");
+  }
+
+  // Starts another run that does `hold` and waits until it has.
+  void start_run(const std::function<void()>& hold) {
+    int ready[2];
+    ASSERT_EQ(pipe(ready), 0);
+    run_ = fork();
+    if (run_ == 0) {
+      const std::function<void()> wait = [&] {
+        (void)!write(ready[1], "x", 1);
+        for (;;) pause();
+      };
+      held_then_ = &wait;
+      hold();
+      _exit(0);
+    }
+    char byte = 0;
+    ASSERT_EQ(read(ready[0], &byte, 1), 1);
+    close(ready[0]);
+    close(ready[1]);
+  }
+
+  // What the other run does while it holds what it holds: it waits to be killed.
+  static void stay() { (*held_then_)(); }
+
+  void end_run() {
+    kill(run_, SIGKILL);
+    waitpid(run_, nullptr, 0);
+    run_ = 0;
+  }
+
+ private:
+  static inline const std::function<void()>* held_then_ = nullptr;
+  pid_t run_ = 0;
+};
+
+TEST_F(RunLocks, ALockIsHadByOneRunAtATime) {
+  start_run([] {
+    RunLock lock;
+    lock.take("a.lock", LockMode::kExclusive);
+    stay();
+  });
+  RunLock lock;
+  EXPECT_EQ(lock.try_take("a.lock", LockMode::kExclusive), LockTry::kBusy);
+  EXPECT_EQ(lock.try_take("a.lock", LockMode::kShared), LockTry::kBusy);
+  EXPECT_EQ(lock.try_take("b.lock", LockMode::kExclusive), LockTry::kTaken);
+  end_run();
+  EXPECT_EQ(lock.try_take("a.lock", LockMode::kExclusive), LockTry::kTaken);
+}
+
+TEST_F(RunLocks, TheFolderAndItsFilesAreRootsAlone) {
+  RunLock lock;
+  lock.take("a.lock", LockMode::kExclusive);
+  struct stat found;
+  ASSERT_EQ(stat("/run/remvol", &found), 0);
+  EXPECT_EQ(found.st_mode & 07777, 0700U);
+  ASSERT_EQ(stat("/run/remvol/a.lock", &found), 0);
+  EXPECT_EQ(found.st_mode & 07777, 0600U);
+}
+
+TEST_F(RunLocks, ALinkInTheLocksPlaceIsNotFollowed) {
+  std::filesystem::create_directory("/run/remvol");
+  std::filesystem::create_symlink("/run/victim", "/run/remvol/a.lock");
+  RunLock lock;
+  EXPECT_EQ(lock.take("a.lock", LockMode::kExclusive), LockTry::kNone);
+  EXPECT_FALSE(std::filesystem::exists("/run/victim"));
+}
+
+TEST_F(RunLocks, AProgramThatIsStartedDoesNotKeepTheLock) {
+  start_run([] {
+    RunLock lock;
+    lock.take("a.lock", LockMode::kExclusive);
+    const pid_t daemon = fork();
+    if (daemon == 0) execl("/bin/sleep", "sleep", "2", nullptr);
+    poll(nullptr, 0, 200);
+    stay();
+  });
+  end_run();
+  RunLock lock;
+  EXPECT_EQ(lock.try_take("a.lock", LockMode::kExclusive), LockTry::kTaken);
+}
+
+TEST_F(RunLocks, ATargetThatIsBroughtUpIsNotIdle) {
+  EXPECT_FALSE(IdleTarget("iqn.t1"));  // no run has ever held it
+  start_run([] {
+    const TargetHold hold("iqn.t1");
+    stay();
+  });
+  EXPECT_FALSE(IdleTarget("iqn.t1"));
+  EXPECT_FALSE(IdleTarget("iqn.t1", 1));
+  EXPECT_FALSE(IdleTarget("iqn.t2"));
+  end_run();
+  EXPECT_TRUE(IdleTarget("iqn.t1"));
+  EXPECT_TRUE(IdleTarget("iqn.t1", 1));
+}
+
+TEST_F(RunLocks, LunsOfOneTargetAreBroughtUpSideBySide) {
+  start_run([] {
+    const TargetHold hold("iqn.t1", 1);
+    stay();
+  });
+  const TargetHold other("iqn.t1", 2);
+  EXPECT_FALSE(other.waited());
+  EXPECT_FALSE(IdleTarget("iqn.t1"));
+  EXPECT_FALSE(IdleTarget("iqn.t1", 1));
+}
+
+TEST_F(RunLocks, AnIdleLunBesideABusyOne) {
+  start_run([] {
+    const TargetHold hold("iqn.t1", 1);
+    stay();
+  });
+  EXPECT_TRUE(IdleTarget("iqn.t1", 2));
+}
+
+TEST_F(RunLocks, AWaitingRunGoesOnWhenTheHolderIsKilled) {
+  start_run([] {
+    const TargetHold hold("iqn.t1");
+    stay();
+  });
+  const pid_t waiter = fork();
+  if (waiter == 0) {
+    const TargetHold hold("iqn.t1");
+    _exit(hold.waited() ? 0 : 1);
+  }
+  poll(nullptr, 0, 100);
+  int status = -1;
+  EXPECT_EQ(waitpid(waiter, &status, WNOHANG), 0);
+  end_run();
+  waitpid(waiter, &status, 0);
+  EXPECT_EQ(status, 0);
+}
+
+TEST_F(RunLocks, AHeldTargetIsHeldOn) {
+  const TargetHold outer("iqn.t1");
+  {
+    const TargetHold inner("iqn.t1");
+    EXPECT_FALSE(inner.waited());
+  }
+  const pid_t other = fork();
+  if (other == 0) {
+    RunLock lock;
+    _exit(IdleTarget("iqn.t1") ? 1 : 0);
+  }
+  int status = 0;
+  waitpid(other, &status, 0);
+  EXPECT_EQ(status, 0);
+}
+
+int asked = 0;
+
+TEST_F(RunLocks, ARunThatTakesAwayWaitsOnlyForAsLongAsItMay) {
+  start_run([] {
+    const TargetHold hold("iqn.t1");
+    stay();
+  });
+  asked = 0;
+  const BriefTargetHold hold(
+      "iqn.t1", [](int dbidx) { return dbidx == 4 && ++asked < 3; }, 4);
+  EXPECT_EQ(asked, 3);
+  EXPECT_EQ(fakes::calls(), (Texts{"usleep 100000", "usleep 100000"}));
+}
+
+TEST_F(RunLocks, ARunThatTakesAwayWaitsAMinuteAtMost) {
+  start_run([] {
+    const TargetHold hold("iqn.t1");
+    stay();
+  });
+  const BriefTargetHold hold(
+      "iqn.t1", [](int) { return true; }, 1);
+  EXPECT_EQ(fakes::calls().size(), 600U);
+}
+
+TEST_F(RunLocks, ARunThatTakesAwayKeepsOthersFromBringingUp) {
+  const BriefTargetHold hold(
+      "iqn.t1", [](int) { return true; }, 1);
+  const pid_t other = fork();
+  if (other == 0) {
+    RunLock lock;
+    _exit(IdleTarget("iqn.t1") ? 1 : 0);
+  }
+  int status = 0;
+  waitpid(other, &status, 0);
+  EXPECT_EQ(status, 0);
+}
+
+// Whether another run could use, or change, the slots now.
+bool another_run_can(SlotsHeld::Purpose purpose) {
+  const pid_t other = fork();
+  if (other == 0) {
+    RunLock lock;
+    const LockMode mode = purpose == SlotsHeld::kUse ? LockMode::kShared : LockMode::kExclusive;
+    _exit(lock.try_take("slots.lock", mode) == LockTry::kTaken ? 0 : 1);
+  }
+  int status = 0;
+  waitpid(other, &status, 0);
+  return status == 0;
+}
+
+TEST_F(RunLocks, RunsShareTheirUseOfTheSlotsAndOneAloneChangesThem) {
+  {
+    const SlotsHeld held;
+    EXPECT_TRUE(another_run_can(SlotsHeld::kUse));
+    EXPECT_FALSE(another_run_can(SlotsHeld::kChange));
+  }
+  {
+    const SlotsHeld held(SlotsHeld::kChange);
+    { const SlotsHeld inner; }
+    EXPECT_FALSE(another_run_can(SlotsHeld::kUse));
+  }
+  EXPECT_TRUE(another_run_can(SlotsHeld::kChange));
+}
+
+class TempFiles : public RunLocks {
+ protected:
+  TempFiles() { cover("/tmp"); }
+  ~TempFiles() override { uncover("/tmp"); }
+};
+
+TEST_F(TempFiles, WhatIsPlantedAtTheNameIsNotWrittenThrough) {
+  std::ofstream("/tmp/victim") << "kept";
+  std::filesystem::create_symlink("/tmp/victim", "/tmp/x.tmp");
+  const TempFile file("/tmp/x.tmp");
+  EXPECT_STREQ(file.path(), "/tmp/x.tmp");
+  struct stat found;
+  ASSERT_EQ(lstat("/tmp/x.tmp", &found), 0);
+  EXPECT_TRUE(S_ISREG(found.st_mode));
+  EXPECT_EQ(found.st_mode & 07777, 0600U);
+  std::ofstream("/tmp/x.tmp") << "listing";
+  EXPECT_EQ(std::filesystem::file_size("/tmp/victim"), 4U);
+}
+
+TEST_F(TempFiles, AnOldListingIsNotReadAgain) {
+  std::ofstream("/tmp/x.tmp") << "old";
+  const TempFile file("/tmp/x.tmp");
+  EXPECT_EQ(std::filesystem::file_size("/tmp/x.tmp"), 0U);
+}
+
+TEST_F(TempFiles, AnotherRunGetsAFileOfItsOwn) {
+  start_run([] {
+    const TempFile file("/tmp/x.tmp");
+    std::ofstream("/tmp/x.tmp") << "theirs";
+    stay();
+  });
+  std::string path;
+  {
+    const TempFile file("/tmp/x.tmp");
+    path = file.path();
+    EXPECT_EQ(path, "/tmp/x.tmp." + std::to_string(getpid()));
+    std::ofstream(path) << "ours";
+  }
+  EXPECT_FALSE(std::filesystem::exists(path));
+  EXPECT_EQ(std::filesystem::file_size("/tmp/x.tmp"), 6U);
+}
+
+}  // namespace

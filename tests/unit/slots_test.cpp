@@ -1,0 +1,151 @@
+// What slot numbers stand for while other runs add and delete slots.
+#include "tree/slots.h"
+
+#include <string>
+
+#include "fakes.h"
+#include "tree/entry.h"
+#include "tree/half_made.h"
+#include "tree/state.h"
+
+namespace {
+
+using namespace remvol;
+
+std::string key(int n, const std::string& name) {
+  return "/iscsi/initiator/id:" + std::to_string(n) + "/" + name;
+}
+
+std::string lun_key(int n, int m, const std::string& name) {
+  return key(n, "lun/id:" + std::to_string(m) + "/" + name);
+}
+
+// Three targets, each with LUN 10, 20 and 30.
+class Slots : public fakes::Test {
+ protected:
+  Slots() {
+    fakes::tree_set({{"/iscsi/initiator/ver", "1"}, {"/iscsi/initiator/count", "3"}});
+    for (int n = 1; n <= 3; n++) {
+      fakes::tree_set({{key(n, "target"), "iqn.t" + std::to_string(n)}, {key(n, "ip"), "10.0.0.1"}});
+      for (int m = 1; m <= 3; m++) {
+        fakes::tree_set({{lun_key(n, m, "lun"), std::to_string(10 * m)},
+                         {lun_key(n, m, "share"), "s" + std::to_string(n) + std::to_string(m)}});
+      }
+    }
+  }
+
+  // What another run does.
+  static void delete_target(int n) { fakes::tree_delete("/iscsi/initiator/id:" + std::to_string(n)); }
+  static void delete_lun(int n, int m) { fakes::tree_delete(key(n, "lun/id:" + std::to_string(m))); }
+};
+
+TEST_F(Slots, AStateIsWrittenToItsTargetWhereverThatIs) {
+  ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t2"), 2);
+  delete_target(1);
+  EXPECT_EQ(ktree_set_connect_state(2, kConnecting), 0);
+  EXPECT_EQ(fakes::tree_get(key(1, "conn_state")), "2");
+  EXPECT_EQ(fakes::tree_get(key(2, "conn_state")), std::nullopt);
+}
+
+TEST_F(Slots, AStateIsWrittenToItsLunWhereverThatIs) {
+  TargetEntry lun;
+  ASSERT_EQ(ktree_get_lun_entry_by_dbidx(&lun, 3, 2), 0);
+  delete_target(2);
+  delete_lun(2, 1);
+  EXPECT_EQ(ktree_update_volume_state(&lun, kVolumeFailed), 0);
+  EXPECT_EQ(fakes::tree_get(lun_key(2, 1, "volume_state")), "3");
+  EXPECT_EQ(fakes::tree_get(lun_key(2, 2, "volume_state")), std::nullopt);
+}
+
+TEST_F(Slots, NothingIsWrittenForATargetThatWasDeleted) {
+  TargetEntry lun;
+  ASSERT_EQ(ktree_get_lun_entry_by_dbidx(&lun, 3, 1), 0);
+  delete_target(3);
+  const auto before = fakes::tree_dump();
+  EXPECT_EQ(ktree_set_connect_state(3, kConnected), -103);
+  EXPECT_EQ(ktree_update_volume_state(&lun, kVolumeNormal), -103);
+  EXPECT_EQ(ktree_update_formatting_state(&lun, kFormatting), -103);
+  EXPECT_EQ(ktree_update_format_progress(3, 1, 50), -103);
+  EXPECT_EQ(ktree_update_lun_vol_access_right(VOL_AC_RO, 3, 1), -103);
+  EXPECT_EQ(ktree_record_connect_set(&lun), -103);
+  EXPECT_EQ(ktree_update_current_luncnt(3), -103);
+  ktree_update_mount_info(&lun, "/dev/sdb1", "/mnt/VV/s31", "ext4");
+  EXPECT_EQ(fakes::tree_dump(), before);
+}
+
+TEST_F(Slots, NothingIsWrittenForALunThatWasDeleted) {
+  TargetEntry lun;
+  ASSERT_EQ(ktree_get_lun_entry_by_dbidx(&lun, 1, 2), 0);
+  delete_lun(1, 2);
+  EXPECT_EQ(ktree_update_volume_state(&lun, kVolumeNormal), -103);
+  EXPECT_EQ(fakes::tree_get(lun_key(1, 2, "volume_state")), std::nullopt);
+}
+
+TEST_F(Slots, ATreeThatDoesNotAnswerLeavesTheNumbersAsTheyAre) {
+  ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t2"), 2);
+  fakes::on("ktreec_get_wb").returns(-1);
+  EXPECT_EQ(ktree_set_connect_state(2, kConnecting), 0);
+  EXPECT_EQ(fakes::tree_get(key(2, "conn_state")), "2");
+}
+
+TEST_F(Slots, ANumberThatNothingWasReadFromIsTakenAsItIs) {
+  EXPECT_EQ(ktree_set_connect_state(7, kConnecting), 0);
+  EXPECT_EQ(fakes::tree_get(key(7, "conn_state")), "2");
+}
+
+TEST_F(Slots, AnEntryIsReadFromItsTargetWhereverThatIs) {
+  TargetEntry entry;
+  ASSERT_EQ(ktree_get_entry_by_targetname("iqn.t3", &entry), 0);
+  delete_target(1);
+  TargetEntry lun;
+  ASSERT_EQ(ktree_get_lun_entry_by_dbidx(&lun, entry.db_idx, 2), 0);
+  EXPECT_STREQ(lun.target_name, "iqn.t3");
+  EXPECT_STREQ(lun.share, "s32");
+  delete_target(2);
+  EXPECT_EQ(ktree_get_lun_entry_by_dbidx(&lun, entry.db_idx, 2), -1);
+}
+
+TEST_F(Slots, AWalkOverTheTargetsMeetsEveryOneOnce) {
+  remember_all_targets();
+  std::string met;
+  for (int n = 1; n <= 3; n++) {
+    TargetEntry entry;
+    if (ktree_get_entry_by_dbidx(n, &entry) == 0) met += std::string(entry.target_name) + " ";
+    if (n == 1) delete_target(1);
+  }
+  EXPECT_EQ(met, "iqn.t1 iqn.t2 iqn.t3 ");
+}
+
+TEST_F(Slots, AWalkOverTheLunsMeetsEveryOneOnce) {
+  for (const int deleted : {1, 2, 3}) {
+    fakes::tree_set({{key(1, "target"), "iqn.t1"}});
+    std::string met;
+    for (int m = 1; m <= 8; m = lun_slot_after(1, m)) {
+      TargetEntry lun;
+      if (ktree_get_lun_entry_by_dbidx(&lun, 1, m) != 0) break;
+      met += std::to_string(lun.lun) + " ";
+      if (lun.lun == 20) delete_lun(1, deleted);
+    }
+    EXPECT_EQ(met, deleted == 3 ? "10 20 " : "10 20 30 ") << deleted;
+    delete_target(1);
+    for (int m = 1; m <= 3; m++) fakes::tree_set({{lun_key(1, m, "lun"), std::to_string(10 * m)}});
+  }
+}
+
+TEST_F(Slots, HalfMadeSlotsAreDropped) {
+  fakes::tree_set({{lun_key(1, 2, "share"), ""}, {key(4, "target"), "iqn.t4"}});
+  EXPECT_TRUE(drop_half_made_slots());
+  EXPECT_EQ(fakes::tree_get(lun_key(1, 2, "lun")), "30");
+  EXPECT_EQ(fakes::tree_get(key(4, "target")), std::nullopt);
+  EXPECT_FALSE(drop_half_made_slots());
+  EXPECT_EQ(fakes::tree_get(key(3, "target")), "iqn.t3");
+}
+
+TEST_F(Slots, AddingDropsHalfMadeLunsAndNoTarget) {
+  fakes::tree_set({{lun_key(2, 1, "share"), ""}, {key(4, "target"), "iqn.t4"}});
+  drop_half_made_luns();
+  EXPECT_EQ(fakes::tree_get(lun_key(2, 1, "lun")), "20");
+  EXPECT_EQ(fakes::tree_get(key(4, "target")), "iqn.t4");
+}
+
+}  // namespace
