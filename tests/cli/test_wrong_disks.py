@@ -190,6 +190,7 @@ class TestOtherRuns:
         while_waiting(lun.box, f"{self.make(lun)}; mkdir /mnt/other; mount {lun.disk.part} /mnt/other")
         assert lun.mount(force=1).result == -3
         assert not formatted(lun.box)
+        assert not ran(lun.box, "fuser")
         assert self.label(lun) == "theirs"
 
     def test_nor_one_that_is_in_use_unseen(self, lun):
