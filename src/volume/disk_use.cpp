@@ -4,7 +4,6 @@
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -15,6 +14,7 @@
 #include "support/files.h"
 #include "support/text.h"
 #include "volume/device.h"
+#include "volume/mount_table.h"
 
 namespace remvol {
 
@@ -24,7 +24,6 @@ constexpr size_t kMarkedSize = 4096;
 constexpr useconds_t kLookPause = 100000;  // microseconds
 constexpr int kClaimLooks = 10;            // a second
 constexpr int kUdevLooks = 50;             // 5 seconds
-constexpr char kMountInfo[] = "/proc/self/mountinfo";
 constexpr char kUdev[] = "/run/udev";
 constexpr char kUdevQueue[] = "/run/udev/queue";  // there while events are pending; see udevadm(8), settle
 
@@ -78,19 +77,8 @@ ContentMark content_mark(const char* node) {
 
 bool is_node_mounted(const char* node) {
   struct stat status;
-  if (!is_block_device(node, &status)) return false;
-  const File table(fopen(kMountInfo, "re"));
-  if (!table) return false;
-  char line[8192];
-  while (fgets(line, sizeof line, table.get()) != nullptr) {
-    unsigned major_number = 0;
-    unsigned minor_number = 0;
-    if (sscanf(line, "%*d %*d %u:%u ", &major_number, &minor_number) == 2 &&
-        makedev(major_number, minor_number) == status.st_rdev) {
-      return true;
-    }
-  }
-  return false;
+  MountLine mount;
+  return is_block_device(node, &status) && find_mount_of(status.st_rdev, nullptr, &mount) == Mounted::yes;
 }
 
 bool is_node_claimed(const char* node) {

@@ -257,9 +257,12 @@ int keep_standing(const Volume* volume, Caller caller = Caller()) {
 // Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.
 int bring_up(Volume* volume, Caller caller = Caller()) {
   int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format, caller);
-  if (result == kOk && find_partition(volume, is_standing)) return keep_standing(volume, caller);
+  if (result == kOk && !volume->asked && find_partition(volume, is_standing)) {
+    return keep_standing(volume, caller);
+  }
   if (result == kOk) result = pick_partition(volume);
   if (result == kOk) result = prepare_file_system(volume, caller);
+  if (result == kOk && is_standing(volume)) return keep_standing(volume, caller);  // another run was quicker
   if (result == kOk) result = make_mount_point(volume, caller);
   if (result == kOk) result = mount_file_system(volume, caller);
   if (result == kOk) result = record_outcome(volume, caller);

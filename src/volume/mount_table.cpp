@@ -101,7 +101,9 @@ Mounted find_mount_below(const char* path, MountLine* mount) {
 
 Mounted find_mount_of(dev_t device, const char* path, MountLine* mount) {
   return find(
-      [device, path](const MountLine& line) { return line.device == device && strcmp(line.path, path) == 0; },
+      [device, path](const MountLine& line) {
+        return line.device == device && (path == nullptr || strcmp(line.path, path) == 0);
+      },
       mount);
 }
 

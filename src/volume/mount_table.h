@@ -23,7 +23,8 @@ enum class Mounted { no, yes, unknown };  // unknown: the table cannot be read
 // `mount`.
 Mounted find_mount_below(const char* path, MountLine* mount);
 
-// Looks for a mount of the file system on `device` at `path`, which is absolute and without links.
+// Looks for a mount of the file system on `device` at `path`, which is absolute and without links; anywhere
+// when it is null.
 Mounted find_mount_of(dev_t device, const char* path, MountLine* mount);
 
 }  // namespace remvol

@@ -176,7 +176,7 @@ class TestOtherRuns:
         assert done.result == 0
         assert f"{lun.disk.part} is mounted by now, it is not formatted" in messages(done)
         assert not formatted(lun.box)
-        assert not ran(lun.box, "fuser")
+        assert not ran(lun.box, "fuser", "mount -t")
         assert lun.read_file("file") == b"data\n"
         assert [lun.key(key) for key in ("format_state", "volume_state")] == ["0", "0"]
 
@@ -192,6 +192,14 @@ class TestOtherRuns:
         assert not formatted(lun.box)
         assert not ran(lun.box, "fuser")
         assert self.label(lun) == "theirs"
+
+    def test_nor_one_that_was_never_unmounted(self, lun):
+        assert lun.mount().result == 0
+        lun.write_file("file", b"data")
+        lun.box.forget()
+        assert lun.mount(force=1).result == -3
+        assert not formatted(lun.box)
+        assert lun.read_file("file") == b"data"
 
     def test_nor_one_that_is_in_use_unseen(self, lun):
         lun.box.fake("fuser")
