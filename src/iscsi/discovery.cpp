@@ -1,12 +1,11 @@
 #include "iscsi/discovery.h"
 
-#include <algorithm>
 #include <cstdio>
 #include <cstring>
-#include <vector>
 
 #include "frontend/log.h"
 #include "frontend/request.h"
+#include "iscsi/discovered_names.h"
 #include "iscsi/iface.h"
 #include "iscsi/iscsiadm.h"
 #include "iscsi/result_daemon.h"
@@ -25,14 +24,6 @@ namespace remvol {
 
 namespace {
 
-// One discovered name. They come from a remote machine: as many as it sends.
-struct DiscoveredName {
-  char text[kListingLineSize] = "";
-
-  bool operator<(const DiscoveredName& other) const { return strcmp(text, other.text) < 0; }
-};
-
-using DiscoveredNames = std::vector<DiscoveredName>;
 using PathText = Text<512>;
 
 // The name is also that of the listing which ktree_update_dev reads: each use writes it anew.
@@ -46,20 +37,22 @@ bool discover(const char* address, int port, const char* iface, const char* path
 }
 
 // Reads the names that lines of the requested address show, in ascending order. The same name stays as often
-// as it is offered.
-DiscoveredNames read_names(FILE* file, Caller caller) {
-  DiscoveredNames names;
-  DiscoveredName last;
+// as it is offered. Returns false when memory is too short for them.
+bool read_names(FILE* file, DiscoveredNames* names, Caller caller) {
+  DiscoveredName last = {};
   char line[kListingLineSize];
   for (int lines = 0; fgets(line, sizeof line, file) != nullptr;) {
     if (!is_discovery_line_of(line, request_target.ip)) continue;
     lines++;
-    if (read_discovered_name(line, last.text)) names.push_back(last);
+    if (read_discovered_name(line, last.text) && !names->add(last)) {
+      LOG_AT(caller, 0, "out of memory for the names that %s offers", request_target.ip);
+      return false;
+    }
     LOG_AT(caller, 3, "line %d: %s", lines, last.text);
   }
-  std::sort(names.begin(), names.end());
-  LOG_AT(caller, 0, "vector size: %ld", static_cast<long>(names.size()));
-  return names;
+  names->sort();
+  LOG_AT(caller, 0, "vector size: %ld", static_cast<long>(names->size()));
+  return true;
 }
 
 // Replaces the stored names. A failed write leaves its place empty.
@@ -85,7 +78,9 @@ int search_portal(const char* socket, Caller caller) {
   int result = discover(request.ip, request.port, request.iface, path, caller) ? 0 : 1;
   File file(fopen(path, "re"));
   if (file == nullptr) return 2;
-  publish_names(socket, read_names(file.get(), caller), caller);
+  DiscoveredNames names;
+  if (!read_names(file.get(), &names, caller)) return 1;
+  publish_names(socket, names, caller);
   file.reset();
   if (tree_write_to(socket, key::kSearchDone, "1") != kOk) {
     LOG_AT(caller, 0, "ktreec_set() failed");

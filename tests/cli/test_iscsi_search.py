@@ -432,3 +432,26 @@ def test_an_iface_that_cannot_be_chosen_dumps_the_default_tree(box, results):
     assert box.trace()[0] == daemon_road("search")[-1]
     load(box, "/tmp/out.xml")
     assert box.tree.dump() == {"/some/value": "1"}
+
+
+@pytest.mark.unsanitized
+def test_a_search_that_runs_out_of_memory_says_so_and_fails(box, results):
+    """Whichever allocation of the names it is; names are published whole or not at all."""
+    box.fake("iscsiadm", "-m discovery", stdout=lines(*(f"iqn.2026-01.org.example:t{i:03}" for i in range(40))))
+    counter = box.write("/fake/left", bytes(8))
+    preload = f"{box.tools}/libpreload.so {box.tools}/libscarce.so"
+    scarce = {"LD_PRELOAD": preload, "SCARCE_FILE": "/fake/left", "SCARCE_PROGRAM": "remvol"}
+    short = 0
+    for n in range(1, 1000):
+        counter.write_bytes(n.to_bytes(8, "little"))
+        done = box.remvol(*SEARCH, env=scarce)
+        assert done.status in (0, 255), done
+        if "out of memory for the names that 10.9.0.2 offers" in done.stdout:
+            short += 1
+            assert done.status == 255 and found(results) == {}
+        if int.from_bytes(counter.read_bytes(), "little") > 0:
+            break
+        if done.status == 0:
+            results.delete("/temp/vv_search")
+    assert short == 3 and done.status == 0
+    assert len(found(results)) == 41
