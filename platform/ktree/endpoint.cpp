@@ -15,8 +15,9 @@
 namespace ktree {
 namespace {
 
-constexpr int kLockTries = 50;  // 100 ms apart: a starting daemon holds the folder for much less than 5 s
+constexpr int kLockTries = 50;  // 100 ms apart: a starting daemon holds the lock for much less than 5 s
 constexpr long kLockPause = 100000000;
+constexpr int kNoLock = -2;  // what was there is removed
 
 std::string folder_of(const std::string& path) {
   size_t slash = path.rfind('/');
@@ -25,20 +26,6 @@ std::string folder_of(const std::string& path) {
 
 std::string name_of(const std::string& path) {
   return path.substr(path.rfind('/') + 1);
-}
-
-bool lock_folder(int folder) {
-  for (int i = 0; i < kLockTries; i++) {
-    if (flock(folder, LOCK_EX | LOCK_NB) == 0) {
-      return true;
-    }
-    if (errno != EWOULDBLOCK && errno != EINTR) {
-      return false;
-    }
-    timespec pause = {0, kLockPause};
-    nanosleep(&pause, nullptr);
-  }
-  return false;
 }
 
 bool socket_address(const std::string& path, sockaddr_un& address) {
@@ -84,26 +71,72 @@ Endpoint::~Endpoint() {
   }
 }
 
+// Opens the lock file for this user alone: a file that others can open they can lock for ever.
+int Endpoint::open_lock(const std::string& name) const {
+  const int fd = openat(folder_, name.c_str(), O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0600);
+  struct stat info = {};
+  if (fd >= 0 && fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && info.st_uid == geteuid() &&
+      (info.st_mode & 077) == 0) {
+    return fd;
+  }
+  if (fd >= 0) {
+    close(fd);
+  }
+  return unlinkat(folder_, name.c_str(), 0) == 0 ? kNoLock : -1;
+}
+
+// The holder removes the file when it is done, so the one that was waited for may be gone.
+bool Endpoint::take_lock(const std::string& name, int& lock) const {
+  for (int i = 0; i < kLockTries; i++) {
+    lock = open_lock(name);
+    if (lock == -1) {
+      return false;
+    }
+    struct stat mine = {};
+    struct stat there = {};
+    if (lock != kNoLock && flock(lock, LOCK_EX | LOCK_NB) == 0 && fstat(lock, &mine) == 0 &&
+        fstatat(folder_, name.c_str(), &there, AT_SYMLINK_NOFOLLOW) == 0 && mine.st_ino == there.st_ino) {
+      return true;
+    }
+    if (lock != kNoLock) {
+      close(lock);
+      timespec pause = {0, kLockPause};
+      nanosleep(&pause, nullptr);
+    }
+  }
+  errno = EWOULDBLOCK;
+  return false;
+}
+
 bool Endpoint::open(const std::string& socket_path, const std::string& name, std::string& error) {
   const std::string folder = folder_of(socket_path);
+  const std::string lock_name = name_of(socket_path) + ".lock";
+  int lock = -1;
   folder_ = ::open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
-  if (folder_ < 0 || !lock_folder(folder_)) {
+  if (folder_ < 0 || !take_lock(lock_name, lock)) {
     error = system_error(folder);
     return false;
   }
-  bool opened = make_free(socket_path, error);
-  if (opened) {
-    pid_.name = name_of(socket_path) + "_" + name + ".pid";
-    opened = write_pid();
-    if (!opened) {
-      error = system_error(folder + "/" + pid_.name);
-    } else if (!listen_on(socket_path)) {
-      opened = false;
-      error = system_error(socket_path);
-    }
-  }
-  flock(folder_, LOCK_UN);
+  const bool opened = open_locked(socket_path, name, error);
+  unlinkat(folder_, lock_name.c_str(), 0);
+  close(lock);
   return opened;
+}
+
+bool Endpoint::open_locked(const std::string& socket_path, const std::string& name, std::string& error) {
+  if (!make_free(socket_path, error)) {
+    return false;
+  }
+  pid_.name = name_of(socket_path) + "_" + name + ".pid";
+  if (!write_pid()) {
+    error = system_error(folder_of(socket_path) + "/" + pid_.name);
+    return false;
+  }
+  if (!listen_on(socket_path)) {
+    error = system_error(socket_path);
+    return false;
+  }
+  return true;
 }
 
 bool Endpoint::make_free(const std::string& socket_path, std::string& error) const {
@@ -154,7 +187,7 @@ bool Endpoint::write_pid() {
   const int length = snprintf(text, sizeof text, "%ld\n", static_cast<long>(getpid()));
   const std::string temporary = pid_.name + ".new";
   unlinkat(folder_, temporary.c_str(), 0);
-  pid_file_ = openat(folder_, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
+  pid_file_ = openat(folder_, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
   if (pid_file_ < 0) {
     return false;
   }

@@ -17,8 +17,8 @@ class Endpoint {
 
   // Makes the pid file SOCKET_NAME.pid and listens on `socket_path` (mode 0600). A socket file that a dead
   // daemon left is replaced; when a daemon answers on it, or it is no socket, nothing is touched. Two daemons
-  // that start at the same time keep out of each other's way by a lock on the folder. Returns false with a
-  // message in `error`.
+  // that start at the same time keep out of each other's way by the lock file SOCKET.lock. Returns false with
+  // a message in `error`.
   [[nodiscard]] bool open(const std::string& socket_path, const std::string& name, std::string& error);
 
   [[nodiscard]] int listener() const { return listener_; }
@@ -36,6 +36,9 @@ class Endpoint {
   [[nodiscard]] bool write_pid();
   [[nodiscard]] bool remember(OwnFile& file, const std::string& name) const;
   void remove(const OwnFile& file) const;
+  [[nodiscard]] int open_lock(const std::string& name) const;
+  [[nodiscard]] bool take_lock(const std::string& name, int& lock) const;
+  [[nodiscard]] bool open_locked(const std::string& socket_path, const std::string& name, std::string& error);
 
   int folder_ = -1;
   int listener_ = -1;

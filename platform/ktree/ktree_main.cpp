@@ -3,20 +3,26 @@
 #include <getopt.h>
 #include <sys/resource.h>
 #include <sys/signalfd.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <cstddef>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <new>
 #include <string>
+#include <vector>
 
 #include "ktree/endpoint.h"
 #include "ktree/server.h"
 #include "ktree/standard_descriptors.h"
+#include "ktree/start_settings.h"
 
 namespace {
 
@@ -25,17 +31,19 @@ constexpr size_t kMaxClients = 4096;
 constexpr size_t kOwnDescriptors = 16;
 
 constexpr char kUsage[] =
-    "Usage: ktree -n NAME -s SOCKET\n"
+    "Usage: ktree -n NAME -s SOCKET [-l FILE]...\n"
     "Holds a configuration tree and serves it on the unix socket SOCKET.\n"
     "\n"
     "  -n NAME        name of the tree; the process number goes into SOCKET_NAME.pid\n"
     "  -s SOCKET      path of the socket\n"
+    "  -l FILE        load the settings file first; of several, the first that can be loaded\n"
     "  -h, --help     print this text and exit\n"
     "  -V, --version  print the version and exit\n";
 
 struct Options {
   std::string name;
   std::string socket;
+  std::vector<std::string> settings;
 };
 
 // Returns -1 when the daemon is to run, otherwise the exit status.
@@ -43,13 +51,16 @@ int parse_options(int argc, char** argv, Options& options) {
   const option long_options[] = {
       {"help", no_argument, nullptr, 'h'}, {"version", no_argument, nullptr, 'V'}, {nullptr, 0, nullptr, 0}};
   int letter = 0;
-  while ((letter = getopt_long(argc, argv, "n:s:hV", long_options, nullptr)) != -1) {
+  while ((letter = getopt_long(argc, argv, "n:s:l:hV", long_options, nullptr)) != -1) {
     switch (letter) {
       case 'n':
         options.name = optarg;
         break;
       case 's':
         options.socket = optarg;
+        break;
+      case 'l':
+        options.settings.emplace_back(optarg);
         break;
       case 'h':
         fputs(kUsage, stdout);
@@ -106,20 +117,37 @@ int open_signals() {
   return signalfd(-1, &mask, SFD_CLOEXEC | SFD_NONBLOCK);
 }
 
-}  // namespace
-
-int main(int argc, char** argv) {
-  Options options;
-  const int status = parse_options(argc, argv, options);
-  if (status >= 0) {
-    return status;
+// Tells the service manager, where one waits for it, that the daemon answers; see sd_notify(3).
+void tell_ready() {
+  constexpr char kReady[] = "READY=1";
+  const char* path = getenv("NOTIFY_SOCKET");
+  sockaddr_un address = {};
+  if (path == nullptr || path[0] == '\0' || strlen(path) >= sizeof address.sun_path) {
+    return;
   }
+  address.sun_family = AF_UNIX;
+  strcpy(address.sun_path, path);
+  if (path[0] == '@') {
+    address.sun_path[0] = '\0';
+  }
+  const auto length = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + strlen(path));
+  const int fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+  sendto(fd, kReady, sizeof kReady - 1, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&address), length);
+  if (fd >= 0) {
+    close(fd);
+  }
+}
+
+int run_daemon(const Options& options) {
   // What the starting process left open is not the daemon's: a lock file would stay locked for as long as it
   // lives. Nor is the folder that it was started in: a volume would stay busy.
   ktree::fill_standard_descriptors();
   close_range(STDERR_FILENO + 1, ~0U, 0);
   limit_process();
   const int signals = open_signals();
+  // Before anybody can ask: an empty tree counts as fresh.
+  ktree::Service service;
+  ktree::load_first(options.settings, service);
   ktree::Endpoint endpoint;
   std::string error;
   if (signals < 0 || !endpoint.open(options.socket, options.name, error)) {
@@ -130,10 +158,24 @@ int main(int argc, char** argv) {
     fprintf(stderr, "ktree: /: %s\n", strerror(errno));
     return EXIT_FAILURE;
   }
-  auto server = std::make_unique<ktree::Server>(endpoint.listener(), signals, client_limit());
+  auto server = std::make_unique<ktree::Server>(endpoint.listener(), signals, client_limit(), service);
+  tell_ready();
   if (!server->run()) {
     fprintf(stderr, "ktree: %s\n", strerror(errno));
     return EXIT_FAILURE;
   }
   return EXIT_SUCCESS;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  try {
+    Options options;
+    const int status = parse_options(argc, argv, options);
+    return status >= 0 ? status : run_daemon(options);
+  } catch (const std::bad_alloc&) {
+    fputs("ktree: out of memory\n", stderr);
+    return EXIT_FAILURE;
+  }
 }

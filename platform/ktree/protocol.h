@@ -27,7 +27,7 @@ enum class Status : uint8_t {
   missing = 1,  // no such node, or no value in it
   refused = 2,  // a bad path or value, or the tree would get too large
   damaged = 3,  // a load: the document is damaged; a text of at most kMaxErrorBytes follows that says where
-  failed = 4,   // the memory file is of no use
+  failed = 4,   // the memory file is of no use, or memory is short
 };
 
 struct RequestHeader {

@@ -9,6 +9,7 @@
 #include <cstring>
 #include <ctime>
 #include <memory>
+#include <new>
 
 namespace ktree {
 namespace {
@@ -34,6 +35,11 @@ bool is_welcome(int fd) {
          (peer.uid == 0 || peer.uid == geteuid());
 }
 
+// Null when memory is short.
+std::unique_ptr<char[]> room_for(size_t size) {
+  return std::unique_ptr<char[]>(new (std::nothrow) char[size]);
+}
+
 bool has_input(int fd) {
   char byte = 0;
   return recv(fd, &byte, 1, MSG_PEEK | MSG_DONTWAIT) > 0;
@@ -41,8 +47,8 @@ bool has_input(int fd) {
 
 }  // namespace
 
-Server::Server(int listener, int signals, size_t max_clients)
-    : listener_(listener), signals_(signals), max_clients_(max_clients) {}
+Server::Server(int listener, int signals, size_t max_clients, Service& service)
+    : listener_(listener), signals_(signals), max_clients_(max_clients), service_(service) {}
 
 Server::~Server() {
   for (ConnectionList* list : {&idle_, &stuck_}) {
@@ -153,7 +159,11 @@ void Server::accept_clients() {
 }
 
 void Server::welcome(int fd) {
-  auto connection = std::make_unique<Connection>();
+  std::unique_ptr<Connection> connection(new (std::nothrow) Connection);
+  if (connection == nullptr) {
+    close(fd);
+    return;
+  }
   connection->fd = fd;
   if (!is_welcome(fd) || !watch(fd, connection.get(), kNextRequest, EPOLL_CTL_ADD)) {
     return;
@@ -238,22 +248,30 @@ bool Server::take_request(Connection& connection, std::string_view bytes) {
     drop(connection);
     return false;
   }
-  keep_part(connection, bytes, size == kMoreNeeded ? sizeof(RequestHeader) : size);
+  if (!keep_part(connection, bytes, size == kMoreNeeded ? sizeof(RequestHeader) : size)) {
+    drop(connection);
+    return false;
+  }
   return true;
 }
 
-// Keeps the part of a request that has come, with room for `size` bytes in all.
-void Server::keep_part(Connection& connection, std::string_view bytes, size_t size) {
+// Keeps the part of a request that has come, with room for `size` bytes in all. Returns false when memory is
+// short.
+bool Server::keep_part(Connection& connection, std::string_view bytes, size_t size) {
   if (connection.bytes == nullptr) {
     mark_stuck(connection);
   }
   if (connection.size < size) {
-    auto room = std::make_unique_for_overwrite<char[]>(size);
+    std::unique_ptr<char[]> room = room_for(size);
+    if (room == nullptr) {
+      return false;
+    }
     memcpy(room.get(), bytes.data(), bytes.size());
     connection.bytes = std::move(room);
     connection.used = bytes.size();
     connection.size = size;
   }
+  return true;
 }
 
 void Server::answer(Connection& connection, std::string_view bytes) {
@@ -296,7 +314,11 @@ void Server::send_reply(Connection& connection, std::string_view reply) {
 }
 
 void Server::keep_reply(Connection& connection, std::string_view rest) {
-  connection.bytes = std::make_unique_for_overwrite<char[]>(rest.size());
+  connection.bytes = room_for(rest.size());
+  if (connection.bytes == nullptr) {
+    drop(connection);
+    return;
+  }
   memcpy(connection.bytes.get(), rest.data(), rest.size());
   connection.used = 0;
   connection.size = rest.size();

@@ -21,9 +21,9 @@ constexpr int64_t kStuckMilliseconds = 30000;
 class Server {
  public:
   // Serves `listener` (a listening, non-blocking socket) until `signals` (a signalfd) has something to read.
-  // Both stay the caller's. At most `max_clients` are kept; when one more comes, or descriptors run out, the
-  // one that is stuck or idle for the longest goes.
-  Server(int listener, int signals, size_t max_clients);
+  // All of them, and what answers the requests, stay the caller's. At most `max_clients` are kept; when one
+  // more comes, or descriptors run out, the one that is stuck or idle for the longest goes.
+  Server(int listener, int signals, size_t max_clients, Service& service);
   Server(const Server&) = delete;
   Server& operator=(const Server&) = delete;
   ~Server();
@@ -46,7 +46,7 @@ class Server {
   void serve(Connection& connection, uint32_t events);
   [[nodiscard]] bool receive_part(Connection& connection);
   [[nodiscard]] bool take_request(Connection& connection, std::string_view bytes);
-  void keep_part(Connection& connection, std::string_view bytes, size_t size);
+  [[nodiscard]] bool keep_part(Connection& connection, std::string_view bytes, size_t size);
   void answer(Connection& connection, std::string_view bytes);
   void send_reply(Connection& connection, std::string_view reply);
   void keep_reply(Connection& connection, std::string_view rest);
@@ -68,7 +68,7 @@ class Server {
   size_t clients_ = 0;
   ConnectionList idle_;   // between requests, the one that is so for the longest first
   ConnectionList stuck_;  // in the middle of a request or a reply, likewise
-  Service service_;
+  Service& service_;
   std::array<char, kMaxRequestBytes> request_;
   std::array<char, kMaxReplyBytes> reply_;
 };

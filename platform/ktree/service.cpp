@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <new>
 
 #include "ktree/listing.h"
 #include "ktree/settings_reader.h"
@@ -22,7 +23,16 @@ bool is_memory_file(int fd) {
 
 }  // namespace
 
+// A client that asks for more than the machine has must not cost the others their tree.
 Service::Answer Service::handle(const Request& request) {
+  try {
+    return carry_out(request);
+  } catch (const std::bad_alloc&) {
+    return {Status::failed, {}};
+  }
+}
+
+Service::Answer Service::carry_out(const Request& request) {
   switch (request.operation) {
     case Operation::get:
       return get(request);
@@ -79,11 +89,12 @@ Service::Answer Service::dump(const Request& request) const {
 }
 
 Service::Answer Service::load(const Request& request) {
-  if (!is_memory_file(request.document)) {
-    return {Status::failed, {}};
-  }
+  return is_memory_file(request.document) ? load_document(request.document) : Answer{Status::failed, {}};
+}
+
+Service::Answer Service::load_document(int fd) {
   Tree loaded;
-  if (!read_settings(request.document, loaded, error_)) {
+  if (!read_settings(fd, loaded, error_)) {
     return {Status::damaged, std::string_view(error_).substr(0, kMaxErrorBytes)};
   }
   tree_.swap(loaded);

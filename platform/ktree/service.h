@@ -15,9 +15,15 @@ class Service {
     Status status;
     std::string_view body;
   };
+  // When memory is short the answer is Status::failed, and the tree is as it was.
   [[nodiscard]] Answer handle(const Request& request);
 
+  // Makes the tree what the settings file in `fd` holds, or leaves it as it was. Throws std::bad_alloc when
+  // memory is short.
+  [[nodiscard]] Answer load_document(int fd);
+
  private:
+  Answer carry_out(const Request& request);
   Answer get(const Request& request) const;
   Answer set(const Request& request);
   Answer del(const Request& request);

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <new>
 #include <vector>
 
 #include "ktree/element_text.h"
@@ -38,8 +39,8 @@ class SettingsReader {
   SettingsReader& operator=(const SettingsReader&) = delete;
   ~SettingsReader() { XML_ParserFree(parser_); }
 
-  // Room for the next kChunk bytes of the document; null when memory is short.
-  [[nodiscard]] void* chunk() { return XML_GetBuffer(parser_, kChunk); }
+  // Room for the next kChunk bytes of the document.
+  [[nodiscard]] void* chunk();
 
   // Reads the `size` bytes put into chunk(); 0 at the end. Returns false when the document is refused.
   [[nodiscard]] bool feed(size_t size);
@@ -54,6 +55,10 @@ class SettingsReader {
   static void XMLCALL on_doctype(void* self, const XML_Char*, const XML_Char* system, const XML_Char*,
                                  int subset);
 
+  template <typename Act>
+  static void call(void* self, Act act);
+
+  void start_element(std::string_view name, const XML_Char** attributes);
   void start_root(std::string_view name);
   void start_node(std::string_view name);
   void read_attribute(std::string_view name, std::string_view value);
@@ -67,10 +72,14 @@ class SettingsReader {
   std::string value_;
   size_t fed_ = 0;
   size_t understood_ = 0;
+  bool memory_is_short_ = false;
 };
 
 SettingsReader::SettingsReader(Tree& tree, std::string& error)
     : tree_(tree), error_(error), parser_(XML_ParserCreate(nullptr)) {
+  if (parser_ == nullptr) {
+    throw std::bad_alloc();
+  }
   error_.clear();
   XML_SetUserData(parser_, this);
   XML_SetElementHandler(parser_, on_start, on_end);
@@ -89,8 +98,19 @@ void SettingsReader::refuse(const char* what) {
   XML_StopParser(parser_, XML_FALSE);
 }
 
+void* SettingsReader::chunk() {
+  void* room = XML_GetBuffer(parser_, kChunk);
+  if (room == nullptr) {
+    throw std::bad_alloc();
+  }
+  return room;
+}
+
 bool SettingsReader::feed(size_t size) {
   if (XML_ParseBuffer(parser_, static_cast<int>(size), size == 0) != XML_STATUS_OK) {
+    if (memory_is_short_ || XML_GetErrorCode(parser_) == XML_ERROR_NO_MEMORY) {
+      throw std::bad_alloc();
+    }
     refuse(XML_ErrorString(XML_GetErrorCode(parser_)));
     return false;
   }
@@ -103,35 +123,53 @@ bool SettingsReader::feed(size_t size) {
   return error_.empty();
 }
 
-void XMLCALL SettingsReader::on_start(void* self, const XML_Char* name, const XML_Char** attributes) {
+// Carries out what the parser calls for, unless the document is refused already. The parser is C: an
+// exception must not pass through it, and is thrown again behind it.
+template <typename Act>
+void SettingsReader::call(void* self, Act act) {
   auto* reader = static_cast<SettingsReader*>(self);
-  if (reader->open_.empty()) {
-    reader->start_root(name);
-  } else {
-    reader->start_node(name);
+  if (reader->memory_is_short_ || !reader->error_.empty()) {
+    return;
   }
-  for (; *attributes != nullptr && reader->error_.empty(); attributes += 2) {
-    reader->read_attribute(attributes[0], attributes[1]);
+  try {
+    act(*reader);
+  } catch (const std::bad_alloc&) {
+    reader->memory_is_short_ = true;
+    XML_StopParser(reader->parser_, XML_FALSE);
+  }
+}
+
+void XMLCALL SettingsReader::on_start(void* self, const XML_Char* name, const XML_Char** attributes) {
+  call(self, [&](SettingsReader& reader) { reader.start_element(name, attributes); });
+}
+
+void SettingsReader::start_element(std::string_view name, const XML_Char** attributes) {
+  if (open_.empty()) {
+    start_root(name);
+  } else {
+    start_node(name);
+  }
+  for (; *attributes != nullptr && error_.empty(); attributes += 2) {
+    read_attribute(attributes[0], attributes[1]);
   }
 }
 
 void XMLCALL SettingsReader::on_end(void* self, const XML_Char*) {
-  auto* reader = static_cast<SettingsReader*>(self);
-  if (!reader->error_.empty()) {
-    return;
-  }
-  if (reader->open_.size() == 1) {
-    reader->end_root();
-  } else {
-    reader->end_node();
-  }
+  call(self, [](SettingsReader& reader) {
+    if (reader.open_.size() == 1) {
+      reader.end_root();
+    } else {
+      reader.end_node();
+    }
+  });
 }
 
 void XMLCALL SettingsReader::on_text(void* self, const XML_Char* text, int length) {
-  auto* reader = static_cast<SettingsReader*>(self);
-  if (reader->error_.empty() && !reader->open_.back().text.add({text, static_cast<size_t>(length)})) {
-    reader->refuse("a value of more than 65535 bytes");
-  }
+  call(self, [&](SettingsReader& reader) {
+    if (!reader.open_.back().text.add({text, static_cast<size_t>(length)})) {
+      reader.refuse("a value of more than 65535 bytes");
+    }
+  });
 }
 
 // A document type can declare entities, whose expansion may fill any memory, or leave them to a file
@@ -139,7 +177,7 @@ void XMLCALL SettingsReader::on_text(void* self, const XML_Char* text, int lengt
 void XMLCALL SettingsReader::on_doctype(void* self, const XML_Char*, const XML_Char* system, const XML_Char*,
                                         int subset) {
   if (system != nullptr || subset != 0) {
-    static_cast<SettingsReader*>(self)->refuse("a document type declaration");
+    call(self, [](SettingsReader& reader) { reader.refuse("a document type declaration"); });
   }
 }
 
@@ -152,9 +190,6 @@ void SettingsReader::start_root(std::string_view name) {
 }
 
 void SettingsReader::start_node(std::string_view name) {
-  if (!error_.empty()) {
-    return;
-  }
   OpenElement& parent = open_.back();
   parent.text.begin_child();
   if (!valid_name(name)) {
@@ -222,8 +257,7 @@ void SettingsReader::end_node() {
 template <typename Read>
 bool read_all(SettingsReader& reader, Read read) {
   for (;;) {
-    void* buffer = reader.chunk();
-    ssize_t size = buffer == nullptr ? -1 : read(buffer, static_cast<size_t>(kChunk));
+    const ssize_t size = read(reader.chunk(), static_cast<size_t>(kChunk));
     if (size < 0) {
       reader.refuse("the document cannot be read");
       return false;

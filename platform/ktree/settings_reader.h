@@ -10,7 +10,7 @@ namespace ktree {
 
 // Reads the document in `fd` from offset 0 to its end into `tree`, which must be empty. Returns true, or
 // false when the document is damaged or holds what a tree may not hold: `tree` is then of no use, and `error`
-// says what and where ("line 7: ...").
+// says what and where ("line 7: ..."). Throws std::bad_alloc when memory is short.
 [[nodiscard]] bool read_settings(int fd, Tree& tree, std::string& error);
 
 // The same for a document in memory.

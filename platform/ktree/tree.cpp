@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <new>
 #include <utility>
 
 namespace ktree {
@@ -63,6 +64,31 @@ bool Tree::fits(Growth growth) const {
   return growth.nodes <= kMaxNodes - node_count_ && growth.bytes <= kMaxTreeBytes - bytes_;
 }
 
+// What is to be made below `from`, which the first `existing` elements of the path lead to.
+Tree::Growth Tree::growth_by(const Node& from, const Path& path, size_t existing,
+                             std::string_view value) const {
+  Growth growth = {0, existing == path.depth && value.size() <= from.size ? 0 : value.size()};
+  for (size_t i = existing; i < path.depth; i++) {
+    const Element& element = path.elements[i];
+    const size_t made = element.number - (i == existing ? members_of(from, element.name()) : 0);
+    growth.nodes += made;
+    growth.bytes += made * element.name().size();
+  }
+  return growth;
+}
+
+Node* Tree::make_path(Node* node, const Path& path, size_t existing) {
+  for (size_t i = existing; i < path.depth; i++) {
+    const Element& element = path.elements[i];
+    Node* child = nullptr;
+    for (size_t have = members_of(*node, element.name()); have < element.number; have++) {
+      child = make_child(*node, element.name());
+    }
+    node = child;
+  }
+  return node;
+}
+
 bool Tree::set(const Path& path, std::string_view value) {
   Node* node = &root_;
   size_t existing = 0;
@@ -73,26 +99,37 @@ bool Tree::set(const Path& path, std::string_view value) {
     }
     node = child;
   }
-  Growth growth = {0, existing == path.depth && value.size() <= node->size ? 0 : value.size()};
-  for (size_t i = existing; i < path.depth; i++) {
-    const Element& element = path.elements[i];
-    size_t made = element.number - (i == existing ? members_of(*node, element.name()) : 0);
-    growth.nodes += made;
-    growth.bytes += made * element.name().size();
-  }
-  if (!fits(growth)) {
+  if (!fits(growth_by(*node, path, existing, value))) {
     return false;
   }
-  for (size_t i = existing; i < path.depth; i++) {
-    const Element& element = path.elements[i];
-    Node* child = nullptr;
-    for (size_t have = members_of(*node, element.name()); have < element.number; have++) {
-      child = make_child(*node, element.name());
-    }
-    node = child;
+  if (existing == path.depth) {
+    store_value(*node, value);
+    return true;
   }
-  store_value(*node, value);
+  const std::string_view first_made = path.elements[existing].name();
+  const size_t members = members_of(*node, first_made);
+  try {
+    store_value(*make_path(node, path, existing), value);
+  } catch (const std::bad_alloc&) {
+    shrink_to(*node, first_made, members);
+    throw;
+  }
   return true;
+}
+
+// Takes `node`, the child `number` of its name below `parent`, out of the tree and frees it.
+void Tree::take_out(Node& parent, Node& node, unsigned number) {
+  bytes_ -= node.group->name.size();
+  unlink_sibling(parent, node);
+  leave_group(parent, node, number);
+  node.group = nullptr;
+  destroy(&node);
+}
+
+void Tree::shrink_to(Node& parent, std::string_view name, size_t members) {
+  for (size_t have = members_of(parent, name); have > members; have--) {
+    take_out(parent, *find_group(parent, name)->members.back(), static_cast<unsigned>(have));
+  }
 }
 
 bool Tree::remove(const Path& path) {
@@ -107,11 +144,7 @@ bool Tree::remove(const Path& path) {
   if (parent == nullptr) {
     return false;
   }
-  bytes_ -= node->group->name.size();
-  unlink_sibling(*parent, *node);
-  leave_group(*parent, *node, path.elements[path.depth - 1].number);
-  node->group = nullptr;
-  destroy(node);
+  take_out(*parent, *node, path.elements[path.depth - 1].number);
   return true;
 }
 
@@ -136,16 +169,20 @@ void Tree::swap(Tree& other) noexcept {
   std::swap(bytes_, other.bytes_);
 }
 
+// Whatever cannot be had is asked for before anything is changed.
 Node* Tree::make_child(Node& parent, std::string_view name) {
+  auto made = std::make_unique<Node>();
   auto position = group_position(parent, name);
   if (position == parent.groups.end() || (*position)->name != name) {
     auto group = std::make_unique<Group>();
     group->name = name;
+    group->members.push_back(made.get());
     position = parent.groups.insert(position, std::move(group));
+  } else {
+    (*position)->members.push_back(made.get());
   }
-  Node* node = new Node;
+  Node* node = made.release();
   node->group = position->get();
-  node->group->members.push_back(node);
   node->previous = parent.last_child;
   (parent.last_child == nullptr ? parent.first_child : parent.last_child->next) = node;
   parent.last_child = node;

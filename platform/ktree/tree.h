@@ -58,7 +58,8 @@ class Tree {
   ~Tree();
 
   // Sets the node at `path` to `value` and makes what is missing on the way, also the nodes before `name:N`.
-  // Returns false, with nothing changed, when the tree would get larger than a tree may be.
+  // Returns false, with nothing changed, when the tree would get larger than a tree may be; throws
+  // std::bad_alloc, with nothing changed either, when memory is short.
   [[nodiscard]] bool set(const Path& path, std::string_view value);
 
   // The node at `path`, or null.
@@ -71,7 +72,7 @@ class Tree {
   [[nodiscard]] size_t node_count() const { return node_count_; }
 
   // For building a tree from a document. Both return false or null, with nothing changed, when a limit is
-  // met.
+  // met, and throw std::bad_alloc, with nothing changed, when memory is short.
   [[nodiscard]] Node* append_child(Node& parent, std::string_view name);
   [[nodiscard]] bool set_value(Node& node, std::string_view value);
   [[nodiscard]] Node& root() { return root_; }
@@ -86,6 +87,11 @@ class Tree {
   };
 
   [[nodiscard]] bool fits(Growth growth) const;
+  [[nodiscard]] Growth growth_by(const Node& from, const Path& path, size_t existing,
+                                 std::string_view value) const;
+  [[nodiscard]] Node* make_path(Node* node, const Path& path, size_t existing);
+  void take_out(Node& parent, Node& node, unsigned number);
+  void shrink_to(Node& parent, std::string_view name, size_t members);
   [[nodiscard]] Node* make_child(Node& parent, std::string_view name);
   void store_value(Node& node, std::string_view value);
   void destroy(Node* node);

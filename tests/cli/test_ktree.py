@@ -5,8 +5,10 @@ import os
 import random
 import resource
 import signal
+import socket
 import stat
 import subprocess
+import time
 
 import pytest
 
@@ -39,6 +41,7 @@ def test_the_socket_is_private_and_the_pid_file_holds_the_number(daemon):
     info = daemon.socket.lstat()
     assert stat.S_ISSOCK(info.st_mode) and stat.S_IMODE(info.st_mode) == 0o600
     assert daemon.pid_file.read_text() == f"{daemon.process.pid}\n"
+    assert stat.S_IMODE(daemon.pid_file.lstat().st_mode) == 0o600
     assert sorted(os.listdir(daemon.folder)) == ["sock", "sock_config.pid"]
 
 
@@ -183,13 +186,114 @@ def test_it_raises_its_own_limit_of_descriptors(place):
     assert resource.prlimit(place.process.pid, resource.RLIMIT_NOFILE) == (512, 512)
 
 
+def settings(value):
+    return f"<config><a>{value}</a></config>"
+
+
+def started_with(place, *files):
+    """Starts the daemon with these settings files; gives what it says."""
+    arguments = [word for file in files for word in ("-l", place.folder / file)]
+    with open(place.folder / "said", "w+") as said:
+        place.start(arguments=arguments, stderr=said)
+        said.seek(0)
+        return said.read().replace(f"{place.folder}/", "")
+
+
+def test_it_starts_with_the_settings_of_a_file(place):
+    (place.folder / "vv.xml").write_text(settings("saved"))
+    (place.folder / "copy").write_text(settings("copy"))
+    assert started_with(place, "vv.xml", "copy") == ""
+    assert place.get("/a") == b"saved"
+    assert "vv.xml.damaged" not in os.listdir(place.folder)
+
+
+@pytest.mark.parametrize("damaged, reason", [
+    (None, "No such file or directory"), ("", "line 1: no element found"), ("<config><a>", "line 1: no element found"),
+    ("rubbish", "line 1: syntax error")])
+def test_it_starts_with_the_next_file_and_keeps_the_damaged_one(place, damaged, reason):
+    (place.folder / "copy").write_text(settings("copy"))
+    if damaged is not None:
+        (place.folder / "vv.xml").write_text(damaged)
+    assert started_with(place, "vv.xml", "copy") == f"ktree: vv.xml: {reason}\nktree: loaded copy instead\n"
+    assert place.get("/a") == b"copy"
+    kept = place.folder / "vv.xml.damaged"
+    assert (kept.read_text() if kept.exists() else None) == damaged
+    assert place.run("-D", place.folder / "vv.xml").returncode == 0
+    assert (kept.read_text() if kept.exists() else None) == damaged
+
+
+def test_without_any_settings_it_starts_empty(place):
+    os.mkfifo(place.folder / "fifo")
+    (place.folder / "torn").write_text("<config>")
+    assert started_with(place, "none", "fifo", "torn").splitlines() == [
+        "ktree: none: No such file or directory", "ktree: fifo: not a regular file", "ktree: torn: line 1: no element found"]
+    assert place.listing() == []
+
+
+def test_nobody_gets_an_answer_before_the_settings_are_loaded(place):
+    """The settings file is read before the socket is there."""
+    (place.folder / "vv.xml").write_text(settings("saved"))
+    log = place.folder / "log"
+    place.start(prefix=["strace", "-o", log, "-e", "trace=openat,socket,bind,listen"], env=TRACED,
+                arguments=["-l", place.folder / "vv.xml"])
+    calls = log.read_text()
+    assert 0 < calls.index(str(place.folder / "vv.xml")) < calls.index("bind(")
+    place.process.send_signal(signal.SIGTERM)
+
+
+def test_the_service_manager_is_told_when_it_answers(place):
+    with socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as manager:
+        manager.bind(str(place.folder / "notify"))
+        manager.settimeout(20)
+        place.process = subprocess.Popen([KTREE, "-n", "config", "-s", place.socket],
+                                         env={**os.environ, "NOTIFY_SOCKET": str(place.folder / "notify")})
+        assert manager.recv(100) == b"READY=1"
+        assert place.answers()
+
+
+@pytest.mark.parametrize("others", ["a folder that others lock", "a lock file that others may open", "a link", "a pipe"])
+def test_what_others_lock_does_not_keep_it_from_starting(place, others):
+    lock = place.folder / "sock.lock"
+    held = place.folder
+    if others == "a lock file that others may open":
+        lock.touch(0o644)
+        held = lock
+    elif others == "a link":
+        held = place.folder / "precious"
+        held.touch(0o600)
+        lock.symlink_to(held)
+    elif others == "a pipe":
+        os.mkfifo(lock)
+    holder = os.open(held, os.O_RDONLY)
+    fcntl.flock(holder, fcntl.LOCK_EX)
+    begun = time.monotonic()
+    place.start()
+    assert time.monotonic() - begun < 3
+    os.close(holder)
+    assert sorted(set(os.listdir(place.folder)) - {"precious"}) == ["sock", "sock_config.pid"]
+
+
+def test_one_that_is_starting_is_waited_for(place):
+    lock = place.folder / "sock.lock"
+    lock.touch(0o600)
+    holder = os.open(lock, os.O_RDWR)
+    fcntl.flock(holder, fcntl.LOCK_EX)
+    second = subprocess.Popen([KTREE, "-n", "config", "-s", place.socket])
+    time.sleep(0.5)
+    assert not place.socket.exists()
+    lock.unlink()
+    os.close(holder)
+    place.process = second
+    until(lambda: place.socket.exists() and place.answers())
+
+
 @pytest.mark.parametrize("arguments", [[], ["-n", "x"], ["-s", "/tmp/x"], ["-n", "a/b", "-s", "/tmp/x"],
                                        ["-n", "", "-s", "/tmp/x"], ["-n", "x", "-s", ""], ["-n", "x", "-s", "y", "z"],
                                        ["-z"], ["--nix"]])
 def test_bad_usage_of_the_daemon(arguments):
     done = run(KTREE, *arguments)
     assert done.returncode == 2 and done.stdout == ""
-    assert "Usage: ktree -n NAME -s SOCKET\n" in done.stderr
+    assert "Usage: ktree -n NAME -s SOCKET [-l FILE]...\n" in done.stderr
 
 
 @pytest.mark.parametrize("program", [KTREE, KTREEC])
@@ -488,6 +592,17 @@ def test_a_dump_that_fails_at_any_step_leaves_the_old_file_alone(daemon, fault):
     assert done.returncode == 1
     assert file.read_text() == "old"
     assert sorted(os.listdir(daemon.folder)) == ["sock", "sock_config.pid", "vv.xml"]
+
+
+def test_a_dump_is_on_the_disk_before_it_gets_the_name_and_the_folder_after_it(daemon):
+    daemon.set("/a", "new")
+    log = daemon.folder.parent / f"{daemon.folder.name}.log"
+    run("strace", "-y", "-o", log, "-e", "trace=fsync,fdatasync,rename,renameat,renameat2", KTREEC, "-S", daemon.socket,
+        "-D", daemon.folder / "vv.xml", env=TRACED, check=True)
+    lines = log.read_text().splitlines()
+    log.unlink()
+    assert [line.split("(")[0] for line in lines[:3]] == ["fsync", "rename", "fsync"]
+    assert ".tmp>" in lines[0] and f"{daemon.folder}>" in lines[2]
 
 
 def test_a_temporary_file_of_the_same_name_is_in_nobodys_way(daemon):

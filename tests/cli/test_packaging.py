@@ -120,8 +120,6 @@ def test_modules_are_taken_away_again(kernel):
 
 # --- the tree at start ---
 
-SAVED, COPY = "/etc/NAS_CFG/vv.xml", "/usr/local/config/vv.xml"
-
 
 def settings(share):
     return f"<config><iscsi><initiator><prefix>{share}</prefix></initiator></iscsi></config>"
@@ -135,22 +133,16 @@ def settings(share):
     ("<config><cut", "rubbish", None),
     (None, None, None),
 ])
-def test_the_tree_gets_the_saved_settings_or_their_copy(box, saved, copy, loaded):
-    for path, text in ((SAVED, saved), (COPY, copy)):
+def test_the_unit_starts_with_the_saved_settings_or_their_copy(bare_box, saved, copy, loaded):
+    box = bare_box
+    for path, text in (("/etc/NAS_CFG/vv.xml", saved), ("/usr/local/config/vv.xml", copy)):
         if text is not None:
             box.write(path, text)
-    assert helper(box, "load-tree").status == 0
+    service = Unit("remvol-tree.service")["Service"]
+    assert service["Type"] == "notify"
+    box.tree.start(shlex.split(service["ExecStart"])[1:])
     assert box.tree.get("/iscsi/initiator/prefix") == loaded
-    damaged = box.path(SAVED + ".damaged")
-    assert damaged.exists() == (saved is not None and loaded is None)
-
-
-def test_load_tree_waits_for_the_daemon(bare_box):
-    bare_box.write(SAVED, settings("late"))
-    loading = bare_box.start([PACKAGING / "helpers" / "load-tree"], env={"LD_PRELOAD": None})
-    bare_box.tree.start()
-    assert loading.wait().status == 0
-    assert bare_box.tree.get("/iscsi/initiator/prefix") == "late"
+    assert box.path("/etc/NAS_CFG/vv.xml.damaged").exists() == (saved is not None and loaded != "saved")
 
 
 # --- units ---
@@ -246,6 +238,8 @@ def test_every_command_is_completed(complete):
     ("remvol -d ", ["0", "1", "2", "3"]),
     ("remvol --add -P ", []),
     ("remvol --init ", []),
+    ("ktree -", ["-n", "-s", "-l", "-h", "--help", "-V", "--version"]),
+    ("ktree -n ", ["config"]),
     ("ktreec -", ["-S", "-g", "-s", "-d", "-t", "-l", "-D", "-h", "--help", "-V", "--version"]),
     ("ktreec -S ", ["/var/run/ktree_sock_vv"]),
 ])

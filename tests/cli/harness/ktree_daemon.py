@@ -40,9 +40,9 @@ class Daemon:
         if start:
             self.start(prefix, **popen)
 
-    def start(self, prefix=(), **popen):
-        self.process = subprocess.Popen([*prefix, KTREE, "-n", self.name, "-s", self.socket], stdin=subprocess.DEVNULL,
-                                        **popen)
+    def start(self, prefix=(), arguments=(), **popen):
+        self.process = subprocess.Popen([*prefix, KTREE, "-n", self.name, "-s", self.socket, *arguments],
+                                        stdin=subprocess.DEVNULL, **popen)
         until(self.answers)
 
     def answers(self):

@@ -12,8 +12,9 @@ class Tree:
         self.box, self.socket = box, socket
         self.daemon = None
 
-    def start(self):
-        self.daemon = self.box.start(["ktree", "-n", "config", "-s", self.socket], env={"LD_PRELOAD": None})
+    def start(self, arguments=None):
+        words = arguments or ["-n", "config", "-s", self.socket]
+        self.daemon = self.box.start(["ktree", *words], env={"LD_PRELOAD": None})
         self.box.wait_until(self._answers, what="the tree's daemon")
         return self
 
