@@ -2,6 +2,7 @@
 
 import argparse
 import collections
+import multiprocessing
 import pathlib
 import random
 import sys
@@ -9,6 +10,7 @@ import time
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent))
 
+from faults import Faults  # noqa: E402
 from many import Round  # noqa: E402
 from pairs import PAIRS, torment  # noqa: E402
 
@@ -56,6 +58,41 @@ def run_pairs(options):
     return bad == 0
 
 
+def run_faults(options):
+    begin = time.monotonic()
+    faults = Faults(options.only or (options.at or "").split("/")[0], options.seed)
+    chosen = [fault for fault in faults.all if options.at in (None, fault.key())]
+    random.Random(options.seed).shuffle(chosen)
+    chosen = chosen[: options.count]
+    print(f"faults: {len(faults.all)} are possible on {len(faults.walks)} roads, {len(chosen)} chosen (seed {options.seed})", flush=True)
+    good = bad = missed = 0
+    with multiprocessing.Pool(options.jobs, initializer=keep_faults, initargs=(faults,)) as pool:
+        for fault, found in pool.imap_unordered(play_fault, chosen):
+            missed += found is None
+            good += found == []
+            bad += bool(found)
+            if found:
+                print(f"{fault.key()} {fault}", *(f"    {text[:1000]}" for text in found), sep="\n", flush=True)
+            if options.seconds is not None and time.monotonic() - begin > options.seconds:
+                pool.terminate()
+                break
+    seconds = time.monotonic() - begin
+    print(f"faults: {good} passed, {bad} failed ({missed} not met, {seconds:.0f} s, {(good + bad) / seconds:.1f} a second)")
+    return bad == 0
+
+
+def keep_faults(faults):
+    global kept
+    kept = faults
+
+
+def play_fault(fault):
+    try:
+        return fault, kept.play(fault)
+    except Exception as error:  # noqa: BLE001: one bad box does not end a long run
+        return fault, [f"torture: {type(error).__name__}: {error}"]
+
+
 def main():
     parser = argparse.ArgumentParser(prog="torture")
     forms = parser.add_subparsers(required=True)
@@ -73,6 +110,14 @@ def main():
     pairs.add_argument("--seed", type=int, default=1)
     pairs.add_argument("--stories", help="folder for the whole story of a round with findings")
     pairs.set_defaults(run=run_pairs)
+    faults = forms.add_parser("faults", help="every call, command and allocation fails")
+    faults.add_argument("--count", type=int, default=50000, help="at most so many, drawn by the seed")
+    faults.add_argument("--seconds", type=float, help="begin none after so long")
+    faults.add_argument("--only", default="", help="one road")
+    faults.add_argument("--at", help="one fault, by its key")
+    faults.add_argument("--seed", type=int, default=1)
+    faults.add_argument("--jobs", type=int, default=2)
+    faults.set_defaults(run=run_faults)
     options = parser.parse_args()
     sys.exit(0 if options.run(options) else 1)
 

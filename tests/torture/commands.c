@@ -3,12 +3,16 @@
  * violation, whoever asked for it. */
 #include <dirent.h>
 #include <errno.h>
+#include <fcntl.h>
+#include <linux/mount.h>
 #include <signal.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/mount.h>
+#include <sys/sem.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/sysmacros.h>
 #include <time.h>
 #include <unistd.h>
@@ -490,9 +494,26 @@ static int run_real(const char* name, char** argv) {
   return 127;
 }
 
-/* `world restore NODE POINT...`: the kernel's view of the sessions that the state holds, and volumes mounted
- * as they were. The torture itself calls it, when a state was put back. */
+/* The file system turns read-only by itself: it says so, the mount does not. */
+static int degrade(const char* point) {
+  int fs = (int)syscall(SYS_fspick, AT_FDCWD, point, 0);
+  if (fs < 0 || syscall(SYS_fsconfig, fs, FSCONFIG_SET_FLAG, "ro", NULL, 0) != 0) return 1;
+  return syscall(SYS_fsconfig, fs, FSCONFIG_CMD_RECONFIGURE, NULL, NULL, 0) == 0 ? 0 : 1;
+}
+
+/* What the format semaphore stands at; nothing when there is none. */
+static int show_semaphore(void) {
+  int id = semget(90111, 1, 0);
+  if (id >= 0) printf("%d\n", semctl(id, 0, GETVAL));
+  return 0;
+}
+
+/* `world semaphore`, `world degrade POINT`: see above. `world restore NODE POINT...`: the kernel's view of
+ * the sessions that the state holds, and volumes mounted as they were. The torture itself calls it, when a
+ * state was put back. */
 static int do_world(char** argv) {
+  if (argv[0] != NULL && strcmp(argv[0], "semaphore") == 0) return show_semaphore();
+  if (argv[0] != NULL && argv[1] != NULL && strcmp(argv[0], "degrade") == 0) return degrade(argv[1]);
   if (argv[0] == NULL || strcmp(argv[0], "restore") != 0) return 2;
   for (int t = 1; t <= TARGETS; t++) {
     struct target* target = &world->targets[t];

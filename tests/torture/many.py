@@ -49,10 +49,22 @@ def options(command, t, l, share):
 def start_run(world, dice, command, t, l, share):
     if command == "recover":  # the listener says one thing at a time
         world.tool("oiscsi_evt_reopen", t=t)
+        if dice.random() < 0.7:
+            degrade_one(world, t)
         return world.begin("oiscsi_evt_recover", t=t)
     if command == "disconnect":
         return world.begin(command, **({"t": t} if dice.random() < 0.85 else {}))
     return world.begin(command, **options(command, t, l, share))
+
+
+def degrade_one(world, t):
+    """A volume of the target turns read-only, when one is mounted."""
+    for point in world.mounts():
+        try:
+            if (world.box.path(point) / ".data").read_text().startswith(f"{t} "):
+                return world.degrade(point.rsplit("/", 1)[1])
+        except (OSError, RuntimeError):
+            continue  # it has just been unmounted
 
 
 class Round:
@@ -180,7 +192,8 @@ class Round:
         """Every target that is stored can be connected, shows its data, and can be left again."""
         world = self.world
         stored = sorted({t for t, _ in judge.volumes(world.tree())})
-        for t in stored:
+        for t in stored:  # one that is read-only is not, once it was unmounted
+            world.tool("disconnect", t=t)
             job = world.tool("connect", t=t)
             if job.status != 0:
                 self.check(f"unwell: {job}: {job.output[-800:]}")

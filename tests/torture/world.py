@@ -198,6 +198,12 @@ class World:
             raise RuntimeError(f"the beginning was not put back: {done}")
         (self.box.root / "fake/world/log").unlink(missing_ok=True)
 
+    def degrade(self, share):
+        """The file system of a mounted volume turns read-only."""
+        done = self.box.run(["world", "degrade", f"/mnt/VV/{share}"], env={"LD_PRELOAD": None})
+        if done.status != 0:
+            raise RuntimeError(f"/mnt/VV/{share} was not turned read-only: {done}")
+
     # --- runs of the tool ---
 
     def begin(self, command, t=None, l=None, share=None, **more):

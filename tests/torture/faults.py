@@ -1,0 +1,234 @@
+"""Every fault: each call, tree call, command and allocation of each road fails once, or that one and all later ones.
+
+After a fault: no crash, no hang, no success that is none; and the same command again, without the fault, ends as if
+nothing had happened (beside a run that never had a fault). What is settled otherwise stands in settled.py."""
+
+import dataclasses
+import random
+import re
+import time
+
+import settled
+from pairs import BLANK, FULL, on, stored
+from world import SAVED, SOCKET, World
+
+CALL, TREE, COMMAND, MEMORY = range(4)
+CLASSES = ("call", "tree", "command", "memory")
+FAIL, KILL, NOTHING, MUTE, LATE = range(5)
+KINDS = ("fails", "is killed", "does nothing and says 0", "prints nothing", "works and says 1")
+EIO, ENOMEM, ENOSPC, EMFILE = 5, 12, 28, 24
+PACE = 5  # percent: nobody meets anybody here
+HANG = 30  # seconds
+
+
+@dataclasses.dataclass
+class Road:
+    name: str
+    furnish: tuple
+    command: tuple
+    before: tuple = ()  # commands that belong to it and go before it, also when it is repeated
+    heal: tuple = ()  # what a person would do next, when the repetition is refused as it must be
+    degraded: str = ""  # a share whose volume turns read-only first
+
+
+CONNECT_1, CONNECT_2 = ("connect", on(1)), ("connect", on(2))
+ROADS = {
+    road.name: road
+    for road in (
+        Road("init", FULL, ("init", {})),
+        Road("add", FULL, ("add", on(4, 0, "v40"))),
+        Road("add-connected", FULL, ("add", on(2, 1, "v21")), heal=(CONNECT_2,)),
+        Road("connect", BLANK, CONNECT_1),
+        Road("connect-again", FULL, CONNECT_1),
+        Road("disconnect", FULL, ("disconnect", on(1))),
+        Road("disconnect-all", FULL, ("disconnect", {})),
+        Road("del", FULL, ("del", on(1))),
+        Road("del_lun", FULL, ("del_lun", on(1, 0))),
+        Road("format", FULL, ("format", on(1, 0)), heal=(CONNECT_1,)),
+        Road("modify", FULL, ("modify", on(1)), heal=(CONNECT_1,)),
+        Road("status", FULL, ("status", {})),
+        Road("recover", FULL, ("oiscsi_evt_recover", on(1)), before=(("oiscsi_evt_reopen", on(1)),), heal=(CONNECT_1,),
+             degraded="v10"),
+    )
+}
+
+
+@dataclasses.dataclass(frozen=True)
+class Fault:
+    road: str
+    kind_of: int
+    index: int
+    forever: bool
+    kind: int
+    error: int
+    name: str
+    subject: str
+
+    def __str__(self):
+        what = f"{self.road}: {CLASSES[self.kind_of]} {self.index} ({self.name} {self.subject})".replace("\t", " ")
+        return f"{what[:200]} {KINDS[self.kind]}{' for ever' if self.forever else ''}, errno {self.error}"
+
+    def key(self):
+        return f"{self.road}/{self.kind_of}/{self.index}/{int(self.forever)}/{self.kind}/{self.error}"
+
+
+# --- what is there afterwards ---
+
+def picture(world):
+    """Everything that lasts, with the disks under the names of their LUNs."""
+    state = world.state()
+    names = {lun.dev: f"<{t}.{l}>" for t, (_, _, _, luns) in state.items() for l, lun in enumerate(luns) if lun.dev}
+
+    def plain(text):
+        return re.sub(r"\bsd[b-z](?=1?\b)", lambda m: names.get(m[0], "<gone>"), text)
+
+    seen = {f"tree {path}": plain(value) for path, value in world.tree().items() if not path.startswith("/result")}
+    for t, (online, record, _, luns) in state.items():
+        if record or online:
+            seen[f"target {t}"] = f"online={online} record={record}"
+        for l, lun in enumerate(luns):
+            if lun.parts:
+                seen[f"disk {t}.{l}"] = f"content={lun.content}"
+    for point, sources in world.mounts().items():
+        seen[f"mount {point}"] = plain(" ".join(sources))
+    folder = world.box.path("/mnt/VV")
+    for entry in folder.iterdir() if folder.exists() else ():
+        seen[f"folder {entry.name}"] = ""
+    seen["settings"] = plain(without_results(world.box.path(SAVED)))
+    world.sh(f"ktreec -S {SOCKET} -D /tmp/now.xml")
+    seen["now"] = plain(without_results(world.box.path("/tmp/now.xml")))
+    return seen
+
+
+def without_results(file):
+    text = file.read_text() if file.exists() else "none"
+    return re.sub(r"(?s)<result>.*?</result>\s*|<result/>\s*", "", text)
+
+
+def difference(good, seen, output=""):
+    texts = []
+    for key in sorted(good.keys() | seen.keys()):
+        if good.get(key) == seen.get(key):
+            continue
+        if key == "settings":
+            said = re.search(r"(?m)^\(.*(dump|saved|settings|vv\.xml)", output)
+            texts.append(f"settings differ{' (as the tree)' if seen[key] == seen['now'] else ' (said)' if said else ''}")
+        elif key != "now":
+            texts.append(f"{key}: {seen.get(key)} for {good.get(key)}")
+    return texts
+
+
+# --- one road, with a fault or without ---
+
+class Walk:
+    def __init__(self, road, beginning):
+        self.road, self.beginning = road, beginning
+
+    def world(self):
+        world = World(pace=PACE, daemon=False)
+        world.restore(self.beginning[0])
+        world.start_daemon()
+        if self.road.degraded:
+            world.degrade(self.road.degraded)
+        return world
+
+    def begin(self, world):
+        for command, options in self.road.before:
+            world.tool(command, **options)
+
+    def repeat(self, world):
+        self.begin(world)
+        for command, options in (self.road.command, *self.road.heal, ("status", {})):
+            world.tool(command, **options)
+        world.box.wait_quiet()
+
+    def clean(self):
+        """The pictures after one run and after the repetition, and the calls of the run."""
+        with self.world() as world:
+            self.begin(world)
+            world.plan(traced=1)
+            command, options = self.road.command
+            done = world.tool(command, **options)
+            world.plan(active=0)
+            world.box.wait_quiet()
+            if done.status != 0 or world.findings():
+                raise RuntimeError(f"{self.road.name} fails without a fault: {done} {done.output} {world.findings()}")
+            self.first = picture(world)
+            calls = (world.box.root / "fake/world/calls").read_text("utf-8", "replace").splitlines()
+            self.repeat(world)
+            self.second = picture(world)
+            if world.findings():
+                raise RuntimeError(f"{self.road.name}: {world.findings()}")
+        return [line.split("\t", 3) for line in calls]
+
+    def suffer(self, fault):
+        """Findings of one fault; None when it was never met."""
+        found = []
+        with self.world() as world:
+            self.begin(world)
+            world.plan(kind_of=fault.kind_of, index=fault.index, forever=fault.forever, kind=fault.kind, error=fault.error)
+            command, options = self.road.command
+            job = world.begin(command, **options)
+            try:
+                job.running.wait(HANG)
+            except TimeoutError:
+                world.plan(active=0)
+                return [f"hang: {job.output[-500:]}"]
+            fired, _ = world.faults()
+            world.plan(active=0)
+            job.ended = time.monotonic()
+            if not fired:
+                return None
+            world.box.wait_quiet()
+            job.killed = fault.kind == KILL and fault.kind_of in (CALL, TREE, MEMORY)
+            if job.status == 0:
+                found += [f"success: {text}" for text in difference(self.first, picture(world), job.output)]
+            try:
+                self.repeat(world)
+            except TimeoutError as late:
+                return found + [f"hang: afterwards {late}"]
+            found += [f"after: {text}" for text in difference(self.second, picture(world))]
+            return found + world.findings()
+
+
+def possible(road, calls, dice):
+    """Every fault of a road."""
+    for kind_of, index, name, subject in calls:
+        kind_of, index = int(kind_of), int(index)
+
+        def fault(forever, kind, error=EIO):
+            return Fault(road, kind_of, index, forever, kind, error, name, subject)
+
+        if kind_of == COMMAND:
+            for kind in (FAIL, KILL, NOTHING, MUTE, LATE):
+                yield fault(False, kind)
+            yield fault(True, FAIL)
+        elif kind_of == MEMORY:
+            yield fault(False, FAIL, ENOMEM)
+            yield fault(True, FAIL, ENOMEM)
+        else:
+            yield fault(False, FAIL, dice.choice([EIO, ENOSPC, EMFILE]))
+            yield fault(True, FAIL, dice.choice([EIO, ENOSPC, EMFILE]))
+            yield fault(False, KILL)
+
+
+class Faults:
+    """All roads: their clean walks, and the list of what can fail."""
+
+    def __init__(self, only="", seed=1):
+        from pairs import beginning
+
+        dice = random.Random(seed)
+        self.walks, self.all = {}, []
+        for name, road in ROADS.items():
+            if only and only != name:
+                continue
+            walk = self.walks[name] = Walk(road, beginning(*road.furnish))
+            self.all += possible(name, walk.clean(), dice)
+
+    def play(self, fault):
+        """(kind of finding, text) for what is wrong and not settled."""
+        found = self.walks[fault.road].suffer(fault)
+        if found is None:
+            return None
+        return [text for text in found if not settled.reason(fault, text)]
