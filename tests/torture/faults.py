@@ -36,7 +36,7 @@ ROADS = {
     road.name: road
     for road in (
         Road("init", FULL, ("init", {})),
-        Road("add", FULL, ("add", on(4, 0, "v40"))),
+        Road("add", FULL, ("add", on(4, 0, "v40")), heal=(("connect", on(4)),)),
         Road("add-connected", FULL, ("add", on(2, 1, "v21")), heal=(CONNECT_2,)),
         Road("connect", BLANK, CONNECT_1),
         Road("connect-again", FULL, CONNECT_1),
@@ -111,7 +111,7 @@ def difference(good, seen, output=""):
         if good.get(key) == seen.get(key):
             continue
         if key == "settings":
-            said = re.search(r"(?m)^\(.*(dump|saved|settings|vv\.xml)", output)
+            said = re.search(r"(?m)^(\(|remvol: ).*(dump|saved|settings|vv\.xml)", output)
             texts.append(f"settings differ{' (as the tree)' if seen[key] == seen['now'] else ' (said)' if said else ''}")
         elif key != "now":
             texts.append(f"{key}: {seen.get(key)} for {good.get(key)}")
@@ -137,6 +137,7 @@ class Walk:
             world.tool(command, **options)
 
     def repeat(self, world):
+        world.tool("status")  # the platform asks for it all the time
         self.begin(world)
         for command, options in (self.road.command, *self.road.heal, ("status", {})):
             world.tool(command, **options)

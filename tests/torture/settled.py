@@ -40,15 +40,24 @@ SUCCESS = (
 )
 
 AFTER = (
+    ("", r"tree /iscsi/initiator/id:\d+/lun/id:\d+/format_progress:",
+     "the progress of a format that came to an early end stays in the tree; nothing shows it"),
     (r"^(del|del_lun)$", r"(folder|mount|target|disk) ",
      "a slot is deleted although its volume could not be unmounted or its session closed, and the deletion that is "
      "asked for again finds no slot"),
 )
 
+PULLED = (
+    (r"^(disconnect|disconnect-all|del|modify|recover)$", r"logout",
+     "a volume that cannot be unmounted does not keep a session from being closed"),
+    (r"^(connect|connect-again|init|modify|recover)$", r"logout",
+     "a session in which no disk of the target can be found is closed again, whatever is mounted"),
+)
+
 
 def reason(fault, text):
     kind, _, rest = text.partition(": ")
-    table = {"success": SUCCESS, "after": AFTER}.get(kind, ())
+    table = {"success": SUCCESS, "after": AFTER, "pulled": PULLED}.get(kind, ())
     for roads, finding, why in table:
         if re.search(roads, fault.road) and re.match(finding, rest):
             return why
