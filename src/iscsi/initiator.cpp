@@ -13,6 +13,7 @@
 #include "iscsi/node.h"
 #include "support/command.h"
 #include "support/files.h"
+#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
@@ -140,7 +141,7 @@ void reload_modules(Caller caller) {
 
 InitiatorName write_initiator_name(Caller caller) {
   const InitiatorName name = make_initiator_name(caller);
-  run_command(CommandText("echo 'InitiatorName=%s' > %s", name.c_str(), kNameFile), caller);
+  run_command(shell_command("echo 'InitiatorName=%s' > %s", name.c_str(), kNameFile), caller);
   return name;
 }
 

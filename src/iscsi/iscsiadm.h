@@ -2,6 +2,10 @@
 //
 // Some put the target name between double quotes and some do not. What watches this tool's commands knows
 // them so.
+//
+// Values reach iscsiadm only as text; see shell_command. Refused besides, at level 0, is what would leave the
+// initiator's records: a target name or address with a component "..", and a user or secret with a line
+// break, behind which would stand another setting of the record. A refused command is one that fails.
 #ifndef REMVOL_ISCSI_ISCSIADM_H
 #define REMVOL_ISCSI_ISCSIADM_H
 
@@ -41,8 +45,8 @@ CommandText login_command(const TargetEntry& entry);
 CommandText portal_logout_command(const TargetEntry& entry);
 CommandText login_again_command(const TargetEntry& entry);
 
-// Logs out of every session to the target called `name`.
-CommandText logout_command(const char* name);
+// Logs out of every session to the target.
+CommandText logout_command(const TargetEntry& entry);
 
 }  // namespace remvol
 

@@ -57,7 +57,7 @@ int _target_chap_apply(TargetEntry* entry) {
 }
 
 int log_out(const TargetEntry* entry, Caller caller) {
-  return run_command(logout_command(entry->target_name), caller) == 0 ? 0 : 1;
+  return run_command(logout_command(*entry), caller) == 0 ? 0 : 1;
 }
 
 // Reads the output of a login until it says that a session to this node is already open.

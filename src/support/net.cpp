@@ -4,6 +4,7 @@
 #include <cstring>
 
 #include "frontend/log.h"
+#include "support/shell_text.h"
 #include "support/text.h"
 
 namespace remvol {
@@ -42,13 +43,16 @@ void store_group(unsigned char* address, int index, const char* group) {
 int ping_ip(const char* address, const char* interface) {
   if (address == nullptr || address[0] == '\0') return 0;
   const bool from_interface = interface != nullptr && interface[0] != '\0';
-  const Text<128> source(from_interface ? "-I %s " : "%s", from_interface ? interface : "");
   if (is_ipv6_text(address)) {
-    const CommandText command("ping -6 -W 1 -c 2 %s%s", source.c_str(), without_brackets(address).c_str());
+    const AddressText bare = without_brackets(address);
+    const CommandText command = from_interface
+                                    ? shell_command("ping -6 -W 1 -c 2 -I %s %s", interface, bare.c_str())
+                                    : shell_command("ping -6 -W 1 -c 2 %s", bare.c_str());
     LOG(2, "run cmd = %s", command.c_str());
     return system(command) == 0 ? 1 : 0;
   }
-  const CommandText command("ping -W 1 -c 2 %s%s", source.c_str(), address);
+  const CommandText command = from_interface ? shell_command("ping -W 1 -c 2 -I %s %s", interface, address)
+                                             : shell_command("ping -W 1 -c 2 %s", address);
   return system(command) == 0 ? 1 : 0;
 }
 

@@ -8,6 +8,7 @@
 #include "support/command.h"
 #include "support/locks.h"
 #include "support/result.h"
+#include "support/shell_text.h"
 #include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/connect.h"
@@ -92,8 +93,8 @@ void _keep_volumes(TargetEntry* entry) {
 
 // Starts a run in the background that comes back for the target after a while.
 void _postpone(const TargetEntry* entry, Caller caller) {
-  run_command(CommandText("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds,
-                          entry->target_name),
+  run_command(shell_command("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds,
+                            entry->target_name),
               caller);
 }
 

@@ -7,6 +7,7 @@
 
 #include "frontend/log.h"
 #include "support/format_semaphore.h"
+#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/state.h"
@@ -83,7 +84,7 @@ CommandText make_format_command(FsName& fs_type, const char* partition, Caller c
     copy_text(fs_type, kDefaultFs);
     command = find_format_command(fs_type);
   }
-  return CommandText("%s %s", command, partition);
+  return command_on_node(command, partition);
 }
 
 // Returns the running mke2fs, or null when it could not be started three times.
@@ -145,11 +146,11 @@ int make_file_system(TargetEntry* entry, const char* partition, Caller caller = 
   note_update(ktree_update_lun_status(entry, 1), caller);
   LOG_AT(caller, 2, "format partition %s", partition);
   wait_for_udev(partition);
-  System("fuser -mk \"%s\"", partition);
+  System("%s", shell_command("fuser -mk \"%s\"", partition).c_str());
   FsName fs_type;
   choose_fs(fs_type, partition, caller);
   if (!may_overwrite(entry, partition, caller)) return kRefused;
-  if (System("dd if=/dev/zero of=%s bs=1M count=1", partition) != 0) {
+  if (System("%s", shell_command("dd if=/dev/zero of=%s bs=1M count=1", partition).c_str()) != 0) {
     LOG_AT(caller, 1, "dd %s failed, this device is not able to write.", partition);
     return kNotWritable;
   }

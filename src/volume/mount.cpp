@@ -10,6 +10,7 @@
 
 #include "frontend/log.h"
 #include "support/result.h"
+#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/entry.h"
@@ -169,7 +170,7 @@ int keep_file_system(Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 1, "Got FS type = %s, skip creating volume", volume->fs_type);
   if (strcmp(volume->fs_type, "ext4") == 0 && sys_check_fs_state(volume->node) != 0) {
     volume->held.release();  // the look takes its time, and another run may kill who holds the node
-    System("e2fsck -n -f %s", volume->node.c_str());  // changes nothing
+    System("%s", command_on_node("e2fsck -n -f", volume->node).c_str());  // changes nothing
   }
   const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
   return note_update(result, caller) != 0 ? kTreeFailed : kOk;
@@ -225,7 +226,7 @@ int record_mount(const Volume* volume, Caller caller = Caller()) {
   ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
   if (strcmp(volume->fs_type, "ext4") == 0) {
     // A file system that is older than its partition's growth fills it in the background.
-    System("resize2fs -fp %s &", volume->node.c_str());
+    System("%s", shell_command("resize2fs -fp %s &", volume->node.c_str()).c_str());
   }
   note_update(ktree_update_volume_state(volume->entry, kVolumeNormal), caller);
   return open_to_everybody(volume, caller);

@@ -7,6 +7,7 @@
 #include <cstring>
 
 #include "support/files.h"
+#include "support/shell_text.h"
 #include "support/text.h"
 #include "volume/mount_point.h"
 
@@ -45,7 +46,7 @@ const MountCommand* find_command(const char* fs_type) {
 }
 
 CommandText full_command(const char* text, const char* node, const char* mount_point) {
-  return command_on_path(Text<256>("%s %s", text, node), mount_point);
+  return command_on_path(command_on_node(text, node), mount_point);
 }
 
 // Returns whether the mount took hold within its tries.

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "support/shell_text.h"
 #include "sysaux.h"
 
 namespace remvol {
@@ -87,7 +88,7 @@ bool is_share_inside_root(const char* share, Caller caller) {
 
 CommandText command_on_path(const char* verb, const char* path) {
   char escaped[CommandText::size() / 2];
-  if (str_insert_back_slash(escaped, sizeof escaped, path) != 0) return CommandText("false");
+  if (str_insert_back_slash(escaped, sizeof escaped, path) != 0) return CommandText("%s", kRefusedCommand);
   return CommandText("%s \"%s\"", verb, escaped);
 }
 

@@ -11,6 +11,7 @@
 #include "support/command.h"
 #include "support/files.h"
 #include "support/result.h"
+#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/entry.h"
@@ -38,7 +39,7 @@ constexpr size_t kFtpPathSize = 512;
 void kill_node_users(const TargetEntry* entry, Caller caller = Caller()) {
   if (is_foreign_disk(entry, entry->mnt_dev, caller)) return;
   wait_for_udev(entry->mnt_dev);
-  System("fuser -mk %s", entry->mnt_dev);
+  System("%s", command_on_node("fuser -mk", entry->mnt_dev).c_str());
 }
 
 void kill_users(const char* mount_point, Caller caller = Caller()) {
