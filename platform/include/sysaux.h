@@ -35,14 +35,15 @@ int sys_get_mac_addr(const char* interface, unsigned char mac[6]);
 /* Puts the host name into `out` of `size` bytes. Returns 0, or -1 when it is empty or does not fit. */
 int sys_hostname(char* out, size_t size);
 
-/* Returns the size of the block device whose path printf(format, ...) would print; 0 or less when unknown. */
+/* Returns the size of the block device whose path printf(format, ...) would print; 0 or less when unknown. A
+ * node missing in /dev is looked for in /sys/class/block, here and in sys_get_partition_list. */
 long long sys_get_disk_space(const char* format, ...) __attribute__((format(printf, 1, 2)));
 
 /* Writes the kernel names of the partitions of `device` (a path), joined by ",", into `out`, which holds at
  * least 1024 characters; names that do not fit are left out. Returns their number; -1 when `device` is no
  * block device, cannot be read, or has a GPT of which only the protective MBR can be used. Where the kernel
  * has not read the partition table, it is told of the partitions; they count also when it refuses them, so 0
- * means that there is no partition on the disk. */
+ * means that there is no partition on the disk, or none that the kernel knows when the node is missing. */
 int sys_get_partition_list(char* out, const char* device);
 
 /* Writes a new partition table (GPT) with one aligned partition of the type "Linux filesystem" that covers

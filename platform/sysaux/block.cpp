@@ -15,10 +15,24 @@
 
 namespace sysaux {
 
+// The sysfs path of the device that a node missing in /dev would be: /dev may be static, and the node be made
+// once the disk is known. sysfs has an exclamation mark for a slash.
+static bool named_block_dir_path(const char* node, char* path, size_t size) {
+  constexpr char kDev[] = "/dev/";
+  constexpr char kClass[] = "/sys/class/block/";
+  if (strncmp(node, kDev, strlen(kDev)) != 0 || node[strlen(kDev)] == '.') return false;
+  const int length = snprintf(path, size, "%s%s", kClass, node + strlen(kDev));
+  if (length < 0 || static_cast<size_t>(length) >= size) return false;
+  for (char* slash = path + strlen(kClass); (slash = strchr(slash, '/')) != nullptr;) *slash = '!';
+  return true;
+}
+
 // The sysfs path of the block device `node`; a link to the device's directory.
 static bool block_dir_path(const char* node, char* path, size_t size) {
   struct stat info;
-  if (node == nullptr || stat(node, &info) != 0 || !S_ISBLK(info.st_mode)) return false;
+  if (node == nullptr) return false;
+  if (stat(node, &info) != 0) return errno == ENOENT && named_block_dir_path(node, path, size);
+  if (!S_ISBLK(info.st_mode)) return false;
   snprintf(path, size, "/sys/dev/block/%u:%u", major(info.st_rdev), minor(info.st_rdev));
   return true;
 }

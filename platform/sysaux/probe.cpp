@@ -1,4 +1,5 @@
 // The module that recognises: file systems and partitions.
+#include <errno.h>
 #include <fcntl.h>
 #include <limits.h>
 #include <stdio.h>
@@ -50,6 +51,7 @@ int list_unread_table(const char* device, int block_dir, NameList* names) {
   char disk_name[32];
   char name[64];
   const Fd disk(open(device, O_RDONLY | O_CLOEXEC));
+  if (!disk.ok() && errno == ENOENT) return 0;  // without a node the kernel alone is asked
   if (!disk.ok() || !kernel_name(device, disk_name, sizeof disk_name)) return -1;
   const int count = read_table(disk.get(), extents, kMaxPartitions);
   for (int i = 0; i < count; ++i) {

@@ -320,6 +320,34 @@ def test_a_node_that_comes_late_is_waited_for(loop):
     assert out == "0\nthere\n"
 
 
+def test_a_disk_without_a_node_is_asked_for_in_sysfs(loop):
+    """The tool makes the node once it knows that there is a disk."""
+    disk = loop()
+    ask = "for call in disk_space partition_list; do $1 $call /dev/$2; done"
+    assert in_a_bare_dev(disk, ask) == f"{64 * MIB}\n0 \n"
+    assert call("create", disk.node) == 0
+    assert in_a_bare_dev(disk, ask) == f"{64 * MIB}\n1 {disk.name}p1\n"
+    assert in_a_bare_dev(disk, "$1 disk_space /dev/$2p1") == f"{62 * MIB}\n"
+
+
+def test_a_node_that_is_missing_makes_nothing_usable(loop):
+    disk = loop()
+    for name, result in (("check_dev", "-1"), ("fs_type", "-1 "), ("create", "-1"), ("expand", "-1")):
+        assert in_a_bare_dev(disk, f"$1 {name} /dev/$2 || :") == result + "\n", name
+    assert disk.partitions() == {}
+
+
+@pytest.mark.parametrize("path", ["/dev/", "/dev/.", "/dev/..", "/dev/../block/$2", "/dev/no_such_disk", "$2", "/x/$2",
+                                  "/dev/$2/"])
+def test_only_the_name_of_a_disk_is_asked_for_in_sysfs(loop, path):
+    assert in_a_bare_dev(loop(), f"$1 disk_space {path} || :") == "-1\n"
+
+
+@pytest.mark.parametrize("thing", ["touch /dev/$2", "mkdir /dev/$2", "mknod /dev/$2 c 1 3"])
+def test_what_stands_in_the_place_of_a_node_is_no_disk(loop, thing):
+    assert in_a_bare_dev(loop(), f"{thing}; $1 disk_space /dev/$2 || :") == "-1\n"
+
+
 def test_a_node_that_never_comes_is_waited_for_5_seconds(loop):
     disk = loop()
     begun = time.monotonic()
