@@ -48,8 +48,9 @@ int sys_get_partition_list(char* out, const char* device);
 
 /* Writes a new partition table (GPT) with one aligned partition of the type "Linux filesystem" that covers
  * the disk. Returns when the partition's node is in /dev, or after 5 seconds. Refused are a disk in use, one
- * with partitions, one that carries a file system, LVM, RAID, encryption or another signature of its own, and
- * one that cannot be read. What lies in the new partition's place stays as it is. Returns 0, or non-zero. */
+ * with partitions, one that carries a file system, LVM, RAID, encryption or another signature of its own, one
+ * on which only copies of a file system's lost first sectors are left, and one that cannot be read. What lies
+ * in the new partition's place stays as it is. Returns 0, or non-zero. */
 int sys_create_1_partition(const char* device);
 
 /* Grows the only partition of `device` (in a GPT, or a primary one in a DOS table, which ends at 2 TiB) to
@@ -66,9 +67,10 @@ int sys_check_dev(const char* node);
 /* Puts the name of the file system on `node` into `out`, which holds at least 16 characters: ext2, ext3,
  * ext4, vfat, ntfs, hfsplus, xfs, or what libblkid(3) calls it. Another signature (LVM, RAID, encryption,
  * swap, a partition table ...) counts and gives its name, cut to 15 characters; several that contradict each
- * other give "ambivalent", a device that reads at its start and fails further on gives "unreadable": neither
- * is empty. Returns 0; 1 when all places were examined and nothing was recognised; -1 when `node` is no block
- * device or cannot be read, so that nothing is known of it. `out` is the empty text in both. */
+ * other give "ambivalent", copies of a file system's lost first sectors "damaged_" and its kind, a device
+ * that reads at its start and fails further on "unreadable": none of them is empty. Returns 0; 1 when all
+ * places were examined and nothing was recognised; -1 when `node` is no block device or cannot be read, so
+ * that nothing is known of it. `out` is the empty text in both. */
 int sys_get_fs_type(char* out, const char* node);
 
 /* Returns non-zero when the ext2, ext3 or ext4 file system on `node` says of itself that it wants a check:

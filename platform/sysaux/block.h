@@ -13,9 +13,9 @@ namespace sysaux {
 constexpr long long kSectorBytes = 512;
 constexpr size_t kFirstMebibyte = 1 << 20;
 
-// Opens the sysfs directory of the block device that `node` (a path, links are followed) is. A node missing in
-// /dev is looked for by its name. Returns a descriptor, or -1 when it is no block device or the kernel has no
-// such device.
+// Opens the sysfs directory of the block device that `node` (a path, links are followed) is. A node missing
+// in /dev is looked for by its name. Returns a descriptor, or -1 when it is no block device or the kernel has
+// no such device.
 int open_block_dir(const char* node);
 
 // Writes the kernel name of the block device `node` into `name` of `size` bytes. Returns false when there is

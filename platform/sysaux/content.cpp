@@ -5,6 +5,7 @@
 #include <string.h>
 
 #include "block.h"
+#include "copies.h"
 
 namespace sysaux {
 
@@ -105,6 +106,22 @@ bool table_has_partitions(Probe& probe) {
   return probe.has_lost_gpt() || probe.partitions(&first, 1) > 0;
 }
 
+// What ends like a boot sector without a partition. Whoever makes a partition table gives it a number, so one
+// without belongs to something else: a file system whose first bytes are lost, or one that is not known here.
+bool is_unknown_boot_sector(Probe& probe) {
+  const char* table = probe.value("PTTYPE");
+  return table != nullptr && strcmp(table, "dos") == 0 && probe.value("PTUUID") == nullptr &&
+         !table_has_partitions(probe);
+}
+
+Content recognise_copy(int device, char name[16]) {
+  const char* found = nullptr;
+  if (!find_copy(device, &found)) return Content::unreadable;
+  if (found == nullptr) return Content::nothing;
+  snprintf(name, 16, "%.15s", found);
+  return Content::signature;
+}
+
 }  // namespace
 
 Content recognise(int device, char name[16]) {
@@ -123,12 +140,12 @@ Content recognise(int device, char name[16]) {
   if (answer != Answer::ambivalent && answer != Answer::failed && probe.value("TYPE") == nullptr) {
     answer = probe.run(BLKID_SUBLKS_BADCSUM);
   }
-  if (answer == Answer::nothing) return Content::nothing;
+  if (answer == Answer::nothing) return recognise_copy(device, name);
   if (answer != Answer::found && answer != Answer::ambivalent) return Content::unreadable;
   const char* type = answer == Answer::found ? probe.value("TYPE") : "ambivalent";
   const char* found = type != nullptr ? type : probe.value("PTTYPE");
   snprintf(name, 16, "%.15s", found != nullptr ? found : "unknown");
-  if (type != nullptr) return Content::signature;
+  if (type != nullptr || is_unknown_boot_sector(probe)) return Content::signature;
   return table_has_partitions(probe) ? Content::partitions : Content::empty_table;
 }
 

@@ -8,7 +8,7 @@ import zlib
 
 import pytest
 from harness.sysaux import (
-    CALL, MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, mounted, run, under_fault,
+    CALL, MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, mounted, read_at, run, under_fault,
 )
 
 __all__ = ["loop"]
@@ -268,12 +268,6 @@ def test_an_entry_that_recognition_takes_for_invalid_is_kept(loop):
     assert "start=        2048, size=       40960" in run("sfdisk", "-d", disk.node)
     assert call("partition_list", disk.node) == 0
     refused(disk)
-
-
-def read_at(disk, offset, size):
-    with open(disk.node, "rb", buffering=0) as device:
-        device.seek(offset)
-        return device.read(size)
 
 
 @pytest.mark.parametrize("label", ["dos", "gpt"])

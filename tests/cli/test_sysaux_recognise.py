@@ -103,7 +103,7 @@ def test_a_wrong_checksum_does_not_make_a_signature_invisible(loop):
 
 def test_the_cache_of_blkid_is_never_asked(loop):
     disk = loop()
-    make_ext(disk)
+    run("mkswap", disk.node)
     run("blkid", disk.node)
     run("wipefs", "-qa", disk.node)
     assert call("fs_type", disk.node) == 1

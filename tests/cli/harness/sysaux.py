@@ -193,6 +193,12 @@ def squashfs_head():
     return bytes(head)
 
 
+def read_at(disk, offset, size):
+    with open(disk.node, "rb", buffering=0) as device:
+        device.seek(offset)
+        return device.read(size)
+
+
 # --- faults ---
 
 

@@ -1,0 +1,90 @@
+#include "copies.h"
+
+#include <stdint.h>
+#include <unistd.h>
+
+#include <string_view>
+
+namespace sysaux {
+
+namespace {
+
+constexpr long long kKibi = 1024;
+constexpr long long kMebi = 1024 * kKibi;
+
+// Bytes that mark a copy. A negative place counts from the end of the device.
+struct Mark {
+  const char* name;
+  long long at;
+  std::string_view bytes;
+};
+
+// The places in sectors are those of disks with sectors of 512 and of 4096 bytes.
+constexpr Mark kMarks[] = {
+    {"damaged_vfat", 6 * 512 + 82, "FAT32   "},     {"damaged_vfat", 6 * 4096 + 82, "FAT32   "},
+    {"damaged_exfat", 12 * 512 + 3, "EXFAT   "},    {"damaged_exfat", 12 * 4096 + 3, "EXFAT   "},
+    {"damaged_btrfs", 64 * kMebi + 64, "_BHRfS_M"}, {"damaged_btrfs", 256 * (kKibi * kMebi) + 64, "_BHRfS_M"},
+    {"damaged_hfs", -1024, {"H+\0\4", 4}},          {"damaged_hfs", -1024, {"HX\0\5", 4}},
+    {"damaged_ntfs", -512, "\xebR\x90NTFS "},       {"damaged_ntfs", -4096, "\xebR\x90NTFS "},
+};
+
+enum class Found { yes, no, failed };
+
+// Reads from one place; what lies beyond an end of the device is not there.
+Found read_at(int device, long long end, long long at, void* data, size_t size) {
+  if (at < 0 || at + static_cast<long long>(size) > end) return Found::no;
+  return pread(device, data, size, at) == static_cast<ssize_t>(size) ? Found::yes : Found::failed;
+}
+
+Found has_mark(int device, long long end, const Mark& mark) {
+  char bytes[16];
+  const Found found = read_at(device, end, mark.at < 0 ? end + mark.at : mark.at, bytes, mark.bytes.size());
+  if (found != Found::yes) return found;
+  return mark.bytes == std::string_view(bytes, mark.bytes.size()) ? Found::yes : Found::no;
+}
+
+uint16_t little16(const unsigned char* bytes) {
+  return static_cast<uint16_t>(bytes[0] | bytes[1] << 8);
+}
+
+// The superblock that begins the second block group of an ext2, ext3 or ext4 with blocks of 1024 bytes
+// shifted by `shift`: a group has eight times as many blocks as a block has bytes.
+Found has_ext_copy(int device, long long end, int shift) {
+  constexpr int kBlockSizeAt = 24, kMagicAt = 56, kGroupAt = 90;
+  constexpr uint16_t kMagic = 0xEF53;
+  const long long block = kKibi << shift;
+  const long long at = (8 * block + (shift == 0 ? 1 : 0)) * block;
+  unsigned char super[92];
+  const Found found = read_at(device, end, at, super, sizeof super);
+  if (found != Found::yes) return found;
+  const bool fits = little16(super + kMagicAt) == kMagic && little16(super + kGroupAt) == 1 &&
+                    little16(super + kBlockSizeAt) == shift;
+  return fits ? Found::yes : Found::no;
+}
+
+// mkfs.xfs divides a device below 4 TiB into four allocation groups, each with a superblock at its start; in
+// larger ones a group has 1 TiB.
+Found has_xfs_copy(int device, long long end) {
+  constexpr long long kBlock = 4096;
+  constexpr long long kGroup = kMebi * kMebi;
+  const long long quarter = (end / kBlock + 3) / 4 * kBlock;
+  return has_mark(device, end, {"damaged_xfs", quarter < kGroup ? quarter : kGroup, {"XFSB\0\0", 6}});
+}
+
+}  // namespace
+
+bool find_copy(int device, const char** name) {
+  const long long end = lseek(device, 0, SEEK_END);
+  bool readable = end >= 0;
+  *name = nullptr;
+  const auto note = [&](Found found, const char* kind) {
+    if (found == Found::failed) readable = false;
+    if (found == Found::yes && *name == nullptr) *name = kind;
+  };
+  for (const Mark& mark : kMarks) note(has_mark(device, end, mark), mark.name);
+  for (int shift = 0; shift <= 2; ++shift) note(has_ext_copy(device, end, shift), "damaged_ext");
+  note(has_xfs_copy(device, end), "damaged_xfs");
+  return readable || *name != nullptr;
+}
+
+}  // namespace sysaux
