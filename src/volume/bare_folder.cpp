@@ -8,9 +8,11 @@
 #include <unistd.h>
 
 #include <climits>
+#include <cstdio>
 #include <cstring>
 
 #include "support/text.h"
+#include "volume/cover.h"
 #include "volume/mount_point.h"
 
 namespace remvol {
@@ -69,6 +71,49 @@ void walk_to(const char* path, Act act) {
   }
 }
 
+struct Renaming {
+  const char* from;
+  const char* to;
+};
+
+bool rename_folder(const void* what) {
+  const auto* renaming = static_cast<const Renaming*>(what);
+  return renameat2(AT_FDCWD, renaming->from, AT_FDCWD, renaming->to, RENAME_NOREPLACE) == 0;
+}
+
+// The name that a folder is made under. A killed run may have left it.
+Path draft_of(const char* path) {
+  const char* name = strrchr(path, '/') + 1;
+  return Path("%.*s.new-%s", static_cast<int>(name - path), path, name);
+}
+
+// Makes the folder under another name first, so that it has the flag before anybody can reach it under its
+// own. Does nothing where that cannot be had.
+void make_unseen(const char* path) {
+  const Path draft = draft_of(path);
+  rmdir(draft);
+  if (access(path, F_OK) == 0 || mkdir(draft, 0777) != 0) return;
+  const Folder folder(draft);
+  const Renaming renaming = {draft, path};
+  if (folder.is_bare() && run_covered(draft, rename_folder, &renaming)) {
+    folder.set_immutable(true);
+    lift_cover(path);
+  } else {
+    rmdir(draft);
+  }
+}
+
+struct Removal {
+  const Folder* folder;
+  const char* path;
+};
+
+bool remove_folder(const void* what) {
+  const auto* removal = static_cast<const Removal*>(what);
+  removal->folder->set_immutable(false);
+  return rmdir(removal->path) == 0;
+}
+
 }  // namespace
 
 void make_bare_folder(const char* path) {
@@ -76,6 +121,7 @@ void make_bare_folder(const char* path) {
     release(parent);  // a killed run may have left it, of a share that is named so
     mkdir(parent, 0777);
   });
+  make_unseen(path);
   mkdir(path, 0777);
   const Folder folder(path);
   if (folder.is_bare()) folder.set_immutable(true);
@@ -83,11 +129,12 @@ void make_bare_folder(const char* path) {
 
 void drop_bare_folder(const char* path) {
   walk_to(path, release);
+  rmdir(draft_of(path));
   nftw(path, release_below, kOpenFolders, FTW_PHYS | FTW_MOUNT);
   const Folder folder(path);
   if (!folder.is_bare()) return;
-  folder.set_immutable(false);
-  rmdir(path);
+  const Removal removal = {&folder, path};
+  if (!run_covered(path, remove_folder, &removal)) remove_folder(&removal);
 }
 
 }  // namespace remvol

@@ -1,6 +1,7 @@
 """From a bare LUN to a mounted folder and back, on real disks with the real commands."""
 
 import os
+import random
 import signal
 import stat
 
@@ -400,6 +401,23 @@ def test_a_share_name_that_leads_out_is_refused(luns, name):
 
 # --- the folder below a mount ---
 
+WRITER = """
+import itertools, os
+kept = open("/tmp/acknowledged", "w", buffering=1)
+for number in itertools.count():
+    name = f"file{number}"
+    try:
+        fd = os.open("/mnt/VV/share1/" + name, os.O_CREAT | os.O_EXCL | os.O_WRONLY)
+        os.write(fd, b"x")
+        os.fsync(fd)
+        os.close(fd)
+    except OSError:
+        continue
+    print(name, file=kept)
+"""
+ROUNDS = int(os.environ.get("REMVOL_ROUNDS", "10"))
+
+
 @pytest.fixture
 def ext4_root(luns):
     """The mount root on an ext4 of its own, as on a machine."""
@@ -417,6 +435,56 @@ def ext4_root(luns):
 
 def immutable(lun, path):
     return "i" in lun.box.run(["/usr/bin/lsattr", "-d", path]).stdout.split()[0]
+
+
+def test_files_written_while_a_volume_comes_and_goes_are_on_the_volume(ext4_root):
+    """A root writer beside unmount and mount: what it was told is kept was kept."""
+    lun = ext4_root
+    lun.mount()
+    lun.box.fake("fuser", first=True)  # nobody is killed
+    writer = lun.box.start(["/usr/bin/python3", "-c", WRITER], env={"LD_PRELOAD": None})
+    acknowledged = lun.box.path("/tmp/acknowledged")
+    lun.box.wait_until(lambda: acknowledged.exists() and acknowledged.stat().st_size > 100)
+    for _ in range(ROUNDS):
+        before = acknowledged.stat().st_size
+        assert lun.unmount().result == 0
+        assert lun.mount().result == 0
+        lun.box.wait_until(lambda: acknowledged.stat().st_size > before)
+    writer.kill()
+    writer.wait()
+    names = set(acknowledged.read_text().split())
+    print(f"{ROUNDS} rounds, {len(names)} files, lost {len(names - set(os.listdir(lun.path())))}")
+    assert names <= set(os.listdir(lun.path()))
+    assert lun.unmount().result == 0
+    assert left_below_root(lun) == ["lost+found"]
+
+
+def left_below_root(lun):
+    """What the mount root holds, and what is mounted in it."""
+    mounts = open(f"/proc/{lun.box.pid}/mounts", encoding="utf-8").read().splitlines()
+    return sorted(os.listdir(lun.box.path("/mnt/VV"))) + [line for line in mounts if " /mnt/VV/" in line]
+
+
+@pytest.mark.parametrize("seed", range(4))
+def test_a_run_that_is_killed_anywhere_leaves_a_folder_that_is_used_again(ext4_root, seed):
+    lun = ext4_root
+    lun.mount()
+    keep_files(lun)
+    moments = random.Random(seed)
+    for number in range(12):
+        operation = ["unmount", "1", "1"] if number % 2 == 0 else ["mount", "1", "1", "0", "0"]
+        run_to_kill = lun.box.start([str(lun.box.tools / "volume_driver"), *operation])
+        lun.box.pump(moments.uniform(0, 0.06))
+        run_to_kill.kill()
+        run_to_kill.wait()
+        lun.box.wait_quiet()
+        if number % 3 == 2:
+            assert lun.mount().result == 0
+            assert_files(lun)
+    assert lun.mount().result == 0
+    assert_files(lun)
+    assert lun.unmount().result == 0
+    assert left_below_root(lun) == ["lost+found"]
 
 
 def test_a_bare_folder_takes_nothing(ext4_root):

@@ -9,6 +9,7 @@
 #include <fstream>
 
 #include "volume/bare_folder.h"
+#include "volume/cover.h"
 #include "volume_fixture.h"
 
 using namespace remvol;
@@ -190,6 +191,49 @@ TEST_F(MountedPath, TheRootOfAVolumeIsNeverFlagged) {
   drop_bare_folder(path.c_str());
   drop_bare_folder((path + "/inner").c_str());
   EXPECT_TRUE(std::filesystem::exists(path + "/inner"));
+}
+
+// Runs in the process aside; the others' view is that of its parent.
+bool others_cannot_write(const void* path) {
+  const auto* name = static_cast<const char*>(path);
+  std::string file = "/proc/" + std::to_string(getppid()) + "/root" + name + "/file";
+  const bool refused = open(file.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600) < 0 && errno == EROFS;
+  file = std::string(name) + "/aside";
+  return refused && open(file.c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0600) >= 0 &&
+         unlink(file.c_str()) == 0;
+}
+
+bool fails(const void*) {
+  return false;
+}
+
+TEST_F(MountedPath, WhileAFolderIsChangedOthersFindACover) {
+  EXPECT_TRUE(run_covered(path.c_str(), others_cannot_write, path.c_str()));
+  MountLine cover;
+  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::yes) << "the caller's to lift";
+  lift_cover(path.c_str());
+  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::no);
+}
+
+TEST_F(MountedPath, ACoverGoesWhenTheWorkFails) {
+  EXPECT_FALSE(run_covered(path.c_str(), fails, nullptr));
+  MountLine cover;
+  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::no);
+  EXPECT_FALSE(run_covered("/mnt/VV/none", others_cannot_write, path.c_str())) << "nothing to cover";
+}
+
+TEST_F(MountedPath, NothingIsLeftOfTheMakingAndTheRemoval) {
+  std::filesystem::remove(path);
+  std::filesystem::create_directory("/mnt/VV/.new-Data");  // of a killed run
+  make_bare_folder(path.c_str());
+  EXPECT_TRUE(is_immutable(path));
+  EXPECT_FALSE(std::filesystem::exists("/mnt/VV/.new-Data"));
+  MountLine cover;
+  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::no);
+  std::filesystem::create_directory("/mnt/VV/.new-Data");
+  drop_bare_folder(path.c_str());
+  EXPECT_TRUE(std::filesystem::is_empty("/mnt/VV"));
+  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::no);
 }
 
 TEST_F(MountedPath, SharesBelowAFolderThatAKilledRunLeft) {
