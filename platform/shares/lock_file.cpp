@@ -30,7 +30,7 @@ void put_folder_aside() {
 
 int open_folder() {
   for (int i = 0; i < kTries; i++) {
-    mkdir(kFolder, 0755);
+    mkdir(kFolder, 0700);
     const int folder = open(kFolder, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
     if (folder >= 0 && is_ours(folder, S_IFDIR, kOthersWrite)) return folder;
     if (folder >= 0) close(folder);

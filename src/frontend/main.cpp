@@ -12,6 +12,7 @@
 #include "frontend/remvol_debug.h"
 #include "frontend/request.h"
 #include "ktreec.h"
+#include "support/run_lock.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
@@ -50,13 +51,18 @@ bool is_strangers_file(const char* path) {
 
 void copy_to_flash(Caller caller) {
   if (access(kResetMark, F_OK) == 0 && !is_strangers_file(kResetMark)) return;
+  RunLock lock;
+  lock.take("flash.lock", LockMode::kExclusive);  // the last to copy copies the newest settings
   if (System("flashrun \"cp -f %s /usr/local/config/\"", kSettingsFile) == 0) return;
   LOG_AT(caller, 0, "%s could not be copied to the configuration flash", kSettingsFile);
 }
 
 int succeed(const Command& command, int result, Caller caller) {
   record_result(NumberText("%d", result));
+  RunLock lock;
+  lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one
   const bool stored = store_settings(caller);
+  lock.release();
   if (command.persists && stored) copy_to_flash(caller);
   if (command.persists) reload_share_services();
   return result;

@@ -1,0 +1,181 @@
+"""Runs beside one another, and what a killed run leaves to the next."""
+
+import re
+import time
+
+import pytest
+
+from appliance import INITIATOR, messages
+
+LOGIN = re.compile("^iscsiadm -m node -T iqn.t1 .*--login$")
+MOUNT = re.compile("^mount -t ext4 ")
+
+
+@pytest.fixture
+def stored(site):
+    """A target with a LUN, offered by its portal but not logged in."""
+    site.store("iqn.t1", conn_set=0, luns=[("a", 0)])
+    site.offer("iqn.t1", {0: "sdb"})
+    site.disk("sdb")
+    return site
+
+
+def status(box):
+    done = box.remvol("--status")
+    assert done.status == 0
+    return done
+
+
+def until(condition, seconds=10):
+    end = time.monotonic() + seconds
+    while not condition():
+        assert time.monotonic() < end, "waited for too long"
+        time.sleep(0.02)
+
+
+def held(box, lock):
+    """Shell text that says whether the lock is held: "1" in /root/held."""
+    return f"flock -n /run/remvol/{lock} true; echo $? >/root/held"
+
+
+class TestStandingBehindAState:
+    def test_a_connection_under_way_stays_connecting(self, stored, box):
+        box.hook("popen", LOGIN, through=True, delay=1)
+        run = box.start(["remvol", "--connect", "-n", "iqn.t1"])
+        until(lambda: any(call.kind == "popen" for call in box.calls))
+        status(box)
+        assert (stored.target("status"), stored.target("conn_state")) == ("Connecting", "2")
+        assert run.wait().status == 0
+        assert (stored.target("status"), stored.lun("status")) == ("Connected", "Running")
+
+    def test_a_killed_connection_is_put_right(self, stored, box):
+        box.hook("popen", LOGIN, through=True, effect="kill -KILL $PPID", times=1)
+        assert box.remvol("--connect", "-n", "iqn.t1").status == -9
+        assert stored.target("conn_state") == "2"
+        status(box)
+        assert (stored.target("status"), stored.target("conn_state")) == ("Disconnected", "0")
+
+    def test_a_state_that_nobody_is_known_to_have_worked_on_stays(self, stored, box):
+        box.tree.set(f"{INITIATOR}/id:1/conn_state", 2)
+        status(box)
+        assert stored.target("status") == "Connecting"
+
+    def test_a_killed_creation_of_a_volume_is_put_right(self, stored, box):
+        box.hook("system", MOUNT, through=True, effect="kill -KILL $PPID", times=1)
+        assert box.remvol("--connect", "-n", "iqn.t1").status == -9
+        assert stored.lun("volume_state") == "1"
+        status(box)
+        assert (stored.lun("volume_state"), stored.lun("status")) == ("0", "No Format")
+
+    @pytest.mark.parametrize("state", [1, 4])
+    def test_a_killed_format_is_put_right(self, stored, box, state):
+        stored.log_in("iqn.t1")
+        box.tree.set({f"{INITIATOR}/id:1/lun/id:1/dev": "sdb", f"{INITIATOR}/id:1/lun/id:1/format_progress": 26})
+        box.hook("ktreec_set", f"{INITIATOR}/id:1/lun/id:1/format_state", value=str(state), through=True,
+                 effect="kill -KILL $PPID", times=1)
+        assert box.remvol("--format", "-n", "iqn.t1", "-l", "0").status == -9
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/format_state", state)
+        status(box)
+        assert (stored.lun("format_state"), stored.lun("volume_state")) == ("0", "0")
+        assert not stored.lun("status").startswith(("Formatting", "Wait", "Creating"))
+
+    def test_a_format_whose_mke2fs_goes_on_stays_formatting(self, stored, box):
+        stored.log_in("iqn.t1")
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/dev", "sdb")
+        box.hook("ktreec_set", f"{INITIATOR}/id:1/lun/id:1/format_state", value="1", through=True,
+                 effect="kill -KILL $PPID", times=1)
+        assert box.remvol("--format", "-n", "iqn.t1", "-l", "0").status == -9
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/format_state", 1)
+        program = box.start(["bash", "-c", "echo mke2fs >/proc/self/comm; sleep 30; true", "mke2fs", "/dev/sdb1"])
+        until(lambda: any("mke2fs" in p.read_text() for p in box.path("/proc").glob("[0-9]*/comm")))
+        status(box)
+        program.kill()
+        assert stored.lun("status").startswith("Formatting")
+
+
+class TestOneAfterAnother:
+    def test_two_connections_of_a_target_follow_one_another(self, stored, box):
+        box.hook("popen", LOGIN, through=True, delay=0.5, times=1)
+        runs = [box.start(["remvol", "--connect", "-n", "iqn.t1"]) for _ in range(2)]
+        assert [run.wait().status for run in runs] == [0, 0]
+        assert (stored.target("status"), stored.lun("status")) == ("Connected", "Running")
+        dumps = [n for n, line in enumerate(box.trace("popen", "dump")) if line.startswith("dump")]
+        assert dumps == [1, 3]  # each logs in when the other has ended
+
+    def test_a_target_that_is_taken_away_is_not_brought_up_meanwhile(self, stored, box):
+        box.hook("popen", LOGIN, through=True, delay=0.5, times=1)
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t1"])
+        until(lambda: any(call.kind == "popen" for call in box.calls))
+        box.sleep_takes(100)
+        assert box.remvol("--disconnect", "-n", "iqn.t1").status == 0
+        assert connect.wait().status == 0
+        assert not stored.mounted("a") and not stored.logged_in("iqn.t1")
+        assert (stored.target("conn_set"), stored.target("conn_state")) == ("0", "0")
+
+    def test_settings_are_dumped_by_one_run_at_a_time(self, stored, box):
+        box.hook("ktreec_dump", through=True, effect=held(box, "settings.lock"))
+        status(box)
+        assert box.path("/root/held").read_text() == "1\n"
+
+    def test_the_flash_gets_one_copy_at_a_time(self, stored, box):
+        box.fake("flashrun", effect=held(box, "flash.lock"))
+        assert box.remvol("--disconnect", "-n", "iqn.t1").status == 0
+        assert box.path("/root/held").read_text() == "1\n"
+
+
+class TestAdding:
+    ADD = ["--add", "-n", "iqn.t1", "-l", "0", "-i", "10.9.0.2", "-p", "3260", "-s", "a"]
+
+    def test_storing_is_one_step_for_other_runs(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        box.hook("ktreec_set", f"{INITIATOR}/id:1/lun/id:1/share", through=True, effect=held(box, "slots.lock"))
+        assert box.remvol(*self.ADD).status == 0
+        assert box.path("/root/held").read_text() == "1\n"
+
+    @pytest.mark.parametrize("moment", ["target", "ip", "port", "lun/id:1/lun", "lun/id:1/share", "lun/id:1/enable"])
+    def test_what_a_killed_run_began_is_completed(self, site, box, moment):
+        site.offer("iqn.t1", {0: "sdb"})
+        box.hook("ktreec_set", f"{INITIATOR}/id:1/{moment}", through=True, effect="kill -KILL $PPID", times=1)
+        assert box.remvol(*self.ADD).status == -9
+        second = box.remvol(*self.ADD)
+        stored_whole = moment == "lun/id:1/enable"  # number and share are there: it is a LUN
+        assert second.status == (255 if stored_whole else 0)
+        assert (site.lun("lun"), site.lun("share")) == ("0", "a")
+        assert site.lun("lun", 2) is None
+
+    def test_two_at_once_with_one_share_name(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        site.offer("iqn.t2", {0: "sdc"})
+        other = [*self.ADD[:2], "iqn.t2", *self.ADD[3:]]
+        runs = [box.start(["remvol", *args]) for args in (self.ADD, other)]
+        assert sorted(run.wait().status for run in runs) == [0, 255]
+
+
+class TestStrangersAndTemporaryFiles:
+    def test_a_run_beside_another_lists_into_a_file_of_its_own(self, stored, box):
+        box.fake("iscsiadm", "-m session", exact=True, delay=1, times=1, status=21)
+        first = box.start(["remvol", "--status"])
+        until(lambda: box.runs("iscsiadm"))
+        until(lambda: any("-m session >" in line for line in box.shell()))
+        status(box)
+        first.wait()
+        files = {line.split(">")[1].split()[0] for line in box.shell() if line.startswith("iscsiadm -m session >")}
+        assert "/tmp/remvol_session.tmp" in files and len(files) == 2
+        assert not [p.name for p in box.path("/tmp").iterdir() if re.search(r"\.tmp\.\d", p.name)]
+
+    def test_a_lock_folder_of_another_user_is_replaced(self, stored, box):
+        folder = box.path("/var/lock/virtual_volume")
+        folder.mkdir(parents=True)
+        box.run(["sh", "-c", "chown 1234 /var/lock/virtual_volume; ln -s /root/victim /var/lock/virtual_volume/remvol_recover.lock"])
+        box.tree.set({f"{INITIATOR}/id:1/conn_set": 1, f"{INITIATOR}/id:1/conn_state": 3})
+        box.remvol("--oiscsi_evt_recover", "-n", "iqn.t1")
+        assert not box.path("/root/victim").exists()
+        assert folder.stat().st_uid == 0 and folder.stat().st_mode & 0o777 == 0o700
+
+    def test_an_error_of_a_lock_that_stays_ends_the_tries(self, stored, box):
+        box.tree.set({f"{INITIATOR}/id:1/conn_set": 1, f"{INITIATOR}/id:1/conn_state": 3})
+        box.hook("fcntl", "lock", ret=-1, errno=37)
+        done = box.remvol("--oiscsi_evt_recover", "-n", "iqn.t1")
+        assert done.status == 255
+        assert "lock failed for iqn.t1, skip and exit" in messages(done)
+        assert len(box.trace("fcntl")) < 200
