@@ -82,7 +82,8 @@ def picture(world):
     def plain(text):
         return re.sub(r"\bsd[b-z](?=1?\b)", lambda m: names.get(m[0], "<gone>"), text)
 
-    seen = {f"tree {path}": plain(value) for path, value in world.tree().items() if not path.startswith("/result")}
+    tree = world.tree()  # in which an empty value is as good as none
+    seen = {f"tree {path}": plain(value) for path, value in tree.items() if value and not path.startswith("/result")}
     for t, (online, record, _, luns) in state.items():
         if record or online:
             seen[f"target {t}"] = f"online={online} record={record}"
@@ -111,8 +112,9 @@ def difference(good, seen, output=""):
         if good.get(key) == seen.get(key):
             continue
         if key == "settings":
-            said = re.search(r"(?m)^(\(|remvol: ).*(dump|saved|settings|vv\.xml)", output)
-            texts.append(f"settings differ{' (as the tree)' if seen[key] == seen['now'] else ' (said)' if said else ''}")
+            if seen[key] != seen["now"]:  # else it is the tree that differs
+                said = re.search(r"(?m)^(\(|remvol: ).*(dump|saved|settings|vv\.xml)", output)
+                texts.append(f"settings differ{' (said)' if said else ''}")
         elif key != "now":
             texts.append(f"{key}: {seen.get(key)} for {good.get(key)}")
     return texts

@@ -20,8 +20,6 @@ SUCCESS = (
      "whether the wish to be connected was stored is not looked at"),
     ("", r"settings differ \(said\)",
      "the result of the dump is not looked at; that it failed is told at level 0"),
-    ("", r"settings differ \(as the tree\)",
-     "the dump holds what the tree holds, and the tree lacks what is explained above"),
     (BRINGS_UP, r"(disk|folder|mount) ",
      "a volume that cannot be mounted is told by its volume state and fails no command that brings a target up"),
     (r"^(modify|init|recover)$", r"target \d",
