@@ -605,6 +605,34 @@ def test_a_dump_is_on_the_disk_before_it_gets_the_name_and_the_folder_after_it(d
     assert ".tmp>" in lines[0] and f"{daemon.folder}>" in lines[2]
 
 
+def test_what_killed_dumps_left_is_removed_by_the_next(daemon):
+    file = daemon.folder / "vv.xml"
+    daemon.set("/a", "secret")
+    assert traced_dump(daemon, file, "fsync:signal=SIGKILL:when=1").returncode != 0
+    assert [name for name in os.listdir(daemon.folder) if name.endswith(".tmp")]
+    (daemon.folder / "vv.xml.77.tmp").touch()
+    kept = ["other.xml.77.tmp", "vv.xml.7x.tmp", "vv.xml..tmp", "vv.xml.77.tmp~", "vv.xml.78.tmp", "vv.xml.79.tmp"]
+    for name in kept[:-2]:
+        (daemon.folder / name).touch()
+    (daemon.folder / "vv.xml.78.tmp").mkdir()
+    os.mkfifo(daemon.folder / "vv.xml.79.tmp")
+    assert daemon.run("-D", file).returncode == 0
+    assert sorted(os.listdir(daemon.folder)) == sorted(["sock", "sock_config.pid", "vv.xml", *kept])
+
+
+def test_what_a_living_dump_writes_is_left_to_it(daemon):
+    file = daemon.folder / "vv.xml"
+    daemon.set("/a", "new")
+    slow = subprocess.Popen(["strace", "-f", "-o", "/dev/null", "-e", "trace=fsync", "-e",
+                             "inject=fsync:delay_enter=1500000:when=1", KTREEC, "-S", daemon.socket, "-D", file],
+                            env=TRACED)
+    until(lambda: [name for name in os.listdir(daemon.folder) if name.endswith(".tmp")])
+    assert daemon.run("-D", file).returncode == 0
+    assert [name for name in os.listdir(daemon.folder) if name.endswith(".tmp")]
+    assert slow.wait(20) == 0
+    assert sorted(os.listdir(daemon.folder)) == ["sock", "sock_config.pid", "vv.xml"]
+
+
 def test_a_temporary_file_of_the_same_name_is_in_nobodys_way(daemon):
     # The name holds the number of the process, which exec keeps.
     target = daemon.folder / "precious"

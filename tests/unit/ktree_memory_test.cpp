@@ -28,6 +28,15 @@ void* allocate(size_t size) {
 [[gnu::noinline]] void* operator new(size_t size, const std::nothrow_t&) noexcept {
   return allocate(size);
 }
+[[gnu::noinline]] void* operator new[](size_t size) {
+  return operator new(size);
+}
+[[gnu::noinline]] void operator delete[](void* block) noexcept {
+  free(block);
+}
+[[gnu::noinline]] void operator delete[](void* block, size_t) noexcept {
+  free(block);
+}
 [[gnu::noinline]] void operator delete(void* block) noexcept {
   free(block);
 }

@@ -1,6 +1,8 @@
 #include "ktree/client/document.h"
 
+#include <dirent.h>
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -54,25 +56,84 @@ int copy_all(int from, int to) {
   }
 }
 
+constexpr char kTemporaryEnd[] = ".tmp";
+
+// Opens the folder of `file`. Returns -1, with errno, when it cannot be had.
+int open_folder_of(const char* file) {
+  char folder[PATH_MAX];
+  const char* slash = strrchr(file, '/');
+  const size_t length = slash == nullptr ? 0 : static_cast<size_t>(slash - file) + 1;
+  if (length >= sizeof folder) {
+    errno = ENAMETOOLONG;
+    return -1;
+  }
+  memcpy(folder, file, length);
+  folder[length] = '\0';
+  return open(length == 0 ? "." : folder, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+}
+
+// True when `name` is "FILE.NUMBER.tmp" of the file called `file`.
+bool is_temporary_of(const char* name, const char* file) {
+  const size_t length = strlen(file);
+  if (strncmp(name, file, length) != 0 || name[length] != '.') {
+    return false;
+  }
+  const char* number = name + length + 1;
+  const size_t digits = strspn(number, "0123456789");
+  return digits > 0 && strcmp(number + digits, kTemporaryEnd) == 0;
+}
+
+// Removes `name` in the folder when it was left by a process of this user that died: a living one has it
+// locked.
+void remove_left_over(int folder, const char* name) {
+  const int fd = openat(folder, name, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
+  struct stat info = {};
+  if (fd >= 0 && fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && info.st_uid == geteuid() &&
+      flock(fd, LOCK_EX | LOCK_NB) == 0) {
+    unlinkat(folder, name, 0);
+  }
+  if (fd >= 0) {
+    close(fd);
+  }
+}
+
+// A process that is killed in the middle of a dump leaves its file behind, with all that the settings hold.
+void remove_left_overs_of(const char* file) {
+  const int folder = open_folder_of(file);
+  DIR* entries = folder < 0 ? nullptr : fdopendir(folder);
+  if (entries == nullptr) {
+    if (folder >= 0) {
+      close(folder);
+    }
+    return;
+  }
+  const char* slash = strrchr(file, '/');
+  while (const dirent* entry = readdir(entries)) {
+    if (is_temporary_of(entry->d_name, slash == nullptr ? file : slash + 1)) {
+      remove_left_over(folder, entry->d_name);
+    }
+  }
+  closedir(entries);
+}
+
 // A file that is about to take the place of another one; removed again unless it did.
 class Replacement {
  public:
   // Makes it in the folder of `file`. Returns 0 or an errno value. The name holds the process and thread, so
   // what is there already was left by one that died.
   int create(const char* file) {
-    const int length = snprintf(path_, sizeof path_, "%s.%ld.tmp", file, static_cast<long>(gettid()));
+    remove_left_overs_of(file);
+    const int length =
+        snprintf(path_, sizeof path_, "%s.%ld%s", file, static_cast<long>(gettid()), kTemporaryEnd);
     if (length < 0 || static_cast<size_t>(length) >= sizeof path_) {
       path_[0] = '\0';
       return ENAMETOOLONG;
     }
-    unlink(path_);
-    fd_ = open(path_, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-    if (fd_ < 0) {
-      path_[0] = '\0';
-      return errno;
+    int wrong = make();
+    for (int i = 0; i < kCreateTries && wrong == EBUSY; i++) {
+      wrong = make();
     }
-    // The process's mask may take bits away; it cannot add any.
-    return fchmod(fd_, 0600) == 0 ? 0 : errno;
+    return wrong;
   }
 
   // Writes it to the disk and gives it the name `file`. Returns 0 or an errno value.
@@ -104,21 +165,35 @@ class Replacement {
   }
 
  private:
+  static constexpr int kCreateTries = 10;
+
+  // Makes and locks the file. Returns 0 or an errno value: EBUSY when another process took it for one that
+  // was left behind, before it was locked.
+  int make() {
+    unlink(path_);
+    fd_ = open(path_, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
+    if (fd_ < 0) {
+      path_[0] = '\0';
+      return errno;
+    }
+    struct stat info = {};
+    const bool locked = flock(fd_, LOCK_EX | LOCK_NB) == 0 || errno != EWOULDBLOCK;
+    if (!locked || fstat(fd_, &info) != 0 || info.st_nlink == 0) {
+      close(fd_);
+      fd_ = -1;
+      return EBUSY;
+    }
+    // The process's mask may take bits away; it cannot add any.
+    return fchmod(fd_, 0600) == 0 ? 0 : errno;
+  }
+
   int fd_ = -1;
   char path_[PATH_MAX] = "";
 };
 
 // A rename is on the disk when its folder is.
 int sync_folder_of(const char* file) {
-  char folder[PATH_MAX];
-  const char* slash = strrchr(file, '/');
-  const size_t length = slash == nullptr ? 0 : static_cast<size_t>(slash - file) + 1;
-  if (length >= sizeof folder) {
-    return ENAMETOOLONG;
-  }
-  memcpy(folder, file, length);
-  folder[length] = '\0';
-  const int fd = open(length == 0 ? "." : folder, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  const int fd = open_folder_of(file);
   if (fd < 0) {
     return errno;
   }
