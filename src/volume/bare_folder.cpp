@@ -42,6 +42,16 @@ class Folder {
     return own.st_dev == root.st_dev && (place.stx_attributes & STATX_ATTR_MOUNT_ROOT) == 0;
   }
 
+  bool knows_flags() const {
+    int flags = 0;
+    return ioctl(fd_, FS_IOC_GETFLAGS, &flags) == 0;
+  }
+
+  bool is_immutable() const {
+    int flags = 0;
+    return ioctl(fd_, FS_IOC_GETFLAGS, &flags) == 0 && (flags & FS_IMMUTABLE_FL) != 0;
+  }
+
   void set_immutable(bool on) const {
     int flags = 0;
     if (ioctl(fd_, FS_IOC_GETFLAGS, &flags) != 0) return;
@@ -95,7 +105,7 @@ void make_unseen(const char* path) {
   if (access(path, F_OK) == 0 || mkdir(draft, 0777) != 0) return;
   const Folder folder(draft);
   const Renaming renaming = {draft, path};
-  if (folder.is_bare() && run_covered(draft, rename_folder, &renaming)) {
+  if (folder.is_bare() && folder.knows_flags() && run_covered(draft, rename_folder, &renaming)) {
     folder.set_immutable(true);
     lift_cover(path);
   } else {
@@ -132,7 +142,7 @@ void drop_bare_folder(const char* path) {
   rmdir(draft_of(path));
   nftw(path, release_below, kOpenFolders, FTW_PHYS | FTW_MOUNT);
   const Folder folder(path);
-  if (!folder.is_bare()) return;
+  if (!folder.is_bare() || !folder.is_immutable()) return;
   const Removal removal = {&folder, path};
   if (!run_covered(path, remove_folder, &removal)) remove_folder(&removal);
 }

@@ -12,8 +12,8 @@ namespace remvol {
 // Requires a path below the mount root. A folder that a killed run left is used again.
 void make_bare_folder(const char* path);
 
-// Takes the flag off the folder and those below it, and removes the folder when it is empty, so that there is
-// no moment in which it could take data. Requires that nothing is mounted on the path or below it.
+// Takes the flag off the folder and those below it. One that has it is removed here when it is empty: there
+// is no moment in which it could take data. Requires that nothing is mounted on the path or below it.
 void drop_bare_folder(const char* path);
 
 }  // namespace remvol

@@ -4,6 +4,7 @@ import os
 import random
 import signal
 import stat
+import string
 
 import pytest
 from harness.sysaux import Loop, image, make_ambivalent, make_ext, md_member, mounted, run
@@ -366,6 +367,7 @@ NAMES = [
     "two words", " blank at both ends ", "it's", 'say "yes"', "$HOME", "$(touch /tmp/broken-out)",
     "`touch /tmp/broken-out`", "back\\slash", "\\", "a;touch /tmp/broken-out", "a&b|c>d<e", "*?[a]", "#!~%",
     "ümläut 名前", "-rf", "--", "-", "...", "..x", "x" * 120, "$`\"\\" * 30, "new\nline", "tab\tstop", "a/b", "./c",
+    "".join(c for c in string.printable if c != "/"), "\x01\x1b[31m\x7f", "\udcff\udc80", "a\\040b",
 ]
 
 
@@ -485,6 +487,37 @@ def test_a_run_that_is_killed_anywhere_leaves_a_folder_that_is_used_again(ext4_r
     assert_files(lun)
     assert lun.unmount().result == 0
     assert left_below_root(lun) == ["lost+found"]
+
+
+def test_a_full_system_disk_holds_up_no_unmount(ext4_root):
+    lun = ext4_root
+    lun.mount()
+    keep_files(lun)
+    filler = lun.box.path("/mnt/VV/filler")
+    with pytest.raises(OSError), open(filler, "wb", buffering=0) as file:
+        while True:
+            file.write(b"x" * MIB)
+    assert lun.unmount().result == 0
+    assert left_below_root(lun) == ["filler", "lost+found"]
+    assert lun.mount().result in (0, -4), "a small folder may find its room"
+    filler.unlink()
+    assert lun.mount().result == 0
+    assert_files(lun)
+
+
+@pytest.mark.parametrize("share", ["share1", "a/share1"])
+def test_a_planted_link_is_not_followed(luns, share):
+    lun = luns(64 * MIB, share)
+    kept = lun.box.write("/tmp/elsewhere/share1/kept", "stays")
+    before = lun.disk.digest()
+    link = lun.box.path("/mnt/VV/" + share.split("/")[0])
+    link.parent.mkdir(exist_ok=True)
+    link.symlink_to("/tmp/elsewhere" if "/" in share else "/tmp/elsewhere/share1")
+    assert lun.mount().result == -4
+    assert lun.unmount().result == -1
+    assert not lun.box.shell()
+    assert lun.disk.digest() == before
+    assert kept.read_text() == "stays"
 
 
 def test_a_bare_folder_takes_nothing(ext4_root):

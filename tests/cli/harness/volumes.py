@@ -10,6 +10,8 @@
     lun.mounted()                        whether its mount point is a mount
 """
 
+import os
+import pathlib
 import re
 import time
 
@@ -51,7 +53,8 @@ class Lun:
 
     def mounts(self):
         """The mount points of the disk and its partitions, in the kernel's order."""
-        lines = open(f"/proc/{self.box.pid}/mounts", encoding="utf-8").read().splitlines()
+        table = pathlib.Path(f"/proc/{self.box.pid}/mounts").read_bytes()
+        lines = os.fsdecode(table).split("\n")  # other ends of lines are characters of a path
         mine = re.compile(re.escape(self.disk.node) + r"(p\d+)? ")
         paths = [line.split(" ")[1] for line in lines if mine.match(line)]
         return [re.sub(r"\\(\d{3})", lambda m: chr(int(m[1], 8)), path) for path in paths]
