@@ -6,6 +6,9 @@
 
 namespace remvol {
 
+// What stands in messages in place of a CHAP secret.
+inline constexpr char kMaskedSecret[] = "***";
+
 // The process-wide debug level. Negative silences everything. Set once by main.
 extern int debug_level;
 
@@ -22,7 +25,8 @@ struct Caller {
 // Prints the prefix when the debug level is at least `level`; flushes standard output in every case.
 void log_prefix(int level, const char* file, const char* function, int line);
 
-// Prints prefix, message and a newline when the debug level is at least `level`; flushes in every case.
+// Prints prefix, message and a newline when the debug level is at least `level`; flushes in every case. The
+// secret in a command of iscsiadm is masked.
 [[gnu::format(printf, 5, 6)]] void log_message(int level, const char* file, const char* function, int line,
                                                const char* format, ...);
 

@@ -1,10 +1,12 @@
 // remvol: one command of the appliance a run. main reads the command line, runs the command's handler and
 // records the outcome.
+#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <cstdio>
 #include <cstdlib>
+#include <vector>
 
 #include "frontend/commands.h"
 #include "frontend/log.h"
@@ -92,12 +94,27 @@ void keep_program_path(int argc, char** argv) {
   if (argc > 0) copy_text(program_path, argv[0]);
 }
 
+// A core would hold the secrets. Programs that the tool starts are not changed: exec sets it back.
+void leave_no_core() {
+  prctl(PR_SET_DUMPABLE, 0);
+}
+
+void log_arguments(char** argv, const std::vector<int>& shown, Caller caller) {
+  int i = 0;
+  for (const int length : shown) {
+    LOG_AT(caller, 1, "arg[%d]: '%.*s%s'", i, length, argv[i], length < 0 ? "" : kMaskedSecret);
+    i++;
+  }
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
+  leave_no_core();
+  const std::vector<int> shown = hide_secrets(argc, argv);
   debug_level = dbg_get_remvol_debug_lv();
   keep_program_path(argc, argv);
-  for (int i = 0; i < argc; i++) LOG(1, "arg[%d]: '%s'", i, argv[i]);
+  log_arguments(argv, shown, Caller());
   request_target = TargetEntry();
   Options options;
   switch (parse_options(argc, argv, &options)) {

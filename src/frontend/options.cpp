@@ -26,6 +26,7 @@ constexpr size_t kAddressSize = sizeof(TargetEntry::ip);
 // Reading the command line is main's work, and its messages have always borne main's name.
 #define LOG_AS_MAIN(level, ...) LOG_AT(Caller("main"), level, __VA_ARGS__)
 
+constexpr char kSecretOption = 'P';
 constexpr char kShortOptions[] = "i:p:n:s:vc:U:P:d:l:ho:w:";
 
 // The long options are the rows of the command table.
@@ -51,8 +52,15 @@ ParseEnd choose_command(int index, Options* options) {
 }
 
 void log_option(int option) {
-  LOG_AS_MAIN(1, "opt('%c') with arg '%s'", option, optarg);
+  LOG_AS_MAIN(1, "opt('%c') with arg '%s'", option, option == kSecretOption ? kMaskedSecret : optarg);
   LOG_AS_MAIN(1, "OPT_FLAG: %08x", OPT_FLAG);
+}
+
+// Returns whether the argument fits into a field of `size` bytes; logs when it does not.
+bool fits_field(int option, size_t size) {
+  if (strlen(optarg) < size) return true;
+  LOG_AS_MAIN(0, "Command parameter check failed, -%c takes at most %zu bytes", option, size - 1);
+  return false;
 }
 
 template <size_t N>
@@ -61,6 +69,7 @@ ParseEnd take_name(int option, unsigned bit, char (&field)[N]) {
     LOG_AS_MAIN(1, "Command parameter check failed, wrong name: '%s'", optarg);
     return ParseEnd::kFail;
   }
+  if (!fits_field(option, N)) return ParseEnd::kFail;
   OPT_FLAG |= bit;
   copy_text(field, optarg);
   log_option(option);
@@ -77,17 +86,28 @@ ParseEnd take_number(int option, unsigned bit, int32_t* field) {
 // User and secret count only behind "-c 1"; given earlier they are dropped without a word. Callers rely on
 // that order.
 template <size_t N>
-void take_credential(int option, char (&field)[N]) {
-  if (request_target.chap != 1) return;
+ParseEnd take_credential(int option, char (&field)[N]) {
+  if (request_target.chap != 1) return ParseEnd::kReady;
+  if (!fits_field(option, N)) return ParseEnd::kFail;
   copy_text(field, optarg);
   log_option(option);
+  return ParseEnd::kReady;
 }
 
 ParseEnd take_secret() {
-  take_credential('P', request_target.chap_pwd);
-  // The process list shows a process's arguments to everybody.
+  const ParseEnd end = take_credential(kSecretOption, request_target.chap_pwd);
   explicit_bzero(optarg, strlen(optarg));
-  return ParseEnd::kReady;
+  return end;
+}
+
+// Returns how many characters stand before the secret in its argument.
+int move_secret(char** argument, char* secret) {
+  const int before = static_cast<int>(secret - *argument);
+  char* const copy = strdup(*argument);
+  if (copy == nullptr) return before;  // take_secret overwrites it
+  explicit_bzero(secret, strlen(secret));
+  *argument = copy;
+  return before;
 }
 
 ParseEnd take_address() {
@@ -131,9 +151,8 @@ ParseEnd take_option(int option, int index, Options* options) {
     case 'i':
       return take_address();
     case 'U':
-      take_credential(option, request_target.chap_name);
-      return ParseEnd::kReady;
-    case 'P':
+      return take_credential(option, request_target.chap_name);
+    case kSecretOption:
       return take_secret();
     case 'o':
       output_file = optarg;
@@ -170,6 +189,21 @@ int format_ipv6(char* address, const sockaddr_in6& socket, Caller caller) {
 }
 
 }  // namespace
+
+std::vector<int> hide_secrets(int argc, char** argv) {
+  std::vector<int> shown(static_cast<size_t>(argc), -1);
+  const Text<64> in_order("-%s", kShortOptions);  // the arguments stay in their order; getopt_long(3)
+  opterr = 0;
+  int option = 0;
+  while ((option = getopt_long(argc, argv, in_order, long_options(), nullptr)) != -1) {
+    if (option != kSecretOption) continue;
+    const int index = optind - 1;
+    shown[static_cast<size_t>(index)] = move_secret(&argv[index], optarg);
+  }
+  opterr = 1;
+  optind = 0;  // the reading begins anew
+  return shown;
+}
 
 ParseEnd parse_options(int argc, char** argv, Options* options) {
   const option* const commands = long_options();

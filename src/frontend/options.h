@@ -2,6 +2,8 @@
 #ifndef REMVOL_FRONTEND_OPTIONS_H
 #define REMVOL_FRONTEND_OPTIONS_H
 
+#include <vector>
+
 namespace remvol {
 
 // How the reading of the command line ended.
@@ -18,8 +20,13 @@ struct Options {
   int wait_seconds = 0;  // argument of -w
 };
 
+// The process list shows a process's arguments to everybody: moves every argument with a secret (-P) into
+// memory of the tool's own, overwrites the secret where it stood and points `argv` to the copy. Returns for
+// each argument how many characters of it may be shown, -1 for all.
+std::vector<int> hide_secrets(int argc, char** argv);
+
 // Reads the arguments into the request record and `options`. -d and -v do their work at once and end the
-// reading. The secret after -P is overwritten in `argv`.
+// reading. A value that is longer than its field fails; cut, two long names would become one.
 ParseEnd parse_options(int argc, char** argv, Options* options);
 
 // The one place where rules for target and share names would stand. Returns 0 to accept `name`, which it

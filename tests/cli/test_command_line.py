@@ -138,7 +138,8 @@ class TestOptions:
         logged = messages(done.stdout)
         assert {entry[:2] for entry in logged} == {("src.cpp", "main")}
         texts = [entry[2] for entry in logged]
-        assert texts[:len(args) + 1] == [f"arg[{i}]: '{a}'" for i, a in enumerate(["remvol", *args])]
+        assert texts[:len(args) + 1] == [
+            f"arg[{i}]: '{'***' if a == 'secret' else a}'" for i, a in enumerate(["remvol", *args])]
         assert texts[len(args) + 1:] == [
             "opt('l') with arg '7'", "OPT_FLAG: 00000040",
             "opt('s') with arg 'my share'", "OPT_FLAG: 00000060",
@@ -147,7 +148,7 @@ class TestOptions:
             "get ip address 10.1.2.3 = 10.1.2.3, inet_type = AF_INET",
             "opt('c') with arg '1'", "OPT_FLAG: 0000006e",
             "opt('U') with arg 'user'", "OPT_FLAG: 0000006e",
-            "opt('P') with arg 'secret'", "OPT_FLAG: 0000006e"]
+            "opt('P') with arg '***'", "OPT_FLAG: 0000006e"]
 
     def test_a_name_sets_its_bit(self, box):
         box.debug(1)
@@ -196,6 +197,44 @@ class TestSecret:
         words = box.path("/tmp/cmdline").read_bytes().split(b"\0")
         assert words[:6] == [b"remvol", b"--search", b"-c", chap.encode(), b"-U", b"user"]
         assert b"Secret" not in b"\0".join(words)
+
+    def test_it_is_gone_before_anything_is_waited_for(self, box):
+        box.hook("getaddrinfo", "slow", ret=-2, effect="cat /proc/[0-9]*/cmdline >/tmp/cmdline")
+        box.remvol("--search", "-i", "slow", "-c", "1", "-P", self.SECRET)
+        lines = box.path("/tmp/cmdline").read_bytes()
+        assert b"--search" in lines and b"Secret" not in lines
+
+    @pytest.mark.parametrize("level", [0, 1, 2, 3])
+    @pytest.mark.parametrize("secret", [SECRET, 'The"$`\\Secret" \\', "x", "\\"])
+    @pytest.mark.parametrize("command", [["--add", "-l", "0", "-s", "s"], ["--modify"], ["--search_lun"], ["--connect"]])
+    def test_no_message_and_no_temporary_file_shows_it(self, box, level, secret, command):
+        box.default("iscsiadm", status=6)
+        box.debug(level)
+        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t", "/iscsi/initiator/id:1/ip": "10.0.0.1",
+                      "/iscsi/initiator/id:1/port": 3260, "/iscsi/initiator/id:1/chap": 1,
+                      "/iscsi/initiator/id:1/chap_name": "u", "/iscsi/initiator/id:1/chap_pwd": secret})
+        words = ["-n", "iqn.t", "-i", "10.0.0.1", "-p", "3260", "-c", "1", "-U", "u", "-P", secret, f"-P{secret}"]
+        done = box.remvol(*command, *words)
+        shown = done.stdout + done.stderr
+        stored = re.findall("auth.password -v (.*)' failed", shown)
+        assert all(text == '"***"' for text in stored)
+        if level > 0:
+            assert "'***'\n" in shown and "'-P***'\n" in shown
+        if "Secret" in secret:
+            files = [path.read_bytes() for path in box.path("/tmp").rglob("*") if path.is_file()]
+            assert "Secret" not in shown and not any(b"Secret" in text for text in files)
+
+    def test_no_core_shows_it(self, box):
+        box.write("/run-it", f"ulimit -c unlimited; cd /tmp; remvol -P {self.SECRET}\n")
+        box.run(["sh", "/run-it"])
+        assert not list(box.path("/tmp").glob("core*"))
+
+    def test_a_program_that_it_starts_may_leave_a_core(self, box):
+        effect = "ulimit -c unlimited; cd /tmp; sh -c 'kill -ABRT $$'"
+        box.hook("system", "winshare_reload", through=True, effect=effect)
+        box.remvol("--search")
+        if box.path("/proc/sys/kernel/core_pattern").read_text().strip() == "core":
+            assert list(box.path("/tmp").glob("core*"))
 
 
 class TestAddress:
@@ -452,17 +491,29 @@ class TestSuccessOfOtherCommands:
 class TestFieldSizes:
     """Texts are cut to what their field holds."""
 
-    @pytest.mark.parametrize("length,status", [(126, 0), (127, 1), (128, 1), (5000, 1)])
+    @pytest.mark.parametrize("length,status", [(126, 0), (127, 1), (128, 255), (5000, 255)])
     def test_a_share_name_holds_127_bytes(self, box, length, status):
         box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t", "/iscsi/initiator/id:1/lun/id:1/lun": "0",
                       "/iscsi/initiator/id:1/lun/id:1/share": "s" * 127})
         assert box.remvol("--check_share_name", "-s", "s" * length).status == status
 
-    @pytest.mark.parametrize("length", [255, 256, 5000])
-    def test_a_target_name_holds_255_bytes_and_chap_texts_127(self, box, length):
+    @pytest.mark.parametrize("option,most", [("n", 255), ("s", 127), ("U", 127), ("P", 127)])
+    def test_a_longer_value_is_refused_not_cut(self, box, option, most):
+        box.unscripted_ok()
+        done = box.remvol("--add", "-c", "1", f"-{option}", "v" * (most + 1))
+        assert done.status == 255
+        assert said(done.stdout)[-1] == f"Command parameter check failed, -{option} takes at most {most} bytes"
+        assert box.tree.dump() == {"/result/add": "-1"}
+
+    @pytest.mark.parametrize("option", ["U", "P"])
+    def test_a_longer_credential_that_does_not_count_is_dropped(self, box, option):
+        done = box.remvol("--check_share_name", f"-{option}", "v" * 128, "-s", "s")
+        assert done.status == 0
+
+    def test_a_target_name_holds_255_bytes_and_chap_texts_127(self, box):
         box.fake("iscsiadm", status=21)
-        box.remvol("--add", "-n", "n" * length, "-l", "0", "-i", "10.0.0.1", "-p", "3260", "-s", "s", "-c", "1",
-                   "-U", "u" * length, "-P", "p" * length)
+        box.remvol("--add", "-n", "n" * 255, "-l", "0", "-i", "10.0.0.1", "-p", "3260", "-s", "s", "-c", "1",
+                   "-U", "u" * 127, "-P", "p" * 127)
         target = "/iscsi/initiator/id:1"
         assert box.tree.get(f"{target}/target") == "n" * 255
         assert box.tree.get(f"{target}/chap_name") == "u" * 127
