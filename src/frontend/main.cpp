@@ -59,12 +59,25 @@ void copy_to_flash(Caller caller) {
   LOG_AT(caller, 0, "%s could not be copied to the configuration flash", kSettingsFile);
 }
 
-int succeed(const Command& command, int result, Caller caller) {
-  record_result(NumberText("%d", result));
+// Dumps the tree. Returns whether the settings file may go to the flash.
+bool dump_settings(Caller caller) {
   RunLock lock;
   lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one
-  const bool stored = store_settings(caller);
-  lock.release();
+  return store_settings(caller);
+}
+
+// Returns whether the tree that the command has changed is gone, and the change with it: its daemon was
+// started anew and has loaded the settings of before, or does not answer any more. Logged at level 0.
+bool was_change_lost(const TreeInstance& tree, Caller caller) {
+  if (is_same_tree(tree) && tree_answers(KeyText("%s/%s", key::kResult, gs_str_command))) return false;
+  LOG_AT(caller, 0, "the configuration tree was started anew meanwhile, what was changed may be lost");
+  return true;
+}
+
+int succeed(const Command& command, int result, const TreeInstance& tree, Caller caller) {
+  record_result(NumberText("%d", result));
+  const bool stored = dump_settings(caller);
+  if (command.persists && was_change_lost(tree, caller)) return fail(false);
   if (command.persists && stored) copy_to_flash(caller);
   if (command.persists) reload_share_services();
   return result;
@@ -82,12 +95,13 @@ int run(const Command& command, const Options& options, Caller caller) {
     return fail(false);
   }
   if (command.run == nullptr) return fail(false);
+  const TreeInstance tree = tree_instance();
   const int result = command.run(options);
   if (result != 0 && !command.reports_value) {
     LOG_AT(caller, 1, "%s", failure_message(command));
     return fail(false);
   }
-  return succeed(command, result, caller);
+  return succeed(command, result, tree, caller);
 }
 
 void keep_program_path(int argc, char** argv) {

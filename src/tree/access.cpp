@@ -1,6 +1,7 @@
 #include "tree/access.h"
 
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -10,6 +11,7 @@
 
 #include "ktreec.h"
 #include "support/result.h"
+#include "tree/keys.h"
 
 namespace remvol {
 
@@ -38,6 +40,18 @@ bool tree_answers(const char* key) {
   return ktreec_get_wb(main_socket, 0, key, value, sizeof value) >= 0 || tree_takes_connections();
 }
 
+TreeInstance tree_instance() {
+  struct stat info;
+  if (stat(main_socket, &info) != 0) return {};
+  return {info.st_ino, info.st_ctim};
+}
+
+bool is_same_tree(const TreeInstance& before) {
+  const TreeInstance now = tree_instance();
+  return now.inode == before.inode && now.made.tv_sec == before.made.tv_sec &&
+         now.made.tv_nsec == before.made.tv_nsec;
+}
+
 bool tree_read(const char* key, char* buffer, size_t size) {
   memset(buffer, 0, size);
   return ktreec_get_wb(main_socket, 0, key, buffer, size) > 0 && buffer[0] != '\0';
@@ -46,6 +60,10 @@ bool tree_read(const char* key, char* buffer, size_t size) {
 bool tree_present(const char* key) {
   char value[256];
   return tree_read(key, value);
+}
+
+bool tree_is_loaded() {
+  return tree_present(key::kVersion) || tree_present(key::kTargetCount);
 }
 
 int tree_read_number(const char* key, int missing) {

@@ -4,7 +4,10 @@
 #ifndef REMVOL_TREE_ACCESS_H
 #define REMVOL_TREE_ACCESS_H
 
+#include <sys/types.h>
+
 #include <cstddef>
+#include <ctime>
 
 #include "frontend/log.h"
 
@@ -19,6 +22,19 @@ inline constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
 // Returns whether a daemon serves the tree: it has `key`, also with an empty value, or takes a connection.
 [[nodiscard]] bool tree_answers(const char* key);
 
+// The tree's daemon by its socket: another one, or one that was started anew, has another socket.
+struct TreeInstance {
+  ino_t inode = 0;
+  timespec made = {};
+};
+
+// Returns which daemon answers now; all zero when there is no socket.
+[[nodiscard]] TreeInstance tree_instance();
+
+// Returns whether the daemon that was there at `before` is there still. One that was started anew has loaded
+// the settings file, and knows nothing of what was stored since.
+[[nodiscard]] bool is_same_tree(const TreeInstance& before);
+
 // Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns whether the key is present.
 [[nodiscard]] bool tree_read(const char* key, char* buffer, size_t size);
 
@@ -29,6 +45,10 @@ template <size_t N>
 
 // Returns whether `key` is present.
 [[nodiscard]] bool tree_present(const char* key);
+
+// Returns whether the tree answers and was loaded: a read does not tell a missing key from a tree that is not
+// there, but one of two keys is in every tree that was loaded.
+[[nodiscard]] bool tree_is_loaded();
 
 // Returns the decimal number at `key`, 0 when its text is no number, `missing` when the key is not present.
 int tree_read_number(const char* key, int missing);

@@ -52,12 +52,6 @@ bool holds_lun(int n, int m, int lun) {
   return tree_read(KeyText(key::kLunNumber, n, m), stored) && atoi(stored) == lun;
 }
 
-// A read says nothing of whether a key is missing or the tree does not answer; these two are in every tree
-// that was loaded.
-bool tree_answers() {
-  return tree_present(key::kVersion) || tree_present(key::kTargetCount);
-}
-
 int find_target(int n, Caller caller) {
   if (!is_target_slot(n) || known_slots[n].target[0] == '\0') return n;
   const char* name = known_slots[n].target;
@@ -65,7 +59,7 @@ int find_target(int n, Caller caller) {
   for (int slot = 1; slot <= kMaxTargets; slot++) {
     if (holds_target(slot, name)) return slot;
   }
-  if (!tree_answers()) return n;
+  if (!tree_is_loaded()) return n;
   LOG_AT(caller, 1, "target %s is stored no more", name);
   return kGone;
 }
@@ -77,7 +71,7 @@ int find_lun(int n, int m, int now, Caller caller) {
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
     if (holds_lun(now, slot, lun)) return slot;
   }
-  if (!tree_answers()) return m;
+  if (!tree_is_loaded()) return m;
   LOG_AT(caller, 1, "lun %d of target %s is stored no more", lun, known_slots[n].target);
   return kGone;
 }

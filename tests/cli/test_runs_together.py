@@ -151,6 +151,27 @@ class TestAdding:
         assert sorted(run.wait().status for run in runs) == [0, 255]
 
 
+class TestATreeThatIsStartedAnew:
+    def test_an_add_whose_tree_has_gone_is_no_success(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        box.tree.set(f"{INITIATOR}/ver", 1)
+        # As its unit does: the daemon is killed, and one that has loaded what was saved before takes its place.
+        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
+                   "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & sleep 0.3; "
+                   f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1")
+        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=restart, times=1)
+        done = box.remvol(*TestAdding.ADD)
+        assert done.status == 255
+        assert box.tree.get("/result/add") == "-1"
+        assert "the configuration tree was started anew meanwhile, what was changed may be lost" in messages(done)
+
+    def test_an_add_whose_tree_does_not_answer_is_no_success(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        box.hook("ktreec_set", "/result/add", value="0", through=True, times=1,
+                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+        assert box.remvol(*TestAdding.ADD).status == 255
+
+
 class TestStrangersAndTemporaryFiles:
     def test_a_run_beside_another_lists_into_a_file_of_its_own(self, stored, box):
         box.fake("iscsiadm", "-m session", exact=True, delay=1, times=1, status=21)
