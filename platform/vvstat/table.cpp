@@ -99,11 +99,15 @@ std::vector<Row> rows_of(const Status& status) {
 
 // The longest start of `text` that takes at most that many cells.
 std::string_view fitting(std::string_view text, size_t columns) {
-  size_t size = text.size();
-  while (size > 0 && platform::cells(text.substr(0, size)) > columns) {
-    do {
-      --size;
-    } while (size > 0 && (static_cast<unsigned char>(text[size]) & 0xc0) == 0x80);
+  if (platform::cells(text) <= columns) return text;
+  size_t size = 0;
+  while (size < text.size()) {
+    size_t end = size + 1;
+    while (end < text.size() && (static_cast<unsigned char>(text[end]) & 0xc0) == 0x80) ++end;
+    const size_t width = platform::cells(text.substr(size, end - size));
+    if (width > columns) break;
+    columns -= width;
+    size = end;
   }
   return text.substr(0, size);
 }
@@ -141,7 +145,10 @@ std::string readable_size(unsigned long long bytes) {
 }
 
 std::string table(const Status& status, const Screen& screen) {
-  if (status.targets.empty()) return "No targets are configured.\n";
+  if (status.targets.empty()) {
+    const std::string_view text = "No targets are configured.";
+    return std::string(fitting(text, screen.columns == 0 ? text.size() : screen.columns)) + "\n";
+  }
   const std::vector<Row> rows = rows_of(status);
   std::array<size_t, kColumns> widths{};
   for (const Row& row : rows) {

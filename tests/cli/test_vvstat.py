@@ -273,6 +273,15 @@ def test_watch_stays_within_a_small_terminal(example):
         "TARGET / SHARE              PO", "iqn.2026-01.org.example:t1  10", "  Backup                    LU"]
 
 
+def test_watch_without_targets_stays_within_a_small_terminal(example):
+    example.tree.delete("/iscsi")
+    terminal = Terminal(example, "--watch", columns=10, lines=4, env={"NO_COLOR": "1"})
+    terminal.wait_for("\x1b[J")
+    terminal.running.kill(signal.SIGTERM)
+    terminal.end()
+    assert terminal.text.split("\x1b[H")[1].split("\r\n")[0].removesuffix("\x1b[K") == "No targets"
+
+
 def test_watch_goes_on_while_the_tree_is_away(example):
     terminal = Terminal(example, "--watch")
     terminal.wait_for("Connected")

@@ -1,0 +1,16 @@
+// fopen as the tool's library sees it (the target is linked with --wrap=fopen): every file holds the bytes of
+// this run. Included by one file of a target.
+#ifndef FUZZ_WRAPPED_FILES_H
+#define FUZZ_WRAPPED_FILES_H
+
+#include <cstdint>
+#include <cstdio>
+
+inline const uint8_t* file_data = nullptr;
+inline size_t file_size = 0;
+
+extern "C" FILE* __wrap_fopen(const char*, const char*) {
+  return file_size == 0 ? nullptr : fmemopen(const_cast<uint8_t*>(file_data), file_size, "r");
+}
+
+#endif
