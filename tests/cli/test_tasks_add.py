@@ -300,13 +300,14 @@ class TestBadInput:
         assert (done.status, messages(done)) == (255, [f"ip address {address} -> error"])
         assert settings(box) == {}
 
-    def test_a_long_name_is_cut(self, site, box):
-        assert add(box, n="x" * 300, s="y" * 300).status == 0
+    def test_the_longest_names_are_stored_whole(self, site, box):
+        assert add(box, n="x" * 255, s="y" * 127).status == 0
         assert (site.target("target"), site.lun("share")) == ("x" * 255, "y" * 127)
 
-    def test_a_long_name_is_the_same_target_next_time(self, site, box):
-        assert [add(box, n="x" * 300).status, add(box, n="x" * 300).status] == [0, 255]
-        assert site.target("target", 2) is None
+    @pytest.mark.parametrize("long", [{"n": "x" * 256}, {"s": "y" * 128}])
+    def test_a_longer_name_is_refused_not_cut(self, site, box, long):
+        assert add(box, **long).status == 255
+        assert site.target("target") is None
 
 
 class TestCheckShareName:

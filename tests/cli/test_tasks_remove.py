@@ -93,7 +93,7 @@ class TestTarget:
         assert trace[trace.index("del id:1"):last] == ["del id:1"] * min(failures + 1, 4)
         assert_order(trace, "del id:1", f"set count={1 if failures == 4 else 0}")
 
-    @pytest.mark.parametrize("name", ["iqn.t3", "iqn.t", "", "x" * 300])
+    @pytest.mark.parametrize("name", ["iqn.t3", "iqn.t", "", "x" * 255])
     def test_an_unknown_target_refreshes_the_count_alone(self, site, box, name):
         site.store("iqn.t1", luns=[("a", 0)])
         site.tree.set("/iscsi/initiator/count", 7)
@@ -171,7 +171,7 @@ class TestLun:
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
         self.refused(site, box, ["lun is not given"], "iqn.t1", number, None)
 
-    @pytest.mark.parametrize("name", ["iqn.t2", "", "x" * 300])
+    @pytest.mark.parametrize("name", ["iqn.t2", "", "x" * 255])
     def test_an_unknown_target_refreshes_no_count(self, site, box, name):
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
         self.refused(site, box, [f"Can not find: {name[:255]}"], name, "0", None)
