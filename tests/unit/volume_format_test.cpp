@@ -187,7 +187,14 @@ TEST_F(Format, TheResultIsThatOfLeavingTheSemaphore) {
   EXPECT_EQ(stored("format_state"), "0");
 }
 
-TEST_F(Format, ARunningMkfsOnAScsiDiskIsSeen) {
+// Processes of the machine are none of these tests' business.
+class FormatProcesses : public Format {
+ protected:
+  FormatProcesses() { cover("/proc"); }
+  ~FormatProcesses() override { uncover("/proc"); }
+};
+
+TEST_F(FormatProcesses, ARunningMkfsOnAScsiDiskIsSeen) {
   const char command[] = "ps -w | grep mke2fs | grep -v 'grep'";
   fakes::on("popen", command).text("1 root mke2fs -m0 /dev/vdb\n2 root mke2fs -m0 /dev/sdb1\n").times(1);
   EXPECT_EQ(check_mkfs_process_existing(), 0);
@@ -199,7 +206,7 @@ TEST_F(Format, ARunningMkfsOnAScsiDiskIsSeen) {
   EXPECT_EQ(check_mkfs_process_existing(), 1);
 }
 
-TEST_F(Format, ARunningResizeOfTheDeviceIsSeen) {
+TEST_F(FormatProcesses, ARunningResizeOfTheDeviceIsSeen) {
   debug_level = 2;
   const char command[] = "ps -w | grep resize2fs | grep -v 'grep'";
   fakes::on("popen", command).text("7 root resize2fs -fp /dev/sdb1\n").times(2);
