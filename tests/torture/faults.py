@@ -4,6 +4,7 @@ After a fault: no crash, no hang, no success that is none; and the same command 
 nothing had happened (beside a run that never had a fault). What is settled otherwise stands in settled.py."""
 
 import dataclasses
+import errno
 import random
 import re
 import time
@@ -12,8 +13,11 @@ import settled
 from pairs import BLANK, FULL, on, stored
 from world import SAVED, SOCKET, World
 
-CALL, TREE, COMMAND, MEMORY = range(4)
-CLASSES = ("call", "tree", "command", "memory")
+CALL, TREE, COMMAND, MEMORY, SYSTEM = range(5)
+CLASSES = ("call", "tree", "command", "memory", "system call")
+SYSTEM_CALLS = ("openat read write close newfstatat socket connect sendmsg recvmsg pipe2 clone3 clone vfork execve wait4 "
+                "dup2 mmap fcntl flock unlink rename mkdir fsync semop getdents64").split()
+INJECTED = "/tmp/injected"
 FAIL, KILL, NOTHING, MUTE, LATE = range(5)
 KINDS = ("fails", "is killed", "does nothing and says 0", "prints nothing", "works and says 1")
 EIO, ENOMEM, ENOSPC, EMFILE = 5, 12, 28, 24
@@ -169,21 +173,31 @@ class Walk:
         found = []
         with self.world() as world:
             self.begin(world)
-            world.plan(kind_of=fault.kind_of, index=fault.index, forever=fault.forever, kind=fault.kind, error=fault.error)
+            under = ()
+            if fault.kind_of == SYSTEM:
+                when = f"{fault.index}{'+' if fault.forever else ''}"
+                effect = "signal=KILL" if fault.kind == KILL else f"error={errno.errorcode[fault.error]}"
+                under = ["strace", "-f", "-qq", "-o", INJECTED, "-e", f"trace={fault.name}",
+                         "-e", f"inject={fault.name}:{effect}:when={when}"]
+            else:
+                world.plan(kind_of=fault.kind_of, index=fault.index, forever=fault.forever, kind=fault.kind, error=fault.error)
             command, options = self.road.command
-            job = world.begin(command, **options)
+            job = world.begin(command, under=under, **options)
             try:
                 job.running.wait(HANG)
             except TimeoutError:
                 world.plan(active=0)
                 return [f"hang: {job.output[-500:]}"]
             fired, _ = world.faults()
+            if fault.kind_of == SYSTEM:
+                text = world.box.path(INJECTED).read_text("utf-8", "replace")
+                fired = "INJECTED" in text or "SIGKILL" in text
             world.plan(active=0)
             job.ended = time.monotonic()
             if not fired:
                 return None
             world.box.wait_quiet()
-            job.killed = fault.kind == KILL and fault.kind_of in (CALL, TREE, MEMORY)
+            job.killed = fault.kind == KILL and fault.kind_of != COMMAND
             if job.status == 0:
                 found += [f"success: {text}" for text in difference(self.first, picture(world), job.output)]
             try:
@@ -228,6 +242,13 @@ class Faults:
                 continue
             walk = self.walks[name] = Walk(road, beginning(*road.furnish))
             self.all += possible(name, walk.clean(), dice)
+
+    def system_calls(self, count, seed):
+        """Faults below the C library, in the tool and in everything that it starts: the index-th of a kind in each."""
+        dice = random.Random(seed)
+        return [Fault(dice.choice(list(self.walks)), SYSTEM, dice.randint(1, 40), dice.random() < 0.3,
+                      dice.choice([FAIL, FAIL, KILL]), dice.choice([EIO, ENOSPC, EMFILE, ENOMEM]),
+                      dice.choice(SYSTEM_CALLS), "") for _ in range(count)]
 
     def play(self, fault):
         """(kind of finding, text) for what is wrong and not settled."""

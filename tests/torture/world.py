@@ -206,13 +206,14 @@ class World:
 
     # --- runs of the tool ---
 
-    def begin(self, command, t=None, l=None, share=None, **more):
+    def begin(self, command, t=None, l=None, share=None, under=(), **more):
+        """`under`: words that go before the tool's own, of a program that runs it."""
         job = Job(len(self.jobs) + 1, command, t, l, share, arguments(command, t, l, share, **more))
         self.jobs.append(job)
         short = {"oiscsi_evt_recover": "recover", "oiscsi_evt_reopen": "reopen"}.get(command, command)
         mark = f"{job.number}:{short}:{'-' if t is None else t}:{'-' if l is None else l}"
         job.began = time.monotonic()
-        job.running = self.box.start(["remvol", *job.words], env={"TORTURE_RUN": mark})
+        job.running = self.box.start([*under, "remvol", *job.words], env={"TORTURE_RUN": mark})
         return job
 
     def tool(self, command, *, timeout=LONG, **options):
