@@ -430,6 +430,22 @@ static int do_mount(char** argv) {
   return status;
 }
 
+/* Whether the topmost mount at the point is one of a disk. */
+static int shows_disk(const char* point) {
+  char line[4096];
+  int disk = 0;
+  FILE* table = fopen("/proc/self/mounts", "re");
+  while (table != NULL && fgets(line, sizeof line, table) != NULL) {
+    char source[1024];
+    char where[2048];
+    if (sscanf(line, "%1023s %2047s", source, where) == 2 && strcmp(where, point) == 0) {
+      disk = strncmp(source, "/dev/sd", 7) == 0;
+    }
+  }
+  if (table != NULL) fclose(table);
+  return disk;
+}
+
 static int do_umount(char** argv) {
   const char* point = node_of(argv);
   struct run run = whose_run();
@@ -445,8 +461,9 @@ static int do_umount(char** argv) {
     if (fscanf(mark, "%d %d %d", &target, &number, &stamp) != 3) target = 0;
     fclose(mark);
   }
+  int volume = shows_disk(point);
   int status = umount2(point, 0) == 0 ? 0 : 32;
-  if (status == 0) {
+  if (status == 0 && volume) {
     world_log("E", "umount %s t%d lun%d stamp=%d", point, target, number, stamp);
     if (target == 0) {
       world_log("V", "files-lost: the files of the volume at %s were gone before it was unmounted", point);

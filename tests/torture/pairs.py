@@ -68,6 +68,7 @@ class Pair(Round):
 
 BLANK = ("blank", lambda world: stored(world, (1, 0), (1, 1), (2, 0)))
 FULL = ("full", lambda world: stored(world, (1, 0), (1, 1), (2, 0), (3, 0), connect=(1, 2)))
+THREE = ("three", lambda world: stored(world, (1, 0), (1, 1), (1, 2), connect=(1,)))
 EMPTY = ("empty", lambda world: stored(world))
 
 
@@ -112,6 +113,7 @@ PAIRS = {
     "del-del-same": (FULL, ("del", on(1)), ("del", on(1)), anything),
     "del-del_lun": (FULL, ("del", on(1)), ("del_lun", on(1, 1)), anything),
     "del_lun-del_lun": (FULL, ("del_lun", on(1, 0)), ("del_lun", on(1, 1)), both_work),
+    "del_lun-del_lun-same": (THREE, ("del_lun", on(1, 0)), ("del_lun", on(1, 0)), anything),
     "del_lun-connect": (BLANK, ("del_lun", on(1, 0)), ("connect", on(1)), anything),
     "del_lun-status": (FULL, ("del_lun", on(1, 0)), ("status", {}), both_work),
     "del_lun-format-of-the-next": (FULL, ("del_lun", on(1, 0)), ("format", on(1, 1)), both_work),
