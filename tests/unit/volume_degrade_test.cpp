@@ -4,9 +4,11 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <utility>
 
 #include "volume_fixture.h"
 
@@ -235,6 +237,18 @@ TEST_F(TwoTables, AWriteTellsWhatTheTablesDoNot) {
   ASSERT_EQ(mount(nullptr, kVolume, nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0);
   EXPECT_EQ(check(kVolume), 1);
   EXPECT_TRUE(has(log, "the access right is degrade to ro for dev /dev/sdb1"));
+}
+
+TEST_F(TwoTables, AWriteThatNeverReachesTheDiskTellsItToo) {
+  mtab("rw");
+  proc_mounts("rw,relatime");
+  std::filesystem::create_directories(kVolume);
+  ASSERT_EQ(mount("tmpfs", kVolume, "tmpfs", 0, nullptr), 0);
+  fakes::on("sys_mount_point", kVolume).returns(1);
+  for (const auto& [error, degraded] : {std::pair{EIO, 1}, {EROFS, 1}, {ENOSPC, 0}}) {
+    fakes::on("fsync").error(error).returns(-1).times(1);
+    EXPECT_EQ(check(kVolume), degraded) << strerror(error);
+  }
 }
 
 TEST_F(TwoTables, ErrorsOtherThanARefusalDecideNothing) {

@@ -23,7 +23,7 @@
 //   ktreec_*             work on the tree in memory
 //   str*                 do what the platform's do
 //   sys_*, LIB_*         are refused
-//   getaddrinfo, inet_ntop, access, fcntl, sem*, strdup   are the real ones
+//   getaddrinfo, inet_ntop, access, fcntl, fsync, sem*, strdup   are the real ones
 // Subjects: the command, the path, the number, the name; the platform's names are in sys_* order of
 // arguments.
 #ifndef FAKES_FAKES_H

@@ -135,6 +135,12 @@ int access(const char* path, int mode) noexcept {
   return real<decltype(access)>("access")(path, mode);
 }
 
+int fsync(int fd) {
+  int result = 0;
+  if (answered_number("fsync", {}, &result)) return result;
+  return real<decltype(fsync)>("fsync")(fd);
+}
+
 int fcntl(int fd, int command, ...) {
   int result = 0;
   va_list list;
