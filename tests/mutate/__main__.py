@@ -1,0 +1,180 @@
+"""scripts/mutate: see there."""
+
+import argparse
+import json
+import pathlib
+import queue
+import re
+import sys
+import threading
+import time
+
+HERE = pathlib.Path(__file__).parent
+sys.path.insert(0, str(HERE))
+
+from breakages import chosen, stored  # noqa: E402
+from copy_of import FOLDER, PROGRAMS, ROOT, Copy  # noqa: E402
+from cover import Cover, failing  # noqa: E402
+
+UNIT_LIMIT = 60  # seconds, for tests that take some tenths of one
+RESULTS = FOLDER / "results.jsonl"
+
+
+class Worker:
+    """Breaks, builds and tests in a copy of its own."""
+
+    def __init__(self, number, cover):
+        self.copy, self.cover = Copy(f"worker{number}"), cover
+
+    def prepare(self, targets):
+        self.copy.refresh()
+        good, output = self.copy.make(*targets, jobs=2)
+        if not good:
+            raise SystemExit(f"the sources do not build unbroken:\n{output[-3000:]}")
+
+    def try_one(self, breakage):
+        """Returns (verdict, by): caught, open or uncompiled."""
+        place = self.copy.root / breakage.file
+        lines = place.read_text().split("\n")
+        place.write_text("\n".join([*lines[:breakage.line - 1], breakage.after, *lines[breakage.line:]]))
+        try:
+            return self._tested(breakage)
+        finally:
+            place.write_text("\n".join(lines))
+
+    def _tested(self, breakage):
+        units, files = self.cover.of(breakage) if self.cover else tests_of(breakage)
+        # The short wait for one unit test that knows the line well saves linking them all.
+        for batch in filter(None, (units[:1], units[1:])):
+            built, output = self.copy.make(*batch)
+            if not built:
+                return "uncompiled", re.findall(r"error: .*", output)[:1]
+            for name in batch:
+                status, _ = self.copy.unit(name, UNIT_LIMIT)
+                if status != 0:
+                    return "caught", name if status is not None else f"{name} (no end)"
+        if not files:
+            return "open", ""
+        built, output = self.copy.make(*PROGRAMS)
+        if not built:
+            return "uncompiled", re.findall(r"error: .*", output)[:1]
+        return self._tested_from_outside(files)
+
+    def _tested_from_outside(self, files):
+        ignored = self.cover.failing() if self.cover else []
+        limit = 120 + 4 * sum(self.cover.tests[name]["seconds"] for name in files) if self.cover else 300
+        while True:
+            arguments = ["-x", *(f"--deselect={name}" for name in ignored), *(f"tests/cli/{name}" for name in files)]
+            status, output = self.copy.cli(arguments, limit, 2)
+            if status is None:
+                return "caught", "cli (no end)"
+            if status == 0:
+                return "open", ""
+            found = failing(output)
+            if not found:
+                return "caught", f"cli (status {status}) {output[-300:]}"
+            # Many tests at once on a busy machine: one that fails alone as well means it.
+            again, _ = self.copy.cli(["-x", found[0]], limit, 1)
+            if again != 0:
+                return "caught", found[0]
+            ignored.append(found[0])
+
+
+def tests_of(breakage):
+    return [t for t in breakage.tests if not t.endswith(".py")], [t for t in breakage.tests if t.endswith(".py")]
+
+
+def in_turn(worker, waiting, done):
+    while True:
+        try:
+            breakage = waiting.get_nowait()
+        except queue.Empty:
+            return
+        began = time.monotonic()
+        verdict, by = worker.try_one(breakage)
+        done(breakage, verdict, by, time.monotonic() - began)
+
+
+def targets_of(breakages, cover):
+    if cover:
+        return ["all"]
+    tests = [t for b in breakages for t in b.tests]
+    return [*{t for t in tests if not t.endswith(".py")}, *(PROGRAMS if any(t.endswith(".py") for t in tests) else ())]
+
+
+def run_all(breakages, options, cover):
+    reasons = {b.key(): b.reason for b in stored(HERE / "harmless", ROOT)}
+    counts = {"caught": 0, "harmless": 0, "open": 0, "uncompiled": 0}
+    still_open, lock, began = [], threading.Lock(), time.monotonic()
+    FOLDER.mkdir(parents=True, exist_ok=True)
+
+    def done(breakage, verdict, by, seconds):
+        with lock:
+            if verdict == "open" and breakage.key() in reasons:
+                verdict, by = "harmless", reasons[breakage.key()]
+            counts[verdict] += 1
+            if verdict == "open":
+                still_open.append(breakage)
+            print(f"[{sum(counts.values())}/{len(breakages)}] {verdict}: {breakage}\n  {by} ({seconds:.0f} s)", flush=True)
+            with RESULTS.open("a") as file:
+                file.write(json.dumps({"key": breakage.key(), "verdict": verdict, "by": by}) + "\n")
+
+    waiting = queue.Queue()
+    for breakage in breakages:
+        waiting.put(breakage)
+    workers = [Worker(n, cover) for n in range(min(options.jobs, len(breakages)))]
+    for worker in workers:
+        worker.prepare(targets_of(breakages, cover))
+    threads = [threading.Thread(target=in_turn, args=(worker, waiting, done), daemon=True) for worker in workers]
+    for thread in threads:
+        thread.start()
+    for thread in threads:
+        thread.join()
+    for breakage in still_open:
+        print(f"no test notices: {breakage}")
+    tried = sum(counts.values()) - counts["uncompiled"]
+    print(f"{tried} breakages: {counts['caught']} caught by a test, {counts['harmless']} harmless with a reason, "
+          f"{counts['open']} open; {counts['uncompiled']} did not compile ({time.monotonic() - began:.0f} s)")
+    print(f"mutate: {counts['caught'] + counts['harmless']} passed, {counts['open']} failed")
+    return counts["open"] == 0 and tried > 0
+
+
+def those_open(breakages):
+    """The ones among them that no test noticed the last time."""
+    last = {}
+    for line in RESULTS.read_text().split("\n") if RESULTS.exists() else ():
+        if line:
+            result = json.loads(line)
+            last[tuple(result["key"])] = result["verdict"]
+    return [b for b in breakages if last.get(b.key()) == "open"]
+
+
+def main():
+    parser = argparse.ArgumentParser(prog="scripts/mutate")
+    parser.add_argument("--count", type=int, default=200, help="how many breakages (200)")
+    parser.add_argument("--seed", type=int, default=1, help="which ones (1)")
+    parser.add_argument("--only", default="", help="of the files with this in their names")
+    parser.add_argument("--jobs", type=int, default=2, help="so many at once, each in a copy of its own (2)")
+    parser.add_argument("--list", action="store_true", help="says which ones, breaks nothing")
+    parser.add_argument("--known", action="store_true", help="those of tests/mutate/known, with the tests named there")
+    parser.add_argument("--again", action="store_true", help="of the chosen ones those that were open the last time")
+    parser.add_argument("--measure", action="store_true", help="measures which tests run which line, and ends")
+    options = parser.parse_args()
+    known = stored(HERE / "known", ROOT)
+    breakages = known if options.known else known + chosen(ROOT, options.count, options.seed, options.only)
+    if options.only:
+        breakages = [b for b in breakages if options.only in b.file]
+    if options.again:
+        breakages = those_open(breakages)
+    if options.list:
+        print("\n".join(map(str, breakages)))
+        return True
+    cover = None
+    if not options.known:
+        cover = Cover()
+        cover.measure(2)
+    return options.measure or run_all(breakages, options, cover)
+
+
+if __name__ == "__main__":
+    sys.exit(0 if main() else 1)
