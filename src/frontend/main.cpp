@@ -6,7 +6,8 @@
 
 #include <cstdio>
 #include <cstdlib>
-#include <vector>
+#include <memory>
+#include <new>
 
 #include "frontend/commands.h"
 #include "frontend/log.h"
@@ -113,11 +114,9 @@ void leave_no_core() {
   prctl(PR_SET_DUMPABLE, 0);
 }
 
-void log_arguments(char** argv, const std::vector<int>& shown, Caller caller) {
-  int i = 0;
-  for (const int length : shown) {
-    LOG_AT(caller, 1, "arg[%d]: '%.*s%s'", i, length, argv[i], length < 0 ? "" : kMaskedSecret);
-    i++;
+void log_arguments(int argc, char** argv, const int* shown, Caller caller) {
+  for (int i = 0; i < argc; i++) {
+    LOG_AT(caller, 1, "arg[%d]: '%.*s%s'", i, shown[i], argv[i], shown[i] < 0 ? "" : kMaskedSecret);
   }
 }
 
@@ -125,10 +124,12 @@ void log_arguments(char** argv, const std::vector<int>& shown, Caller caller) {
 
 int main(int argc, char** argv) {
   leave_no_core();
-  const std::vector<int> shown = hide_secrets(argc, argv);
+  const std::unique_ptr<int[]> shown(new (std::nothrow) int[static_cast<size_t>(argc) + 1]);
+  if (!shown) return fail(false);
+  hide_secrets(argc, argv, shown.get());
   debug_level = dbg_get_remvol_debug_lv();
   keep_program_path(argc, argv);
-  log_arguments(argv, shown, Caller());
+  log_arguments(argc, argv, shown.get(), Caller());
   request_target = TargetEntry();
   Options options;
   switch (parse_options(argc, argv, &options)) {

@@ -190,19 +190,18 @@ int format_ipv6(char* address, const sockaddr_in6& socket, Caller caller) {
 
 }  // namespace
 
-std::vector<int> hide_secrets(int argc, char** argv) {
-  std::vector<int> shown(static_cast<size_t>(argc), -1);
+void hide_secrets(int argc, char** argv, int* shown) {
+  for (int i = 0; i < argc; i++) shown[i] = -1;
   const Text<64> in_order("-%s", kShortOptions);  // the arguments stay in their order; getopt_long(3)
   opterr = 0;
   int option = 0;
   while ((option = getopt_long(argc, argv, in_order, long_options(), nullptr)) != -1) {
     if (option != kSecretOption) continue;
     const int index = optind - 1;
-    shown[static_cast<size_t>(index)] = move_secret(&argv[index], optarg);
+    shown[index] = move_secret(&argv[index], optarg);
   }
   opterr = 1;
   optind = 0;  // the reading begins anew
-  return shown;
 }
 
 ParseEnd parse_options(int argc, char** argv, Options* options) {

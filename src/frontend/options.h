@@ -2,8 +2,6 @@
 #ifndef REMVOL_FRONTEND_OPTIONS_H
 #define REMVOL_FRONTEND_OPTIONS_H
 
-#include <vector>
-
 namespace remvol {
 
 // How the reading of the command line ended.
@@ -21,9 +19,9 @@ struct Options {
 };
 
 // The process list shows a process's arguments to everybody: moves every argument with a secret (-P) into
-// memory of the tool's own, overwrites the secret where it stood and points `argv` to the copy. Returns for
-// each argument how many characters of it may be shown, -1 for all.
-std::vector<int> hide_secrets(int argc, char** argv);
+// memory of the tool's own, overwrites the secret where it stood and points `argv` to the copy. Puts into
+// `shown` (`argc` numbers) how many characters of each argument may be shown, -1 for all.
+void hide_secrets(int argc, char** argv, int* shown);
 
 // Reads the arguments into the request record and `options`. -d and -v do their work at once and end the
 // reading. A value that is longer than its field fails; cut, two long names would become one.

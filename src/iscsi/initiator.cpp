@@ -21,6 +21,7 @@
 #include "tree/settings_file.h"
 #include "tree/state.h"
 #include "upgrade/remvol_ver_upgrade.h"
+#include "volume/session_volumes.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
@@ -176,7 +177,7 @@ int task_init() {
 int task_deinit(int system_off) {
   LOG(2, system_off != 0 ? "system off" : "deinit start");
   Target_umount_all();
-  run_command(kLogoutAllCommand);
+  if (unmount_session_volumes(nullptr)) run_command(kLogoutAllCommand);
   LOG(1, "killall -SIGTERM iscsid ");
   bool succeeded = run_command("killall -SIGTERM iscsid") == 0;
   LOG(2, "deinit end");

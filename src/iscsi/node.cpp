@@ -24,6 +24,7 @@
 #include "tree/status_text.h"
 #include "volume/mount.h"
 #include "volume/mount_point.h"
+#include "volume/session_volumes.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
@@ -57,6 +58,7 @@ int _target_chap_apply(TargetEntry* entry) {
 }
 
 int log_out(const TargetEntry* entry, Caller caller) {
+  if (!unmount_session_volumes(entry->target_name, caller)) return 1;
   return run_command(logout_command(*entry), caller) == 0 ? 0 : 1;
 }
 
@@ -184,6 +186,11 @@ void give_up_session(TargetEntry* entry, int reason, VolumeState state, Caller c
     LOG_AT(caller, 1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
   } else if (reason == kNoRunningDisk) {
     LOG_AT(caller, 1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
+  }
+  // A listing that failed, or a disk that does not run just now, is no reason to pull it from under a volume.
+  if (has_session_volume(entry->target_name)) {
+    LOG_AT(caller, 0, "the session of target %s stays, a volume is mounted from it", entry->target_name);
+    return;
   }
   // Written after a logout that worked; readers of the log know it so.
   if (Target_Logout(entry) == kOk) LOG_AT(caller, 1, "Logout Fail on Target: %s ", entry->target_name);

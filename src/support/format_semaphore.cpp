@@ -7,6 +7,7 @@
 #include <cerrno>
 
 #include "frontend/log.h"
+#include "support/run_lock.h"
 
 namespace remvol {
 
@@ -88,9 +89,17 @@ int create_format_sem(int initial, Caller caller) {
   return -1;
 }
 
-// Returns the id of the format semaphore, made when missing, or -1.
+// A set that nobody has entered yet and that lets nobody in: the run that made it was killed before it gave
+// it its value.
+bool was_left_without_value(int sem_id) {
+  semid_ds status{};
+  return read_status(sem_id, &status) && status.sem_otime == 0 && semctl(sem_id, 0, GETVAL) == 0;
+}
+
+// Returns the id of the format semaphore, made when missing, or -1. One run at a time.
 int find_format_sem(int initial, Caller caller) {
   const int sem_id = get_own_set(kFormatSemMode, caller);
+  if (sem_id != -1 && was_left_without_value(sem_id)) return create_format_sem(initial, caller);
   if (sem_id != -1) return sem_id;
   const int error = errno;
   LOG_AT(caller, 0, "semget(...) == -1, errno = %d", error);
@@ -107,7 +116,10 @@ int format_sem_P(int* sem_id, int initial) {
     LOG(1, "pid = %lu, is in format critical section still", static_cast<unsigned long>(getpid()));
     return 0;
   }
+  RunLock lock;
+  lock.take("format-semaphore.lock", LockMode::kExclusive);
   const int found = find_format_sem(initial, Caller());
+  lock.release();
   if (found == -1) return -1;
   *sem_id = found;
   LOG(2, "get sem_id = %d", found);

@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 
 #include "support/files.h"
 #include "support/text.h"
@@ -25,7 +26,18 @@ bool lock_file(int fd, int operation) {
   return true;
 }
 
+// FNV-1a.
+uint64_t hash_of(const char* text) {
+  uint64_t hash = 14695981039346656037U;
+  for (; *text != '\0'; text++) hash = (hash ^ static_cast<unsigned char>(*text)) * 1099511628211U;
+  return hash;
+}
+
 }  // namespace
+
+LockName hashed_lock_name(const char* kind, const char* name) {
+  return LockName("%s-%016llx.lock", kind, static_cast<unsigned long long>(hash_of(name)));
+}
 
 LockTry RunLock::open_and_lock(const char* name, int open_flags, int operation) {
   release();
@@ -51,10 +63,18 @@ LockTry RunLock::try_existing(const char* name, LockMode mode) {
   return open_and_lock(name, 0, operation_of(mode) | LOCK_NB);
 }
 
+void RunLock::take_again(const char* name, LockMode mode) {
+  if (fd_ < 0 || !lock_file(fd_, operation_of(mode))) take(name, mode);
+}
+
 // Unlocked by name, not by closing alone: a child that was forked meanwhile shares the open file.
+void RunLock::pause() {
+  if (fd_ >= 0) flock(fd_, LOCK_UN);
+}
+
 void RunLock::release() {
   if (fd_ < 0) return;
-  flock(fd_, LOCK_UN);
+  pause();
   close(fd_);
   fd_ = -1;
 }

@@ -6,6 +6,8 @@
 #ifndef REMVOL_SUPPORT_RUN_LOCK_H
 #define REMVOL_SUPPORT_RUN_LOCK_H
 
+#include "support/text.h"
+
 namespace remvol {
 
 inline constexpr char kRunDir[] = "/run/remvol";
@@ -17,6 +19,10 @@ enum class LockTry {
   kBusy,  // another run holds it
   kNone,  // there is no such lock, and none could be made
 };
+
+// A lock's name for something that has a name of any form.
+using LockName = Text<64>;
+LockName hashed_lock_name(const char* kind, const char* name);
 
 class RunLock {
  public:
@@ -35,8 +41,13 @@ class RunLock {
   // The same for a lock that some run has taken before: without one, kNone, and none is made.
   [[nodiscard]] LockTry try_existing(const char* name, LockMode mode);
 
+  // Takes a lock again that was paused, or takes it for the first time: for one that is held many times.
+  void take_again(const char* name, LockMode mode);
+
+  // Lets the lock go, and keeps its file open.
+  void pause();
+
   void release();
-  bool is_held() const { return fd_ >= 0; }
 
  private:
   LockTry open_and_lock(const char* name, int open_flags, int operation);

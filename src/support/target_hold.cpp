@@ -2,7 +2,6 @@
 
 #include <unistd.h>
 
-#include <cstdint>
 #include <cstring>
 
 #include "support/format_semaphore.h"
@@ -12,27 +11,25 @@ namespace remvol {
 
 namespace {
 
-using LockName = Text<64>;
-
 constexpr useconds_t kBriefPoll = 100000;  // microseconds
 constexpr int kBriefPolls = 600;
 
 // What this run holds; empty: nothing.
 char held_target[256];
 
-// A file name of fixed length for names of any form; the hash is FNV-1a.
-uint64_t hash_of(const char* text) {
-  uint64_t hash = 14695981039346656037U;
-  for (; *text != '\0'; text++) hash = (hash ^ static_cast<unsigned char>(*text)) * 1099511628211U;
-  return hash;
-}
-
 LockName target_lock(const char* target_name) {
-  return LockName("target-%016llx.lock", static_cast<unsigned long long>(hash_of(target_name)));
+  return hashed_lock_name("target", target_name);
 }
 
 LockName lun_lock(const char* target_name, int lun) {
-  return LockName("target-%016llx-%d.lock", static_cast<unsigned long long>(hash_of(target_name)), lun);
+  return hashed_lock_name(Text<32>("lun-%d", lun), target_name);
+}
+
+// Returns whether this run did not hold the target before.
+bool enter(const char* target_name) {
+  if (strcmp(held_target, target_name) == 0) return false;
+  copy_text(held_target, target_name);
+  return true;
 }
 
 // Takes the lock. Returns whether it had to be waited for. Who holds it may itself wait for the format
@@ -46,19 +43,17 @@ bool take_waiting(RunLock* lock, const char* name, LockMode mode) {
 
 }  // namespace
 
-bool TargetHold::enter(const char* target_name) {
-  if (strcmp(held_target, target_name) == 0) return false;
-  copy_text(held_target, target_name);
-  outermost_ = true;
-  return true;
+void mark_target(const char* target_name) {
+  RunLock lock;
+  (void)lock.try_take(target_lock(target_name), LockMode::kShared);
 }
 
-TargetHold::TargetHold(const char* target_name) {
-  if (enter(target_name)) waited_ = take_waiting(&target_, target_lock(target_name), LockMode::kExclusive);
+TargetHold::TargetHold(const char* target_name) : outermost_(enter(target_name)) {
+  if (outermost_) waited_ = take_waiting(&target_, target_lock(target_name), LockMode::kExclusive);
 }
 
-TargetHold::TargetHold(const char* target_name, int lun) {
-  if (!enter(target_name)) return;
+TargetHold::TargetHold(const char* target_name, int lun) : outermost_(enter(target_name)) {
+  if (!outermost_) return;
   waited_ = take_waiting(&target_, target_lock(target_name), LockMode::kShared);
   waited_ |= take_waiting(&lun_, lun_lock(target_name, lun), LockMode::kExclusive);
 }
@@ -67,12 +62,19 @@ TargetHold::~TargetHold() {
   if (outermost_) held_target[0] = '\0';
 }
 
-BriefTargetHold::BriefTargetHold(const char* target_name, bool (*may_wait)(int dbidx), int dbidx) {
+BriefTargetHold::BriefTargetHold(const char* target_name, bool (*may_wait)(int dbidx), int dbidx)
+    : outermost_(enter(target_name)) {
+  if (!outermost_) return;
   const LockName name = target_lock(target_name);
   for (int polls = 0; target_.try_take(name, LockMode::kExclusive) == LockTry::kBusy; polls++) {
+    waited_ = true;
     if (polls == kBriefPolls || !may_wait(dbidx)) return;
     usleep(kBriefPoll);
   }
+}
+
+BriefTargetHold::~BriefTargetHold() {
+  if (outermost_) held_target[0] = '\0';
 }
 
 IdleTarget::IdleTarget(const char* target_name)

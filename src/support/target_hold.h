@@ -11,6 +11,9 @@
 
 namespace remvol {
 
+// Leaves a sign that a run works on the target, for IdleTarget.
+void mark_target(const char* target_name);
+
 class TargetHold {
  public:
   // For the whole target. Waits for every run that brings it, or a LUN of it, up. A target that this run
@@ -28,26 +31,34 @@ class TargetHold {
   bool waited() const { return waited_; }
 
  private:
-  bool enter(const char* target_name);
-
   RunLock target_;
   RunLock lun_;
   bool outermost_ = false;
   bool waited_ = false;
 };
 
-// Holds the whole target for a run that takes something away, unless that needs a long wait.
+// Holds the whole target for a run that takes something away, or is there for a moment, unless that needs a
+// long wait.
 class BriefTargetHold {
  public:
-  // Waits for as long as `may_wait` says of the target's slot, asked again and again, and never longer than a
-  // minute.
+  // A target that this run holds already is held on. Waits for as long as `may_wait` says of the target's
+  // slot, asked again and again, and never longer than a minute.
   BriefTargetHold(const char* target_name, bool (*may_wait)(int dbidx), int dbidx);
+  BriefTargetHold(const BriefTargetHold&) = delete;
+  BriefTargetHold& operator=(const BriefTargetHold&) = delete;
+  ~BriefTargetHold();
+
+  // Whether another run held it: what was read before may have changed.
+  bool waited() const { return waited_; }
 
  private:
   RunLock target_;
+  bool outermost_ = false;
+  bool waited_ = false;
 };
 
-// Holds the whole target, or one LUN of it (0 or more), when a run has held it before and none does now.
+// Holds the whole target, or one LUN of it (0 or more), when a run has held or marked it before and none holds it
+// now.
 class IdleTarget {
  public:
   explicit IdleTarget(const char* target_name);

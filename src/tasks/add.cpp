@@ -64,6 +64,7 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
 // Stores the requested target and LUN, in one step for other runs. Returns 0 with both slots, or -1.
 int _store_requested_lun(int* dbidx, int* lun_dbidx, Caller caller = Caller()) {
   TargetEntry* const entry = &request_target;
+  mark_target(entry->target_name);
   const SlotsHeld held(SlotsHeld::kChange);
   drop_half_made_luns();
   *dbidx = ktree_add_entry(entry);

@@ -15,6 +15,7 @@
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/mount.h"
+#include "volume/session_volumes.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
@@ -84,6 +85,7 @@ int _disconnect_all(Caller caller = Caller()) {
   LOG_AT(caller, 1, "update share folder status");
   reload_share_services();
   LOG_AT(caller, 1, "finish share folder status");
+  if (!unmount_session_volumes(nullptr, caller)) return 1;
   return run_command(kLogoutAllCommand, caller) == 0 ? kOk : 1;
 }
 

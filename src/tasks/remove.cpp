@@ -60,7 +60,6 @@ int _remove_target(TargetEntry* entry, Caller caller = Caller()) {
 int _remove_lun(int dbidx, int lun_dbidx, Caller caller = Caller()) {
   TargetEntry lun;
   if (read_requested_lun(&lun, dbidx, lun_dbidx, caller) != kOk) return kFailed;
-  const BriefTargetHold hold(lun.target_name, is_no_lun_formatting, dbidx);
   reload_lun_share(&lun);
   Target_LUN_umount(&lun);
   return _delete_slot(dbidx, lun_dbidx, caller);
@@ -84,6 +83,8 @@ int task_del() {
 
 int task_del_lun() {
   LOG(2, "start");
+  const char* name = request_target.target_name;
+  const BriefTargetHold hold(name, is_no_lun_formatting, ktree_get_dbidx_by_targetname(name));
   int dbidx = 0;
   int lun_dbidx = 0;
   int result = kFailed;
@@ -99,6 +100,8 @@ int task_del_lun() {
     result = task_del();
   } else if (result == kOk) {
     result = _remove_lun(dbidx, lun_dbidx);
+    target_gone = result == kOk && ktree_count_target_luns(dbidx) == 0;
+    if (target_gone) result = task_del();  // another run has removed the others meanwhile
   }
   if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);
   LOG(2, "end, ret = %d", result);

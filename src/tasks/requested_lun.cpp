@@ -1,5 +1,7 @@
 #include "tasks/requested_lun.h"
 
+#include <cstring>
+
 #include "frontend/request.h"
 #include "support/result.h"
 #include "tree/entry.h"
@@ -22,7 +24,11 @@ int find_requested_lun(int* dbidx, int* lun_dbidx, Caller caller) {
 }
 
 int read_requested_lun(TargetEntry* entry, int dbidx, int lun_dbidx, Caller caller) {
-  if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) == kOk) return kOk;
+  // Another run may have deleted the LUN since it was found; another one has its slot then.
+  if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) == kOk && entry->lun == request_target.lun &&
+      strcmp(entry->target_name, request_target.target_name) == 0) {
+    return kOk;
+  }
   LOG_AT(caller, 0, "Can not get lun entry %d under target %s", request_target.lun,
          request_target.target_name);
   return kFailed;

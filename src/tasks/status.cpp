@@ -6,6 +6,7 @@
 #include "frontend/log.h"
 #include "iscsi/session.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/repair.h"
 #include "tree/access.h"
@@ -94,11 +95,21 @@ void _prune_slots_behind(int count, Caller caller = Caller()) {
   }
 }
 
+// Counts the targets that a run has stored and not counted, since it was killed in between.
+void _repair_count() {
+  const SlotsHeld held(SlotsHeld::kChange);
+  const int count = tree_read_number(key::kTargetCount, kMaxTargets);
+  char name[sizeof TargetEntry::target_name];
+  if (count < 0 || !tree_read(KeyText(key::kTargetName, count + 1), name)) return;
+  if (IdleTarget(name)) ktree_update_current_targetcnt();
+}
+
 }  // namespace
 
 int task_status() {
   LOG(2, "start");
-  if (drop_half_made_slots()) ktree_update_current_targetcnt();
+  drop_half_made_slots();
+  _repair_count();
   char text[128];
   if (!tree_read(key::kTargetCount, text)) return kFailed;
   const int count = std::min(atoi(text), kMaxTargets);

@@ -4,6 +4,7 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
+#include "tree/entry.h"
 #include "tree/keys.h"
 #include "tree/record.h"
 #include "tree/slots.h"
@@ -12,20 +13,26 @@ namespace remvol {
 
 namespace {
 
+// A read that failed looks like a key that is missing: that counts when it is so twice, and another key of
+// the slot can be read in between.
+bool is_missing(const char* key, const char* present) {
+  return !tree_present(key) && tree_present(present) && !tree_present(key);
+}
+
 bool is_half_made_lun(int n, int m) {
-  return tree_present(KeyText(key::kLunNumber, n, m)) && !tree_present(KeyText(key::kLunShare, n, m));
+  const KeyText number(key::kLunNumber, n, m);
+  return tree_present(number) && is_missing(KeyText(key::kLunShare, n, m), number);
 }
 
 bool is_half_made_target(int n) {
-  return tree_present(KeyText(key::kTargetName, n)) && !tree_present(KeyText(key::kTargetIp, n)) &&
-         !tree_present(KeyText(key::kLunNumber, n, 1));
+  const KeyText name(key::kTargetName, n);
+  return tree_present(name) && is_missing(KeyText(key::kTargetIp, n), name) &&
+         is_missing(KeyText(key::kLunNumber, n, 1), name);
 }
 
-bool drop(const char* path) {
+void drop(const char* path) {
   LOG(0, "half made slot '%s' is deleted", path);
-  if (tree_delete(path) == kOk) return true;
-  LOG(0, "ktreec_del() of path '%s' failed", path);
-  return false;
+  if (tree_delete(path) != kOk) LOG(0, "ktreec_del() of path '%s' failed", path);
 }
 
 void drop_half_made_luns_of(int n) {
@@ -42,14 +49,14 @@ void drop_half_made_luns() {
   for (int n = 1; n <= kMaxTargets; n++) drop_half_made_luns_of(n);
 }
 
-bool drop_half_made_slots() {
+void drop_half_made_slots() {
   const SlotsHeld held(SlotsHeld::kChange);
-  bool dropped = false;
   for (int n = kMaxTargets; n >= 1; n--) {
     drop_half_made_luns_of(n);
-    if (is_half_made_target(n)) dropped |= drop(KeyText(key::kTarget, n));
+    if (!is_half_made_target(n)) continue;
+    drop(KeyText(key::kTarget, n));
+    ktree_update_current_targetcnt();
   }
-  return dropped;
 }
 
 }  // namespace remvol

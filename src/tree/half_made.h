@@ -8,9 +8,8 @@ namespace remvol {
 // Deletes the LUN slots of stored targets that have a number, but no share.
 void drop_half_made_luns();
 
-// The same, and the target slots that have a name, but neither an address nor a LUN. Returns whether a target
-// slot was deleted: the count of targets is another one then.
-bool drop_half_made_slots();
+// The same, and the target slots that have a name, but neither an address nor a LUN.
+void drop_half_made_slots();
 
 }  // namespace remvol
 

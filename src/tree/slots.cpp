@@ -80,11 +80,11 @@ int find_lun(int n, int m, int now, Caller caller) {
 
 SlotsHeld::SlotsHeld(Purpose purpose) {
   if (holders++ > 0) return;
-  slots_lock.take(kSlotsLock, purpose == kChange ? LockMode::kExclusive : LockMode::kShared);
+  slots_lock.take_again(kSlotsLock, purpose == kChange ? LockMode::kExclusive : LockMode::kShared);
 }
 
 SlotsHeld::~SlotsHeld() {
-  if (--holders == 0) slots_lock.release();
+  if (--holders == 0) slots_lock.pause();
 }
 
 HeldSlot::HeldSlot(int n, int m, Caller caller)

@@ -64,6 +64,15 @@ DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
   return strcmp(name, entry->target_name) == 0 && lun == entry->lun ? kDiskOurs : kDiskForeign;
 }
 
+bool is_session_disk(const char* node, const char* target_name) {
+  SysfsPath path;
+  if (!find_device(node, path)) return false;
+  const char* session_end = find_session_end(path);
+  if (session_end == nullptr || target_name == nullptr) return session_end != nullptr;
+  char name[256];
+  return read_target_name(path, session_end, name) && strcmp(name, target_name) == 0;
+}
+
 bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller) {
   if (disk_owner(entry, node) != kDiskForeign) return false;
   LOG_AT(caller, 0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun,

@@ -18,6 +18,10 @@ enum DiskOwner : int {
 // Asks sysfs for the disk of `node`, a disk or partition with or without "/dev/" in front.
 DiskOwner disk_owner(const TargetEntry* entry, const char* node);
 
+// Returns whether the disk of `node` is one of a session to the target called `target_name`, or to any when
+// that is null.
+bool is_session_disk(const char* node, const char* target_name);
+
 // Returns whether the disk of `node` is known to be another one than the entry's; then nothing that changes
 // it or ends its users may be done. That is logged at level 0 in the caller's name.
 bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller = Caller());

@@ -99,6 +99,10 @@ Mounted find_mount_below(const char* path, MountLine* mount) {
   return find([path](const MountLine& line) { return is_at_or_below(line.path, path); }, mount);
 }
 
+Mounted find_mount(bool (*fits)(const MountLine&, const void*), const void* what, MountLine* mount) {
+  return find([fits, what](const MountLine& line) { return fits(line, what); }, mount);
+}
+
 Mounted find_mount_of(dev_t device, const char* path, MountLine* mount) {
   return find(
       [device, path](const MountLine& line) {

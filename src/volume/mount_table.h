@@ -23,6 +23,10 @@ enum class Mounted { no, yes, unknown };  // unknown: the table cannot be read
 // `mount`.
 Mounted find_mount_below(const char* path, MountLine* mount);
 
+// Looks for the first mount that `fits(mount, what)`.
+Mounted find_mount(bool (*fits)(const MountLine& mount, const void* what), const void* what,
+                   MountLine* mount);
+
 // Looks for a mount of the file system on `device` at `path`, which is absolute and without links; anywhere
 // when it is null.
 Mounted find_mount_of(dev_t device, const char* path, MountLine* mount);

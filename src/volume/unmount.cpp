@@ -11,6 +11,7 @@
 #include "support/command.h"
 #include "support/files.h"
 #include "support/result.h"
+#include "support/run_lock.h"
 #include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -103,6 +104,10 @@ int Target_LUN_umount(const TargetEntry* entry) {
   }
   kill_node_users(entry);
   const MountPointText mount_point = mount_point_of(entry->share);
+  // One run after another: between the look and the kill another one could unmount, and the kill would then
+  // hit the users of the system's own disk.
+  RunLock lock;
+  lock.take(hashed_lock_name("volume", mount_point), LockMode::kExclusive);
   if (check_path_exist(mount_point) != 0) return kOk;
   if (sys_mount_point(mount_point) != 0) {
     remount_mnt_path(mount_point, 0);

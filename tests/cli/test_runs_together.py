@@ -93,6 +93,27 @@ class TestStandingBehindAState:
         assert stored.lun("status").startswith("Formatting")
 
 
+class TestHalfMadeSlots:
+    def test_a_share_that_could_not_be_read_once_costs_no_lun(self, stored, box):
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/lun/id:1/share", ret=-1, times=1)
+        status(box)
+        assert (stored.lun("lun"), stored.lun("share")) == ("0", "a")
+
+    def test_a_lun_without_a_share_is_gone_after_a_status(self, stored, box):
+        box.tree.delete(f"{INITIATOR}/id:1/lun/id:1/share")
+        assert f"half made slot '{INITIATOR}/id:1/lun/id:1' is deleted" in messages(status(box))
+        assert stored.lun("lun") is None and stored.target("target") == "iqn.t1"
+
+    def test_a_target_that_a_killed_add_has_not_counted_is_refreshed(self, site, box):
+        site.store("iqn.t0")
+        site.offer("iqn.t1", {0: "sdb"})
+        box.hook("ktreec_set", f"{INITIATOR}/id:2/lun/id:1/share", through=True, effect="kill -KILL $PPID", times=1)
+        assert box.remvol(*TestAdding.ADD).status == -9
+        assert box.tree.get(f"{INITIATOR}/count") == "1"
+        status(box)
+        assert (box.tree.get(f"{INITIATOR}/count"), site.target("status", 2)) == ("2", "Disconnected")
+
+
 class TestOneAfterAnother:
     def test_two_connections_of_a_target_follow_one_another(self, stored, box):
         box.hook("popen", LOGIN, through=True, delay=0.5, times=1)

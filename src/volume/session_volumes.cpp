@@ -1,0 +1,47 @@
+#include "volume/session_volumes.h"
+
+#include <cstring>
+
+#include "support/text.h"
+#include "tree/record.h"
+#include "volume/disk_identity.h"
+#include "volume/mount_point.h"
+#include "volume/mount_table.h"
+#include "volume/unmount.h"
+
+namespace remvol {
+
+namespace {
+
+constexpr int kMaxVolumes = 64;
+
+bool is_session_volume(const MountLine& mount, const void* target_name) {
+  return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0 &&
+         is_session_disk(mount.source, static_cast<const char*>(target_name));
+}
+
+bool find_session_volume(const char* target_name, MountLine* mount) {
+  return find_mount(is_session_volume, target_name, mount) == Mounted::yes;
+}
+
+}  // namespace
+
+bool has_session_volume(const char* target_name) {
+  MountLine mount;
+  return find_session_volume(target_name, &mount);
+}
+
+bool unmount_session_volumes(const char* target_name, Caller caller) {
+  MountLine mount;
+  for (int volumes = 0; find_session_volume(target_name, &mount); volumes++) {
+    TargetEntry entry = {};
+    copy_text(entry.share, mount.path + strlen(kMountRoot));
+    copy_text(entry.mnt_dev, mount.source);
+    if (volumes < kMaxVolumes && Target_LUN_umount(&entry) == 0) continue;
+    LOG_AT(caller, 0, "the session of %s stays, it is mounted on %s", mount.source, mount.path);
+    return false;
+  }
+  return true;
+}
+
+}  // namespace remvol
