@@ -14,6 +14,8 @@ sys.path.insert(0, str(pathlib.Path(__file__).parent))
 from faults import Faults  # noqa: E402
 from many import Round  # noqa: E402
 from pairs import PAIRS, torment  # noqa: E402
+import power  # noqa: E402
+import replay  # noqa: E402
 
 
 def kinds(found):
@@ -122,6 +124,8 @@ def main():
     faults.add_argument("--seed", type=int, default=1)
     faults.add_argument("--jobs", type=int, default=2)
     faults.set_defaults(run=run_faults)
+    power.add_form(forms)
+    replay.add_form(forms)
     options = parser.parse_args()
     sys.exit(0 if options.run(options) else 1)
 
