@@ -52,12 +52,11 @@ bool is_strangers_file(const char* path) {
   return !S_ISREG(info.st_mode) || (info.st_uid != 0 && info.st_uid != geteuid());
 }
 
-void copy_to_flash(Caller caller) {
+void copy_to_flash() {
   if (access(kResetMark, F_OK) == 0 && !is_strangers_file(kResetMark)) return;
   RunLock lock;
   lock.take("flash.lock", LockMode::kExclusive);  // the last to copy copies the newest settings
-  if (System("flashrun \"cp -f %s /usr/local/config/\"", kSettingsFile) == 0) return;
-  LOG_AT(caller, 0, "%s could not be copied to the configuration flash", kSettingsFile);
+  System("flashrun \"cp -f %s /usr/local/config/\"", kSettingsFile);  // tells of a failure itself
 }
 
 // Dumps the tree. Returns whether the settings file may go to the flash.
@@ -79,7 +78,7 @@ int succeed(const Command& command, int result, const TreeInstance& tree, Caller
   record_result(NumberText("%d", result));
   const bool stored = dump_settings(caller);
   if (command.persists && was_change_lost(tree, caller)) return fail(false);
-  if (command.persists && stored) copy_to_flash(caller);
+  if (command.persists && stored) copy_to_flash();
   if (command.persists) reload_share_services();
   return result;
 }
