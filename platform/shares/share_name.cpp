@@ -19,6 +19,22 @@ const NameRules kNetatalkNames = {L"%<>*?|/\\+=;:\",[]$", {L"global", L"homes"},
 
 namespace {
 
+// Words of some scripts hold a joiner or its opposite, and emoji a joiner or what chooses their form: not one
+// of them stands behind ASCII but in a key cap, which has the mark of one behind it.
+bool is_part_of_writing(const std::wstring& characters, size_t at) {
+  constexpr std::wstring_view kJoiners = L"\u200c\u200d\ufe0e\ufe0f";
+  constexpr wchar_t kKeyCap = 0x20e3;
+  if (at == 0 || kJoiners.find(characters[at]) == std::wstring_view::npos) return false;
+  return characters[at - 1] >= 0x80 || (at + 1 < characters.size() && characters[at + 1] == kKeyCap);
+}
+
+bool hides_something(const std::wstring& characters) {
+  for (size_t at = 0; at < characters.size(); ++at) {
+    if (platform::is_invisible(characters[at]) && !is_part_of_writing(characters, at)) return true;
+  }
+  return false;
+}
+
 bool is_reserved(std::string_view name, const NameRules& rules) {
   std::wstring plain = folded_name(name);
   plain.erase(std::remove(plain.begin(), plain.end(), L' '), plain.end());
@@ -35,7 +51,7 @@ const char* name_refusal(std::string_view name, const NameRules& rules) {
   if (!platform::decode(name, characters)) return "it is not UTF-8";
   if (std::any_of(characters.begin(), characters.end(), platform::is_control))
     return "it holds a control character";
-  if (std::any_of(characters.begin(), characters.end(), platform::is_invisible))
+  if (hides_something(characters))
     return "it holds a character that is not seen or that turns the text around";
   if (characters.find_first_of(rules.forbidden) != std::wstring::npos) {
     return "it holds a character that the file server does not allow in names";
@@ -49,6 +65,7 @@ const char* name_refusal(std::string_view name, const NameRules& rules) {
 std::wstring folded_name(std::string_view name) {
   std::wstring characters;
   platform::decode(name, characters);
+  std::erase_if(characters, platform::is_invisible);
   for (wchar_t& character : characters) character = platform::lower_case(character);
   return characters;
 }

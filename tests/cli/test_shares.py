@@ -150,7 +150,9 @@ def test_the_last_share_that_goes_leaves_an_empty_file(shares):
 
 
 @pytest.mark.parametrize("name", ["two words", "日本語", "Ünïcode – 3", "C# notes", "it's", "a&b", "$HOME", "-rf",
-                                  "x" * 120, "(1)", "!", "~"])
+                                  "x" * 120, "(1)", "!", "~", "Stra\u00dfe u\u0308ber", "\U0001f4f7 Fotos",
+                                  "\u2764\ufe0f", "\U0001f468\u200d\U0001f469\u200d\U0001f467",
+                                  "\U0001f441\ufe0f\u200d\U0001f5e8\ufe0f", "1\ufe0f\u20e3", "\u0645\u06cc\u200c\u062e\u0648\u0627\u0647\u0645"])
 def test_unusual_names_are_shared(shares, name):
     shares.add(name)
     assert shares.reload() == ""
@@ -204,6 +206,14 @@ def test_a_name_that_leads_elsewhere_is_never_shared(shares, name):
     shares.add(name, mounted=False)
     shares.reload()
     assert not shares.box.path(SHARES).exists()
+
+
+def test_names_that_differ_in_what_is_not_seen_alone_are_one_share(shares):
+    shares.add("\u2764\ufe0f")
+    shares.add("\u2764")
+    log = shares.reload()
+    assert shares.file() == HEAD + section("\u2764\ufe0f")
+    assert log == 'winshare_reload: volume "\u2764" is not shared: another share has this name\n'
 
 
 def test_names_that_differ_in_case_alone_are_one_share(shares):
