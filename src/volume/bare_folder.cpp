@@ -101,6 +101,7 @@ Path draft_of(const char* path) {
 // own. Does nothing where that cannot be had.
 void make_unseen(const char* path) {
   const Path draft = draft_of(path);
+  lift_left_cover(draft);
   rmdir(draft);
   if (access(path, F_OK) == 0 || mkdir(draft, 0777) != 0) return;
   const Folder folder(draft);
@@ -127,6 +128,8 @@ bool remove_folder(const void* what) {
 }  // namespace
 
 void make_bare_folder(const char* path) {
+  mkdir(kMountRoot, 0777);
+  lift_left_cover(path);
   walk_to(path, [](const char* parent) {
     release(parent);  // a killed run may have left it, of a share that is named so
     mkdir(parent, 0777);

@@ -3,14 +3,20 @@
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstring>
+
+#include "volume/mount_table.h"
 
 namespace remvol {
 
 namespace {
+
+constexpr char kSource[] = "remvol-cover";  // what the mount table shows for a device
 
 enum Outcome : int { kDone, kNotDone };
 
@@ -43,7 +49,7 @@ bool run_covered(const char* path, bool (*work)(const void*), const void* what) 
   char word = 0;
   const bool covered =
       child > 0 && read(link[0], &word, 1) == 1 &&
-      mount("none", path, "tmpfs", MS_RDONLY | MS_NODEV | MS_NOSUID | MS_NOEXEC, "size=4k") == 0;
+      mount(kSource, path, "tmpfs", MS_RDONLY | MS_NODEV | MS_NOSUID | MS_NOEXEC, "size=4k") == 0;
   if (covered) send(link[0], &word, 1, MSG_NOSIGNAL);
   close(link[0]);
   const bool done = child > 0 && ended_well(child);
@@ -53,6 +59,13 @@ bool run_covered(const char* path, bool (*work)(const void*), const void* what) 
 
 void lift_cover(const char* path) {
   umount2(path, MNT_DETACH | UMOUNT_NOFOLLOW);
+}
+
+void lift_left_cover(const char* path) {
+  struct stat top;
+  MountLine mount;
+  if (stat(path, &top) != 0 || find_mount_of(top.st_dev, path, &mount) != Mounted::yes) return;
+  if (strcmp(mount.source, kSource) == 0) lift_cover(path);
 }
 
 }  // namespace remvol

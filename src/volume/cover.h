@@ -15,6 +15,9 @@ bool run_covered(const char* path, bool (*work)(const void* what), const void* w
 // Takes the cover off the folder.
 void lift_cover(const char* path);
 
+// Takes off a cover that a killed run has left on the folder; what else is mounted there stays.
+void lift_left_cover(const char* path);
+
 }  // namespace remvol
 
 #endif

@@ -236,6 +236,34 @@ TEST_F(MountedPath, NothingIsLeftOfTheMakingAndTheRemoval) {
   EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::no);
 }
 
+TEST_F(MountedPath, TheFirstFolderOfAMachineIsBareAsWell) {
+  std::filesystem::remove_all("/mnt/VV");
+  make_bare_folder(path.c_str());
+  EXPECT_TRUE(is_immutable(path));
+}
+
+TEST_F(MountedPath, ACoverThatAKilledRunLeftIsTakenOff) {
+  const std::string draft = "/mnt/VV/.new-Other";
+  std::filesystem::create_directory(draft);
+  for (const std::string& covered : {path, draft}) {
+    ASSERT_TRUE(run_covered(covered.c_str(), others_cannot_write, covered.c_str()));
+  }
+  make_bare_folder(path.c_str());
+  make_bare_folder("/mnt/VV/Other");
+  EXPECT_TRUE(is_immutable(path));
+  EXPECT_TRUE(is_immutable("/mnt/VV/Other"));
+  EXPECT_FALSE(std::filesystem::exists(draft));
+  MountLine cover;
+  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::no);
+}
+
+TEST_F(MountedPath, AVolumeIsNoCoverEvenOnTopOfOne) {
+  ASSERT_TRUE(run_covered(path.c_str(), others_cannot_write, path.c_str()));
+  put_layer();
+  make_bare_folder(path.c_str());
+  EXPECT_TRUE(std::filesystem::exists(path + "/file"));
+}
+
 TEST_F(MountedPath, SharesBelowAFolderThatAKilledRunLeft) {
   make_bare_folder(path.c_str());
   make_bare_folder((path + "/a/b").c_str());
