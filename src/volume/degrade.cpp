@@ -128,17 +128,6 @@ bool is_mtab_live() {
   return realpath(kMtab, target) != nullptr && strncmp(target, "/proc/", 6) == 0;
 }
 
-// Kernels 6.1.192, 6.12 and 6.13 show nothing of an ext4 that refuses every write: only a write tells. The
-// file has no name, so it leaves nothing behind. Errors other than a refusal decide nothing: not every file
-// system can make such a file.
-bool refuses_writes(const char* mount_path) {
-  const int fd = open(mount_path, O_TMPFILE | O_WRONLY | O_CLOEXEC, 0600);
-  const bool written = fd >= 0 && write(fd, "", 1) == 1 && fsync(fd) == 0;
-  const int error = written ? 0 : errno;
-  if (fd >= 0) close(fd);
-  return error == EROFS || error == EIO;
-}
-
 }  // namespace
 
 int get_mnt_ac_right_from_mnt_file(const char* device, const char* table) {
@@ -202,6 +191,17 @@ int check_mnt_dev_degrade_to_ro(const char* device, const char* mount_path) {
   }
   LOG(2, "access right in mtab and proc are both rw for dev %s", device);
   return 0;
+}
+
+// Kernels 6.1.192, 6.12 and 6.13 show nothing of an ext4 that refuses every write: only a write tells. The
+// file has no name, so it leaves nothing behind. Errors other than a refusal decide nothing: not every file
+// system can make such a file.
+bool refuses_writes(const char* mount_path) {
+  const int fd = open(mount_path, O_TMPFILE | O_WRONLY | O_CLOEXEC, 0600);
+  const bool written = fd >= 0 && write(fd, "", 1) == 1 && fsync(fd) == 0;
+  const int error = written ? 0 : errno;
+  if (fd >= 0) close(fd);
+  return error == EROFS || error == EIO;
 }
 
 }  // namespace remvol

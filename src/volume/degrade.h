@@ -23,6 +23,9 @@ int get_proc_mount_access_right(const char* device);
 // one of the tables, -2 on other failures. `mount_path` may be empty: no remount is tried then.
 int check_mnt_dev_degrade_to_ro(const char* device, const char* mount_path);
 
+// Returns whether the file system mounted on the path refuses a write, whatever the tables say of it.
+bool refuses_writes(const char* mount_path);
+
 }  // namespace remvol
 
 #endif

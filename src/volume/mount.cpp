@@ -18,6 +18,7 @@
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/bare_folder.h"
+#include "volume/degrade.h"
 #include "volume/format.h"
 #include "volume/mount_command.h"
 #include "volume/mount_point.h"
@@ -107,6 +108,13 @@ bool detect_fs(Volume* volume) {
   return volume->fs_type[0] != '\0';
 }
 
+// Returns whether it names what is left of a file system whose beginning is lost, not a file system: after a
+// format that failed, of the one that was to be overwritten.
+bool is_remains(const char* fs_type) {
+  constexpr char kDamaged[] = "damaged_";
+  return strncmp(fs_type, kDamaged, strlen(kDamaged)) == 0;
+}
+
 bool is_usable(Volume* volume) {
   volume->held.hold(volume->node);
   return sys_check_dev(volume->node) == 0;
@@ -185,7 +193,7 @@ int prepare_file_system(Volume* volume, Caller caller = Caller()) {
   const int result =
       volume->force_format != 0 ? create_file_system(volume, caller) : keep_file_system(volume, caller);
   if (result != kOk) return result;
-  const bool found = detect_fs(volume);
+  const bool found = detect_fs(volume) && !(volume->force_format != 0 && is_remains(volume->fs_type));
   volume->held.release();
   return found ? kOk : kFailed;
 }
@@ -210,6 +218,11 @@ int mount_file_system(const Volume* volume, Caller caller = Caller()) {
   return kMountUnsupported;
 }
 
+int record_read_only(const Volume* volume, Caller caller) {
+  if (record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
+  return kMountReadOnly;
+}
+
 // Opens the volume to everybody and records whether that could be written.
 int open_to_everybody(const Volume* volume, Caller caller = Caller()) {
   if (system(command_on_path("chmod 777", volume->mount_point)) == 0) {
@@ -218,8 +231,7 @@ int open_to_everybody(const Volume* volume, Caller caller = Caller()) {
   }
   LOG_AT(caller, 1, "change mode 777 to %s failed, this might be a read only filesystem",
          volume->entry->share);
-  if (record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
-  return kMountReadOnly;
+  return record_read_only(volume, caller);
 }
 
 int record_mount(const Volume* volume, Caller caller = Caller()) {
@@ -248,11 +260,16 @@ int record_outcome(const Volume* volume, Caller caller = Caller()) {
 }
 
 // A volume that is in use where it belongs is neither checked, formatted nor mounted over: its state is
-// recorded as after a mount, with all that follows one (its partition may have grown).
+// recorded as after a mount, with all that follows one (its partition may have grown). One that has turned
+// read-only since may take the chmod in memory alone.
 int keep_standing(const Volume* volume, Caller caller = Caller()) {
   LOG_AT(caller, 1, "%s is mounted on %s already", volume->node.c_str(), volume->mount_point.c_str());
-  const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
-  return note_update(result, caller) != 0 ? kTreeFailed : record_mount(volume, caller);
+  int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
+  if (note_update(result, caller) != 0) return kTreeFailed;
+  result = record_mount(volume, caller);
+  if (result != kOk || !refuses_writes(volume->mount_point)) return result;
+  LOG_AT(caller, 1, "%s takes no writes any more", volume->mount_point.c_str());
+  return record_read_only(volume, caller);
 }
 
 // Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.

@@ -683,6 +683,20 @@ def test_a_volume_whose_journal_was_aborted_is_degraded(luns):
     assert degraded(lun) == 0, "a new mount helps"
 
 
+def test_a_degraded_volume_that_is_mounted_still_is_not_called_writable(luns):
+    """On kernels 6.1.192, 6.12 and 6.13 the chmod goes through, in memory alone."""
+    lun = luns(300 * MIB)
+    lun.mount()
+    lun.box.run(["/usr/bin/mount", "-o", "remount,abort", lun.mount_point])
+    lun.box.fake("chmod", "777", first=True)
+    assert lun.mount().result == -7
+    assert (lun.key("volume_state"), lun.key("vol_access_right")) == ("0", "0")
+    assert lun.unmount().result == 0
+    assert_gone(lun)
+    assert lun.mount().result == 0
+    assert lun.key("vol_access_right") == "1"
+
+
 def test_a_volume_that_was_mounted_read_only_is_not_degraded(luns):
     lun = luns(300 * MIB)
     lun.mount()

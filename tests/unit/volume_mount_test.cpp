@@ -121,10 +121,17 @@ TEST_F(Mount, EveryFileSystemHasItsCommand) {
   }
 }
 
+TEST_F(Mount, WhatIsLeftOfAnOverwrittenFileSystemIsNone) {
+  fakes::on("sys_get_fs_type", kNode).text("ext4").returns(0).times(3);
+  fakes::on("sys_get_fs_type", kNode).text("damaged_ext").returns(0);  // mke2fs failed
+  EXPECT_EQ(mount_it(1), -1);
+  EXPECT_EQ(fakes::commands().back(), kMkfs);
+}
+
 TEST_F(Mount, AnUnsupportedFileSystemIsNeitherMountedNorFormatted) {
   debug_level = 1;
-  for (const char* fs_type :
-       {"btrfs", "LVM2_member", "linux_raid_memb", "crypto_LUKS", "ambivalent", "unreadable"}) {
+  for (const char* fs_type : {"btrfs", "LVM2_member", "linux_raid_memb", "crypto_LUKS", "ambivalent",
+                              "unreadable", "damaged_ext"}) {
     fakes::on("sys_get_fs_type", kNode).text(fs_type).times(3);
     const size_t before = fakes::commands().size();
     EXPECT_EQ(mount_it(), kMountUnsupported);
