@@ -17,6 +17,7 @@ struct Command {
   bool persists;            // a success copies the settings to flash and reloads the shares
   bool reports_value;       // the handler's result is the command's answer, never a failure
   const char* failure_all;  // instead of `failure` when -n is absent; null where that makes no difference
+  bool ends_tree = false;   // the tree's daemon is gone behind it
 };
 
 constexpr int kCommandCount = 19;

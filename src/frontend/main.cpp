@@ -30,9 +30,13 @@ namespace {
 constexpr char kResetMark[] = "/tmp/reset_default";  // while it exists, the flash copy stays as it is
 constexpr int kFailureStatus = -1;
 
+KeyText result_key() {
+  return KeyText("%s/%s", key::kResult, gs_str_command);
+}
+
 // Those who started the command poll this key: empty while it runs, then its result.
 void record_result(const char* value) {
-  ktreec_set(main_socket, 0, KeyText("%s/%s", key::kResult, gs_str_command), value);
+  ktreec_set(main_socket, 0, result_key(), value);
 }
 
 int fail(bool show_usage) {
@@ -60,7 +64,10 @@ void copy_to_flash() {
 }
 
 // Dumps the tree. Returns whether the settings file may go to the flash.
-bool dump_settings(Caller caller) {
+bool dump_settings(const Command& command, Caller caller) {
+  // Behind a command that has ended the tree there is nothing to tell of.
+  if (command.ends_tree && !tree_answers(result_key()))
+    return ktreec_dump(main_socket, 0, kSettingsFile) == 0;
   RunLock lock;
   lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one
   return store_settings(caller);
@@ -69,14 +76,14 @@ bool dump_settings(Caller caller) {
 // Returns whether the tree that the command has changed is gone, and the change with it: its daemon was
 // started anew and has loaded the settings of before, or does not answer any more. Logged at level 0.
 bool was_change_lost(const TreeInstance& tree, Caller caller) {
-  if (is_same_tree(tree) && tree_answers(KeyText("%s/%s", key::kResult, gs_str_command))) return false;
+  if (is_same_tree(tree) && tree_answers(result_key())) return false;
   LOG_AT(caller, 0, "the configuration tree was started anew meanwhile, what was changed may be lost");
   return true;
 }
 
 int succeed(const Command& command, int result, const TreeInstance& tree, Caller caller) {
   record_result(NumberText("%d", result));
-  const bool stored = dump_settings(caller);
+  const bool stored = dump_settings(command, caller);
   if (command.persists && was_change_lost(tree, caller)) return fail(false);
   if (command.persists && stored) copy_to_flash();
   if (command.persists) reload_share_services();

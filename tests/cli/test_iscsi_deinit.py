@@ -137,3 +137,10 @@ def test_the_settings_are_saved_no_more(box, initiator):
     box.write("/etc/NAS_CFG/vv.xml", "saved before\n")
     take_down(box, "--deinit")
     assert box.path("/etc/NAS_CFG/vv.xml").read_text() == "saved before\n"
+
+
+@pytest.mark.parametrize("command", ROAD)
+def test_nothing_is_told_of_a_dump_behind_the_trees_end(box, initiator, command):
+    box.write("/etc/NAS_CFG/vv.xml", "<config><iscsi><initiator><ver>1</ver></initiator></iscsi></config>\n")
+    assert "never loaded" not in take_down(box, command).stdout
+    assert "<ver>1</ver>" in box.path("/etc/NAS_CFG/vv.xml").read_text()
