@@ -14,7 +14,7 @@ sys.path.insert(0, str(HERE))
 
 from breakages import chosen, stored  # noqa: E402
 from copy_of import FOLDER, PROGRAMS, ROOT, Copy  # noqa: E402
-from cover import Cover, failing  # noqa: E402
+from cover import Cover, failing, unit_tests  # noqa: E402
 
 UNIT_LIMIT = 60  # seconds, for tests that take some tenths of one
 RESULTS = FOLDER / "results.jsonl"
@@ -22,6 +22,8 @@ RESULTS = FOLDER / "results.jsonl"
 
 class Worker:
     """Breaks, builds and tests in a copy of its own."""
+
+    passing = {}  # what a cli test says of the unbroken code, by its name
 
     def __init__(self, number, cover):
         self.copy, self.cover = Copy(f"worker{number}"), cover
@@ -32,18 +34,18 @@ class Worker:
         if not good:
             raise SystemExit(f"the sources do not build unbroken:\n{output[-3000:]}")
 
-    def try_one(self, breakage):
-        """Returns (verdict, by): caught, open or uncompiled."""
+    def try_one(self, breakage, test):
+        """Breaks the line and asks test(breakage), which returns (verdict, by): caught, open or uncompiled."""
         place = self.copy.root / breakage.file
         lines = place.read_text().split("\n")
         place.write_text("\n".join([*lines[:breakage.line - 1], breakage.after, *lines[breakage.line:]]))
         try:
-            return self._tested(breakage)
+            return test(breakage)
         finally:
             place.write_text("\n".join(lines))
 
-    def _tested(self, breakage):
-        units, files = self.cover.of(breakage) if self.cover else tests_of(breakage)
+    def units(self, breakage):
+        units, files = self._tests_of(breakage)
         # The short wait for one unit test that knows the line well saves linking them all.
         for batch in filter(None, (units[:1], units[1:])):
             built, output = self.copy.make(*batch)
@@ -53,14 +55,21 @@ class Worker:
                 status, _ = self.copy.unit(name, UNIT_LIMIT)
                 if status != 0:
                     return "caught", name if status is not None else f"{name} (no end)"
-        if not files:
-            return "open", ""
+        return ("later" if files else "open"), ""
+
+    def from_outside(self, breakage):
+        files = self._tests_of(breakage)[1]
         built, output = self.copy.make(*PROGRAMS)
         if not built:
             return "uncompiled", re.findall(r"error: .*", output)[:1]
-        return self._tested_from_outside(files)
+        return self._cli(files)
 
-    def _tested_from_outside(self, files):
+    def _tests_of(self, breakage):
+        if self.cover:
+            return self.cover.of(breakage)
+        return ([t for t in breakage.tests if not t.endswith(".py")], [t for t in breakage.tests if t.endswith(".py")])
+
+    def _cli(self, files):
         ignored = self.cover.failing() if self.cover else []
         limit = 120 + 4 * sum(self.cover.tests[name]["seconds"] for name in files) if self.cover else 300
         while True:
@@ -72,32 +81,45 @@ class Worker:
                 return "open", ""
             found = failing(output)
             if not found:
-                return "caught", f"cli (status {status}) {output[-300:]}"
+                return "open", f"pytest said nothing (status {status}): {output[-300:]}"
             # Many tests at once on a busy machine: one that fails alone as well means it.
             again, _ = self.copy.cli(["-x", found[0]], limit, 1)
-            if again != 0:
+            if again != 0 and self._passes_unbroken(found[0], limit):
                 return "caught", found[0]
             ignored.append(found[0])
 
+    def _passes_unbroken(self, name, limit):
+        if name not in self.passing and self.cover:
+            self.passing[name] = Copy("cover").cli([name], limit, 1)[0] == 0
+        return self.passing.get(name, True)
 
-def tests_of(breakage):
-    return [t for t in breakage.tests if not t.endswith(".py")], [t for t in breakage.tests if t.endswith(".py")]
 
+def share_out(workers, breakages, test, done):
+    """Every worker takes the next of the breakages."""
+    waiting = queue.Queue()
+    for breakage in breakages:
+        waiting.put(breakage)
 
-def in_turn(worker, waiting, done):
-    while True:
-        try:
-            breakage = waiting.get_nowait()
-        except queue.Empty:
-            return
-        began = time.monotonic()
-        verdict, by = worker.try_one(breakage)
-        done(breakage, verdict, by, time.monotonic() - began)
+    def work(worker):
+        while True:
+            try:
+                breakage = waiting.get_nowait()
+            except queue.Empty:
+                return
+            began = time.monotonic()
+            verdict, by = worker.try_one(breakage, getattr(worker, test))
+            done(breakage, verdict, by, time.monotonic() - began)
+
+    threads = [threading.Thread(target=work, args=(worker,), daemon=True) for worker in workers]
+    for thread in threads:
+        thread.start()
+    for thread in threads:
+        thread.join()
 
 
 def targets_of(breakages, cover):
     if cover:
-        return ["all"]
+        return [*unit_tests(), *PROGRAMS]
     tests = [t for b in breakages for t in b.tests]
     return [*{t for t in tests if not t.endswith(".py")}, *(PROGRAMS if any(t.endswith(".py") for t in tests) else ())]
 
@@ -105,12 +127,15 @@ def targets_of(breakages, cover):
 def run_all(breakages, options, cover):
     reasons = {b.key(): b.reason for b in stored(HERE / "harmless", ROOT)}
     counts = {"caught": 0, "harmless": 0, "open": 0, "uncompiled": 0}
-    still_open, lock, began = [], threading.Lock(), time.monotonic()
+    still_open, later, lock, began = [], [], threading.Lock(), time.monotonic()
     FOLDER.mkdir(parents=True, exist_ok=True)
 
     def done(breakage, verdict, by, seconds):
         with lock:
-            if verdict == "open" and breakage.key() in reasons:
+            if verdict == "later" and breakage.key() not in reasons:
+                later.append(breakage)
+                return
+            if verdict in ("open", "later") and breakage.key() in reasons:
                 verdict, by = "harmless", reasons[breakage.key()]
             counts[verdict] += 1
             if verdict == "open":
@@ -119,17 +144,15 @@ def run_all(breakages, options, cover):
             with RESULTS.open("a") as file:
                 file.write(json.dumps({"key": breakage.key(), "verdict": verdict, "by": by}) + "\n")
 
-    waiting = queue.Queue()
-    for breakage in breakages:
-        waiting.put(breakage)
     workers = [Worker(n, cover) for n in range(min(options.jobs, len(breakages)))]
     for worker in workers:
         worker.prepare(targets_of(breakages, cover))
-    threads = [threading.Thread(target=in_turn, args=(worker, waiting, done), daemon=True) for worker in workers]
-    for thread in threads:
-        thread.start()
-    for thread in threads:
-        thread.join()
+    share_out(workers, breakages, "units", done)
+    if options.units:
+        for breakage in later:
+            print(f"left to the cli tests: {breakage}", flush=True)
+    else:
+        share_out(workers, sorted(later, key=cover.seconds) if cover else later, "from_outside", done)
     for breakage in still_open:
         print(f"no test notices: {breakage}")
     tried = sum(counts.values()) - counts["uncompiled"]
@@ -139,14 +162,14 @@ def run_all(breakages, options, cover):
     return counts["open"] == 0 and tried > 0
 
 
-def those_open(breakages):
-    """The ones among them that no test noticed the last time."""
+def without_verdict(breakages):
+    """The ones among them that no test has noticed yet."""
     last = {}
     for line in RESULTS.read_text().split("\n") if RESULTS.exists() else ():
         if line:
             result = json.loads(line)
             last[tuple(result["key"])] = result["verdict"]
-    return [b for b in breakages if last.get(b.key()) == "open"]
+    return [b for b in breakages if last.get(b.key(), "open") == "open"]
 
 
 def main():
@@ -157,22 +180,25 @@ def main():
     parser.add_argument("--jobs", type=int, default=2, help="so many at once, each in a copy of its own (2)")
     parser.add_argument("--list", action="store_true", help="says which ones, breaks nothing")
     parser.add_argument("--known", action="store_true", help="those of tests/mutate/known, with the tests named there")
-    parser.add_argument("--again", action="store_true", help="of the chosen ones those that were open the last time")
+    parser.add_argument("--again", action="store_true", help="of the chosen ones those that no test has noticed yet")
+    parser.add_argument("--units", action="store_true", help="runs the unit tests alone")
     parser.add_argument("--measure", action="store_true", help="measures which tests run which line, and ends")
+    parser.add_argument("--as-measured", action="store_true", help="takes what is measured for good, though tests changed")
     options = parser.parse_args()
     known = stored(HERE / "known", ROOT)
     breakages = known if options.known else known + chosen(ROOT, options.count, options.seed, options.only)
     if options.only:
         breakages = [b for b in breakages if options.only in b.file]
     if options.again:
-        breakages = those_open(breakages)
+        breakages = without_verdict(breakages)
     if options.list:
         print("\n".join(map(str, breakages)))
         return True
     cover = None
     if not options.known:
         cover = Cover()
-        cover.measure(2)
+        if options.measure or not options.as_measured:
+            cover.measure(2)
     return options.measure or run_all(breakages, options, cover)
 
 

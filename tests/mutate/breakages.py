@@ -102,7 +102,7 @@ def broken_lines(lines, number):
         while at >= 0:
             yield "condition dropped", line[:at] + line[operand_ends(plain, at, len(operator)):]
             at = plain.find(operator, at + len(operator))
-    for flag in FLAG.finditer(plain):
+    for flag in FLAG.finditer(plain.replace("O_RDONLY", "0_______")):  # which is 0
         yield "flag dropped", line[:flag.start()] + line[flag.end():]
     constant = CONSTANT.match(plain)
     if constant:

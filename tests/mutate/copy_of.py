@@ -6,11 +6,14 @@ import shutil
 import signal
 import subprocess
 
+from fenced import NAMESPACES
+
 ROOT = pathlib.Path(__file__).resolve().parents[2]
 FOLDER = ROOT / "build" / "mutate"
 # What the cli tests need beside remvol itself.
 PROGRAMS = ("remvol", "ktree", "ktreec", "flashrun", "winshare_reload", "macshare_reload", "remvol-events", "vvstat",
-            "box", "fakecmd", "preload", "netlink", "scarce", "sysaux_call", "ktree_call", "volume_driver")
+            "box", "fakecmd", "preload", "netlink", "scarce", "sysaux_call", "ktree_call", "volume_driver",
+            "sysaux_disk", "sysaux_probe", "sysaux_state")
 
 
 def run(argv, folder, limit, env=None):
@@ -78,9 +81,12 @@ class Copy:
 
     def unit(self, name, limit):
         """Runs a unit test up to its first failure."""
-        return run([str(self.build / "bin" / name)], self.root, limit, {"GTEST_FAIL_FAST": "1", "GTEST_BRIEF": "1"})
+        return self.fenced([str(self.build / "bin" / name)], limit, {"GTEST_FAIL_FAST": "1", "GTEST_BRIEF": "1"})
 
     def cli(self, arguments, limit, jobs):
         workers = ["-n", str(jobs)] if jobs > 1 else []
-        return run(["/usr/bin/python3", "-m", "pytest", "-q", "-p", "no:cacheprovider", "--tb=no", "-rfE", *workers,
-                    *arguments], self.root, limit, {"REMVOL_BUILD": "build", "PYTHONDONTWRITEBYTECODE": "1"})
+        return self.fenced(["/usr/bin/python3", "-m", "pytest", "-q", "-p", "no:cacheprovider", "--tb=no", "-rfE",
+                            *workers, *arguments], limit, {"REMVOL_BUILD": "build", "PYTHONDONTWRITEBYTECODE": "1"})
+
+    def fenced(self, argv, limit, env):
+        return run([*NAMESPACES, str(self.root), *argv], self.root, limit, {**env, "CCACHE_DISABLE": "1"})

@@ -49,7 +49,7 @@ class Cover:
             self.tests, self.texts = {}, {}
         copy = Copy("cover", "-O0 -w --coverage")
         copy.refresh()
-        good, output = copy.make("all", jobs=jobs)
+        good, output = copy.make(*unit_tests(), *PROGRAMS, jobs=jobs)
         if not good:
             raise SystemExit(f"the build for measuring failed:\n{output[-2000:]}")
         for name in stale if self.tests else [*unit_tests(), *cli_tests()]:
@@ -83,6 +83,10 @@ class Cover:
                 hits.update({n: hits[n] or 1 for n in hits if n.endswith(".py") and n.startswith(names)})
         order = sorted((n for n in hits if hits[n]), key=lambda n: self.tests[n]["seconds"] / (1 + hits[n] ** 0.5))
         return [n for n in order if not n.endswith(".py")], [n for n in order if n.endswith(".py")]
+
+    def seconds(self, breakage):
+        """What its cli test files take."""
+        return sum(self.tests[name]["seconds"] for name in self.of(breakage)[1])
 
     def _hits(self, test, file, line):
         lines = test["lines"].get(file, {})

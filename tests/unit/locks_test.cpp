@@ -149,6 +149,17 @@ TEST_F(Locks, AHeldLockIsTriedFiveTimesWithFourWaits) {
   }
 }
 
+TEST_F(Locks, NoTwoRunsWaitAlike) {
+  ASSERT_EQ(make_lock_dir(), 0);
+  fakes::on("fcntl", "lock").returns(-1).error(EAGAIN);
+  call([] { return wait_flock(kPath, 3, 100000); });
+  const Texts first = fakes::calls({"usleep"});
+  call([] { return wait_flock(kPath, 3, 100000); });
+  const Texts both = fakes::calls({"usleep"});
+  ASSERT_EQ(both.size(), 8u);
+  EXPECT_NE(first, Texts(both.begin() + 4, both.end()));
+}
+
 TEST_F(Locks, ALockOfTheLastAttemptCountsAsNotHad) {
   ASSERT_EQ(make_lock_dir(), 0);
   fakes::on("fcntl", "lock").returns(-1).error(EACCES).times(4);

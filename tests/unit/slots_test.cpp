@@ -132,6 +132,19 @@ TEST_F(Slots, AWalkOverTheLunsMeetsEveryOneOnce) {
   }
 }
 
+TEST_F(Slots, TheLastLunOfATargetLeavesTheNextTargetAsItIs) {
+  remember_target(1, "iqn.t1");
+  remember_target(2, "iqn.t2");
+  for (int m = 1; m <= kMaxLunsPerTarget + 1; m++) remember_lun(1, m, 10 * m);  // there is no slot 9
+  delete_target(1);
+  EXPECT_EQ(HeldSlot(2).target(), 1);
+}
+
+TEST_F(Slots, ALunThatIsNotStoredIsNotFormatting) {
+  fakes::tree_set({{lun_key(1, 5, "format_state"), "1"}});
+  EXPECT_TRUE(is_no_lun_formatting(1));
+}
+
 TEST_F(Slots, HalfMadeSlotsAreDropped) {
   fakes::tree_set({{lun_key(1, 2, "share"), ""}, {key(4, "target"), "iqn.t4"}});
   drop_half_made_slots();

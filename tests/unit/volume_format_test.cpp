@@ -51,6 +51,12 @@ TEST_F(Format, Ext4StaysExt4) {
   EXPECT_EQ(commands_for("ext4"), with_mke2fs(kExt4Command));
 }
 
+TEST_F(Format, AProbeThatFailsNamesNoFileSystem) {
+  fakes::on("sys_get_fs_type", kNode).text("ext2").returns(-1);
+  EXPECT_EQ(Target_format(&entry, kNode), 0);
+  EXPECT_EQ(fakes::commands(), with_mke2fs(kExt4Command));
+}
+
 TEST_F(Format, AnythingElseBecomesExt4AndIsSaid) {
   debug_level = 1;
   fakes::on("sys_get_fs_type", kNode).text("vfat");

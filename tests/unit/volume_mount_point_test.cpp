@@ -111,6 +111,19 @@ TEST_F(MountedPath, AMountBelowIsNotRemoved) {
   EXPECT_FALSE(is_removal_unsafe((path + "/deeper/with").c_str()));
 }
 
+TEST_F(MountedPath, ADetachedVolumeIsHeldByNobody) {
+  put_layer();
+  fakes::on("sys_mount_point", path).returns(1).times(1);
+  fakes::on("sys_mount_point", path).returns(0);
+  detach_mounts(path.c_str());
+  for (const auto& open_one : std::filesystem::directory_iterator("/proc/self/fd")) {
+    std::error_code gone;  // the folder that is walked through is one of them
+    EXPECT_EQ(std::filesystem::read_symlink(open_one, gone).string().find("Data"), std::string::npos)
+        << "an open folder keeps the disk busy";
+    EXPECT_NE(std::filesystem::read_symlink(open_one, gone), "/") << "which is how a detached one shows";
+  }
+}
+
 TEST_F(MountedPath, ALinkToAMountIsNotRemovedThrough) {
   put_layer();
   std::filesystem::create_symlink("/mnt/VV", "/mnt/link");
