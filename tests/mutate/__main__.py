@@ -125,7 +125,7 @@ def targets_of(breakages, cover):
 
 
 def run_all(breakages, options, cover):
-    reasons = {b.key(): b.reason for b in stored(HERE / "harmless", ROOT)}
+    reasons = {b.key(): b.reason for b in stored(HERE / "harmless", ROOT, print)}
     counts = {"caught": 0, "harmless": 0, "open": 0, "uncompiled": 0}
     still_open, later, lock, began = [], [], threading.Lock(), time.monotonic()
     FOLDER.mkdir(parents=True, exist_ok=True)
@@ -185,7 +185,7 @@ def main():
     parser.add_argument("--measure", action="store_true", help="measures which tests run which line, and ends")
     parser.add_argument("--as-measured", action="store_true", help="takes what is measured for good, though tests changed")
     options = parser.parse_args()
-    known = stored(HERE / "known", ROOT)
+    known = stored(HERE / "known", ROOT, sys.exit)
     breakages = known if options.known else known + chosen(ROOT, options.count, options.seed, options.only)
     if options.only:
         breakages = [b for b in breakages if options.only in b.file]

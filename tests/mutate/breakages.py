@@ -187,8 +187,9 @@ def chosen(root, count, seed, only=""):
     return sorted(taken, key=lambda b: (SCOPE.index(b.file), b.line))
 
 
-def stored(path, root):
-    """The breakages of a file: blocks of "FILE", "- line", "+ line", "= reason", "@ tests"; see tests/mutate/known."""
+def stored(path, root, complain):
+    """The breakages of a file: blocks of "FILE", "- line", "+ line", "= reason", "@ tests"; see tests/mutate/known.
+    Calls complain(text) for each whose line is there no more."""
     found = []
     for block in re.split(r"\n\s*\n", pathlib.Path(path).read_text()):
         parts = [line for line in block.split("\n") if line and not line.startswith("#")]
@@ -198,7 +199,8 @@ def stored(path, root):
         lines = (root / parts[0]).read_text().split("\n")
         places = [n for n, line in enumerate(lines) if line.strip() == texts["-"]]
         if not places:
-            raise SystemExit(f"{path}: {parts[0]} has no line '{texts['-']}' any more")
+            complain(f"{path}: {parts[0]} has no line '{texts['-']}' any more")
+            continue
         line = lines[places[0]]
         space = line[: len(line) - len(line.lstrip())]
         found.append(Breakage(parts[0], places[0] + 1, line, space + texts["+"], "known", texts["="],
