@@ -57,8 +57,8 @@ class BriefTargetHold {
   bool waited_ = false;
 };
 
-// Holds the whole target, or one LUN of it (0 or more), when a run has held or marked it before and none holds it
-// now.
+// Holds the whole target, or one LUN of it (0 or more), when a run has held or marked it before and none
+// holds it now.
 class IdleTarget {
  public:
   explicit IdleTarget(const char* target_name);
