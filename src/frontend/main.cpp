@@ -74,8 +74,10 @@ bool dump_settings(const Command& command, Caller caller) {
 }
 
 // Returns whether the tree that the command has changed is gone, and the change with it: its daemon was
-// started anew and has loaded the settings of before, or does not answer any more. Logged at level 0.
+// started anew and has loaded the settings of before, or does not answer any more. Logged at level 0. Where
+// there was no socket before the command, nothing is known of that.
 bool was_change_lost(const TreeInstance& tree, Caller caller) {
+  if (tree.inode == 0) return false;
   if (is_same_tree(tree) && tree_answers(result_key())) return false;
   LOG_AT(caller, 0, "the configuration tree was started anew meanwhile, what was changed may be lost");
   return true;

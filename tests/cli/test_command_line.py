@@ -405,6 +405,11 @@ class TestSuccessOfChangingCommands:
         assert (done.status, box.tree.get("/result/disconnect")) == (0, "0")
         assert done_by_main(box, "disconnect")[1:] == ["dump /etc/NAS_CFG/vv.xml", FLASH, SHARES]
 
+    def test_a_tree_that_was_not_there_before_is_not_missed(self, box):
+        box.tree.stop()
+        done = box.remvol("--disconnect")
+        assert done.status == 0, done.stdout
+
     def test_the_result_is_empty_while_the_handler_runs(self, box):
         box.tree.set("/result/disconnect", "-1")
         box.fake("iscsiadm", first=True, effect="ktreec -S /var/run/ktree_sock_vv -g /result/disconnect >/tmp/seen")
