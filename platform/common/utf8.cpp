@@ -51,8 +51,10 @@ void append_escaped(std::string& text, std::string_view bytes) {
   }
 }
 
-bool is_plain(std::string_view bytes, wchar_t character, bool utf8) {
-  return !bytes.empty() && !is_control(character) && !is_invisible(character) && (utf8 || bytes.size() == 1);
+// Of text that is not UTF-8 there are no `characters`; only ASCII is plain then.
+bool is_plain(std::string_view bytes, const std::wstring& characters, size_t at) {
+  if (characters.empty()) return bytes.size() == 1 && !is_control(bytes.front());
+  return !is_control(characters[at]) && !is_hidden(characters, at);
 }
 
 }  // namespace
@@ -93,6 +95,14 @@ bool is_invisible(wchar_t character) {
   return false;
 }
 
+bool is_hidden(std::wstring_view characters, size_t at) {
+  constexpr std::wstring_view kJoiners = L"\u200c\u200d\ufe0e\ufe0f";
+  constexpr wchar_t kKeyCap = 0x20e3;
+  if (!is_invisible(characters[at])) return false;
+  if (at == 0 || kJoiners.find(characters[at]) == std::wstring_view::npos) return true;
+  return characters[at - 1] < 0x80 && (at + 1 == characters.size() || characters[at + 1] != kKeyCap);
+}
+
 wchar_t lower_case(wchar_t character) {
   if (character >= L'A' && character <= L'Z') return character + (L'a' - L'A');
   if (character < 0x80 || utf8_locale() == nullptr) return character;
@@ -115,14 +125,14 @@ size_t cells(std::string_view text) {
 
 std::string printable(std::string_view text) {
   std::wstring characters;
-  const bool utf8 = decode(text, characters);
+  decode(text, characters);
   std::string shown;
-  while (!text.empty()) {
+  for (size_t at = 0; !text.empty(); ++at) {
     wchar_t character = 0;
     const size_t size = first_character(text, character);
     const std::string_view bytes = text.substr(0, size);
-    is_plain(bytes, character, utf8) ? static_cast<void>(shown += bytes)
-                                     : append_escaped(shown, text.substr(0, size == 0 ? 1 : size));
+    is_plain(bytes, characters, at) ? static_cast<void>(shown += bytes)
+                                    : append_escaped(shown, text.substr(0, size == 0 ? 1 : size));
     text.remove_prefix(size == 0 ? 1 : size);
   }
   return shown;

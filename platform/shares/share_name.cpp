@@ -19,18 +19,9 @@ const NameRules kNetatalkNames = {L"%<>*?|/\\+=;:\",[]$", {L"global", L"homes"},
 
 namespace {
 
-// Words of some scripts hold a joiner or its opposite, and emoji a joiner or what chooses their form: not one
-// of them stands behind ASCII but in a key cap, which has the mark of one behind it.
-bool is_part_of_writing(const std::wstring& characters, size_t at) {
-  constexpr std::wstring_view kJoiners = L"\u200c\u200d\ufe0e\ufe0f";
-  constexpr wchar_t kKeyCap = 0x20e3;
-  if (at == 0 || kJoiners.find(characters[at]) == std::wstring_view::npos) return false;
-  return characters[at - 1] >= 0x80 || (at + 1 < characters.size() && characters[at + 1] == kKeyCap);
-}
-
 bool hides_something(const std::wstring& characters) {
   for (size_t at = 0; at < characters.size(); ++at) {
-    if (platform::is_invisible(characters[at]) && !is_part_of_writing(characters, at)) return true;
+    if (platform::is_hidden(characters, at)) return true;
   }
   return false;
 }

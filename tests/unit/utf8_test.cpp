@@ -46,6 +46,11 @@ TEST(Utf8, PrintableTextHasNoControlCharacter) {
                       "b"),
             "\\xC3\\xA9\\xFFb");
   EXPECT_EQ(printable("a\u202eb\u200d"), "a\\xE2\\x80\\xAEb\\xE2\\x80\\x8D");
+  for (const char* text : {"❤\ufe0f", "👨\u200d👩\u200d👧", "1\ufe0f\u20e3", "می\u200cخواهم"}) {
+    EXPECT_EQ(printable(text), text);
+  }
+  EXPECT_EQ(printable("1\ufe0f"), "1\\xEF\\xB8\\x8F");
+  EXPECT_EQ(printable("\u200d"), "\\xE2\\x80\\x8D");
   EXPECT_EQ(printable(""), "");
 }
 
