@@ -1,5 +1,5 @@
-// The volumes that are mounted from the disks of iSCSI sessions, by the kernel's own tables: a session that is
-// closed under a volume takes what was not yet written with it.
+// The volumes that are mounted from the disks of iSCSI sessions, by the kernel's own tables: a session that
+// is closed under a volume takes what was not yet written with it.
 #ifndef REMVOL_VOLUME_SESSION_VOLUMES_H
 #define REMVOL_VOLUME_SESSION_VOLUMES_H
 
