@@ -47,7 +47,7 @@ const MountOutcome& _mount_outcome(int mounted) {
 // last step into `result`. Returns false when the mount broke: nothing more is to be done then.
 bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result) {
   ktree_update_dev(entry);
-  if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) < 0) return true;
+  if (ktree_get_found_lun_entry(entry, dbidx, lun_dbidx, entry->lun) < 0) return true;
   int enable = 0;
   *result = ktree_get_lun_enable(&enable, dbidx, lun_dbidx);
   if (*result != kOk || enable != 1) return true;

@@ -1,7 +1,5 @@
 #include "tasks/requested_lun.h"
 
-#include <cstring>
-
 #include "frontend/request.h"
 #include "support/result.h"
 #include "tree/entry.h"
@@ -24,11 +22,7 @@ int find_requested_lun(int* dbidx, int* lun_dbidx, Caller caller) {
 }
 
 int read_requested_lun(TargetEntry* entry, int dbidx, int lun_dbidx, Caller caller) {
-  // Another run may have deleted the LUN since it was found; another one has its slot then.
-  if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) == kOk && entry->lun == request_target.lun &&
-      strcmp(entry->target_name, request_target.target_name) == 0) {
-    return kOk;
-  }
+  if (ktree_get_found_lun_entry(entry, dbidx, lun_dbidx, request_target.lun) == kOk) return kOk;
   LOG_AT(caller, 0, "Can not get lun entry %d under target %s", request_target.lun,
          request_target.target_name);
   return kFailed;

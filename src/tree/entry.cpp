@@ -34,6 +34,13 @@ void read_target_fields(TargetEntry* entry, int dbidx) {
   entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
 }
 
+// Counts the LUNs of the slot `n` as it is now, up to the first empty one.
+int count_luns_at(int n) {
+  int count = 0;
+  while (count < kMaxLunsPerTarget && !tree_slot_is_free(KeyText(key::kLunNumber, n, count + 1))) count++;
+  return count;
+}
+
 int read_state(const char* key, bool stored, int* value, int missing) {
   char text[128];
   const bool present = stored && tree_read(key, text);
@@ -151,6 +158,15 @@ int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx) {
   return kOk;
 }
 
+int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int lun) {
+  const SlotsHeld held;
+  if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) == kOk && entry->lun == lun) return kOk;
+  remember_lun(dbidx, lun_dbidx, lun);
+  const HeldSlot slot(dbidx, lun_dbidx);
+  if (!slot || slot.lun() == lun_dbidx) return kFailed;  // it was deleted, or could not be read where it is
+  return ktree_get_lun_entry_by_dbidx(entry, dbidx, slot.lun());
+}
+
 int ktree_update_current_targetcnt() {
   const SlotsHeld held;
   int count = 0;
@@ -162,16 +178,15 @@ int ktree_get_total_luncnt() {
   const SlotsHeld held;
   int total = 0;
   for (int n = 1; n <= kMaxTargets && !tree_slot_is_free(KeyText(key::kTargetName, n)); n++) {
-    total += ktree_count_target_luns(n);
+    total += count_luns_at(n);
   }
   return total;
 }
 
 int ktree_count_target_luns(int dbidx) {
   if (dbidx < 1) return kFailed;
-  int count = 0;
-  while (count < kMaxLunsPerTarget && !tree_slot_is_free(KeyText(key::kLunNumber, dbidx, count + 1))) count++;
-  return count;
+  const HeldSlot slot(dbidx);
+  return slot ? count_luns_at(slot.target()) : 0;
 }
 
 int ktree_refresh_total_luncnt() {

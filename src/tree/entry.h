@@ -31,6 +31,10 @@ int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry);
 // bad (null, below 1) or one of the two slots is empty.
 int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx);
 
+// The same for the LUN with number `lun`, which this run has found or stored at `lun_dbidx`, wherever it is
+// now; -1 also when it is stored no more. What has taken its place is another LUN.
+int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int lun);
+
 // Rewrites the count of targets: every filled slot of the eight, gaps or not. Returns 0 or -103.
 int ktree_update_current_targetcnt();
 

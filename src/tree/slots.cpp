@@ -52,28 +52,36 @@ bool holds_lun(int n, int m, int lun) {
   return tree_read(KeyText(key::kLunNumber, n, m), stored) && atoi(stored) == lun;
 }
 
-int find_target(int n, Caller caller) {
-  if (!is_target_slot(n) || known_slots[n].target[0] == '\0') return n;
-  const char* name = known_slots[n].target;
-  if (holds_target(n, name)) return n;
-  for (int slot = 1; slot <= kMaxTargets; slot++) {
-    if (holds_target(slot, name)) return slot;
+// Returns the slot of 1 to `last` that `holds` tells, asked for `slot` first; `slot` in a tree that does not
+// answer, and kGone when none does. One that was silent during the first look, since its daemon was started
+// anew, answers the second.
+template <typename Holds>
+int find_slot(int slot, int last, Holds holds) {
+  for (int looks = 0; looks < 2; looks++) {
+    if (holds(slot)) return slot;
+    for (int other = 1; other <= last; other++) {
+      if (holds(other)) return other;
+    }
+    if (!tree_is_loaded()) return slot;
   }
-  if (!tree_is_loaded()) return n;
-  LOG_AT(caller, 1, "target %s is stored no more", name);
   return kGone;
 }
 
-int find_lun(int n, int m, int now, Caller caller) {
+int find_target(int n, Caller caller) {
+  if (!is_target_slot(n) || known_slots[n].target[0] == '\0') return n;
+  const char* name = known_slots[n].target;
+  const int now = find_slot(n, kMaxTargets, [name](int slot) { return holds_target(slot, name); });
+  if (now == kGone) LOG_AT(caller, 1, "target %s is stored no more", name);
+  return now;
+}
+
+int find_lun(int n, int m, int target, Caller caller) {
   if (!is_lun_slot(n, m) || known_lun(n, m) == kNoLun) return m;
   const int lun = known_lun(n, m);
-  if (holds_lun(now, m, lun)) return m;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
-    if (holds_lun(now, slot, lun)) return slot;
-  }
-  if (!tree_is_loaded()) return m;
-  LOG_AT(caller, 1, "lun %d of target %s is stored no more", lun, known_slots[n].target);
-  return kGone;
+  const int now =
+      find_slot(m, kMaxLunsPerTarget, [target, lun](int slot) { return holds_lun(target, slot, lun); });
+  if (now == kGone) LOG_AT(caller, 1, "lun %d of target %s is stored no more", lun, known_slots[n].target);
+  return now;
 }
 
 }  // namespace
@@ -110,6 +118,11 @@ void remember_all_targets() {
     TargetName name;
     if (tree_read(KeyText(key::kTargetName, n), name)) remember_target(n, name);
   }
+}
+
+int target_slot_after(int n) {
+  const HeldSlot slot(n);
+  return slot ? slot.target() + 1 : n;
 }
 
 int lun_slot_after(int n, int m) {

@@ -51,6 +51,10 @@ void remember_lun(int n, int m, int lun);
 // Remembers the target of each of the eight slots, for a walk over all of them.
 void remember_all_targets();
 
+// Returns the slot to visit after slot `n`: the one behind the target that was read there, or, when that has
+// been deleted meanwhile, the one that has taken its place.
+int target_slot_after(int n);
+
 // Returns the LUN slot to visit after slot `m` of the target at `n`: the one behind the LUN that was read
 // there, or, when that has been deleted meanwhile, the one that has taken its place.
 int lun_slot_after(int n, int m);

@@ -204,6 +204,46 @@ class TestStrangersAndTemporaryFiles:
         files = {line.split(">")[1].split()[0] for line in box.shell() if line.startswith("iscsiadm -m session >")}
         assert "/tmp/remvol_session.tmp" in files and len(files) == 2
         assert not [p.name for p in box.path("/tmp").iterdir() if re.search(r"\.tmp\.\d", p.name)]
+class TestUpgrading:
+    def test_it_is_one_step_for_other_runs(self, site, box):
+        box.tree.set({f"{INITIATOR}/count": 1, f"{INITIATOR}/id:1/target": "iqn.t1", f"{INITIATOR}/id:1/ip": "10.9.0.2",
+                      f"{INITIATOR}/id:1/share": "a"})
+        box.hook("ktreec_set", f"{INITIATOR}/id:1/lun/id:1/lun", through=True, effect=held(box, "slots.lock"))
+        assert box.remvol("--verupgrade").status == 0
+        assert box.path("/root/held").read_text() == "1\n"
+        assert site.lun("share") == "a"
+
+
+class TestLunsThatMove:
+    DELETE_FIRST = f"ktreec -S /var/run/ktree_sock_vv -d {INITIATOR}/id:1/lun/id:1"
+
+    @pytest.fixture
+    def three(self, site, box):
+        """A connected target with three LUNs; the first is deleted as soon as the second was found."""
+        site.store("iqn.t1", conn_set=1, luns=[(share, n, {"dev": f"sd{share}"}) for n, share in enumerate("bcd")])
+        site.offer("iqn.t1", {n: f"sd{share}" for n, share in enumerate("bcd")})
+        site.log_in("iqn.t1")
+        for share in "bcd":
+            site.disk(f"sd{share}")
+            site.mount(f"sd{share}", f"/mnt/VV/{share}")
+        # The name is read when the target is found, when its LUN is found, and when the LUN is read.
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", through=True, skip=2, times=1, effect=self.DELETE_FIRST)
+        return site
+
+    def test_the_lun_that_was_asked_for_is_deleted(self, three, box):
+        assert box.remvol("--del_lun", "-n", "iqn.t1", "-l", "1").status == 0
+        assert [three.lun("share", n) for n in (1, 2)] == ["d", None]
+        assert (three.mounted("c"), three.mounted("d")) == (False, True)
+
+    def test_the_lun_that_was_asked_for_is_formatted(self, three, box):
+        for command in ("dd", "mke2fs"):
+            box.fake(command)
+        box.remvol("--format", "-n", "iqn.t1", "-l", "1")
+        formatted = [line for line in box.shell() if "mke2fs" in line]
+        assert formatted and all("/dev/sdc1" in line for line in formatted)
+        assert three.mounted("d")
+
+
 
     def test_a_lock_folder_of_another_user_is_replaced(self, stored, box):
         folder = box.path("/var/lock/virtual_volume")

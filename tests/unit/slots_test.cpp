@@ -88,6 +88,13 @@ TEST_F(Slots, ATreeThatDoesNotAnswerLeavesTheNumbersAsTheyAre) {
   EXPECT_EQ(fakes::tree_get(key(2, "conn_state")), "2");
 }
 
+TEST_F(Slots, ATreeThatWasSilentForAMomentHasDeletedNothing) {
+  ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t2"), 2);
+  fakes::on("ktreec_get_wb", std::regex("/target$")).returns(-1).times(9);  // the first look for the name
+  EXPECT_EQ(ktree_set_connect_state(2, kConnecting), 0);
+  EXPECT_EQ(fakes::tree_get(key(2, "conn_state")), "2");
+}
+
 TEST_F(Slots, ANumberThatNothingWasReadFromIsTakenAsItIs) {
   EXPECT_EQ(ktree_set_connect_state(7, kConnecting), 0);
   EXPECT_EQ(fakes::tree_get(key(7, "conn_state")), "2");
@@ -105,6 +112,36 @@ TEST_F(Slots, AnEntryIsReadFromItsTargetWhereverThatIs) {
   EXPECT_EQ(ktree_get_lun_entry_by_dbidx(&lun, entry.db_idx, 2), -1);
 }
 
+TEST_F(Slots, ALunThatWasFoundIsReadWhereverItIs) {
+  ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t3"), 3);
+  ASSERT_EQ(ktree_get_dbidx_by_lun(3, 20), 2);
+  delete_lun(3, 1);
+  delete_target(1);
+  TargetEntry lun;
+  ASSERT_EQ(ktree_get_found_lun_entry(&lun, 3, 2, 20), 0);
+  EXPECT_EQ(lun.lun, 20);
+  EXPECT_STREQ(lun.share, "s32");
+  EXPECT_EQ(ktree_update_volume_state(&lun, kVolumeFailed), 0);
+  EXPECT_EQ(fakes::tree_get(lun_key(2, 1, "volume_state")), "3");
+}
+
+TEST_F(Slots, WhatHasTakenThePlaceOfADeletedLunIsNotReadForIt) {
+  ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t1"), 1);
+  ASSERT_EQ(ktree_get_dbidx_by_lun(1, 20), 2);
+  delete_lun(1, 2);
+  TargetEntry lun;
+  EXPECT_EQ(ktree_get_found_lun_entry(&lun, 1, 2, 20), -1);
+}
+
+TEST_F(Slots, TheLunsThatAreCountedAreThoseOfTheTarget) {
+  ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t2"), 2);
+  delete_lun(3, 3);
+  delete_lun(3, 2);
+  delete_target(1);  // in the second slot there is now a target with one LUN
+  EXPECT_EQ(ktree_count_target_luns(2), 3);
+  EXPECT_EQ(ktree_get_total_luncnt(), 4);
+}
+
 TEST_F(Slots, AWalkOverTheTargetsMeetsEveryOneOnce) {
   remember_all_targets();
   std::string met;
@@ -114,6 +151,23 @@ TEST_F(Slots, AWalkOverTheTargetsMeetsEveryOneOnce) {
     if (n == 1) delete_target(1);
   }
   EXPECT_EQ(met, "iqn.t1 iqn.t2 iqn.t3 ");
+}
+
+TEST_F(Slots, AWalkByTheSlotThatComesNextMeetsEveryTargetOnce) {
+  for (const int deleted : {1, 2}) {
+    std::string met;
+    for (int n = 1; n <= 8; n = target_slot_after(n)) {
+      const auto name = fakes::tree_get(key(n, "target"));
+      if (!name) break;
+      remember_target(n, name->c_str());
+      met += *name + " ";
+      if (*name == "iqn.t2") delete_target(deleted);
+    }
+    EXPECT_EQ(met, "iqn.t1 iqn.t2 iqn.t3 ") << deleted;
+    delete_target(1);
+    delete_target(1);
+    for (int n = 1; n <= 3; n++) fakes::tree_set({{key(n, "target"), "iqn.t" + std::to_string(n)}});
+  }
 }
 
 TEST_F(Slots, AWalkOverTheLunsMeetsEveryOneOnce) {
