@@ -6,7 +6,6 @@
 #include "frontend/log.h"
 #include "iscsi/session.h"
 #include "support/result.h"
-#include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/repair.h"
 #include "tree/access.h"
@@ -70,8 +69,9 @@ int _refresh_targets(int count, Caller caller = Caller()) {
   for (int visited = 0; visited < count; visited++) {
     char name[sizeof TargetEntry::target_name];
     if (tree_read(KeyText(key::kTargetName, slot), name)) {
+      remember_target(slot, name);
       if (_refresh_target(name, caller) != kOk) return kTreeFailed;
-      slot++;
+      slot = target_slot_after(slot);
       continue;
     }
     if (!_delete_nameless_slot(slot, caller)) slot++;
@@ -95,21 +95,12 @@ void _prune_slots_behind(int count, Caller caller = Caller()) {
   }
 }
 
-// Counts the targets that a run has stored and not counted, since it was killed in between.
-void _repair_count() {
-  const SlotsHeld held(SlotsHeld::kChange);
-  const int count = tree_read_number(key::kTargetCount, kMaxTargets);
-  char name[sizeof TargetEntry::target_name];
-  if (count < 0 || !tree_read(KeyText(key::kTargetName, count + 1), name)) return;
-  if (IdleTarget(name)) ktree_update_current_targetcnt();
-}
-
 }  // namespace
 
 int task_status() {
   LOG(2, "start");
   drop_half_made_slots();
-  _repair_count();
+  if (has_uncounted_target()) ktree_update_current_targetcnt();
   char text[128];
   if (!tree_read(key::kTargetCount, text)) return kFailed;
   const int count = std::min(atoi(text), kMaxTargets);

@@ -2,12 +2,14 @@
 
 #include "frontend/log.h"
 #include "support/result.h"
+#include "support/target_hold.h"
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
 #include "tree/record.h"
 #include "tree/slots.h"
+#include "tree/state.h"
 
 namespace remvol {
 
@@ -42,7 +44,23 @@ void drop_half_made_luns_of(int n) {
   }
 }
 
+// A target whose mount failed is not counted, as those who read the tree know it.
+bool is_uncounted(int n) {
+  char name[256];
+  return tree_read(KeyText(key::kTargetName, n), name) && tree_present(KeyText(key::kLunShare, n, 1)) &&
+         tree_read_number(KeyText(key::kLunVolumeState, n, 1), kVolumeNormal) != kVolumeFailed &&
+         IdleTarget(name);
+}
+
 }  // namespace
+
+bool has_uncounted_target() {
+  const SlotsHeld held;
+  for (int n = tree_read_number(key::kTargetCount, 0) + 1; n <= kMaxTargets; n++) {
+    if (n >= 1 && is_uncounted(n)) return true;
+  }
+  return false;
+}
 
 void drop_half_made_luns() {
   const SlotsHeld held(SlotsHeld::kChange);

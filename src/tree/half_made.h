@@ -11,6 +11,10 @@ void drop_half_made_luns();
 // The same, and the target slots that have a name, but neither an address nor a LUN.
 void drop_half_made_slots();
 
+// Returns whether behind the counted slots is a target that a run has stored and not counted, since it was
+// killed in between.
+[[nodiscard]] bool has_uncounted_target();
+
 }  // namespace remvol
 
 #endif

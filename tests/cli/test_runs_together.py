@@ -164,6 +164,38 @@ class TestAdding:
         assert (site.lun("lun"), site.lun("share")) == ("0", "a")
         assert site.lun("lun", 2) is None
 
+    @pytest.mark.parametrize("command", ["^iscsiadm -m node .*-o new$", MOUNT])
+    def test_what_a_killed_run_stored_is_counted(self, site, box, command):
+        site.store("iqn.t0", luns=[("z", 0)])
+        site.offer("iqn.t1", {0: "sdb"})
+        site.disk("sdb")
+        if command == MOUNT:
+            site.log_in("iqn.t1")
+        box.hook("system", re.compile(command), through=True, effect="kill -KILL $PPID", times=1)
+        assert box.remvol(*self.ADD).status == -9
+        status(box)
+        assert box.tree.get(f"{INITIATOR}/count") == "2"
+        assert (site.target("status", 2), site.lun("status", 1, 2)) != (None, None)
+        assert site.lun("volume_state", 1, 2) in (None, "0")
+
+    def test_the_first_target_of_a_killed_run_is_counted(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        box.hook("system", re.compile("^iscsiadm -m node .*-o new$"), effect="kill -KILL $PPID", times=1)
+        assert box.remvol(*self.ADD).status == -9
+        status(box)
+        assert box.tree.get(f"{INITIATOR}/count") == "1"
+
+    def test_a_target_whose_mount_failed_stays_uncounted(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        site.disk("sdb")
+        site.log_in("iqn.t1")
+        box.hook("sys_get_partition_list", "/dev/sdb", ret=0, first=True)
+        box.hook("sys_create_1_partition", "/dev/sdb", ret=1)
+        assert box.remvol(*self.ADD).status == 255
+        box.tree.set(f"{INITIATOR}/count", 0)
+        status(box)
+        assert (site.lun("volume_state"), box.tree.get(f"{INITIATOR}/count")) == ("3", "0")
+
     def test_two_at_once_with_one_share_name(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})
         site.offer("iqn.t2", {0: "sdc"})
@@ -172,38 +204,6 @@ class TestAdding:
         assert sorted(run.wait().status for run in runs) == [0, 255]
 
 
-class TestATreeThatIsStartedAnew:
-    def test_an_add_whose_tree_has_gone_is_no_success(self, site, box):
-        site.offer("iqn.t1", {0: "sdb"})
-        box.tree.set(f"{INITIATOR}/ver", 1)
-        # As its unit does: the daemon is killed, and one that has loaded what was saved before takes its place.
-        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
-                   "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & sleep 0.3; "
-                   f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1")
-        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=restart, times=1)
-        done = box.remvol(*TestAdding.ADD)
-        assert done.status == 255
-        assert box.tree.get("/result/add") == "-1"
-        assert "the configuration tree was started anew meanwhile, what was changed may be lost" in messages(done)
-
-    def test_an_add_whose_tree_does_not_answer_is_no_success(self, site, box):
-        site.offer("iqn.t1", {0: "sdb"})
-        box.hook("ktreec_set", "/result/add", value="0", through=True, times=1,
-                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
-        assert box.remvol(*TestAdding.ADD).status == 255
-
-
-class TestStrangersAndTemporaryFiles:
-    def test_a_run_beside_another_lists_into_a_file_of_its_own(self, stored, box):
-        box.fake("iscsiadm", "-m session", exact=True, delay=1, times=1, status=21)
-        first = box.start(["remvol", "--status"])
-        until(lambda: box.runs("iscsiadm"))
-        until(lambda: any("-m session >" in line for line in box.shell()))
-        status(box)
-        first.wait()
-        files = {line.split(">")[1].split()[0] for line in box.shell() if line.startswith("iscsiadm -m session >")}
-        assert "/tmp/remvol_session.tmp" in files and len(files) == 2
-        assert not [p.name for p in box.path("/tmp").iterdir() if re.search(r"\.tmp\.\d", p.name)]
 class TestUpgrading:
     def test_it_is_one_step_for_other_runs(self, site, box):
         box.tree.set({f"{INITIATOR}/count": 1, f"{INITIATOR}/id:1/target": "iqn.t1", f"{INITIATOR}/id:1/ip": "10.9.0.2",
@@ -244,6 +244,38 @@ class TestLunsThatMove:
         assert three.mounted("d")
 
 
+class TestATreeThatIsStartedAnew:
+    def test_an_add_whose_tree_has_gone_is_no_success(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        box.tree.set(f"{INITIATOR}/ver", 1)
+        # As its unit does: the daemon is killed, and one that has loaded what was saved before takes its place.
+        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
+                   "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & sleep 0.3; "
+                   f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1")
+        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=restart, times=1)
+        done = box.remvol(*TestAdding.ADD)
+        assert done.status == 255
+        assert box.tree.get("/result/add") == "-1"
+        assert "the configuration tree was started anew meanwhile, what was changed may be lost" in messages(done)
+
+    def test_an_add_whose_tree_does_not_answer_is_no_success(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        box.hook("ktreec_set", "/result/add", value="0", through=True, times=1,
+                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+        assert box.remvol(*TestAdding.ADD).status == 255
+
+
+class TestStrangersAndTemporaryFiles:
+    def test_a_run_beside_another_lists_into_a_file_of_its_own(self, stored, box):
+        box.fake("iscsiadm", "-m session", exact=True, delay=1, times=1, status=21)
+        first = box.start(["remvol", "--status"])
+        until(lambda: box.runs("iscsiadm"))
+        until(lambda: any("-m session >" in line for line in box.shell()))
+        status(box)
+        first.wait()
+        files = {line.split(">")[1].split()[0] for line in box.shell() if line.startswith("iscsiadm -m session >")}
+        assert "/tmp/remvol_session.tmp" in files and len(files) == 2
+        assert not [p.name for p in box.path("/tmp").iterdir() if re.search(r"\.tmp\.\d", p.name)]
 
     def test_a_lock_folder_of_another_user_is_replaced(self, stored, box):
         folder = box.path("/var/lock/virtual_volume")
