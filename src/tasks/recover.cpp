@@ -84,11 +84,35 @@ TargetHealth _check_luns(int dbidx, Caller caller) {
   return health;
 }
 
-void _keep_volumes(TargetEntry* entry) {
+// Returns whether the target is to be connected and was lost, by what is stored now.
+bool _is_lost(int dbidx) {
+  const SlotsHeld held;
+  TargetEntry target;
+  int state = kDisconnected;
+  if (ktree_get_entry_by_dbidx(dbidx, &target) != kOk) return false;
+  ktree_get_connect_state(dbidx, &state);
+  return target.conn_set != 0 && state == kRecovering;
+}
+
+int _leave_target(const TargetEntry* entry, Caller caller) {
+  LOG_AT(caller, 1, "This target %s has not been set to connect", entry->target_name);
+  return kOk;
+}
+
+// Returns whether the target was still lost.
+bool _store_recovered(TargetEntry* entry) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  if (!_is_lost(entry->db_idx)) return false;
   entry->conn_set = 1;
   ktree_record_connect_set(entry);
   ktree_set_connect_state(entry->db_idx, kConnected);
+  return true;
+}
+
+int _keep_volumes(TargetEntry* entry, Caller caller) {
+  if (!_store_recovered(entry)) return _leave_target(entry, caller);
   ktree_update_status(entry);
+  return kOk;
 }
 
 // Starts a run in the background that comes back for the target after a while.
@@ -114,6 +138,7 @@ void _unmount_luns(int dbidx, Caller caller) {
 // Unmounts everything, logs out and connects the target again. Returns the result of the connection.
 int _rebuild(TargetEntry* entry, Caller caller) {
   const TargetHold hold(entry->target_name);
+  if (!_is_lost(entry->db_idx)) return _leave_target(entry, caller);
   _unmount_luns(entry->db_idx, caller);
   Target_Logout(entry);
   entry->conn_set = 1;
@@ -136,19 +161,12 @@ int _recover_requested_target(Caller caller) {
     LOG_AT(caller, 1, "Can not find: %s", name);
     return kNotStored;
   }
-  int state = kDisconnected;
-  ktree_get_connect_state(entry.db_idx, &state);
-  if (entry.conn_set == 0 || state != kRecovering) {
-    LOG_AT(caller, 1, "This target %s has not been set to connect", name);
-    return kOk;
-  }
+  if (!_is_lost(entry.db_idx)) return _leave_target(&entry, caller);
+  // The looks take seconds: what is done then is for a target that nobody has taken away or brought up since.
   const TargetHealth health = _check_luns(entry.db_idx, caller);
-  if (health.degraded && !health.busy) return _rebuild(&entry, caller);
-  if (health.degraded) {
-    _postpone(&entry, caller);
-  } else {
-    _keep_volumes(&entry);
-  }
+  if (!health.degraded) return _keep_volumes(&entry, caller);
+  if (!health.busy) return _rebuild(&entry, caller);
+  _postpone(&entry, caller);
   return kOk;
 }
 

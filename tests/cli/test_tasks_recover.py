@@ -138,6 +138,20 @@ class TestSurvivedVolumes:
         assert lost.mounted("a")
 
 
+@pytest.mark.parametrize("degraded", [False, True])
+class TestATargetThatIsTakenAwayMeanwhile:
+    def test_it_stays_as_it_was_left(self, lost, box, degraded):
+        if degraded:
+            degrade(box, "b")
+        ktreec = "ktreec -S /var/run/ktree_sock_vv -s"
+        box.hook("popen", "ps -w | grep resize2fs | grep -v 'grep'", through=True, times=1,
+                 effect=f"{ktreec} {INITIATOR}/id:1/conn_set 0; {ktreec} {INITIATOR}/id:1/conn_state 0")
+        done = recover(box)
+        assert (done.status, messages(done)[-1]) == (0, NOT_SET)
+        assert (lost.target("conn_set"), lost.target("conn_state")) == ("0", "0")
+        assert not any("umount" in line or "--log" in line for line in box.shell())
+
+
 class TestDegradedVolumes:
     def test_the_target_is_rebuilt(self, lost, box):
         degrade(box, "b")
@@ -204,7 +218,7 @@ class TestDegradedVolumes:
     def test_a_target_that_vanishes_ends_disconnected(self, lost, box):
         degrade(box, "a")
         # The connection looks the target up again and does not find it: so many reads come before that one.
-        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=23, times=1)
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=28, times=1)
         assert recover(box).status == 255
         assert lost.target("conn_state") == "0"
         assert_order(lost.trace(), "set id:1/conn_state=2", "set id:1/conn_state=0")
