@@ -11,7 +11,6 @@
 #include "support/lun_list.h"
 #include "support/result.h"
 #include "support/target_hold.h"
-#include "tree/entry.h"
 #include "tree/search_results.h"
 #include "tree/state.h"
 
@@ -81,7 +80,7 @@ int search_luns(const char* socket, Caller caller) {
   const char* name = request_target.target_name;
   std::optional<BriefTargetHold> hold;
   int connected = check_target_connected(name);
-  if (connected == 0) hold.emplace(name, is_no_lun_formatting, ktree_get_dbidx_by_targetname(name));
+  if (connected == 0) hold.emplace(name, is_no_lun_formatting);
   if (hold && hold->waited()) connected = check_target_connected(name);
   bool logged_in = false;
   int result = open_session(socket, connected, &logged_in, caller);

@@ -62,13 +62,13 @@ TargetHold::~TargetHold() {
   if (outermost_) held_target[0] = '\0';
 }
 
-BriefTargetHold::BriefTargetHold(const char* target_name, bool (*may_wait)(int dbidx), int dbidx)
+BriefTargetHold::BriefTargetHold(const char* target_name, bool (*may_wait)(const char* target_name))
     : outermost_(enter(target_name)) {
   if (!outermost_) return;
   const LockName name = target_lock(target_name);
   for (int polls = 0; target_.try_take(name, LockMode::kExclusive) == LockTry::kBusy; polls++) {
     waited_ = true;
-    if (polls == kBriefPolls || !may_wait(dbidx)) return;
+    if (polls == kBriefPolls || !may_wait(target_name)) return;
     usleep(kBriefPoll);
   }
 }

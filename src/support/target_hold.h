@@ -41,9 +41,9 @@ class TargetHold {
 // long wait.
 class BriefTargetHold {
  public:
-  // A target that this run holds already is held on. Waits for as long as `may_wait` says of the target's
-  // slot, asked again and again, and never longer than a minute.
-  BriefTargetHold(const char* target_name, bool (*may_wait)(int dbidx), int dbidx);
+  // A target that this run holds already is held on. Waits for as long as `may_wait` says of the target,
+  // asked again and again while another run holds it, and never longer than a minute.
+  BriefTargetHold(const char* target_name, bool (*may_wait)(const char* target_name));
   BriefTargetHold(const BriefTargetHold&) = delete;
   BriefTargetHold& operator=(const BriefTargetHold&) = delete;
   ~BriefTargetHold();

@@ -92,7 +92,7 @@ int _disconnect_all(Caller caller = Caller()) {
 int _disconnect_requested() {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(request_target.target_name, &entry) != kOk) return kFailed;
-  const BriefTargetHold hold(entry.target_name, is_no_lun_formatting, entry.db_idx);
+  const BriefTargetHold hold(entry.target_name, is_no_lun_formatting);
   Target_Disconnect(&entry);
   ktree_update_status(&entry);
   return kOk;

@@ -45,7 +45,7 @@ int _delete_slot(int dbidx, int lun_dbidx, Caller caller) {
 
 // Removes the target in `entry`, volumes, session and node record first. Returns 0 or kNotDeleted.
 int _remove_target(TargetEntry* entry, Caller caller = Caller()) {
-  const BriefTargetHold hold(entry->target_name, is_no_lun_formatting, entry->db_idx);
+  const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   TargetEntry lun;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
     if (ktree_get_lun_entry_by_dbidx(&lun, entry->db_idx, slot) != kOk) break;
@@ -83,8 +83,7 @@ int task_del() {
 
 int task_del_lun() {
   LOG(2, "start");
-  const char* name = request_target.target_name;
-  const BriefTargetHold hold(name, is_no_lun_formatting, ktree_get_dbidx_by_targetname(name));
+  const BriefTargetHold hold(request_target.target_name, is_no_lun_formatting);
   int dbidx = 0;
   int lun_dbidx = 0;
   int result = kFailed;

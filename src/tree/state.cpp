@@ -62,8 +62,9 @@ int ktree_update_formatting_state(const TargetEntry* entry, int state) {
                                NumberText("%d", state));
 }
 
-bool is_no_lun_formatting(int dbidx) {
+bool is_no_lun_formatting(const char* target_name) {
   const SlotsHeld held;
+  const int dbidx = ktree_get_dbidx_by_targetname(target_name);
   for (int m = 1; m <= kMaxLunsPerTarget && is_lun_stored(dbidx, m); m++) {
     int state = kFormatIdle;
     ktree_get_lun_format_state(dbidx, m, &state);

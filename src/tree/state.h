@@ -47,8 +47,8 @@ int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx);
 // Writes the format state of the entry's LUN. Returns 0 or -103.
 int ktree_update_formatting_state(const TargetEntry* entry, int state);
 
-// Returns whether no LUN of the target at `dbidx` is being formatted or waits for that, by the stored states.
-bool is_no_lun_formatting(int dbidx);
+// Returns whether no LUN of the target is being formatted or waits for that, by the stored states.
+bool is_no_lun_formatting(const char* target_name);
 
 // Writes the format progress in percent. Returns 0, -1 for a dbidx below 1, or -103.
 int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent);

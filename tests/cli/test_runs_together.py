@@ -107,7 +107,7 @@ class TestHalfMadeSlots:
     def test_a_target_that_a_killed_add_has_not_counted_is_refreshed(self, site, box):
         site.store("iqn.t0")
         site.offer("iqn.t1", {0: "sdb"})
-        box.hook("ktreec_set", f"{INITIATOR}/id:2/lun/id:1/share", through=True, effect="kill -KILL $PPID", times=1)
+        box.hook("ktreec_set", f"{INITIATOR}/id:2/lun/id:1/enable", through=True, effect="kill -KILL $PPID", times=1)
         assert box.remvol(*TestAdding.ADD).status == -9
         assert box.tree.get(f"{INITIATOR}/count") == "1"
         status(box)
@@ -195,6 +195,12 @@ class TestAdding:
         box.tree.set(f"{INITIATOR}/count", 0)
         status(box)
         assert (site.lun("volume_state"), box.tree.get(f"{INITIATOR}/count")) == ("3", "0")
+
+    def test_a_target_whose_share_was_refused_stays_uncounted(self, site, box):
+        site.store("iqn.t0", luns=[("a", 0)])
+        assert box.remvol(*self.ADD).status == 255
+        status(box)
+        assert (site.target("target", 2), box.tree.get(f"{INITIATOR}/count")) == ("iqn.t1", "1")
 
     def test_two_at_once_with_one_share_name(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})

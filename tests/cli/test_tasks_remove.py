@@ -202,6 +202,14 @@ class TestLun:
         assert (site.lun("share"), site.target("lun/count")) == ("a", "2")
         assert box.shell() == ["winshare_reload"]
 
+    def test_nothing_is_said_of_what_is_only_looked_at(self, site, box):
+        site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
+        site.debug(1)
+        said = messages(box.remvol("--del_lun", "-n", "iqn.t1", "-l", "7"))
+        assert said[-5:] == ["get iqn.t1 db_idx=1", "ktreec_get(/iscsi/initiator/id:1/lun/id:3/lun) failed",
+                             "get lun: 7 at db_idx=-1", "Can not find lun 7 under target iqn.t1", "task_del_lun() failed"]
+        assert said.count("get iqn.t1 db_idx=1") == 1
+
     @pytest.mark.parametrize("options", [["-n", "iqn.t1"], ["-l", "0"], []])
     def test_a_missing_option(self, site, box, options):
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])

@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <functional>
@@ -182,8 +183,8 @@ TEST_F(RunLocks, ARunThatTakesAwayWaitsOnlyForAsLongAsItMay) {
     stay();
   });
   asked = 0;
-  const BriefTargetHold hold(
-      "iqn.t1", [](int dbidx) { return dbidx == 4 && ++asked < 3; }, 4);
+  const BriefTargetHold hold("iqn.t1",
+                             [](const char* name) { return strcmp(name, "iqn.t1") == 0 && ++asked < 3; });
   EXPECT_EQ(asked, 3);
   EXPECT_EQ(fakes::calls(), (Texts{"usleep 100000", "usleep 100000"}));
 }
@@ -193,14 +194,12 @@ TEST_F(RunLocks, ARunThatTakesAwayWaitsAMinuteAtMost) {
     const TargetHold hold("iqn.t1");
     stay();
   });
-  const BriefTargetHold hold(
-      "iqn.t1", [](int) { return true; }, 1);
+  const BriefTargetHold hold("iqn.t1", [](const char*) { return true; });
   EXPECT_EQ(fakes::calls().size(), 600U);
 }
 
 TEST_F(RunLocks, ARunThatTakesAwayKeepsOthersFromBringingUp) {
-  const BriefTargetHold hold(
-      "iqn.t1", [](int) { return true; }, 1);
+  const BriefTargetHold hold("iqn.t1", [](const char*) { return true; });
   const pid_t other = fork();
   if (other == 0) {
     RunLock lock;
