@@ -196,7 +196,7 @@ TEST_F(Slots, TheLastLunOfATargetLeavesTheNextTargetAsItIs) {
 
 TEST_F(Slots, ALunThatIsNotStoredIsNotFormatting) {
   fakes::tree_set({{lun_key(1, 5, "format_state"), "1"}});
-  EXPECT_TRUE(is_no_lun_formatting(1));
+  EXPECT_TRUE(is_no_lun_formatting("iqn.t1"));
 }
 
 TEST_F(Slots, HalfMadeSlotsAreDropped) {
