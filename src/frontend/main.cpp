@@ -65,9 +65,9 @@ void copy_to_flash() {
 
 // Dumps the tree. Returns whether the settings file may go to the flash.
 bool dump_settings(const Command& command, Caller caller) {
-  // Behind a command that has ended the tree there is nothing to tell of.
-  if (command.ends_tree && !tree_answers(result_key()))
-    return ktreec_dump(main_socket, 0, kSettingsFile) == 0;
+  // A tree that was told to end may be gone already, which is nothing to tell of.
+  if (command.ends_tree)
+    return !dump_would_bury_settings() && ktreec_dump(main_socket, 0, kSettingsFile) == 0;
   RunLock lock;
   lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one
   return store_settings(caller);
