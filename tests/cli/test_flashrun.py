@@ -409,6 +409,22 @@ def test_many_copies_at_once_are_all_whole(copied):
     assert content(copied) == NEW and names(copied) == ["vv.xml"]
 
 
+@pytest.mark.unsanitized
+def test_a_copy_that_stays_open_to_others_is_told(copied):
+    copied.box.path(COPY).chmod(0o644)
+    done = traced(copied, ["-e", "inject=fchmod:error=EIO:when=1"], "true")
+    assert (done.status, done.stderr) == (0, f"flashrun: {COPY} stays readable for others: Input/output error\n")
+
+
+@pytest.mark.unsanitized
+def test_a_flash_that_nobody_can_watch_is_closed_at_once(flash):
+    flash.mount()
+    done = traced(flash, ["-e", "inject=clone,clone3,fork,vfork:error=EAGAIN:when=1"], f"touch {FOLDER}/f")
+    assert (done.status, done.stderr) == (126, "flashrun: fork: Resource temporarily unavailable\n")
+    assert flash.read_only
+    assert flash.sh(f"ls {FOLDER}") == ""
+
+
 # --- locks ---
 
 LOCKS = "/run/remvol"
@@ -446,6 +462,15 @@ def test_a_lock_that_others_can_hold_is_not_waited_for(flash, plant):
     assert flash.sh(f"stat -c '%F %a %u' {LOCKS}/flash.door") == "regular empty file 600 0\n"
     flash.sh("pkill -x sleep || :")
     holder.wait()
+
+
+def test_without_a_lock_the_flash_stays_as_it_is(flash):
+    flash.mount()
+    flash.sh("/bin/mount -o remount,ro /run")
+    done = flash.run("true")
+    assert done.status == 0
+    assert done.stderr.splitlines()[0] == f"flashrun: {FOLDER} cannot be made writable: Permission denied"
+    assert flash.read_only
 
 
 def host_pid(flash, inside):

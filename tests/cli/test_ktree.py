@@ -605,6 +605,19 @@ def test_a_dump_is_on_the_disk_before_it_gets_the_name_and_the_folder_after_it(d
     assert ".tmp>" in lines[0] and f"{daemon.folder}>" in lines[2]
 
 
+def test_a_dump_leaves_nothing_open(daemon):
+    daemon.set("/a", "new")
+    log = daemon.folder.parent / f"{daemon.folder.name}.log"
+    run("strace", "-y", "-o", log, "-e", "trace=openat,close", KTREEC, "-S", daemon.socket, "-D",
+        daemon.folder / "vv.xml", env=TRACED, check=True)
+    lines = [line for line in log.read_text().splitlines() if str(daemon.folder) in line]
+    log.unlink()
+    opened = [line.rpartition("= ")[2] for line in lines if line.startswith("openat") and "= -1" not in line]
+    closed = [line.partition("(")[2].partition(">")[0] + ">" for line in lines if line.startswith("close")]
+    assert len(opened) == 3  # the folder for what was left there, the new file, the folder to be written out
+    assert sorted(closed) == sorted(opened)
+
+
 def test_what_killed_dumps_left_is_removed_by_the_next(daemon):
     file = daemon.folder / "vv.xml"
     daemon.set("/a", "secret")

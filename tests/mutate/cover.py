@@ -37,6 +37,7 @@ class Cover:
         stored = json.loads(STORE.read_text()) if STORE.exists() else {}
         self.tests, self.texts = stored.get("tests", {}), stored.get("texts", {})
         self.maps = {}
+        self.now = {name: stamp(path) for name, path in {**unit_tests(), **cli_tests()}.items()}
 
     def measure(self, jobs):
         stale = [name for name, path in {**unit_tests(), **cli_tests()}.items()
@@ -78,10 +79,13 @@ class Cover:
         hits = {name: self._hits(test, breakage.file, line) for name, test in self.tests.items()}
         if not any(hits.values()):  # not code of its own, or run where nothing is counted
             hits = {name: int(breakage.file in test["lines"]) for name, test in self.tests.items()}
+        for name, test in self.tests.items():  # one that has changed may know the line by now
+            if test["stamp"] != self.now.get(name) and breakage.file in test["lines"]:
+                hits[name] = hits[name] or 1
         for start, names in BY_NAME.items():
             if breakage.file.startswith(start):
                 hits.update({n: hits[n] or 1 for n in hits if n.endswith(".py") and n.startswith(names)})
-        order = sorted((n for n in hits if hits[n]), key=lambda n: self.tests[n]["seconds"] / (1 + hits[n] ** 0.5))
+        order = sorted((n for n in hits if hits[n] and n in self.now), key=lambda n: self.tests[n]["seconds"] / (1 + hits[n] ** 0.5))
         return [n for n in order if not n.endswith(".py")], [n for n in order if n.endswith(".py")]
 
     def seconds(self, breakage):
