@@ -61,9 +61,10 @@ void Targets::settle(Target& target, const std::vector<Session>& sessions) {
   const Links links = links_of(target.name, sessions);
   target.present = links.any;
   if (target.suspect > 0) --target.suspect;
-  if (target.pause > 0 && --target.pause == 0) target.wants_recover = links.any;
+  // Also without a session: a recovery that was killed may have closed it.
+  if (target.pause > 0 && --target.pause == 0) target.wants_recover = true;
   if (!links.any) {
-    target.suspect = target.pause = 0;
+    target.suspect = 0;
     target.answered = false;
   } else if (links.any_down) {
     if (!target.lost) order_reopen(target);
@@ -82,7 +83,8 @@ void Targets::look(const std::vector<Session>& sessions) {
   for (const Session& session : sessions) find(session.target);
   for (Target& target : targets_) settle(target, sessions);
   std::erase_if(targets_, [](const Target& target) {
-    return !target.present && !target.lost && !target.busy && !target.wants_reopen && !target.wants_recover;
+    return !target.present && !target.lost && !target.busy && !target.wants_reopen && !target.wants_recover &&
+           target.pause == 0;
   });
 }
 
@@ -128,9 +130,8 @@ void Targets::ended(pid_t process, bool failed) {
 Hurry Targets::hurry() const {
   Hurry hurry = Hurry::kNone;
   for (const Target& target : targets_) {
-    if (!target.present) continue;
-    if (target.suspect > 0 || target.answered) return Hurry::kMuch;
-    if (target.lost || target.pause > 0) hurry = Hurry::kSome;
+    if (target.present && (target.suspect > 0 || target.answered)) return Hurry::kMuch;
+    if ((target.present && target.lost) || target.pause > 0) hurry = Hurry::kSome;
   }
   return hurry;
 }

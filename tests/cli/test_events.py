@@ -272,6 +272,18 @@ def test_a_recovery_that_failed_is_tried_again(connected):
     connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end of the retries")
 
 
+def test_a_recovery_that_was_killed_behind_the_logout_is_tried_again(connected):
+    gone = f"mv {SESSIONS}/session1 /sys/class/gone1; exit 255"
+    connected.box.fake("remvol", "--oiscsi_evt_recover", status=255, effect=gone, times=1)
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    connected.state(1, "LOGGED_IN")
+    connected.send(login_response(1))
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"), recover("iqn.a"))
+    connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end of the retries")
+
+
 def test_a_reopen_that_failed_is_not_tried_again(connected):
     connected.box.fake("remvol", "--oiscsi_evt_reopen", status=255)
     connected.state(1, "FAILED")
