@@ -11,6 +11,7 @@
 #include "iscsi/initiator_name.h"
 #include "iscsi/iscsiadm.h"
 #include "iscsi/node.h"
+#include "iscsi/records.h"
 #include "support/command.h"
 #include "support/files.h"
 #include "support/shell_text.h"
@@ -166,6 +167,7 @@ int task_init() {
   run_command("mkdir -p /etc/iscsi");
   write_daemon_configuration(caller);
   const InitiatorName name = write_initiator_name(caller);
+  drop_empty_records();
   start_daemon("iscsid -f >/dev/null 2>&1 &");
   Iface_Config_Gen();
   ktree_update_initiator_iqn(name);

@@ -156,6 +156,24 @@ def test_every_failure_is_logged_and_the_next_step_runs(box, initiator):
     assert box.tree.get("/iscsi/initiator/iqn") == NAME
 
 
+def test_records_that_a_power_cut_left_empty_are_removed(box, initiator):
+    folder = "/etc/iscsi/nodes/iqn.2026-01.org.example:t1"
+    empty = [f"{folder}/10.9.0.2,3260", f"{folder}/10.9.1.2,3260,1/iface0", "/etc/iscsi/ifaces/iface1"]
+    whole = [f"{folder}/10.9.0.3,3260", "/etc/iscsi/ifaces/iface0"]
+    for path in empty:
+        box.write(path, "")
+    for path in whole:
+        box.write(path, "# BEGIN RECORD 2.1.8\n")
+    box.path("/etc/iscsi/ifaces/link").symlink_to("/etc/iscsi/elsewhere")
+    box.write("/etc/iscsi/elsewhere", "")
+    done = init(box)
+    assert box.trace() == bring_up()
+    assert [path for path in empty if box.path(path).exists()] == []
+    assert sorted(re.findall(r": the empty record (\S+) is removed", done.stdout)) == sorted(empty)
+    assert all(box.path(path).exists() for path in [*whole, "/etc/iscsi/elsewhere"])
+    assert box.path("/etc/iscsi/ifaces/link").is_symlink()
+
+
 def test_missing_modules_and_a_missing_iscsiadm_leave_a_clear_state(box, initiator):
     store(box, 1, T1, luns=[{"lun": 1}])
     box.fake("insmod", status=1, stderr="insmod: ERROR: could not load module\n")

@@ -38,6 +38,8 @@ case $PHASE in
     ;;
 2)
     all_back
+    # The initiator's records are written without a sync: this is what the power may leave of them.
+    truncate -s 0 /etc/iscsi/nodes/${T}1/* /etc/iscsi/ifaces/iface0
     sync
     power_pull
     ;;
