@@ -605,6 +605,15 @@ def test_a_dump_is_on_the_disk_before_it_gets_the_name_and_the_folder_after_it(d
     assert ".tmp>" in lines[0] and f"{daemon.folder}>" in lines[2]
 
 
+def test_what_no_dump_takes_the_place_of(daemon):
+    (daemon.folder / "folder").mkdir()
+    os.mkfifo(daemon.folder / "fifo")
+    for name, reason in [("folder", "Is a directory"), ("fifo", "Invalid argument")]:
+        done = daemon.run("-D", daemon.folder / name)
+        assert (done.returncode, done.stderr.decode()) == (1, f"ktreec: {daemon.folder / name}: {reason}\n")
+    assert sorted(os.listdir(daemon.folder)) == ["fifo", "folder", "sock", "sock_config.pid"]
+
+
 def test_a_dump_leaves_nothing_open(daemon):
     daemon.set("/a", "new")
     log = daemon.folder.parent / f"{daemon.folder.name}.log"

@@ -1,10 +1,12 @@
 """What the platform recognises on a device, and what it never takes for an empty one."""
 
+import os
 import struct
+import subprocess
 
 import pytest
 from harness.sysaux import (
-    MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, mounted, run, under_fault,
+    CALL, MIB, call, calls_of, hfsplus, image, loop, make_ambivalent, make_ext, md_member, mounted, run, under_fault,
 )
 
 __all__ = ["loop"]
@@ -238,3 +240,26 @@ def test_other_content_wants_no_check(loop):
     run("mkfs.vfat", fat.node)
     for node in (empty.node, fat.node, "/dev/no_such_node"):
         assert call("check_fs_state", node) == 0
+
+
+def test_a_node_that_cannot_be_opened_is_not_known(loop):
+    disk = loop()
+    make_ext(disk)
+    status, words = under_fault("fs_type", disk.node, disk.node, "openat", "error=EIO", "1+")
+    assert (status, words[:1]) == (0, ["-1"])
+
+
+@pytest.mark.unsanitized
+def test_without_memory_a_file_system_never_counts_as_nothing(loop, tmp_path):
+    disk = loop()
+    make_ext(disk)
+    left = tmp_path / "left"
+    scarce = {**os.environ, "LD_PRELOAD": str(CALL.parent / "libscarce.so"), "SCARCE_FILE": str(left)}
+    answers, spare = [], 0
+    while spare == 0:  # until there are fewer allocations than that
+        left.write_bytes(struct.pack("=q", len(answers) + 1))
+        done = subprocess.run([CALL, "fs_type", disk.node], env=scarce, stdout=subprocess.PIPE, text=True, timeout=60)
+        answers.append(done.stdout.split() if done.returncode == 0 else [f"status {done.returncode}"])
+        spare = struct.unpack("=q", left.read_bytes())[0]
+    assert {words[0] for words in answers} == {"0", "-1"}, answers
+    assert all(len(words) == 2 for words in answers if words[0] == "0"), answers
