@@ -43,7 +43,7 @@ bool tree_answers(const char* key) {
 TreeInstance tree_instance() {
   struct stat info;
   if (stat(main_socket, &info) != 0) return {};
-  return {info.st_ino, info.st_ctim};
+  return {info.st_ino, info.st_mtim};
 }
 
 bool is_same_tree(const TreeInstance& before) {

@@ -177,6 +177,7 @@ int ktree_update_status(const TargetEntry* entry) {
     if (state == seen) return write_target_state(n, connected, state, here);
   }
   const SlotsHeld held(SlotsHeld::kChange);
+  if (state == kRecovering && entry->conn_set == 1) return write_target_status(n, "Reconnecting", here);
   return write_target_state(n, connected, state, here);
 }
 
