@@ -4,6 +4,7 @@
 #include <string>
 
 #include "fakes.h"
+#include "support/text.h"
 #include "tree/entry.h"
 #include "tree/half_made.h"
 #include "tree/state.h"
@@ -192,6 +193,15 @@ TEST_F(Slots, TheLastLunOfATargetLeavesTheNextTargetAsItIs) {
   for (int m = 1; m <= kMaxLunsPerTarget + 1; m++) remember_lun(1, m, 10 * m);  // there is no slot 9
   delete_target(1);
   EXPECT_EQ(HeldSlot(2).target(), 1);
+}
+
+TEST_F(Slots, ATargetThatWasJustAddedIsFoundWhereverItIs) {
+  TargetEntry entry = {};
+  copy_text(entry.target_name, "iqn.t4");
+  copy_text(entry.ip, "10.0.0.4");
+  ASSERT_EQ(ktree_add_entry(&entry), 4);
+  delete_target(1);
+  EXPECT_EQ(HeldSlot(4).target(), 3);
 }
 
 TEST_F(Slots, ALunThatIsNotStoredIsNotFormatting) {
