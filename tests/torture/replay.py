@@ -196,15 +196,15 @@ def run(options):
     seed = first_seed(options.seed)
     print(f"replay: seed {seed}", flush=True)
     prepared, begin = prepare(), time.monotonic()
-    disks = bad = flushes = 0
-    for number in range(options.rounds):
-        if options.seconds is not None and time.monotonic() - begin > options.seconds:
-            break
+    disks = bad = flushes = number = 0
+    while number < options.rounds and (options.seconds is None or time.monotonic() - begin < options.seconds):
         found, passed, looked = play(seed + number, prepared, options)
         disks, flushes, bad = disks + looked, flushes + passed, bad + len(found)
         if found:
             print(f"run with seed {seed + number}:", *found, sep="\n  ", flush=True)
-    print(f"replay: {max(0, disks - bad)} passed, {bad} failed (disks; {flushes} flushes, {time.monotonic() - begin:.0f} s)")
+        number += 1
+    seconds = time.monotonic() - begin
+    print(f"replay: {max(0, disks - bad)} passed, {bad} failed (disks; {flushes} flushes in {number} runs, {seconds:.0f} s)")
     return bad == 0
 
 
