@@ -147,6 +147,8 @@ def run_all(breakages, options, cover):
     workers = [Worker(n, cover) for n in range(min(options.jobs, len(breakages)))]
     for worker in workers:
         worker.prepare(targets_of(breakages, cover))
+    if cover:  # the unbroken programs, for the tests as they are now
+        Copy("cover").refresh("tests/cli/")
     share_out(workers, breakages, "units", done)
     if options.units:
         for breakage in later:

@@ -52,17 +52,18 @@ class Copy:
         self.build = self.root / "build"
         self.flags = flags
 
-    def refresh(self):
-        """Brings the sources up to date; what has not changed keeps its time."""
-        wanted = set(source_files())
+    def refresh(self, below=""):
+        """Brings the sources (below a folder) up to date; what has not changed keeps its time."""
+        wanted = {name for name in source_files() if name.startswith(below)}
         for name in wanted:
             data, place = (ROOT / name).read_bytes(), self.root / name
             if not place.exists() or place.read_bytes() != data:
                 place.parent.mkdir(parents=True, exist_ok=True)
                 place.write_bytes(data)
                 place.chmod((ROOT / name).stat().st_mode)
-        for place in self.root.rglob("test_*.py"):
-            if str(place.relative_to(self.root)) not in wanted:
+        for place in (self.root / "tests").rglob("test_*.py"):
+            name = str(place.relative_to(self.root))
+            if name.startswith(below) and name not in wanted:
                 place.unlink()
         self.configure()
 

@@ -205,8 +205,8 @@ TEST_F(Slots, ATargetThatWasJustAddedIsFoundWhereverItIs) {
 }
 
 TEST_F(Slots, ALunThatIsNotStoredIsNotFormatting) {
-  fakes::tree_set({{lun_key(1, 5, "format_state"), "1"}});
-  EXPECT_TRUE(is_no_lun_formatting("iqn.t1"));
+  fakes::tree_set({{lun_key(3, 4, "format_state"), "1"}});
+  EXPECT_TRUE(is_no_lun_formatting("iqn.t3"));
 }
 
 TEST_F(Slots, HalfMadeSlotsAreDropped) {
