@@ -56,8 +56,9 @@ bool is_uncounted(int n) {
 
 bool has_uncounted_target() {
   const SlotsHeld held;
-  for (int n = tree_read_number(key::kTargetCount, 0) + 1; n <= kMaxTargets; n++) {
-    if (n >= 1 && is_uncounted(n)) return true;
+  const int count = tree_read_number(key::kTargetCount, 0);
+  for (int n = 1; n <= kMaxTargets; n++) {
+    if (n > count && is_uncounted(n)) return true;
   }
   return false;
 }

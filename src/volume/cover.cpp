@@ -16,6 +16,7 @@ namespace remvol {
 
 namespace {
 
+constexpr int kLiftTries = 3;               // memory may be short for a moment
 constexpr char kSource[] = "remvol-cover";  // what the mount table shows for a device
 
 enum Outcome : int { kDone, kNotDone };
@@ -58,7 +59,9 @@ bool run_covered(const char* path, bool (*work)(const void*), const void* what) 
 }
 
 void lift_cover(const char* path) {
-  umount2(path, MNT_DETACH | UMOUNT_NOFOLLOW);
+  for (int tries = 0; tries < kLiftTries; tries++) {
+    if (umount2(path, MNT_DETACH | UMOUNT_NOFOLLOW) == 0 || errno == EINVAL || errno == ENOENT) return;
+  }
 }
 
 void lift_left_cover(const char* path) {

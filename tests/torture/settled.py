@@ -45,17 +45,9 @@ AFTER = (
      "asked for again finds no slot"),
 )
 
-PULLED = (
-    (r"^(disconnect|disconnect-all|del|modify|recover)$", r"logout",
-     "a volume that cannot be unmounted does not keep a session from being closed"),
-    (r"^(connect|connect-again|init|modify|recover)$", r"logout",
-     "a session in which no disk of the target can be found is closed again, whatever is mounted"),
-)
-
-
 def reason(fault, text):
     kind, _, rest = text.partition(": ")
-    table = {"success": SUCCESS, "after": AFTER, "pulled": PULLED}.get(kind, ())
+    table = {"success": SUCCESS, "after": AFTER}.get(kind, ())
     for roads, finding, why in table:
         if re.search(roads, fault.road) and re.match(finding, rest):
             return why
