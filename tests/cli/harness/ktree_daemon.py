@@ -51,7 +51,8 @@ class Daemon:
             return client.connect_ex(str(self.socket)) == 0
 
     def pid(self):
-        return int(self.pid_file.read_text())
+        """The daemon's own process, which may be another one than what was started; written a moment after it answers."""
+        return int(until(lambda: self.pid_file.exists() and self.pid_file.read_text()))
 
     def stop(self, number=signal.SIGTERM):
         self.process.send_signal(number)
