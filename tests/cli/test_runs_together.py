@@ -250,6 +250,42 @@ class TestLunsThatMove:
         assert three.mounted("d")
 
 
+class TestASessionUnderAVolume:
+    """A volume that the tree does not name is known by the kernel's tables alone."""
+
+    @pytest.fixture
+    def unknown(self, stored, box):
+        stored.log_in("iqn.t1")
+        box.session_disk("sdq", "iqn.t1", lun=7)
+        stored.mount("sdq", "/mnt/VV/unknown")
+        return stored
+
+    @pytest.mark.parametrize("command, logout", [
+        (["--disconnect", "-n", "iqn.t1"], 'iscsiadm -m node -T "iqn.t1" --logout'),
+        (["--disconnect"], "iscsiadm -m node -u"),
+        (["--system_off"], "iscsiadm -m node -u")])
+    def test_it_is_unmounted_before_the_session_is_closed(self, unknown, box, command, logout):
+        box.default("killall")
+        box.remvol(*command)
+        shell = box.shell()
+        assert shell.index('umount -f "/mnt/VV/unknown"') < shell.index(logout)
+
+    @pytest.mark.parametrize("command", [["--disconnect", "-n", "iqn.t1"], ["--disconnect"]])
+    def test_another_targets_volume_does_not_matter(self, stored, box, command):
+        stored.log_in("iqn.t1")
+        box.local_disk("sdq")
+        stored.mount("sdq", "/mnt/VV/other")
+        assert box.remvol(*command).status == 0
+        assert stored.mounted("other")
+
+    def test_a_listing_that_fails_gives_no_session_up(self, unknown, box):
+        box.fake("iscsiadm", "-m session -P3", status=1)
+        said = messages(box.remvol("--connect", "-n", "iqn.t1"))
+        assert "the session of target iqn.t1 stays, a volume is mounted from it" in said
+        assert unknown.logged_in("iqn.t1") and unknown.target("conn_set") == "1"
+        assert unknown.mounted("unknown")
+
+
 class TestATreeThatIsStartedAnew:
     def test_an_add_whose_tree_has_gone_is_no_success(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})
