@@ -7,11 +7,12 @@ import pathlib
 import random
 import re
 import sys
+import tempfile
 import time
 
 sys.path.insert(0, str(pathlib.Path(__file__).parent))
 
-from faults import Faults  # noqa: E402
+from faults import Faults, Outcomes  # noqa: E402
 from many import Round  # noqa: E402
 from pairs import PAIRS, torment  # noqa: E402
 import power  # noqa: E402
@@ -63,38 +64,67 @@ def run_pairs(options):
 
 def run_faults(options):
     begin = time.monotonic()
-    faults = Faults(options.only or (options.at or "").split("/")[0], options.seed)
+    faults = Faults(options.only or (options.at or "").split("/")[0], options.seed, options.jobs)
     everything = faults.system_calls(options.count, options.seed) if options.system_calls else faults.all
-    chosen = [fault for fault in everything if options.at in (None, fault.key()) and re.search(options.named or "", str(fault))]
-    random.Random(options.seed).shuffle(chosen)
-    chosen = chosen[: options.count]
-    print(f"faults: {len(faults.all)} are possible on {len(faults.walks)} roads, {len(chosen)} chosen (seed {options.seed})", flush=True)
-    good = bad = missed = 0
-    with multiprocessing.Pool(options.jobs, initializer=keep_faults, initargs=(faults,)) as pool:
+    share, shares = options.shard
+    chosen = sorted((fault for fault in everything
+                     if options.at in (None, fault.key()) and re.search(options.named or "", str(fault))
+                     and faults.order(fault) % shares == share), key=faults.order)
+    results = Results(options.results)
+    chosen = [fault for fault in chosen if fault.key() not in results.known][: options.count]
+    print(f"faults: {len(faults.all)} are possible on {len(faults.walks)} roads, {len(results.known)} have been tried, "
+          f"{len(chosen)} chosen (seed {options.seed})", flush=True)
+    with tempfile.TemporaryDirectory(prefix="outcomes.") as folder, \
+         multiprocessing.Pool(options.jobs, initializer=keep_faults, initargs=(faults, Outcomes(folder))) as pool:
         for fault, found in pool.imap_unordered(play_fault, chosen):
-            missed += found is None
-            good += found == []
-            bad += bool(found)
-            if found:
-                print(f"{fault.key()} {fault}", *(f"    {text[:1000]}" for text in found), sep="\n", flush=True)
+            results.add(fault, found)
             if options.seconds is not None and time.monotonic() - begin > options.seconds:
                 pool.terminate()
                 break
+        states = len(list(pathlib.Path(folder).iterdir()))
     seconds = time.monotonic() - begin
-    print(f"faults: {good} passed, {bad} failed ({missed} not met, {seconds:.0f} s, {(good + bad) / seconds:.1f} a second)")
+    good, bad, missed = (results.counts[word] for word in ("passed", "failed", "missed"))
+    print(f"faults: {good} passed, {bad} failed ({missed} not met, {states} states, {seconds:.0f} s, {(good + bad) / seconds:.1f} a second)")
     return bad == 0
 
 
-def keep_faults(faults):
+class Results:
+    """What became of each fault, also in a file that a later run goes on with."""
+
+    def __init__(self, path):
+        self.file = open(path, "a+") if path else None
+        self.known = set()
+        self.counts = collections.Counter()
+        if self.file:
+            self.file.seek(0)
+            self.known = {line.split(" ")[1] for line in self.file if not line.startswith(" ")}
+
+    def add(self, fault, found):
+        word = "missed" if found is None else "failed" if found else "passed"
+        self.counts[word] += 1
+        text = "".join("\n    " + text[:1000].replace("\n", "\n    ") for text in found or ())
+        if found:
+            print(f"{fault.key()} {fault}{text}", flush=True)
+        if self.file:
+            print(f"{word} {fault.key()} {fault}{text}", file=self.file, flush=True)
+
+
+def keep_faults(*what):
     global kept
-    kept = faults
+    kept = what
 
 
 def play_fault(fault):
+    faults, outcomes = kept
     try:
-        return fault, kept.play(fault)
+        return fault, faults.play(fault, outcomes)
     except Exception as error:  # noqa: BLE001: one bad box does not end a long run
         return fault, [f"torture: {type(error).__name__}: {error}"]
+
+
+def shard(text):
+    share, shares = map(int, text.split("/"))
+    return share, shares
 
 
 def main():
@@ -123,6 +153,8 @@ def main():
     faults.add_argument("--named", help="those whose text this expression finds")
     faults.add_argument("--seed", type=int, default=1)
     faults.add_argument("--jobs", type=int, default=2)
+    faults.add_argument("--shard", type=shard, default=(0, 1), help="I/N: the I-th of N parts, from 0")
+    faults.add_argument("--results", help="file for what became of each; those that stand in it are not tried again")
     faults.set_defaults(run=run_faults)
     power.add_form(forms)
     replay.add_form(forms)

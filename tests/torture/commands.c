@@ -17,6 +17,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include "lasting.h"
 #include "sysfs.h"
 #include "world.h"
 
@@ -498,10 +499,12 @@ static int do_ps(void) {
   return 0;
 }
 
+/* The real command; what is put before the C library has nothing to do in it. */
 static int run_real(const char* name, char** argv) {
   static char path[8192];
   const char* all = getenv("PATH");
   if (all != NULL && strncmp(all, "/fake/bin:", 10) == 0) all += 10;
+  unsetenv("LD_PRELOAD");
   snprintf(path, sizeof path, "%s", all == NULL ? "/usr/sbin:/usr/bin:/sbin:/bin" : all);
   for (char* folder = strtok(path, ":"); folder != NULL; folder = strtok(NULL, ":")) {
     char file[4096];
@@ -525,26 +528,41 @@ static int show_semaphore(void) {
   return 0;
 }
 
-/* `world semaphore`, `world degrade POINT`: see above. `world restore NODE POINT...`: the kernel's view of
- * the sessions that the state holds, and volumes mounted as they were. The torture itself calls it, when a
- * state was put back. */
-static int do_world(char** argv) {
-  if (argv[0] != NULL && strcmp(argv[0], "semaphore") == 0) return show_semaphore();
-  if (argv[0] != NULL && argv[1] != NULL && strcmp(argv[0], "degrade") == 0) return degrade(argv[1]);
-  if (argv[0] == NULL || strcmp(argv[0], "restore") != 0) return 2;
+/* The kernel's view of the sessions that the state holds, and volumes mounted as they were. */
+static int restore(char** argv) {
   for (int t = 1; t <= TARGETS; t++) {
     struct target* target = &world->targets[t];
     for (int l = 0; l < LUNS; l++) {
       if (target->luns[l].letter != 0) sysfs_add(t, l, &target->luns[l], target->session);
     }
   }
-  for (argv++; argv[0] != NULL && argv[1] != NULL; argv += 2) {
-    char path[4096];
-    snprintf(path, sizeof path, "mkdir -p '%s'", argv[1]);
+  mkdir("/mnt/VV", 0755);
+  for (; argv[0] != NULL && argv[1] != NULL; argv += 2) {
     char* words[] = {argv[0], argv[1], NULL};
-    if (system(path) != 0 || do_mount(words) != 0 || chmod(argv[1], 0777) != 0) return 1;
+    if (mkdir(argv[1], 0777) != 0 || do_mount(words) != 0 || chmod(argv[1], 0777) != 0) return 1;
   }
   return 0;
+}
+
+/* Before anything else: a sysfs without a disk. */
+static int begin(void) {
+  const char* const folders[] = {"/sys/block", "/sys/class", "/sys/class/block", "/sys/class/iscsi_session"};
+  if (mount("sys", "/sys", "tmpfs", 0, "") != 0) return 1;
+  for (size_t i = 0; i < sizeof folders / sizeof *folders; i++) {
+    if (mkdir(folders[i], 0755) != 0) return 1;
+  }
+  return 0;
+}
+
+/* `world ...`: the torture itself calls it. */
+static int do_world(char** argv) {
+  const char* what = argv[0] == NULL ? "" : argv[0];
+  if (strcmp(what, "begin") == 0) return begin();
+  if (strcmp(what, "restore") == 0) return restore(argv + 1); /* NODE POINT... of what was mounted */
+  if (strcmp(what, "degrade") == 0 && argv[1] != NULL) return degrade(argv[1]);
+  if (strcmp(what, "semaphore") == 0) return show_semaphore();
+  if (strcmp(what, "lasting") == 0) return lasting_show();
+  return 2;
 }
 
 static int is_plain(const char* name) {

@@ -5,13 +5,18 @@ nothing had happened (beside a run that never had a fault). What is settled othe
 
 import dataclasses
 import errno
+import json
+import multiprocessing
+import os
+import pathlib
 import random
 import re
 import time
+import zlib
 
 import settled
 from pairs import BLANK, FULL, on, stored
-from world import SAVED, SOCKET, World
+from world import SAVED, World
 
 CALL, TREE, COMMAND, MEMORY, SYSTEM = range(5)
 CLASSES = ("call", "tree", "command", "memory", "system call")
@@ -21,6 +26,7 @@ INJECTED = "/tmp/injected"
 FAIL, KILL, NOTHING, MUTE, LATE = range(5)
 KINDS = ("fails", "is killed", "does nothing and says 0", "prints nothing", "works and says 1")
 EIO, ENOMEM, ENOSPC, EMFILE = 5, 12, 28, 24
+ERRORS = (EIO, ENOSPC, EMFILE)
 PACE = 5  # percent: nobody meets anybody here
 HANG = 30  # seconds
 
@@ -99,14 +105,14 @@ def picture(world):
     folder = world.box.path("/mnt/VV")
     for entry in folder.iterdir() if folder.exists() else ():
         seen[f"folder {entry.name}"] = ""
-    seen["settings"] = plain(without_results(world.box.path(SAVED)))
-    world.sh(f"ktreec -S {SOCKET} -D /tmp/now.xml")
-    seen["now"] = plain(without_results(world.box.path("/tmp/now.xml")))
+    saved = world.box.path(SAVED)
+    seen["settings"] = plain(without_results(saved.read_bytes())) if saved.exists() else "none"
+    seen["now"] = plain(without_results(world.dump()))
     return seen
 
 
-def without_results(file):
-    text = file.read_text() if file.exists() else "none"
+def without_results(data):
+    text = data.decode("utf-8", "surrogateescape")
     return re.sub(r"(?s)<result>.*?</result>\s*|<result/>\s*", "", text)
 
 
@@ -124,15 +130,56 @@ def difference(good, seen, output=""):
     return texts
 
 
+# --- what became of the states that faults leave ---
+
+@dataclasses.dataclass
+class Outcome:
+    seen: dict  # the picture of the state itself
+    later: list  # what was found when the command was given again from there
+
+
+class Outcomes:
+    """Faults leave the same few states again and again. From the same state the same commands lead to the same end,
+    so each is gone on from once, by whichever process meets it first; one in CHECKED again, to see that it is so."""
+
+    CHECKED = 40
+
+    def __init__(self, folder):
+        self.folder = pathlib.Path(folder)
+        self.checks = 0
+
+    def of(self, road, state):
+        """The outcome that is known, None when there is none or it is to be found once more."""
+        file = self.folder / f"{road}.{state}"
+        if state is None or not file.exists():
+            return None
+        return Outcome(**json.loads(file.read_text()))
+
+    def due(self):
+        self.checks += 1
+        return self.checks % self.CHECKED == 0
+
+    def keep(self, road, state, outcome):
+        if state is None:
+            return
+        draft = self.folder / f"draft.{os.getpid()}"
+        draft.write_text(json.dumps(dataclasses.asdict(outcome)))
+        draft.rename(self.folder / f"{road}.{state}")
+
+
 # --- one road, with a fault or without ---
 
 class Walk:
-    def __init__(self, road, beginning):
-        self.road, self.beginning = road, beginning
+    def __init__(self, name, beginning):
+        self.name, self.beginning = name, beginning
+
+    @property
+    def road(self):
+        return ROADS[self.name]
 
     def world(self):
         world = World(pace=PACE, daemon=False)
-        world.restore(self.beginning[0])
+        world.restore(self.beginning)
         world.start_daemon()
         if self.road.degraded:
             world.degrade(self.road.degraded)
@@ -159,57 +206,87 @@ class Walk:
             world.plan(active=0)
             world.box.wait_quiet()
             if done.status != 0 or world.findings():
-                raise RuntimeError(f"{self.road.name} fails without a fault: {done} {done.output} {world.findings()}")
+                raise RuntimeError(f"{self.name} fails without a fault: {done} {done.output} {world.findings()}")
             self.first = picture(world)
             calls = (world.box.root / "fake/world/calls").read_text("utf-8", "replace").splitlines()
             self.repeat(world)
             self.second = picture(world)
             if world.findings():
-                raise RuntimeError(f"{self.road.name}: {world.findings()}")
+                raise RuntimeError(f"{self.name}: {world.findings()}")
         return [line.split("\t", 3) for line in calls]
 
-    def suffer(self, fault):
+    def suffer(self, fault, outcomes):
         """Findings of one fault; None when it was never met."""
-        found = []
         with self.world() as world:
             self.begin(world)
-            under = ()
-            if fault.kind_of == SYSTEM:
-                when = f"{fault.index}{'+' if fault.forever else ''}"
-                effect = "signal=KILL" if fault.kind == KILL else f"error={errno.errorcode[fault.error]}"
-                under = ["strace", "-f", "-qq", "-o", INJECTED, "-e", f"trace={fault.name}",
-                         "-e", f"inject={fault.name}:{effect}:when={when}"]
-            else:
-                world.plan(kind_of=fault.kind_of, index=fault.index, forever=fault.forever, kind=fault.kind, error=fault.error)
-            command, options = self.road.command
-            job = world.begin(command, under=under, **options)
-            try:
-                job.running.wait(HANG)
-            except TimeoutError:
-                world.plan(active=0)
+            job, fired = self.run(world, fault)
+            if job.status is None:
                 return [f"hang: {job.output[-500:]}"]
-            fired, _ = world.faults()
-            if fault.kind_of == SYSTEM:
-                text = world.box.path(INJECTED).read_text("utf-8", "replace")
-                fired = "INJECTED" in text or "SIGKILL" in text
-            world.plan(active=0)
-            job.ended = time.monotonic()
             if not fired:
                 return None
             world.box.wait_quiet()
             job.killed = fault.kind == KILL and fault.kind_of != COMMAND
+            found = world.findings()
+            outcome = self.outcome(world, outcomes)
             if job.status == 0:
-                found += [f"success: {text}" for text in difference(self.first, picture(world), job.output)]
-            try:
-                self.repeat(world)
-            except TimeoutError as late:
-                return found + [f"hang: afterwards {late}"]
-            found += [f"after: {text}" for text in difference(self.second, picture(world))]
-            return found + world.findings()
+                found += [f"success: {text}" for text in difference(self.first, outcome.seen, job.output)]
+            return found + outcome.later
+
+    def run(self, world, fault):
+        """Runs the road's command with the fault. Gives the run, and whether the fault was met."""
+        under = ()
+        if fault.kind_of == SYSTEM:
+            when = f"{fault.index}{'+' if fault.forever else ''}"
+            effect = "signal=KILL" if fault.kind == KILL else f"error={errno.errorcode[fault.error]}"
+            under = ["strace", "-f", "-qq", "-o", INJECTED, "-e", f"trace={fault.name}",
+                     "-e", f"inject={fault.name}:{effect}:when={when}"]
+        else:
+            world.plan(kind_of=fault.kind_of, index=fault.index, forever=fault.forever, kind=fault.kind, error=fault.error)
+        command, options = self.road.command
+        job = world.begin(command, under=under, **options)
+        try:
+            job.running.wait(HANG)
+        except TimeoutError:
+            pass
+        fired, _ = world.faults()
+        world.plan(active=0)
+        job.ended = time.monotonic()
+        if fault.kind_of == SYSTEM:
+            injected = world.box.path(INJECTED)
+            text = injected.read_text("utf-8", "replace")
+            fired = "INJECTED" in text or "SIGKILL" in text
+            injected.unlink()
+        return job, fired
+
+    def outcome(self, world, outcomes):
+        """What the state is, and what the same command makes of it."""
+        state = world.lasting()
+        known = outcomes.of(self.name, state)
+        if known and not outcomes.due():
+            return known
+        seen, before = picture(world), world.findings()
+        later = []
+        try:
+            self.repeat(world)
+            later += [f"after: {text}" for text in difference(self.second, picture(world))]
+        except TimeoutError as late:
+            later += [f"hang: afterwards {late}"]
+        later += [text for text in world.findings() if text not in before]
+        if known and (seen, later) != (known.seen, known.later):
+            later += [f"unsteady: the same state ended otherwise before: {known.later}"]
+        outcome = Outcome(seen, later)
+        if not known:
+            outcomes.keep(self.name, state, outcome)
+        return outcome
 
 
-def possible(road, calls, dice):
-    """Every fault of a road."""
+def draw(seed, *words):
+    """A number that depends on these words alone, not on what was drawn before."""
+    return zlib.crc32("/".join(map(str, (seed, *words))).encode())
+
+
+def possible(road, calls, seed):
+    """Every fault of a road; the error of a failing call is drawn by the seed."""
     for kind_of, index, name, subject in calls:
         kind_of, index = int(kind_of), int(index)
 
@@ -224,24 +301,34 @@ def possible(road, calls, dice):
             yield fault(False, FAIL, ENOMEM)
             yield fault(True, FAIL, ENOMEM)
         else:
-            yield fault(False, FAIL, dice.choice([EIO, ENOSPC, EMFILE]))
-            yield fault(True, FAIL, dice.choice([EIO, ENOSPC, EMFILE]))
+            for forever in (False, True):
+                yield fault(forever, FAIL, ERRORS[draw(seed, road, kind_of, index, forever) % len(ERRORS)])
             yield fault(False, KILL)
+
+
+def walk_clean(name):
+    """A road's walk, and the calls on it."""
+    from pairs import beginning
+
+    road = ROADS[name]
+    walk = Walk(name, beginning(*road.furnish)[0])
+    return walk, walk.clean()
 
 
 class Faults:
     """All roads: their clean walks, and the list of what can fail."""
 
-    def __init__(self, only="", seed=1):
-        from pairs import beginning
+    def __init__(self, only="", seed=1, jobs=2):
+        names = [name for name in ROADS if only in ("", name)]
+        with multiprocessing.Pool(jobs) as pool:
+            walked = dict(zip(names, pool.map(walk_clean, names, chunksize=1)))
+        self.seed = seed
+        self.walks = {name: walk for name, (walk, _) in walked.items()}
+        self.all = [fault for name, (_, calls) in walked.items() for fault in possible(name, calls, seed)]
 
-        dice = random.Random(seed)
-        self.walks, self.all = {}, []
-        for name, road in ROADS.items():
-            if only and only != name:
-                continue
-            walk = self.walks[name] = Walk(road, beginning(*road.furnish))
-            self.all += possible(name, walk.clean(), dice)
+    def order(self, fault):
+        """Where a fault stands among all: the same in every run, whatever else is chosen."""
+        return draw(self.seed, fault.key())
 
     def system_calls(self, count, seed):
         """Faults below the C library, in the tool and in everything that it starts: the index-th of a kind in each."""
@@ -250,9 +337,9 @@ class Faults:
                       dice.choice([FAIL, FAIL, KILL]), dice.choice([EIO, ENOSPC, EMFILE, ENOMEM]),
                       dice.choice(SYSTEM_CALLS), "") for _ in range(count)]
 
-    def play(self, fault):
+    def play(self, fault, outcomes):
         """(kind of finding, text) for what is wrong and not settled."""
-        found = self.walks[fault.road].suffer(fault)
+        found = self.walks[fault.road].suffer(fault, outcomes)
         if found is None:
             return None
         return [text for text in found if not settled.reason(fault, text)]

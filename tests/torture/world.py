@@ -7,6 +7,7 @@ runs it, and every run of the tool says whose it is, so that what it does can be
     world.findings()                          what was wrong so far
 """
 
+import hashlib
 import os
 import pathlib
 import re
@@ -113,15 +114,18 @@ class World:
         for folder in ("/etc/NAS_CFG", "/usr/local/config", "/var/lock"):
             box.path(folder).mkdir(parents=True, exist_ok=True)
         box.environment["LD_PRELOAD"] = str(tools / "libtorture_shim.so")
-        self.sh("/bin/mount -t tmpfs sys /sys && mkdir -p /sys/block /sys/class/block /sys/class/iscsi_session")
+        self.real("world", "begin")
+
+    def real(self, *words, timeout=20, **environment):
+        """Runs a program without the shim; gives what it prints."""
+        done = self.box.run(words, env={"LD_PRELOAD": None, **environment}, timeout=timeout)
+        if done.status != 0:
+            raise RuntimeError(f"{shlex.join(words)}: {done}")
+        return done.stdout
 
     def sh(self, text, timeout=20):
         """Runs a shell text with the real commands."""
-        done = self.box.run(["/bin/sh", "-c", text], env={"LD_PRELOAD": None, "PATH": f"{self.box.build}/bin:{SYSTEM_PATH}"},
-                            timeout=timeout)
-        if done.status != 0:
-            raise RuntimeError(f"{text}: {done}")
-        return done.stdout
+        return self.real("/bin/sh", "-c", text, timeout=timeout, PATH=f"{self.box.build}/bin:{SYSTEM_PATH}")
 
     # --- the tree's daemon, as its unit runs it ---
 
@@ -181,9 +185,8 @@ class World:
     def snapshot(self):
         """The tree, the state and the mounts, to begin with in another world."""
         mounts = [word for point, sources in self.mounts().items() for word in (sources[-1], point)]
-        self.sh(f"ktreec -S {SOCKET} -D /tmp/snapshot.xml")
         flash = self.box.path(FLASH)
-        return (self.box.path("/tmp/snapshot.xml").read_bytes(), flash.read_bytes() if flash.exists() else None,
+        return (self.dump(), flash.read_bytes() if flash.exists() else None,
                 self.state_file.read_bytes(), mounts)
 
     def restore(self, snapshot):
@@ -193,16 +196,28 @@ class World:
         if flash is not None:
             self.box.write(FLASH, flash, 0o600)
         self.state_file.write_bytes(state)
-        done = self.box.run(["world", "restore", *mounts], env={"LD_PRELOAD": None})
-        if done.status != 0:
-            raise RuntimeError(f"the beginning was not put back: {done}")
+        self.real("world", "restore", *mounts)
         (self.box.root / "fake/world/log").unlink(missing_ok=True)
 
     def degrade(self, share):
         """The file system of a mounted volume turns read-only."""
-        done = self.box.run(["world", "degrade", f"/mnt/VV/{share}"], env={"LD_PRELOAD": None})
-        if done.status != 0:
-            raise RuntimeError(f"/mnt/VV/{share} was not turned read-only: {done}")
+        self.real("world", "degrade", f"/mnt/VV/{share}")
+
+    def dump(self):
+        """The whole tree, as its daemon writes it."""
+        self.real("ktreec", "-S", SOCKET, "-D", "/fake/now.xml")
+        return (self.box.root / "fake/now.xml").read_bytes()
+
+    def lasting(self):
+        """A digest of all that a later run may meet: equal ones end equally. Only while nothing runs but the tree's daemon."""
+        state = bytearray(self.state_file.read_bytes()[:FAULTS_AT])
+        for t in range(1, TARGETS + 1):
+            for l in range(LUNS):  # a writer that was killed stays noted, its number does not matter
+                opener = HEAD.size + t * TARGET_SIZE + TARGET.size + (l + 1) * LUN.size - 4
+                state[opener : opener + 4] = struct.pack("i", any(state[opener : opener + 4]))
+        processes = sorted(map(shlex.join, self.box.processes().values()))
+        parts = (bytes(state), self.dump(), self.real("world", "lasting").encode("utf-8", "surrogateescape"), repr(processes).encode())
+        return hashlib.sha256(b"".join(hashlib.sha256(part).digest() for part in parts)).hexdigest()
 
     # --- runs of the tool ---
 

@@ -3,9 +3,9 @@
  * usage: box SOCKET KEEP...
  * SOCKET is the number of an inherited SOCK_SEQPACKET socket; KEEP are folders that stay visible as they are
  * (the repository, the build). The box has mount, IPC, network, host name and process namespaces of its own;
- * its root is the machine's root with a layer in memory on top, so nothing that is done in it stays. /run,
- * /tmp, /mnt, /root and /dev start empty (/dev with the harmless devices), /sys/block shows no disk, and
- * /etc/mtab is there as on any booted system.
+ * its root is the machine's root with a layer in memory on top (seen in /fake/upper), so nothing that is done
+ * in it stays. /run, /tmp, /mnt, /root and /dev start empty (/dev with the harmless devices), /sys/block
+ * shows no disk, and /etc/mtab is there as on any booted system.
  *
  * First answer: "ready PID" (seen from outside), or "failed TEXT". Then a request is fields separated by NUL,
  *   run ID FOLDER ARGUMENTS-COUNT ARGUMENT... VARIABLE...   with three descriptors: the standard streams
@@ -87,6 +87,16 @@ static void make_devices(void) {
   must(mkdir("dev/shm", 01777), "dev/shm");
 }
 
+/* A look at the upper layer that changes nothing. */
+static int upper_layer(void) {
+  struct mount_attr read_only = {.attr_set = MOUNT_ATTR_RDONLY};
+  int upper = (int)syscall(SYS_open_tree, AT_FDCWD, "/tmp/upper", OPEN_TREE_CLONE | OPEN_TREE_CLOEXEC);
+  must(upper, "upper layer");
+  must((int)syscall(SYS_mount_setattr, upper, "", AT_EMPTY_PATH, &read_only, sizeof read_only),
+       "upper layer");
+  return upper;
+}
+
 /* The root's lower layer is one file system: what else is mounted below it is not in the box. */
 static void make_root(char** keep) {
   int kept[16];
@@ -99,6 +109,7 @@ static void make_root(char** keep) {
   }
   must(mount("tmpfs", "/tmp", "tmpfs", 0, "mode=755"), "memory");
   must(mkdir("/tmp/upper", 0755), "upper layer");
+  int upper = upper_layer();
   must(mkdir("/tmp/work", 0755), "work folder");
   must(mkdir("/tmp/root", 0755), "root");
   must(mount("overlay", "/tmp/root", "overlay", 0, "lowerdir=/,upperdir=/tmp/upper,workdir=/tmp/work"),
@@ -115,6 +126,9 @@ static void make_root(char** keep) {
   if (symlink("../proc/self/mounts", "etc/mtab") < 0 && errno != EEXIST) must(-1, "etc/mtab");
   make_devices();
   must(mkdir("fake", 0777), "fake");
+  must(mkdir("fake/upper", 0755), "fake/upper");
+  must((int)syscall(SYS_move_mount, upper, "", AT_FDCWD, "fake/upper", MOVE_MOUNT_F_EMPTY_PATH),
+       "fake/upper");
   for (int i = 0; i < count; i++) {
     char path[4096];
     snprintf(path, sizeof path, "/tmp/root%s", keep[i]);
