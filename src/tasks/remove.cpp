@@ -65,6 +65,11 @@ int _remove_lun(int dbidx, int lun_dbidx, Caller caller = Caller()) {
   return _delete_slot(dbidx, lun_dbidx, caller);
 }
 
+// The slot behind the last one is looked at once more: with the target go all of its LUNs.
+bool _has_at_most(int luns, int dbidx) {
+  return ktree_count_target_luns(dbidx) <= luns && has_no_further_lun(dbidx, luns);
+}
+
 }  // namespace
 
 int task_del() {
@@ -93,13 +98,13 @@ int task_del_lun() {
   } else {
     result = find_requested_lun(&dbidx, &lun_dbidx);
   }
-  if (result == kOk && ktree_count_target_luns(dbidx) <= 1) {
+  if (result == kOk && _has_at_most(1, dbidx)) {
     LOG(2, "removing target %s", request_target.target_name);
     target_gone = true;
     result = task_del();
   } else if (result == kOk) {
     result = _remove_lun(dbidx, lun_dbidx);
-    target_gone = result == kOk && ktree_count_target_luns(dbidx) == 0;
+    target_gone = result == kOk && _has_at_most(0, dbidx);
     if (target_gone) result = task_del();  // another run has removed the others meanwhile
   }
   if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);

@@ -62,6 +62,10 @@ bool tree_present(const char* key) {
   return tree_read(key, value);
 }
 
+bool tree_is_missing(const char* key, const char* present) {
+  return !tree_present(key) && tree_present(present) && !tree_present(key);
+}
+
 bool tree_is_loaded() {
   return tree_present(key::kVersion) || tree_present(key::kTargetCount);
 }

@@ -189,6 +189,12 @@ int ktree_count_target_luns(int dbidx) {
   return slot ? count_luns_at(slot.target()) : 0;
 }
 
+bool has_no_further_lun(int dbidx, int most) {
+  const HeldSlot slot(dbidx);
+  return !slot || tree_is_missing(KeyText(key::kLunNumber, slot.target(), most + 1),
+                                  KeyText(key::kTargetName, slot.target()));
+}
+
 int ktree_refresh_total_luncnt() {
   const SlotsHeld held;
   return tree_write_with_tries(key::kTotalLunCount, NumberText("%d", ktree_get_total_luncnt()));

@@ -15,21 +15,15 @@ namespace remvol {
 
 namespace {
 
-// A read that failed looks like a key that is missing: that counts when it is so twice, and another key of
-// the slot can be read in between.
-bool is_missing(const char* key, const char* present) {
-  return !tree_present(key) && tree_present(present) && !tree_present(key);
-}
-
 bool is_half_made_lun(int n, int m) {
   const KeyText number(key::kLunNumber, n, m);
-  return tree_present(number) && is_missing(KeyText(key::kLunShare, n, m), number);
+  return tree_present(number) && tree_is_missing(KeyText(key::kLunShare, n, m), number);
 }
 
 bool is_half_made_target(int n) {
   const KeyText name(key::kTargetName, n);
-  return tree_present(name) && is_missing(KeyText(key::kTargetIp, n), name) &&
-         is_missing(KeyText(key::kLunNumber, n, 1), name);
+  return tree_present(name) && tree_is_missing(KeyText(key::kTargetIp, n), name) &&
+         tree_is_missing(KeyText(key::kLunNumber, n, 1), name);
 }
 
 void drop(const char* path) {

@@ -202,6 +202,13 @@ class TestLun:
         assert (site.lun("share"), site.target("lun/count")) == ("a", "2")
         assert box.shell() == ["winshare_reload"]
 
+    @pytest.mark.parametrize("slot, skip", [(1, 0), (1, 1), (1, 2), (1, 3), (1, 4), (1, 5), (2, 0), (2, 1), (2, 2), (2, 3)])
+    def test_a_read_that_fails_deletes_no_other_lun(self, mounted, box, slot, skip):
+        box.hook("ktreec_get_wb", f"/iscsi/initiator/id:1/lun/id:{slot}/lun", ret=-1, skip=skip, times=1)
+        box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0")
+        assert {"y", "z"} <= {mounted.lun("share", n) for n in (1, 2, 3)}
+        assert mounted.logged_in("iqn.t1") and mounted.mounted("y") and mounted.mounted("z")
+
     def test_nothing_is_said_of_what_is_only_looked_at(self, site, box):
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
         site.debug(1)
