@@ -46,8 +46,8 @@ template <size_t N>
 // Returns whether `key` is present.
 [[nodiscard]] bool tree_present(const char* key);
 
-// Returns whether `key` is missing for certain. A read that failed looks like a missing key: it counts when it
-// is so twice, and `present`, a key that is there, can be read in between.
+// Returns whether `key` is missing for certain. A read that failed looks like a missing key: it counts when
+// it is so twice, and `present`, a key that is there, can be read in between.
 [[nodiscard]] bool tree_is_missing(const char* key, const char* present);
 
 // Returns whether the tree answers and was loaded: a read does not tell a missing key from a tree that is not

@@ -44,8 +44,8 @@ int ktree_get_total_luncnt();
 // Returns the number of LUNs of the target at `dbidx` up to its first empty slot; -1 for a dbidx below 1.
 int ktree_count_target_luns(int dbidx);
 
-// Returns whether the target in a slot has no LUN but the first `most`, for certain: one that could not be read
-// is not taken for one that is not there.
+// Returns whether the target in a slot has no LUN but the first `most`, for certain: one that could not be
+// read is not taken for one that is not there.
 [[nodiscard]] bool has_no_further_lun(int dbidx, int most);
 
 // Rewrites the count of LUNs over all targets. Returns 0 or -103.
