@@ -180,6 +180,11 @@ static int log_in(int t) {
     fprintf(stderr, "iscsiadm: default: 1 session requested, but 1 already present.\n");
     return 15;
   }
+  if (target->secrets != HAS_BOTH) {
+    fprintf(stderr,
+            "iscsiadm: initiator reported error (24 - iSCSI login failed due to authorization failure)\n");
+    return 24;
+  }
   target->online = 1;
   target->session = ++world->sessions;
   for (int l = 0; l < LUNS; l++) {
@@ -230,22 +235,36 @@ static int log_out_all(void) {
   return 0;
 }
 
+/* One of the record's secrets is set: another target's is a violation, an empty one does not let in. */
+static void set_secret(int t, int which, const char* what, const char* value) {
+  char wanted[64];
+  snprintf(wanted, sizeof wanted, which == HAS_USER ? "user%d" : "secret%dsecret%d", t, t);
+  int right = strcmp(value, wanted) == 0;
+  if (!right && value[0] != '\0') world_log("V", "foreign-value: %s %s for t%d", what, value, t);
+  world->targets[t].secrets &= ~which;
+  if (right) world->targets[t].secrets |= which;
+}
+
+static int update_record(int t, char** argv) {
+  const char* value = option(argv, "-v");
+  if (!world->targets[t].record) return 21;
+  if (value == NULL) return 7;
+  if (has(argv, "node.session.auth.username")) set_secret(t, HAS_USER, "user", value);
+  if (has(argv, "node.session.auth.password")) set_secret(t, HAS_SECRET, "secret", value);
+  return 0;
+}
+
 static int node_record(char** argv) {
   int t = target_number(argv);
   const char* operation = option(argv, "-o");
   struct run run = whose_run();
   if (t == 0) return 7;
   if (!covers(&run, t, run.lun)) world_log("V", "foreign-record: -o %s of t%d", operation, t);
-  if (strcmp(operation, "new") == 0) world->targets[t].record = 1;
-  if (strcmp(operation, "update") == 0) {
-    const char* value = option(argv, "-v");
-    char wanted[64];
-    snprintf(wanted, sizeof wanted, "user%d", t);
-    if (has(argv, "node.session.auth.username") && strcmp(value, wanted) != 0) {
-      world_log("V", "foreign-value: user %s for t%d", value, t);
-    }
-    return world->targets[t].record ? 0 : 21;
+  if (strcmp(operation, "new") == 0) {
+    world->targets[t].record = 1;
+    world->targets[t].secrets = 0;
   }
+  if (strcmp(operation, "update") == 0) return update_record(t, argv);
   if (strcmp(operation, "delete") != 0) return 0;
   if (world->targets[t].online) return 15;
   if (!world->targets[t].record) return 21;

@@ -45,7 +45,7 @@ static void node(const char* name, int partition) {
   mode_t mask = umask(0);
   snprintf(path, sizeof path, "/dev/%s%s", name, partition ? "1" : "");
   unlink(path);
-  mknod(path, S_IFBLK | 0660, makedev(DISK_MAJOR, (unsigned)((name[2] - 'a') * 16 + partition)));
+  mknod(path, S_IFBLK | 0660, makedev(DISK_MAJOR, DISK_NUMBER(name[2]) + (partition ? 1 : 0)));
   umask(mask);
 }
 
@@ -68,7 +68,7 @@ void sysfs_add(int target, int number, const struct lun* lun, int session) {
   snprintf(place, sizeof place, "/sys/devices/platform/host%d/session%d/target%d:0:0/%d:0:0:%d", session,
            session, session, session, number);
   put("running\n", "%s/state", place);
-  snprintf(text, sizeof text, "%d:%d\n", DISK_MAJOR, (name[2] - 'a') * 16);
+  snprintf(text, sizeof text, "%d:%u\n", DISK_MAJOR, DISK_NUMBER(name[2]));
   put(text, "%s/block/%s/dev", place, name);
   put("524288\n", "%s/block/%s/size", place, name);
   snprintf(text, sizeof text, "%s/block/%s/device", place, name);
@@ -91,7 +91,7 @@ void sysfs_add_partition(const struct lun* lun) {
   char text[64];
   char link[64];
   name_of(lun, name);
-  snprintf(text, sizeof text, "%d:%d\n", DISK_MAJOR, (name[2] - 'a') * 16 + 1);
+  snprintf(text, sizeof text, "%d:%u\n", DISK_MAJOR, DISK_NUMBER(name[2]) + 1);
   put(text, "/sys/block/%s/%s1/dev", name, name);
   put("1\n", "/sys/block/%s/%s1/partition", name, name);
   put("522240\n", "/sys/block/%s/%s1/size", name, name);

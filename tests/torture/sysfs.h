@@ -6,6 +6,9 @@
 
 enum { DISK_MAJOR = 250 }; /* one that no driver has */
 
+/* Of the disk with this letter; its partition has the next. */
+#define DISK_NUMBER(letter) ((unsigned)((letter) - 'a') * 16)
+
 void sysfs_add(int target, int number, const struct lun* lun, int session);
 
 /* A partition was made on the disk. */

@@ -14,6 +14,9 @@ enum content { CONTENT_NONE = 0, CONTENT_EXT4 = 1, CONTENT_TORN = 2 };
 
 #define NAME_BASE "iqn.2026-01.org.example:t"
 
+/* A target lets in who has both. */
+enum { HAS_USER = 1, HAS_SECRET = 2, HAS_BOTH = HAS_USER | HAS_SECRET };
+
 struct lun {
   int32_t offered;
   int32_t letter;  /* of the disk's name, 0 without a session */
@@ -27,7 +30,7 @@ struct target {
   int32_t online;
   int32_t record; /* a node record is there */
   int32_t session;
-  int32_t reserved;
+  int32_t secrets;       /* the record's: HAS_USER, HAS_SECRET */
   struct lun luns[LUNS]; /* by LUN number */
 };
 
