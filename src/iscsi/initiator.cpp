@@ -179,7 +179,7 @@ int task_init() {
 int task_deinit(int system_off) {
   LOG(2, system_off != 0 ? "system off" : "deinit start");
   Target_umount_all();
-  if (unmount_session_volumes(nullptr)) run_command(kLogoutAllCommand);
+  close_sessions(nullptr, kLogoutAllCommand);
   LOG(1, "killall -SIGTERM iscsid ");
   bool succeeded = run_command("killall -SIGTERM iscsid") == 0;
   LOG(2, "deinit end");

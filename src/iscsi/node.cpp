@@ -13,6 +13,7 @@
 #include "iscsi/session_check.h"
 #include "support/command.h"
 #include "support/result.h"
+#include "support/session_hold.h"
 #include "support/target_hold.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -58,8 +59,7 @@ int _target_chap_apply(TargetEntry* entry) {
 }
 
 int log_out(const TargetEntry* entry, Caller caller) {
-  if (!unmount_session_volumes(entry->target_name, caller)) return 1;
-  return run_command(logout_command(*entry), caller) == 0 ? 0 : 1;
+  return close_sessions(entry->target_name, logout_command(*entry), caller);
 }
 
 // Reads the output of a login until it says that a session to this node is already open.
@@ -69,6 +69,24 @@ bool login_found_session(FILE* output) {
     if (strstr(line, kAlreadyExists) != nullptr) return true;
   }
   return false;
+}
+
+// Starts the login and reads its output. Returns whether a session was there already.
+bool log_in(const char* command, FILE** output) {
+  const LoginUnderWay under_way;
+  *output = popen(command, "r");
+  return *output != nullptr && login_found_session(*output);
+}
+
+void close_own_session(const TargetEntry& entry, Caller caller) {
+  const SessionClosing closing(entry.target_name);
+  run_command(portal_logout_command(entry), caller);
+}
+
+void log_in_again(const TargetEntry& entry, Caller caller = Caller()) {
+  close_own_session(entry, caller);
+  const LoginUnderWay under_way;
+  run_command(login_again_command(entry), caller);
 }
 
 // Names the requested target, not `name`: at start-up there is none. Returns whether the session is there.
@@ -82,12 +100,9 @@ int _target_connect_run(const TargetEntry& entry) {
   if (entry.port < kMinPort || entry.port > kMaxPort) return kFailed;
   const CommandText login = login_command(entry);
   LOG(1, "try to login - cmd: %s \n", login.c_str());
-  FILE* output = popen(login, "r");
+  FILE* output = nullptr;
+  if (log_in(login, &output)) log_in_again(entry);
   if (output == nullptr) return 1;
-  if (login_found_session(output)) {
-    run_command(portal_logout_command(entry));
-    run_command(login_again_command(entry));
-  }
   pclose(output);
   return confirm_login(entry.target_name, Caller()) ? 0 : 1;
 }

@@ -14,6 +14,9 @@ namespace remvol {
 
 namespace {
 
+constexpr int kPollsPerSecond = 50;
+constexpr useconds_t kPoll = 1'000'000 / kPollsPerSecond;
+
 int operation_of(LockMode mode) {
   return mode == LockMode::kShared ? LOCK_SH : LOCK_EX;
 }
@@ -57,6 +60,15 @@ LockTry RunLock::take(const char* name, LockMode mode) {
 
 LockTry RunLock::try_take(const char* name, LockMode mode) {
   return open_and_lock(name, O_CREAT, operation_of(mode) | LOCK_NB);
+}
+
+LockTry RunLock::take_in_time(const char* name, LockMode mode, int seconds) {
+  LockTry tried = try_take(name, mode);
+  for (int polls = 0; tried == LockTry::kBusy && polls < seconds * kPollsPerSecond; polls++) {
+    usleep(kPoll);
+    tried = try_take(name, mode);
+  }
+  return tried;
 }
 
 LockTry RunLock::try_existing(const char* name, LockMode mode) {

@@ -38,6 +38,9 @@ class RunLock {
   // The same without waiting.
   [[nodiscard]] LockTry try_take(const char* name, LockMode mode);
 
+  // The same as take, but waits `seconds` at most: kBusy when it is not had by then.
+  LockTry take_in_time(const char* name, LockMode mode, int seconds);
+
   // The same for a lock that some run has taken before: without one, kNone, and none is made.
   [[nodiscard]] LockTry try_existing(const char* name, LockMode mode);
 

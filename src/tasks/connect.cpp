@@ -7,7 +7,6 @@
 #include "iscsi/iscsiadm.h"
 #include "iscsi/node.h"
 #include "iscsi/session.h"
-#include "support/command.h"
 #include "support/result.h"
 #include "support/target_hold.h"
 #include "tree/entry.h"
@@ -85,8 +84,7 @@ int _disconnect_all(Caller caller = Caller()) {
   LOG_AT(caller, 1, "update share folder status");
   reload_share_services();
   LOG_AT(caller, 1, "finish share folder status");
-  if (!unmount_session_volumes(nullptr, caller)) return 1;
-  return run_command(kLogoutAllCommand, caller) == 0 ? kOk : 1;
+  return close_sessions(nullptr, kLogoutAllCommand, caller);
 }
 
 int _disconnect_requested() {

@@ -51,6 +51,26 @@ bool read_lun(const char* path, long long* lun) {
   return sscanf(strrchr(path, '/'), "/%*u:%*u:%*u:%lld", lun) == 1;
 }
 
+// The disk that this run was last told to be its entry's own.
+struct OwnDisk {
+  Text<256> disk;
+  char target_name[sizeof TargetEntry::target_name];
+  int lun;
+};
+
+OwnDisk own_disk;
+
+void remember_own_disk(const TargetEntry* entry, const char* node) {
+  own_disk.disk = disk_of_node(node);
+  copy_text(own_disk.target_name, entry->target_name);
+  own_disk.lun = entry->lun;
+}
+
+bool was_own_disk(const TargetEntry* entry, const char* node) {
+  return strcmp(own_disk.disk, disk_of_node(node)) == 0 &&
+         strcmp(own_disk.target_name, entry->target_name) == 0 && own_disk.lun == entry->lun;
+}
+
 }  // namespace
 
 DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
@@ -73,8 +93,14 @@ bool is_session_disk(const char* node, const char* target_name) {
   return read_target_name(path, session_end, name) && strcmp(name, target_name) == 0;
 }
 
+bool has_disk(const char* node) {
+  return check_path_exist(Text<512>("/sys/block/%s", disk_of_node(node).c_str())) == 0;
+}
+
 bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller) {
-  if (disk_owner(entry, node) != kDiskForeign) return false;
+  const DiskOwner owner = disk_owner(entry, node);
+  if (owner == kDiskOurs) remember_own_disk(entry, node);
+  if (owner == kDiskOurs || (owner == kDiskUnknown && !was_own_disk(entry, node))) return false;
   LOG_AT(caller, 0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun,
          entry->target_name);
   return true;

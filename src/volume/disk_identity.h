@@ -22,8 +22,13 @@ DiskOwner disk_owner(const TargetEntry* entry, const char* node);
 // that is null.
 bool is_session_disk(const char* node, const char* target_name);
 
+// Returns whether sysfs has a disk of `node`, whosever it is.
+bool has_disk(const char* node);
+
 // Returns whether the disk of `node` is known to be another one than the entry's; then nothing that changes
-// it or ends its users may be done. That is logged at level 0 in the caller's name.
+// it or ends its users may be done. That is logged at level 0 in the caller's name. A disk that this run has
+// seen to be the entry's and that sysfs knows nothing of any more counts as another one: its session was
+// closed meanwhile, and the name may be given anew at any moment.
 bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller = Caller());
 
 }  // namespace remvol

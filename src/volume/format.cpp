@@ -1,5 +1,6 @@
 #include "volume/format.h"
 
+#include <poll.h>
 #include <unistd.h>
 
 #include <cstdio>
@@ -7,6 +8,7 @@
 
 #include "frontend/log.h"
 #include "support/format_semaphore.h"
+#include "support/session_hold.h"
 #include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -21,6 +23,7 @@ namespace remvol {
 namespace {
 
 constexpr int kStartTries = 3;
+constexpr int kFirstWordMs = 5000;  // of mke2fs, at most
 constexpr int kRefused = -1;
 constexpr int kNotWritable = -2;
 constexpr int kNotStarted = -3;
@@ -138,6 +141,37 @@ bool may_overwrite(const TargetEntry* entry, const char* partition, Caller calle
   return false;
 }
 
+// Ends everybody else on the partition. Returns 0 or kRefused.
+int end_users(const TargetEntry* entry, const char* partition, Caller caller) {
+  const SessionKept kept(entry->target_name);
+  wait_for_udev(partition);
+  if (is_foreign_disk(entry, partition, caller)) return kRefused;
+  System("%s", shell_command("fuser -mk \"%s\"", partition).c_str());
+  return 0;
+}
+
+// Returns 0, kRefused or kNotWritable.
+int wipe_beginning(const TargetEntry* entry, const char* partition, Caller caller) {
+  const SessionKept kept(entry->target_name);
+  if (!may_overwrite(entry, partition, caller)) return kRefused;
+  if (System("%s", shell_command("dd if=/dev/zero of=%s bs=1M count=1", partition).c_str()) == 0) return 0;
+  LOG_AT(caller, 1, "dd %s failed, this device is not able to write.", partition);
+  return kNotWritable;
+}
+
+// Starts mke2fs and waits until it has opened the disk: before that it says nothing. From then on the disk's
+// name can go to no other. Returns 0, kRefused or kNotStarted.
+int begin_making(const TargetEntry* entry, FsName& fs_type, const char* partition, FILE** output,
+                 Caller caller) {
+  const SessionKept kept(entry->target_name);
+  if (!may_overwrite(entry, partition, caller)) return kRefused;
+  *output = start_mke2fs(fs_type, partition, caller);
+  if (*output == nullptr) return kNotStarted;
+  pollfd said = {fileno(*output), POLLIN, 0};
+  if (said.fd >= 0) poll(&said, 1, kFirstWordMs);
+  return 0;
+}
+
 // Makes the file system, everybody else on the partition ended and its beginning wiped before. Returns 0,
 // kRefused, kNotWritable, or kNotStarted.
 int make_file_system(TargetEntry* entry, const char* partition, Caller caller = Caller()) {
@@ -145,19 +179,16 @@ int make_file_system(TargetEntry* entry, const char* partition, Caller caller = 
   note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0), caller);
   note_update(ktree_update_lun_status(entry, 1), caller);
   LOG_AT(caller, 2, "format partition %s", partition);
-  wait_for_udev(partition);
-  System("%s", shell_command("fuser -mk \"%s\"", partition).c_str());
+  int result = end_users(entry, partition, caller);
+  if (result != 0) return result;
   FsName fs_type;
   choose_fs(fs_type, partition, caller);
-  if (!may_overwrite(entry, partition, caller)) return kRefused;
-  if (System("%s", shell_command("dd if=/dev/zero of=%s bs=1M count=1", partition).c_str()) != 0) {
-    LOG_AT(caller, 1, "dd %s failed, this device is not able to write.", partition);
-    return kNotWritable;
-  }
+  result = wipe_beginning(entry, partition, caller);
+  if (result != 0) return result;
   sleep(1);
-  if (!may_overwrite(entry, partition, caller)) return kRefused;
-  FILE* output = start_mke2fs(fs_type, partition, caller);
-  if (output == nullptr) return kNotStarted;
+  FILE* output = nullptr;
+  result = begin_making(entry, fs_type, partition, &output, caller);
+  if (result != 0) return result;
   follow_mke2fs(output, entry, partition, caller);
   return 0;
 }

@@ -10,6 +10,7 @@
 
 #include "frontend/log.h"
 #include "support/result.h"
+#include "support/session_hold.h"
 #include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -19,6 +20,7 @@
 #include "tree/status_text.h"
 #include "volume/bare_folder.h"
 #include "volume/degrade.h"
+#include "volume/disk_identity.h"
 #include "volume/format.h"
 #include "volume/mount_command.h"
 #include "volume/mount_point.h"
@@ -198,7 +200,7 @@ int prepare_file_system(Volume* volume, Caller caller = Caller()) {
   return found ? kOk : kFailed;
 }
 
-int make_mount_point(Volume* volume, Caller caller = Caller()) {
+int make_mount_point(const Volume* volume, Caller caller = Caller()) {
   const CommandText command = command_on_path("mkdir -p", volume->mount_point);
   LOG_AT(caller, 1, "cmd = %s", command.c_str());
   make_bare_folder(volume->mount_point);
@@ -272,6 +274,18 @@ int keep_standing(const Volume* volume, Caller caller = Caller()) {
   return record_read_only(volume, caller);
 }
 
+// Mounts the file system and records what became of that. No other run closes the session meanwhile, or
+// removes the mount point.
+int put_in_place(const Volume* volume, Caller caller = Caller()) {
+  const SessionKept kept(volume->entry->target_name);
+  const MountPointHold hold(volume->mount_point);
+  if (is_foreign_disk(volume->entry, volume->node, caller)) return kMountTooSmall;
+  int result = make_mount_point(volume, caller);
+  if (result == kOk) result = mount_file_system(volume, caller);
+  if (result == kOk) result = record_outcome(volume, caller);
+  return result;
+}
+
 // Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.
 int bring_up(Volume* volume, Caller caller = Caller()) {
   int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format, caller);
@@ -281,9 +295,7 @@ int bring_up(Volume* volume, Caller caller = Caller()) {
   if (result == kOk) result = pick_partition(volume);
   if (result == kOk) result = prepare_file_system(volume, caller);
   if (result == kOk && is_standing(volume)) return keep_standing(volume, caller);  // another run was quicker
-  if (result == kOk) result = make_mount_point(volume, caller);
-  if (result == kOk) result = mount_file_system(volume, caller);
-  if (result == kOk) result = record_outcome(volume, caller);
+  if (result == kOk) result = put_in_place(volume, caller);
   return result;
 }
 

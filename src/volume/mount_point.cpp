@@ -17,6 +17,7 @@ namespace remvol {
 namespace {
 
 constexpr int kMaxLayers = 32;
+constexpr int kLongestHold = 60;  // seconds
 
 // Writes out what the file system mounted on `path` holds. A path that cannot be opened is left to the
 // kernel, which syncs a detached file system when its last user ends.
@@ -69,6 +70,10 @@ bool has_link_below_root(const char* path) {
 }
 
 }  // namespace
+
+MountPointHold::MountPointHold(const char* path) {
+  lock_.take_in_time(hashed_lock_name("volume", path), LockMode::kExclusive, kLongestHold);
+}
 
 MountPointText mount_point_of(const char* share) {
   return MountPointText("%s%s", kMountRoot, share);

@@ -4,6 +4,7 @@
 #define REMVOL_VOLUME_MOUNT_POINT_H
 
 #include "frontend/log.h"
+#include "support/run_lock.h"
 #include "support/text.h"
 #include "volume/mount_table.h"
 
@@ -13,6 +14,16 @@ inline constexpr char kMountRoot[] = "/mnt/VV/";
 
 // The mount root and a share name.
 using MountPointText = Text<sizeof kMountRoot + 128>;
+
+// Mounting there, unmounting and removing it, one run after another; one that does not come to an end is
+// waited for a minute.
+class MountPointHold {
+ public:
+  explicit MountPointHold(const char* path);
+
+ private:
+  RunLock lock_;
+};
 
 // Returns the mount point of the share.
 MountPointText mount_point_of(const char* share);

@@ -10,7 +10,7 @@ enum MountResult : int {
   kMountNoMountPoint = -4,  // the mount point could not be made, or would lie outside "/mnt/VV/"
   kMountUnsupported = -6,   // not a file system that can be mounted; volume state 5 is recorded
   kMountReadOnly = -7,      // mounted but not writable; VOL_AC_RO is recorded, no share service is reloaded
-  kMountTooSmall = -8,      // a disk of 1 MiB or less counts as offline
+  kMountTooSmall = -8,      // a disk of 1 MiB or less, or of another LUN by now: the LUN is offline
 };
 
 }  // namespace remvol

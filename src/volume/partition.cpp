@@ -5,6 +5,7 @@
 
 #include "frontend/log.h"
 #include "support/files.h"
+#include "support/session_hold.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/state.h"
@@ -29,6 +30,7 @@ bool create_partition(const TargetEntry* entry, const char* device, Caller calle
   LOG_AT(caller, 2, "No partitions found on %s, try to create partition...", device);
   ktree_update_volume_state(entry, kVolumeCreating);
   LOG_AT(caller, 2, "Creating partition on %s", device);
+  const SessionKept kept(entry->target_name);
   if (is_foreign_disk(entry, device, caller) || sys_create_1_partition(device) != 0) {
     LOG_AT(caller, 0, "Create partition FAILED");
     ktree_update_volume_state(entry, kVolumeFailed);
@@ -45,6 +47,7 @@ void expand_partition(const TargetEntry* entry, const char* device, Caller calle
   LOG_AT(caller, 2, "%s, try to expand partition...", device);
   LOG_AT(caller, 2, "Expanding partition on %s", device);
   ktree_update_volume_state(entry, kVolumeCreating);
+  const SessionKept kept(entry->target_name);
   if (is_foreign_disk(entry, device, caller) || sys_expand_1_partition(device) != 0) {
     LOG_AT(caller, 0, "Expand partition FAILED");
     return;

@@ -2,6 +2,8 @@
 
 #include <cstring>
 
+#include "support/command.h"
+#include "support/session_hold.h"
 #include "support/text.h"
 #include "tree/record.h"
 #include "volume/disk_identity.h"
@@ -24,13 +26,7 @@ bool find_session_volume(const char* target_name, MountLine* mount) {
   return find_mount(is_session_volume, target_name, mount) == Mounted::yes;
 }
 
-}  // namespace
-
-bool has_session_volume(const char* target_name) {
-  MountLine mount;
-  return find_session_volume(target_name, &mount);
-}
-
+// Returns whether none is left.
 bool unmount_session_volumes(const char* target_name, Caller caller) {
   MountLine mount;
   for (int volumes = 0; find_session_volume(target_name, &mount); volumes++) {
@@ -42,6 +38,19 @@ bool unmount_session_volumes(const char* target_name, Caller caller) {
     return false;
   }
   return true;
+}
+
+}  // namespace
+
+bool has_session_volume(const char* target_name) {
+  MountLine mount;
+  return find_session_volume(target_name, &mount);
+}
+
+int close_sessions(const char* target_name, const char* logout, Caller caller) {
+  const SessionClosing closing(target_name);
+  if (!unmount_session_volumes(target_name, caller)) return 1;
+  return run_command(logout, caller) == 0 ? 0 : 1;
 }
 
 }  // namespace remvol

@@ -11,9 +11,11 @@ namespace remvol {
 // target when it is null. Where the kernel's tables cannot be read there is none.
 [[nodiscard]] bool has_session_volume(const char* target_name);
 
-// Unmounts those volumes: what the tree does not know, or another run has mounted meanwhile. Returns whether
-// none is left; one that is is logged at level 0 in the caller's name.
-[[nodiscard]] bool unmount_session_volumes(const char* target_name, Caller caller = Caller());
+// Closes the target's session, or all for null, by the command `logout`. Volumes that are mounted still,
+// since the tree does not know them or another run has mounted them meanwhile, are unmounted before; no run
+// mounts one until the command has ended. Returns 0; or 1 when the command failed, or a volume stays mounted,
+// which is logged at level 0 in the caller's name: then the command does not run.
+int close_sessions(const char* target_name, const char* logout, Caller caller = Caller());
 
 }  // namespace remvol
 

@@ -11,7 +11,7 @@
 #include "support/command.h"
 #include "support/files.h"
 #include "support/result.h"
-#include "support/run_lock.h"
+#include "support/session_hold.h"
 #include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -36,10 +36,14 @@ constexpr char kProcMounts[] = "/proc/mounts";
 constexpr char kPublicFtp[] = "/home/Public";
 constexpr size_t kFtpPathSize = 512;
 
-// Ends the users of the node that was mounted, unless its name belongs to another disk by now.
+// Ends the users of the node that was mounted, unless its name belongs to another disk by now. A name that is
+// no disk's becomes none's until then.
 void kill_node_users(const TargetEntry* entry, Caller caller = Caller()) {
-  if (is_foreign_disk(entry, entry->mnt_dev, caller)) return;
+  const SessionKept kept(entry->target_name);
   wait_for_udev(entry->mnt_dev);
+  LoginsHeldOff logins;
+  if (!has_disk(entry->mnt_dev)) logins.begin();
+  if (is_foreign_disk(entry, entry->mnt_dev, caller)) return;
   System("%s", command_on_node("fuser -mk", entry->mnt_dev).c_str());
 }
 
@@ -104,10 +108,9 @@ int Target_LUN_umount(const TargetEntry* entry) {
   }
   kill_node_users(entry);
   const MountPointText mount_point = mount_point_of(entry->share);
-  // One run after another: between the look and the kill another one could unmount, and the kill would then
-  // hit the users of the system's own disk.
-  RunLock lock;
-  lock.take(hashed_lock_name("volume", mount_point), LockMode::kExclusive);
+  // Between the look and the kill another run could unmount, and the kill would then hit the users of the
+  // system's own disk; between the look and the removal another run could mount.
+  const MountPointHold hold(mount_point);
   if (check_path_exist(mount_point) != 0) return kOk;
   if (sys_mount_point(mount_point) != 0) {
     remount_mnt_path(mount_point, 0);

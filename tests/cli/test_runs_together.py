@@ -33,6 +33,28 @@ def until(condition, seconds=10):
         time.sleep(0.02)
 
 
+def meet(box, function, what):
+    """The next run that comes to the call waits there until go_on(); sleeps take some time from now on."""
+    box.sleep_takes(10)
+    passed_on = function != "sys_create_1_partition"
+    box.hook(function, what, through=passed_on, times=1, effect="touch /root/there; until [ -e /root/go ]; do sleep 0.02; done")
+
+
+def is_there(box):
+    return box.path("/root/there").exists()
+
+
+def go_on(box):
+    box.path("/root/go").touch()
+
+
+def comes_true(condition, seconds=0.7):
+    end = time.monotonic() + seconds
+    while not condition() and time.monotonic() < end:
+        time.sleep(0.02)
+    return condition()
+
+
 def held(box, lock):
     """Shell text that says whether the lock is held: "1" in /root/held."""
     return f"flock -n /run/remvol/{lock} true; echo $? >/root/held"
@@ -284,6 +306,101 @@ class TestASessionUnderAVolume:
         assert "the session of target iqn.t1 stays, a volume is mounted from it" in said
         assert unknown.logged_in("iqn.t1") and unknown.target("conn_set") == "1"
         assert unknown.mounted("unknown")
+
+
+class TestTakingEverythingAway:
+    """It holds no target: what it closes and removes, another run may bring up in the same moment."""
+
+    @pytest.mark.parametrize("command", ["--disconnect", "--deinit", "--system_off"])
+    def test_nothing_is_mounted_while_the_sessions_are_closed(self, stored, box, command):
+        box.default("killall")
+        box.default("rmmod")
+        stored.log_in("iqn.t1")
+        meet(box, "system", "iscsiadm -m node -u")
+        everything = box.start(["remvol", command])
+        until(lambda: is_there(box))
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t1"])
+        mounted = comes_true(lambda: stored.mounted("a"))
+        go_on(box)
+        everything.wait()
+        connect.wait()
+        assert not mounted
+
+    def test_nothing_is_mounted_where_a_mount_point_is_removed(self, stored, box):
+        stored.log_in("iqn.t1")
+        stored.mount("sdb", "/mnt/VV/a")
+        meet(box, "system", 'rm -rf "/mnt/VV/a"')
+        everything = box.start(["remvol", "--disconnect"])
+        until(lambda: is_there(box))
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t1"])
+        mounted = comes_true(lambda: stored.mounted("a"))
+        go_on(box)
+        everything.wait()
+        connect.wait()
+        assert not mounted
+
+    @pytest.mark.parametrize("function, what", [
+        ("sys_create_1_partition", "/dev/sdb"), ("system", "fuser -mk /dev/sdb1"),
+        ("system", 'fuser -mk "/dev/sdb1"'), ("system", "dd if=/dev/zero of=/dev/sdb1 bs=1M count=1"),
+        ("popen", re.compile("mke2fs.* /dev/sdb1$")), ("system", MOUNT)])
+    def test_no_session_is_closed_between_the_look_at_its_disk_and_what_is_done_to_it(self, stored, box, function, what):
+        stored.log_in("iqn.t1")
+        box.tree.set({f"{INITIATOR}/id:1/lun/id:1/dev": "sdb", f"{INITIATOR}/id:1/lun/id:1/mnt_dev": "/dev/sdb1"})
+        box.hook("sys_get_partition_list", "/dev/sdb", ret=0, times=1, first=True)
+        meet(box, function, what)
+        box.hook("sys_create_1_partition", "/dev/sdb")
+        box.fake("dd")
+        box.fake("mke2fs")
+        format_ = box.start(["remvol", "--format", "-n", "iqn.t1", "-l", "0"])
+        until(lambda: is_there(box))
+        everything = box.start(["remvol", "--disconnect"])
+        closed = comes_true(lambda: not stored.logged_in("iqn.t1"))
+        go_on(box)
+        format_.wait()
+        everything.wait()
+        assert not closed and not stored.logged_in("iqn.t1")
+
+    def test_no_target_is_logged_in_while_the_users_of_a_name_that_is_nobodys_are_ended(self, stored, box):
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/mnt_dev", "/dev/sdb1")
+        stored.store("iqn.t2", slot=2)
+        stored.offer("iqn.t2", {0: "sdb"})  # the lowest name that is free
+        meet(box, "system", "fuser -mk /dev/sdb1")
+        disconnect = box.start(["remvol", "--disconnect", "-n", "iqn.t1"])
+        until(lambda: is_there(box))
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t2"])
+        came = comes_true(lambda: stored.logged_in("iqn.t2"))
+        go_on(box)
+        disconnect.wait()
+        connect.wait()
+        assert not came
+
+    def test_the_users_of_a_name_that_is_nobodys_are_ended_when_a_login_has_ended(self, stored, box):
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/mnt_dev", "/dev/sdb1")
+        stored.store("iqn.t2", slot=2)
+        stored.offer("iqn.t2", {0: "sdb"})
+        meet(box, "popen", re.compile("^iscsiadm -m node -T iqn.t2 .*--login$"))
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t2"])
+        until(lambda: is_there(box))
+        disconnect = box.start(["remvol", "--disconnect", "-n", "iqn.t1"])
+        ended = comes_true(lambda: "fuser -mk /dev/sdb1" in box.shell())
+        box.session_disk("sdb", "iqn.t2")
+        go_on(box)
+        connect.wait()
+        assert "/dev/sdb1 is not the disk of LUN 0 of iqn.t1, it is left alone" in messages(disconnect.wait())
+        assert not ended and "fuser -mk /dev/sdb1" not in box.shell()
+
+    def test_a_session_is_closed_beside_another_targets_work(self, stored, box):
+        stored.log_in("iqn.t1")
+        stored.store("iqn.t2", slot=2, luns=[("b", 0)])
+        stored.offer("iqn.t2", {0: "sdc"})
+        stored.disk("sdc")
+        meet(box, "system", re.compile("^mount -t ext4 /dev/sdb1 "))
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t1"])
+        until(lambda: is_there(box))
+        assert box.remvol("--connect", "-n", "iqn.t2").status == 0
+        assert box.remvol("--disconnect", "-n", "iqn.t2").status == 0
+        go_on(box)
+        assert connect.wait().status == 0
 
 
 class TestATreeThatIsStartedAnew:

@@ -47,6 +47,9 @@ def volume(site, box):
     return site
 
 
+GOES = "rm /sys/block/sdb/device"  # shell text: the disk is gone, and its name another one's any moment
+
+
 def ran(box, *words):
     return [line for line in box.shell() if any(word in line for word in words)]
 
@@ -112,19 +115,32 @@ class TestNamesThatMoved:
         drive(box, "mount", 1, 1, 0, 0)
         assert not box.trace(call)
 
-    @pytest.mark.parametrize("step, reached", [("semop", []), ("fuser", ["fuser"]), ("dd", ["fuser", "dd"])])
-    def test_a_disk_that_moves_away_during_a_format(self, volume, box, step, reached):
+    @pytest.mark.parametrize("step, reached, change", [
+        ("semop", [], turns_into_another()), ("fuser", ["fuser"], turns_into_another()), ("dd", ["fuser", "dd"], turns_into_another()),
+        ("fuser", ["fuser"], GOES), ("dd", ["fuser", "dd"], GOES)])
+    def test_a_disk_that_moves_away_during_a_format(self, volume, box, step, reached, change):
         box.session_disk("sdb", "iqn.t1")
         if step == "semop":
-            box.hook("semop", re.compile("^-1"), through=True, effect=turns_into_another())
+            box.hook("semop", re.compile("^-1"), through=True, effect=change)
         else:
-            box.fake(step, effect=turns_into_another(), first=True)
+            box.fake(step, effect=change, first=True)
         done = drive(box, "format", 1, 1, "/dev/sdb1")
         assert done.result == -1
         assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
         assert [line.split()[0] for line in ran(box, "fuser", "dd if", "mke2fs")] == reached
         assert volume.lun("format_state") == "3"
         assert box.run(["cat", "/proc/sysvipc/sem"]).lines[1:] == [], "the semaphore is left"
+
+
+    @pytest.mark.parametrize("change", [turns_into_another(), GOES])
+    def test_a_disk_that_moves_away_before_the_mount_is_not_mounted(self, volume, box, change):
+        box.run(["umount", "/mnt/VV/data"], env={"LD_PRELOAD": None, "PATH": "/bin:/usr/bin"})
+        box.session_disk("sdb", "iqn.t1")
+        box.hook("sys_check_fs_state", "/dev/sdb1", effect=change, first=True)
+        done = box.remvol("--connect", "-n", "iqn.t1")
+        assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
+        assert not ran(box, "mkdir", "mount -t")
+        assert (done.status, volume.lun("volume_state")) == (0, "2")
 
 
 def while_waiting(box, effect):

@@ -11,6 +11,7 @@
 #include <functional>
 
 #include "support/run_lock.h"
+#include "support/session_hold.h"
 #include "support/target_hold.h"
 #include "support/temp_file.h"
 #include "tree/slots.h"
@@ -235,6 +236,73 @@ TEST_F(RunLocks, RunsShareTheirUseOfTheSlotsAndOneAloneChangesThem) {
     EXPECT_FALSE(another_run_can(SlotsHeld::kUse));
   }
   EXPECT_TRUE(another_run_can(SlotsHeld::kChange));
+}
+
+TEST_F(RunLocks, ASessionIsKeptByAsManyAsNeedItAndClosedBesideAnother) {
+  start_run([] {
+    const SessionKept kept("iqn.t1");
+    stay();
+  });
+  { const SessionKept kept("iqn.t1"); }
+  { const SessionClosing closing("iqn.t2"); }
+  EXPECT_TRUE(fakes::calls().empty()) << "nothing was waited for";
+}
+
+TEST_F(RunLocks, ASessionThatIsKeptIsNotClosedBeforeAMinute) {
+  start_run([] {
+    const SessionKept kept("iqn.t1");
+    stay();
+  });
+  { const SessionClosing closing("iqn.t1"); }
+  EXPECT_EQ(fakes::calls(), Texts(3000, "usleep 20000"));
+  { const SessionClosing closing(nullptr); }
+  EXPECT_EQ(fakes::calls().size(), 6000U);
+}
+
+TEST_F(RunLocks, WhileSessionsAreClosedNoneIsKept) {
+  start_run([] {
+    const SessionClosing closing(nullptr);
+    stay();
+  });
+  { const SessionKept kept("iqn.t1"); }
+  EXPECT_FALSE(fakes::calls().empty());
+}
+
+TEST_F(RunLocks, WhoClosesASessionMayUseItsDisks) {
+  const SessionClosing closing("iqn.t1");
+  { const SessionKept kept("iqn.t1"); }
+  EXPECT_TRUE(fakes::calls().empty());
+  const pid_t other = fork();
+  if (other == 0) {
+    RunLock lock;
+    const LockName name = hashed_lock_name("session", "iqn.t1");
+    _exit(lock.try_take(name, LockMode::kShared) == LockTry::kBusy ? 0 : 1);
+  }
+  int status = -1;
+  waitpid(other, &status, 0);
+  EXPECT_EQ(status, 0) << "still closed to others";
+}
+
+TEST_F(RunLocks, LoginsGoOnSideBySideAndAreWaitedForSomeSeconds) {
+  start_run([] {
+    const LoginUnderWay login;
+    stay();
+  });
+  { const LoginUnderWay login; }
+  EXPECT_TRUE(fakes::calls().empty());
+  LoginsHeldOff logins;
+  logins.begin();
+  EXPECT_EQ(fakes::calls(), Texts(250, "usleep 20000"));
+}
+
+TEST_F(RunLocks, LoginsThatAreHeldOffWait) {
+  start_run([] {
+    LoginsHeldOff logins;
+    logins.begin();
+    stay();
+  });
+  { const LoginUnderWay login; }
+  EXPECT_EQ(fakes::calls().size(), 3000U);
 }
 
 class TempFiles : public RunLocks {

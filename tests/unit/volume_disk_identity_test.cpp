@@ -77,6 +77,26 @@ TEST_F(DiskIdentity, ALargeLunIsComparedAsTheKernelShowsIt) {
   EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskForeign);
 }
 
+TEST_F(DiskIdentity, OneThatWasOursAndIsGoneIsForeign) {
+  name_session(7, "iqn.t1\n");
+  lead_to("host2/session7/target2:0:0/2:0:0:3");
+  EXPECT_FALSE(is_foreign_disk(&entry, "/dev/sdb"));
+  std::filesystem::remove_all("/sys/block/sdb");
+  EXPECT_TRUE(is_foreign_disk(&entry, "/dev/sdb1"));
+  EXPECT_FALSE(is_foreign_disk(&entry, "/dev/sdc1")) << "another one was never seen";
+  entry.lun = 4;
+  EXPECT_FALSE(is_foreign_disk(&entry, "/dev/sdb1")) << "nor as that of another LUN";
+  entry.lun = 3;
+  copy_text(entry.target_name, "iqn.t2");
+  EXPECT_FALSE(is_foreign_disk(&entry, "/dev/sdb1")) << "nor as that of another target";
+}
+
+TEST_F(DiskIdentity, ADiskIsThereWhosesoeverItIs) {
+  EXPECT_FALSE(has_disk("/dev/sdb1"));
+  lead_to("virtio2");
+  EXPECT_TRUE(has_disk("/dev/sdb1"));
+}
+
 TEST_F(DiskIdentity, WhereSysfsTellsNothingItIsUnknown) {
   EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskUnknown) << "no such disk";
   EXPECT_EQ(disk_owner(&entry, ""), kDiskUnknown);
