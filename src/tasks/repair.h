@@ -13,6 +13,10 @@ void repair_target_state(const TargetEntry* target);
 // outlived its run is work too.
 void repair_lun_state(const TargetEntry* lun);
 
+// Returns whether the target's status text, or that of a LUN of it, tells of work that has ended, however it
+// ended: a run has held the target, and none does now.
+[[nodiscard]] bool shows_ended_work(const TargetEntry* target);
+
 }  // namespace remvol
 
 #endif

@@ -79,6 +79,17 @@ int _refresh_targets(int count, Caller caller = Caller()) {
   return kOk;
 }
 
+// The targets behind the counted ones, such as one whose add was refused, stay as they are, unless they show
+// work that nobody does any more. Returns 0 or -103.
+int _refresh_ended_work_behind(int count, Caller caller = Caller()) {
+  for (int slot = count + 1; slot <= kMaxTargets && is_target_stored(slot); slot++) {
+    TargetEntry entry;
+    if (ktree_get_entry_by_dbidx(slot, &entry) != kOk || !shows_ended_work(&entry)) continue;
+    if (_refresh_target(entry.target_name, caller) != kOk) return kTreeFailed;
+  }
+  return kOk;
+}
+
 // Deletes the nameless slots behind the counted ones, up to the first without a status.
 void _prune_slots_behind(int count, Caller caller = Caller()) {
   const SlotsHeld held(SlotsHeld::kChange);
@@ -104,7 +115,7 @@ int task_status() {
   char text[128];
   if (!tree_read(key::kTargetCount, text)) return kFailed;
   const int count = std::min(atoi(text), kMaxTargets);
-  if (_refresh_targets(count) != kOk) return kTreeFailed;
+  if (_refresh_targets(count) != kOk || _refresh_ended_work_behind(count) != kOk) return kTreeFailed;
   _prune_slots_behind(count);
   LOG(2, "end");
   return kOk;

@@ -115,6 +115,43 @@ class TestStandingBehindAState:
         assert stored.lun("status").startswith("Formatting")
 
 
+    def test_a_connection_that_failed_is_put_right_behind_the_counted_targets(self, site, box):
+        site.store("iqn.t0", luns=[("a", 0)])
+        assert box.remvol(*TestAdding.ADD).status == 255  # the share is in use: the target stays, uncounted
+        site.fail_login("iqn.t1")
+        assert box.remvol("--connect", "-n", "iqn.t1").status == 255
+        assert site.target("status", 2) == "Connecting"
+        status(box)
+        assert (site.target("status", 2), box.tree.get(f"{INITIATOR}/count")) == ("Connect Error", "1")
+
+    def test_a_killed_connection_is_put_right_behind_the_counted_targets(self, site, box):
+        site.store("iqn.t0", luns=[("a", 0)])
+        box.remvol(*TestAdding.ADD)
+        box.hook("popen", LOGIN, through=True, effect="kill -KILL $PPID", times=1)
+        assert box.remvol("--connect", "-n", "iqn.t1").status == -9
+        status(box)
+        assert (site.target("status", 2), site.target("conn_state", 2)) == ("Disconnected", "0")
+
+    def test_a_killed_format_is_put_right_behind_the_counted_targets(self, stored, box):
+        stored.store("iqn.t2", slot=2, luns=[("b", 0, {"dev": "sdc", "volume_state": 3})])
+        box.tree.set(f"{INITIATOR}/count", 1)
+        stored.disk("sdc", fs="")
+        stored.offer("iqn.t2", {0: "sdc"})
+        stored.log_in("iqn.t2")
+        box.hook("ktreec_set", f"{INITIATOR}/id:2/lun/id:1/status", value="Formatting 0%", through=True,
+                 effect="kill -KILL $PPID", times=1)
+        assert box.remvol("--format", "-n", "iqn.t2", "-l", "0").status == -9
+        box.tree.set({f"{INITIATOR}/id:2/lun/id:1/status": "Formatting 0%", f"{INITIATOR}/id:2/lun/id:1/volume_state": 3})
+        status(box)
+        assert stored.lun("status", 1, 2) == "Create Volume Failed"
+
+    def test_a_target_behind_the_counted_ones_that_shows_no_work_stays_as_it_is(self, stored, box):
+        stored.store("iqn.t2", slot=2, status="Connected")
+        box.tree.set(f"{INITIATOR}/count", 1)
+        status(box)
+        assert stored.target("status", 2) == "Connected"
+
+
 class TestHalfMadeSlots:
     def test_a_share_that_could_not_be_read_once_costs_no_lun(self, stored, box):
         box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/lun/id:1/share", ret=-1, times=1)
