@@ -21,6 +21,7 @@ namespace {
 
 constexpr int kDeleteTries = 4;
 constexpr int kNotDeleted = 2;
+constexpr int kEveryLun = -1;
 
 // Has the share services look at their shares again before the volume of `entry` goes away. They reload
 // everything at once, so the entry is not needed.
@@ -43,8 +44,26 @@ int _delete_slot(int dbidx, int lun_dbidx, Caller caller) {
   return kNotDeleted;
 }
 
-// Removes the target in `entry`, volumes, session and node record first. Returns 0 or kNotDeleted.
-int _remove_target(TargetEntry* entry, Caller caller = Caller()) {
+// The slot behind the last one is looked at once more: with the target go all of its LUNs.
+bool _has_at_most(int luns, int dbidx) {
+  return ktree_count_target_luns(dbidx) <= luns && has_no_further_lun(dbidx, luns);
+}
+
+// Deletes the slot of the target at `dbidx`, of which LUN `lun` was the last one. When another run has stored
+// a further one since, that stays, and so does the target. Returns 0 or kNotDeleted.
+int _delete_slot_of_last_lun(int dbidx, int lun, Caller caller) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  int lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);
+  if (lun_dbidx <= 0) lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);  // the read may have failed
+  if (_has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return _delete_slot(dbidx, 0, caller);
+  const int result = lun_dbidx > 0 ? _delete_slot(dbidx, lun_dbidx, caller) : kOk;
+  ktree_update_current_luncnt(dbidx);
+  return result;
+}
+
+// Removes the target in `entry`, volumes, session and node record first; `last_lun` is the LUN with which it
+// goes, or kEveryLun. Returns 0 or kNotDeleted.
+int _remove_target(TargetEntry* entry, int last_lun, Caller caller) {
   const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   TargetEntry lun;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
@@ -53,7 +72,8 @@ int _remove_target(TargetEntry* entry, Caller caller = Caller()) {
   }
   Target_Disconnect(entry);
   _target_record_delete(entry);
-  return _delete_slot(entry->db_idx, 0, caller);
+  if (last_lun == kEveryLun) return _delete_slot(entry->db_idx, 0, caller);
+  return _delete_slot_of_last_lun(entry->db_idx, last_lun, caller);
 }
 
 // Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
@@ -65,25 +85,24 @@ int _remove_lun(int dbidx, int lun_dbidx, Caller caller = Caller()) {
   return _delete_slot(dbidx, lun_dbidx, caller);
 }
 
-// The slot behind the last one is looked at once more: with the target go all of its LUNs.
-bool _has_at_most(int luns, int dbidx) {
-  return ktree_count_target_luns(dbidx) <= luns && has_no_further_lun(dbidx, luns);
+int _remove_requested_target(int last_lun, Caller caller) {
+  LOG_AT(caller, 2, "start");
+  int result = kNotStored;
+  TargetEntry entry;
+  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {
+    result = _remove_target(&entry, last_lun, caller);
+  } else {
+    LOG_AT(caller, 1, "Can not find: %s", request_target.target_name);
+  }
+  ktree_update_current_targetcnt();
+  LOG_AT(caller, 2, "end");
+  return result;
 }
 
 }  // namespace
 
 int task_del() {
-  LOG(2, "start");
-  int result = kNotStored;
-  TargetEntry entry;
-  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {
-    result = _remove_target(&entry);
-  } else {
-    LOG(1, "Can not find: %s", request_target.target_name);
-  }
-  ktree_update_current_targetcnt();
-  LOG(2, "end");
-  return result;
+  return _remove_requested_target(kEveryLun, Caller());
 }
 
 int task_del_lun() {
@@ -101,11 +120,12 @@ int task_del_lun() {
   if (result == kOk && _has_at_most(1, dbidx)) {
     LOG(2, "removing target %s", request_target.target_name);
     target_gone = true;
-    result = task_del();
+    result = _remove_requested_target(request_target.lun, Caller("task_del"));
   } else if (result == kOk) {
     result = _remove_lun(dbidx, lun_dbidx);
     target_gone = result == kOk && _has_at_most(0, dbidx);
-    if (target_gone) result = task_del();  // another run has removed the others meanwhile
+    // Another run has removed the others meanwhile.
+    if (target_gone) result = _remove_requested_target(request_target.lun, Caller("task_del"));
   }
   if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);
   LOG(2, "end, ret = %d", result);

@@ -269,6 +269,19 @@ class TestAdding:
         assert sorted(run.wait().status for run in runs) == [0, 255]
 
 
+    def test_a_lun_that_comes_while_the_last_one_is_deleted_stays(self, stored, box):
+        stored.log_in("iqn.t1")
+        meet(box, "system", 'iscsiadm -m node -T "iqn.t1" --logout')
+        delete = box.start(["remvol", "--del_lun", "-n", "iqn.t1", "-l", "0"])
+        until(lambda: is_there(box))
+        add = box.start(["remvol", *self.ADD[:4], "1", *self.ADD[5:-1], "b"])
+        until(lambda: stored.lun("enable", 2))
+        go_on(box)
+        assert (delete.wait().status, add.wait().status) == (0, 0)
+        assert (stored.lun("lun"), stored.lun("share"), stored.target("lun/count")) == ("1", "b", "1")
+        assert (box.tree.get(f"{INITIATOR}/count"), box.tree.get(f"{INITIATOR}/total_lun_count")) == ("1", "1")
+
+
 class TestUpgrading:
     def test_it_is_one_step_for_other_runs(self, site, box):
         box.tree.set({f"{INITIATOR}/count": 1, f"{INITIATOR}/id:1/target": "iqn.t1", f"{INITIATOR}/id:1/ip": "10.9.0.2",
