@@ -68,7 +68,8 @@ BriefTargetHold::BriefTargetHold(const char* target_name, bool (*may_wait)(const
   const LockName name = target_lock(target_name);
   for (int polls = 0; target_.try_take(name, LockMode::kExclusive) == LockTry::kBusy; polls++) {
     waited_ = true;
-    if (polls == kBriefPolls || !may_wait(target_name)) return;
+    given_up_ = polls == kBriefPolls || !may_wait(target_name);
+    if (given_up_) return;
     usleep(kBriefPoll);
   }
 }

@@ -51,10 +51,14 @@ class BriefTargetHold {
   // Whether another run held it: what was read before may have changed.
   bool waited() const { return waited_; }
 
+  // Whether another run holds it still, and this one goes on without.
+  bool given_up() const { return given_up_; }
+
  private:
   RunLock target_;
   bool outermost_ = false;
   bool waited_ = false;
+  bool given_up_ = false;
 };
 
 // Holds the whole target, or one LUN of it (0 or more), when a run has held or marked it before and none

@@ -135,9 +135,16 @@ void _unmount_luns(int dbidx, Caller caller) {
   }
 }
 
-// Unmounts everything, logs out and connects the target again. Returns the result of the connection.
+// Unmounts everything, logs out and connects the target again. Returns the result of the connection. A target
+// that another run is at for long is put off: to wait for its format would hold up the recovery of all
+// others.
 int _rebuild(TargetEntry* entry, Caller caller) {
-  const TargetHold hold(entry->target_name);
+  const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
+  if (hold.given_up()) {
+    LOG_AT(caller, 1, "another run is at target %s, its recovery is put off", entry->target_name);
+    _postpone(entry, caller);
+    return kOk;
+  }
   if (!_is_lost(entry->db_idx)) return _leave_target(entry, caller);
   _unmount_luns(entry->db_idx, caller);
   Target_Logout(entry);

@@ -307,6 +307,21 @@ class TestBusyTargets:
         assert f"popen {LOGIN}" in lost.trace()
 
 
+    def test_a_target_that_another_run_is_at_is_postponed_and_holds_up_no_other(self, lost, box):
+        degrade(box, "a")
+        box.hook("popen", LOGIN, through=True, effect="touch /root/there; until [ -e /root/go ]; do sleep 0.02; done", times=1)
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t1"])
+        box.wait_until(box.path("/root/there").exists, what="the other run")
+        box.tree.set(f"{INITIATOR}/id:1/conn_state", 3)
+        done = recover(box)
+        assert done.status == 0
+        assert "another run is at target iqn.t1, its recovery is put off" in messages(done)
+        assert AGAIN in box.shell()
+        assert not any("umount" in line or LOGOUT in line for line in box.shell())
+        box.path("/root/go").touch()
+        assert connect.wait().status == 0
+
+
 class TestPostponedRun:
     def test_it_comes_back_after_ten_seconds_and_does_the_work(self, lost, box):
         degrade(box, "a")
