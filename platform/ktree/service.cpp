@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cstring>
@@ -19,6 +20,11 @@ namespace {
 bool is_memory_file(int fd) {
   struct stat info = {};
   return fd >= 0 && fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && fcntl(fd, F_GET_SEALS) >= 0;
+}
+
+// The same, emptied: a client whose reply was lost passes a file again that was filled already.
+bool is_new_document(int fd) {
+  return is_memory_file(fd) && ftruncate(fd, 0) == 0 && lseek(fd, 0, SEEK_SET) == 0;
 }
 
 }  // namespace
@@ -83,8 +89,8 @@ Service::Answer Service::del(const Request& request) {
 }
 
 Service::Answer Service::dump(const Request& request) const {
-  return {is_memory_file(request.document) && write_settings(tree_, request.document) ? Status::done
-                                                                                      : Status::failed,
+  return {is_new_document(request.document) && write_settings(tree_, request.document) ? Status::done
+                                                                                       : Status::failed,
           {}};
 }
 
@@ -111,7 +117,7 @@ Service::Answer Service::list(const Request& request) const {
   if (node == nullptr) {
     return {Status::missing, {}};
   }
-  const bool written = is_memory_file(request.document) && write_listing(*node, path, request.document);
+  const bool written = is_new_document(request.document) && write_listing(*node, path, request.document);
   return {written ? Status::done : Status::failed, {}};
 }
 

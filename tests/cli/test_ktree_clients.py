@@ -381,6 +381,21 @@ def test_documents_travel_as_memory_files(daemon):
     assert status == 3 and text.startswith(b"line 1: ")
 
 
+@pytest.mark.parametrize("request_bytes, whole", [(frame(LIST, b"/"), b"/a=x\n"), (frame(DUMP), None)])
+def test_a_document_that_was_filled_already_is_filled_anew(daemon, request_bytes, whole):
+    """As a client passes it that had no reply the first time."""
+    client = daemon.connect()
+    daemon.set("/a", "x")
+    document = os.memfd_create("document")
+    assert send_document(client, request_bytes, document) == (0, b"")
+    whole = whole or os.pread(document, 1000, 0)
+    assert whole.count(b"x") >= 1
+    for left in (b"", b"longer than anything that the daemon writes here" * 20):
+        os.pwrite(document, left, 0)
+        assert send_document(client, request_bytes, document) == (0, b"")
+        assert os.pread(document, 1000, 0) == whole
+
+
 def send_parts_at_once(daemon, client, *parts):
     """The parts are all there when the daemon looks; the kernel hands out the first, with a descriptor, by itself."""
     memory = os.memfd_create("memory")
