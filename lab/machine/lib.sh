@@ -1,0 +1,93 @@
+# What a scenario finds in a full machine, beside the functions of lab/lib.sh. The scenario starts as early as the boot
+# allows, while other services still start; "booted" waits for them.
+#
+# The storage server is a service of the machine that stops after all others. It comes back at every boot with the targets
+# and LUNs it was given, unless the scenario says target_at_boot off.
+
+LUN_DIR=/data/luns
+
+# fail TEXT...: ends the scenario; what the machine itself says of the failure comes along.
+fail() {
+    say "FAILED (phase $PHASE): $*"
+    systemctl list-units --failed --no-legend --plain
+    systemctl list-jobs --no-legend
+    journalctl -b -n 60 --no-pager -o short-monotonic
+    exit 1
+}
+
+# ---- the machine ----
+
+# booted: every service has started; none has failed.
+booted() {
+    state=$(systemctl is-system-running --wait) || :
+    expect_equal "the state of the machine" running "$state"
+    expect_equal "services that failed" "" "$(systemctl list-units --failed --no-legend --plain)"
+}
+
+# The packages come from a folder, as an operator has them.
+install_packages() {
+    expect "the packages are installed" apt_quiet install /lab/packages/*.deb
+}
+
+# apt_quiet ARGUMENT...: apt-get, which asks nothing; its output is in /tmp/apt.log and shown when it fails.
+apt_quiet() {
+    apt-get -y -q -o Dpkg::Use-Pty=0 -o APT::Sandbox::User=root "$@" >/tmp/apt.log 2>&1 || {
+        status=$?
+        cat /tmp/apt.log
+        return $status
+    }
+}
+
+# expect_active UNIT...
+expect_active() {
+    for unit in "$@"; do expect_equal "$unit" active "$(systemctl is-active "$unit")"; done
+}
+
+# messages UNIT...: what these units have said since the machine was started.
+messages() { journalctl -b -o cat --no-pager $(printf -- '-u %s ' "$@"); }
+
+# ---- the power ----
+
+# reboot_machine: as an operator does it; the scenario starts again with PHASE one higher.
+reboot_machine() {
+    printf '\036restart\n' >&9
+    systemctl reboot
+    sleep 1000
+}
+
+# power_cycle: as power_pull, but what was written is kept.
+power_cycle() {
+    sync
+    power_pull
+}
+
+# ---- the storage server ----
+
+# remember COMMAND...: does it now, and again whenever the storage server starts.
+remember() {
+    "$@" || return
+    [ -n "$replaying" ] || printf '%s ' "$@" | sed 's/ $/\n/' >>/data/target
+}
+
+target_start() {
+    touch /data/target
+    systemctl start lab-target
+}
+
+target_kill() {
+    systemctl kill --signal=KILL lab-target
+    wait_for 10 target_is_gone
+}
+
+# target_at_boot on|off
+target_at_boot() {
+    case $1 in on) systemctl --quiet enable lab-target ;; off) systemctl --quiet disable lab-target ;; esac
+}
+
+# What lab-target.service runs.
+target_run_stored() {
+    target_run tgtd
+    wait_for 20 tgtadm --lld iscsi --mode sys --op show
+    replaying=1
+    . /data/target
+}
