@@ -1,67 +1,102 @@
 #include "tree_reader.h"
 
-#include <sys/socket.h>
-#include <sys/un.h>
-#include <time.h>
+#include <sys/mman.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 
-#include "ktreec.h"
+#include "ktree/client/calls.h"
 
 namespace platform {
 namespace {
 
-constexpr char kSocket[] = "/var/run/ktree_sock_vv";
-constexpr time_t kPatience = 2;  // seconds
-constexpr size_t kPathSize = 128, kValueSize = 512;
+using ktree::client::Result;
 
-time_t now() {
-  timespec time{};
-  clock_gettime(CLOCK_MONOTONIC, &time);
-  return time.tv_sec;
+constexpr char kSocket[] = "/var/run/ktree_sock_vv";
+constexpr char kRoot[] = "/iscsi/initiator";
+constexpr size_t kPathSize = 128;
+
+__attribute__((format(printf, 1, 0))) std::string path_of(const char* format, va_list arguments) {
+  char path[kPathSize];
+  vsnprintf(path, sizeof path, format, arguments);
+  return path;
+}
+
+int digit(char character) {
+  constexpr std::string_view kDigits = "0123456789ABCDEF";
+  const size_t at = kDigits.find(character);
+  return at == std::string_view::npos ? -1 : static_cast<int>(at);
+}
+
+// The value without the \xHH that a listing has for control characters and the backslash.
+std::string unescaped(std::string_view text) {
+  std::string value;
+  while (!text.empty()) {
+    const bool escaped = text.starts_with("\\x") && text.size() >= 4;
+    const int byte = escaped ? digit(text[2]) * 16 + digit(text[3]) : text.front();
+    value += static_cast<char>(byte);
+    text.remove_prefix(escaped ? 4 : 1);
+  }
+  return value;
+}
+
+// All of a memory file.
+std::string content_of(int file) {
+  std::string text;
+  char buffer[1 << 14];
+  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
+    text.append(buffer, static_cast<size_t>(n));
+  return text;
 }
 
 }  // namespace
 
-std::string TreeReader::read(const char* path) {
-  if (hung_) return {};
-  char text[kValueSize];
-  const time_t start = now();
-  const bool found = ktreec_get_wb(kSocket, 0, path, text, sizeof text) > 0;
-  hung_ = now() - start > kPatience;
-  return found ? text : std::string();
+TreeReader::TreeReader() {
+  const int file = memfd_create("listing", MFD_CLOEXEC);
+  ktree::client::Reason reason;
+  const Result result = file < 0 ? Result::failed : ktree::client::list_to(kSocket, kRoot, file, reason);
+  answered_ = result == Result::done || result == Result::missing;
+  if (result == Result::done) take(content_of(file));
+  if (file >= 0) close(file);
 }
 
-std::string TreeReader::value(const char* format, ...) {
-  char path[kPathSize];
-  va_list arguments;
-  va_start(arguments, format);
-  vsnprintf(path, sizeof path, format, arguments);
-  va_end(arguments);
-  return read(path);
+TreeReader::TreeReader(std::string_view listing) {
+  take(listing);
 }
 
-int TreeReader::number(int fallback, const char* format, ...) {
-  char path[kPathSize];
+void TreeReader::take(std::string_view listing) {
+  while (!listing.empty()) {
+    const std::string_view line = listing.substr(0, listing.find('\n'));
+    const size_t equals = line.find('=');
+    if (equals != std::string_view::npos)
+      values_.emplace(line.substr(0, equals), unescaped(line.substr(equals + 1)));
+    listing.remove_prefix(std::min(line.size() + 1, listing.size()));
+  }
+}
+
+std::string TreeReader::read(const char* path) const {
+  const auto found = values_.find(std::string_view(path));
+  return found == values_.end() ? std::string() : found->second;
+}
+
+std::string TreeReader::value(const char* format, ...) const {
   va_list arguments;
   va_start(arguments, format);
-  vsnprintf(path, sizeof path, format, arguments);
+  const std::string path = path_of(format, arguments);
   va_end(arguments);
-  const std::string text = read(path);
+  return read(path.c_str());
+}
+
+int TreeReader::number(int fallback, const char* format, ...) const {
+  va_list arguments;
+  va_start(arguments, format);
+  const std::string path = path_of(format, arguments);
+  va_end(arguments);
+  const std::string text = read(path.c_str());
   return text.empty() ? fallback : atoi(text.c_str());
-}
-
-bool TreeReader::answered() const {
-  sockaddr_un address{AF_UNIX, {}};
-  snprintf(address.sun_path, sizeof address.sun_path, "%s", kSocket);
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-  if (fd < 0) return false;
-  const bool listens = connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0;
-  close(fd);
-  return listens && !hung_;
 }
 
 }  // namespace platform

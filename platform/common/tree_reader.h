@@ -2,29 +2,40 @@
 #ifndef PLATFORM_COMMON_TREE_READER_H
 #define PLATFORM_COMMON_TREE_READER_H
 
+#include <functional>
+#include <map>
 #include <string>
+#include <string_view>
 
 namespace platform {
 
 inline constexpr int kTargets = 8, kLuns = 8;  // slots; those in use are the first ones
 
-// A hung daemon costs time once: after the first read that shows it every value is empty.
+// Everything below /iscsi/initiator at one moment, had with one request.
 class TreeReader {
  public:
-  // The value at the path that printf(format, ...) would print; empty when there is none.
-  std::string value(const char* format, ...) __attribute__((format(printf, 2, 3)));
+  // Asks the daemon, which has five seconds to answer.
+  TreeReader();
+
+  // Takes the values from a listing, as `ktreec -t` prints it; a line that is none is left out.
+  explicit TreeReader(std::string_view listing);
+
+  // True when the daemon answered; without an answer there are no values.
+  bool answered() const { return answered_; }
+
+  // The value at the path that printf(format, ...) would print, of 127 bytes at most; empty when there is
+  // none.
+  std::string value(const char* format, ...) const __attribute__((format(printf, 2, 3)));
 
   // The same as a number; `fallback` when there is none.
-  int number(int fallback, const char* format, ...) __attribute__((format(printf, 3, 4)));
-
-  // True when the daemon listens and answered all reads in time. To be asked after the reads: the client
-  // library does not tell a missing value from a missing daemon.
-  bool answered() const;
+  int number(int fallback, const char* format, ...) const __attribute__((format(printf, 3, 4)));
 
  private:
-  std::string read(const char* path);
+  void take(std::string_view listing);
+  std::string read(const char* path) const;
 
-  bool hung_ = false;
+  bool answered_ = true;
+  std::map<std::string, std::string, std::less<>> values_;
 };
 
 }  // namespace platform

@@ -138,4 +138,13 @@ std::string printable(std::string_view text) {
   return shown;
 }
 
+std::string ascii(std::string_view text) {
+  std::string shown;
+  for (size_t at = 0; at < text.size(); ++at) {
+    const bool plain = static_cast<unsigned char>(text[at]) < 0x80;
+    plain ? static_cast<void>(shown += text[at]) : append_escaped(shown, text.substr(at, 1));
+  }
+  return shown;
+}
+
 }  // namespace platform

@@ -32,6 +32,9 @@ size_t cells(std::string_view text);
 // well when it is not UTF-8.
 std::string printable(std::string_view text);
 
+// `text` with all that is not ASCII as \xHH.
+std::string ascii(std::string_view text);
+
 }  // namespace platform
 
 #endif

@@ -20,6 +20,8 @@
 namespace events {
 namespace {
 
+using platform::read_sessions;
+
 constexpr char kTool[] = "remvol";
 constexpr int kMuchHurry = 50, kSomeHurry = 1000;  // milliseconds between looks
 

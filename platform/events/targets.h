@@ -13,6 +13,9 @@
 
 namespace events {
 
+using platform::Link;
+using platform::Session;
+
 enum class Action { kReopen, kRecover };
 
 struct Order {

@@ -1,9 +1,6 @@
 #include "status.h"
 
 #include <algorithm>
-#include <cstdio>
-
-#include "tree_reader.h"
 
 #define TARGET "/iscsi/initiator/id:%d/"
 #define LUN TARGET "lun/id:%d/"
@@ -13,7 +10,7 @@ namespace {
 
 using platform::TreeReader;
 
-Volume read_volume(TreeReader& tree, int target, int lun) {
+Volume read_volume(const TreeReader& tree, int target, int lun) {
   Volume volume{};
   volume.lun = tree.number(-1, LUN "lun", target, lun);
   volume.share = tree.value(LUN "share", target, lun);
@@ -23,15 +20,13 @@ Volume read_volume(TreeReader& tree, int target, int lun) {
   volume.format_state = tree.number(-1, LUN "format_state", target, lun);
   volume.progress = std::clamp(tree.number(0, LUN "format_progress", target, lun), 0, 100);
   volume.volume_state = tree.number(-1, LUN "volume_state", target, lun);
-  const std::string size = tree.value(LUN "size", target, lun);
-  if (sscanf(size.c_str(), "%llu/%llu", &volume.used, &volume.size) != 2) volume.used = volume.size = 0;
   volume.file_system = tree.value(LUN "fs_type", target, lun);
   volume.device = tree.value(LUN "dev", target, lun);
   volume.mount_point = tree.value(LUN "mnt", target, lun);
   return volume;
 }
 
-Target read_target(TreeReader& tree, int index) {
+Target read_target(const TreeReader& tree, int index) {
   Target target{};
   target.name = tree.value(TARGET "target", index);
   target.address = tree.value(TARGET "ip", index);
@@ -39,8 +34,6 @@ Target read_target(TreeReader& tree, int index) {
   target.wanted = tree.number(0, TARGET "conn_set", index) != 0;
   target.connect_state = tree.number(-1, TARGET "conn_state", index);
   target.status = tree.value(TARGET "status", index);
-  // At a loss of the connection the tool sets the state alone; its text follows with the next command.
-  if (target.wanted && target.connect_state == kRecovering) target.status = "Reconnecting";
   for (int lun = 1; lun <= platform::kLuns; ++lun) {
     if (tree.value(LUN "lun", index, lun).empty()) break;
     target.volumes.push_back(read_volume(tree, index, lun));
@@ -50,24 +43,13 @@ Target read_target(TreeReader& tree, int index) {
 
 }  // namespace
 
-Status read_status() {
-  TreeReader tree;
+Status read_status(const TreeReader& tree) {
   Status status{tree.answered(), {}};
-  for (int index = 1; status.reachable && index <= platform::kTargets; ++index) {
+  for (int index = 1; index <= platform::kTargets; ++index) {
     if (tree.value(TARGET "target", index).empty()) break;
     status.targets.push_back(read_target(tree, index));
   }
-  if (status.reachable && !tree.answered()) status = {false, {}};
   return status;
-}
-
-bool is_connected(const Target& target) {
-  return target.connect_state == 1;
-}
-
-bool all_connected(const Status& status) {
-  return std::all_of(status.targets.begin(), status.targets.end(),
-                     [](const Target& target) { return !target.wanted || is_connected(target); });
 }
 
 }  // namespace vvstat

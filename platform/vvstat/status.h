@@ -5,6 +5,8 @@
 #include <string>
 #include <vector>
 
+#include "tree_reader.h"
+
 namespace vvstat {
 
 struct Volume {
@@ -13,11 +15,9 @@ struct Volume {
   std::string status;  // the text of the tool
   bool enabled;
   bool read_only;
-  int format_state;         // -1: unknown, 0: none, 1: running, 3: failed, 4: waiting
-  int progress;             // percent of the format
-  int volume_state;         // -1: unknown, 0: ready, 1: being created, 2: offline, 3: failed, 5: unsupported
-  unsigned long long used;  // bytes, 0 while it is not mounted
-  unsigned long long size;
+  int format_state;  // -1: unknown, 0: none, 1: running, 3: failed, 4: waiting
+  int progress;      // percent of the format
+  int volume_state;  // -1: unknown, 0: ready, 1: being created, 2: offline, 3: failed, 5: unsupported
   std::string file_system;
   std::string device;
   std::string mount_point;
@@ -28,7 +28,7 @@ struct Target {
   std::string address;
   int port;
   bool wanted;        // it should be connected
-  int connect_state;  // -1: unknown, 0: disconnected, 1: connected, 2: connecting, 3: recovering, 4: error
+  int connect_state;  // -1: unknown, 0: disconnected, 1: connected, 2: connecting, 3: lost, 4: login failed
   std::string status;
   std::vector<Volume> volumes;
 };
@@ -38,15 +38,12 @@ struct Status {
   std::vector<Target> targets;
 };
 
-inline constexpr int kFormatRunning = 1;
-inline constexpr int kRecovering = 3;
+// Values of connect_state, format_state and volume_state.
+inline constexpr int kConnected = 1, kConnecting = 2, kRecovering = 3, kConnectError = 4;
+inline constexpr int kFormatRunning = 1, kFormatFailed = 3, kFormatWaiting = 4;
+inline constexpr int kBeingCreated = 1, kVolumeFailed = 3, kUnsupported = 5;
 
-Status read_status();
-
-bool is_connected(const Target& target);
-
-// True when every target that should be connected is.
-bool all_connected(const Status& status);
+Status read_status(const platform::TreeReader& tree);
 
 }  // namespace vvstat
 

@@ -1,146 +1,243 @@
-// vvstat: the state of targets and volumes for an operator. Reads the configuration tree and changes nothing.
+// vvstat: the state of targets and volumes for an operator. Reads the configuration tree and the kernel's
+// tables, and changes nothing.
 #include <getopt.h>
-#include <poll.h>
-#include <signal.h>
 #include <sys/ioctl.h>
-#include <sys/signalfd.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
-#include <initializer_list>
+#include <cstring>
 
-#include "json.h"
-#include "table.h"
+#include "columns.h"
+#include "verdict.h"
+#include "watch.h"
 
 namespace vvstat {
 namespace {
 
-constexpr int kNotConnected = 1, kUsage = 2, kUnreachable = 3;
-constexpr int kInterval = 1000;  // milliseconds
-constexpr char kMissing[] = "vvstat: the configuration tree cannot be reached\n";
+constexpr int kAiling = 1, kUsage = 2, kUnreachable = 3;
 
 struct Options {
-  bool json = false;
+  Layout layout;
   bool watch = false;
+  bool ailing_only = false;
+  const char* name = nullptr;  // of a share or a target
 };
 
-int exit_status(const Status& status) {
-  if (!status.reachable) return kUnreachable;
-  return all_connected(status) ? 0 : kNotConnected;
+// One look at everything.
+struct Look {
+  Status status;
+  std::vector<Row> rows;
+};
+
+Look look() {
+  Look look;
+  look.status = read_status(platform::TreeReader());
+  look.rows = assess(look.status, read_facts(look.status));
+  return look;
 }
 
-void put(const std::string& text) {
+int exit_status(const Look& look) {
+  if (!look.status.reachable) return kUnreachable;
+  return all_healthy(look.rows) ? 0 : kAiling;
+}
+
+const char* why_unreachable() {
+  return geteuid() == 0 ? "vvstat: the configuration tree cannot be reached\n"
+                        : "vvstat: only root may read the configuration tree\n";
+}
+
+std::vector<Row> chosen(const std::vector<Row>& rows, bool ailing_only) {
+  std::vector<Row> some;
+  for (const Row& row : rows) {
+    if (!ailing_only || !row.healthy()) some.push_back(row);
+  }
+  return some;
+}
+
+Page page_of(const Look& look, const Options& options) {
+  if (!look.status.reachable) return {"", why_unreachable()};
+  const std::vector<Row> rows = chosen(look.rows, options.ailing_only);
+  Page page;
+  const Layout& layout = options.layout;
+  if (!rows.empty() || layout.form == Form::kJson) page.table = report(rows, layout);
+  // Whoever takes a report apart wants the rows alone.
+  if (layout.form == Form::kTable && layout.headings) {
+    page.verdict = verdict(look.rows, time(nullptr), layout.width);
+  }
+  return page;
+}
+
+void put(std::string_view text) {
   fwrite(text.data(), 1, text.size(), stdout);
-  fflush(stdout);
 }
 
-// Colour for a terminal, unless NO_COLOR asks for none (no-color.org).
-Screen screen_of_output() {
-  Screen screen;
-  if (isatty(STDOUT_FILENO) == 0) return screen;
-  const char* no_colour = getenv("NO_COLOR");
-  screen.colour = no_colour == nullptr || no_colour[0] == '\0';
-  return screen;
+// What could not be written is a failure: a full disk must not look like a machine without volumes.
+int finish(int status) {
+  if (ferror(stdout) == 0 && fflush(stdout) == 0) return status;
+  fprintf(stderr, "vvstat: write error: %s\n", strerror(errno));
+  return kAiling;
+}
+
+size_t width_of_output() {
+  winsize size{};
+  if (ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col != 0) return size.ws_col;
+  const char* columns = getenv("COLUMNS");
+  const int width = columns != nullptr ? atoi(columns) : 0;
+  return width > 0 ? static_cast<size_t>(width) : Layout().width;
 }
 
 int show_once(const Options& options) {
-  const Status status = read_status();
-  if (options.json) {
-    put(json(status));
-  } else if (status.reachable) {
-    put(table(status, screen_of_output()));
+  const Look seen = look();
+  if (!seen.status.reachable) {
+    fputs(why_unreachable(), stderr);
+    return kUnreachable;
   }
-  if (!status.reachable) fputs(kMissing, stderr);
-  return exit_status(status);
+  const Page page = page_of(seen, options);
+  put(page.table);
+  if (!page.table.empty() && !page.verdict.empty()) put("\n");
+  put(page.verdict);
+  return finish(exit_status(seen));
 }
 
-// Puts the text over the one before: each line is cleared behind its end, the rest of the screen at last.
-void redraw(const std::string& text) {
-  std::string drawn = "\x1b[H";
-  for (const char character : text) {
-    if (character == '\n') drawn += "\x1b[K";
-    drawn += character;
+// Everything of the volume of that share, or of all volumes of that target.
+int show_one(const Options& options) {
+  const Look seen = look();
+  if (!seen.status.reachable) {
+    fputs(why_unreachable(), stderr);
+    return kUnreachable;
   }
-  put(drawn + "\x1b[J");
+  std::vector<Row> rows;
+  for (const Row& row : seen.rows) {
+    if (row.target->name == options.name || (row.volume != nullptr && row.volume->share == options.name))
+      rows.push_back(row);
+  }
+  if (rows.empty()) {
+    fprintf(stderr, "vvstat: there is no share and no target of this name\n");
+    return kUsage;
+  }
+  if (options.layout.form != Form::kTable) {
+    put(report(rows, options.layout));
+  } else {
+    for (const Row& row : rows) {
+      if (&row != rows.data()) put("\n");
+      put(block(row, options.layout.bytes));
+    }
+  }
+  return finish(all_healthy(rows) ? 0 : kAiling);
 }
 
-void draw(const Status& status, const Options& options) {
-  if (options.json) return put(json(status));
-  Screen screen = screen_of_output();
-  winsize size{};
-  if (isatty(STDOUT_FILENO) == 0)
-    return put((status.reachable ? table(status, screen) : kMissing) + std::string("\n"));
-  if (ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0) {
-    screen.columns = size.ws_col;
-    screen.lines = size.ws_row > 1 ? size.ws_row - 1U : size.ws_row;
-  }
-  redraw(status.reachable ? table(status, screen) : kMissing);
-}
-
-int watch(const Options& options) {
-  sigset_t set;
-  sigemptyset(&set);
-  for (int number : {SIGINT, SIGTERM, SIGHUP, SIGWINCH}) sigaddset(&set, number);
-  sigprocmask(SIG_BLOCK, &set, nullptr);
-  pollfd signals{signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK), POLLIN, 0};
-  const bool terminal = isatty(STDOUT_FILENO) != 0 && !options.json;
-  // The other screen, without a cursor; both are as before at the end.
-  if (terminal) put("\x1b[?1049h\x1b[?25l");
-  Status status{};
-  for (signalfd_siginfo info{}; info.ssi_signo == 0 || info.ssi_signo == SIGWINCH;) {
-    status = read_status();
-    draw(status, options);
-    if (ferror(stdout) != 0) break;
-    poll(&signals, 1, kInterval);
-    if (read(signals.fd, &info, sizeof info) != sizeof info) info = {};
-  }
-  if (terminal) put("\x1b[?25h\x1b[?1049l");
-  return exit_status(status);
+int show_again(Options options) {
+  Look last;
+  watch([&options, &last](size_t width) {
+    if (width != 0) options.layout.width = width;
+    last = look();
+    return page_of(last, options);
+  });
+  return exit_status(last);
 }
 
 constexpr char kHelp[] =
-    "usage: vvstat [--watch] [--json]\n"
-    "Shows the targets and their volumes as the configuration tree has them.\n"
-    "  -w, --watch    shows it again every second\n"
-    "  -j, --json     shows it as JSON, for programs\n"
-    "  -h, --help     this text\n"
-    "  -V, --version  the version\n"
-    "Exit status: 0 all that should be connected is, 1 something is not, 2 usage,\n"
+    "usage: vvstat [OPTION...] [SHARE|TARGET]\n"
+    "Shows the volumes of remote targets: how they are, what is wrong and what to do.\n"
+    "With a name: everything of that share, or of that target's volumes.\n"
+    "  -x, --unhealthy     only what needs attention\n"
+    "  -w, --watch         shows it again every second, until q is typed\n"
+    "  -o, --output LIST   these columns; with a + before the first, these as well\n"
+    "  -b, --bytes         sizes in bytes\n"
+    "  -n, --noheadings    the rows alone\n"
+    "  -r, --raw           the rows as plain text, blanks as \\x20\n"
+    "  -J, --json          JSON, for programs\n"
+    "  -h, --help          this text\n"
+    "  -V, --version       the version\n"
+    "Columns:\n";
+constexpr char kStatusHelp[] =
+    "Exit status: 0 all that is wanted is healthy, 1 something is not, 2 usage,\n"
     "3 the configuration tree cannot be reached.\n";
 
-constexpr option kLongOptions[] = {{"watch", no_argument, nullptr, 'w'},
-                                   {"json", no_argument, nullptr, 'j'},
-                                   {"help", no_argument, nullptr, 'h'},
-                                   {"version", no_argument, nullptr, 'V'},
-                                   {}};
+constexpr option kLongOptions[] = {
+    {"unhealthy", no_argument, nullptr, 'x'},    {"watch", no_argument, nullptr, 'w'},
+    {"output", required_argument, nullptr, 'o'}, {"bytes", no_argument, nullptr, 'b'},
+    {"noheadings", no_argument, nullptr, 'n'},   {"raw", no_argument, nullptr, 'r'},
+    {"json", no_argument, nullptr, 'J'},         {"help", no_argument, nullptr, 'h'},
+    {"version", no_argument, nullptr, 'V'},      {}};
+
+// What reading the arguments came to: go on, or end with this status.
+constexpr int kGoOn = -1;
+
+int wrong_usage() {
+  fputs("Try 'vvstat --help'.\n", stderr);
+  return kUsage;
+}
+
+int take_columns(const char* names, Layout& layout) {
+  std::string unknown;
+  if (choose_columns(names, layout, unknown)) return kGoOn;
+  fprintf(stderr, "vvstat: there is no column \"%s\"\n", unknown.c_str());
+  return wrong_usage();
+}
+
+int take_option(int letter, Options& options) {
+  switch (letter) {
+    case 'x':
+      options.ailing_only = true;
+      return kGoOn;
+    case 'w':
+      options.watch = true;
+      return kGoOn;
+    case 'o':
+      return take_columns(optarg, options.layout);
+    case 'b':
+      options.layout.bytes = true;
+      return kGoOn;
+    case 'n':
+      options.layout.headings = false;
+      return kGoOn;
+    case 'r':
+      options.layout.form = Form::kRaw;
+      return kGoOn;
+    case 'j':
+    case 'J':
+      options.layout.form = Form::kJson;
+      return kGoOn;
+    case 'h':
+      put(kHelp);
+      put(describe_columns());
+      put(kStatusHelp);
+      return finish(0);
+    case 'V':
+      put("vvstat " REMVOL_VERSION "\n");
+      return finish(0);
+    default:
+      return wrong_usage();
+  }
+}
+
+int take_arguments(int argc, char** argv, Options& options) {
+  for (int letter; (letter = getopt_long(argc, argv, "xwo:bnrjJhV", kLongOptions, nullptr)) != -1;) {
+    const int status = take_option(letter, options);
+    if (status != kGoOn) return status;
+  }
+  if (optind < argc) options.name = argv[optind++];
+  return optind == argc && !(options.watch && options.name != nullptr) ? kGoOn : wrong_usage();
+}
+
+// Colour for a terminal, unless NO_COLOR asks for none (no-color.org).
+bool wants_colour() {
+  const char* no_colour = getenv("NO_COLOR");
+  return isatty(STDOUT_FILENO) != 0 && (no_colour == nullptr || no_colour[0] == '\0');
+}
 
 int run(int argc, char** argv) {
   Options options;
-  for (int letter; (letter = getopt_long(argc, argv, "wjhV", kLongOptions, nullptr)) != -1;) {
-    switch (letter) {
-      case 'w':
-        options.watch = true;
-        break;
-      case 'j':
-        options.json = true;
-        break;
-      case 'h':
-        put(kHelp);
-        return 0;
-      case 'V':
-        put("vvstat " REMVOL_VERSION "\n");
-        return 0;
-      default:
-        fputs(kHelp, stderr);
-        return kUsage;
-    }
-  }
-  if (optind != argc) {
-    fputs(kHelp, stderr);
-    return kUsage;
-  }
-  return options.watch ? watch(options) : show_once(options);
+  const int status = take_arguments(argc, argv, options);
+  if (status != kGoOn) return status;
+  use_utf8();
+  options.layout.colour = wants_colour();
+  options.layout.width = width_of_output();
+  if (options.name != nullptr) return show_one(options);
+  return options.watch ? show_again(options) : show_once(options);
 }
 
 }  // namespace

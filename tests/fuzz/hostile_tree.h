@@ -1,5 +1,5 @@
 // A configuration tree whose values are parts of the input (between NULs), given one after the other to
-// whatever is asked for, over and over or once; "-" stands for a missing one. Included by one file of a
+// whatever is asked for, over and over; "-" stands for a missing one. Included by one file of a
 // target.
 #ifndef FUZZ_HOSTILE_TREE_H
 #define FUZZ_HOSTILE_TREE_H
@@ -26,11 +26,7 @@ inline void take_values(const uint8_t* data, size_t size) {
   }
 }
 
-inline bool given_once = false;
-
 inline const std::string& next_value() {
-  static const std::string missing = "-";
-  if (given_once && asked >= values.size()) return missing;
   return values[asked++ % values.size()];
 }
 

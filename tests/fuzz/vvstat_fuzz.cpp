@@ -1,22 +1,15 @@
-// The status shown to people and programs, for any values of the tree: nothing that moves a cursor reaches a
-// terminal, no line is wider than the screen, and the JSON is one line of balanced, well-formed text.
-#include <sys/socket.h>
-
+// The report for people and programs, for any listing of the tree and any facts of the kernel: nothing that
+// moves a cursor reaches a terminal, no row is wider than the screen, and the JSON is balanced, well-formed
+// text.
 #include <cstdint>
 #include <string>
 
-#include "../../platform/vvstat/json.h"
-#include "../../platform/vvstat/table.h"
-#include "hostile_tree.h"
+#include "columns.h"
 #include "require.h"
 #include "utf8.h"
+#include "verdict.h"
 
 using namespace vvstat;
-
-// The daemon listens.
-extern "C" int __wrap_connect(int, const sockaddr*, socklen_t) {
-  return 0;
-}
 
 namespace {
 
@@ -39,7 +32,7 @@ void check_json(const std::string& text) {
   bool quoted = false;
   for (size_t i = 0; i < text.size(); i++) {
     const char byte = text[i];
-    require(static_cast<unsigned char>(byte) >= 0x20 || (byte == '\n' && i + 1 == text.size()));
+    require(static_cast<unsigned char>(byte) >= 0x20 || (byte == '\n' && !quoted));
     if (quoted && byte == '\\')
       i++;
     else if (byte == '"')
@@ -56,18 +49,48 @@ void check_json(const std::string& text) {
   require(platform::decode(text, characters));
 }
 
+// Facts that a byte stands for.
+std::vector<TargetFacts> facts_of(const Status& status, uint8_t byte) {
+  constexpr const char* kSessions[] = {"", "LOGGED_IN", "FAILED", "FREE"};
+  std::vector<TargetFacts> all;
+  for (const Target& target : status.targets) {
+    const VolumeFacts volume{(byte & 4U) != 0, (byte & 8U) != 0, (byte & 16U) != 0, byte, byte * 3ULL};
+    all.push_back(
+        {kSessions[byte & 3U], "10.0.0.1", std::vector<VolumeFacts>(target.volumes.size(), volume)});
+  }
+  return all;
+}
+
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  if (size < 2) return 0;
-  Screen screen;
-  screen.columns = data[0] & 0x7fU;
-  screen.lines = data[1] & 0x0fU;
-  given_once = true;
-  take_values(data + 2, size - 2);
-  const Status status = read_status();
+  if (size < 3) return 0;
+  static const bool ready = (use_utf8(), true);
+  require(ready);
+  // Below this width the numbers alone fill the line.
+  constexpr size_t kLeast = 60;
+  Layout layout;
+  layout.width = kLeast + data[0];
+  layout.colour = false;
+  const std::string_view listing(reinterpret_cast<const char*>(data + 2), size - 2);
+  const Status status = read_status(platform::TreeReader(listing));
   require(status.reachable && status.targets.size() <= 8);
-  check_text(table(status, screen), screen.columns);
-  check_json(json(status));
+  const std::vector<Row> rows = assess(status, facts_of(status, data[1]));
+  switch (data[1] >> 6U) {
+    case 0:
+      check_text(report(rows, layout), layout.width);
+      break;
+    case 1:
+      layout.form = Form::kRaw;
+      check_text(report(rows, layout), 0);
+      break;
+    case 2:
+      layout.form = Form::kJson;
+      check_json(report(rows, layout));
+      break;
+    default:
+      check_text(verdict(rows, 0, layout.width), 0);
+      for (const Row& row : rows) check_text(block(row, false), 0);
+  }
   return 0;
 }

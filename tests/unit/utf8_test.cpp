@@ -71,6 +71,11 @@ TEST(Utf8, CellsAreWhatATerminalTakes) {
   EXPECT_EQ(cells(""), 0U);
 }
 
+TEST(Utf8, Ascii) {
+  EXPECT_EQ(ascii("a b\x7f"), "a b\x7f");
+  EXPECT_EQ(ascii("\xc3\xa9x\xff"), "\\xC3\\xA9x\\xFF");
+}
+
 TEST(Utf8, LowerCase) {
   EXPECT_EQ(lower_case(L'A'), L'a');
   EXPECT_EQ(lower_case(L'['), L'[');

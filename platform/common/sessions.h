@@ -1,12 +1,12 @@
 // The iSCSI sessions of the machine, as sysfs shows them.
-#ifndef PLATFORM_EVENTS_SESSIONS_H
-#define PLATFORM_EVENTS_SESSIONS_H
+#ifndef PLATFORM_COMMON_SESSIONS_H
+#define PLATFORM_COMMON_SESSIONS_H
 
 #include <cstdint>
 #include <string>
 #include <vector>
 
-namespace events {
+namespace platform {
 
 enum class Link {
   kUp,    // logged in
@@ -17,12 +17,17 @@ enum class Link {
 struct Session {
   uint32_t number;
   std::string target;
+  std::string state;  // the kernel's word: LOGGED_IN, FAILED or FREE
   Link link;
 };
 
 // Lists the sessions; one that vanishes meanwhile is left out.
 std::vector<Session> read_sessions();
 
-}  // namespace events
+// The address of the portal that the session's connection was made to, as it was given; empty when it has
+// none.
+std::string address_of(const Session& session);
+
+}  // namespace platform
 
 #endif

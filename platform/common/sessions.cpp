@@ -8,7 +8,7 @@
 #include <cstdlib>
 #include <string_view>
 
-namespace events {
+namespace platform {
 namespace {
 
 constexpr char kFolder[] = "/sys/class/iscsi_session";
@@ -48,8 +48,8 @@ bool had_luns(const std::string& session) {
 }
 
 // The state "FREE" is both the first one and that of a session whose recovery took too long.
-Link link_of(const std::string& session) {
-  if (read_line(session + "/state") == "LOGGED_IN") return Link::kUp;
+Link link_of(const std::string& session, const std::string& state) {
+  if (state == "LOGGED_IN") return Link::kUp;
   return had_luns(session) ? Link::kDown : Link::kNew;
 }
 
@@ -62,10 +62,16 @@ std::vector<Session> read_sessions() {
     const std::string path = std::string(kFolder) + "/" + std::string(name);
     const std::string target = read_line(path + "/targetname");
     const auto number = static_cast<uint32_t>(strtoul(name.data() + kSession.size(), nullptr, 10));
-    if (!target.empty()) sessions.push_back({number, target, link_of(path)});
+    const std::string state = read_line(path + "/state");
+    if (!target.empty()) sessions.push_back({number, target, state, link_of(path, state)});
     return true;
   });
   return sessions;
 }
 
-}  // namespace events
+std::string address_of(const Session& session) {
+  return read_line("/sys/class/iscsi_connection/connection" + std::to_string(session.number) +
+                   ":0/persistent_address");
+}
+
+}  // namespace platform

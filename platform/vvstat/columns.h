@@ -1,0 +1,49 @@
+// The report as a table, as raw text and as JSON.
+#ifndef PLATFORM_VVSTAT_COLUMNS_H
+#define PLATFORM_VVSTAT_COLUMNS_H
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "health.h"
+
+namespace vvstat {
+
+enum class Form { kTable, kRaw, kJson };
+
+// How the report is to look.
+struct Layout {
+  Form form = Form::kTable;
+  bool headings = true;
+  bool bytes = false;   // sizes in bytes; as JSON they always are
+  bool colour = false;  // in a table
+  size_t width = 80;    // cells that a line of a table may take; raw lines and JSON are as long as they are
+  std::vector<size_t> columns;  // by their numbers; empty: the usual ones of the form
+};
+
+// Takes a list of column names, as "SHARE,STATUS"; with a "+" before it they are added to the usual ones.
+// Returns false when there is no such column; `unknown` is its name then.
+bool choose_columns(std::string_view names, Layout& layout, std::string& unknown);
+
+// The columns' names with what each shows, a line each, for a help text.
+std::string describe_columns();
+
+// The report. Text of users is shown with \xHH for bytes that are no UTF-8, and for characters that move a
+// cursor or cannot be seen. Secrets are not in it. The process must have a UTF-8 locale (use_utf8()) for all
+// else that is not ASCII. Empty when there is no memory for it.
+std::string report(const std::vector<Row>& rows, const Layout& layout);
+
+// Everything of one row, a column a line; what is empty is left out. Text of users is shown as above.
+std::string block(const Row& row, bool bytes);
+
+// Sets the character set of the process to UTF-8, whatever its environment says; where the system lacks the
+// locale, what is not ASCII is shown as \xHH.
+void use_utf8();
+
+// A size as a person reads it, such as "1.5G", in powers of 1024.
+std::string readable_size(unsigned long long bytes);
+
+}  // namespace vvstat
+
+#endif

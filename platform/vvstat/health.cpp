@@ -1,0 +1,125 @@
+#include "health.h"
+
+#include <algorithm>
+
+namespace vvstat {
+namespace {
+
+const Problem kNone;
+
+// A name as a word of the shell, since people copy commands.
+std::string quoted(const std::string& name) {
+  constexpr char kPlain[] = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789.:-_";
+  if (!name.empty() && name.find_first_not_of(kPlain) == std::string::npos) return name;
+  std::string word = "'";
+  for (const char byte : name) byte == '\'' ? word += "'\\''" : word += byte;
+  return word += "'";
+}
+
+std::string connect(const Target& target) {
+  return "remvol --connect -n " + quoted(target.name);
+}
+
+constexpr char kHealsItself[] = "look at the network and the storage server; it heals by itself";
+
+// Nothing of a target's volumes can be had while it has a problem.
+Problem problem_of(const Target& target, const TargetFacts& facts) {
+  switch (target.connect_state) {
+    case kConnected:
+      break;
+    case kConnecting:
+      return {"Connecting", "is being connected", "wait a minute", ""};
+    case kRecovering:
+      return {"Reconnecting", "the connection was lost", kHealsItself, ""};
+    case kConnectError:
+      return {"Connect Error", "the login failed", "check the address, the password and the cable",
+              connect(target)};
+    default:
+      return {"Disconnected", "is not connected", "connect it", connect(target)};
+  }
+  if (facts.session.empty())
+    return {"No Session", "the target's session is gone, although nobody disconnected it", "connect it again",
+            connect(target)};
+  if (facts.session != "LOGGED_IN") return {"Reconnecting", "the connection was lost", kHealsItself, ""};
+  return kNone;
+}
+
+Problem problem_of_unmounted(const Target& target, const Volume& volume) {
+  const std::string format =
+      "remvol --format -n " + quoted(target.name) + " -l " + std::to_string(volume.lun);
+  if (volume.format_state == kFormatFailed)
+    return {"Format Failed", "its format failed", "look at the storage server and the kernel's log", format};
+  if (volume.volume_state == kUnsupported)
+    return {"Unsupported", "what is on its disk cannot be mounted here",
+            "the data is left as it is; this destroys it", format};
+  if (volume.volume_state == kVolumeFailed)
+    return {"Failed", "its partition, format or mount failed",
+            "look at the kernel's log for errors of the disk", connect(target)};
+  if (volume.device.empty())
+    return {"No Disk", "its LUN has no disk here", "see whether the storage server still offers it",
+            connect(target)};
+  return {"Not Mounted", "is not mounted", "mount it again", connect(target)};
+}
+
+Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {
+  if (volume.format_state == kFormatRunning)
+    return {"Formatting", "is being formatted, " + std::to_string(volume.progress) + "%", "wait", ""};
+  if (volume.format_state == kFormatWaiting)
+    return {"Wait to Format", "waits until another volume is formatted", "wait", ""};
+  if (volume.volume_state == kBeingCreated) return {"Creating", "is being created", "wait", ""};
+  if (!facts.mounted) return problem_of_unmounted(target, volume);
+  // A write-protected LUN is read-only from the beginning, and the tree says so.
+  if (facts.read_only && !(facts.disk_read_only && volume.read_only))
+    return {"Read Only", "became read-only: its file system has errors, or the LUN was write-protected",
+            "disconnect it, check its file system with e2fsck, connect it again", connect(target)};
+  return kNone;
+}
+
+Row row_of(const Target& target, const TargetFacts& facts) {
+  Row row{&target,       nullptr, target.status, facts.session, facts.address, false, false, 0, 0,
+          target.wanted, {}};
+  if (row.wanted) row.problem = problem_of(target, facts);
+  if (!row.healthy()) row.status = row.problem.status;
+  return row;
+}
+
+// What the tree says of a volume is kept unless the volume is not as well as it says.
+std::string status_of(const Volume& volume, const Problem& problem) {
+  const bool tells_so = problem.what.empty() || !volume.status.starts_with("Running");
+  return tells_so && !volume.status.empty() ? volume.status : problem.status;
+}
+
+Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
+  const Volume& volume = target.volumes[at];
+  const VolumeFacts& facts = target_facts.volumes[at];
+  Row row = row_of(target, target_facts);
+  row.volume = &volume;
+  row.mounted = facts.mounted;
+  row.read_only = facts.mounted ? facts.read_only : volume.read_only;
+  row.used = facts.used;
+  row.size = facts.size;
+  row.wanted = target.wanted && volume.enabled;
+  if (!row.wanted) row.problem = kNone;
+  const bool lost = !row.healthy();
+  if (row.wanted && !lost) row.problem = problem_of(target, volume, facts);
+  row.status = lost ? row.problem.status : status_of(volume, row.problem);
+  return row;
+}
+
+}  // namespace
+
+std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& facts) {
+  std::vector<Row> rows;
+  for (size_t at = 0; at < status.targets.size(); ++at) {
+    const Target& target = status.targets[at];
+    if (target.volumes.empty()) rows.push_back(row_of(target, facts[at]));
+    for (size_t n = 0; n < target.volumes.size(); ++n) rows.push_back(row_of(target, facts[at], n));
+  }
+  return rows;
+}
+
+bool all_healthy(const std::vector<Row>& rows) {
+  return std::all_of(rows.begin(), rows.end(), [](const Row& row) { return row.healthy(); });
+}
+
+}  // namespace vvstat

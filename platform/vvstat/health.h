@@ -1,0 +1,47 @@
+// What is well and what is not: the tree and the kernel compared.
+#ifndef PLATFORM_VVSTAT_HEALTH_H
+#define PLATFORM_VVSTAT_HEALTH_H
+
+#include <string>
+#include <vector>
+
+#include "kernel.h"
+#include "status.h"
+
+namespace vvstat {
+
+// What is wrong with a volume or its target. Texts are ASCII without ends of lines, but for the target's name
+// in the command.
+struct Problem {
+  std::string status;   // for the status column, where the tree's text says that all is well
+  std::string what;     // goes behind "Photos: "; empty when nothing is wrong
+  std::string advice;   // what a person does about it
+  std::string command;  // that does it, if there is one
+};
+
+// A line of the report: a volume, or a target that has none.
+struct Row {
+  const Target* target;
+  const Volume* volume;  // null for a target without volumes
+  std::string status;    // as it is now
+  std::string session;   // the kernel's word for the session's state; empty without a session
+  std::string address;   // that the session is connected with
+  bool mounted;
+  bool read_only;           // mounted, and not to be written
+  unsigned long long used;  // bytes; 0 while it is not mounted
+  unsigned long long size;
+  bool wanted;      // it should be connected, and is not switched off
+  Problem problem;  // of one that is wanted
+
+  bool healthy() const { return problem.what.empty(); }
+};
+
+// The rows in the order of the tree. They point into `status`.
+std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& facts);
+
+// True when nothing that is wanted has a problem.
+bool all_healthy(const std::vector<Row>& rows);
+
+}  // namespace vvstat
+
+#endif

@@ -1,0 +1,34 @@
+// What the kernel says of the targets and volumes of the tree: it is newer than the tree, whose texts are as
+// old as the last command that wrote them.
+#ifndef PLATFORM_VVSTAT_KERNEL_H
+#define PLATFORM_VVSTAT_KERNEL_H
+
+#include <string>
+#include <vector>
+
+#include "status.h"
+
+namespace vvstat {
+
+struct VolumeFacts {
+  bool mounted = false;         // something is mounted on its mount point
+  bool read_only = false;       // that mount is
+  bool disk_read_only = false;  // the disk itself is: the LUN is write-protected
+  unsigned long long used = 0;  // bytes, while it is mounted
+  unsigned long long size = 0;
+};
+
+struct TargetFacts {
+  std::string session;               // its state: LOGGED_IN, FAILED, FREE; empty without a session
+  std::string address;               // the portal that it is connected with, without its port
+  std::vector<VolumeFacts> volumes;  // in the order of the tree
+};
+
+// Reads /sys/class/iscsi_session, statx(2), statvfs(3) and the disks' /sys/class/block/NAME/ro; none of it
+// waits for a disk. The facts are in the order of status.targets; what cannot be read counts as not there. Of
+// several sessions of one target the one that is logged in counts.
+std::vector<TargetFacts> read_facts(const Status& status);
+
+}  // namespace vvstat
+
+#endif
