@@ -10,18 +10,20 @@
 #include <cstring>
 
 #include "columns.h"
+#include "metrics.h"
 #include "verdict.h"
 #include "watch.h"
 
 namespace vvstat {
 namespace {
 
-constexpr int kAiling = 1, kUsage = 2, kUnreachable = 3;
+constexpr int kAiling = 1, kFailed = 2, kUnreachable = 3;
 
 struct Options {
   Layout layout;
   bool watch = false;
   bool ailing_only = false;
+  bool metrics = false;
   const char* name = nullptr;  // of a share or a target
 };
 
@@ -77,7 +79,7 @@ void put(std::string_view text) {
 int finish(int status) {
   if (ferror(stdout) == 0 && fflush(stdout) == 0) return status;
   fprintf(stderr, "vvstat: write error: %s\n", strerror(errno));
-  return kAiling;
+  return kFailed;
 }
 
 size_t width_of_output() {
@@ -101,6 +103,13 @@ int show_once(const Options& options) {
   return finish(exit_status(seen));
 }
 
+// For a collector of metrics the absence of the tree is news as well.
+int show_metrics() {
+  const Look seen = look();
+  put(metrics(seen.status.reachable, seen.rows));
+  return finish(exit_status(seen));
+}
+
 // Everything of the volume of that share, or of all volumes of that target.
 int show_one(const Options& options) {
   const Look seen = look();
@@ -115,7 +124,7 @@ int show_one(const Options& options) {
   }
   if (rows.empty()) {
     fprintf(stderr, "vvstat: there is no share and no target of this name\n");
-    return kUsage;
+    return kFailed;
   }
   if (options.layout.form != Form::kTable) {
     put(report(rows, options.layout));
@@ -149,26 +158,32 @@ constexpr char kHelp[] =
     "  -n, --noheadings    the rows alone\n"
     "  -r, --raw           the rows as plain text, blanks as \\x20\n"
     "  -J, --json          JSON, for programs\n"
+    "  -P, --prometheus    metrics in the text format of Prometheus\n"
     "  -h, --help          this text\n"
     "  -V, --version       the version\n"
     "Columns:\n";
 constexpr char kStatusHelp[] =
-    "Exit status: 0 all that is wanted is healthy, 1 something is not, 2 usage,\n"
-    "3 the configuration tree cannot be reached.\n";
+    "Exit status: 0 all that is wanted is healthy, 1 something is not, 2 wrong usage or the\n"
+    "output cannot be written, 3 the configuration tree cannot be reached.\n";
 
-constexpr option kLongOptions[] = {
-    {"unhealthy", no_argument, nullptr, 'x'},    {"watch", no_argument, nullptr, 'w'},
-    {"output", required_argument, nullptr, 'o'}, {"bytes", no_argument, nullptr, 'b'},
-    {"noheadings", no_argument, nullptr, 'n'},   {"raw", no_argument, nullptr, 'r'},
-    {"json", no_argument, nullptr, 'J'},         {"help", no_argument, nullptr, 'h'},
-    {"version", no_argument, nullptr, 'V'},      {}};
+constexpr option kLongOptions[] = {{"unhealthy", no_argument, nullptr, 'x'},
+                                   {"watch", no_argument, nullptr, 'w'},
+                                   {"output", required_argument, nullptr, 'o'},
+                                   {"bytes", no_argument, nullptr, 'b'},
+                                   {"noheadings", no_argument, nullptr, 'n'},
+                                   {"raw", no_argument, nullptr, 'r'},
+                                   {"json", no_argument, nullptr, 'J'},
+                                   {"prometheus", no_argument, nullptr, 'P'},
+                                   {"help", no_argument, nullptr, 'h'},
+                                   {"version", no_argument, nullptr, 'V'},
+                                   {}};
 
 // What reading the arguments came to: go on, or end with this status.
 constexpr int kGoOn = -1;
 
 int wrong_usage() {
   fputs("Try 'vvstat --help'.\n", stderr);
-  return kUsage;
+  return kFailed;
 }
 
 int take_columns(const char* names, Layout& layout) {
@@ -197,9 +212,11 @@ int take_option(int letter, Options& options) {
     case 'r':
       options.layout.form = Form::kRaw;
       return kGoOn;
-    case 'j':
     case 'J':
       options.layout.form = Form::kJson;
+      return kGoOn;
+    case 'P':
+      options.metrics = true;
       return kGoOn;
     case 'h':
       put(kHelp);
@@ -215,12 +232,13 @@ int take_option(int letter, Options& options) {
 }
 
 int take_arguments(int argc, char** argv, Options& options) {
-  for (int letter; (letter = getopt_long(argc, argv, "xwo:bnrjJhV", kLongOptions, nullptr)) != -1;) {
+  for (int letter; (letter = getopt_long(argc, argv, "xwo:bnrJPhV", kLongOptions, nullptr)) != -1;) {
     const int status = take_option(letter, options);
     if (status != kGoOn) return status;
   }
   if (optind < argc) options.name = argv[optind++];
-  return optind == argc && !(options.watch && options.name != nullptr) ? kGoOn : wrong_usage();
+  const bool alone = !options.metrics || (!options.watch && options.name == nullptr);
+  return optind == argc && alone && !(options.watch && options.name != nullptr) ? kGoOn : wrong_usage();
 }
 
 // Colour for a terminal, unless NO_COLOR asks for none (no-color.org).
@@ -236,6 +254,7 @@ int run(int argc, char** argv) {
   use_utf8();
   options.layout.colour = wants_colour();
   options.layout.width = width_of_output();
+  if (options.metrics) return show_metrics();
   if (options.name != nullptr) return show_one(options);
   return options.watch ? show_again(options) : show_once(options);
 }

@@ -93,6 +93,30 @@ def test_a_manual_page_has_every_option_of_its_program(program, page):
         assert re.search(rf"(?<![\w-]){option}(?![\w-])", plain(page)), option
 
 
+def test_the_monitoring_guide_has_every_metric(box):
+    box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/lun/id:1/lun": "1",
+                  "/iscsi/initiator/id:1/lun/id:1/format_state": "1", "/iscsi/initiator/id:1/lun/id:1/mnt": "/mnt/VV"})
+    box.path("/mnt/VV").mkdir(parents=True)
+    assert box.run(["/bin/mount", "-t", "tmpfs", "volume", "/mnt/VV"], env={"LD_PRELOAD": None}).status == 0
+    told = set(re.findall(r"^# TYPE (\w+)", box.run(["vvstat", "-P"], env={"LD_PRELOAD": None}).stdout, re.M))
+    guide = (DOCS / "monitoring.md").read_text()
+    assert told == set(re.findall(r"remvol_\w+", guide))
+
+
+@pytest.mark.parametrize("wanted, status, line", [
+    ("0", 0, "VOLUMES OK - nothing is wanted, as of "), ("1", 2, "VOLUMES CRITICAL - 1 of 1 needs attention, as of "),
+    (None, 3, "VOLUMES UNKNOWN - vvstat: the configuration tree cannot be reached")])
+def test_the_check_of_the_monitoring_guide(box, wanted, status, line):
+    check = box.write("/check_remvol", block(DOCS / "monitoring.md", "sh"), mode=0o755)
+    assert check
+    if wanted is None:
+        box.tree.stop()
+    else:
+        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/conn_set": wanted})
+    done = box.run(["/check_remvol"], env={"LD_PRELOAD": None})
+    assert (done.status, done.lines[0].startswith(line)) == (status, True), done.stdout
+
+
 PROGRAM = """
 #include <stdio.h>
 #include <ktreec.h>

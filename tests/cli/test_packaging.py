@@ -118,6 +118,44 @@ def test_modules_are_taken_away_again(kernel):
     assert not kernel.path("/usr/local/modules").exists()
 
 
+# --- metrics ---
+
+METRICS = "/var/lib/prometheus/node-exporter"
+
+
+def test_metrics_are_written_in_one_step(box):
+    box.path(METRICS).mkdir(parents=True)
+    box.write(f"{METRICS}/remvol.prom", "old")
+    box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/conn_set": "1"})
+    assert helper(box, "metrics").status == 0
+    assert [path.name for path in box.path(METRICS).iterdir()] == ["remvol.prom"]
+    file = box.path(f"{METRICS}/remvol.prom")
+    assert file.stat().st_mode & 0o777 == 0o644
+    assert 'remvol_target_wanted{target="iqn.t1"} 1\n' in file.read_text()
+
+
+def test_metrics_tell_of_a_tree_that_is_away(box):
+    box.path(METRICS).mkdir(parents=True)
+    box.tree.stop()
+    assert helper(box, "metrics").status == 0
+    assert box.path(f"{METRICS}/remvol.prom").read_text().endswith("\nremvol_tree_reachable 0\n")
+
+
+def test_metrics_that_cannot_be_written_leave_the_old_ones(box):
+    box.path("/metrics").mkdir()
+    assert box.run(["/bin/mount", "-t", "tmpfs", "-o", "size=4k,nr_inodes=10", "full", "/metrics"],
+                   env={"LD_PRELOAD": None}).status == 0
+    box.write("/metrics/remvol.prom", "x" * 4096)
+    assert helper(box, "metrics", "/metrics").status == 2
+    assert [path.name for path in box.path("/metrics").iterdir()] == ["remvol.prom"]
+    assert box.path("/metrics/remvol.prom").read_text() == "x" * 4096
+
+
+def test_a_machine_without_the_folder_is_told(box):
+    done = helper(box, "metrics", "/nowhere")
+    assert done.status != 0 and "/nowhere" in done.stderr
+
+
 # --- the tree at start ---
 
 
@@ -170,7 +208,7 @@ def test_a_unit_that_mounts_for_others_has_no_mounts_of_its_own(name):
     assert {"CapabilityBoundingSet", "SystemCallFilter", "RestrictNamespaces", "MemoryDenyWriteExecute"} <= set(service)
 
 
-@pytest.mark.parametrize("path", sorted((PACKAGING / "units").iterdir()), ids=lambda path: path.name)
+@pytest.mark.parametrize("path", sorted((PACKAGING / "units").glob("*.service")), ids=lambda path: path.name)
 def test_what_a_unit_starts_is_installed(path):
     unit = Unit(path.name)
     programs = {p.name for p in (PACKAGING / "helpers").iterdir()}

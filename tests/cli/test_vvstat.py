@@ -12,6 +12,7 @@ import termios
 import unicodedata
 
 import jsonschema
+import prometheus_client.parser
 import pytest
 
 SCHEMA = json.loads((pathlib.Path(__file__).resolve().parents[2] / "docs/vvstat.schema.json").read_text())
@@ -285,6 +286,49 @@ def test_json(example):
     assert volumes(example)[1]["progress"] == 37
 
 
+def metrics(box):
+    """The metrics as a monitor reads them: name -> {labels: value}."""
+    done = vvstat(box, "--prometheus")
+    families = list(prometheus_client.parser.text_string_to_metric_families(done.stdout))
+    assert all(family.documentation and family.type == "gauge" for family in families)
+    assert done.stdout.count("# TYPE") == len({family.name for family in families}) == len(families)
+    return {family.name: {tuple(sample.labels.values()): sample.value for sample in family.samples} for family in families}
+
+
+def test_metrics(example):
+    backup, photos = ("Backup", "0", T1_NAME), ("Fotos 日本", "1", T1_NAME)
+    change(example, {"lun/id:2/format_state": "1", "lun/id:2/format_progress": "37"})
+    run(example, "/bin/umount", "/mnt/VV/Fotos 日本")
+    assert metrics(example) == {
+        "remvol_tree_reachable": {(): 1},
+        "remvol_target_wanted": {(T1_NAME,): 1, ("iqn.t2",): 0},
+        "remvol_target_connected": {(T1_NAME,): 1, ("iqn.t2",): 0},
+        "remvol_volume_wanted": {backup: 1, photos: 1},
+        "remvol_volume_healthy": {backup: 1, photos: 0},
+        "remvol_volume_mounted": {backup: 1, photos: 0},
+        "remvol_volume_read_only": {backup: 0, photos: 0},
+        "remvol_volume_used_bytes": {backup: 3 << 19},
+        "remvol_volume_size_bytes": {backup: 20 << 20},
+        "remvol_volume_format_progress_percent": {photos: 37},
+    }
+    session(example, 3, T1_NAME, "FAILED")
+    assert metrics(example)["remvol_target_connected"] == {(T1_NAME,): 0, ("iqn.t2",): 0}
+    assert vvstat(example, "-P").status == 1
+
+
+def test_metrics_without_the_tree_say_so(box):
+    box.tree.stop()
+    assert metrics(box) == {"remvol_tree_reachable": {(): 0}}
+    assert vvstat(box, "-P").status == 3
+
+
+@pytest.mark.parametrize("name", ['a"b', "a\\b", "a\nb", "a\udcffb", "{x=}"])
+def test_metrics_of_a_name_with_marks(example, name):
+    change(example, {"lun/id:1/share": name})
+    shown = name.replace("\n", "\\x0A").replace("\udcff", "\\xFF")
+    assert (shown, "0", T1_NAME) in metrics(example)["remvol_volume_healthy"]
+
+
 def test_every_column_is_in_the_schema_and_the_help(example):
     names = set(re.findall(r"^  ([A-Z%-]+) ", vvstat(example, "--help").stdout, re.M))
     assert {name.lower() for name in names} == set(SCHEMA["properties"]["volumes"]["items"]["properties"])
@@ -374,7 +418,8 @@ def test_sentences_are_folded_to_the_screen(example):
 
 
 def test_secrets_are_not_shown(example):
-    assert "canary" not in vvstat(example).stdout + vvstat(example, "-J").stdout + vvstat(example, "Backup").stdout
+    for options in ([], ["-J"], ["-r"], ["-P"], ["Backup"]):
+        assert "canary" not in vvstat(example, *options).stdout
 
 
 @pytest.mark.parametrize("name, shown", [
@@ -401,7 +446,7 @@ def test_eight_targets_with_eight_volumes(box):
 
 
 @pytest.mark.parametrize("options, status", [(["--help"], 0), (["-h"], 0), (["--version"], 0), (["-V"], 0),
-                                             (["--nonsense"], 2), (["one", "more"], 2), (["-w", "Backup"], 2), (["-o"], 2)])
+                                             (["--nonsense"], 2), (["one", "more"], 2), (["-w", "Backup"], 2), (["-P", "Backup"], 2), (["-Pw"], 2), (["-o"], 2)])
 def test_the_usual_options(bare_box, options, status):
     done = vvstat(bare_box, *options)
     assert done.status == status
@@ -412,7 +457,7 @@ def test_the_usual_options(bare_box, options, status):
 @pytest.mark.parametrize("options", [[], ["--json"], ["Backup"], ["--help"]])
 def test_what_cannot_be_written_is_a_failure(example, options):
     done = example.run(["sh", "-c", '"$@" >/dev/full', "sh", "vvstat", *options], env={"LD_PRELOAD": None})
-    assert (done.status, done.stderr) == (1, "vvstat: write error: No space left on device\n")
+    assert (done.status, done.stderr) == (2, "vvstat: write error: No space left on device\n")
 
 
 # --- on a terminal ---
