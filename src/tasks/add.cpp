@@ -69,7 +69,11 @@ int _store_requested_lun(int* dbidx, int* lun_dbidx, Caller caller = Caller()) {
   drop_half_made_luns();
   *dbidx = ktree_add_entry(entry);
   if (*dbidx <= 0) return kFailed;
-  if (ktree_get_dbidx_by_lun(*dbidx, entry->lun) > 0) return kFailed;
+  const int stored = ktree_get_dbidx_by_lun(*dbidx, entry->lun);
+  if (stored > 0) {
+    ktree_complete_lun_entry(entry, stored);
+    return kFailed;
+  }
   if (ktree_check_duplicate_share_name(entry->share) != 0) {
     LOG_AT(caller, 0, "share name %s has benn used", entry->share);
     return kFailed;

@@ -25,12 +25,19 @@ void read_field(const char* key, char (&field)[N]) {
   if (tree_read(key, value)) copy_text(field, value);
 }
 
+// Every stored target has a port, which is stored again with what was changed: one that could not be read is
+// read once more.
+int read_port(const char* key) {
+  const int port = tree_read_number(key, 0);
+  return port != 0 ? port : tree_read_number(key, 0);
+}
+
 void read_target_fields(TargetEntry* entry, int dbidx) {
   entry->chap = tree_read_number(KeyText(key::kTargetChap, dbidx), 0);
   read_field(KeyText(key::kTargetChapName, dbidx), entry->chap_name);
   read_field(KeyText(key::kTargetChapPwd, dbidx), entry->chap_pwd);
   read_field(KeyText(key::kTargetIp, dbidx), entry->ip);
-  entry->port = tree_read_number(KeyText(key::kTargetPort, dbidx), 0);
+  entry->port = read_port(KeyText(key::kTargetPort, dbidx));
   entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
 }
 
@@ -39,6 +46,42 @@ int count_luns_at(int n) {
   int count = 0;
   while (count < kMaxLunsPerTarget && !tree_slot_is_free(KeyText(key::kLunNumber, n, count + 1))) count++;
   return count;
+}
+
+// A read that failed looks like a key that is not there. What is counted, or seems free and is to be written
+// to, is looked at once more.
+bool is_present(const char* key) {
+  return tree_present(key) || tree_present(key);
+}
+
+// Counts the LUNs of the slot `n` as it is now, also those behind an empty one.
+int count_all_luns_at(int n) {
+  int count = 0;
+  for (int m = 1; m <= kMaxLunsPerTarget; m++) count += is_present(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
+  return count;
+}
+
+// Returns where a target is to be stored, by a second look: its own slot, else `free`, which seems to be
+// free; kFailed when another target is there.
+int slot_to_take(int free, const char* target_name) {
+  bool taken = false;
+  for (int n = 1; n <= kMaxTargets; n++) {
+    char name[kValueSize];
+    if (!tree_read(KeyText(key::kTargetName, n), name)) continue;
+    if (strcmp(name, target_name) == 0) return n;
+    taken = taken || n == free;
+  }
+  return taken ? kFailed : free;
+}
+
+// Returns whether a LUN may be stored at `m`, by a second look: nothing is there, and it is nowhere else.
+bool may_take_lun_slot(int n, int m, int lun) {
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
+    char number[kValueSize];
+    if (tree_read(KeyText(key::kLunNumber, n, slot), number) && (slot == m || atoi(number) == lun))
+      return false;
+  }
+  return true;
 }
 
 int read_state(const char* key, bool stored, int* value, int missing) {
@@ -170,7 +213,7 @@ int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int 
 int ktree_update_current_targetcnt() {
   const SlotsHeld held;
   int count = 0;
-  for (int n = 1; n <= kMaxTargets; n++) count += tree_present(KeyText(key::kTargetName, n)) ? 1 : 0;
+  for (int n = 1; n <= kMaxTargets; n++) count += is_present(KeyText(key::kTargetName, n)) ? 1 : 0;
   return tree_write_with_tries(key::kTargetCount, NumberText("%d", count));
 }
 
@@ -204,13 +247,25 @@ int ktree_update_current_luncnt(int dbidx) {
   const HeldSlot slot(dbidx);
   if (!slot) return kTreeFailed;
   const int n = slot.target();
-  int count = 0;
-  for (int m = 1; m <= kMaxLunsPerTarget; m++) {
-    count += tree_present(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
-  }
-  const int result = tree_write_with_tries(KeyText(key::kTargetLunCount, n), NumberText("%d", count));
+  const int result =
+      tree_write_with_tries(KeyText(key::kTargetLunCount, n), NumberText("%d", count_all_luns_at(n)));
   const int total_result = ktree_refresh_total_luncnt();
   return result != kOk ? result : total_result;
+}
+
+void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  const int n = entry->db_idx;
+  char share[kValueSize];
+  if (!tree_read(KeyText(key::kLunShare, n, lun_dbidx), share) || strcmp(share, entry->share) != 0) return;
+  const KeyText number(key::kLunNumber, n, lun_dbidx);
+  const KeyText enable(key::kLunEnable, n, lun_dbidx);
+  const KeyText right(key::kLunAccessRight, n, lun_dbidx);
+  const Caller here;
+  if (tree_is_missing(enable, number)) set_value(enable, 1, here);
+  if (tree_is_missing(right, number)) set_value(right, VOL_AC_RW, here);
+  if (tree_read_number(KeyText(key::kTargetLunCount, n), 0) != count_all_luns_at(n))
+    ktree_update_current_luncnt(n);
 }
 
 int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value) {
@@ -289,7 +344,7 @@ int ktree_add_lun_entry(TargetEntry* entry) {
   const int n = entry->db_idx >= 1 ? entry->db_idx : ktree_get_dbidx_by_targetname(entry->target_name);
   if (n < 1 || ktree_get_dbidx_by_lun(n, entry->lun) >= 1) return kFailed;
   const int m = ktree_get_free_lun_dbidx(n);
-  if (m <= 0) return kFailed;
+  if (m <= 0 || !may_take_lun_slot(n, m, entry->lun)) return kFailed;
   entry->lun_db_idx = m;
   remember_lun(n, m, entry->lun);
   const Caller here;
@@ -309,11 +364,14 @@ int ktree_add_entry(TargetEntry* entry) {
   if (entry->chap != 0 && (entry->chap_name[0] == '\0' || entry->chap_pwd[0] == '\0')) return kFailed;
   const SlotsHeld held(SlotsHeld::kChange);
   int n = ktree_get_dbidx_by_targetname(entry->target_name);
-  if (n < 1) n = ktree_get_free_dbidx();
+  const bool known = n >= 1;
+  if (!known) n = ktree_get_free_dbidx();
   if (n < 1) {
     LOG(0, "ktree_get_free_dbidx() failed");
     return kFailed;
   }
+  if (!known) n = slot_to_take(n, entry->target_name);
+  if (n < 1) return kFailed;
   entry->db_idx = n;
   remember_target(n, entry->target_name);
   const Caller here;

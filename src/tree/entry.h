@@ -79,6 +79,10 @@ int ktree_get_dbidx_by_lun(int dbidx, int lun);
 // free; -103 when a write failed (the writes before it stay).
 int ktree_add_lun_entry(TargetEntry* entry);
 
+// Gives a stored LUN what a killed run has left out, when its share is the one of `entry`: whether it is
+// enabled, its access right, and its place in the target's count.
+void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx);
+
 // Stores the target fields of `entry` in the slot of its name, or in a free one, and sets db_idx. Returns the
 // slot; -1 when the name or address is empty, the port negative, CHAP is on without user or secret, no slot
 // is free, or a write failed (the other writes still run).

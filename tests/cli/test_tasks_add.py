@@ -330,3 +330,83 @@ class TestCheckShareName:
     def test_without_a_name(self, site, box):
         assert box.remvol("--check_share_name").status == 255
         assert box.tree.get("/result/check_share_name") == "-1"
+
+
+class TestReadThatFails:
+    """One read of the tree, the first or a later one, gives nothing: it looks like a slot that is free."""
+
+    @pytest.fixture
+    def three(self, site):
+        for n, name in enumerate(("iqn.t1", "iqn.t2", "iqn.t3"), 1):
+            site.store(name, slot=n, luns=[(f"{name[-2:]}a", 0), (f"{name[-2:]}b", 1)])
+        return site
+
+    def stored(self, box):
+        slots = {path: value for path, value in settings(box).items() if path.endswith(("/target", "/lun", "/share"))}
+        return {path.removeprefix("/iscsi/initiator/"): value for path, value in slots.items()}
+
+    def failing(self, box, key, skip):
+        box.hook("ktreec_get_wb", f"/iscsi/initiator/{key}", ret=-1, skip=skip, times=1)
+
+    @pytest.mark.parametrize("key", ["id:1/target", "id:2/target", "id:3/target"])
+    @pytest.mark.parametrize("skip", range(5))
+    def test_a_new_target_takes_no_slot_that_is_taken(self, three, box, key, skip):
+        before = self.stored(box)
+        self.failing(box, key, skip)
+        done = add(box, n="iqn.t4")
+        new = {"id:4/target": "iqn.t4", "id:4/lun/id:1/lun": "0", "id:4/lun/id:1/share": "data"}
+        assert self.stored(box) == (before if done.status else {**before, **new})
+
+    @pytest.mark.parametrize("key", ["id:1/target", "id:2/target", "id:2/lun/id:1/lun", "id:2/lun/id:2/lun"])
+    @pytest.mark.parametrize("skip", range(6))
+    def test_a_stored_target_is_not_stored_twice(self, three, box, key, skip):
+        before = self.stored(box)
+        self.failing(box, key, skip)
+        done = add(box, n="iqn.t2", l="2")
+        new = {"id:2/lun/id:3/lun": "2", "id:2/lun/id:3/share": "data"}
+        assert self.stored(box) == (before if done.status else {**before, **new})
+        assert done.status or (three.target("lun/count", 2), box.tree.get("/iscsi/initiator/count")) == ("3", "3")
+
+    @pytest.mark.parametrize("key", ["id:2/lun/id:1/lun", "id:2/lun/id:2/lun"])
+    @pytest.mark.parametrize("skip", range(3))
+    def test_a_stored_lun_is_not_stored_twice(self, three, box, key, skip):
+        before = self.stored(box)
+        self.failing(box, key, skip)
+        assert add(box, n="iqn.t2", l="1").status == 255
+        assert self.stored(box) == before
+
+    @pytest.mark.parametrize("key", ["id:2/lun/id:1/share", "id:2/lun/id:2/share"])
+    @pytest.mark.parametrize("skip", range(3))
+    def test_a_share_name_is_not_given_twice(self, three, box, key, skip):
+        before = self.stored(box)
+        self.failing(box, key, skip)
+        assert add(box, n="iqn.t1", l="2", s="t2b").status == 255
+        assert self.stored(box) == before
+
+
+class TestHalfStoredLun:
+    """What an --add that was killed between its values has left is completed by the same --add, which is refused."""
+
+    @pytest.fixture
+    def half(self, site, box):
+        site.store("iqn.t1", luns=[("a", 0), ("data", 1)])
+        box.tree.delete("/iscsi/initiator/id:1/lun/id:2/enable")
+        box.tree.delete("/iscsi/initiator/id:1/lun/id:2/vol_access_right")
+        box.tree.set("/iscsi/initiator/id:1/lun/count", 1)
+        box.tree.set("/iscsi/initiator/total_lun_count", 1)
+        return site
+
+    def test_it_is_completed(self, half, box):
+        assert add(box, l="1").status == 255
+        assert (half.lun("enable", 2), half.lun("vol_access_right", 2), half.target("lun/count")) == ("1", "1", "2")
+        assert box.tree.get("/iscsi/initiator/total_lun_count") == "2"
+
+    def test_under_another_share_name_it_stays(self, half, box):
+        assert add(box, l="1", s="other").status == 255
+        assert (half.lun("enable", 2), half.lun("share", 2), half.target("lun/count")) == (None, "data", "1")
+
+    def test_a_volume_that_was_disabled_stays_so(self, site, box):
+        site.store("iqn.t1", luns=[("data", 0, {"enable": 0, "vol_access_right": 0})])
+        box.forget()
+        assert add(box).status == 255
+        assert (site.lun("enable"), site.lun("vol_access_right")) == ("0", "0")
