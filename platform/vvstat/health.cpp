@@ -20,7 +20,21 @@ std::string connect(const Target& target) {
   return "remvol --connect -n " + quoted(target.name);
 }
 
+// The tool stores that a target is not to be connected when somebody disconnects it, but also when a login
+// fails that somebody asked for.
+bool is_wanted(const Target& target) {
+  return target.wanted || target.connect_state == kConnected || target.connect_state == kConnecting ||
+         target.connect_state == kConnectError;
+}
+
 constexpr char kHealsItself[] = "look at the network and the storage server; it heals by itself";
+
+// It stores so as well when a session shows no disk at start-up; the volumes' state alone tells that from a
+// disconnection.
+Problem given_up(const Target& target) {
+  return {"Given Up", "was given up at start-up: its target showed no disk",
+          "see whether the storage server still offers its LUNs", connect(target)};
+}
 
 // Nothing of a target's volumes can be had while it has a problem.
 Problem problem_of(const Target& target, const TargetFacts& facts) {
@@ -76,8 +90,8 @@ Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts
 }
 
 Row row_of(const Target& target, const TargetFacts& facts) {
-  Row row{&target,       nullptr, target.status, facts.session, facts.address, false, false, 0, 0,
-          target.wanted, {}};
+  Row row{&target,           nullptr, target.status, facts.session, facts.address, false, false, 0, 0,
+          is_wanted(target), {}};
   if (row.wanted) row.problem = problem_of(target, facts);
   if (!row.healthy()) row.status = row.problem.status;
   return row;
@@ -98,7 +112,11 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
   row.read_only = facts.mounted ? facts.read_only : volume.read_only;
   row.used = facts.used;
   row.size = facts.size;
-  row.wanted = target.wanted && volume.enabled;
+  if (!row.wanted && volume.volume_state == kGivenUp) {
+    row.wanted = true;
+    row.problem = given_up(target);
+  }
+  row.wanted = row.wanted && volume.enabled;
   if (!row.wanted) row.problem = kNone;
   const bool lost = !row.healthy();
   if (row.wanted && !lost) row.problem = problem_of(target, volume, facts);

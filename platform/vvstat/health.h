@@ -30,7 +30,7 @@ struct Row {
   bool read_only;           // mounted, and not to be written
   unsigned long long used;  // bytes; 0 while it is not mounted
   unsigned long long size;
-  bool wanted;      // it should be connected, and is not switched off
+  bool wanted;      // it should be connected, as far as can be told, and is not switched off
   Problem problem;  // of one that is wanted
 
   bool healthy() const { return problem.what.empty(); }

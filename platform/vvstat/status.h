@@ -27,7 +27,7 @@ struct Target {
   std::string name;
   std::string address;
   int port;
-  bool wanted;        // it should be connected
+  bool wanted;        // it is to be connected at start-up
   int connect_state;  // -1: unknown, 0: disconnected, 1: connected, 2: connecting, 3: lost, 4: login failed
   std::string status;
   std::vector<Volume> volumes;
@@ -41,7 +41,7 @@ struct Status {
 // Values of connect_state, format_state and volume_state.
 inline constexpr int kConnected = 1, kConnecting = 2, kRecovering = 3, kConnectError = 4;
 inline constexpr int kFormatRunning = 1, kFormatFailed = 3, kFormatWaiting = 4;
-inline constexpr int kBeingCreated = 1, kVolumeFailed = 3, kUnsupported = 5;
+inline constexpr int kBeingCreated = 1, kVolumeFailed = 3, kGivenUp = 4, kUnsupported = 5;
 
 Status read_status(const platform::TreeReader& tree);
 

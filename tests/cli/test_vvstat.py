@@ -146,6 +146,14 @@ TREE_PROBLEMS = [
     ({"lun/id:1/format_state": "4", "lun/id:1/status": "Wait to Format"}, "Wait to Format",
      "waits until another volume is formatted", None),
     ({"lun/id:1/volume_state": "1", "lun/id:1/status": "Creating Volume"}, "Creating Volume", "is being created", None),
+    # A connection that somebody asked for and that failed is not stored as one that is wanted.
+    ({"conn_set": "0", "conn_state": "4"}, "Connect Error", "the login failed", CONNECT),
+    ({"conn_set": "0", "conn_state": "2"}, "Connecting", "is being connected", None),
+    ({"conn_set": "0", "lun/id:1/format_state": "4", "lun/id:1/status": "Wait to Format"}, "Wait to Format",
+     "waits until another volume is formatted", None),
+    # Nor is one that was given up at start-up.
+    ({"conn_set": "0", "conn_state": "0", "lun/id:1/volume_state": "4"}, "Given Up",
+     "was given up at start-up: its target showed no disk", CONNECT),
 ]
 UNMOUNTED_PROBLEMS = [
     ({}, "Not Mounted", "is not mounted", CONNECT),
@@ -231,7 +239,9 @@ def test_a_volume_that_the_tree_takes_for_lost_is_well_when_it_is(example):
     assert vvstat(example).status == 0
 
 
-@pytest.mark.parametrize("values", [{"conn_set": "0", "conn_state": "4"}, {"conn_set": "0", "conn_state": "0"},
+@pytest.mark.parametrize("values", [{"conn_set": "0", "conn_state": "0"}, {"conn_set": "0", "conn_state": "3"},
+                                    {"conn_set": "0", "conn_state": "0", "lun/id:1/volume_state": "3"},
+                                    {"conn_set": "0", "conn_state": "0", "lun/id:1/volume_state": "4", "lun/id:1/enable": "0"},
                                     {"lun/id:1/enable": "0", "lun/id:2/enable": "0", "lun/id:1/volume_state": "3"}])
 def test_what_is_not_wanted_needs_no_attention(example, values):
     run(example, "/bin/umount", "/mnt/VV/Backup")
