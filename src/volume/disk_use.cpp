@@ -64,6 +64,15 @@ bool is_udev_at(const char* disk) {
 
 }  // namespace
 
+DiskHeld::DiskHeld(const char* partition) {
+  const Text<512> disk("/dev/%s", disk_of_node(partition).c_str());
+  if (strcmp(disk, partition) != 0) fd_ = open(disk, O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+}
+
+DiskHeld::~DiskHeld() {
+  if (fd_ >= 0) close(fd_);
+}
+
 ContentMark content_mark(const char* node) {
   struct stat status;
   if (!is_block_device(node, &status)) return kNoMark;

@@ -11,6 +11,20 @@ namespace remvol {
 using ContentMark = uint64_t;
 inline constexpr ContentMark kNoMark = 0;  // it cannot be read
 
+// Keeps the disk of a partition's node open. For so long the kernel gives the disk's name to no other,
+// whatever becomes of its session. A node that is the disk itself is not opened: whoever ends its users would
+// end this run.
+class DiskHeld {
+ public:
+  explicit DiskHeld(const char* partition);
+  ~DiskHeld();
+  DiskHeld(const DiskHeld&) = delete;
+  DiskHeld& operator=(const DiskHeld&) = delete;
+
+ private:
+  int fd_ = -1;
+};
+
 // Returns the mark of the first 4 KiB, where every file system that the tool makes has its signature.
 ContentMark content_mark(const char* node);
 

@@ -179,6 +179,7 @@ int make_file_system(TargetEntry* entry, const char* partition, Caller caller = 
   note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0), caller);
   note_update(ktree_update_lun_status(entry, 1), caller);
   LOG_AT(caller, 2, "format partition %s", partition);
+  const DiskHeld disk(partition);
   int result = end_users(entry, partition, caller);
   if (result != 0) return result;
   FsName fs_type;

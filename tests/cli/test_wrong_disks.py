@@ -132,6 +132,12 @@ class TestNamesThatMoved:
         assert box.run(["cat", "/proc/sysvipc/sem"]).lines[1:] == [], "the semaphore is left"
 
 
+    @pytest.mark.parametrize("step", ["fuser", "dd", "mke2fs"])
+    def test_a_disk_keeps_its_name_while_it_is_formatted(self, volume, box, step):
+        box.fake(step, effect="ls -l /proc/[0-9]*/fd 2>/dev/null | grep -c '/dev/sdb$' >/root/open", first=True)
+        drive(box, "format", 1, 1, "/dev/sdb1")
+        assert box.path("/root/open").read_text() == "1\n", "whoever has the disk open keeps its name from being given anew"
+
     @pytest.mark.parametrize("change", [turns_into_another(), GOES])
     def test_a_disk_that_moves_away_before_the_mount_is_not_mounted(self, volume, box, change):
         box.run(["umount", "/mnt/VV/data"], env={"LD_PRELOAD": None, "PATH": "/bin:/usr/bin"})
