@@ -6,8 +6,6 @@
 
 #include <cstdio>
 #include <cstdlib>
-#include <memory>
-#include <new>
 
 #include "frontend/commands.h"
 #include "frontend/log.h"
@@ -15,6 +13,7 @@
 #include "frontend/remvol_debug.h"
 #include "frontend/request.h"
 #include "ktreec.h"
+#include "support/memory.h"
 #include "support/run_lock.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -132,7 +131,7 @@ void log_arguments(int argc, char** argv, const int* shown, Caller caller) {
 
 int main(int argc, char** argv) {
   leave_no_core();
-  const std::unique_ptr<int[]> shown(new (std::nothrow) int[static_cast<size_t>(argc) + 1]);
+  const Memory<int> shown = allocate<int>(static_cast<size_t>(argc) + 1);
   if (!shown) return fail(false);
   hide_secrets(argc, argv, shown.get());
   debug_level = dbg_get_remvol_debug_lv();

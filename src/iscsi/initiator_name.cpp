@@ -59,7 +59,7 @@ int get_mac_as_unique_name(char* out) {
   if (out != nullptr && strlen(mac) == kMacTextLength) {
     Text<16> name;
     if (!read_octets(mac + kLastOctets, &name)) result = kFailed;
-    snprintf(out, kUniqueNameLength + 1, "%s", name.c_str());
+    snprintf(out, kUniqueNameLength + 1, "%.*s", static_cast<int>(kUniqueNameLength), name.c_str());
     if (strlen(name) != kUniqueNameLength) {
       LOG(0, "error : unique_name = %s", name.c_str());
       result = kFailed;

@@ -80,8 +80,9 @@ int search_luns(const char* socket, Caller caller) {
   const char* name = request_target.target_name;
   std::optional<BriefTargetHold> hold;
   int connected = check_target_connected(name);
-  if (connected == 0) hold.emplace(name, is_no_lun_formatting);
-  if (hold && hold->waited()) connected = check_target_connected(name);
+  if (connected == 0 && hold.emplace(name, is_no_lun_formatting).waited()) {
+    connected = check_target_connected(name);
+  }
   bool logged_in = false;
   int result = open_session(socket, connected, &logged_in, caller);
   if (result == kOk) result = publish_luns(socket, caller);

@@ -20,37 +20,44 @@ constexpr string_view kHostNumber = "Host Number: ";
 constexpr string_view kLunNumber = "Lun: ";
 constexpr string_view kAttachedDisk = "Attached scsi disk";
 
+// In place of substr(), remove_prefix() and remove_suffix(), which would make the tool load the C++ library
+// for the case that there is less text.
+string_view behind(string_view text, size_t length) {
+  return {text.data() + length, text.size() - length};
+}
+
+string_view without_end(string_view text, string_view end) {
+  return text.ends_with(end) ? string_view(text.data(), text.size() - end.size()) : text;
+}
+
 string_view without_newline(string_view line) {
-  if (line.ends_with('\n')) line.remove_suffix(1);
-  return line;
+  return without_end(line, "\n");
 }
 
 // Since 2.0.874 iscsiadm says behind the name whether the kernel made the session at boot from flash.
 string_view without_flash_mark(string_view line) {
-  for (const string_view mark : {string_view(" (non-flash)"), string_view(" (flash)")}) {
-    if (line.ends_with(mark)) return line.substr(0, line.size() - mark.size());
-  }
-  return line;
+  const string_view text = without_end(line, " (non-flash)");
+  return text.size() < line.size() ? text : without_end(line, " (flash)");
 }
 
 bool is_line_of_target(string_view line, string_view name) {
   const string_view text = without_flash_mark(without_newline(line));
   const size_t blank = text.rfind(' ');
-  return blank != string_view::npos && text.substr(blank + 1) == name;
+  return blank != string_view::npos && behind(text, blank + 1) == name;
 }
 
 // Puts the text behind the first `label` into `value`. Returns false when the line does not contain it.
 bool read_value(string_view line, string_view label, string_view* value) {
   const size_t at = line.find(label);
   if (at == string_view::npos) return false;
-  *value = line.substr(at + label.size());
+  *value = behind(line, at + label.size());
   return true;
 }
 
 // `text` is what follows the disk label: a blank, the device name, a TAB and the state of the disk.
 ListingLine read_disk(DetailedListing* listing, string_view text) {
   if (text.empty()) return ListingLine::kOther;  // cut right behind the label
-  text.remove_prefix(1);
+  text = behind(text, 1);
   if (text.find("running") == string_view::npos) return ListingLine::kOther;
   listing->disk = text.data();
   // A kernel name holds no white space: without a TAB, any of it ends the name.
@@ -136,15 +143,15 @@ bool read_discovered_name(const char* line, char (&name)[kListingLineSize]) {
   string_view text = without_newline(line);
   const size_t blank = text.find(' ');
   if (blank == string_view::npos) return false;
-  const string_view whole = text.substr(blank + 1);
+  const string_view whole = behind(text, blank + 1);
   NameWriter out{name};
   out.append("");
   bool has_argument = true;
   text = whole;
   for (size_t at = text.find('%'); at != string_view::npos; at = text.find('%')) {
-    out.append(text.substr(0, at));
-    text.remove_prefix(at + 1);
-    text.remove_prefix(append_directive(&out, text, whole, &has_argument));
+    out.append(string_view(text.data(), at));
+    text = behind(text, at + 1);
+    text = behind(text, append_directive(&out, text, whole, &has_argument));
   }
   out.append(text);
   return true;

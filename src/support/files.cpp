@@ -11,6 +11,7 @@
 #include <cstring>
 
 #include "frontend/log.h"
+#include "support/memory.h"
 #include "support/text.h"
 
 namespace remvol {
@@ -58,7 +59,7 @@ int check_path_exist(const char* path) {
 int make_dir_include_parent(const char* path, mode_t mode) {
   if (path == nullptr) return -1;
   if (mode == 0) mode = 0700;
-  const std::unique_ptr<char, decltype(&free)> copy(strdup(path), &free);
+  const Memory<char> copy(strdup(path));
   if (copy == nullptr) {
     LOG(0, "strdup fail");
     return -1;

@@ -5,10 +5,9 @@
 
 #include <cstdlib>
 #include <cstring>
-#include <memory>
-#include <new>
 
 #include "frontend/log.h"
+#include "support/memory.h"
 #include "support/result.h"
 #include "support/session_hold.h"
 #include "support/shell_text.h"
@@ -338,8 +337,8 @@ int remount_mnt_path(const char* path, int wait_seconds) {
     return kFailed;
   }
   const size_t size = 2 * (strlen(path) + 25);  // room for a path of which every character is escaped
-  const std::unique_ptr<char[]> escaped(new (std::nothrow) char[size]);
-  const std::unique_ptr<char[]> command(new (std::nothrow) char[size]);
+  const Memory<char> escaped = allocate<char>(size);
+  const Memory<char> command = allocate<char>(size);
   if (!escaped || !command) {
     LOG(0, "malloc failed");
     return kFailed;

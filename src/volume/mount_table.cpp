@@ -5,9 +5,9 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <memory>
 
 #include "support/files.h"
+#include "support/memory.h"
 #include "support/text.h"
 
 namespace remvol {
@@ -16,10 +16,6 @@ namespace {
 
 constexpr char kMountInfo[] = "/proc/self/mountinfo";
 constexpr int kFieldsUpToPath = 5;
-
-struct Freer {
-  void operator()(char* text) const { free(text); }
-};
 
 bool is_octal(char c) {
   return c >= '0' && c <= '7';
@@ -76,7 +72,7 @@ Mounted search_table(Fits fits, MountLine* mount) {
   while (found == Mounted::no && getline(&buffer, &size, table.get()) > 0) {
     if (parse_line(buffer, mount) && fits(*mount)) found = Mounted::yes;
   }
-  const std::unique_ptr<char, Freer> owner(buffer);
+  const Memory<char> owner(buffer);
   return found == Mounted::no && ferror(table.get()) != 0 ? Mounted::unknown : found;
 }
 

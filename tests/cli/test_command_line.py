@@ -2,10 +2,12 @@
 
 import re
 import signal
+import subprocess
 
 import pytest
 
 from harness import messages, said
+from harness.ktree_daemon import BUILD
 
 USAGE = (
     "use: {} [\n\t--init\n\t--search -i IP -p port\n"
@@ -27,6 +29,20 @@ NEEDS = {"search": 12, "add": 109, "del": 1, "format": 65, "modify": 3, "check_s
 
 def options_for(bits):
     return [word for bit, words in GIVEN.items() if bits & bit for word in words]
+
+
+@pytest.mark.unsanitized  # a sanitizer brings its own
+class TestTheProgram:
+    """It is loaded once for every request."""
+
+    def test_it_needs_the_platform_and_the_c_library_alone(self):
+        table = subprocess.run(["readelf", "-d", BUILD / "bin/remvol"], capture_output=True, text=True, check=True).stdout
+        needed = re.findall(r"NEEDED.*\[(\w+)\.so", table)
+        assert sorted(needed) == ["libc", "libktreec", "libostel_common", "libsysaux"]
+
+    def test_it_is_small(self, tmp_path):
+        subprocess.run(["strip", "-o", tmp_path / "remvol", BUILD / "bin/remvol"], check=True)
+        assert (tmp_path / "remvol").stat().st_size <= 150 * 1000
 
 
 class TestUsage:

@@ -3,7 +3,6 @@
 
 #include <filesystem>
 #include <fstream>
-#include <new>
 #include <regex>
 
 #include "volume_fixture.h"
@@ -16,11 +15,12 @@ int allocations = -1;  // how many allocations that may fail are left before the
 
 }  // namespace
 
-// In front of the library's.
-void* operator new[](size_t size, const std::nothrow_t&) noexcept {
+// In front of the library's, by the linker.
+extern "C" void* __real_calloc(size_t count, size_t size);
+extern "C" void* __wrap_calloc(size_t count, size_t size) {
   if (allocations == 0) return nullptr;
   if (allocations > 0) allocations--;
-  return ::operator new[](size);
+  return __real_calloc(count, size);
 }
 
 namespace {
