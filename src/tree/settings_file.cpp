@@ -35,12 +35,20 @@ struct Tag {
   bool opens() const { return !is_markup() && !closes() && last != '/'; }
 };
 
+// The text of the file, as far as it is looked at. (Not by ftell(3), which asks the kernel each time.)
+struct FileText {
+  FILE* file;
+  long left = kMostRead;
+
+  int next() { return left-- > 0 ? getc(file) : EOF; }
+};
+
 // Reads on to the next tag. Returns whether there is one.
-bool next_tag(FILE* file, Tag* tag) {
+bool next_tag(FileText* text, Tag* tag) {
   *tag = Tag();
   bool inside = false;
   size_t length = 0;
-  for (int c; ftell(file) < kMostRead && (c = getc(file)) != EOF;) {
+  for (int c; (c = text->next()) != EOF;) {
     if (inside && c == '>') return true;
     if (inside) {
       tag->last = static_cast<char>(c);
@@ -52,17 +60,17 @@ bool next_tag(FILE* file, Tag* tag) {
 }
 
 // Returns whether text follows, not the next tag.
-bool has_text(FILE* file) {
-  const int c = getc(file);
+bool has_text(FileText* text) {
+  const int c = text->next();
   return c != EOF && c != '<';
 }
 
-bool find_version(FILE* file) {
+bool find_version(FileText text) {
   int depth = 0;
   int on_path = 0;  // how many of the open elements lead to the version
-  for (Tag tag; depth >= 0 && next_tag(file, &tag);) {
+  for (Tag tag; depth >= 0 && next_tag(&text, &tag);) {
     if (tag.opens() && on_path == depth && tag.is_named(kVersionPath[depth])) on_path++;
-    if (on_path == kVersionDepth) return has_text(file);
+    if (on_path == kVersionDepth) return has_text(&text);
     if (tag.opens()) depth++;
     if (tag.closes()) depth--;
     if (on_path > depth) on_path = depth;
@@ -83,7 +91,7 @@ void tell_failed_dump(Caller caller) {
 
 bool settings_file_has_version(const char* path) {
   const File file(fopen(path, "re"));
-  return file != nullptr && find_version(file.get());
+  return file != nullptr && find_version({file.get()});
 }
 
 bool settings_file_is_torn(const char* path) {
