@@ -75,8 +75,8 @@ LockTry RunLock::try_existing(const char* name, LockMode mode) {
   return open_and_lock(name, 0, operation_of(mode) | LOCK_NB);
 }
 
-void RunLock::take_again(const char* name, LockMode mode) {
-  if (fd_ < 0 || !lock_file(fd_, operation_of(mode))) take(name, mode);
+LockTry RunLock::take_again(const char* name, LockMode mode) {
+  return fd_ >= 0 && lock_file(fd_, operation_of(mode)) ? LockTry::kTaken : take(name, mode);
 }
 
 // Unlocked by name, not by closing alone: a child that was forked meanwhile shares the open file.

@@ -45,7 +45,8 @@ class RunLock {
   [[nodiscard]] LockTry try_existing(const char* name, LockMode mode);
 
   // Takes a lock again that was paused, or takes it for the first time: for one that is held many times.
-  void take_again(const char* name, LockMode mode);
+  // Returns kTaken or kNone.
+  LockTry take_again(const char* name, LockMode mode);
 
   // Lets the lock go, and keeps its file open.
   void pause();

@@ -38,7 +38,7 @@ int _delete_slot(int dbidx, int lun_dbidx, Caller caller) {
   const KeyText key =
       lun_dbidx > 0 ? KeyText(key::kLun, slot.target(), slot.lun()) : KeyText(key::kTarget, slot.target());
   for (int tries = 0; tries < kDeleteTries; tries++) {
-    if (tree_delete(key) == kOk) return kOk;
+    if (delete_slot(key) == kOk) return kOk;
     LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", key.c_str());
   }
   return kNotDeleted;

@@ -46,24 +46,23 @@ bool shows_ended_work(const TargetEntry* target) {
   return any_text_tells_of_work(target->db_idx) && IdleTarget(target->target_name);
 }
 
-void repair_target_state(const TargetEntry* target) {
+int repair_target_state(const TargetEntry* target) {
   int state = kDisconnected;
   ktree_get_connect_state(target->db_idx, &state);
-  if (state != kConnecting || !IdleTarget(target->target_name)) return;
+  if (state != kConnecting || !IdleTarget(target->target_name)) return state;
   ktree_set_connect_state(target->db_idx, kDisconnected);
+  ktree_get_connect_state(target->db_idx, &state);
+  return state;
 }
 
-void repair_lun_state(const TargetEntry* lun) {
-  int format_state = kFormatIdle;
-  int volume_state = kVolumeNormal;
-  ktree_get_lun_format_state(lun->db_idx, lun->lun_db_idx, &format_state);
-  ktree_get_lun_volume_state(lun->db_idx, lun->lun_db_idx, &volume_state);
-  if (!is_format_under_way(format_state) && volume_state != kVolumeCreating) return;
+void repair_lun_state(const TargetEntry* lun, LunState* state) {
+  if (!is_format_under_way(state->format) && state->volume != kVolumeCreating) return;
   const IdleTarget idle(lun->target_name, lun->lun);
   if (!idle) return;
   if (lun->dev[0] != '\0' && has_process("mke2fs", Text<32>("/dev/%s", lun->dev))) return;
-  if (is_format_under_way(format_state)) ktree_update_formatting_state(lun, kFormatIdle);
-  if (volume_state == kVolumeCreating) ktree_update_volume_state(lun, kVolumeNormal);
+  if (is_format_under_way(state->format)) ktree_update_formatting_state(lun, kFormatIdle);
+  if (state->volume == kVolumeCreating) ktree_update_volume_state(lun, kVolumeNormal);
+  (void)read_lun_state(lun->db_idx, lun->lun_db_idx, state);
 }
 
 }  // namespace remvol

@@ -20,43 +20,51 @@ namespace remvol {
 
 namespace {
 
-// Refreshes the status texts of the LUNs of the target at `dbidx`, with `entry` as the record for each.
-void _refresh_luns(TargetEntry* entry, int dbidx) {
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
-    if (ktree_get_lun_entry_by_dbidx(entry, dbidx, slot) != kOk) break;
-    repair_lun_state(entry);
-    int format_state = kFormatIdle;
-    ktree_get_lun_format_state(dbidx, slot, &format_state);
-    ktree_update_lun_status(entry, format_state == kFormatting ? 1 : 0);
+// Reads the LUN in the target's slot and its state. Returns whether there is one.
+bool _read_lun(TargetEntry* entry, LunState* state, int slot) {
+  return ktree_get_lun_of_target(entry, slot) == kOk && read_lun_state(entry->db_idx, slot, state) == kOk;
+}
+
+// Refreshes the status texts of the LUNs of the target in `entry`, which is the record for each. The slots
+// are let go of while disks are looked at.
+void _refresh_luns(TargetEntry* entry, SlotsHeld* held) {
+  LunState state;
+  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
+    if (!_read_lun(entry, &state, slot)) break;
+    held->let_go();
+    repair_lun_state(entry, &state);
+    ktree_update_lun_status(entry, state);
+    held->take();
   }
   ktree_refresh_total_luncnt();
 }
 
-// Refreshes the target called `name`. Returns 0, also when it had to be skipped, or -103.
-int _refresh_target(const char* name, Caller caller) {
-  TargetEntry entry;
-  if (ktree_get_entry_by_targetname(name, &entry) != kOk) return kOk;
-  const int found = ktree_update_dev(&entry);
-  if (found == kListingFailed) {
-    LOG_AT(caller, 2, "iscsiadm -m session failed. Skip this target.");
-    return kOk;
-  }
+// Refreshes the target in `entry`. The slots are let go of while the sessions are listed. Returns 0, also
+// when it had to be skipped, or -103.
+int _refresh_target(TargetEntry* entry, SlotsHeld* held, Caller caller) {
+  held->let_go();
+  const int found = ktree_update_dev(entry);
   if (found == kTreeFailed) {
     LOG_AT(caller, 0, "set value to ktree failed. Exit.");
     return kTreeFailed;
   }
-  repair_target_state(&entry);
-  ktree_update_status(&entry);
-  _refresh_luns(&entry, entry.db_idx);
+  if (found == kListingFailed) {
+    LOG_AT(caller, 2, "iscsiadm -m session failed. Skip this target.");
+    held->take();
+    return kOk;
+  }
+  ktree_update_status(entry, repair_target_state(entry));
+  held->take();
+  _refresh_luns(entry, held);
   return kOk;
 }
 
 // Returns whether the slot was nameless and is gone.
 bool _delete_nameless_slot(int slot, Caller caller) {
   const SlotsHeld held(SlotsHeld::kChange);
-  if (tree_present(KeyText(key::kTargetName, slot))) return false;
+  if (is_target_stored_at(slot)) return false;
   const KeyText path(key::kTarget, slot);
-  if (tree_delete(path) == kOk) return true;
+  if (delete_slot(path) == kOk) return true;
   LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", path.c_str());
   return false;
 }
@@ -65,16 +73,21 @@ bool _delete_nameless_slot(int slot, Caller caller) {
 // that moves into a deleted one's place is visited next; no more slots are visited than were counted. Returns
 // 0 or -103.
 int _refresh_targets(int count, Caller caller = Caller()) {
+  SlotsHeld held;
   int slot = 1;
   for (int visited = 0; visited < count; visited++) {
-    char name[sizeof TargetEntry::target_name];
-    if (tree_read(KeyText(key::kTargetName, slot), name)) {
-      remember_target(slot, name);
-      if (_refresh_target(name, caller) != kOk) return kTreeFailed;
-      slot = target_slot_after(slot);
+    TargetEntry entry;
+    char name[sizeof entry.target_name];
+    if (!read_target_name(slot, name)) {
+      held.let_go();
+      if (!_delete_nameless_slot(slot, caller)) slot++;
+      held.take();
       continue;
     }
-    if (!_delete_nameless_slot(slot, caller)) slot++;
+    remember_target(slot, name);
+    const bool found = ktree_get_entry_by_targetname(name, &entry) == kOk;
+    if (found && _refresh_target(&entry, &held, caller) != kOk) return kTreeFailed;
+    slot = target_slot_after(slot);
   }
   return kOk;
 }
@@ -82,10 +95,11 @@ int _refresh_targets(int count, Caller caller = Caller()) {
 // The targets behind the counted ones, such as one whose add was refused, stay as they are, unless they show
 // work that nobody does any more. Returns 0 or -103.
 int _refresh_ended_work_behind(int count, Caller caller = Caller()) {
+  SlotsHeld held;
   for (int slot = count + 1; slot <= kMaxTargets && is_target_stored(slot); slot++) {
     TargetEntry entry;
     if (ktree_get_entry_by_dbidx(slot, &entry) != kOk || !shows_ended_work(&entry)) continue;
-    if (_refresh_target(entry.target_name, caller) != kOk) return kTreeFailed;
+    if (_refresh_target(&entry, &held, caller) != kOk) return kTreeFailed;
   }
   return kOk;
 }
@@ -96,13 +110,13 @@ void _prune_slots_behind(int count, Caller caller = Caller()) {
   int slot = count + 1;
   for (int visited = count; visited < kMaxTargets; visited++) {
     if (!tree_present(KeyText(key::kTargetStatus, slot))) return;
-    if (!tree_slot_is_free(KeyText(key::kTargetName, slot))) {
+    if (!is_target_slot_free(slot)) {
       slot++;
       continue;
     }
     const KeyText path(key::kTarget, slot);
     LOG_AT(caller, 0, "ktreec_del() of path '%s'", path.c_str());
-    if (tree_delete(path) != kOk) slot++;
+    if (delete_slot(path) != kOk) slot++;
   }
 }
 

@@ -52,9 +52,13 @@ bool is_same_tree(const TreeInstance& before) {
          now.made.tv_nsec == before.made.tv_nsec;
 }
 
-bool tree_read(const char* key, char* buffer, size_t size) {
+int tree_get(const char* key, char* buffer, size_t size) {
   memset(buffer, 0, size);
-  return ktreec_get_wb(main_socket, 0, key, buffer, size) > 0 && buffer[0] != '\0';
+  return ktreec_get_wb(main_socket, 0, key, buffer, size);
+}
+
+bool tree_read(const char* key, char* buffer, size_t size) {
+  return tree_get(key, buffer, size) > 0 && buffer[0] != '\0';
 }
 
 bool tree_present(const char* key) {
@@ -76,8 +80,8 @@ int tree_read_number(const char* key, int missing) {
 }
 
 bool tree_slot_is_free(const char* key) {
-  char value[256] = "";
-  return ktreec_get_wb(main_socket, 0, key, value, sizeof value) == -1 || value[0] == '\0';
+  char value[256];
+  return tree_get(key, value, sizeof value) == -1 || value[0] == '\0';
 }
 
 int tree_write(const char* key, const char* value) {

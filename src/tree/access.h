@@ -35,7 +35,11 @@ struct TreeInstance {
 // the settings file, and knows nothing of what was stored since.
 [[nodiscard]] bool is_same_tree(const TreeInstance& before);
 
-// Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns whether the key is present.
+// Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns what the read gives: the number
+// of bytes, -1 for a key that is missing.
+int tree_get(const char* key, char* buffer, size_t size);
+
+// The same. Returns whether the key is present.
 [[nodiscard]] bool tree_read(const char* key, char* buffer, size_t size);
 
 template <size_t N>

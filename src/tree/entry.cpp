@@ -41,10 +41,33 @@ void read_target_fields(TargetEntry* entry, int dbidx) {
   entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
 }
 
+// Reads what the LUN slot `m` of the target in `slot` holds, which this run knows by the number `dbidx`, into
+// the LUN's fields. Returns whether both are stored.
+bool read_lun_at(TargetEntry* entry, int dbidx, const HeldSlot& slot, int m, Caller caller) {
+  const int n = slot.target();
+  if (!slot || !read_target_name(n, entry->target_name)) {
+    LOG_AT(caller, 0, "Can not get entry from %d", dbidx);
+    return false;
+  }
+  remember_target(dbidx, entry->target_name);
+  entry->db_idx = dbidx;
+  if (!read_lun_number(n, m, &entry->lun)) {
+    LOG_AT(caller, 2, "Can not get lun from %d", m);
+    return false;
+  }
+  entry->lun_db_idx = m;
+  remember_lun(dbidx, m, entry->lun);
+  read_field(KeyText(key::kLunShare, n, m), entry->share);
+  read_field(KeyText(key::kLunDev, n, m), entry->dev);
+  read_field(KeyText(key::kLunMntDev, n, m), entry->mnt_dev);
+  read_field(KeyText(key::kLunMnt, n, m), entry->mnt);
+  return true;
+}
+
 // Counts the LUNs of the slot `n` as it is now, up to the first empty one.
 int count_luns_at(int n) {
   int count = 0;
-  while (count < kMaxLunsPerTarget && !tree_slot_is_free(KeyText(key::kLunNumber, n, count + 1))) count++;
+  while (count < kMaxLunsPerTarget && !is_lun_slot_free(n, count + 1)) count++;
   return count;
 }
 
@@ -109,10 +132,9 @@ int ktree_get_dbidx_by_targetname(const char* target_name) {
   const SlotsHeld held;
   int dbidx = kFailed;
   for (int n = 1; n <= kMaxTargets && dbidx == kFailed; n++) {
-    const KeyText key(key::kTargetName, n);
     char name[kValueSize];
-    if (!tree_read(key, name)) {
-      LOG(1, "ktreec_get(%s) failed", key.c_str());
+    if (!read_target_name(n, name)) {
+      LOG(1, "ktreec_get(%s) failed", KeyText(key::kTargetName, n).c_str());
       break;
     }
     if (strcmp(name, target_name) == 0) dbidx = n;
@@ -124,7 +146,7 @@ int ktree_get_dbidx_by_targetname(const char* target_name) {
 
 int ktree_get_free_dbidx() {
   for (int n = 1; n <= kMaxTargets; n++) {
-    if (!tree_slot_is_free(KeyText(key::kTargetName, n))) continue;
+    if (!is_target_slot_free(n)) continue;
     LOG(3, "free ent id: %d", n);
     return n;
   }
@@ -153,7 +175,7 @@ int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry) {
 int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry) {
   *entry = TargetEntry();
   const HeldSlot slot(dbidx);
-  if (!slot || !tree_read(KeyText(key::kTargetName, slot.target()), entry->target_name)) return kFailed;
+  if (!slot || !read_target_name(slot.target(), entry->target_name)) return kFailed;
   remember_target(dbidx, entry->target_name);
   entry->db_idx = dbidx;
   read_target_fields(entry, slot.target());
@@ -162,14 +184,14 @@ int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry) {
 
 bool is_target_stored(int dbidx) {
   const HeldSlot slot(dbidx);
-  return slot && tree_present(KeyText(key::kTargetName, slot.target()));
+  return slot && is_target_stored_at(slot.target());
 }
 
 bool is_lun_stored(int dbidx, int lun_dbidx) {
   const HeldSlot slot(dbidx);
-  char lun[kValueSize];
-  if (!slot || !tree_read(KeyText(key::kLunNumber, slot.target(), lun_dbidx), lun)) return false;
-  remember_lun(dbidx, lun_dbidx, atoi(lun));
+  int lun = 0;
+  if (!slot || !read_lun_number(slot.target(), lun_dbidx, &lun)) return false;
+  remember_lun(dbidx, lun_dbidx, lun);
   return true;
 }
 
@@ -177,28 +199,21 @@ int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx) {
   if (entry == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
   *entry = TargetEntry();
   const HeldSlot slot(dbidx);
-  const int n = slot.target();
-  char value[kValueSize];
-  if (!slot || !tree_read(KeyText(key::kTargetName, n), value)) {
-    LOG(0, "Can not get entry from %d", dbidx);
-    return kFailed;
-  }
-  remember_target(dbidx, value);
-  copy_text(entry->target_name, value);
-  entry->db_idx = dbidx;
-  if (!tree_read(KeyText(key::kLunNumber, n, lun_dbidx), value)) {
-    LOG(2, "Can not get lun from %d", lun_dbidx);
-    return kFailed;
-  }
-  entry->lun = atoi(value);
-  entry->lun_db_idx = lun_dbidx;
-  remember_lun(dbidx, lun_dbidx, entry->lun);
-  read_field(KeyText(key::kLunShare, n, lun_dbidx), entry->share);
-  read_field(KeyText(key::kLunDev, n, lun_dbidx), entry->dev);
-  read_field(KeyText(key::kLunMntDev, n, lun_dbidx), entry->mnt_dev);
-  read_field(KeyText(key::kLunMnt, n, lun_dbidx), entry->mnt);
-  read_target_fields(entry, n);
+  if (!read_lun_at(entry, dbidx, slot, lun_dbidx, Caller())) return kFailed;
+  read_target_fields(entry, slot.target());
   return kOk;
+}
+
+int ktree_get_lun_of_target(TargetEntry* entry, int lun_dbidx) {
+  copy_text(entry->share, "");
+  copy_text(entry->dev, "");
+  copy_text(entry->mnt_dev, "");
+  copy_text(entry->mnt, "");
+  entry->lun = 0;
+  entry->lun_db_idx = 0;
+  const HeldSlot slot(entry->db_idx);
+  return read_lun_at(entry, entry->db_idx, slot, lun_dbidx, Caller("ktree_get_lun_entry_by_dbidx")) ? kOk
+                                                                                                    : kFailed;
 }
 
 int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int lun) {
@@ -220,7 +235,7 @@ int ktree_update_current_targetcnt() {
 int ktree_get_total_luncnt() {
   const SlotsHeld held;
   int total = 0;
-  for (int n = 1; n <= kMaxTargets && !tree_slot_is_free(KeyText(key::kTargetName, n)); n++) {
+  for (int n = 1; n <= kMaxTargets && !is_target_slot_free(n); n++) {
     total += count_luns_at(n);
   }
   return total;
@@ -310,7 +325,7 @@ int ktree_get_free_lun_dbidx(int dbidx) {
   }
   int m = 1;
   for (; m <= kMaxLunsPerTarget; m++) {
-    if (!tree_slot_is_free(KeyText(key::kLunNumber, dbidx, m))) continue;
+    if (!is_lun_slot_free(dbidx, m)) continue;
     LOG(3, "free ent id: %d", m);
     return m;
   }
@@ -325,13 +340,12 @@ int ktree_get_dbidx_by_lun(int dbidx, int lun) {
   if (!slot) return kFailed;
   int lun_dbidx = kFailed;
   for (int m = 1; m <= kMaxLunsPerTarget && lun_dbidx == kFailed; m++) {
-    const KeyText key(key::kLunNumber, slot.target(), m);
-    char value[kValueSize];
-    if (!tree_read(key, value)) {
-      LOG(1, "ktreec_get(%s) failed", key.c_str());
+    int stored = 0;
+    if (!read_lun_number(slot.target(), m, &stored)) {
+      LOG(1, "ktreec_get(%s) failed", KeyText(key::kLunNumber, slot.target(), m).c_str());
       break;
     }
-    if (atoi(value) == lun) lun_dbidx = m;
+    if (stored == lun) lun_dbidx = m;
   }
   if (lun_dbidx >= 1) remember_lun(dbidx, lun_dbidx, lun);
   LOG(1, "get lun: %d at db_idx=%d", lun, lun_dbidx);

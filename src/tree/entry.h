@@ -31,8 +31,12 @@ int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry);
 // bad (null, below 1) or one of the two slots is empty.
 int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx);
 
-// The same for the LUN with number `lun`, which this run has found or stored at `lun_dbidx`, wherever it is
-// now; -1 also when it is stored no more. What has taken its place is another LUN.
+// The same for a LUN of the target that `entry` holds already: what was read of the target stays.
+int ktree_get_lun_of_target(TargetEntry* entry, int lun_dbidx);
+
+// The same as ktree_get_lun_entry_by_dbidx() for the LUN with number `lun`, which this run has found or
+// stored at `lun_dbidx`, wherever it is now; -1 also when it is stored no more. What has taken its place is
+// another LUN.
 int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int lun);
 
 // Rewrites the count of targets: every filled slot of the eight, gaps or not. Returns 0 or -103.

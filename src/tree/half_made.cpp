@@ -17,23 +17,27 @@ namespace {
 
 bool is_half_made_lun(int n, int m) {
   const KeyText number(key::kLunNumber, n, m);
-  return tree_present(number) && tree_is_missing(KeyText(key::kLunShare, n, m), number);
+  return is_lun_stored_at(n, m) && tree_is_missing(KeyText(key::kLunShare, n, m), number);
 }
 
 bool is_half_made_target(int n) {
   const KeyText name(key::kTargetName, n);
-  return tree_present(name) && tree_is_missing(KeyText(key::kTargetIp, n), name) &&
+  return is_target_stored_at(n) && !is_lun_stored_at(n, 1) &&
+         tree_is_missing(KeyText(key::kTargetIp, n), name) &&
          tree_is_missing(KeyText(key::kLunNumber, n, 1), name);
 }
 
 void drop(const char* path) {
   LOG(0, "half made slot '%s' is deleted", path);
-  if (tree_delete(path) != kOk) LOG(0, "ktreec_del() of path '%s' failed", path);
+  if (delete_slot(path) != kOk) LOG(0, "ktreec_del() of path '%s' failed", path);
 }
 
+// Adding takes the first slot without a number, so behind it is none.
 void drop_half_made_luns_of(int n) {
-  if (!tree_present(KeyText(key::kTargetName, n))) return;
-  for (int m = kMaxLunsPerTarget; m >= 1; m--) {
+  if (!is_target_stored_at(n)) return;
+  int last = 0;
+  while (last < kMaxLunsPerTarget && is_lun_stored_at(n, last + 1)) last++;
+  for (int m = last; m >= 1; m--) {
     if (is_half_made_lun(n, m)) drop(KeyText(key::kLun, n, m));
   }
 }
@@ -41,7 +45,7 @@ void drop_half_made_luns_of(int n) {
 // A target whose mount failed is not counted, as those who read the tree know it.
 bool is_uncounted(int n) {
   char name[256];
-  return tree_read(KeyText(key::kTargetName, n), name) && tree_present(KeyText(key::kLunShare, n, 1)) &&
+  return read_target_name(n, name) && tree_present(KeyText(key::kLunShare, n, 1)) &&
          tree_read_number(KeyText(key::kLunVolumeState, n, 1), kVolumeNormal) != kVolumeFailed &&
          IdleTarget(name);
 }

@@ -18,6 +18,7 @@ constexpr int kNoLun = -1;
 constexpr int kGone = 0;
 
 using TargetName = char[256];
+using Value = char[256];
 
 // What this run knows of one target slot.
 struct KnownSlot {
@@ -29,6 +30,32 @@ KnownSlot known_slots[kMaxTargets + 1];
 
 RunLock slots_lock;  // open for as long as the run lives
 int holders = 0;
+bool are_locked = false;  // false also while they are held without a lock, since none can be had
+
+// What was read from a target slot since the slots are held; empty: nothing.
+struct SeenSlot {
+  TargetName target;
+  char luns[kMaxLunsPerTarget + 1][16];
+};
+
+SeenSlot seen_slots[kMaxTargets + 1];
+
+void forget_seen_slots() {
+  memset(seen_slots, 0, sizeof seen_slots);
+}
+
+// Reads the value at `key`, which defines a slot, or takes it from `seen`; null: nothing is kept of it.
+// Returns what tree_get() does.
+template <size_t N>
+int get_slot_value(const char* key, char (*seen)[N], Value& value) {
+  if (seen != nullptr && (*seen)[0] != '\0') {
+    copy_text(value, *seen);
+    return static_cast<int>(strlen(value));
+  }
+  const int length = tree_get(key, value, sizeof value);
+  if (seen != nullptr && are_locked && length > 0 && strlen(value) < N) copy_text(*seen, value);
+  return length;
+}
 
 bool is_target_slot(int n) {
   return n >= 1 && n <= kMaxTargets;
@@ -42,14 +69,24 @@ int known_lun(int n, int m) {
   return known_slots[n].luns[m] - 1;
 }
 
+int get_target_name(int n, TargetName& name) {
+  TargetName* const seen = is_target_slot(n) ? &seen_slots[n].target : nullptr;
+  return get_slot_value(KeyText(key::kTargetName, n), seen, name);
+}
+
+int get_lun_number(int n, int m, Value& number) {
+  auto* const seen = is_lun_slot(n, m) ? &seen_slots[n].luns[m] : nullptr;
+  return get_slot_value(KeyText(key::kLunNumber, n, m), seen, number);
+}
+
 bool holds_target(int n, const char* target_name) {
   TargetName stored;
-  return tree_read(KeyText(key::kTargetName, n), stored) && strcmp(stored, target_name) == 0;
+  return read_target_name(n, stored) && strcmp(stored, target_name) == 0;
 }
 
 bool holds_lun(int n, int m, int lun) {
-  char stored[256];
-  return tree_read(KeyText(key::kLunNumber, n, m), stored) && atoi(stored) == lun;
+  int stored = 0;
+  return read_lun_number(n, m, &stored) && stored == lun;
 }
 
 // Returns the slot of 1 to `last` that `holds` tells, asked for `slot` first; `slot` in a tree that does not
@@ -86,18 +123,60 @@ int find_lun(int n, int m, int target, Caller caller) {
 
 }  // namespace
 
-SlotsHeld::SlotsHeld(Purpose purpose) {
+void SlotsHeld::take() {
+  held_ = true;
   if (holders++ > 0) return;
-  slots_lock.take_again(kSlotsLock, purpose == kChange ? LockMode::kExclusive : LockMode::kShared);
+  const LockMode mode = purpose_ == kChange ? LockMode::kExclusive : LockMode::kShared;
+  are_locked = slots_lock.take_again(kSlotsLock, mode) == LockTry::kTaken;
 }
 
-SlotsHeld::~SlotsHeld() {
-  if (--holders == 0) slots_lock.pause();
+void SlotsHeld::let_go() {
+  held_ = false;
+  if (--holders > 0) return;
+  forget_seen_slots();
+  are_locked = false;
+  slots_lock.pause();
 }
 
 HeldSlot::HeldSlot(int n, int m, Caller caller)
     : target_(find_target(n, caller)), lun_(target_ != kGone ? find_lun(n, m, target_, caller) : kGone) {
   found_ = target_ != kGone && (m == 0 || lun_ != kGone);
+}
+
+bool read_target_name(int n, TargetName& name) {
+  return get_target_name(n, name) > 0 && name[0] != '\0';
+}
+
+bool read_lun_number(int n, int m, int* lun) {
+  Value number;
+  if (get_lun_number(n, m, number) <= 0 || number[0] == '\0') return false;
+  *lun = atoi(number);
+  return true;
+}
+
+bool is_target_stored_at(int n) {
+  TargetName name;
+  return read_target_name(n, name);
+}
+
+bool is_lun_stored_at(int n, int m) {
+  int lun = 0;
+  return read_lun_number(n, m, &lun);
+}
+
+bool is_target_slot_free(int n) {
+  TargetName name;
+  return get_target_name(n, name) == -1 || name[0] == '\0';
+}
+
+bool is_lun_slot_free(int n, int m) {
+  Value number;
+  return get_lun_number(n, m, number) == -1 || number[0] == '\0';
+}
+
+int delete_slot(const char* path) {
+  forget_seen_slots();
+  return tree_delete(path);
 }
 
 void remember_target(int n, const char* target_name) {
@@ -116,7 +195,7 @@ void remember_all_targets() {
   for (int n = 1; n <= kMaxTargets; n++) {
     known_slots[n] = KnownSlot();
     TargetName name;
-    if (tree_read(KeyText(key::kTargetName, n), name)) remember_target(n, name);
+    if (read_target_name(n, name)) remember_target(n, name);
   }
 }
 

@@ -19,10 +19,20 @@ class SlotsHeld {
  public:
   enum Purpose { kUse, kChange };
 
-  explicit SlotsHeld(Purpose purpose = kUse);
+  explicit SlotsHeld(Purpose purpose = kUse) : purpose_(purpose) { take(); }
   SlotsHeld(const SlotsHeld&) = delete;
   SlotsHeld& operator=(const SlotsHeld&) = delete;
-  ~SlotsHeld();
+  ~SlotsHeld() {
+    if (held_) let_go();
+  }
+
+  // Lets go of the slots for a while, and takes them again.
+  void let_go();
+  void take();
+
+ private:
+  Purpose purpose_;
+  bool held_ = false;
 };
 
 // A slot of a target, or of one of its LUNs, by the number that this run knows it by.
@@ -43,6 +53,23 @@ class HeldSlot {
   int target_;
   int lun_;
 };
+
+// What defines a slot: the name of the target in it, the number of the LUN. Read from the tree, but only once
+// while the slots are held, since nobody moves them then. Return whether it is there.
+[[nodiscard]] bool read_target_name(int n, char (&name)[256]);
+[[nodiscard]] bool read_lun_number(int n, int m, int* lun);
+
+// Return whether it is there.
+[[nodiscard]] bool is_target_stored_at(int n);
+[[nodiscard]] bool is_lun_stored_at(int n, int m);
+
+// The same by the looser rule of the free-slot searches (tree_slot_is_free).
+[[nodiscard]] bool is_target_slot_free(int n);
+[[nodiscard]] bool is_lun_slot_free(int n, int m);
+
+// Deletes the slot of a target or a LUN at `path`, with the slots held for a change: those behind it move
+// down. Returns 0 or -103 (not logged).
+[[nodiscard]] int delete_slot(const char* path);
 
 // Remember what a slot holds, as this run has just read or written it.
 void remember_target(int n, const char* target_name);

@@ -22,14 +22,6 @@ using StatusText = Text<64>;
 
 constexpr int kStatusTries = 3;
 
-// What the status text of a LUN is made of.
-struct LunState {
-  int right;
-  int format;
-  int volume;
-  int progress;
-};
-
 int write_logged(const char* key, const char* value, Caller caller) {
   LOG_AT(caller, 1, "ktreec_set %s=%s", key, value);
   return tree_write_with_tries(key, value, caller);
@@ -40,8 +32,10 @@ StatusText with_right(const char* text, int right) {
   return right == VOL_AC_RO ? StatusText("%s ( %s )", text, "Read Only") : StatusText("%s", text);
 }
 
-StatusText progress_text(const LunState& state) {
-  return StatusText("%s %d%%", "Formatting", state.progress);
+StatusText progress_text(const TargetEntry* entry) {
+  int progress = 0;
+  ktree_get_lun_format_progress(entry->db_idx, entry->lun_db_idx, &progress);
+  return StatusText("%s %d%%", "Formatting", progress);
 }
 
 bool failed(const LunState& state) {
@@ -49,8 +43,8 @@ bool failed(const LunState& state) {
 }
 
 // A file system is there, but it is not mounted.
-StatusText unmounted_text(const LunState& state) {
-  if (state.format == kFormatting) return progress_text(state);
+StatusText unmounted_text(const TargetEntry* entry, const LunState& state) {
+  if (state.format == kFormatting) return progress_text(entry);
   if (state.volume == kVolumeCreating) return StatusText("Creating Volume");
   if (state.volume == kVolumeUnsupported) return with_right("Unsupported File System", state.right);
   if (!failed(state)) return StatusText("Offline");
@@ -58,8 +52,8 @@ StatusText unmounted_text(const LunState& state) {
 }
 
 // No file system was recognised.
-StatusText unformatted_text(const LunState& state) {
-  if (state.format == kFormatting) return progress_text(state);
+StatusText unformatted_text(const TargetEntry* entry, const LunState& state) {
+  if (state.format == kFormatting) return progress_text(entry);
   if (state.format == kFormatWaiting) return StatusText("Wait to Format");
   if (state.volume == kVolumeCreating) return StatusText("Creating Volume");
   if (failed(state)) return with_right("Create Volume Failed", state.right);
@@ -67,15 +61,6 @@ StatusText unformatted_text(const LunState& state) {
   // The user interface knows no read-only form of this text here.
   if (state.volume == kVolumeUnsupported) return StatusText("Unsupported File System");
   return with_right("No Format", state.right);
-}
-
-LunState read_lun_state(int n, int m, int right) {
-  const SlotsHeld held;
-  LunState state = {right, 0, 0, 0};
-  ktree_get_lun_format_state(n, m, &state.format);
-  ktree_get_lun_volume_state(n, m, &state.volume);
-  ktree_get_lun_format_progress(n, m, &state.progress);
-  return state;
 }
 
 // Writes a status text and a size; both are tried even when the first fails.
@@ -107,29 +92,27 @@ int write_recognised(const TargetEntry* entry, const LunState& state, const char
     result =
         write_status(entry, with_right("Running", state.right), Text<64>("%llu/%llu", used, total), caller);
   } else {
-    result = write_status(entry, unmounted_text(state), "0/0", caller);
+    result = write_status(entry, unmounted_text(entry, state), "0/0", caller);
   }
   return type_result != kOk ? type_result : result;
 }
 
-int compose_lun_status(const TargetEntry* entry, int formatting, int right, Caller caller) {
-  const int n = entry->db_idx;
-  const int m = entry->lun_db_idx;
-  int enable = 0;
-  if (ktree_get_lun_enable(&enable, n, m) != kOk || enable == 0) {
-    // The size of a disabled LUN stays as it was.
-    const HeldSlot slot(n, m);
-    return slot ? write_logged(KeyText(key::kLunStatus, slot.target(), slot.lun()), "Disable", caller)
-                : kTreeFailed;
-  }
-  const LunState state = read_lun_state(n, m, right);
-  if (formatting != 0) return write_status(entry, progress_text(state), "0/0", caller);
+// The size of a disabled LUN stays as it was.
+int write_disabled(const TargetEntry* entry, Caller caller) {
+  const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+  if (!slot) return kTreeFailed;
+  return write_logged(KeyText(key::kLunStatus, slot.target(), slot.lun()), "Disable", caller);
+}
+
+int compose_lun_status(const TargetEntry* entry, bool formatting, const LunState& state, Caller caller) {
+  if (!state.enabled) return write_disabled(entry, caller);
+  if (formatting) return write_status(entry, progress_text(entry), "0/0", caller);
   if (entry->dev[0] == '\0') return write_status(entry, "Offline", "0/0", caller);
   char fs_type[16] = "";
   if (sys_get_fs_type(fs_type, entry->mnt_dev) == 0) {
     return write_recognised(entry, state, fs_type, caller);
   }
-  return write_status(entry, unformatted_text(state), "0/0", caller);
+  return write_status(entry, unformatted_text(entry, state), "0/0", caller);
 }
 
 int write_target_status(int dbidx, const char* text, Caller caller) {
@@ -164,9 +147,12 @@ int write_target_state(int n, bool connected, int state, Caller caller) {
 }  // namespace
 
 int ktree_update_status(const TargetEntry* entry) {
+  return ktree_update_status(entry, read_connect_state(entry->db_idx));
+}
+
+int ktree_update_status(const TargetEntry* entry, int state) {
   const int n = entry->db_idx;
   const Caller here;
-  int state = read_connect_state(n);
   bool connected = false;
   // While the sessions are listed another run may bring the target up, or fail to: what it wrote counts then.
   for (int tries = 0; tries < kStatusTries; tries++) {
@@ -181,18 +167,35 @@ int ktree_update_status(const TargetEntry* entry) {
   return write_target_state(n, connected, state, here);
 }
 
+int read_lun_state(int dbidx, int lun_dbidx, LunState* state) {
+  const SlotsHeld held;
+  int enabled = 0;
+  if (ktree_get_lun_vol_access_right(&state->right, dbidx, lun_dbidx) != kOk) return kFailed;
+  state->enabled = ktree_get_lun_enable(&enabled, dbidx, lun_dbidx) == kOk && enabled != 0;
+  ktree_get_lun_format_state(dbidx, lun_dbidx, &state->format);
+  ktree_get_lun_volume_state(dbidx, lun_dbidx, &state->volume);
+  return kOk;
+}
+
 int ktree_update_lun_status(const TargetEntry* entry, int formatting) {
   LOG(2, "update lun status start");
   if (entry->db_idx < 1 || entry->lun_db_idx < 1) {
     LOG(1, "target or lun db index not given");
     return kFailed;
   }
-  int right = VOL_AC_RW;
-  if (ktree_get_lun_vol_access_right(&right, entry->db_idx, entry->lun_db_idx) != kOk) {
+  LunState state;
+  if (read_lun_state(entry->db_idx, entry->lun_db_idx, &state) != kOk) {
     LOG(0, "ktree_get_lun_vol_access_right() failed");
     return kFailed;
   }
-  const int result = compose_lun_status(entry, formatting, right, Caller());
+  const int result = compose_lun_status(entry, formatting != 0, state, Caller());
+  LOG(2, "update status end");
+  return result;
+}
+
+int ktree_update_lun_status(const TargetEntry* entry, const LunState& state) {
+  LOG(2, "update lun status start");
+  const int result = compose_lun_status(entry, state.format == kFormatting, state, Caller());
   LOG(2, "update status end");
   return result;
 }

@@ -322,6 +322,26 @@ class TestLunsThatMove:
         assert three.mounted("d")
 
 
+class TestTargetsThatMove:
+    @pytest.mark.parametrize("function, subject, skip", [("system", re.compile("^iscsiadm -m session >"), 1),
+                                                         ("sys_get_fs_type", "/dev/sdb1", 0)])
+    def test_the_status_goes_to_the_target_it_is_of(self, site, box, function, subject, skip):
+        """The first target is deleted while the second is refreshed: nothing is held then that a deletion waits for."""
+        site.store("iqn.t1")
+        site.store("iqn.t2", slot=2, luns=[("b", 0, {"mnt_dev": "/dev/sdb1"})])
+        site.store("iqn.t3", slot=3)
+        site.offer("iqn.t2", {0: "sdb"})
+        site.log_in("iqn.t2")
+        box.hook(function, subject, out="ext4", through=function == "system", effect="remvol --del -n iqn.t1", skip=skip,
+                 times=1)
+        site.disk("sdb")
+        status(box)
+        assert [site.target("target", n) for n in (1, 2, 3)] == ["iqn.t2", "iqn.t3", None]
+        assert [site.target("status", n) for n in (1, 2)] == ["Connected", "Disconnected"]
+        assert [site.lun(key) for key in ("dev", "status")] == ["sdb", "Offline"]
+        assert [site.lun(key, target=2) for key in ("dev", "status")] == [None, None]
+
+
 class TestASessionUnderAVolume:
     """A volume that the tree does not name is known by the kernel's tables alone."""
 

@@ -218,7 +218,7 @@ class TestDegradedVolumes:
     def test_a_target_that_vanishes_ends_disconnected(self, lost, box):
         degrade(box, "a")
         # The connection looks the target up again and does not find it: so many reads come before that one.
-        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=28, times=1)
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=19, times=1)
         assert recover(box).status == 255
         assert lost.target("conn_state") == "0"
         assert_order(lost.trace(), "set id:1/conn_state=2", "set id:1/conn_state=0")

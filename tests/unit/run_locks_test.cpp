@@ -231,8 +231,12 @@ TEST_F(RunLocks, RunsShareTheirUseOfTheSlotsAndOneAloneChangesThem) {
     EXPECT_FALSE(another_run_can(SlotsHeld::kChange));
   }
   {
-    const SlotsHeld held(SlotsHeld::kChange);
+    SlotsHeld held(SlotsHeld::kChange);
     { const SlotsHeld inner; }
+    EXPECT_FALSE(another_run_can(SlotsHeld::kUse));
+    held.let_go();
+    EXPECT_TRUE(another_run_can(SlotsHeld::kChange));
+    held.take();
     EXPECT_FALSE(another_run_can(SlotsHeld::kUse));
   }
   EXPECT_TRUE(another_run_can(SlotsHeld::kChange));

@@ -1,6 +1,8 @@
 // What slot numbers stand for while other runs add and delete slots.
 #include "tree/slots.h"
 
+#include <filesystem>
+#include <regex>
 #include <string>
 
 #include "fakes.h"
@@ -8,6 +10,7 @@
 #include "tree/entry.h"
 #include "tree/half_made.h"
 #include "tree/state.h"
+#include "volume_fixture.h"
 
 namespace {
 
@@ -19,6 +22,81 @@ std::string key(int n, const std::string& name) {
 
 std::string lun_key(int n, int m, const std::string& name) {
   return key(n, "lun/id:" + std::to_string(m) + "/" + name);
+}
+
+// Two targets, each with a LUN 10.
+class HeldSlots : public VolumeTest {
+ protected:
+  HeldSlots() {
+    cover("/run");
+    fakes::tree_set({{"/iscsi/initiator/ver", "1"},
+                     {"/iscsi/initiator/id:1/target", "iqn.t1"},
+                     {"/iscsi/initiator/id:1/lun/id:1/lun", "10"},
+                     {"/iscsi/initiator/id:2/target", "iqn.t2"},
+                     {"/iscsi/initiator/id:2/lun/id:1/lun", "10"}});
+    remember_target(2, "iqn.t2");
+    remember_lun(2, 1, 10);
+  }
+
+  ~HeldSlots() override { uncover("/run"); }
+
+  // What another run does.
+  static void delete_first_target() { fakes::tree_delete("/iscsi/initiator/id:1"); }
+};
+
+// The first test: a run opens its lock on the slots once.
+TEST_F(HeldSlots, AreReadAnewEachTimeWhenThereIsNoLock) {
+  std::filesystem::create_directory("/run/remvol");
+  std::filesystem::create_symlink("/run/victim", "/run/remvol/slots.lock");
+  const SlotsHeld held;
+  EXPECT_EQ(HeldSlot(2, 1).target(), 2);
+  delete_first_target();
+  EXPECT_EQ(HeldSlot(2, 1).target(), 1);
+}
+
+TEST_F(HeldSlots, AreReadOnce) {
+  const SlotsHeld held;
+  EXPECT_TRUE(HeldSlot(2, 1));
+  fakes::on("ktreec_get_wb", std::regex("/target$")).returns(-1);
+  fakes::on("ktreec_get_wb", std::regex("/lun$")).returns(-1);
+  EXPECT_TRUE(HeldSlot(2, 1));
+  EXPECT_TRUE(is_target_stored(2));
+  EXPECT_TRUE(is_lun_stored(2, 1));
+  EXPECT_EQ(ktree_count_target_luns(2), 1);
+}
+
+TEST_F(HeldSlots, AreReadAnewAfterADeletionBetweenTwoHolds) {
+  {
+    const SlotsHeld held;
+    EXPECT_EQ(HeldSlot(2, 1).target(), 2);
+  }
+  delete_first_target();
+  EXPECT_EQ(HeldSlot(2, 1).target(), 1);
+}
+
+TEST_F(HeldSlots, AreReadAnewAfterADeletionWhileTheyWereLetGo) {
+  SlotsHeld held;
+  EXPECT_EQ(HeldSlot(2, 1).target(), 2);
+  held.let_go();
+  delete_first_target();
+  held.take();
+  EXPECT_EQ(HeldSlot(2, 1).target(), 1);
+}
+
+TEST_F(HeldSlots, AreReadAnewAfterADeletionOfOurOwn) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  EXPECT_EQ(HeldSlot(2, 1).target(), 2);
+  EXPECT_EQ(delete_slot("/iscsi/initiator/id:1"), 0);
+  EXPECT_EQ(HeldSlot(2, 1).target(), 1);
+  EXPECT_EQ(delete_slot("/iscsi/initiator/id:1/lun/id:1"), 0);
+  EXPECT_FALSE(HeldSlot(2, 1));
+}
+
+TEST_F(HeldSlots, AreReadAnewWhenTheyWereEmpty) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  EXPECT_EQ(ktree_get_dbidx_by_targetname("iqn.t3"), -1);
+  fakes::tree_set({{"/iscsi/initiator/id:3/target", "iqn.t3"}});
+  EXPECT_EQ(ktree_get_dbidx_by_targetname("iqn.t3"), 3);
 }
 
 // Three targets, each with LUN 10, 20 and 30.
