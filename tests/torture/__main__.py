@@ -18,6 +18,7 @@ from pairs import PAIRS, torment  # noqa: E402
 import fuzz  # noqa: E402
 import power  # noqa: E402
 import replay  # noqa: E402
+import valgrind  # noqa: E402
 
 
 def kinds(found):
@@ -160,6 +161,7 @@ def main():
     fuzz.add_form(forms)
     power.add_form(forms)
     replay.add_form(forms)
+    valgrind.add_form(forms)
     options = parser.parse_args()
     sys.exit(0 if options.run(options) else 1)
 

@@ -9,6 +9,8 @@ import subprocess
 import tempfile
 import time
 
+from .under import SLOWER, keep, under
+
 BUILD = pathlib.Path(os.environ.get("REMVOL_BUILD", pathlib.Path(__file__).parents[3] / "build/release")).resolve()
 KTREE = BUILD / "bin/ktree"
 KTREEC = BUILD / "bin/ktreec"
@@ -18,7 +20,7 @@ GET, SET, DEL, DUMP, LOAD, LIST = range(1, 7)
 TRACED = {**os.environ, "ASAN_OPTIONS": "detect_leaks=0"}
 
 
-def until(condition, seconds=20):
+def until(condition, seconds=20 * SLOWER):
     """Waits until condition() is true and returns what it gave; fails when that takes too long."""
     end = time.monotonic() + seconds
     while True:
@@ -41,7 +43,8 @@ class Daemon:
             self.start(prefix, **popen)
 
     def start(self, prefix=(), arguments=(), **popen):
-        self.process = subprocess.Popen([*prefix, KTREE, "-n", self.name, "-s", self.socket, *arguments],
+        words = under([KTREE, "-n", self.name, "-s", self.socket, *arguments], BUILD, self.folder / "found")
+        self.process = subprocess.Popen([*prefix, *words],
                                         stdin=subprocess.DEVNULL, **popen)
         until(self.answers)
 
@@ -62,6 +65,7 @@ class Daemon:
         if self.process is not None and self.process.poll() is None:
             self.process.kill()
             self.process.wait()
+        keep(self.folder.glob("found.*"), os.environ.get("PYTEST_CURRENT_TEST", "").rpartition(" ")[0])
         shutil.rmtree(self.folder)
 
     def cpu_ticks(self):
@@ -69,7 +73,8 @@ class Daemon:
         return int(fields[11]) + int(fields[12])
 
     def run(self, *args, **options):
-        return subprocess.run([KTREEC, "-S", self.socket, *args], capture_output=True, timeout=60, **options)
+        words = under([KTREEC, "-S", self.socket, *args], BUILD, self.folder / "found")
+        return subprocess.run(words, capture_output=True, timeout=60 * SLOWER, **options)
 
     def set(self, path, value):
         assert self.run("-s", path, value).returncode == 0, path

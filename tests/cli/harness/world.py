@@ -14,6 +14,7 @@ import time
 from .disks import attach, detach, lead_to_controller, lead_to_session
 from .result import Arguments, Call, Result, escape, matcher, unescape
 from .tree import Tree
+from .under import SLOWER, keep, under, without
 
 COMMANDS = (
     "iscsiadm iscsid insmod rmmod mke2fs e2fsck resize2fs mount umount fuser dd ping ps killall "
@@ -21,7 +22,7 @@ COMMANDS = (
 ).split()
 SYSTEM_PATH = "/usr/local/sbin:/usr/local/bin:/usr/sbin:/usr/bin:/sbin:/bin"
 SHELL_KINDS = ("system", "popen", "sleep", "usleep")
-TIMEOUT = 20
+TIMEOUT = 20 * SLOWER
 
 
 def build_folder():
@@ -197,7 +198,8 @@ class Box:
         out, err = (os.memfd_create(name, os.MFD_CLOEXEC) for name in ("out", "err"))
         running = self.running[number] = Running(self, number, argv, out, err)
         variables = [f"{name}={value}" for name, value in self.env(env).items()]
-        self.send(["run", number, cwd, len(argv), *argv, *variables], [stdin, out, err])
+        words = under(argv, self.build, "/fake/found")
+        self.send(["run", number, cwd, len(words), *words, *variables], [stdin, out, err])
         os.close(stdin)
         while running.pid is None and running.result is None:
             if not self.pump(TIMEOUT):
@@ -224,7 +226,7 @@ class Box:
                 except OSError:
                     continue
                 if not ended:  # one that is about to execute a program has no words for a moment
-                    found[int(entry.name)] = [word.decode("utf-8", "replace") for word in words]
+                    found[int(entry.name)] = without([word.decode("utf-8", "replace") for word in words])
         return found
 
     def wait_until(self, condition, timeout=TIMEOUT, what="the condition"):
@@ -317,6 +319,7 @@ class Box:
         return found + [p.read_text() for p in (self.root / "fake").glob("sanitizer.*")]
 
     def close(self):
+        keep((self.root / "fake").glob("found.*"), os.environ.get("PYTEST_CURRENT_TEST", "").rpartition(" ")[0])
         for loop in self.disks:
             detach(loop)
         self.control.close()
