@@ -19,7 +19,7 @@ COMMANDS = {
 
 def under(argv, build, log):
     """The words that run `argv`, one of the programs of the build, with the other program's messages in log.NUMBER."""
-    words = [str(word) for word in argv]
+    words = [word if isinstance(word, bytes) else str(word) for word in argv]
     name = words[0].rpartition("/")[2]
     if not NAME or words[0] not in (name, f"{build}/bin/{name}") or not (pathlib.Path(build) / "bin" / name).exists():
         return words
