@@ -15,9 +15,12 @@ if [ "${2:-}" != inside ]; then
   exec unshare --mount --pid --fork --kill-child "$0" "$build" inside
 fi
 
-# The tool's paths are fixed: /run, /tmp and the settings folder are this run's own.
+# The tool's paths are fixed: /run, /tmp and the settings folder are this run's own. A build below one of them is
+# put back into its place.
+mount --bind "$build" /mnt
 mount -t tmpfs run /run
 mount -t tmpfs tmp /tmp
+[ -d "$build" ] || { mkdir -p "$build" && mount --bind /mnt "$build"; }
 mkdir -p /run/etc/upper /run/etc/work
 mount -t overlay etc -o lowerdir=/etc,upperdir=/run/etc/upper,workdir=/run/etc/work /etc
 mkdir -p /etc/NAS_CFG
