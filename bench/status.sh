@@ -37,6 +37,7 @@ socket=/run/ktree_sock_vv
 
 ktree -n config -s $socket &
 until ktreec -S $socket -s /iscsi/initiator/count 8 2>/dev/null; do sleep 0.01; done
+ktreec -S $socket -s /iscsi/initiator/ver 1
 for n in {1..8}; do
   target=/iscsi/initiator/id:$n
   name=iqn.2026-01.org.example:t$n
