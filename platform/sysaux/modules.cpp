@@ -4,6 +4,7 @@
 #include <limits.h>
 #include <stdio.h>
 #include <string.h>
+#include <sys/stat.h>
 
 #include "sysaux.h"
 
@@ -45,15 +46,21 @@ Function* find(Module& module, const char* symbol) {
   return reinterpret_cast<Function*>(dlsym(handle, symbol));
 }
 
+bool is_block_device(const char* node) {
+  struct stat info;
+  return node != nullptr && stat(node, &info) == 0 && S_ISBLK(info.st_mode);
+}
+
 }  // namespace
 
 extern "C" {
 
+// That there is no disk to look at is told without the module and its libraries.
 int sys_get_fs_type(char* out, const char* node) {
-  const auto call = find<decltype(sysaux_probe_fs_type)>(probe_module, "sysaux_probe_fs_type");
-  if (call != nullptr) return call(out, node);
   out[0] = '\0';
-  return -1;
+  if (!is_block_device(node)) return -1;
+  const auto call = find<decltype(sysaux_probe_fs_type)>(probe_module, "sysaux_probe_fs_type");
+  return call != nullptr ? call(out, node) : -1;
 }
 
 int sys_get_partition_list(char* out, const char* device) {

@@ -9,7 +9,7 @@
 
 extern "C" {
 
-// libsysaux_probe.so: recognises, by libblkid.
+// libsysaux_probe.so: recognises, by libblkid. The node of the first is a block device.
 SYSAUX_EXPORT int sysaux_probe_fs_type(char* out, const char* node);
 SYSAUX_EXPORT int sysaux_probe_partition_list(char* out, const char* device);
 

@@ -50,3 +50,11 @@ def test_without_its_modules_nothing_is_known_and_nothing_is_done(loop, tmp_path
     before = disk.digest()
     assert moved(tmp_path / "alone")(name, disk.node) == answer
     assert disk.digest() == before
+
+
+@pytest.mark.parametrize("node", ["", "/dev/none", "/dev/null", "/tmp"])
+def test_where_no_disk_is_nothing_is_loaded_to_tell(node):
+    traced = subprocess.run(["strace", "-f", "-e", "trace=open,openat", CALL, "fs_type", node],
+                            capture_output=True, text=True, env=TRACED)
+    assert traced.stdout == "-1 \n"
+    assert "libsysaux_probe.so" not in traced.stderr and "libblkid" not in traced.stderr
