@@ -241,8 +241,10 @@ class TestSecret:
             assert "Secret" not in shown and not any(b"Secret" in text for text in files)
 
     def test_no_core_shows_it(self, box):
-        box.write("/run-it", f"ulimit -c unlimited; cd /tmp; remvol -P {self.SECRET}\n")
-        box.run(["sh", "/run-it"])
+        """It is killed while one of its commands runs: that one's shell is the child of the tool."""
+        box.hook("system", "winshare_reload", through=True, effect="kill -SEGV $PPID")
+        box.write("/run-it", f'ulimit -c unlimited; cd /tmp; exec remvol --search -c 1 -U u -P {self.SECRET}\n')
+        assert box.run(["sh", "/run-it"]).status == -11
         assert not list(box.path("/tmp").glob("core*"))
 
     def test_a_program_that_it_starts_may_leave_a_core(self, box):
