@@ -35,6 +35,28 @@ class TestWorld:
             assert not other.path(f"{folder}/left-behind").exists()
         other.close()
 
+    def test_what_the_machine_has_set_up_for_itself_is_not_there(self, bare_box):
+        own = ["/etc/iscsi/iscsid.conf", "/etc/samba/smb.conf", "/usr/local/config/vv.xml", "/var/lib/iscsi/nodes/n"]
+        for path in own:
+            bare_box.write(path, "the machine's own")
+        # A box whose machine is this box: its first process answers on its input, and ends when nobody is there.
+        code = f"""if 1:
+            import os, socket, subprocess
+            mine, its = socket.socketpair(socket.AF_UNIX, socket.SOCK_SEQPACKET)
+            inner = subprocess.Popen([{str(bare_box.tools / "box")!r}, str(its.fileno())], pass_fds=[its.fileno()])
+            its.close()
+            print(mine.recv(4096).decode().split()[0], flush=True)
+            streams = [os.open("/dev/null", os.O_RDONLY), 1, 2]
+            words = ["run", "1", "/", "3", "sh", "-c", "cd /etc; ls -d iscsi samba hosts"]
+            socket.send_fds(mine, [b"".join(word.encode() + b"\\0" for word in words)], streams)
+            while not mine.recv(4096).startswith(b"ended"):
+                pass
+            mine.close()
+            inner.wait()
+        """
+        done = bare_box.run(["/usr/bin/python3", "-c", code])
+        assert done.lines == ["ready", "hosts"], done.stderr
+
     def test_a_path_is_followed_inside_the_box(self, bare_box):
         bare_box.write("/etc/iscsi/iscsid.conf", "a = b\n")
         bare_box.run(["ln", "-s", "/etc/iscsi", "/tmp/link"])

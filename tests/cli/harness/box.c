@@ -5,7 +5,8 @@
  * (the repository, the build). The box has mount, IPC, network, host name and process namespaces of its own;
  * its root is the machine's root with a layer in memory on top (seen in /fake/upper), so nothing that is done
  * in it stays. /run, /tmp, /mnt, /root and /dev start empty (/dev with the harmless devices), /sys/block
- * shows no disk, and /etc/mtab is there as on any booted system.
+ * shows no disk, /etc/mtab is there as on any booted system, and what the machine has set up for its own
+ * initiator, file servers and volumes (absent[]) is not.
  *
  * First answer: "ready PID" (seen from outside), or "failed TEXT". Then a request is fields separated by NUL,
  *   run ID FOLDER ARGUMENTS-COUNT ARGUMENT... VARIABLE...   with three descriptors: the standard streams
@@ -87,6 +88,22 @@ static void make_devices(void) {
   must(mkdir("dev/shm", 01777), "dev/shm");
 }
 
+/* What a machine may have set up for itself. In a layer above it, a device 0:0 says that the file is not
+ * there. */
+static void leave_out(void) {
+  static const char* const absent[] = {"fake",      "etc/iscsi",        "etc/NAS_CFG",       "etc/netatalk",
+                                       "etc/samba", "usr/local/config", "usr/local/modules", "var/lib/iscsi"};
+  for (size_t i = 0; i < sizeof absent / sizeof *absent; i++) {
+    char path[64];
+    snprintf(path, sizeof path, "/tmp/upper/%s", absent[i]);
+    char* name = strrchr(path, '/');
+    *name = '\0';
+    make_folders(path);
+    *name = '/';
+    must(mknod(path, S_IFCHR, makedev(0, 0)), path);
+  }
+}
+
 /* A look at the upper layer that changes nothing. */
 static int upper_layer(void) {
   struct mount_attr read_only = {.attr_set = MOUNT_ATTR_RDONLY};
@@ -112,6 +129,7 @@ static void make_root(char** keep) {
   int upper = upper_layer();
   must(mkdir("/tmp/work", 0755), "work folder");
   must(mkdir("/tmp/root", 0755), "root");
+  leave_out();
   must(mount("overlay", "/tmp/root", "overlay", 0, "lowerdir=/,upperdir=/tmp/upper,workdir=/tmp/work"),
        "overlay");
   must(chdir("/tmp/root"), "root");
