@@ -293,3 +293,23 @@ def test_completion(complete, line, offered):
 def test_completion_without_the_tree(complete):
     complete.box.tree.stop()
     assert complete("remvol --connect -n ") == []
+
+
+# --- the installation ---
+
+
+def test_what_is_installed_to_another_prefix_finds_its_programs_there(bare_box):
+    done = bare_box.run(["cmake", "--install", bare_box.build, "--prefix", "/opt/x"], env={"LD_PRELOAD": None})
+    assert done.status == 0, done.stderr
+    installed = bare_box.path("/opt/x")
+    units = {path.name: path.read_text() for path in (PACKAGING / "units").glob("*.service")}
+    for name, text in units.items():
+        for folder in ("bin", "lib/remvol"):
+            text = text.replace(f"/usr/{folder}/", f"/opt/x/{folder}/")
+        assert (installed / "lib/systemd/system" / name).read_text() == text
+        for word in text.split():
+            program = word.partition("=")[2]
+            assert not program.startswith("/opt/x/") or (bare_box.path(program)).exists()
+    for helper_file in (PACKAGING / "helpers").iterdir():
+        assert (installed / "lib/remvol" / helper_file.name).stat().st_mode & 0o111
+    assert (installed / "lib/tmpfiles.d/remvol.conf").exists()
