@@ -15,13 +15,33 @@ def pytest_configure(config):
     config.addinivalue_line("markers", "long: waits for half a minute, and starts first so that nothing waits for it")
 
 
+def pytest_addoption(parser):
+    parser.addoption("--cases", type=int, metavar="N",
+                     help="of each test at most N cases: the first, the last, and some at equal distances between them")
+
+
+def leave_out(config, items, left_out):
+    config.hook.pytest_deselected(items=[item for item in items if item in left_out])
+    items[:] = [item for item in items if item not in left_out]
+
+
+def further_cases(items, most):
+    """The tests beyond so many cases of one function."""
+    cases = {}
+    for item in items:
+        cases.setdefault(item.nodeid.partition("[")[0], []).append(item)
+    for same in cases.values():
+        chosen = {i * (len(same) - 1) // max(most - 1, 1) for i in range(most)}
+        yield from (item for number, item in enumerate(same) if number not in chosen)
+
+
 def pytest_collection_modifyitems(config, items):
+    if config.getoption("--cases"):
+        leave_out(config, items, set(further_cases(items, config.getoption("--cases"))))
     items.sort(key=lambda item: item.get_closest_marker("long") is None)
     if "REMVOL_SANITIZE:STRING=\n" in build_folder().joinpath("CMakeCache.txt").read_text():
         return
-    left_out = [item for item in items if item.get_closest_marker("unsanitized")]
-    config.hook.pytest_deselected(items=left_out)
-    items[:] = [item for item in items if item not in left_out]
+    leave_out(config, items, {item for item in items if item.get_closest_marker("unsanitized")})
 
 
 @pytest.fixture
