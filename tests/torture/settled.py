@@ -31,6 +31,9 @@ SUCCESS = (
     (r"^add-connected$", r"(disk|folder|mount) ",
      "a LUN that shows no usable disk, cannot be read back, or whose mount does not take hold stays added, and is "
      "mounted by the next --connect"),
+    (r"^recover$", r"tree /temp/remvol/recover/queue/",
+     "a run that does not get the recover lock, whatever the reason, has put its target into the queue; the next "
+     "recovery takes it from there"),
     (r"^format$", r"(folder|mount|disk) ",
      "a mount that never takes hold after the format is told by volume state 3 alone"),
     (r"^(disconnect|disconnect-all|del|del_lun)$", r"(folder|mount|target) ",
