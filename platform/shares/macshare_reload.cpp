@@ -1,5 +1,5 @@
 // macshare_reload: makes every mounted volume a netatalk share. Without netatalk there is nothing to do: Macs
-// then use the Samba shares, which winshare_reload prepares for them.
+// then use the Samba shares, which winshare_reload prepares for them. With --withdraw no volume is shared.
 #include <cerrno>
 #include <cstring>
 
@@ -17,7 +17,9 @@ constexpr char kLock[] = "afp-shares.lock";
 
 }  // namespace
 
-int main() {
+int main(int argc, char** argv) {
+  const Wish wish = read_wish(argc, argv);
+  if (wish == Wish::kWrong) return 2;
   open_log("macshare_reload");
   if (!is_installed("netatalk")) {
     log_line("netatalk is not installed; Macs use the Samba shares");
@@ -28,7 +30,8 @@ int main() {
     return 0;
   }
   const ServerConfig config = read_server_config(kConfig, kShares);
-  const Reload done = reload_shares({"macshare_reload", kShares, kNetatalkNames, config.names, ""});
+  const Reload done =
+      reload_shares({"macshare_reload", kShares, kNetatalkNames, config.names, "", wish == Wish::kWithdraw});
   if (!done.has_tree) {
     log_line("the configuration tree does not answer; only shares that are gone are taken out");
   } else if (!config.includes_shares && !done.shares.empty()) {

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdio>
 #include <cstring>
 
 #include "process.h"
@@ -52,11 +53,18 @@ std::vector<Section> missing_from(const std::vector<Section>& now, std::vector<S
 
 }  // namespace
 
+Wish read_wish(int argc, char** argv) {
+  if (argc == 1) return Wish::kReload;
+  if (argc == 2 && strcmp(argv[1], "--withdraw") == 0) return Wish::kWithdraw;
+  fprintf(stderr, "usage: %s [--withdraw]\n", argv[0]);
+  return Wish::kWrong;
+}
+
 Reload reload_shares(const Server& server) {
   const std::vector<Section> before = parse_sections(read_file(server.file));
   std::vector<Volume> volumes;
   Reload done{};
-  done.has_tree = read_volumes(volumes);
+  done.has_tree = server.withdraw || read_volumes(volumes);
   done.shares = done.has_tree ? shares_of(volumes, server) : still_mounted(before);
   done.gone = missing_from(done.shares, before);
   done.changed = done.shares != before;

@@ -17,10 +17,17 @@ struct Server {
   const NameRules& names;
   std::vector<std::wstring> taken;  // folded names of shares that are not ours
   std::string attribute_options;    // lines for volumes whose file system keeps user attributes
+  bool withdraw;                    // no volume is to be shared, whatever the tree says
 };
 
+// What the command line of a reload program asks for.
+enum class Wish { kReload, kWithdraw, kWrong };
+
+// Reads the command line; prints the usage when it is wrong.
+Wish read_wish(int argc, char** argv);
+
 struct Reload {
-  bool has_tree;                // false: the shares are the earlier ones that are still mounted
+  bool has_tree;                // false: the tree was asked, and the shares are those that are still mounted
   bool changed;                 // the generated file was replaced
   std::vector<Section> shares;  // what it holds now
   std::vector<Section> gone;    // what it held before

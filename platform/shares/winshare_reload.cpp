@@ -1,4 +1,5 @@
-// winshare_reload: makes every mounted volume a Samba share.
+// winshare_reload: makes every mounted volume a Samba share. With --withdraw, none: the volumes are about to
+// go.
 //
 // The shares stand in a file of their own that smb.conf includes. A running server is told only when that
 // file changed, and clients of a share that is gone are cut off, since the folder below it is no volume any
@@ -83,7 +84,9 @@ void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool h
 
 }  // namespace
 
-int main() {
+int main(int argc, char** argv) {
+  const Wish wish = read_wish(argc, argv);
+  if (wish == Wish::kWrong) return 2;
   open_log("winshare_reload");
   if (!take_turn(kLock)) {
     log_line("%s: %s", kLock, strerror(errno));
@@ -91,8 +94,8 @@ int main() {
   }
   ServerConfig config = read_server_config(kConfig, kShares);
   if (config.uses_registry) add_registry_shares(config);
-  const Reload done =
-      reload_shares({"winshare_reload", kShares, kSambaNames, config.names, options_for_macs(config)});
+  const Reload done = reload_shares({"winshare_reload", kShares, kSambaNames, config.names,
+                                     options_for_macs(config), wish == Wish::kWithdraw});
   const bool has_samba = is_installed("smbcontrol");
   tell_what_is_missing(done, config, has_samba);
   if (done.changed && has_samba) tell_samba(done);

@@ -53,9 +53,9 @@ class Shares:
     def umount(self, name):
         self.sh(f"umount '/mnt/VV/{name}' && rmdir '/mnt/VV/{name}'")
 
-    def reload(self, program="winshare_reload", path=None):
+    def reload(self, program="winshare_reload", *options, path=None):
         env = {"LD_PRELOAD": None, "PATH": path or self.path}
-        done = self.box.run([self.box.build / "bin" / program], env=env)
+        done = self.box.run([self.box.build / "bin" / program, *options], env=env)
         assert (done.status, done.stdout) == (0, "")
         return done.stderr
 
@@ -126,6 +126,22 @@ def test_a_change_replaces_the_file_in_one_step(shares):
     assert shares.file() == HEAD + section("V", read_only=True)
     assert shares.box.path(SHARES).stat().st_ino != before
     assert sorted(os.listdir(shares.box.path("/run/remvol"))) == ["smb-shares.conf", "smb-shares.lock"]
+
+
+def test_withdrawn_shares_are_gone_although_their_volumes_are_mounted(shares):
+    shares.add("Photos")
+    shares.reload()
+    shares.told()
+    assert shares.reload("winshare_reload", "--withdraw") == ""
+    assert shares.file() == HEAD
+    assert shares.told()[-1] == ["smbd", "close-share", "Photos"]
+    shares.reload()
+    assert "[Photos]" in shares.file()
+
+
+def test_a_reload_knows_no_other_option(shares):
+    done = shares.box.run([shares.box.build / "bin/winshare_reload", "--nothing"], env={"LD_PRELOAD": None})
+    assert done.status == 2 and done.stderr.startswith("usage: ")
 
 
 def test_clients_of_a_share_that_is_gone_are_cut_off(shares):
