@@ -1,0 +1,128 @@
+#include "attempt.h"
+
+#include <fcntl.h>
+#include <mntent.h>
+#include <net/if.h>
+#include <netdb.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <spawn.h>
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <vector>
+
+#include "tree_reader.h"
+
+namespace keeper {
+namespace {
+
+constexpr char kTool[] = "remvol";
+constexpr int kPatience = 3000;  // milliseconds
+constexpr const char* kPorts[] = {"egiga0", "egiga1", "bond0"};
+
+bool accepts(const addrinfo& address) {
+  const int fd = socket(address.ai_family, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+  if (fd < 0) return false;
+  bool connected = connect(fd, address.ai_addr, address.ai_addrlen) == 0;
+  if (!connected && errno == EINPROGRESS) {
+    pollfd waiting{fd, POLLOUT, 0};
+    int error = 0;
+    socklen_t size = sizeof error;
+    connected = poll(&waiting, 1, kPatience) == 1 &&
+                getsockopt(fd, SOL_SOCKET, SO_ERROR, &error, &size) == 0 && error == 0;
+  }
+  close(fd);
+  return connected;
+}
+
+bool accepts_at_a_port(const addrinfo& address) {
+  auto* name = reinterpret_cast<sockaddr_in6*>(address.ai_addr);
+  if (address.ai_family != AF_INET6 || !IN6_IS_ADDR_LINKLOCAL(&name->sin6_addr)) return accepts(address);
+  for (const char* port : kPorts) {
+    name->sin6_scope_id = if_nametoindex(port);
+    if (name->sin6_scope_id != 0 && accepts(address)) return true;
+  }
+  return false;
+}
+
+// Runs the tool silently: that a target is missing was told, and why is told by whoever connects it by hand.
+int run_tool(std::vector<const char*> arguments) {
+  arguments.insert(arguments.begin(), kTool);
+  arguments.push_back(nullptr);
+  posix_spawn_file_actions_t files;
+  posix_spawn_file_actions_init(&files);
+  posix_spawn_file_actions_addopen(&files, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
+  posix_spawn_file_actions_addopen(&files, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
+  pid_t process = -1;
+  const int error =
+      posix_spawnp(&process, kTool, &files, nullptr, const_cast<char* const*>(arguments.data()), environ);
+  posix_spawn_file_actions_destroy(&files);
+  int status = 0;
+  if (error != 0 || waitpid(process, &status, 0) < 0) return 1;
+  return WIFEXITED(status) ? WEXITSTATUS(status) : 1;
+}
+
+struct Stored {
+  std::string address, port;
+  std::vector<std::string> shares;
+};
+
+bool read_target(const std::string& target, Stored& stored) {
+  platform::TreeReader tree;
+  for (int n = 1; n <= platform::kTargets; n++) {
+    if (tree.value("/iscsi/initiator/id:%d/target", n) != target) continue;
+    stored.address = tree.value("/iscsi/initiator/id:%d/ip", n);
+    stored.port = tree.value("/iscsi/initiator/id:%d/port", n);
+    for (int m = 1; m <= platform::kLuns; m++) {
+      stored.shares.push_back(tree.value("/iscsi/initiator/id:%d/lun/id:%d/share", n, m));
+    }
+    return true;
+  }
+  return false;
+}
+
+bool has_mounted(const Stored& stored) {
+  FILE* table = setmntent("/proc/self/mounts", "re");
+  if (table == nullptr) return false;
+  bool found = false;
+  while (const mntent* entry = found ? nullptr : getmntent(table)) {
+    for (const std::string& share : stored.shares) {
+      found = found || (!share.empty() && "/mnt/VV/" + share == entry->mnt_dir);
+    }
+  }
+  endmntent(table);
+  return found;
+}
+
+}  // namespace
+
+bool portal_answers(const std::string& address, const std::string& port) {
+  std::string bare = address;
+  if (bare.size() > 2 && bare.front() == '[') bare = bare.substr(1, bare.size() - 2);
+  addrinfo hints{};
+  hints.ai_socktype = SOCK_STREAM;
+  addrinfo* found = nullptr;
+  if (getaddrinfo(bare.c_str(), port.c_str(), &hints, &found) != 0) return false;
+  bool answers = false;
+  for (const addrinfo* one = found; one != nullptr && !answers; one = one->ai_next)
+    answers = accepts_at_a_port(*one);
+  freeaddrinfo(found);
+  return answers;
+}
+
+int try_target(const std::string& target, bool refresh) {
+  Stored stored;
+  if (!read_target(target, stored)) return 1;
+  const bool mounted = has_mounted(stored);
+  // Says "Reconnecting", which is also what a recovery wants to find.
+  if (mounted) run_tool({"--oiscsi_evt_reopen", "-n", target.c_str()});
+  if (refresh) run_tool({"--status"});
+  if (!portal_answers(stored.address, stored.port)) return 1;
+  return run_tool({mounted ? "--oiscsi_evt_recover" : "--connect", "-n", target.c_str()});
+}
+
+}  // namespace keeper

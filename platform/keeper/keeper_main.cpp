@@ -1,0 +1,214 @@
+// remvol-keeper: sees to it that what should be there is there: the initiator's daemon, and a session of each
+// target that is to be connected.
+#include <poll.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/signalfd.h>
+#include <sys/wait.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <initializer_list>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "attempt.h"
+#include "netlink.h"
+#include "processes.h"
+#include "schedule.h"
+#include "sessions.h"
+#include "tree_reader.h"
+
+namespace keeper {
+namespace {
+
+constexpr char kInitiator[] = "iscsid", kTool[] = "remvol";
+constexpr int kLooksWithoutInitiator = 2;
+constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
+constexpr int kDisconnected = 0;         // connect state of the tree
+
+struct Daemon {
+  Schedule schedule;
+  int signals = -1, devices = -1;
+  pid_t process = -1;    // tries a target at this moment
+  int no_initiator = 0;  // looks in a row
+  bool first = true;     // no look yet: who is away now was taken when the settings say so
+};
+
+long now() {
+  timespec time{};
+  clock_gettime(CLOCK_MONOTONIC, &time);
+  return time.tv_sec;
+}
+
+// Sessions go because somebody wants it.
+bool is_taken_down() {
+  return runs(kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"});
+}
+
+// Starts a program that goes on when this one ends. Returns its process, or -1.
+pid_t start(std::initializer_list<const char*> words, const char* program) {
+  std::vector<const char*> argv(words);
+  argv.push_back(nullptr);
+  posix_spawnattr_t attributes;
+  sigset_t none;
+  sigemptyset(&none);
+  posix_spawnattr_init(&attributes);
+  posix_spawnattr_setsigmask(&attributes, &none);
+  posix_spawnattr_setpgroup(&attributes, 0);
+  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETPGROUP);
+  pid_t process = -1;
+  const int error =
+      posix_spawnp(&process, program, nullptr, &attributes, const_cast<char* const*>(argv.data()), environ);
+  posix_spawnattr_destroy(&attributes);
+  if (error != 0) fprintf(stderr, "<3>remvol-keeper: %s: %s\n", program, strerror(error));
+  return error != 0 ? -1 : process;
+}
+
+// Without the daemon no lost session is healed and none is made. Who stops it on purpose stops the tree as
+// well, or is still at work.
+void keep_initiator(Daemon& daemon, bool tree_answers, bool taken_down) {
+  if (!tree_answers || taken_down || runs(kInitiator) || runs(kTool, {"--init"})) {
+    daemon.no_initiator = 0;
+    return;
+  }
+  if (++daemon.no_initiator < kLooksWithoutInitiator) return;
+  daemon.no_initiator = 0;
+  fprintf(stderr, "<4>remvol-keeper: %s is gone, starting another one\n", kInitiator);
+  start({kInitiator, "-f"}, kInitiator);
+}
+
+std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
+  const std::vector<platform::Session> sessions = platform::read_sessions();
+  platform::TreeReader tree;
+  std::vector<Wanted> wanted;
+  for (int n = 1; n <= platform::kTargets; n++) {
+    const std::string name = tree.value("/iscsi/initiator/id:%d/target", n);
+    if (name.empty()) break;
+    if (tree.number(0, "/iscsi/initiator/id:%d/conn_set", n) == 0) continue;
+    const bool connected =
+        std::any_of(sessions.begin(), sessions.end(),
+                    [&name](const platform::Session& session) { return session.target == name; });
+    const bool is_taken =
+        taken_down ||
+        (first && tree.number(kDisconnected, "/iscsi/initiator/id:%d/conn_state", n) == kDisconnected);
+    wanted.push_back({name, connected, is_taken});
+  }
+  answered = tree.answered();
+  return wanted;
+}
+
+void try_again(Daemon& daemon, const Try& next) {
+  daemon.process =
+      start({"remvol-keeper", next.first ? "--try-first" : "--try", next.target.c_str()}, "/proc/self/exe");
+}
+
+void tell(Daemon& daemon) {
+  std::string target;
+  for (Change change; (change = daemon.schedule.next_change(target)) != Change::kNone;) {
+    if (change == Change::kMissing)
+      fprintf(stderr, "<4>remvol-keeper: %s should be connected and is not, it is tried until it is\n",
+              target.c_str());
+    else
+      fprintf(stderr, "<5>remvol-keeper: %s is connected again\n", target.c_str());
+  }
+}
+
+void look(Daemon& daemon) {
+  const bool taken_down = is_taken_down();
+  bool answered = false;
+  const std::vector<Wanted> wanted = read_wanted(daemon.first, taken_down, answered);
+  keep_initiator(daemon, answered, taken_down);
+  if (!answered) return;
+  daemon.first = false;
+  daemon.schedule.look(wanted, now());
+  tell(daemon);
+}
+
+// Returns false when the daemon is to end.
+bool take_signals(Daemon& daemon) {
+  bool ended = false;
+  signalfd_siginfo info;
+  while (read(daemon.signals, &info, sizeof info) == sizeof info) ended = ended || info.ssi_signo != SIGCHLD;
+  for (pid_t child; (child = waitpid(-1, nullptr, WNOHANG)) > 0;) {
+    if (child == daemon.process) daemon.process = -1;
+  }
+  return !ended;
+}
+
+// Waits for the next look: it is due at once when a session comes or goes, so that who takes it away is still
+// there.
+bool wait_for_look(Daemon& daemon) {
+  static unsigned char buffer[1 << 14];
+  const bool hurry = daemon.schedule.anything_missing() || daemon.no_initiator > 0;
+  const long due = now() + (hurry ? kHurry : kRest);
+  for (bool session = false; !session && now() < due;) {
+    pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}};
+    poll(inputs, 2, static_cast<int>(due - now()) * 1000);
+    if (inputs[0].revents != 0 && !take_signals(daemon)) return false;
+    events::Received received = events::Received::kMessage;
+    for (size_t size; (received = events::receive(daemon.devices, buffer, sizeof buffer, size)) ==
+                      events::Received::kMessage;) {
+      session = session || events::is_session_event(buffer, size);
+    }
+    session = session || received == events::Received::kOverrun;
+  }
+  return true;
+}
+
+bool open_inputs(Daemon& daemon) {
+  sigset_t set;
+  sigemptyset(&set);
+  for (int number : {SIGTERM, SIGINT, SIGCHLD}) sigaddset(&set, number);
+  sigprocmask(SIG_BLOCK, &set, nullptr);
+  daemon.signals = signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK);
+  daemon.devices = events::open_device_events();
+  return daemon.signals >= 0 && daemon.devices >= 0;
+}
+
+int serve() {
+  Daemon daemon;
+  if (!open_inputs(daemon)) {
+    fprintf(stderr, "<3>remvol-keeper: device events: %s\n", strerror(errno));
+    return 1;
+  }
+  do {
+    look(daemon);
+    Try next;
+    if (daemon.process < 0 && daemon.schedule.next_try(next, now())) try_again(daemon, next);
+  } while (wait_for_look(daemon));
+  return 0;
+}
+
+constexpr char kHelp[] =
+    "usage: remvol-keeper\n"
+    "Starts the initiator's daemon again when it has died, and has targets connected that should be and are "
+    "not.\n"
+    "Stays in the foreground.\n"
+    "  -h, --help     this text\n"
+    "  -V, --version  the version\n";
+
+}  // namespace
+}  // namespace keeper
+
+int main(int argc, char** argv) {
+  const std::string_view option = argc > 1 ? argv[1] : "";
+  if (option.empty()) return keeper::serve();
+  if (option == "--try-first" && argc == 3) return keeper::try_target(argv[2], true);
+  if (option == "--try" && argc == 3) return keeper::try_target(argv[2], false);
+  if (option == "-h" || option == "--help") {
+    fputs(keeper::kHelp, stdout);
+    return 0;
+  }
+  if (option == "-V" || option == "--version") {
+    puts("remvol-keeper " REMVOL_VERSION);
+    return 0;
+  }
+  fputs(keeper::kHelp, stderr);
+  return 2;
+}

@@ -1,0 +1,16 @@
+// Processes of the machine, as /proc shows them.
+#ifndef PLATFORM_KEEPER_PROCESSES_H
+#define PLATFORM_KEEPER_PROCESSES_H
+
+#include <initializer_list>
+#include <string_view>
+
+namespace keeper {
+
+// True when a process runs the program of that name, and one of its arguments is one of `options` (any when
+// there are none).
+bool runs(std::string_view program, std::initializer_list<std::string_view> options = {});
+
+}  // namespace keeper
+
+#endif

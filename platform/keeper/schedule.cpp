@@ -1,0 +1,73 @@
+#include "schedule.h"
+
+#include <algorithm>
+
+namespace keeper {
+namespace {
+
+// A recovery logs out and in again: a session is missing only when it stays away for some looks.
+constexpr int kLooks = 3;
+
+}  // namespace
+
+Schedule::Target& Schedule::find(const std::string& name) {
+  for (Target& target : targets_) {
+    if (target.name == name) return target;
+  }
+  targets_.push_back({});
+  targets_.back().name = name;
+  return targets_.back();
+}
+
+void Schedule::settle(Target& target, const Wanted& wanted, long now) {
+  if (wanted.connected) {
+    target.tell = target.missing && !target.tell;
+    target.missing = target.taken = false;
+    target.absent = 0;
+    return;
+  }
+  // Only who loses its session while somebody is at it is meant.
+  if (target.absent == 0 && wanted.is_taken) target.taken = true;
+  if (target.taken || target.missing || ++target.absent < kLooks) return;
+  target.missing = target.tell = true;
+  target.pause = kFirstPause;
+  target.due = now;
+}
+
+void Schedule::look(const std::vector<Wanted>& wanted, long now) {
+  for (Target& target : targets_) target.seen = false;
+  for (const Wanted& one : wanted) {
+    Target& target = find(one.name);
+    target.seen = true;
+    settle(target, one, now);
+  }
+  std::erase_if(targets_, [](const Target& target) { return !target.seen; });
+}
+
+Change Schedule::next_change(std::string& name) {
+  for (Target& target : targets_) {
+    if (!target.tell) continue;
+    target.tell = false;
+    name = target.name;
+    return target.missing ? Change::kMissing : Change::kBack;
+  }
+  return Change::kNone;
+}
+
+bool Schedule::next_try(Try& next, long now) {
+  for (Target& target : targets_) {
+    if (!target.missing || now < target.due) continue;
+    next = {target.name, target.pause == kFirstPause};
+    target.due = now + target.pause;
+    target.pause = std::min(2 * target.pause, kLongestPause);
+    return true;
+  }
+  return false;
+}
+
+bool Schedule::anything_missing() const {
+  return std::any_of(targets_.begin(), targets_.end(),
+                     [](const Target& target) { return !target.taken && target.absent > 0; });
+}
+
+}  // namespace keeper

@@ -1,0 +1,60 @@
+// When targets that should be connected and are not are tried again: decides, without trying.
+#ifndef PLATFORM_KEEPER_SCHEDULE_H
+#define PLATFORM_KEEPER_SCHEDULE_H
+
+#include <string>
+#include <vector>
+
+namespace keeper {
+
+// A target of the settings that is to be connected, as the machine has it now.
+struct Wanted {
+  std::string name;
+  bool connected;  // it has a session, working or not
+  bool is_taken;   // when it has none: somebody takes sessions away on purpose
+};
+
+struct Try {
+  std::string target;
+  bool first;  // since it is missing
+};
+
+enum class Change { kNone, kMissing, kBack };
+
+class Schedule {
+ public:
+  // Compares with what the machine has; to be called about once a second, `now` in seconds. A target that is
+  // no longer wanted is forgotten.
+  void look(const std::vector<Wanted>& wanted, long now);
+
+  // Takes a change that is to be told: a target is missing, or is back. Returns kNone when there is none.
+  Change next_change(std::string& target);
+
+  // Takes a target that is to be tried now; the next try comes later, up to kLongestPause seconds.
+  bool next_try(Try& next, long now);
+
+  // True when something is missing, so that looking every second is worth it.
+  bool anything_missing() const;
+
+  static constexpr long kFirstPause = 1, kLongestPause = 60;
+
+ private:
+  struct Target {
+    std::string name;
+    bool seen = false;     // it is among those that are wanted
+    bool taken = false;    // it was taken away on purpose, and stays away until it has been connected again
+    bool missing = false;  // told
+    bool tell = false;
+    int absent = 0;  // looks in a row without a session
+    long pause = kFirstPause, due = 0;
+  };
+
+  Target& find(const std::string& name);
+  static void settle(Target& target, const Wanted& wanted, long now);
+
+  std::vector<Target> targets_;
+};
+
+}  // namespace keeper
+
+#endif

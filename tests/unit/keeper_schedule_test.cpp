@@ -1,0 +1,107 @@
+// When a target that is missing is tried again.
+#include "schedule.h"
+
+#include <gtest/gtest.h>
+
+using namespace keeper;
+
+namespace {
+
+constexpr bool kConnected = true, kAbsent = false, kTaken = true;
+
+class KeeperSchedule : public testing::Test {
+ protected:
+  // A look at one target; a second passes.
+  void look(bool connected, bool is_taken = false) {
+    now_++;
+    schedule_.look({{"a", connected, is_taken}}, now_);
+  }
+
+  Change change() {
+    std::string target;
+    return schedule_.next_change(target);
+  }
+
+  // The seconds, from now, at which it is tried, while it stays away.
+  std::vector<long> tries(long seconds) {
+    std::vector<long> found;
+    const long start = now_;
+    for (Try next; now_ < start + seconds; look(kAbsent)) {
+      if (schedule_.next_try(next, now_)) found.push_back(now_ - start);
+    }
+    return found;
+  }
+
+  void lose() {
+    look(kConnected);
+    for (int i = 0; i < 3; i++) look(kAbsent);
+  }
+
+  Schedule schedule_;
+  long now_ = 100;
+};
+
+TEST_F(KeeperSchedule, StepsGrowToAMinute) {
+  lose();
+  EXPECT_EQ(change(), Change::kMissing);
+  EXPECT_EQ(tries(250), (std::vector<long>{0, 1, 3, 7, 15, 31, 63, 123, 183, 243}));
+  EXPECT_EQ(change(), Change::kNone);
+}
+
+TEST_F(KeeperSchedule, OnlyTheFirstTryIsTheFirst) {
+  lose();
+  Try next;
+  ASSERT_TRUE(schedule_.next_try(next, now_));
+  EXPECT_TRUE(next.first);
+  EXPECT_EQ(next.target, "a");
+  look(kAbsent);
+  ASSERT_TRUE(schedule_.next_try(next, now_));
+  EXPECT_FALSE(next.first);
+}
+
+TEST_F(KeeperSchedule, WhatIsBackIsToldAndBeginsAnew) {
+  lose();
+  EXPECT_EQ(change(), Change::kMissing);
+  tries(100);
+  look(kConnected);
+  EXPECT_EQ(change(), Change::kBack);
+  EXPECT_EQ(change(), Change::kNone);
+  EXPECT_FALSE(schedule_.anything_missing());
+  lose();
+  EXPECT_EQ(tries(5), (std::vector<long>{0, 1, 3}));
+}
+
+TEST_F(KeeperSchedule, ASessionThatIsMadeAnewIsNotMissing) {
+  look(kConnected);
+  look(kAbsent);
+  look(kAbsent);
+  EXPECT_TRUE(schedule_.anything_missing());
+  look(kConnected);
+  EXPECT_EQ(change(), Change::kNone);
+  EXPECT_EQ(tries(2), std::vector<long>());
+}
+
+TEST_F(KeeperSchedule, WhatIsTakenAwayStaysAwayUntilItWasConnected) {
+  look(kConnected);
+  look(kAbsent, kTaken);
+  EXPECT_EQ(tries(100), std::vector<long>());
+  EXPECT_FALSE(schedule_.anything_missing());
+  lose();
+  EXPECT_EQ(change(), Change::kMissing);
+}
+
+TEST_F(KeeperSchedule, WhatIsMissingIsNotTakenAwayWithOthers) {
+  lose();
+  look(kAbsent, kTaken);
+  EXPECT_EQ(tries(2), (std::vector<long>{0, 1}));
+}
+
+TEST_F(KeeperSchedule, WhatIsNotWantedAnyMoreIsForgotten) {
+  lose();
+  schedule_.look({}, ++now_);
+  EXPECT_EQ(change(), Change::kNone);
+  Try next;
+  EXPECT_FALSE(schedule_.next_try(next, now_));
+}
+
+}  // namespace
