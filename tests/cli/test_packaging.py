@@ -2,6 +2,7 @@
 
 import configparser
 import pathlib
+import re
 import shlex
 
 import pytest
@@ -111,8 +112,10 @@ def test_a_missing_module_is_said(bare_box):
 def test_modules_are_taken_away_again(kernel):
     helper(kernel, "modules")
     kernel.write(f"{FOLDER}/of-somebody-else.ko", "")
+    kernel.default("rmmod")
     assert helper(kernel, "modules", "remove").status == 0
     assert [path.name for path in kernel.path(FOLDER).iterdir()] == ["of-somebody-else.ko"]
+    assert [call[-1] for call in kernel.runs("rmmod")] == ["iscsi_tcp", "libiscsi_tcp", "libiscsi", "scsi_transport_iscsi"]
     kernel.path(f"{FOLDER}/of-somebody-else.ko").unlink()
     helper(kernel, "modules", "remove")
     assert not kernel.path("/usr/local/modules").exists()
@@ -154,6 +157,70 @@ def test_metrics_that_cannot_be_written_leave_the_old_ones(box):
 def test_a_machine_without_the_folder_is_told(box):
     done = helper(box, "metrics", "/nowhere")
     assert done.status != 0 and "/nowhere" in done.stderr
+
+
+# --- the initiator ---
+
+FILES = {"/etc/iscsi/iscsid.conf": "of Debian\n", "/etc/iscsi/initiatorname.iscsi": "InitiatorName=iqn.debian\n"}
+MASKED = ["iscsid.service", "iscsid.socket", "open-iscsi.service"]
+NODE = "/etc/iscsi/nodes/iqn.other/10.1.1.1,3260,1/default"
+
+
+@pytest.fixture
+def initiator(bare_box):
+    """A box in which the initiator has its own files, and a target of somebody else."""
+    bare_box.run(["rm", "-rf", "/etc/iscsi", "/etc/systemd/system", "/var/lib/remvol"])
+    for path, text in {**FILES, NODE: "record"}.items():
+        bare_box.write(path, text)
+    bare_box.default("deb-systemd-helper")
+    return bare_box
+
+
+def masked(box):
+    folder = box.path("/etc/systemd/system")
+    return sorted(path.name for path in folder.iterdir() if path.is_symlink()) if folder.exists() else []
+
+
+def test_the_initiator_is_given_back_as_it_was(initiator):
+    taken = helper(initiator, "initiator", "take")
+    assert taken.status == 0
+    assert "  recorded: iqn.other at 10.1.1.1:3260\n" in taken.stderr
+    assert masked(initiator) == MASKED
+    for path in FILES:
+        initiator.write(path, "ours")
+    ours = initiator.write("/etc/iscsi/nodes/iqn.ours/10.9.0.2,3260/default", "secret")
+    again = helper(initiator, "initiator", "take")
+    assert (again.status, again.stderr) == (0, "")
+    assert helper(initiator, "initiator", "give").status == 0
+    assert {path: initiator.path(path).read_text() for path in FILES} == FILES
+    assert initiator.path(NODE).read_text() == "record"
+    assert not ours.exists() and not ours.parent.parent.exists()
+    assert masked(initiator) == []
+    assert not initiator.path("/var/lib/remvol/initiator").exists()
+
+
+def test_a_unit_that_the_administrator_masked_stays_masked(initiator):
+    initiator.path("/etc/systemd/system").mkdir(parents=True)
+    initiator.path("/etc/systemd/system/open-iscsi.service").symlink_to("/dev/null")
+    helper(initiator, "initiator", "take")
+    assert masked(initiator) == MASKED
+    helper(initiator, "initiator", "give")
+    assert masked(initiator) == ["open-iscsi.service"]
+
+
+def test_an_initiator_without_files_gets_none_back(initiator):
+    initiator.run(["rm", "-r", "/etc/iscsi"])
+    assert (helper(initiator, "initiator", "take").stderr) == ""
+    for path in FILES:
+        initiator.write(path, "ours")
+    helper(initiator, "initiator", "give")
+    assert not any(initiator.path(path).exists() for path in FILES)
+
+
+def test_what_was_not_taken_is_not_given_back(initiator):
+    assert helper(initiator, "initiator", "give").status == 0
+    assert {path: initiator.path(path).read_text() for path in FILES} == FILES
+    assert helper(initiator, "initiator").status == 2
 
 
 # --- the tree at start ---
@@ -198,9 +265,11 @@ class Unit(configparser.RawConfigParser):
         super().__init__(strict=False, comment_prefixes="#", inline_comment_prefixes=None, delimiters="=")
         self.optionxform = str
         self.read(PACKAGING / "units" / name)
+        if "tree" in name:
+            self.read(PACKAGING / "units/remvol-tree.service.d/tree.conf")
 
 
-@pytest.mark.parametrize("name", ["remvol.service", "remvol-events.service"])
+@pytest.mark.parametrize("name", ["remvol.service", "remvol-events.service", "remvol-keeper.service"])
 def test_a_unit_that_mounts_for_others_has_no_mounts_of_its_own(name):
     service = Unit(name)["Service"]
     assert not set(PRIVATE_MOUNTS) & set(service)
@@ -210,15 +279,13 @@ def test_a_unit_that_mounts_for_others_has_no_mounts_of_its_own(name):
 
 @pytest.mark.parametrize("path", sorted((PACKAGING / "units").glob("*.service")), ids=lambda path: path.name)
 def test_what_a_unit_starts_is_installed(path):
-    unit = Unit(path.name)
-    programs = {p.name for p in (PACKAGING / "helpers").iterdir()}
-    for key in ("ExecStartPre", "ExecStart", "ExecStartPost", "ExecStop"):
-        if key in unit["Service"]:
-            program = pathlib.PurePath(shlex.split(unit["Service"][key])[0])
-            if program.parent == pathlib.PurePath("/usr/lib/remvol"):
-                assert program.name in programs
-            else:
-                assert str(program) in ("/usr/bin/remvol", "/usr/bin/ktree", "/usr/bin/remvol-events")
+    helpers = {p.name for p in (PACKAGING / "helpers").iterdir()}
+    ours = {"remvol", "ktree", "remvol-events", "remvol-keeper", "winshare_reload", "macshare_reload"}
+    started = [pathlib.PurePath(name) for name in re.findall(r"^Exec\w+=-?(\S+)", path.read_text(), re.M)]
+    assert started
+    for program in started:
+        places = {"/usr/lib/remvol": helpers, "/usr/bin": ours, "/bin": {"sh"}}
+        assert program.name in places[str(program.parent)]
 
 
 # --- completion ---

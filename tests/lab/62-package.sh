@@ -4,23 +4,25 @@
 units=/lib/systemd/system
 
 # unit NAME KEY: the values of a unit.
-unit() { sed -n "s/^$2=//p" "$units/$1.service"; }
+unit() { cat "$units/$1.service" "$units/$1.service.d"/*.conf 2>/dev/null | sed -n "s/^$2=-\?//p"; }
 
-# as_unit NAME KEY: runs the command of a unit.
+# as_unit NAME KEY: runs the command of a unit, of several the last one.
 as_unit() {
     capabilities=$(unit "$1" CapabilityBoundingSet | tr 'A-Z ' 'a-z\n' | sed -n 's/^cap_/,+/p' | tr -d '\n')
     # shellcheck disable=SC2046 # a list
-    exec setpriv --no-new-privs --bounding-set "-all$capabilities" $(unit "$1" "$2")
+    exec setpriv --no-new-privs --bounding-set "-all$capabilities" $(unit "$1" "$2" | tail -n 1)
 }
 
 start() {
     (as_unit remvol-tree ExecStart) &
-    (as_unit remvol-tree ExecStartPost)
-    (as_unit remvol ExecStartPre)
+    (as_unit remvol-general-tree ExecStart) &
+    wait_for 10 test -S $TREE_SOCKET
+    wait_for 10 test -S /var/run/ktree_sock
+    /usr/lib/remvol/modules
     (as_unit remvol ExecStart)
     expect_equal "the result of the start" 0 "$(result init)"
     expect_equal "the capabilities of the tree" 0000000000000000 \
-        "$(sed -n 's/^CapBnd:[[:space:]]*//p' "/proc/$(pgrep -x ktree)/status")"
+        "$(sed -n 's/^CapBnd:[[:space:]]*//p' "/proc/$(cat /var/run/ktree_sock_vv_config.pid)/status")"
     (as_unit remvol-events ExecStart) &
     listener=$!
 }
@@ -30,7 +32,10 @@ tree_is_gone() { ! pgrep -x ktree; }
 stop() {
     kill $listener
     wait $listener || : # 143 when it had not begun to listen
+    winshare_reload --withdraw
+    expect_not "a share is left" grep '^\[' /run/remvol/smb-shares.conf
     (as_unit remvol ExecStop)
+    kill "$(cat /run/ktree_sock_config.pid)"
     wait_for 10 tree_is_gone
     expect_equal "what is mounted" "" "$(grep /mnt/VV/ /proc/mounts)"
     expect_status 21 iscsiadm -m session
@@ -44,12 +49,14 @@ target_add 1 $IQN:t1
 lun_add 1 1 64M
 
 expect "the packages are installed" dpkg -i /packages/*.deb
-for program in ktree ktreec remvol remvol-events vvstat winshare_reload macshare_reload flashrun; do
+for program in ktree ktreec remvol remvol-events remvol-keeper vvstat winshare_reload macshare_reload flashrun; do
     expect "$program is in its place" test -x /usr/bin/$program
 done
 start
 volume_add t1 1 Photos
 works --connect -n $IQN:t1
+works --search -i 10.9.0.2 -p 3260
+expect_equal "what the portal offers" $IQN:t1 "$(ktreec -S /var/run/ktree_sock -g /temp/vv_search/id:1/name)"
 echo text >/mnt/VV/Photos/file
 expect_has "what the operator sees" Running "$(vvstat)"
 stop

@@ -1,0 +1,43 @@
+# timeout: 900
+# after: installed
+# The package is removed, installed again and purged while its volumes are in use.
+expect_nothing_runs() {
+    expect_equal "mounted volumes" "" "$(grep /mnt/VV/ /proc/mounts)"
+    expect_equal "sessions" "" "$(sessions)"
+    expect_not "the initiator runs" pgrep -x iscsid
+    expect_not "the tree runs" pgrep -x ktree
+    expect_lacks "the kernel's words" "I/O error" "$(dmesg)"
+    expect_lacks "the kernel's words" "detected conn error" "$(dmesg)"
+    expect_not "a share is left" grep -q '^\[' /run/remvol/smb-shares.conf
+    expect_equal "failed units" "" "$(systemctl list-units --failed --no-legend --plain)"
+}
+
+# as_before FILE: a file of open-iscsi is what its package brought, not what ours wrote.
+as_before() { expect_not "$1 is ours" grep -q -e 'replacement_timeout = 30$' -e 'iqn\.2013-03' "$1"; }
+
+works --modify -n $IQN:t1 -c 1 -U maria -P s3cr3tw0rd
+sh -c 'while date; do sleep 0.2; done >/mnt/VV/Photos/busy 2>/dev/null' &
+apt_quiet remove remvol || fail "the package is not removed"
+expect_nothing_runs
+as_before /etc/iscsi/iscsid.conf
+as_before /etc/iscsi/initiatorname.iscsi
+expect "the settings are there" grep -q Photos /etc/NAS_CFG/vv.xml
+
+works_again() { expect_equal "the file" "text of Photos" "$(cat /mnt/VV/Photos/file)"; }
+install_packages
+wait_for 30 mounted Photos
+works_again
+
+apt_quiet purge remvol libremvol1 || fail "the package is not purged"
+expect_nothing_runs
+as_before /etc/iscsi/iscsid.conf
+as_before /etc/iscsi/initiatorname.iscsi
+expect_equal "secrets that are left" "" "$(grep -rl s3cr3tw0rd /etc /usr/local /var/lib /run /tmp 2>/dev/null)"
+expect_equal "settings that are left" "" "$(ls -d /etc/NAS_CFG /usr/local/config/vv.xml 2>/dev/null)"
+expect_equal "node records that are left" "" "$(find /etc/iscsi/nodes /etc/iscsi/send_targets -type f 2>/dev/null)"
+expect_equal "loaded modules" "" "$(grep -o '^[a-z_]*iscsi[a-z_]*' /proc/modules)"
+expect_equal "files of the tool" "" "$(ls -d /tmp/remvol* /var/lock/virtual_volume /run/remvol 2>/dev/null)"
+
+install_packages
+expect_equal "volumes that came back" "" "$(ktreec -S $TREE_SOCKET -t | grep share=)"
+booted

@@ -1,0 +1,53 @@
+# timeout: 900
+# after: installed
+# The initiator's daemon dies, the volumes are started anew, open-iscsi is installed again, a stranger logs out: the
+# volumes are always there again, without hands.
+tree_restarts() { systemctl show -P NRestarts remvol-tree; }
+
+all_well() { mounted Photos && mounted Music && one_initiator && vvstat >/dev/null; }
+
+expect_well() {
+    wait_for 30 all_well
+    for share in Photos Music; do
+        expect "$share takes files, $1" sh -c "echo $1 >/mnt/VV/$share/now && sync /mnt/VV/$share/now"
+    done
+    for unit in remvol remvol-tree remvol-events; do expect_active $unit; done
+}
+
+# Another one, and the sessions are its own: they heal after the cable was out.
+old=$(initiators)
+kill -KILL "$old"
+sleep 1
+expect_not "the daemon is dead" test -d "/proc/$old"
+wait_for 5 one_initiator
+cable_cut 0
+wait_for 30 session_is $IQN:t1 FAILED
+cable_plug 0
+wait_for 60 session_is $IQN:t1 LOGGED_IN
+wait_for 60 session_is $IQN:t2 LOGGED_IN
+expect_well "after the daemon died"
+
+systemctl restart remvol
+expect_well "after a restart"
+restarts=$(tree_restarts)
+sleep 15
+expect_equal "restarts of the tree since" "$restarts" "$(tree_restarts)"
+expect_equal "the tree is its unit's" "$(systemctl show -P MainPID remvol-tree)" "$(cat /run/ktree_sock_vv_config.pid)"
+
+began=$(uptime_seconds)
+before=$(stat -c %i:%d /mnt/VV/Photos/file)
+initiator=$(initiators)
+apt_quiet install --reinstall open-iscsi || fail "open-iscsi is not installed again"
+expect "the volume stayed" mounted Photos
+expect_equal "it is the same mount" "$before" "$(stat -c %i:%d /mnt/VV/Photos/file)"
+expect_equal "the daemon" "$initiator" "$(initiators)"
+for unit in iscsid.socket iscsid.service open-iscsi.service; do
+    expect_equal "$unit" masked "$(systemctl is-enabled $unit)"
+done
+expect_well "after open-iscsi was installed again"
+
+iscsiadm -m session -u >/dev/null
+says_so() { ! vvstat >/tmp/vvstat.out && ! grep -q Running /tmp/vvstat.out; }
+wait_for 15 says_so
+wait_for 60 vvstat
+expect_well "after a stranger logged out"

@@ -1,0 +1,25 @@
+# timeout: 700
+# after: installed
+# The storage server is not there at boot: the boot does not wait for it, the texts say so, and the volumes come when it does.
+if [ "$PHASE" = 1 ]; then
+    target_at_boot off
+    reboot_machine
+fi
+reached() { systemctl is-active --quiet multi-user.target; }
+wait_for 120 reached
+boot=$(systemd-analyze | grep -o 'multi-user.target reached after.*\|graphical.target reached after.*')
+say "$boot"
+late=$(systemd-analyze critical-chain multi-user.target | grep remvol.service) || :
+expect_equal "what the boot waited for" "" "$late"
+says_so() { ! vvstat >/tmp/vvstat.out && ! grep -q Running /tmp/vvstat.out; }
+wait_for 30 says_so
+sleep 100
+expect "the texts are right" says_so
+tries=$(messages remvol-events | grep -c $IQN:t1)
+target_start
+all_there() { mounted Photos && mounted Music && vvstat; }
+wait_for 75 all_there
+booted
+sleep 5
+[ "$tries" -le 3 ] || fail "$tries lines in the log before the storage was there"
+expect_equal "the file" "text of Photos" "$(cat /mnt/VV/Photos/file)"
