@@ -14,7 +14,7 @@ expect_equal "LUNs" 1 "$(listed /temp/vv_search_lun/lun/count)"
 general=$(cat /run/ktree_sock_config.pid)
 kill -KILL "$general"
 answers() { ktreec -S $LISTS -s /temp/x 1; }
-wait_for 10 answers
+wait_for 40 answers
 general=$(cat /run/ktree_sock_config.pid)
 systemctl restart remvol
 expect_equal "the general tree after a restart of the volumes" "$general" "$(cat /run/ktree_sock_config.pid)"

@@ -8,7 +8,7 @@ expect_nothing_runs() {
     expect_not "the tree runs" pgrep -x ktree
     expect_lacks "the kernel's words" "I/O error" "$(dmesg)"
     expect_lacks "the kernel's words" "detected conn error" "$(dmesg)"
-    expect_not "a share is left" grep -q '^\[' /run/remvol/smb-shares.conf
+    expect_not "a share is left" grep -qs '^\[' /run/remvol/smb-shares.conf
     expect_equal "failed units" "" "$(systemctl list-units --failed --no-legend --plain)"
 }
 

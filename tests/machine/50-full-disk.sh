@@ -7,7 +7,7 @@ dd if=/dev/zero of=/fill2 bs=1k 2>/dev/null
 kill -KILL "$(cat /run/ktree_sock_vv_config.pid)"
 sleep 25
 rm /fill /fill2
-wait_for 20 tree_answers
+wait_for 60 tree_answers
 expect_active remvol-tree
 expect_equal "its volumes" "Photos Music" "$(ktreec -S $TREE_SOCKET -t | sed -n 's/.*share=//p' | xargs)"
 expect_equal "the file" "text of Photos" "$(cat /mnt/VV/Photos/file)"
