@@ -23,6 +23,7 @@ namespace {
 using platform::read_sessions;
 
 constexpr char kTool[] = "remvol";
+constexpr char kNotifier[] = "remvol-notify";
 constexpr int kMuchHurry = 50, kSomeHurry = 1000;  // milliseconds between looks
 
 struct Daemon {
@@ -48,12 +49,9 @@ int open_signals() {
   return signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK);
 }
 
-// Starts the tool with the signals as usual, in a process group of its own: it goes on when the listener is
-// stopped. Returns its process number, or -1.
-pid_t start_tool(const Order& order) {
-  const bool reopen = order.action == Action::kReopen;
-  const char* option = reopen ? "--oiscsi_evt_reopen" : "--oiscsi_evt_recover";
-  const char* argv[] = {kTool, option, "-n", order.target.c_str(), nullptr};
+// Starts a program with the signals as usual, in a process group of its own: it goes on when the listener is
+// stopped. Returns its process number, or -1 with errno.
+pid_t start(const char* const* argv) {
   posix_spawnattr_t attributes;
   sigset_t none;
   sigemptyset(&none);
@@ -62,14 +60,28 @@ pid_t start_tool(const Order& order) {
   posix_spawnattr_setpgroup(&attributes, 0);
   posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETPGROUP);
   pid_t process = -1;
-  const int error =
-      posix_spawnp(&process, kTool, nullptr, &attributes, const_cast<char* const*>(argv), environ);
+  errno = posix_spawnp(&process, argv[0], nullptr, &attributes, const_cast<char* const*>(argv), environ);
   posix_spawnattr_destroy(&attributes);
+  return errno != 0 ? -1 : process;
+}
+
+pid_t start_tool(const Order& order) {
+  const bool reopen = order.action == Action::kReopen;
+  const char* option = reopen ? "--oiscsi_evt_reopen" : "--oiscsi_evt_recover";
+  const char* argv[] = {kTool, option, "-n", order.target.c_str(), nullptr};
+  const pid_t process = start(argv);
   fprintf(stderr, "remvol-events: %s: %s\n", order.target.c_str(),
-          error != 0 ? strerror(error)
-          : reopen   ? "the connection is lost"
-                     : "the session is back");
-  return error != 0 ? -1 : process;
+          process < 0 ? strerror(errno)
+          : reopen    ? "the connection is lost"
+                      : "the session is back");
+  return process;
+}
+
+// The tree is up to date now: people and programs are told of what has changed.
+void notify(const Outcome& outcome) {
+  const char* changes[] = {kNotifier, nullptr};
+  const char* failure[] = {kNotifier, "--recovery-failed", outcome.given_up.c_str(), nullptr};
+  if (start(changes) < 0 || (!outcome.given_up.empty() && start(failure) < 0)) complain(kNotifier);
 }
 
 void give_orders(Daemon& daemon) {
@@ -106,7 +118,10 @@ void take_signals(Daemon& daemon) {
     if (info.ssi_signo != SIGCHLD) daemon.ended = true;
   }
   int status = 0;
-  for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) daemon.targets.ended(child, status != 0);
+  for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) {
+    const Outcome outcome = daemon.targets.ended(child, status != 0);
+    if (outcome.ordered) notify(outcome);
+  }
 }
 
 // Takes all that waits on a socket; `take(message, size)` gets each message.
@@ -188,9 +203,11 @@ int serve() {
 }
 
 constexpr char kHelp[] =
-    "usage: remvol-events\n"
+    "usage: remvol-events [--test]\n"
     "Runs \"remvol --oiscsi_evt_reopen -n TARGET\" when the connection of an iSCSI session is lost and\n"
-    "\"remvol --oiscsi_evt_recover -n TARGET\" when the session is back. Stays in the foreground.\n"
+    "\"remvol --oiscsi_evt_recover -n TARGET\" when the session is back, and remvol-notify after each.\n"
+    "Stays in the foreground.\n"
+    "  --test         has remvol-notify tell of an event that is none, and ends\n"
     "  -h, --help     this text\n"
     "  -V, --version  the version\n";
 
@@ -200,6 +217,11 @@ constexpr char kHelp[] =
 int main(int argc, char** argv) {
   const std::string_view option = argc > 1 ? argv[1] : "";
   if (option.empty()) return events::serve();
+  if (option == "--test") {
+    execlp("remvol-notify", "remvol-notify", "--test", nullptr);
+    perror("remvol-events: remvol-notify");
+    return 1;
+  }
   if (option == "-h" || option == "--help") {
     fputs(events::kHelp, stdout);
     return 0;

@@ -113,9 +113,11 @@ void Targets::started(const std::string& target, pid_t process) {
   chosen.busy = process > 0;
 }
 
-void Targets::ended(pid_t process, bool failed) {
+Outcome Targets::ended(pid_t process, bool failed) {
+  Outcome outcome;
   for (Target& target : targets_) {
     if (!target.busy || target.process != process) continue;
+    outcome.ordered = true;
     target.busy = false;
     if (!target.recovering) continue;
     if (!failed) {
@@ -123,8 +125,11 @@ void Targets::ended(pid_t process, bool failed) {
     } else if (!target.lost && target.retries < kMostRetries) {
       target.retries++;
       target.pause = kRetryPause;
+    } else if (!target.lost) {
+      outcome.given_up = target.name;
     }
   }
+  return outcome;
 }
 
 Hurry Targets::hurry() const {

@@ -23,6 +23,12 @@ struct Order {
   Action action;
 };
 
+// What the end of a process means.
+struct Outcome {
+  bool ordered = false;  // it did an order
+  std::string given_up;  // the target whose recovery failed for the last time; empty for none
+};
+
 // How soon the sessions must be looked at again although no event came.
 enum class Hurry { kNone, kSome, kMuch };
 
@@ -45,7 +51,7 @@ class Targets {
 
   // The process has ended. A recovery that failed is tried again some seconds later, a few times: runs that
   // come together wait for each other only so long.
-  void ended(pid_t process, bool failed);
+  Outcome ended(pid_t process, bool failed);
 
   Hurry hurry() const;
 

@@ -32,7 +32,7 @@ constexpr char kHealsItself[] = "look at the network and the storage server; it 
 // It stores so as well when a session shows no disk at start-up; the volumes' state alone tells that from a
 // disconnection.
 Problem given_up(const Target& target) {
-  return {"Given Up", "was given up at start-up: its target showed no disk",
+  return {Ailment::kFailed, "Given Up", "was given up at start-up: its target showed no disk",
           "see whether the storage server still offers its LUNs", connect(target)};
 }
 
@@ -42,19 +42,20 @@ Problem problem_of(const Target& target, const TargetFacts& facts) {
     case kConnected:
       break;
     case kConnecting:
-      return {"Connecting", "is being connected", "wait a minute", ""};
+      return {Ailment::kBusy, "Connecting", "is being connected", "wait a minute", ""};
     case kRecovering:
-      return {"Reconnecting", "the connection was lost", kHealsItself, ""};
+      return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
     case kConnectError:
-      return {"Connect Error", "the login failed", "check the address, the password and the cable",
-              connect(target)};
+      return {Ailment::kFailed, "Connect Error", "the login failed",
+              "check the address, the password and the cable", connect(target)};
     default:
-      return {"Disconnected", "is not connected", "connect it", connect(target)};
+      return {Ailment::kFailed, "Disconnected", "is not connected", "connect it", connect(target)};
   }
   if (facts.session.empty())
-    return {"No Session", "the target's session is gone, although nobody disconnected it", "connect it again",
-            connect(target)};
-  if (facts.session != "LOGGED_IN") return {"Reconnecting", "the connection was lost", kHealsItself, ""};
+    return {Ailment::kLost, "No Session", "the target's session is gone, although nobody disconnected it",
+            "connect it again", connect(target)};
+  if (facts.session != "LOGGED_IN")
+    return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
   return kNone;
 }
 
@@ -62,29 +63,33 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume) {
   const std::string format =
       "remvol --format -n " + quoted(target.name) + " -l " + std::to_string(volume.lun);
   if (volume.format_state == kFormatFailed)
-    return {"Format Failed", "its format failed", "look at the storage server and the kernel's log", format};
+    return {Ailment::kFailed, "Format Failed", "its format failed",
+            "look at the storage server and the kernel's log", format};
   if (volume.volume_state == kUnsupported)
-    return {"Unsupported", "what is on its disk cannot be mounted here",
+    return {Ailment::kFailed, "Unsupported", "what is on its disk cannot be mounted here",
             "the data is left as it is; this destroys it", format};
   if (volume.volume_state == kVolumeFailed)
-    return {"Failed", "its partition, format or mount failed",
+    return {Ailment::kFailed, "Failed", "its partition, format or mount failed",
             "look at the kernel's log for errors of the disk", connect(target)};
   if (volume.device.empty())
-    return {"No Disk", "its LUN has no disk here", "see whether the storage server still offers it",
-            connect(target)};
-  return {"Not Mounted", "is not mounted", "mount it again", connect(target)};
+    return {Ailment::kFailed, "No Disk", "its LUN has no disk here",
+            "see whether the storage server still offers it", connect(target)};
+  return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again", connect(target)};
 }
 
 Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {
   if (volume.format_state == kFormatRunning)
-    return {"Formatting", "is being formatted, " + std::to_string(volume.progress) + "%", "wait", ""};
+    return {Ailment::kBusy, "Formatting", "is being formatted, " + std::to_string(volume.progress) + "%",
+            "wait", ""};
   if (volume.format_state == kFormatWaiting)
-    return {"Wait to Format", "waits until another volume is formatted", "wait", ""};
-  if (volume.volume_state == kBeingCreated) return {"Creating", "is being created", "wait", ""};
+    return {Ailment::kBusy, "Wait to Format", "waits until another volume is formatted", "wait", ""};
+  if (volume.volume_state == kBeingCreated)
+    return {Ailment::kBusy, "Creating", "is being created", "wait", ""};
   if (!facts.mounted) return problem_of_unmounted(target, volume);
   // A write-protected LUN is read-only from the beginning, and the tree says so.
   if (facts.read_only && !(facts.disk_read_only && volume.read_only))
-    return {"Read Only", "became read-only: its file system has errors, or the LUN was write-protected",
+    return {Ailment::kReadOnly, "Read Only",
+            "became read-only: its file system has errors, or the LUN was write-protected",
             "disconnect it, check its file system with e2fsck, connect it again", connect(target)};
   return kNone;
 }
@@ -99,7 +104,7 @@ Row row_of(const Target& target, const TargetFacts& facts) {
 
 // What the tree says of a volume is kept unless the volume is not as well as it says.
 std::string status_of(const Volume& volume, const Problem& problem) {
-  const bool tells_so = problem.what.empty() || !volume.status.starts_with("Running");
+  const bool tells_so = problem.ailment == Ailment::kNone || !volume.status.starts_with("Running");
   return tells_so && !volume.status.empty() ? volume.status : problem.status;
 }
 

@@ -12,7 +12,16 @@ namespace vvstat {
 
 // What is wrong with a volume or its target. Texts are ASCII without ends of lines, but for the target's name
 // in the command.
+enum class Ailment {
+  kNone,
+  kBusy,      // it will be well by itself: it is being connected, created or formatted
+  kLost,      // the connection is gone, and comes back by itself or not
+  kReadOnly,  // it became read-only
+  kFailed,    // it waits for a person
+};
+
 struct Problem {
+  Ailment ailment = Ailment::kNone;
   std::string status;   // for the status column, where the tree's text says that all is well
   std::string what;     // goes behind "Photos: "; empty when nothing is wrong
   std::string advice;   // what a person does about it
@@ -33,7 +42,7 @@ struct Row {
   bool wanted;      // it should be connected, as far as can be told, and is not switched off
   Problem problem;  // of one that is wanted
 
-  bool healthy() const { return problem.what.empty(); }
+  bool healthy() const { return problem.ailment == Ailment::kNone; }
 };
 
 // The rows in the order of the tree. They point into `status`.

@@ -84,7 +84,8 @@ def test_the_manual_page_has_every_command_and_option_of_the_tool():
 
 
 @pytest.mark.parametrize("program, page", [("vvstat", "vvstat.1"), ("ktree", "ktree.8"), ("ktreec", "ktreec.1"),
-                                           ("remvol-events", "remvol-events.8"), ("remvol-keeper", "remvol-keeper.8")])
+                                           ("remvol-events", "remvol-events.8"), ("remvol-keeper", "remvol-keeper.8"),
+                                           ("remvol-notify", "remvol-notify.8")])
 def test_a_manual_page_has_every_option_of_its_program(program, page):
     help_text = subprocess.run([BUILD / "bin" / program, "--help"], stdout=subprocess.PIPE, text=True, check=True).stdout
     options = set(re.findall(r"(?<![\w-])(--?[A-Za-z][\w-]*)", help_text)) - set(re.findall(r"remvol (--\w+)", help_text))

@@ -34,6 +34,7 @@ class Events:
         assert done.status == 0, done.stderr
         self.daemon = None
         box.default("remvol")
+        box.default("remvol-notify")
 
     def session(self, number, target, state="LOGGED_IN", luns=True):
         folder = self.box.path(f"{SESSIONS}/session{number}")
@@ -293,6 +294,38 @@ def test_a_reopen_that_failed_is_not_tried_again(connected):
     connected.send(login_response(1))
     connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
     connected.box.wait_until(lambda: connected.asleep_for_good(), what="no retry")
+
+
+def test_people_are_told_after_each_order(connected):
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    told = lambda: connected.box.runs("remvol-notify")
+    connected.box.wait_until(lambda: told() == [[]], what="news of the loss")
+    connected.state(1, "LOGGED_IN")
+    connected.send(login_response(1))
+    connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+    connected.box.wait_until(lambda: told() == [[], []], what="news of the return")
+    connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end")
+
+
+def test_a_recovery_that_is_given_up_is_told(connected):
+    connected.box.fake("remvol", "--oiscsi_evt_recover", status=255)
+    connected.state(1, "FAILED")
+    connected.send(message(LOST, 1))
+    connected.wait_runs(reopen("iqn.a"))
+    connected.state(1, "LOGGED_IN")
+    connected.send(login_response(1))
+    connected.wait_runs(reopen("iqn.a"), *[recover("iqn.a")] * 4)
+    given_up = ["--recovery-failed", "iqn.a"]
+    connected.box.wait_until(lambda: given_up in connected.box.runs("remvol-notify"), what="news")
+    connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end of the retries")
+    assert connected.box.runs("remvol-notify").count(given_up) == 1
+
+
+def test_a_test_of_what_is_told(bare_box):
+    bare_box.fake("remvol-notify", "--test", status=1)
+    assert bare_box.run([bare_box.build / "bin" / "remvol-events", "--test"], env={"LD_PRELOAD": None}).status == 1
 
 
 def test_a_burst_of_eight_targets_loses_nothing(events):

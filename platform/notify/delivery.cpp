@@ -1,0 +1,174 @@
+#include "delivery.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <systemd/sd-journal.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <vector>
+
+namespace notify {
+namespace {
+
+constexpr char kFolder[] = "/etc/remvol/events.d";
+
+struct Form {
+  int priority;            // syslog(3)
+  const char* message_id;  // in packaging/remvol.catalog
+};
+
+// By the numbers of Kind.
+constexpr Form kForms[] = {
+    {LOG_ERR, "9ed0f88078e84644a9615f20f9b7ec79"},      // lost
+    {LOG_NOTICE, "a8b67254a84d414cb92c138f6c361f06"},   // back
+    {LOG_ERR, "cec71bd45f8842eca898881f1e7c00d3"},      // read-only
+    {LOG_ERR, "aca10eddad834bdaac8dd594cc5bc8c3"},      // recovery-failed
+    {LOG_ERR, "e4ba738ea99d4eadb5764d1c5b8ae028"},      // volume-failed
+    {LOG_NOTICE, "3c186e39b1474c6490c124c1b5596931"},   // format-done
+    {LOG_WARNING, "098f1413d38b43139c6787ef678e9a8b"},  // nearly-full
+    {LOG_INFO, "746f55b499aa48c6823cf5891c771352"},     // test
+};
+
+bool complain(const std::string& subject, const char* why) {
+  fprintf(stderr, "remvol-notify: %s: %s\n", subject.c_str(), why);
+  return false;
+}
+
+// Where no journal listens, standard error gets the message.
+bool log_event(const Event& event) {
+  const Form& form = kForms[static_cast<size_t>(event.kind)];
+  if (access("/run/systemd/journal/socket", W_OK) != 0) {
+    fprintf(stderr, "%s\n", event.message.c_str());
+    return true;
+  }
+  const int result =
+      sd_journal_send("MESSAGE=%s", event.message.c_str(), "PRIORITY=%d", form.priority, "MESSAGE_ID=%s",
+                      form.message_id, "EVENT=%s", name_of(event.kind).c_str(), "TARGET=%s",
+                      event.target.c_str(), "SHARE=%s", event.share.c_str(), nullptr);
+  return result >= 0 || complain("journal", strerror(-result));
+}
+
+// Runs the words under timeout(1), which ends the program and what it started; `input` is its standard input,
+// or negative for none.
+bool run(std::vector<std::string> words, int input = -1) {
+  const std::string program = words.front();
+  words.insert(words.begin(), {"timeout", "--kill-after=2", "30"});
+  std::vector<char*> argv;
+  for (std::string& word : words) argv.push_back(word.data());
+  argv.push_back(nullptr);
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+  if (input >= 0) posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
+  pid_t child = -1;
+  const int error = posix_spawnp(&child, argv[0], &actions, nullptr, argv.data(), environ);
+  posix_spawn_file_actions_destroy(&actions);
+  if (error != 0) return complain(program, strerror(error));
+  int status = 0;
+  while (waitpid(child, &status, 0) < 0 && errno == EINTR) continue;
+  if (WIFEXITED(status) && WEXITSTATUS(status) == 0) return true;
+  constexpr int kTimedOut = 124, kKilled = 137;
+  const int exit = WIFEXITED(status) ? WEXITSTATUS(status) : kKilled;
+  return complain(program, exit == kTimedOut || exit == kKilled ? "took longer than 30 seconds" : "failed");
+}
+
+std::string host_name() {
+  char name[HOST_NAME_MAX + 1] = "";
+  gethostname(name, sizeof name - 1);
+  return name;
+}
+
+bool mail_event(const Event& event, const Config& config) {
+  std::string text = "From: " + (config.mail_from.empty() ? "root" : config.mail_from) + "\n";
+  text.append("To: ").append(config.mail_address).append("\n");
+  text.append("Subject: ").append(name_of(event.kind)).append(" on ").append(host_name());
+  text.append("\nContent-Type: text/plain; charset=utf-8\nAuto-Submitted: auto-generated\n\n");
+  text.append(event.message).append("\n\nvvstat -x shows what needs attention.\n");
+  const int mail = memfd_create("mail", MFD_CLOEXEC);
+  if (mail < 0 || write(mail, text.data(), text.size()) < 0 || lseek(mail, 0, SEEK_SET) < 0)
+    return complain("mail", strerror(errno));
+  const bool sent = run({"sendmail", "-t"}, mail);
+  close(mail);
+  return sent;
+}
+
+// The rule of run-parts(8) for names.
+int is_program_name(const dirent* entry) {
+  constexpr char kCharacters[] = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_-";
+  return strspn(entry->d_name, kCharacters) == strlen(entry->d_name) ? 1 : 0;
+}
+
+std::vector<std::string> programs() {
+  std::vector<std::string> found;
+  dirent** entries = nullptr;
+  const int count = scandir(kFolder, &entries, is_program_name, alphasort);
+  for (int at = 0; at < count; ++at) {
+    const std::string path = std::string(kFolder) + "/" + entries[at]->d_name;
+    struct stat info {};
+    if (stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) && (info.st_mode & S_IXUSR) != 0)
+      found.push_back(path);
+    free(entries[at]);
+  }
+  free(entries);
+  return found;
+}
+
+void put_into_environment(const Event& event) {
+  setenv("REMVOL_EVENT", name_of(event.kind).c_str(), 1);
+  setenv("REMVOL_TARGET", event.target.c_str(), 1);
+  setenv("REMVOL_SHARE", event.share.c_str(), 1);
+  setenv("REMVOL_MESSAGE", event.message.c_str(), 1);
+}
+
+std::string rest_of(std::string_view line) {
+  const size_t first = line.find_first_not_of(" \t");
+  const size_t last = line.find_last_not_of(" \t\r");
+  return first == std::string_view::npos ? std::string() : std::string(line.substr(first, last - first + 1));
+}
+
+}  // namespace
+
+Config parse_config(std::string_view text) {
+  Config config;
+  while (!text.empty()) {
+    std::string_view line = text.substr(0, text.find('\n'));
+    text.remove_prefix(line.size() + (line.size() < text.size() ? 1 : 0));
+    line = line.substr(0, line.find('#'));
+    const std::string all = rest_of(line);
+    const std::string word = all.substr(0, all.find_first_of(" \t"));
+    const std::string value = rest_of(std::string_view(all).substr(word.size()));
+    if (word.empty()) continue;
+    std::string* place = word == "MAILADDR"   ? &config.mail_address
+                         : word == "MAILFROM" ? &config.mail_from
+                         : word == "PROGRAM"  ? &config.program
+                                              : nullptr;
+    if (place != nullptr) {
+      *place = value;
+    } else {
+      complain("remvol.conf", ("no such word: " + word).c_str());
+    }
+  }
+  return config;
+}
+
+bool deliver(const Event& event, const Config& config) {
+  bool good = log_event(event);
+  put_into_environment(event);
+  if (!config.program.empty())
+    good = run({config.program, name_of(event.kind), event.target, event.share}) && good;
+  for (const std::string& program : programs()) good = run({program}) && good;
+  if (!config.mail_address.empty()) good = mail_event(event, config) && good;
+  return good;
+}
+
+}  // namespace notify

@@ -1,0 +1,30 @@
+// How an event reaches people and programs.
+#ifndef PLATFORM_NOTIFY_DELIVERY_H
+#define PLATFORM_NOTIFY_DELIVERY_H
+
+#include <string>
+#include <string_view>
+
+#include "history.h"
+
+namespace notify {
+
+// remvol.conf(5): words and habits are those of mdadm.conf(5).
+struct Config {
+  std::string mail_address;  // empty: no mail
+  std::string mail_from;     // empty: root
+  std::string program;       // empty: none
+};
+
+// Reads the text of the file; a line that is not known is named on standard error.
+Config parse_config(std::string_view text);
+
+// Writes the event to the journal, with its priority, a MESSAGE_ID that the catalog explains, EVENT=, TARGET=
+// and SHARE=; runs the program of the configuration and those in /etc/remvol/events.d; mails it by
+// sendmail(8). Each program that it runs is ended after 30 seconds. Returns false when something of it
+// failed, which is said on standard error.
+bool deliver(const Event& event, const Config& config);
+
+}  // namespace notify
+
+#endif

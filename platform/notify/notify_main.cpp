@@ -1,0 +1,138 @@
+// remvol-notify: looks at the volumes and tells people and programs what has changed since its last look.
+#include <fcntl.h>
+#include <getopt.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "delivery.h"
+#include "history.h"
+#include "kernel.h"
+#include "status.h"
+#include "tree_reader.h"
+#include "utf8.h"
+
+namespace notify {
+namespace {
+
+constexpr char kRunFolder[] = "/run/remvol";  // the tool's too; only root may enter it
+constexpr char kHistory[] = "/run/remvol/history";
+constexpr char kConfig[] = "/etc/remvol/remvol.conf";
+constexpr int kFailed = 1, kUsage = 2, kUnreachable = 3;
+
+bool complain(const char* subject) {
+  fprintf(stderr, "remvol-notify: %s: %s\n", subject, strerror(errno));
+  return false;
+}
+
+// All of an open file, from its beginning.
+std::string content_of(int file) {
+  std::string text;
+  char buffer[4096];
+  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
+    text.append(buffer, static_cast<size_t>(n));
+  return text;
+}
+
+Config read_config() {
+  const int file = open(kConfig, O_RDONLY | O_CLOEXEC);
+  if (file < 0) return {};
+  const Config config = parse_config(content_of(file));
+  close(file);
+  return config;
+}
+
+// Another look at the same time waits: each change is found by one of them. The file goes with the machine's
+// run time, so a torn one costs a message told twice.
+bool look(const vvstat::Status& status, std::vector<Event>& events) {
+  mkdir(kRunFolder, 0700);
+  const int file = open(kHistory, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+  if (file < 0 || flock(file, LOCK_EX) != 0) return complain(kHistory);
+  History history = history_of(content_of(file));
+  events = compare(vvstat::assess(status, vvstat::read_facts(status)), time(nullptr), history);
+  const std::string text = text_of(history);
+  const bool written = ftruncate(file, 0) == 0 &&
+                       pwrite(file, text.data(), text.size(), 0) == static_cast<ssize_t>(text.size());
+  if (!written) complain(kHistory);
+  close(file);
+  return written;
+}
+
+int tell(const std::vector<Event>& events) {
+  const Config config = read_config();
+  bool good = true;
+  for (const Event& event : events) good = deliver(event, config) && good;
+  return good ? 0 : kFailed;
+}
+
+int look_and_tell() {
+  const vvstat::Status status = vvstat::read_status(platform::TreeReader());
+  if (!status.reachable) {
+    fputs("remvol-notify: the configuration tree cannot be reached\n", stderr);
+    return kUnreachable;
+  }
+  std::vector<Event> events;
+  const bool looked = look(status, events);
+  const int told = tell(events);
+  return looked ? told : kFailed;
+}
+
+int tell_of_failed_recovery(const char* target) {
+  const std::string name = platform::printable(target);
+  return tell({{Kind::kRecoveryFailed, name, "",
+                "Target " + name + ": its recovery failed and is not tried again; run: remvol --connect -n " +
+                    name}});
+}
+
+constexpr char kHelp[] =
+    "usage: remvol-notify [--test | --recovery-failed TARGET]\n"
+    "Looks at the volumes of remote targets and tells what has changed since its last look: in the\n"
+    "journal, by mail and by programs, as remvol.conf(5) says.\n"
+    "  --test                    tells of an event that is none\n"
+    "  --recovery-failed TARGET  tells that a recovery is not tried again\n"
+    "  -h, --help                this text\n"
+    "  -V, --version             the version\n"
+    "Exit status: 0 all is told, 1 something could not be, 2 usage, 3 the configuration tree cannot be\n"
+    "reached.\n";
+
+constexpr option kLongOptions[] = {{"test", no_argument, nullptr, 't'},
+                                   {"recovery-failed", required_argument, nullptr, 'r'},
+                                   {"help", no_argument, nullptr, 'h'},
+                                   {"version", no_argument, nullptr, 'V'},
+                                   {}};
+
+int run(int argc, char** argv) {
+  const int letter = getopt_long(argc, argv, "hV", kLongOptions, nullptr);
+  const char* target = optarg;
+  if (optind == argc) {
+    switch (letter) {
+      case -1:
+        return look_and_tell();
+      case 't':
+        return tell({{Kind::kTest, "", "", "A test of what is told when something happens to a volume"}});
+      case 'r':
+        return tell_of_failed_recovery(target);
+      case 'h':
+        fputs(kHelp, stdout);
+        return 0;
+      case 'V':
+        puts("remvol-notify " REMVOL_VERSION);
+        return 0;
+      default:
+        break;
+    }
+  }
+  fputs("Try 'remvol-notify --help'.\n", stderr);
+  return kUsage;
+}
+
+}  // namespace
+}  // namespace notify
+
+int main(int argc, char** argv) {
+  return notify::run(argc, argv);
+}

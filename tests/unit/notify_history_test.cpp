@@ -1,0 +1,152 @@
+// What is told of a volume, and how often.
+#include "history.h"
+
+#include <gtest/gtest.h>
+
+namespace notify {
+namespace {
+
+using vvstat::Row;
+using vvstat::Target;
+using vvstat::Volume;
+
+constexpr time_t kStart = 1'000'000;
+
+class Told : public testing::Test {
+ protected:
+  Told() {
+    target_.name = "iqn.t1";
+    volume_.lun = 1;
+    volume_.share = "Photos";
+    row_ = {&target_, &volume_, "", "", "", true, false, 0, 100, true, {}};
+  }
+
+  // What is told when the volume is so, that long after the beginning.
+  std::vector<std::string> at(time_t seconds, Ailment ailment) {
+    row_.problem.ailment = ailment;
+    row_.problem.what = ailment == Ailment::kNone ? "" : "is ill";
+    std::vector<std::string> names;
+    for (const Event& event : compare({row_}, kStart + seconds, history_)) {
+      names.push_back(name_of(event.kind));
+      message_ = event.message;
+    }
+    return names;
+  }
+
+  using Names = std::vector<std::string>;
+  Target target_{};
+  Volume volume_{};
+  Row row_{};
+  History history_;
+  std::string message_;
+};
+
+TEST_F(Told, NothingOfAHealthyVolume) {
+  EXPECT_EQ(at(0, Ailment::kNone), Names{});
+  EXPECT_EQ(at(600, Ailment::kNone), Names{});
+}
+
+TEST_F(Told, ALossAtOnceAndTheReturnAfterAMinute) {
+  at(0, Ailment::kNone);
+  EXPECT_EQ(at(1, Ailment::kLost), Names{"lost"});
+  EXPECT_EQ(message_, "Volume Photos: is ill; ");
+  EXPECT_EQ(at(10, Ailment::kLost), Names{});
+  EXPECT_EQ(at(20, Ailment::kNone), Names{});
+  EXPECT_EQ(at(79, Ailment::kNone), Names{});
+  EXPECT_EQ(at(80, Ailment::kNone), Names{"back"});
+  EXPECT_EQ(message_, "Volume Photos: is well again");
+  EXPECT_EQ(at(200, Ailment::kNone), Names{});
+}
+
+TEST_F(Told, OneLossHoweverOftenItFlaps) {
+  at(0, Ailment::kNone);
+  EXPECT_EQ(at(1, Ailment::kLost), Names{"lost"});
+  for (time_t time = 10; time < 1000; time += 50) {
+    EXPECT_EQ(at(time, Ailment::kNone), Names{});
+    EXPECT_EQ(at(time + 10, Ailment::kBusy), Names{});
+    EXPECT_EQ(at(time + 20, Ailment::kLost), Names{});
+  }
+  at(1000, Ailment::kNone);
+  EXPECT_EQ(at(1060, Ailment::kNone), Names{"back"});
+}
+
+TEST_F(Told, WhatGetsWorseOnTheWay) {
+  EXPECT_EQ(at(0, Ailment::kLost), Names{"lost"});
+  EXPECT_EQ(at(1, Ailment::kReadOnly), Names{"read-only"});
+  EXPECT_EQ(at(2, Ailment::kFailed), Names{"volume-failed"});
+  EXPECT_EQ(at(3, Ailment::kBusy), Names{});
+  EXPECT_EQ(at(4, Ailment::kNone), Names{});
+  EXPECT_EQ(at(64, Ailment::kNone), Names{"back"});
+}
+
+TEST_F(Told, WorkThatEndsWellIsNoNews) {
+  EXPECT_EQ(at(0, Ailment::kBusy), Names{});
+  EXPECT_EQ(at(100, Ailment::kNone), Names{});
+  EXPECT_EQ(at(200, Ailment::kNone), Names{});
+}
+
+TEST_F(Told, TheEndOfAFormat) {
+  volume_.format_state = vvstat::kFormatRunning;
+  EXPECT_EQ(at(0, Ailment::kBusy), Names{});
+  volume_.format_state = 0;
+  EXPECT_EQ(at(5, Ailment::kBusy), Names{});  // it is being mounted
+  EXPECT_EQ(at(10, Ailment::kNone), Names{"format-done"});
+  EXPECT_EQ(at(20, Ailment::kNone), Names{});
+}
+
+TEST_F(Told, AFormatThatFailedIsNotDone) {
+  volume_.format_state = vvstat::kFormatRunning;
+  at(0, Ailment::kBusy);
+  volume_.format_state = vvstat::kFormatFailed;
+  EXPECT_EQ(at(10, Ailment::kFailed), Names{"volume-failed"});
+}
+
+TEST_F(Told, AVolumeThatIsNotWantedIsForgotten) {
+  EXPECT_EQ(at(0, Ailment::kLost), Names{"lost"});
+  row_.wanted = false;
+  EXPECT_EQ(at(1, Ailment::kNone), Names{});
+  row_.wanted = true;
+  EXPECT_EQ(at(2, Ailment::kLost), Names{"lost"});
+}
+
+TEST_F(Told, NearlyFullOnceUntilThereIsRoom) {
+  row_.used = 94;
+  EXPECT_EQ(at(0, Ailment::kNone), Names{});
+  row_.used = 95;
+  EXPECT_EQ(at(1, Ailment::kNone), Names{"nearly-full"});
+  row_.used = 90;
+  at(2, Ailment::kNone);
+  row_.used = 96;
+  EXPECT_EQ(at(3, Ailment::kNone), Names{});
+  row_.used = 89;
+  at(4, Ailment::kNone);
+  row_.used = 96;
+  EXPECT_EQ(at(5, Ailment::kNone), Names{"nearly-full"});
+}
+
+TEST_F(Told, ATargetWithoutVolumes) {
+  row_.volume = nullptr;
+  row_.size = 0;
+  EXPECT_EQ(at(0, Ailment::kFailed), Names{"volume-failed"});
+  EXPECT_EQ(message_, "Target iqn.t1: is ill; ");
+}
+
+TEST_F(Told, TheHistoryIsKeptAsText) {
+  volume_.share = "two words\n\x1b";
+  at(0, Ailment::kLost);
+  row_.used = 99;
+  at(5, Ailment::kReadOnly);
+  const std::string text = text_of(history_);
+  EXPECT_EQ(text, "3 1000005 3 0 1 iqn.t1 1 two words\\x0A\\x1B\n");
+  EXPECT_EQ(history_of(text), history_);
+}
+
+TEST(History, ALineThatIsNoneIsLeftOut) {
+  for (const char* text :
+       {"", "\n", "x", "1 2 3", "9 1 0 0 0 k\n", "0 1 9 0 0 k", "-1 0 0 0 0 k", "0 0 0 0 0 "})
+    EXPECT_TRUE(history_of(text).empty()) << text;
+  EXPECT_EQ(history_of("rubbish\n1 7 0 0 0 a b\n2 8").size(), 1U);
+}
+
+}  // namespace
+}  // namespace notify
