@@ -122,6 +122,7 @@ def connected(events):
     events.session(1, "iqn.a")
     events.start()
     events.wait_runs(recover("iqn.a"))
+    events.box.wait_until(lambda: events.box.runs("remvol-notify"), what="news of the first look")
     events.box.forget()
     return events
 
