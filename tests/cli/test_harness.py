@@ -47,7 +47,7 @@ class TestWorld:
             its.close()
             print(mine.recv(4096).decode().split()[0], flush=True)
             streams = [os.open("/dev/null", os.O_RDONLY), 1, 2]
-            words = ["run", "1", "/", "3", "sh", "-c", "cd /etc; ls -d iscsi samba hosts"]
+            words = ["run", "1", "/", "3", "sh", "-c", "cd /etc; ls -d iscsi samba passwd"]
             socket.send_fds(mine, [b"".join(word.encode() + b"\\0" for word in words)], streams)
             while not mine.recv(4096).startswith(b"ended"):
                 pass
@@ -55,7 +55,7 @@ class TestWorld:
             inner.wait()
         """
         done = bare_box.run(["/usr/bin/python3", "-c", code])
-        assert done.lines == ["ready", "hosts"], done.stderr
+        assert done.lines == ["ready", "passwd"], done.stderr
 
     def test_a_path_is_followed_inside_the_box(self, bare_box):
         bare_box.write("/etc/iscsi/iscsid.conf", "a = b\n")
