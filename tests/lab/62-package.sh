@@ -49,7 +49,7 @@ target_add 1 $IQN:t1
 lun_add 1 1 64M
 
 expect "the packages are installed" dpkg -i /packages/*.deb
-for program in ktree ktreec remvol remvol-events remvol-keeper vvstat winshare_reload macshare_reload flashrun; do
+for program in ktree ktreec remvol remvol-events remvol-keeper remvol-notify vvstat winshare_reload macshare_reload flashrun; do
     expect "$program is in its place" test -x /usr/bin/$program
 done
 start

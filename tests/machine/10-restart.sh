@@ -8,7 +8,7 @@ expect_volumes() {
         expect_equal "the file of $share" "text of $share" "$(cat /mnt/VV/$share/file)"
         expect_has "what Samba is to offer" "[$share]" "$(testparm -s 2>/dev/null)"
     done
-    expect_equal "what the operator sees" "Running Running" "$(vvstat | awk '$2 == "LUN" { print $4 }' | xargs)"
+    expect_equal "what the operator sees" "Running Running" "$(vvstat -no STATUS | xargs)"
     expect "nothing that should be connected is not" vvstat
 }
 
