@@ -1,7 +1,6 @@
 // remvol-events: tells the tool when the connection of an iSCSI session is lost and when it is back.
 #include <poll.h>
 #include <signal.h>
-#include <spawn.h>
 #include <sys/signalfd.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -15,6 +14,7 @@
 #include "kernel_event.h"
 #include "netlink.h"
 #include "sessions.h"
+#include "start.h"
 #include "targets.h"
 
 namespace events {
@@ -49,27 +49,11 @@ int open_signals() {
   return signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK);
 }
 
-// Starts a program with the signals as usual, in a process group of its own: it goes on when the listener is
-// stopped. Returns its process number, or -1 with errno.
-pid_t start(const char* const* argv) {
-  posix_spawnattr_t attributes;
-  sigset_t none;
-  sigemptyset(&none);
-  posix_spawnattr_init(&attributes);
-  posix_spawnattr_setsigmask(&attributes, &none);
-  posix_spawnattr_setpgroup(&attributes, 0);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETPGROUP);
-  pid_t process = -1;
-  errno = posix_spawnp(&process, argv[0], nullptr, &attributes, const_cast<char* const*>(argv), environ);
-  posix_spawnattr_destroy(&attributes);
-  return errno != 0 ? -1 : process;
-}
-
 pid_t start_tool(const Order& order) {
   const bool reopen = order.action == Action::kReopen;
   const char* option = reopen ? "--oiscsi_evt_reopen" : "--oiscsi_evt_recover";
   const char* argv[] = {kTool, option, "-n", order.target.c_str(), nullptr};
-  const pid_t process = start(argv);
+  const pid_t process = platform::start(kTool, argv);
   fprintf(stderr, "remvol-events: %s: %s\n", order.target.c_str(),
           process < 0 ? strerror(errno)
           : reopen    ? "the connection is lost"
@@ -81,7 +65,9 @@ pid_t start_tool(const Order& order) {
 void notify(const Outcome& outcome) {
   const char* changes[] = {kNotifier, nullptr};
   const char* failure[] = {kNotifier, "--recovery-failed", outcome.given_up.c_str(), nullptr};
-  if (start(changes) < 0 || (!outcome.given_up.empty() && start(failure) < 0)) complain(kNotifier);
+  const auto start = platform::start;
+  if (start(kNotifier, changes) < 0 || (!outcome.given_up.empty() && start(kNotifier, failure) < 0))
+    complain(kNotifier);
 }
 
 void give_orders(Daemon& daemon) {

@@ -2,7 +2,6 @@
 // target that is to be connected.
 #include <poll.h>
 #include <signal.h>
-#include <spawn.h>
 #include <sys/signalfd.h>
 #include <sys/wait.h>
 #include <time.h>
@@ -22,6 +21,7 @@
 #include "processes.h"
 #include "schedule.h"
 #include "sessions.h"
+#include "start.h"
 #include "tree_reader.h"
 
 namespace keeper {
@@ -55,19 +55,9 @@ bool is_taken_down() {
 pid_t start(std::initializer_list<const char*> words, const char* program) {
   std::vector<const char*> argv(words);
   argv.push_back(nullptr);
-  posix_spawnattr_t attributes;
-  sigset_t none;
-  sigemptyset(&none);
-  posix_spawnattr_init(&attributes);
-  posix_spawnattr_setsigmask(&attributes, &none);
-  posix_spawnattr_setpgroup(&attributes, 0);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETPGROUP);
-  pid_t process = -1;
-  const int error =
-      posix_spawnp(&process, program, nullptr, &attributes, const_cast<char* const*>(argv.data()), environ);
-  posix_spawnattr_destroy(&attributes);
-  if (error != 0) fprintf(stderr, "<3>remvol-keeper: %s: %s\n", program, strerror(error));
-  return error != 0 ? -1 : process;
+  const pid_t process = platform::start(program, argv.data());
+  if (process < 0) fprintf(stderr, "<3>remvol-keeper: %s: %s\n", program, strerror(errno));
+  return process;
 }
 
 // Without the daemon no lost session is healed and none is made. Who stops it on purpose stops the tree as

@@ -83,9 +83,9 @@ int look_and_tell() {
 
 int tell_of_failed_recovery(const char* target) {
   const std::string name = platform::printable(target);
+  const std::string command = platform::printable(vvstat::connect_command(target));
   return tell({{Kind::kRecoveryFailed, name, "",
-                "Target " + name + ": its recovery failed and is not tried again; run: remvol --connect -n " +
-                    name}});
+                "Target " + name + ": its recovery failed and is not tried again; run: " + command}});
 }
 
 constexpr char kHelp[] =

@@ -17,7 +17,7 @@ std::string quoted(const std::string& name) {
 }
 
 std::string connect(const Target& target) {
-  return "remvol --connect -n " + quoted(target.name);
+  return connect_command(target.name);
 }
 
 // The tool stores that a target is not to be connected when somebody disconnects it, but also when a login
@@ -139,6 +139,10 @@ std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& fa
     for (size_t n = 0; n < target.volumes.size(); ++n) rows.push_back(row_of(target, facts[at], n));
   }
   return rows;
+}
+
+std::string connect_command(const std::string& target_name) {
+  return "remvol --connect -n " + quoted(target_name);
 }
 
 bool all_healthy(const std::vector<Row>& rows) {

@@ -48,6 +48,10 @@ struct Row {
 // The rows in the order of the tree. They point into `status`.
 std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& facts);
 
+// The command that connects the target, to be given to a shell: the name is one word of it, whatever it
+// holds.
+std::string connect_command(const std::string& target_name);
+
 // True when nothing that is wanted has a problem.
 bool all_healthy(const std::vector<Row>& rows);
 

@@ -127,6 +127,11 @@ def test_a_recovery_that_is_given_up(example, journal):  # noqa: F811
     assert (entry["EVENT"], entry["PRIORITY"], entry["TARGET"]) == ("recovery-failed", "3", "iqn.\\x1B")
 
 
+def test_the_command_of_a_message_can_be_copied_whatever_the_name_is(example, journal):  # noqa: F811
+    notify(example, "--recovery-failed", "iqn.x;reboot")
+    assert journal.entries()[0]["MESSAGE"].endswith("; run: remvol --connect -n 'iqn.x;reboot'")
+
+
 def test_every_event_has_a_text_in_the_catalog(example, journal):  # noqa: F811
     source = (pathlib.Path(__file__).resolve().parents[2] / "platform/notify/delivery.cpp").read_text()
     ids = re.findall(r'"([0-9a-f]{32})"', source)
