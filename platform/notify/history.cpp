@@ -1,6 +1,5 @@
 #include "history.h"
 
-#include <cstdio>
 #include <utility>
 
 #include "utf8.h"
@@ -16,13 +15,6 @@ constexpr double kNearlyFull = 0.95, kNotSoFull = 0.90;
 
 std::string share_of(const Row& row) {
   return row.volume != nullptr ? platform::printable(row.volume->share) : std::string();
-}
-
-std::string key_of(const Row& row) {
-  std::string key = platform::printable(row.target->name);
-  if (row.volume == nullptr) return key;
-  key.append(" ").append(std::to_string(row.volume->lun)).append(" ").append(share_of(row));
-  return key;
 }
 
 Event event_of(Kind kind, const Row& row, std::string_view what) {
@@ -48,10 +40,21 @@ bool is_formatting(const Row& row) {
   return row.volume != nullptr && row.volume->format_state == vvstat::kFormatRunning;
 }
 
+// Work that is under way is no error.
+void remember_error(const Row& row, time_t now, Past& past) {
+  if (row.healthy() || past.now == Ailment::kBusy) return;
+  const std::string error = platform::printable(row.problem.what);
+  if (past.error == error && past.error_time >= past.since) return;
+  past.error = error;
+  past.error_time = now;
+}
+
 void compare_health(const Row& row, time_t now, Past& past, std::vector<Event>& events) {
   const Ailment ailment = row.problem.ailment;
-  if (ailment != past.now) past.since = now;
+  // Of what nobody wants it does not matter since when it is well.
+  if (ailment != past.now || !row.wanted) past.since = now;
   past.now = ailment;
+  remember_error(row, now, past);
   const bool formatted = past.formatting && row.wanted && row.healthy();
   past.formatting = is_formatting(row) || (past.formatting && ailment == Ailment::kBusy);
   if (formatted) events.push_back(event_of(Kind::kFormatDone, row, "its format is done"));
@@ -78,8 +81,10 @@ void compare_space(const Row& row, Past& past, std::vector<Event>& events) {
   }
 }
 
-bool is_ailment(unsigned number) {
-  return number <= static_cast<unsigned>(Ailment::kFailed);
+Past first_look(time_t now) {
+  Past past;
+  past.since = now;
+  return past;
 }
 
 }  // namespace
@@ -94,46 +99,15 @@ std::vector<Event> compare(const std::vector<Row>& rows, time_t now, History& hi
   std::vector<Event> events;
   History after;
   for (const Row& row : rows) {
-    const std::string key = key_of(row);
+    const std::string key = vvstat::key_of(row);
     const auto found = history.find(key);
-    Past past = found != history.end() ? found->second : Past{.since = now};
+    Past past = found != history.end() ? found->second : first_look(now);
     compare_health(row, now, past, events);
     compare_space(row, past, events);
     after.emplace(key, past);
   }
   history = std::move(after);
   return events;
-}
-
-std::string text_of(const History& history) {
-  std::string text;
-  for (const auto& [key, past] : history) {
-    char numbers[64];
-    snprintf(numbers, sizeof numbers, "%u %lld %u %u %u ", static_cast<unsigned>(past.now),
-             static_cast<long long>(past.since), static_cast<unsigned>(past.told), past.formatting ? 1U : 0U,
-             past.nearly_full ? 1U : 0U);
-    text.append(numbers).append(key).append("\n");
-  }
-  return text;
-}
-
-History history_of(std::string_view text) {
-  History history;
-  while (!text.empty()) {
-    const std::string line(text.substr(0, text.find('\n')));
-    text.remove_prefix(line.size() + (line.size() < text.size() ? 1 : 0));
-    unsigned now = 0, told = 0, formatting = 0, nearly_full = 0;
-    long long since = 0;
-    int at = 0;
-    if (sscanf(line.c_str(), "%u %lld %u %u %u %n", &now, &since, &told, &formatting, &nearly_full, &at) !=
-            5 ||
-        at == 0 || line.size() == static_cast<size_t>(at) || !is_ailment(now) || !is_ailment(told))
-      continue;
-    history[line.substr(static_cast<size_t>(at))] = {static_cast<Ailment>(now), static_cast<time_t>(since),
-                                                     static_cast<Ailment>(told), formatting != 0,
-                                                     nearly_full != 0};
-  }
-  return history;
 }
 
 }  // namespace notify

@@ -1,30 +1,16 @@
-// How every volume was at the last look, and since when; and what has happened to it since then.
+// What has happened to the volumes since the last look.
 #ifndef PLATFORM_NOTIFY_HISTORY_H
 #define PLATFORM_NOTIFY_HISTORY_H
 
 #include <ctime>
-#include <map>
 #include <string>
-#include <string_view>
 #include <vector>
 
-#include "health.h"
+#include "past.h"
 
 namespace notify {
 
-using vvstat::Ailment;
-
-struct Past {
-  Ailment now = Ailment::kNone;
-  time_t since = 0;               // it has been so
-  Ailment told = Ailment::kNone;  // what was last told of it
-  bool formatting = false;        // it was being formatted
-  bool nearly_full = false;       // and that was told
-  bool operator==(const Past&) const = default;
-};
-
-// By a name that no two volumes share.
-using History = std::map<std::string, Past>;
+using vvstat::Ailment, vvstat::History, vvstat::Past;
 
 enum class Kind { kLost, kBack, kReadOnly, kRecoveryFailed, kVolumeFailed, kFormatDone, kNearlyFull, kTest };
 
@@ -41,10 +27,6 @@ std::string name_of(Kind kind);
 // gets worse is told of at once; that it is well again when it has been so for a minute: a connection that
 // comes and goes is one loss and one return. Volumes that are no more are forgotten.
 std::vector<Event> compare(const std::vector<vvstat::Row>& rows, time_t now, History& history);
-
-// The history as text, a line a volume, and back; a line that is none is left out.
-std::string text_of(const History& history);
-History history_of(std::string_view text);
 
 }  // namespace notify
 

@@ -20,7 +20,6 @@ namespace notify {
 namespace {
 
 constexpr char kRunFolder[] = "/run/remvol";  // the tool's too; only root may enter it
-constexpr char kHistory[] = "/run/remvol/history";
 constexpr char kConfig[] = "/etc/remvol/remvol.conf";
 constexpr int kFailed = 1, kUsage = 2, kUnreachable = 3;
 
@@ -29,19 +28,10 @@ bool complain(const char* subject) {
   return false;
 }
 
-// All of an open file, from its beginning.
-std::string content_of(int file) {
-  std::string text;
-  char buffer[4096];
-  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
-    text.append(buffer, static_cast<size_t>(n));
-  return text;
-}
-
 Config read_config() {
   const int file = open(kConfig, O_RDONLY | O_CLOEXEC);
   if (file < 0) return {};
-  const Config config = parse_config(content_of(file));
+  const Config config = parse_config(vvstat::content_of(file));
   close(file);
   return config;
 }
@@ -50,14 +40,14 @@ Config read_config() {
 // run time, so a torn one costs a message told twice.
 bool look(const vvstat::Status& status, std::vector<Event>& events) {
   mkdir(kRunFolder, 0700);
-  const int file = open(kHistory, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
-  if (file < 0 || flock(file, LOCK_EX) != 0) return complain(kHistory);
-  History history = history_of(content_of(file));
+  const int file = open(vvstat::kHistoryFile, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+  if (file < 0 || flock(file, LOCK_EX) != 0) return complain(vvstat::kHistoryFile);
+  History history = vvstat::history_of(vvstat::content_of(file));
   events = compare(vvstat::assess(status, vvstat::read_facts(status)), time(nullptr), history);
-  const std::string text = text_of(history);
+  const std::string text = vvstat::text_of(history);
   const bool written = ftruncate(file, 0) == 0 &&
                        pwrite(file, text.data(), text.size(), 0) == static_cast<ssize_t>(text.size());
-  if (!written) complain(kHistory);
+  if (!written) complain(vvstat::kHistoryFile);
   close(file);
   return written;
 }

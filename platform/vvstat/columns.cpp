@@ -10,6 +10,7 @@
 #include <iterator>
 #include <memory>
 
+#include "moment.h"
 #include "utf8.h"
 
 namespace vvstat {
@@ -28,6 +29,10 @@ std::string word(bool known, const std::string& text) {
 std::string size_text(unsigned long long bytes, const Row& row, const Layout& layout) {
   if (!row.mounted) return {};
   return layout.bytes ? std::to_string(bytes) : readable_size(bytes);
+}
+
+std::string moment_text(time_t moment, const Layout& layout) {
+  return layout.form == Form::kTable ? date_and_clock(moment) : date_for_programs(moment);
 }
 
 std::string percent(const Row& row) {
@@ -86,6 +91,12 @@ constexpr Column kColumns[] = {
      [](const Row& row, const Layout&) { return row.problem.advice; }},
     {"COMMAND", "the command that does it", 0.3, kText, false,
      [](const Row& row, const Layout&) { return row.problem.command; }},
+    {"SINCE", "since when it is healthy, or not", 0, kText, false,
+     [](const Row& row, const Layout& layout) { return moment_text(row.since, layout); }},
+    {"LAST-ERROR", "what was wrong with it last", 0.3, kText, false,
+     [](const Row& row, const Layout&) { return row.error; }},
+    {"ERROR-TIME", "when that began", 0, kText, false,
+     [](const Row& row, const Layout& layout) { return moment_text(row.error_time, layout); }},
     {"MOUNTED", "its file system is mounted", 0, kFlag, true,
      [](const Row& row, const Layout&) { return flag(row.mounted); }},
     {"RO", "it cannot be written", 0, kFlag, true,

@@ -2,6 +2,7 @@
 #ifndef PLATFORM_VVSTAT_HEALTH_H
 #define PLATFORM_VVSTAT_HEALTH_H
 
+#include <ctime>
 #include <string>
 #include <vector>
 
@@ -41,6 +42,10 @@ struct Row {
   unsigned long long size;
   bool wanted;      // it should be connected, as far as can be told, and is not switched off
   Problem problem;  // of one that is wanted
+  // What recall() adds.
+  time_t since = 0;       // it is healthy, or not; 0: not known
+  std::string error{};    // what was wrong with it last; empty: nothing, as far as is known
+  time_t error_time = 0;  // that began
 
   bool healthy() const { return problem.ailment == Ailment::kNone; }
 };

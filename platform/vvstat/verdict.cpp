@@ -1,8 +1,8 @@
 #include "verdict.h"
 
-#include <cstdio>
 #include <string_view>
 
+#include "moment.h"
 #include "utf8.h"
 
 namespace vvstat {
@@ -19,13 +19,6 @@ Counts count(const std::vector<Row>& rows) {
     counts.ailing += row.healthy() ? 0 : 1;
   }
   return counts;
-}
-
-std::string clock_of(time_t now) {
-  tm parts{};
-  char text[16] = "";
-  if (localtime_r(&now, &parts) != nullptr) strftime(text, sizeof text, "%H:%M:%S", &parts);
-  return text;
 }
 
 // Folds `text` between words; further lines begin with `indent` blanks.
@@ -72,13 +65,19 @@ std::string name_of(const Row& row) {
   return platform::printable(row.volume != nullptr ? row.volume->share : row.target->name);
 }
 
+std::string complaint(const Row& row, time_t now) {
+  std::string text = name_of(row) + ": " + row.problem.what;
+  if (row.since != 0) text += " (since " + since_text(row.since, now) + ")";
+  return text + "; " + row.problem.advice;
+}
+
 }  // namespace
 
 std::string verdict(const std::vector<Row>& rows, time_t now, size_t width) {
   std::string text = folded(summary(rows, now), 0, width);
   for (const Row& row : rows) {
     if (row.healthy()) continue;
-    text += "  " + folded(name_of(row) + ": " + row.problem.what + "; " + row.problem.advice, 4, width - 2);
+    text += "  " + folded(complaint(row, now), 4, width - 2);
     if (!row.problem.command.empty()) text += "    " + platform::printable(row.problem.command) + "\n";
   }
   return text;

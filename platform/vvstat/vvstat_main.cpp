@@ -11,6 +11,7 @@
 
 #include "columns.h"
 #include "metrics.h"
+#include "past.h"
 #include "verdict.h"
 #include "watch.h"
 
@@ -37,6 +38,7 @@ Look look() {
   Look look;
   look.status = read_status(platform::TreeReader());
   look.rows = assess(look.status, read_facts(look.status));
+  recall(read_history(), look.rows);
   return look;
 }
 
@@ -106,7 +108,7 @@ int show_once(const Options& options) {
 // For a collector of metrics the absence of the tree is news as well.
 int show_metrics() {
   const Look seen = look();
-  put(metrics(seen.status.reachable, seen.rows));
+  put(metrics(seen.status.reachable, seen.rows, time(nullptr)));
   return finish(exit_status(seen));
 }
 

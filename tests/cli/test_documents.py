@@ -99,6 +99,8 @@ def test_the_monitoring_guide_has_every_metric(box):
                   "/iscsi/initiator/id:1/lun/id:1/format_state": "1", "/iscsi/initiator/id:1/lun/id:1/mnt": "/mnt/VV"})
     box.path("/mnt/VV").mkdir(parents=True)
     assert box.run(["/bin/mount", "-t", "tmpfs", "volume", "/mnt/VV"], env={"LD_PRELOAD": None}).status == 0
+    box.tree.set({"/iscsi/initiator/id:1/conn_set": "1", "/iscsi/initiator/id:1/lun/id:1/enable": "1"})
+    assert box.run(["remvol-notify"], env={"LD_PRELOAD": None}).status == 0
     told = set(re.findall(r"^# TYPE (\w+)", box.run(["vvstat", "-P"], env={"LD_PRELOAD": None}).stdout, re.M))
     guide = (DOCS / "monitoring.md").read_text()
     assert told == set(re.findall(r"remvol_\w+", guide))

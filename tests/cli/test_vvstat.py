@@ -1,5 +1,6 @@
 """vvstat: how the volumes are, for an operator and for programs."""
 
+import datetime
 import fcntl
 import json
 import os
@@ -9,6 +10,7 @@ import re
 import signal
 import struct
 import termios
+import time
 import unicodedata
 
 import jsonschema
@@ -279,6 +281,77 @@ def test_a_command_can_be_copied_whatever_the_name_is(example, name, word):
     assert f"    remvol --connect -n {word}\n" in vvstat(example).stdout
 
 
+# --- since when ---
+
+KEY = f"{T1_NAME} 0 Backup"
+LOST_AT = datetime.datetime(2026, 11, 21, 12, 34, 56, tzinfo=datetime.timezone.utc)
+
+
+def remember(box, *lines):
+    box.write("/run/remvol/history", "".join(line + "\n" for line in lines))
+
+
+def test_since_when_something_is_wrong(example):
+    session(example, 3, T1_NAME, "FAILED")
+    remember(example, f"2 {int(LOST_AT.timestamp())} 2 0 0 {KEY}\t{int(LOST_AT.timestamp())} the connection was lost")
+    done = vvstat(example, env={"TZ": "UTC"})
+    text = " ".join(done.stdout.split())
+    assert f"Backup: the connection was lost (since 2026-11-21 12:34); {HEALS}" in text
+    assert f"Fotos 日本: the connection was lost; {HEALS}" in text
+    told = volumes(example)[0]
+    assert datetime.datetime.fromisoformat(told["since"]) == datetime.datetime.fromisoformat(told["error-time"]) == LOST_AT
+    assert told["last-error"] == "the connection was lost"
+    block = dict(line.split(None, 1) for line in vvstat(example, "Backup", env={"TZ": "Etc/GMT-2"}).lines)
+    assert block["SINCE"] == block["ERROR-TIME"] == "2026-11-21 14:34:56"
+    assert block["LAST-ERROR"] == "the connection was lost"
+
+
+def test_of_today_the_clock_is_said(example):
+    change(example, {"conn_state": "4"})
+    now = int(time.time())
+    remember(example, f"4 {now} 4 0 0 {KEY}")
+    clock = time.strftime("%H:%M:%S", time.gmtime(now))
+    assert f"Backup: the login failed (since {clock}); " in " ".join(vvstat(example, env={"TZ": "UTC"}).stdout.split())
+
+
+def test_a_change_that_the_notifier_has_not_seen_has_no_time(example):
+    change(example, {"conn_state": "4"})
+    remember(example, f"0 1000000 0 0 0 {KEY}\t1000000 is not mounted")
+    told = volumes(example)[0]
+    assert told["since"] is None and told["last-error"] == "is not mounted"
+    assert "since" not in vvstat(example).stdout
+    assert ("Backup", "0", T1_NAME) not in metrics(example).get("remvol_volume_seconds_since_change", {})
+
+
+def test_how_long_it_has_been_so_is_a_metric(example):
+    remember(example, f"0 {int(time.time()) - 100} 0 0 0 {KEY}")
+    seconds = metrics(example)["remvol_volume_seconds_since_change"]
+    assert 100 <= seconds.pop(("Backup", "0", T1_NAME)) < 130 and seconds == {}
+
+
+def test_a_clock_that_was_set_back(example):
+    remember(example, f"0 {int(time.time()) + 1000} 0 0 0 {KEY}")
+    assert metrics(example)["remvol_volume_seconds_since_change"] == {("Backup", "0", T1_NAME): 0}
+
+
+def test_the_notifier_s_memory_is_what_is_shown(example):
+    change(example, {"conn_state": "4"})
+    before = int(time.time())
+    assert example.run(["remvol-notify"], env={"LD_PRELOAD": None}).status == 0
+    told = volumes(example)[0]
+    assert before <= datetime.datetime.fromisoformat(told["since"]).timestamp() <= time.time()
+    assert told["last-error"] == "the login failed"
+
+
+@pytest.mark.parametrize("make", [lambda path: path.write_bytes(bytes(range(256)) * 10), lambda path: path.mkdir(),
+                                  lambda path: os.mkfifo(path), lambda path: path.symlink_to("/etc/passwd")])
+def test_a_memory_that_is_none(example, make):
+    example.path("/run/remvol").mkdir(exist_ok=True)
+    make(example.path("/run/remvol/history"))
+    done = vvstat(example)
+    assert (done.status, without_clock(done.stdout), done.stderr) == (0, TABLE, "")
+
+
 # --- columns and forms ---
 
 
@@ -287,7 +360,7 @@ def test_json(example):
     assert told[0] == {
         "share": "Backup", "status": "Running", "used": 3 << 19, "size": 20 << 20, "use%": 8, "lun": 0,
         "portal": "10.9.0.2:3260", "target": T1_NAME, "healthy": True, "wanted": True, "problem": None, "advice": None,
-        "command": None, "mounted": True, "ro": False, "mountpoint": "/mnt/VV/Backup", "device": "sdb", "fstype": "ext4",
+        "command": None, "since": None, "last-error": None, "error-time": None, "mounted": True, "ro": False, "mountpoint": "/mnt/VV/Backup", "device": "sdb", "fstype": "ext4",
         "progress": None, "session": "LOGGED_IN", "address": "10.9.0.2", "tree-status": "Running",
         "tree-target": "Connected"}
     assert told[1]["share"] == "Fotos 日本"

@@ -90,7 +90,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
       check_json(report(rows, layout));
       break;
     default:
-      check_text(metrics(true, rows), 0);
+      check_text(metrics(true, rows, 0), 0);
       check_text(verdict(rows, 0, layout.width), 0);
       for (const Row& row : rows) check_text(block(row, false), 0);
   }

@@ -6,6 +6,7 @@
 namespace notify {
 namespace {
 
+using vvstat::history_of, vvstat::text_of;
 using vvstat::Row;
 using vvstat::Target;
 using vvstat::Volume;
@@ -31,6 +32,13 @@ class Told : public testing::Test {
       message_ = event.message;
     }
     return names;
+  }
+
+  // The row with what is remembered of it, by way of the file's text.
+  Row recalled() {
+    std::vector<Row> rows{row_};
+    recall(history_of(text_of(history_)), rows);
+    return rows.front();
   }
 
   using Names = std::vector<std::string>;
@@ -137,8 +145,71 @@ TEST_F(Told, TheHistoryIsKeptAsText) {
   row_.used = 99;
   at(5, Ailment::kReadOnly);
   const std::string text = text_of(history_);
-  EXPECT_EQ(text, "3 1000005 3 0 1 iqn.t1 1 two words\\x0A\\x1B\n");
+  EXPECT_EQ(text, "3 1000005 3 0 1 iqn.t1 1 two words\\x0A\\x1B\t1000005 is ill\n");
   EXPECT_EQ(history_of(text), history_);
+}
+
+TEST_F(Told, SinceWhenItIsSo) {
+  at(0, Ailment::kNone);
+  at(10, Ailment::kLost);
+  at(20, Ailment::kLost);
+  EXPECT_EQ(recalled().since, kStart + 10);
+  row_.problem.ailment = Ailment::kReadOnly;  // the notifier has not seen that yet
+  EXPECT_EQ(recalled().since, 0);
+  at(30, Ailment::kReadOnly);
+  EXPECT_EQ(recalled().since, kStart + 30);
+  at(40, Ailment::kNone);
+  EXPECT_EQ(recalled().since, kStart + 40);
+}
+
+TEST_F(Told, OfWhatNobodyWantsItDoesNotMatter) {
+  at(0, Ailment::kNone);
+  row_.wanted = false;
+  at(10, Ailment::kNone);
+  EXPECT_EQ(recalled().since, 0);
+  row_.wanted = true;
+  at(20, Ailment::kNone);
+  EXPECT_EQ(recalled().since, kStart + 10);
+}
+
+TEST_F(Told, TheLastErrorIsRemembered) {
+  at(0, Ailment::kNone);
+  at(1, Ailment::kBusy);
+  EXPECT_EQ(recalled().error, "");
+  at(2, Ailment::kFailed);
+  at(3, Ailment::kFailed);
+  EXPECT_EQ(recalled().error, "is ill");
+  EXPECT_EQ(recalled().error_time, kStart + 2);
+  at(4, Ailment::kNone);
+  EXPECT_EQ(recalled().error_time, kStart + 2);
+  at(5, Ailment::kFailed);
+  EXPECT_EQ(recalled().error_time, kStart + 5);
+}
+
+TEST_F(Told, AnotherErrorTakesItsPlace) {
+  at(0, Ailment::kFailed);
+  row_.problem.what = "is worse\t";
+  compare({row_}, kStart + 5, history_);
+  EXPECT_EQ(recalled().error, "is worse\\x09");
+  EXPECT_EQ(recalled().error_time, kStart + 5);
+  EXPECT_EQ(recalled().since, kStart);
+}
+
+TEST_F(Told, NothingIsKnownOfAStranger) {
+  EXPECT_EQ(recalled().since, 0);
+  EXPECT_EQ(recalled().error_time, 0);
+}
+
+TEST(History, ALineOfAnEarlierVersionHasNoError) {
+  const History history = history_of("3 7 3 0 1 iqn.t1 1 two words\n");
+  ASSERT_EQ(history.size(), 1U);
+  EXPECT_EQ(history.begin()->first, "iqn.t1 1 two words");
+  EXPECT_EQ(history.begin()->second, (Past{Ailment::kReadOnly, 7, Ailment::kReadOnly, false, true, "", 0}));
+}
+
+TEST(History, AnErrorWithoutItsTimeIsLeftOut) {
+  for (const char* text : {"0 7 0 0 0 a\t", "0 7 0 0 0 a\tx", "0 7 0 0 0 a\t-"})
+    EXPECT_EQ(history_of(text)["a"].error, "") << text;
 }
 
 TEST(History, ALineThatIsNoneIsLeftOut) {

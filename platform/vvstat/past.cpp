@@ -1,0 +1,108 @@
+#include "past.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cstdio>
+
+#include "utf8.h"
+
+namespace vvstat {
+namespace {
+
+// Between a volume's name and its last error; no printable text holds it.
+constexpr char kMark = '\t';
+
+bool is_ailment(unsigned number) {
+  return number <= static_cast<unsigned>(Ailment::kFailed);
+}
+
+// Reads a last error, as "TIME TEXT".
+void take_error(const std::string& text, Past& past) {
+  long long time = 0;
+  int at = 0;
+  if (sscanf(text.c_str(), "%lld %n", &time, &at) != 1 || at == 0) return;
+  past.error_time = static_cast<time_t>(time);
+  past.error = text.substr(static_cast<size_t>(at));
+}
+
+}  // namespace
+
+std::string key_of(const Row& row) {
+  std::string key = platform::printable(row.target->name);
+  if (row.volume == nullptr) return key;
+  key.append(" ").append(std::to_string(row.volume->lun)).append(" ");
+  return key.append(platform::printable(row.volume->share));
+}
+
+std::string text_of(const History& history) {
+  std::string text;
+  for (const auto& [key, past] : history) {
+    char numbers[64];
+    snprintf(numbers, sizeof numbers, "%u %lld %u %u %u ", static_cast<unsigned>(past.now),
+             static_cast<long long>(past.since), static_cast<unsigned>(past.told), past.formatting ? 1U : 0U,
+             past.nearly_full ? 1U : 0U);
+    text.append(numbers).append(key);
+    if (!past.error.empty()) {
+      text.append(1, kMark).append(std::to_string(static_cast<long long>(past.error_time)));
+      text.append(" ").append(past.error);
+    }
+    text.append("\n");
+  }
+  return text;
+}
+
+History history_of(std::string_view text) {
+  History history;
+  while (!text.empty()) {
+    const std::string line(text.substr(0, text.find('\n')));
+    text.remove_prefix(line.size() + (line.size() < text.size() ? 1 : 0));
+    unsigned now = 0, told = 0, formatting = 0, nearly_full = 0;
+    long long since = 0;
+    int at = 0;
+    if (sscanf(line.c_str(), "%u %lld %u %u %u %n", &now, &since, &told, &formatting, &nearly_full, &at) !=
+            5 ||
+        at == 0 || line.size() == static_cast<size_t>(at) || !is_ailment(now) || !is_ailment(told))
+      continue;
+    const size_t name = static_cast<size_t>(at), mark = line.find(kMark, name);
+    Past& past = history[line.substr(name, mark - name)];
+    past = {static_cast<Ailment>(now),
+            static_cast<time_t>(since),
+            static_cast<Ailment>(told),
+            formatting != 0,
+            nearly_full != 0,
+            "",
+            0};
+    if (mark != std::string::npos) take_error(line.substr(mark + 1), past);
+  }
+  return history;
+}
+
+std::string content_of(int file) {
+  std::string text;
+  char buffer[4096];
+  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
+    text.append(buffer, static_cast<size_t>(n));
+  return text;
+}
+
+History read_history() {
+  const int file = open(kHistoryFile, O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+  if (file < 0) return {};
+  const History history = history_of(content_of(file));
+  close(file);
+  return history;
+}
+
+void recall(const History& history, std::vector<Row>& rows) {
+  for (Row& row : rows) {
+    const auto found = history.find(key_of(row));
+    if (found == history.end()) continue;
+    const Past& past = found->second;
+    if (row.wanted && past.now == row.problem.ailment) row.since = past.since;
+    row.error = past.error;
+    row.error_time = past.error_time;
+  }
+}
+
+}  // namespace vvstat
