@@ -70,7 +70,8 @@ class Probe {
   Answer run(int superblock_flags) {
     if (!ready_) return Answer::failed;
     blkid_probe_set_superblocks_flags(probe_, BLKID_SUBLKS_TYPE | superblock_flags);
-    return answer_of(blkid_do_safeprobe(probe_));
+    const Answer answer = answer_of(blkid_do_safeprobe(probe_));
+    return answer == Answer::failed && has_several() ? Answer::ambivalent : answer;
   }
 
   const char* value(const char* tag) const {
@@ -97,6 +98,16 @@ class Probe {
   }
 
  private:
+  // Several signatures, all of them read: libblkid 2.41 calls that an error like any other.
+  bool has_several() {
+    int count = 0, result = 0;
+    blkid_reset_probe(probe_);
+    while ((result = blkid_do_probe(probe_)) == 0) {
+      if (value("TYPE") != nullptr) ++count;
+    }
+    return result == 1 && count > 1;
+  }
+
   blkid_probe probe_;
   bool ready_ = false;
 };

@@ -47,7 +47,8 @@ def ddf_raid():
 
 
 def drbd():
-    return {SIZE - 4096: struct.pack(">7Q2I", 2048, 1, 2, 3, 4, 5, 0, 0, 0x8374026B)}
+    """Sizes, generations, flags and magic; the log of changes, and the bitmap of pieces of 4096 bytes."""
+    return {SIZE - 4096: struct.pack(">7Q2I 4iI", 2048, 1, 2, 3, 4, 5, 0, 0, 0x8374026B, 136, -64, 257, -72, 4096)}
 
 
 def bitlocker():

@@ -68,25 +68,64 @@ def test_an_empty_device_is_told_from_one_that_cannot_be_read(loop, tmp_path):
     assert call("fs_type", "/dev/null") == -1
 
 
-def write_zfs_labels(disk, *places):
-    """The rings of uberblocks of the labels at these places; zdb and libblkid look for their magic."""
+ZFS_AT_THE_START = [0, 256 * 1024]
+ZFS_AT_THE_END = [64 * MIB - 512 * 1024, 64 * MIB - 256 * 1024]
+
+
+def zfs_pair(name, kind, value):
+    padded = name + bytes(-len(name) % 4)
+    size = 12 + len(padded) + 8 + len(value)
+    return struct.pack(">3I", size, size, len(name)) + padded + struct.pack(">2I", kind, 1) + value
+
+
+def zfs_config():
+    """The names and values of a label: encoding and byte order, a version and flags, the pairs, and an empty one."""
+    number, text = 8, 9
+    pairs = [
+        zfs_pair(b"version", number, struct.pack(">Q", 5000)),
+        zfs_pair(b"name", text, struct.pack(">I", 4) + b"tank"),
+        zfs_pair(b"state", number, bytes(8)),
+        zfs_pair(b"txg", number, struct.pack(">Q", 4)),
+        zfs_pair(b"pool_guid", number, struct.pack(">Q", 0x1234567890)),
+        zfs_pair(b"guid", number, struct.pack(">Q", 0x9876543210)),
+    ]
+    return b"\1\1\0\0" + struct.pack(">2I", 0, 1) + b"".join(pairs) + bytes(8)
+
+
+def write_zfs_uberblocks(disk, *places, order="<"):
+    """The rings of uberblocks of the labels at these places, in the byte order of the machine that wrote them."""
     for place in places:
         for i in range(8):
-            uberblock = struct.pack("<QQQQQ", 0x00BAB10C, 5000, i + 1, 1, 1700000000)
+            uberblock = struct.pack(f"{order}QQQQQ", 0x00BAB10C, 5000, i + 1, 1, 1700000000)
             disk.write(place + 128 * 1024 + i * 1024, uberblock)
 
 
-def test_zfs_labels_at_either_end_are_recognised(loop):
-    for places in ([0, 256 * 1024], [64 * MIB - 512 * 1024, 64 * MIB - 256 * 1024]):
-        disk = loop()
-        write_zfs_labels(disk, *places)
-        assert call("fs_type", disk.node) == (0, "zfs_member")
+def write_zfs_labels(disk, *places):
+    """libblkid 2.38 goes by the uberblocks of a label, 2.41 by its names and values."""
+    write_zfs_uberblocks(disk, *places)
+    for place in places:
+        disk.write(place + 16 * 1024, zfs_config())
+
+
+@pytest.mark.parametrize("places", [ZFS_AT_THE_START, ZFS_AT_THE_END])
+def test_zfs_labels_at_either_end_are_recognised(loop, places):
+    disk = loop()
+    write_zfs_labels(disk, *places)
+    assert call("fs_type", disk.node) == (0, "zfs_member")
+
+
+@pytest.mark.parametrize("order", ["<", ">"])
+@pytest.mark.parametrize("places", [ZFS_AT_THE_START[1:], ZFS_AT_THE_END[1:]])
+def test_zfs_labels_without_their_names_and_values_are_not_empty(loop, places, order):
+    disk = loop(64 * MIB + 4096)  # the last label ends at a whole quarter of a mebibyte
+    write_zfs_uberblocks(disk, *places, order=order)
+    assert call("fs_type", disk.node) in [(0, "zfs_member"), (0, "damaged_zfs")]
 
 
 def test_zfs_labels_that_outlived_a_format_hide_nothing(loop):
     disk = loop()
     make_ext(disk, kind="ext4")
-    write_zfs_labels(disk, 64 * MIB - 512 * 1024, 64 * MIB - 256 * 1024)
+    write_zfs_labels(disk, *ZFS_AT_THE_END)
     assert call("fs_type", disk.node) == (0, "ext4")
 
 
@@ -182,7 +221,7 @@ def write_backup_table(disk):
 
 AT_THE_END = {
     "raid": lambda disk: disk.write(*md_member(64 * MIB, "1.0")),
-    "zfs": lambda disk: write_zfs_labels(disk, 64 * MIB - 512 * 1024, 64 * MIB - 256 * 1024),
+    "zfs": lambda disk: write_zfs_labels(disk, *ZFS_AT_THE_END),
     "table": write_backup_table,
 }
 
