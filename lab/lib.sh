@@ -22,6 +22,7 @@ say() { printf '%s\n' "$*"; }
 
 fail() {
     say "FAILED (phase $PHASE): $*"
+    say "Under way: $(pgrep -a 'remvol|iscsiadm|mke2fs|e2fsck|mount' || echo nothing)"
     exit 1
 }
 

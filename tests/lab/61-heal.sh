@@ -6,7 +6,7 @@ connect_state_is() { [ "$(target_key 1 conn_state)" = "$1" ]; }
 takes_writes() { mounted a && dd if=/dev/zero of=/mnt/VV/a/probe bs=4k count=1 conv=fsync 2>/dev/null; }
 refuses_writes() { ! takes_writes; }
 listener_start() {
-    remvol-events 2>>/tmp/events &
+    remvol-events &
     listener=$!
 }
 no_tool() { ! pgrep -x remvol; }
@@ -19,11 +19,14 @@ target_start
 target_add 1 $T
 lun_add 1 1 64M
 works --init
-# Less patience than usual, so that an outage need not be long.
-sed -i -e 's/\(replacement_timeout\).*/\1 = 5/' -e 's/\(noop_out_.*\) = .*/\1 = 2/' /etc/iscsi/iscsid.conf
+# Less patience than usual, so that an outage need not be long; not so little that a busy build machine makes one while
+# the volume is formatted.
+sed -i -e 's/\(replacement_timeout\).*/\1 = 5/' -e 's/\(noop_out_.*\) = .*/\1 = 4/' /etc/iscsi/iscsid.conf
 listener_start
 volume_add t1 1 a
 works --connect -n $T
+wait_for 60 no_tool
+expect_equal "connect state before the cut" 1 "$(target_key 1 conn_state)"
 echo "first text" >/mnt/VV/a/file
 sync
 
@@ -54,4 +57,3 @@ wait_for 20 no_tool
 expect_equal "connect state" 1 "$(target_key 1 conn_state)"
 expect_equal "the synced file" "first text" "$(cat /mnt/VV/a/file)"
 listener_stop
-cat /tmp/events
