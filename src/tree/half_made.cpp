@@ -32,14 +32,25 @@ void drop(const char* path) {
   if (delete_slot(path) != kOk) LOG(0, "ktreec_del() of path '%s' failed", path);
 }
 
-// Adding takes the first slot without a number, so behind it is none.
-void drop_half_made_luns_of(int n) {
-  if (!is_target_stored_at(n)) return;
+// Adding takes the first slot without a number, so behind it is none. Returns the last slot with one.
+int last_lun_at(int n) {
   int last = 0;
   while (last < kMaxLunsPerTarget && is_lun_stored_at(n, last + 1)) last++;
+  return last;
+}
+
+void drop_half_made_luns_of(int n) {
+  if (!is_target_stored_at(n)) return;
+  const int last = last_lun_at(n);
   for (int m = last; m >= 1; m--) {
     if (is_half_made_lun(n, m)) drop(KeyText(key::kLun, n, m));
   }
+}
+
+// A LUN is counted right after it was stored; a run that was killed in between has not counted it.
+void count_luns_of(int n) {
+  if (is_target_stored_at(n) && tree_read_number(KeyText(key::kTargetLunCount, n), 0) < last_lun_at(n))
+    ktree_update_current_luncnt(n);
 }
 
 // A target whose mount failed is not counted, as those who read the tree know it.
@@ -70,6 +81,7 @@ void drop_half_made_slots() {
   const SlotsHeld held(SlotsHeld::kChange);
   for (int n = kMaxTargets; n >= 1; n--) {
     drop_half_made_luns_of(n);
+    count_luns_of(n);
     if (!is_half_made_target(n)) continue;
     drop(KeyText(key::kTarget, n));
     ktree_update_current_targetcnt();

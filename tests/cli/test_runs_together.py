@@ -172,6 +172,14 @@ class TestHalfMadeSlots:
         status(box)
         assert (box.tree.get(f"{INITIATOR}/count"), site.target("status", 2)) == ("2", "Disconnected")
 
+    @pytest.mark.parametrize("moment", ["id:1/lun/id:2/vol_access_right", "id:1/lun/count", "total_lun_count"])
+    def test_a_further_lun_that_a_killed_add_has_not_counted_is_counted(self, stored, box, moment):
+        box.hook("ktreec_set", f"{INITIATOR}/{moment}", effect="kill -KILL $PPID", times=1)
+        assert box.remvol(*TestAdding.ADD[:4], "1", *TestAdding.ADD[5:-1], "b").status == -9
+        assert stored.lun("share", 2) == "b"
+        status(box)
+        assert (stored.target("lun/count"), box.tree.get(f"{INITIATOR}/total_lun_count")) == ("2", "2")
+
 
 class TestOneAfterAnother:
     def test_two_connections_of_a_target_follow_one_another(self, stored, box):
