@@ -30,8 +30,8 @@ int main(int argc, char** argv) {
     return 0;
   }
   const ServerConfig config = read_server_config(kConfig, kShares);
-  const Reload done =
-      reload_shares({"macshare_reload", kShares, kNetatalkNames, config.names, "", wish == Wish::kWithdraw});
+  const Reload done = reload_shares(
+      {"macshare_reload", kShares, kNetatalkNames, config.names, false, "", wish == Wish::kWithdraw});
   if (!done.has_tree) {
     log_line("the configuration tree does not answer; only shares that are gone are taken out");
   } else if (!config.includes_shares && !done.shares.empty()) {

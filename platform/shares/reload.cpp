@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "access.h"
 #include "process.h"
 #include "utf8.h"
 #include "volume_list.h"
@@ -12,28 +13,35 @@
 namespace shares {
 namespace {
 
-Section share_of(const Volume& volume, const Server& server) {
+Section share_of(const Volume& volume, const Server& server, const AccessRule* rule) {
   std::string options = volume.read_only ? "\tread only = yes\n" : "\tread only = no\n";
+  if (rule != nullptr) options += access_option(*rule);
   if (volume.extended_attributes) options += server.attribute_options;
   return make_section(volume.name, volume.path, options);
 }
 
-std::vector<Section> shares_of(const std::vector<Volume>& volumes, const Server& server) {
+std::vector<Section> shares_of(const std::vector<Volume>& volumes, const Server& server,
+                               const Access& access) {
   std::vector<Section> sections;
   std::vector<std::wstring> taken = server.taken;
   for (const Volume& volume : volumes) {
     const std::wstring folded = folded_name(volume.name);
+    const AccessRule* rule = rule_of(access, volume.name);
     const char* why = volume.failure;
+    if (why == nullptr && !volume.mounted) continue;
     if (why == nullptr) why = name_refusal(volume.name, server.names);
     if (why == nullptr && std::find(taken.begin(), taken.end(), folded) != taken.end()) {
       why = "another share has this name";
+    }
+    if (why == nullptr && rule != nullptr && !server.takes_blanks && has_blanks(*rule)) {
+      why = "the file server takes no blanks in the names of its users";
     }
     if (why != nullptr) {
       log_line("volume \"%s\" is not shared: %s", platform::printable(volume.name).c_str(), why);
       continue;
     }
     taken.push_back(folded);
-    sections.push_back(share_of(volume, server));
+    sections.push_back(share_of(volume, server, rule));
   }
   return sections;
 }
@@ -51,6 +59,50 @@ std::vector<Section> missing_from(const std::vector<Section>& now, std::vector<S
   return before;
 }
 
+// Shares whose users are others than before: who is in one and may not any more is to be put out.
+std::vector<Section> barred_in(const std::vector<Section>& now, const std::vector<Section>& before) {
+  std::vector<Section> barred;
+  for (const Section& share : now) {
+    const bool changed = std::any_of(before.begin(), before.end(), [&share](const Section& old) {
+      return old.name == share.name && access_line(old.text) != access_line(share.text);
+    });
+    if (changed) barred.push_back(share);
+  }
+  return barred;
+}
+
+// A rule for a share that is misspelt bars nobody.
+void tell_of_strangers(const Access& access, const std::vector<Volume>& volumes) {
+  for (const AccessRule& rule : access.rules) {
+    const bool known = std::any_of(volumes.begin(), volumes.end(), [&rule](const Volume& volume) {
+      return folded_name(volume.name) == rule.folded;
+    });
+    if (!known)
+      log_line("%s: no volume has the share name \"%s\"", kAccessFile,
+               platform::printable(rule.share).c_str());
+  }
+}
+
+void tell_what_is_wrong(const Access& access) {
+  if (access.line != 0) {
+    log_line("%s, line %d: %s; the shares stay as they are", kAccessFile, access.line, access.why);
+  } else {
+    log_line("%s: %s; the shares stay as they are", kAccessFile, access.why);
+  }
+}
+
+std::vector<Section> shares_of_tree(const Server& server, const std::vector<Volume>& volumes,
+                                    const std::vector<Section>& before) {
+  if (server.withdraw) return {};
+  const Access access = read_access(kAccessFile);
+  if (access.why != nullptr) {
+    tell_what_is_wrong(access);
+    return still_mounted(before);
+  }
+  tell_of_strangers(access, volumes);
+  return shares_of(volumes, server, access);
+}
+
 }  // namespace
 
 Wish read_wish(int argc, char** argv) {
@@ -65,8 +117,9 @@ Reload reload_shares(const Server& server) {
   std::vector<Volume> volumes;
   Reload done{};
   done.has_tree = server.withdraw || read_volumes(volumes);
-  done.shares = done.has_tree ? shares_of(volumes, server) : still_mounted(before);
+  done.shares = done.has_tree ? shares_of_tree(server, volumes, before) : still_mounted(before);
   done.gone = missing_from(done.shares, before);
+  done.barred = barred_in(done.shares, before);
   done.changed = done.shares != before;
   if (done.changed && !replace_file(server.file, compose(server.reload, done.shares))) {
     log_line("%s cannot be written: %s", server.file, strerror(errno));

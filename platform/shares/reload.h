@@ -16,6 +16,7 @@ struct Server {
   const char* file;    // the generated file
   const NameRules& names;
   std::vector<std::wstring> taken;  // folded names of shares that are not ours
+  bool takes_blanks;                // its lists of users may hold names with blanks
   std::string attribute_options;    // lines for volumes whose file system keeps user attributes
   bool withdraw;                    // no volume is to be shared, whatever the tree says
 };
@@ -31,10 +32,15 @@ struct Reload {
   bool changed;                 // the generated file was replaced
   std::vector<Section> shares;  // what it holds now
   std::vector<Section> gone;    // what it held before
+  std::vector<Section> barred;  // shares that other people may use now than before
 };
 
-// Brings the generated file up to date. A volume that failed or whose name the server cannot use is left out
-// with a line in the log, and so is a change that cannot be written.
+inline constexpr char kAccessFile[] = "/etc/remvol/shares.conf";
+
+// Brings the generated file up to date. While the file of who may use a share is wrong, which a line in the
+// log says, shares stay as they are as long as they are mounted, and none comes. A volume that failed or
+// whose name the server cannot use is left out with a line in the log, and so is a change that cannot be
+// written.
 Reload reload_shares(const Server& server);
 
 }  // namespace shares

@@ -17,12 +17,6 @@ bool is_blank(char character) {
   return isspace(static_cast<unsigned char>(character)) != 0;
 }
 
-std::string_view trim(std::string_view text) {
-  while (!text.empty() && is_blank(text.front())) text.remove_prefix(1);
-  while (!text.empty() && is_blank(text.back())) text.remove_suffix(1);
-  return text;
-}
-
 // An option's name, or a word, as the servers compare it: lower case, no blanks.
 std::string plain_name(std::string_view text) {
   std::string name;
@@ -99,6 +93,12 @@ std::string whole_path(const std::string& path) {
 }
 
 }  // namespace
+
+std::string_view trim(std::string_view text) {
+  while (!text.empty() && is_blank(text.front())) text.remove_prefix(1);
+  while (!text.empty() && is_blank(text.back())) text.remove_suffix(1);
+  return text;
+}
 
 void parse_server_config(std::string_view text, bool global, ServerConfig& config) {
   while (!text.empty()) {

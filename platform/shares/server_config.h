@@ -23,6 +23,9 @@ struct ServerConfig {
   std::vector<Include> includes;    // files that are read in addition
 };
 
+// `text` without the white space at its ends.
+std::string_view trim(std::string_view text);
+
 // Adds what the text of one file says to `config`; `global` tells whether it begins among the options for all
 // shares. An include with a substitution (%m) differs from client to client and is left out.
 void parse_server_config(std::string_view text, bool global, ServerConfig& config);

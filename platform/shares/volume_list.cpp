@@ -34,13 +34,12 @@ void read_volume(const platform::TreeReader& tree, int target, int lun, std::vec
   const std::string path = kMountRoot + name;
   if (name.empty()) return;
   if (!is_mounted(path)) {
-    const char* failure = failure_of(tree, target, lun);
-    if (failure != nullptr) volumes.push_back({name, path, true, false, failure});
+    volumes.push_back({name, path, true, false, false, failure_of(tree, target, lun)});
     return;
   }
   const bool writable = tree.number(1, "/iscsi/initiator/id:%d/lun/id:%d/vol_access_right", target, lun) != 0;
   const std::string type = tree.value("/iscsi/initiator/id:%d/lun/id:%d/fs_type", target, lun);
-  volumes.push_back({name, path, !writable, keeps_user_attributes(type), nullptr});
+  volumes.push_back({name, path, !writable, keeps_user_attributes(type), true, nullptr});
 }
 
 }  // namespace

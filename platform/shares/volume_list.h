@@ -1,4 +1,4 @@
-// The volumes of the configuration tree that are mounted.
+// The volumes of the configuration tree, as far as their shares need it.
 #ifndef PLATFORM_SHARES_VOLUME_LIST_H
 #define PLATFORM_SHARES_VOLUME_LIST_H
 
@@ -12,11 +12,12 @@ struct Volume {
   std::string path;  // where it is mounted
   bool read_only;
   bool extended_attributes;  // the file system keeps user attributes of files
-  const char* failure;       // why it is not mounted although its target is connected; null when it is
+  bool mounted;
+  const char* failure;  // why it is not mounted although its target is connected; null for no such reason
 };
 
-// Puts the volumes that are mounted, and those that should be and failed, into `volumes`, in the tree's
-// order. Returns false when the tree cannot be reached; the list is then incomplete.
+// Puts the volumes into `volumes`, in the tree's order. Returns false when the tree cannot be reached; the
+// list is then incomplete.
 bool read_volumes(std::vector<Volume>& volumes);
 
 // True when `path` is a mount point.

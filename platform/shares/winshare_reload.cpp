@@ -3,7 +3,7 @@
 //
 // The shares stand in a file of their own that smb.conf includes. A running server is told only when that
 // file changed, and clients of a share that is gone are cut off, since the folder below it is no volume any
-// more.
+// more, and so are those of a share that other people may use now.
 #include <glob.h>
 
 #include <algorithm>
@@ -67,7 +67,9 @@ void tell_samba(const Reload& done) {
   if (!samba_runs()) log_line("Samba does not run; it finds the shares when it starts");
   if (run({"smbcontrol", "all", "reload-config"}) != 0)
     log_line("smbcontrol failed; Samba may not know the shares");
-  for (const Section& share : done.gone) run({"smbcontrol", "smbd", "close-share", share.name});
+  for (const std::vector<Section>* shares : {&done.gone, &done.barred}) {
+    for (const Section& share : *shares) run({"smbcontrol", "smbd", "close-share", share.name});
+  }
 }
 
 void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool has_samba) {
@@ -94,7 +96,7 @@ int main(int argc, char** argv) {
   }
   ServerConfig config = read_server_config(kConfig, kShares);
   if (config.uses_registry) add_registry_shares(config);
-  const Reload done = reload_shares({"winshare_reload", kShares, kSambaNames, config.names,
+  const Reload done = reload_shares({"winshare_reload", kShares, kSambaNames, config.names, true,
                                      options_for_macs(config), wish == Wish::kWithdraw});
   const bool has_samba = is_installed("smbcontrol");
   tell_what_is_missing(done, config, has_samba);

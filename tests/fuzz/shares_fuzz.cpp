@@ -1,18 +1,41 @@
 // A share name as a user may choose it, a server's configuration and a generated file as anybody may have
-// left them. A name that is not refused stays one section with one path, whatever it holds.
+// left them. A name that is not refused stays one section with one path, whatever it holds, and a list of
+// users stays one line in it.
 #include <cstdlib>
 #include <string>
 
+#include "access.h"
 #include "server_config.h"
 #include "share_file.h"
 #include "share_name.h"
 #include "utf8.h"
+
+namespace {
+
+// Of a file that is understood every rule is one option of its section.
+void check_access(const std::string& text) {
+  const shares::Access access = shares::parse_access(text);
+  if (access.why != nullptr && (!access.rules.empty() || access.line < 1)) abort();
+  for (const shares::AccessRule& rule : access.rules) {
+    const std::string option = shares::access_option(rule);
+    if (rule.names.empty() || option.find('\n') != option.size() - 1 || option.size() > 1000) abort();
+    if (option.find_first_of("%#;[]'") != std::string::npos || option.ends_with("\\\n")) abort();
+    const shares::Section section = shares::make_section("S", "/mnt/VV/S", option);
+    if (section.text.find(shares::access_line(section.text)) == std::string::npos) abort();
+    const auto read = shares::parse_sections(shares::compose("fuzz", {section}));
+    if (read.size() != 1 || !(read[0] == section)) abort();
+    if (shares::rule_of(access, rule.share) != &rule) abort();
+  }
+}
+
+}  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const unsigned char* data, size_t size) {
   const std::string text(reinterpret_cast<const char*>(data), size);
   shares::ServerConfig any;
   shares::parse_server_config(text, true, any);
   shares::parse_sections(text);
+  check_access(text);
   for (const char byte : platform::printable(text)) {
     if (static_cast<unsigned char>(byte) < 0x20 || byte == 0x7f) abort();
   }

@@ -8,9 +8,9 @@ samba_prepare() {
     mkdir -p /etc/samba /var/lib/samba/private /var/cache/samba /var/log/samba /run/samba
     printf '[global]\n   load printers = no\n   disable spoolss = yes\n   map to guest = bad user\n' >/etc/samba/smb.conf
     printf '\n[global]\n   include = %s\n' $generated >>/etc/samba/smb.conf
-    printf '%s\n' nobody:x:65534:65534::/:/bin/false maria:x:1000:1000::/:/bin/false >>/etc/passwd
-    printf '%s\n' nogroup:x:65534: maria:x:1000: >>/etc/group
-    printf 'secret\nsecret\n' | smbpasswd -s -a maria
+    printf '%s\n' nobody:x:65534:65534::/:/bin/false maria:x:1000:1000::/:/bin/false otto:x:1001:1001::/:/bin/false >>/etc/passwd
+    printf '%s\n' nogroup:x:65534: maria:x:1000: otto:x:1001: family:x:1002:otto >>/etc/group
+    for name in maria otto; do printf 'secret\nsecret\n' | smbpasswd -s -a $name; done
 }
 
 samba_start() {
@@ -25,7 +25,7 @@ samba_stop() {
 
 samba_is_gone() { ! pgrep -x smbd; }
 
-smb() { target_run smbclient "//10.9.0.1/$1" -U maria%secret -t 20; }
+smb() { target_run smbclient "//10.9.0.1/$1" -U "${user:-maria}%secret" -t 20; }
 
 # client SHARE COMMANDS: what a client on the target's machine sees that does these in the share.
 client() { echo "$2" | smb "$1" 2>&1; }
@@ -79,6 +79,37 @@ done
 expect_has "a client without a password" NT_STATUS_ACCESS_DENIED \
     "$(target_run smbclient //10.9.0.1/Photos -N -c "put /tmp/text guest" 2>&1)"
 expect_equal "the owner of the file" maria "$(stat -c %U /mnt/VV/Photos/file)"
+
+# allow LIST: leaves Photos to these users and groups.
+allow() {
+    mkdir -p /etc/remvol
+    printf '[photos]\nusers = %s\n' "$1" >/etc/remvol/shares.conf
+    expect_equal "the reload" "" "$(winshare_reload 2>&1)"
+}
+
+# expect_barred USER SHARE, expect_welcome USER SHARE
+expect_barred() { expect_has "$1 in $2" NT_STATUS_ACCESS_DENIED "$(user=$1 client "$2" ls)"; }
+expect_welcome() { expect_has "$1 in $2" " file " "$(user=$1 client "$2" ls)"; }
+
+# Who is not in the list of a share may not open it; the others are open to both. Who is in it meanwhile is put out.
+for name in maria otto; do expect_welcome $name Photos; done
+user=otto
+stay Photos
+user=
+allow maria
+expect_put_off
+expect_welcome maria Photos
+expect_barred otto Photos
+expect_welcome otto Archive
+allow "@family, nobody in particular"
+expect_welcome otto Photos
+expect_barred maria Photos
+echo "[Photos]" >/etc/remvol/shares.conf
+expect_has "a list that is none" "the shares stay as they are" "$(winshare_reload 2>&1)"
+expect_barred maria Photos
+rm /etc/remvol/shares.conf
+winshare_reload
+for name in maria otto; do expect_welcome $name Photos; done
 
 # A reload that has nothing to do leaves the file alone.
 before=$(stat -c '%i %y' $generated)
