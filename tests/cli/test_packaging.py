@@ -344,7 +344,7 @@ def test_every_command_is_completed(complete):
     ("remvol --add -P ", []),
     ("remvol --init ", []),
     ("vvstat --no", ["--noheadings"]),
-    ("vvstat -o si", ["SIZE"]),
+    ("vvstat -o si", ["SIZE", "SINCE"]),
     ("vvstat -o +share,ta", ["+share,TARGET"]),
     ("vvstat iqn.", ["iqn.t1", "iqn.t2"]),
     ("vvstat Tw", ["Two\\ words"]),
