@@ -120,6 +120,49 @@ def test_the_check_of_the_monitoring_guide(box, wanted, status, line):
     assert (done.status, done.lines[0].startswith(line)) == (status, True), done.stdout
 
 
+PAGES = sorted(path.name for path in (DOCS / "man").iterdir())
+
+
+def examples(page):
+    """The blocks of a manual page, as a person sees them."""
+    text = (DOCS / "man" / page).read_text()
+    return [re.sub(r"\\(.)", lambda escape: {"e": "\\", "-": "-"}[escape[1]], found)
+            for found in re.findall(r"^\.EX\n(.*?)^\.EE$", text, re.M | re.S)]
+
+
+@pytest.mark.parametrize("page", PAGES)
+def test_a_manual_page_is_well_formed_and_has_examples(page):
+    text = (DOCS / "man" / page).read_text()
+    if text.startswith(".so "):
+        assert text.split("/")[1].strip() in PAGES
+        return
+    told = subprocess.run(["groff", "-man", "-Tutf8", "-t", "-ww", "-rLL=80n"], input=text, stdout=subprocess.PIPE,
+                          stderr=subprocess.PIPE, text=True, check=True)
+    assert told.stderr == "" and told.stdout
+    assert page[-1] == re.search(r"^\.TH \S+ (\d) ", text, re.M)[1]
+    sections = re.findall(r"^\.SH \"?(.*?)\"?$", text, re.M)
+    assert sections[:3] == ["NAME", "SYNOPSIS", "DESCRIPTION"] and sections[-2:] == ["EXAMPLES", "SEE ALSO"]
+    assert examples(page)
+
+
+@pytest.mark.unsanitized
+def test_every_program_function_and_file_has_its_page(tmp_path):
+    subprocess.run(["cmake", "--install", BUILD, "--prefix", tmp_path], check=True, stdout=subprocess.DEVNULL)
+    programs = {path.name for path in (tmp_path / "bin").iterdir()}
+    functions = set(re.findall(r"\b(ktreec_\w+)\(", (TOP / "platform/include/ktreec.h").read_text()))
+    assert {"remvol", "vvstat"} <= programs and len(functions) == 5
+    names = {page.rsplit(".", 1)[0] for page in PAGES}
+    assert programs | functions | {"libktreec", "vv.xml", "remvol.conf", "remvol-shares.conf"} <= names
+
+
+def test_the_settings_of_the_manual_page_are_read(daemon, tmp_path):
+    (tmp_path / "vv.xml").write_text(examples("vv.xml.5")[0])
+    assert daemon.run("-l", tmp_path / "vv.xml").returncode == 0
+    assert daemon.get("/iscsi/initiator/id:1/lun/id:1/share") == b"Photos"
+    assert daemon.run("-D", tmp_path / "again.xml").returncode == 0
+    assert (tmp_path / "again.xml").read_text() == examples("vv.xml.5")[0]
+
+
 PROGRAM = """
 #include <stdio.h>
 #include <ktreec.h>
@@ -133,14 +176,40 @@ int main(void) {
 """
 
 
-@pytest.mark.unsanitized
-def test_a_program_is_built_with_what_pkg_config_says(tmp_path):
-    subprocess.run(["cmake", "--install", BUILD, "--prefix", tmp_path / "usr"], check=True, stdout=subprocess.DEVNULL)
-    (tmp_path / "program.c").write_text(PROGRAM)
-    folder = next(tmp_path.rglob("remvol-platform.pc")).parent
+def pkg_config(prefix):
+    """Installs the build there; returns the flags for its libraries, and their folder."""
+    subprocess.run(["cmake", "--install", BUILD, "--prefix", prefix], check=True, stdout=subprocess.DEVNULL)
+    folder = next(prefix.rglob("remvol-platform.pc")).parent
     flags = subprocess.run(["pkg-config", "--define-prefix", "--cflags", "--libs", "remvol-platform"], check=True,
                            stdout=subprocess.PIPE, text=True, env={**os.environ, "PKG_CONFIG_PATH": str(folder)}).stdout
-    subprocess.run(["cc", tmp_path / "program.c", "-o", tmp_path / "program", *flags.split()], check=True)
+    return flags.split(), folder.parent
+
+
+@pytest.mark.unsanitized
+def test_a_program_is_built_with_what_pkg_config_says(tmp_path):
+    flags, libraries = pkg_config(tmp_path / "usr")
+    (tmp_path / "program.c").write_text(PROGRAM)
+    subprocess.run(["cc", tmp_path / "program.c", "-o", tmp_path / "program", *flags], check=True)
     done = subprocess.run([tmp_path / "program"], stdout=subprocess.PIPE, text=True,
-                          env={**os.environ, "LD_LIBRARY_PATH": str(folder.parent)})
+                          env={**os.environ, "LD_LIBRARY_PATH": str(libraries)})
     assert (done.returncode, done.stdout) == (0, "[word]\n")
+
+
+@pytest.mark.unsanitized
+def test_the_program_of_the_library_s_manual_page(daemon, tmp_path):
+    program, command = examples("libktreec.3")
+    flags, libraries = pkg_config(tmp_path / "usr")
+    (tmp_path / "status.c").write_text(program.replace("/var/run/ktree_sock_vv", str(daemon.socket)))
+    # The command is that of the page; what it calls looks into the folder of this test.
+    (tmp_path / "pkg-config").write_text(f'#!/bin/sh\necho "{" ".join(flags)}"\n')
+    (tmp_path / "pkg-config").chmod(0o755)
+    subprocess.run(["sh", "-c", command], check=True, cwd=tmp_path,
+                   env={**os.environ, "PATH": f"{tmp_path}:{os.environ['PATH']}"})
+
+    def run():
+        return subprocess.run([tmp_path / "status"], stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True,
+                              env={**os.environ, "LD_LIBRARY_PATH": str(libraries)})
+
+    assert (run().returncode, run().stderr) == (1, "there is no volume\n")
+    daemon.set("/iscsi/initiator/id:1/lun/id:1/status", "Running")
+    assert (run().returncode, run().stdout) == (0, "Running\n")
