@@ -13,6 +13,7 @@
 
 #include "kernel_event.h"
 #include "netlink.h"
+#include "report.h"
 #include "sessions.h"
 #include "start.h"
 #include "targets.h"
@@ -38,7 +39,7 @@ struct Daemon {
 };
 
 void complain(const char* what) {
-  fprintf(stderr, "remvol-events: %s: %s\n", what, strerror(errno));
+  platform::report(LOG_ERR, "remvol-events: %s: %s", what, strerror(errno));
 }
 
 int open_signals() {
@@ -54,10 +55,13 @@ pid_t start_tool(const Order& order) {
   const char* option = reopen ? "--oiscsi_evt_reopen" : "--oiscsi_evt_recover";
   const char* argv[] = {kTool, option, "-n", order.target.c_str(), nullptr};
   const pid_t process = platform::start(kTool, argv);
-  fprintf(stderr, "remvol-events: %s: %s\n", order.target.c_str(),
-          process < 0 ? strerror(errno)
-          : reopen    ? "the connection is lost"
-                      : "the session is back");
+  const char* target = order.target.c_str();
+  if (process < 0)
+    platform::report(LOG_ERR, "remvol-events: %s: %s", target, strerror(errno));
+  else if (reopen)
+    platform::report(LOG_WARNING, "remvol-events: %s: the connection is lost", target);
+  else
+    platform::report(LOG_NOTICE, "remvol-events: %s: the session is back", target);
   return process;
 }
 
@@ -121,7 +125,7 @@ void take_messages(Daemon& daemon, int socket, Take take) {
         take(buffer, size);
         break;
       case Received::kOverrun:
-        fputs("remvol-events: events were lost, looking at all sessions\n", stderr);
+        platform::report(LOG_WARNING, "remvol-events: events were lost, looking at all sessions");
         daemon.gap = true;
         break;
       case Received::kFailed:

@@ -19,6 +19,7 @@
 #include "attempt.h"
 #include "netlink.h"
 #include "processes.h"
+#include "report.h"
 #include "schedule.h"
 #include "sessions.h"
 #include "start.h"
@@ -56,7 +57,7 @@ pid_t start(std::initializer_list<const char*> words, const char* program) {
   std::vector<const char*> argv(words);
   argv.push_back(nullptr);
   const pid_t process = platform::start(program, argv.data());
-  if (process < 0) fprintf(stderr, "<3>remvol-keeper: %s: %s\n", program, strerror(errno));
+  if (process < 0) platform::report(LOG_ERR, "remvol-keeper: %s: %s", program, strerror(errno));
   return process;
 }
 
@@ -69,7 +70,7 @@ void keep_initiator(Daemon& daemon, bool tree_answers, bool taken_down) {
   }
   if (++daemon.no_initiator < kLooksWithoutInitiator) return;
   daemon.no_initiator = 0;
-  fprintf(stderr, "<4>remvol-keeper: %s is gone, starting another one\n", kInitiator);
+  platform::report(LOG_WARNING, "remvol-keeper: %s is gone, starting another one", kInitiator);
   start({kInitiator, "-f"}, kInitiator);
 }
 
@@ -102,10 +103,11 @@ void tell(Daemon& daemon) {
   std::string target;
   for (Change change; (change = daemon.schedule.next_change(target)) != Change::kNone;) {
     if (change == Change::kMissing)
-      fprintf(stderr, "<4>remvol-keeper: %s should be connected and is not, it is tried until it is\n",
-              target.c_str());
+      platform::report(LOG_WARNING,
+                       "remvol-keeper: %s should be connected and is not, it is tried until it is",
+                       target.c_str());
     else
-      fprintf(stderr, "<5>remvol-keeper: %s is connected again\n", target.c_str());
+      platform::report(LOG_NOTICE, "remvol-keeper: %s is connected again", target.c_str());
   }
 }
 
@@ -164,7 +166,7 @@ bool open_inputs(Daemon& daemon) {
 int serve() {
   Daemon daemon;
   if (!open_inputs(daemon)) {
-    fprintf(stderr, "<3>remvol-keeper: device events: %s\n", strerror(errno));
+    platform::report(LOG_ERR, "remvol-keeper: device events: %s", strerror(errno));
     return 1;
   }
   do {

@@ -19,6 +19,7 @@
 #include <string>
 #include <vector>
 
+#include "common/report.h"
 #include "ktree/endpoint.h"
 #include "ktree/server.h"
 #include "ktree/standard_descriptors.h"
@@ -151,17 +152,17 @@ int run_daemon(const Options& options) {
   ktree::Endpoint endpoint;
   std::string error;
   if (signals < 0 || !endpoint.open(options.socket, options.name, error)) {
-    fprintf(stderr, "ktree: %s\n", error.empty() ? strerror(errno) : error.c_str());
+    platform::report(LOG_ERR, "ktree: %s", error.empty() ? strerror(errno) : error.c_str());
     return EXIT_FAILURE;
   }
   if (chdir("/") != 0) {
-    fprintf(stderr, "ktree: /: %s\n", strerror(errno));
+    platform::report(LOG_ERR, "ktree: /: %s", strerror(errno));
     return EXIT_FAILURE;
   }
   auto server = std::make_unique<ktree::Server>(endpoint.listener(), signals, client_limit(), service);
   tell_ready();
   if (!server->run()) {
-    fprintf(stderr, "ktree: %s\n", strerror(errno));
+    platform::report(LOG_ERR, "ktree: %s", strerror(errno));
     return EXIT_FAILURE;
   }
   return EXIT_SUCCESS;
@@ -175,7 +176,7 @@ int main(int argc, char** argv) {
     const int status = parse_options(argc, argv, options);
     return status >= 0 ? status : run_daemon(options);
   } catch (const std::bad_alloc&) {
-    fputs("ktree: out of memory\n", stderr);
+    platform::report(LOG_ERR, "ktree: out of memory");
     return EXIT_FAILURE;
   }
 }

@@ -8,6 +8,8 @@
 #include <cstdio>
 #include <cstring>
 
+#include "common/report.h"
+
 namespace ktree {
 namespace {
 
@@ -36,7 +38,8 @@ void keep_damaged(const std::string& file) {
   const std::string kept = file + ".damaged";
   unlink(kept.c_str());
   if (link(file.c_str(), kept.c_str()) != 0 && rename(file.c_str(), kept.c_str()) != 0) {
-    fprintf(stderr, "ktree: %s: not kept as %s: %s\n", file.c_str(), kept.c_str(), strerror(errno));
+    platform::report(LOG_WARNING, "ktree: %s: not kept as %s: %s", file.c_str(), kept.c_str(),
+                     strerror(errno));
   }
 }
 
@@ -48,13 +51,14 @@ void load_first(const std::vector<std::string>& files, Service& service) {
     std::string reason;
     if (load_file(file, service, reason)) {
       if (passed_over) {
-        fprintf(stderr, "ktree: loaded %s instead\n", file.c_str());
+        platform::report(LOG_WARNING, "ktree: loaded %s instead", file.c_str());
       }
       return;
     }
-    fprintf(stderr, "ktree: %s: %s\n", file.c_str(), reason.c_str());
+    const bool is_there = access(file.c_str(), F_OK) == 0;
+    platform::report(is_there ? LOG_WARNING : LOG_NOTICE, "ktree: %s: %s", file.c_str(), reason.c_str());
     passed_over = true;
-    if (access(file.c_str(), F_OK) == 0) {
+    if (is_there) {
       keep_damaged(file);
     }
   }

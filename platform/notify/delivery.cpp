@@ -17,6 +17,8 @@
 #include <cstring>
 #include <vector>
 
+#include "report.h"
+
 namespace notify {
 namespace {
 
@@ -40,7 +42,7 @@ constexpr Form kForms[] = {
 };
 
 bool complain(const std::string& subject, const char* why) {
-  fprintf(stderr, "remvol-notify: %s: %s\n", subject.c_str(), why);
+  platform::report(LOG_WARNING, "remvol-notify: %s: %s", subject.c_str(), why);
   return false;
 }
 

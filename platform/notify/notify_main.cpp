@@ -12,6 +12,7 @@
 #include "delivery.h"
 #include "history.h"
 #include "kernel.h"
+#include "report.h"
 #include "status.h"
 #include "tree_reader.h"
 #include "utf8.h"
@@ -24,7 +25,7 @@ constexpr char kConfig[] = "/etc/remvol/remvol.conf";
 constexpr int kFailed = 1, kUsage = 2, kUnreachable = 3;
 
 bool complain(const char* subject) {
-  fprintf(stderr, "remvol-notify: %s: %s\n", subject, strerror(errno));
+  platform::report(LOG_WARNING, "remvol-notify: %s: %s", subject, strerror(errno));
   return false;
 }
 
@@ -62,7 +63,7 @@ int tell(const std::vector<Event>& events) {
 int look_and_tell() {
   const vvstat::Status status = vvstat::read_status(platform::TreeReader());
   if (!status.reachable) {
-    fputs("remvol-notify: the configuration tree cannot be reached\n", stderr);
+    platform::report(LOG_WARNING, "remvol-notify: the configuration tree cannot be reached");
     return kUnreachable;
   }
   std::vector<Event> events;

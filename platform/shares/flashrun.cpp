@@ -15,6 +15,7 @@
 #include <initializer_list>
 
 #include "flash.h"
+#include "report.h"
 #include "settings_copy.h"
 
 namespace {
@@ -31,7 +32,7 @@ void protect_settings() {
   if (fd < 0) return;
   if (fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && (info.st_mode & 077) != 0 &&
       fchmod(fd, info.st_mode & 0700) != 0) {
-    fprintf(stderr, "flashrun: %s stays readable for others: %s\n", kSettings, strerror(errno));
+    platform::report(LOG_WARNING, "flashrun: %s stays readable for others: %s", kSettings, strerror(errno));
   }
   close(fd);
 }
@@ -44,7 +45,7 @@ void protect_settings() {
     execvp(command[0], command);
   }
   const int error = errno;
-  fprintf(stderr, "flashrun: %s: %s\n", command[0], strerror(error));
+  platform::report(LOG_WARNING, "flashrun: %s: %s", command[0], strerror(error));
   _exit(error == ENOENT ? kNotFound : kCannotRun);
 }
 
@@ -72,7 +73,8 @@ int exit_status(int wait_status) {
 }
 
 void leave(flash::UserLock& lock) {
-  if (!lock.leave(kFolder)) fprintf(stderr, "flashrun: %s stays writable: %s\n", kFolder, strerror(errno));
+  if (!lock.leave(kFolder))
+    platform::report(LOG_WARNING, "flashrun: %s stays writable: %s", kFolder, strerror(errno));
 }
 
 // Starts the command in the process group `group`, waits for its end and puts back settings that it left
@@ -90,7 +92,7 @@ int run_command(char** command, pid_t group, const sigset_t& callers_mask, bool 
     if (is_copy) _exit(copy.run());
     exec_command(command);
   }
-  if (child < 0) perror("flashrun: fork");
+  if (child < 0) platform::report(LOG_WARNING, "flashrun: fork: %s", strerror(errno));
   const int status = child < 0 ? kCannotRun : exit_status(wait_for(child));
   return kept.settle() || status != 0 ? status : kTorn;
 }
@@ -117,12 +119,12 @@ int main(int argc, char** argv) {
   if (!flash::is_mount(kFolder)) return run_command(command, getpgrp(), callers_mask, true);
   flash::UserLock lock;
   if (!lock.enter(kFolder)) {
-    fprintf(stderr, "flashrun: %s cannot be made writable: %s\n", kFolder, strerror(errno));
+    platform::report(LOG_WARNING, "flashrun: %s cannot be made writable: %s", kFolder, strerror(errno));
   }
   const pid_t guard = fork();
   if (guard == 0) run_guard(command, lock, callers_mask);
   const int status = guard > 0 ? wait_for(guard) : kCannotRun << 8;
-  if (guard < 0) perror("flashrun: fork");
+  if (guard < 0) platform::report(LOG_WARNING, "flashrun: fork: %s", strerror(errno));
   if (guard < 0 || WIFSIGNALED(status)) leave(lock);
   return exit_status(status);
 }

@@ -21,23 +21,22 @@ int main(int argc, char** argv) {
   const Wish wish = read_wish(argc, argv);
   if (wish == Wish::kWrong) return 2;
   open_log("macshare_reload");
-  if (!is_installed("netatalk")) {
-    log_line("netatalk is not installed; Macs use the Samba shares");
-    return 0;
-  }
+  // Macs use the Samba shares then.
+  if (!is_installed("netatalk")) return 0;
   if (!take_turn(kLock)) {
-    log_line("%s: %s", kLock, strerror(errno));
+    log_line(LOG_WARNING, "%s: %s", kLock, strerror(errno));
     return 0;
   }
   const ServerConfig config = read_server_config(kConfig, kShares);
   const Reload done = reload_shares(
       {"macshare_reload", kShares, kNetatalkNames, config.names, false, "", wish == Wish::kWithdraw});
   if (!done.has_tree) {
-    log_line("the configuration tree does not answer; only shares that are gone are taken out");
+    log_line(LOG_WARNING, "the configuration tree does not answer; only shares that are gone are taken out");
   } else if (!config.includes_shares && !done.shares.empty()) {
-    log_line("%s does not include %s; nobody sees the shares", kConfig, kShares);
+    log_line(LOG_WARNING, "%s does not include %s; nobody sees the shares", kConfig, kShares);
   }
   // netatalk(8): SIGHUP makes it and its servers read the configuration again.
-  if (done.changed && run({"killall", "-q", "-HUP", "netatalk"}) != 0) log_line("netatalk does not run");
+  if (done.changed && run({"killall", "-q", "-HUP", "netatalk"}) != 0)
+    log_line(LOG_WARNING, "netatalk does not run");
   return 0;
 }

@@ -9,7 +9,6 @@
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <cstdarg>
@@ -17,6 +16,7 @@
 #include <string_view>
 
 #include "lock_file.h"
+#include "report.h"
 
 namespace shares {
 namespace {
@@ -61,13 +61,13 @@ void take_output(int sink, std::string& output) {
 }  // namespace
 
 void open_log(const char* program) {
-  openlog(program, LOG_PERROR, LOG_DAEMON);
+  openlog(program, platform::is_journal(STDERR_FILENO) ? 0 : LOG_PERROR, LOG_DAEMON);
 }
 
-void log_line(const char* format, ...) {
+void log_line(int priority, const char* format, ...) {
   va_list arguments;
   va_start(arguments, format);
-  vsyslog(LOG_NOTICE, format, arguments);
+  vsyslog(priority, format, arguments);
   va_end(arguments);
 }
 

@@ -2,14 +2,19 @@
 #ifndef PLATFORM_SHARES_PROCESS_H
 #define PLATFORM_SHARES_PROCESS_H
 
+#include <syslog.h>
+
 #include <string>
 #include <vector>
 
 namespace shares {
 
-// Opens the log under the program's name: lines go to standard error and to the system's log.
+// Opens the log under the program's name: lines go to the system's log, and to standard error unless that is
+// the journal, which has them then.
 void open_log(const char* program);
-void log_line(const char* format, ...) __attribute__((format(printf, 1, 2)));
+
+// Logs a line of a priority; see syslog(3).
+void log_line(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
 
 // Waits until no other reload of the same lock file runs and keeps others waiting until this process ends.
 // Makes the folder of the generated files. Returns false, with errno, when it cannot be used.

@@ -37,7 +37,7 @@ std::vector<Section> shares_of(const std::vector<Volume>& volumes, const Server&
       why = "the file server takes no blanks in the names of its users";
     }
     if (why != nullptr) {
-      log_line("volume \"%s\" is not shared: %s", platform::printable(volume.name).c_str(), why);
+      log_line(LOG_WARNING, "volume \"%s\" is not shared: %s", platform::printable(volume.name).c_str(), why);
       continue;
     }
     taken.push_back(folded);
@@ -78,16 +78,17 @@ void tell_of_strangers(const Access& access, const std::vector<Volume>& volumes)
       return folded_name(volume.name) == rule.folded;
     });
     if (!known)
-      log_line("%s: no volume has the share name \"%s\"", kAccessFile,
+      log_line(LOG_WARNING, "%s: no volume has the share name \"%s\"", kAccessFile,
                platform::printable(rule.share).c_str());
   }
 }
 
 void tell_what_is_wrong(const Access& access) {
   if (access.line != 0) {
-    log_line("%s, line %d: %s; the shares stay as they are", kAccessFile, access.line, access.why);
+    log_line(LOG_WARNING, "%s, line %d: %s; the shares stay as they are", kAccessFile, access.line,
+             access.why);
   } else {
-    log_line("%s: %s; the shares stay as they are", kAccessFile, access.why);
+    log_line(LOG_WARNING, "%s: %s; the shares stay as they are", kAccessFile, access.why);
   }
 }
 
@@ -122,7 +123,7 @@ Reload reload_shares(const Server& server) {
   done.barred = barred_in(done.shares, before);
   done.changed = done.shares != before;
   if (done.changed && !replace_file(server.file, compose(server.reload, done.shares))) {
-    log_line("%s cannot be written: %s", server.file, strerror(errno));
+    log_line(LOG_WARNING, "%s cannot be written: %s", server.file, strerror(errno));
   }
   return done;
 }

@@ -11,6 +11,7 @@
 #include <cstring>
 
 #include "lock_file.h"
+#include "report.h"
 
 namespace flash {
 namespace {
@@ -109,8 +110,8 @@ bool end_keeping(int folder, const char* name) {
     return true;
   }
   const bool put_back = take_the_name(folder, name);
-  fprintf(stderr, "flashrun: %s/%s was torn, %s\n", kFolder, kSettings,
-          put_back ? "the former one is back" : strerror(errno));
+  platform::report(LOG_WARNING, "flashrun: %s/%s was torn, %s", kFolder, kSettings,
+                   put_back ? "the former one is back" : strerror(errno));
   return false;
 }
 
@@ -204,14 +205,14 @@ bool SettingsCopy::parse(char** command) {
 int SettingsCopy::run() const {
   const Fd from(open(source, O_RDONLY | O_NONBLOCK | O_CLOEXEC));
   if (!is_regular(from.fd)) {
-    fprintf(stderr, "flashrun: %s: %s\n", source, strerror(errno));
+    platform::report(LOG_WARNING, "flashrun: %s: %s", source, strerror(errno));
     return 1;
   }
   const Fd folder(open(kFolder, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   const Turn turn;
   if (turn.held() && folder.fd >= 0) clear_left_overs(folder.fd);
   if (folder.fd >= 0 && replace_settings(folder.fd, from.fd)) return 0;
-  fprintf(stderr, "flashrun: %s is not copied to %s: %s\n", source, kFolder, strerror(errno));
+  platform::report(LOG_WARNING, "flashrun: %s is not copied to %s: %s", source, kFolder, strerror(errno));
   return 1;
 }
 

@@ -48,7 +48,7 @@ std::string options_for_macs(const ServerConfig& config) {
 void add_registry_shares(ServerConfig& config) {
   std::string output;
   if (run({"net", "conf", "listshares"}, &output) != 0) {
-    log_line("net failed; the shares in Samba's registry are not known");
+    log_line(LOG_WARNING, "net failed; the shares in Samba's registry are not known");
     return;
   }
   for (std::string_view rest = output; !rest.empty();) {
@@ -64,9 +64,9 @@ bool samba_runs() {
 }
 
 void tell_samba(const Reload& done) {
-  if (!samba_runs()) log_line("Samba does not run; it finds the shares when it starts");
+  if (!samba_runs()) log_line(LOG_NOTICE, "Samba does not run; it finds the shares when it starts");
   if (run({"smbcontrol", "all", "reload-config"}) != 0)
-    log_line("smbcontrol failed; Samba may not know the shares");
+    log_line(LOG_WARNING, "smbcontrol failed; Samba may not know the shares");
   for (const std::vector<Section>* shares : {&done.gone, &done.barred}) {
     for (const Section& share : *shares) run({"smbcontrol", "smbd", "close-share", share.name});
   }
@@ -74,13 +74,13 @@ void tell_samba(const Reload& done) {
 
 void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool has_samba) {
   if (!has_samba && !done.has_tree) {
-    log_line("nothing to do without Samba and without the configuration tree");
+    log_line(LOG_WARNING, "nothing to do without Samba and without the configuration tree");
   } else if (!has_samba) {
-    log_line("Samba is not installed; nobody reads %s", kShares);
+    log_line(LOG_WARNING, "Samba is not installed; nobody reads %s", kShares);
   } else if (!done.has_tree) {
-    log_line("the configuration tree does not answer; only shares that are gone are taken out");
+    log_line(LOG_WARNING, "the configuration tree does not answer; only shares that are gone are taken out");
   } else if (!config.includes_shares && !done.shares.empty()) {
-    log_line("%s does not include %s; nobody sees the shares", kConfig, kShares);
+    log_line(LOG_WARNING, "%s does not include %s; nobody sees the shares", kConfig, kShares);
   }
 }
 
@@ -91,7 +91,7 @@ int main(int argc, char** argv) {
   if (wish == Wish::kWrong) return 2;
   open_log("winshare_reload");
   if (!take_turn(kLock)) {
-    log_line("%s: %s", kLock, strerror(errno));
+    log_line(LOG_WARNING, "%s: %s", kLock, strerror(errno));
     return 0;
   }
   ServerConfig config = read_server_config(kConfig, kShares);

@@ -1,5 +1,10 @@
 #include "frontend/log.h"
 
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cerrno>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
@@ -8,6 +13,29 @@
 namespace remvol {
 
 namespace {
+
+constexpr char kJournal[] = "/run/systemd/journal/stdout";
+
+bool is_journal(int fd) {
+  const int error = errno;  // of what is to be told
+  sockaddr_un peer{};
+  socklen_t size = sizeof peer - 1;  // its path ends in a NUL in any case
+  const bool connected = getpeername(fd, reinterpret_cast<sockaddr*>(&peer), &size) == 0;
+  errno = error;
+  return connected && peer.sun_family == AF_UNIX && strcmp(peer.sun_path, kJournal) == 0;
+}
+
+// The journal takes a priority at the begin of each line, of a message of several lines as well.
+void print_lines(Weight weight, const char* text, size_t size) {
+  while (const void* end = memchr(text, '\n', size)) {
+    const size_t line = static_cast<size_t>(static_cast<const char*>(end) - text) + 1;
+    fwrite(text, 1, line, stdout);
+    begin_line(weight);
+    text += line;
+    size -= line;
+  }
+  fwrite(text, 1, size, stdout);
+}
 
 // A CHAP secret stands behind this in the command that stores it.
 constexpr char kSecretSetting[] = "node.session.auth.password -v \"";
@@ -19,33 +47,41 @@ const char* end_of_quoted(const char* text) {
 }
 
 // Here rather than where commands are run: no message of any module can show a secret.
-void print_without_secrets(const char* text) {
+void print_without_secrets(Weight weight, const char* text) {
   while (const char* setting = strstr(text, kSecretSetting)) {
     const char* const secret = setting + strlen(kSecretSetting);
-    printf("%.*s%s", static_cast<int>(secret - text), text, kMaskedSecret);
+    print_lines(weight, text, static_cast<size_t>(secret - text));
+    fputs(kMaskedSecret, stdout);
     text = end_of_quoted(secret);
   }
-  fputs(text, stdout);
+  print_lines(weight, text, strlen(text));
 }
 
 }  // namespace
 
 int debug_level = 0;
 
-void log_prefix(int level, const char* file, const char* function, int line) {
-  if (debug_level >= level) printf("(%s:%s:%d): ", file, function, line);
+void begin_line(Weight weight, FILE* stream) {
+  if (is_journal(fileno(stream))) fprintf(stream, "<%d>", weight.priority);
+}
+
+void log_prefix(Weight weight, const char* file, const char* function, int line) {
+  if (debug_level >= weight.level) {
+    begin_line(weight);
+    printf("(%s:%s:%d): ", file, function, line);
+  }
   fflush(stdout);
 }
 
-void log_message(int level, const char* file, const char* function, int line, const char* format, ...) {
-  log_prefix(level, file, function, line);
-  if (debug_level >= level) {
+void log_message(Weight weight, const char* file, const char* function, int line, const char* format, ...) {
+  log_prefix(weight, file, function, line);
+  if (debug_level >= weight.level) {
     char* text = nullptr;
     va_list arguments;
     va_start(arguments, format);
     if (vasprintf(&text, format, arguments) < 0) text = nullptr;
     va_end(arguments);
-    print_without_secrets(text != nullptr ? text : format);
+    print_without_secrets(weight, text != nullptr ? text : format);
     free(text);
     putchar('\n');
   }

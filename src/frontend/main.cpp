@@ -44,6 +44,7 @@ int fail(bool show_usage) {
   // Only the SMB service is reloaded, and on every failure: users of the shares see what is left of them.
   (void)!system("winshare_reload");
   if (gs_str_command != nullptr) record_result("-1");
+  begin_line(kCommandFailed);
   puts("execute failed.");
   return kFailureStatus;
 }
@@ -150,6 +151,7 @@ int main(int argc, char** argv) {
       break;
   }
   if (gs_str_command == nullptr) {
+    begin_line(kCommandFailed, stderr);
     fprintf(stderr, "%s: %s:%d: %s: Assertion `gs_str_command' failed.\n", program_path, LOG_SOURCE, __LINE__,
             __func__);
     abort();

@@ -124,7 +124,7 @@ ParseEnd take_address() {
 
 ParseEnd store_debug_level() {
   const NumberText value("%d", atoi(optarg));
-  LOG_AS_MAIN(0, "ktreec_set %s=%s", key::kDebugLevel, value.c_str());
+  LOG_AS_MAIN(kNote, "ktreec_set %s=%s", key::kDebugLevel, value.c_str());
   if (tree_write(key::kDebugLevel, value) != kOk) LOG_AS_MAIN(0, "ktreec_set(%s) failed ", key::kDebugLevel);
   return ParseEnd::kExit;
 }

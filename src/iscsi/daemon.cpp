@@ -56,8 +56,8 @@ void start_tree_daemon(const char* socket, Caller caller) {
 }
 
 bool stop_tree_daemon(const char* pid_file) {
-  if (System("kill -SIGTERM `cat %s`", pid_file) == 0) return true;
-  // dash, and bash as sh, know the signal only as TERM.
+  // dash, and bash as sh, know the signal only as TERM, and say so.
+  if (const ErrorsHidden hidden; System("kill -SIGTERM `cat %s`", pid_file) == 0) return true;
   pid_t pid = 0;
   return find_tree_daemon(pid_file, &pid) && kill(pid, SIGTERM) == 0;
 }

@@ -51,7 +51,7 @@ bool read_names(FILE* file, DiscoveredNames* names, Caller caller) {
     LOG_AT(caller, 3, "line %d: %s", lines, last.text);
   }
   names->sort();
-  LOG_AT(caller, 0, "vector size: %ld", static_cast<long>(names->size()));
+  LOG_AT(caller, kNote, "vector size: %ld", static_cast<long>(names->size()));
   return true;
 }
 
@@ -74,7 +74,7 @@ void publish_names(const char* socket, const DiscoveredNames& names, Caller call
 int search_portal(const char* socket, Caller caller) {
   const TargetEntry& request = request_target;
   const TempFile path(discovery_path());
-  LOG_AT(caller, 0, "ip: %s, port: %d", request.ip, request.port);
+  LOG_AT(caller, kNote, "ip: %s, port: %d", request.ip, request.port);
   int result = discover(request.ip, request.port, request.iface, path, caller) ? 0 : 1;
   File file(fopen(path, "re"));
   if (file == nullptr) return 2;

@@ -40,7 +40,7 @@ constexpr IfaceRecord kIfaceRecords[] = {
 // used.
 int _set_iface_config(const char* iface, const char* /*mac*/, const char* netif) {
   if (iface == nullptr || iface[0] == '\0' || netif == nullptr || netif[0] == '\0') return kFailed;
-  run_command(new_iface_command(iface));
+  run_command(new_iface_command(iface), Caller(), kNote);
   return run_command(bind_iface_command(iface, netif)) == 0 ? kOk : kFailed;
 }
 
@@ -99,7 +99,7 @@ int _get_iface_name(char* out, size_t size, const char* address) {
 int _ktree_get_bonding_mode_enable() {
   char value[128];
   if (tree_read(key::kBondingEnable, value)) return atoi(value) != 0 ? 1 : 0;
-  LOG(0, "get bonding mode status failed");
+  LOG(kNote, "get bonding mode status failed");
   return kFailed;
 }
 

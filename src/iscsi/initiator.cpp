@@ -162,7 +162,7 @@ int task_init() {
   start_settings_daemon(caller);
   if (is_remvol_ver_changed() != 0) version_upgrade();
   set_remvol_ver_to_db(kSettingsVersion);
-  run_command("killall -q -SIGTERM iscsid");
+  run_command("killall -q -SIGTERM iscsid", Caller(), kNote);
   reload_modules(caller);
   run_command("mkdir -p /etc/iscsi");
   write_daemon_configuration(caller);

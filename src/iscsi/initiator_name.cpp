@@ -51,7 +51,7 @@ InitiatorName make_initiator_name(Caller caller) {
 int get_mac_as_unique_name(char* out) {
   char mac[32] = "";
   if (get_lan0_mac_text(mac) != 0) {
-    LOG(0, "ERROR : get lan1 mac from ktree failed");
+    LOG(kNote, "ERROR : get lan1 mac from ktree failed");
     return kFailed;
   }
   LOG(2, "LAN1 mac = %s", mac);

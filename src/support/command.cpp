@@ -1,5 +1,6 @@
 #include "support/command.h"
 
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -7,10 +8,23 @@
 
 namespace remvol {
 
-int run_command(const char* command, Caller caller) {
+int run_command(const char* command, Caller caller, Weight failure) {
   const int status = system(command);
-  if (status != 0) LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
+  if (status != 0) LOG_AT(caller, failure, "system() of cmd '%s' failed", command);
   return status;
+}
+
+ErrorsHidden::ErrorsHidden() : kept_(fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1)) {
+  const int nowhere = kept_ >= 0 ? open("/dev/null", O_WRONLY | O_CLOEXEC) : -1;
+  if (nowhere < 0) return;
+  dup2(nowhere, STDERR_FILENO);
+  close(nowhere);
+}
+
+ErrorsHidden::~ErrorsHidden() {
+  if (kept_ < 0) return;
+  dup2(kept_, STDERR_FILENO);
+  close(kept_);
 }
 
 int command_exit_code(int status) {
@@ -28,10 +42,10 @@ int process_system_cmd_mt(const char* command, int cycles, int max_wait_us) {
   for (int cycle = 0; cycle < cycles; cycle++) {
     if (cycle > 0 && max_wait_us >= 2) {
       const int wait = rand() % max_wait_us;
-      LOG(0, "retry cmd : cycle = %d, time = %d", cycle, wait);
+      LOG(kNote, "retry cmd : cycle = %d, time = %d", cycle, wait);
       usleep(static_cast<useconds_t>(wait));
     }
-    status = run_command(command);
+    status = run_command(command, Caller(), kNote);
     if (status == 0) return 0;
     log_command_status(status);
   }

@@ -44,6 +44,7 @@ int make_lock_dir() {
   // Where everybody may make folders (a /var/lock of mode 1777) it may be somebody else's.
   drop_foreign_folder(Text<sizeof kLockDir>("%.*s", static_cast<int>(sizeof kLockDir - 2), kLockDir));
   if (make_dir_include_parent(kLockDir, 0700) == 0) return kOk;
+  begin_line(0, stderr);
   perror(kLockDir);
   return kLockFileFailed;
 }
@@ -51,6 +52,7 @@ int make_lock_dir() {
 int get_recover_cri_flock() {
   const int fd = open_lock_file(kRecoverLock);
   if (fd < 0) {
+    begin_line(0, stderr);
     perror(kRecoverLock);
     return kLockFileFailed;
   }

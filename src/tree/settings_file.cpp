@@ -83,6 +83,7 @@ void tell_failed_dump(Caller caller) {
   if (access(kSettingsFolder, F_OK) == 0) {
     LOG_AT(caller, 0, "ktreec_dump(%s) failed", kSettingsFile);
   } else {
+    begin_line(0, stderr);
     fprintf(stderr, "remvol: the settings are not saved, there is no %s\n", kSettingsFolder);
   }
 }

@@ -166,7 +166,7 @@ bool protect_data(Volume* volume, Caller caller) {
 }
 
 int create_file_system(Volume* volume, Caller caller = Caller()) {
-  LOG_AT(caller, 0, "Got FS type = %s, creating volume", volume->fs_type);
+  LOG_AT(caller, kNote, "Got FS type = %s, creating volume", volume->fs_type);
   volume->held.release();
   const int result = Target_format(volume->entry, volume->node, volume->seen_empty);
   if (result == 0 || (result == kFormatLeftAlone && !volume->asked)) return kOk;

@@ -55,7 +55,7 @@ bool run_with_retries(const char* command, Caller caller) {
   for (int retries = 0; system(command) != 0; retries++) {
     if (retries == kMountRetries) return false;
     LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
-    LOG_AT(caller, 0, "wait %u micro seconds", kMountRetryWait);
+    LOG_AT(caller, kNote, "wait %u micro seconds", kMountRetryWait);
     usleep(kMountRetryWait);
   }
   return true;

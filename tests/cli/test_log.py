@@ -75,3 +75,70 @@ class TestLine:
         box.hook("getaddrinfo", "10.0.0.1", kill=signal.SIGKILL)
         done = box.remvol("--search", "-n", "hidden message", "-i", "10.0.0.1")
         assert (done.status, done.stdout) == (-signal.SIGKILL, "\n")
+
+
+# Runs a program as a unit does: its output is a stream to the journal. Prints what the journal gets.
+IN_A_UNIT = """
+import os, socket, subprocess, sys
+os.makedirs("/run/systemd/journal", exist_ok=True)
+journal = socket.socket(socket.AF_UNIX)
+journal.bind("/run/systemd/journal/stdout")
+journal.listen()
+stream = socket.socket(socket.AF_UNIX)
+stream.connect("/run/systemd/journal/stdout")
+subprocess.run(sys.argv[1:], stdout=stream, stderr=stream, check=False)
+stream.close()
+with journal.accept()[0].makefile() as lines:
+    print(lines.read(), end="")
+"""
+
+
+def in_a_unit(box, *argv):
+    """(priority, text) of each line; the priority is None where the line has none of its own."""
+    done = box.run(["/usr/bin/python3", "-c", IN_A_UNIT, *argv])
+    found = [re.fullmatch(r"(?:<(\d)>)?(.*)", line).groups() for line in done.stdout.split("\n") if line]
+    return [(priority and int(priority), re.sub(r"^\(\S+\.cpp:\w+:\d+\): ", "", text)) for priority, text in found]
+
+
+class TestJournal:
+    def test_failures_are_warnings_and_a_failed_command_is_an_error(self, box):
+        box.hook("getaddrinfo", "nobody", ret=-2)
+        assert in_a_unit(box, "remvol", "--search", "-i", "nobody") == [
+            (4, "ip address nobody -> error"), (3, "execute failed.")]
+
+    def test_flow_and_detail_are_none(self, box):
+        box.debug(2)
+        box.path("/etc/NAS_CFG").mkdir()
+        box.tree.set("/iscsi/initiator/ver", "1")
+        lines = in_a_unit(box, "remvol", "--verupgrade")
+        assert (6, LEVEL_1) in lines and (7, LEVEL_2) in lines
+        assert not [line for line in lines if line[0] is None or line[0] < 6]
+
+    def test_what_is_no_failure_of_the_tool_is_a_note(self, box):
+        box.fake("killall", "-q -SIGTERM iscsid", status=1)
+        box.unscripted_ok()
+        box.run(["touch", "/var/run/ktree_sock_vv_config.pid"])
+        lines = in_a_unit(box, "remvol", "--init")
+        assert (6, "system() of cmd 'killall -q -SIGTERM iscsid' failed") in lines
+        assert (4, "system() of cmd 'insmod /usr/local/modules/driver/libiscsi.ko' failed") in lines
+
+    def test_every_line_of_a_message_has_the_priority(self, box):
+        box.tree.set({"/iscsi/initiator/count": "1", "/iscsi/initiator/id:1/target": "iqn.t1",
+                      "/iscsi/initiator/id:1/ip": "10.9.0.2", "/iscsi/initiator/id:1/port": "3260"})
+        box.unscripted_ok()
+        lines = in_a_unit(box, "remvol", "--connect", "-n", "iqn.t1")
+        at = lines.index((4, "Can not find target iqn.t1 in session"))
+        assert lines[at + 1] == (4, ", connect failed.")
+
+    def test_the_shell_says_nothing_of_the_signal_that_it_does_not_know(self, box):
+        box.run(["ln", "-sf", "dash", "/usr/bin/sh"])
+        box.default("killall")
+        box.default("iscsiadm")
+        assert [line for line in in_a_unit(box, "remvol", "--system_off") if "kill" in line[1]] == []
+
+    def test_programs_of_the_platform(self, box):
+        box.write("/etc/NAS_CFG/vv.xml", "damaged")
+        box.tree.stop()
+        lines = in_a_unit(box, "timeout", "2", "ktree", "-n", "config", "-s", "/run/other", "-l", "/etc/NAS_CFG/vv.xml",
+                          "-l", "/usr/local/config/vv.xml")
+        assert [priority for priority, text in lines if text.startswith("ktree: ")] == [4, 5]

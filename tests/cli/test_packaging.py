@@ -281,7 +281,7 @@ def test_a_unit_that_mounts_for_others_has_no_mounts_of_its_own(name):
 def test_what_a_unit_starts_is_installed(path):
     helpers = {p.name for p in (PACKAGING / "helpers").iterdir()}
     ours = {"remvol", "ktree", "remvol-events", "remvol-keeper", "remvol-notify", "winshare_reload", "macshare_reload"}
-    started = [pathlib.PurePath(name) for name in re.findall(r"^Exec\w+=-?(\S+)", path.read_text(), re.M)]
+    started = [pathlib.PurePath(name) for name in re.findall(r"^Exec\w+=[-+]?(\S+)", path.read_text(), re.M)]
     assert started
     for program in started:
         places = {"/usr/lib/remvol": helpers, "/usr/bin": ours, "/bin": {"sh"}}
