@@ -1,10 +1,11 @@
+# needs: samba
 # timeout: 300
-# What scripts/demo shows, run in the virtual appliance: a remote disk becomes a shared folder, goes away, comes back.
+# What scripts/demo shows, run in the virtual appliance: a remote disk becomes a shared folder, a client on another machine
+# saves a photo in it, the cable to the storage is cut and put back, and nothing is lost.
 # DEMO_TERMINAL is 1 when a person watches on a terminal, 0 when the output goes elsewhere.
 PORTAL=10.9.0.2
 TARGET=iqn.2026-01.org.example:photos
-FOLDER=/mnt/VV/Photos
-LUN_DIR=/data/luns
+DESK=192.168.7.2
 OUT=/tmp/demo
 mkdir -p $OUT
 steps=0
@@ -21,7 +22,9 @@ headline() {
     say "$bold$steps. $*$plain"
 }
 
-note() { say "     $*"; }
+note() { say "   $*"; }
+
+indent() { sed 's/^/   /'; }
 
 # Hundredths of a second since the appliance was switched on.
 clock() {
@@ -31,61 +34,43 @@ clock() {
 
 seconds() { echo "$(($1 / 100)).$(($1 % 100 / 10)) s"; }
 
+# begin, took: the time since then. The status is shown anew.
+begin() { started=$(clock) shown=; }
+
+took() { seconds $(($(clock) - started)); }
+
+# remember TEXT TIME: a line of the summary.
+remember() { printf '  %-50s %8s\n' "$1" "$2" >>$OUT/summary; }
+
 # ---- running a command and telling of it ----
 
-began() {
-    note "$ remvol $*"
-    started=$(clock)
-}
-
-# ended STATUS COMMAND: remembers a line of the summary; a failure ends the demonstration.
-ended() {
-    took=$(($(clock) - started))
-    outcome=$(result "$2")
-    printf '  remvol --%-11s %8s   result %s\n' "$2" "$(seconds $took)" "$outcome" >>$OUT/summary
-    if [ "$1" != 0 ]; then
-        sed 's/^/     | /' $OUT/log
-        fail "remvol --$2 ended with status $1"
-    fi
-}
-
+# run COMMAND...: shows the command; a failure ends the demonstration.
 run() {
-    began "$@"
-    status=0
-    remvol "$@" >$OUT/log 2>&1 || status=$?
-    ended $status "${1#--}"
+    note "$ $*"
+    "$@" >$OUT/log 2>&1 || broken "$@"
 }
 
-# ---- what the administration pages would show ----
-
-# Takes the status texts and the format's progress from the tree, as they are at this moment.
-look() {
-    target= volume= size= formatting= progress=
-    ktreec -S $TREE_SOCKET -t /iscsi/initiator/id:1 >$OUT/tree || return 0
-    while IFS='=' read -r key value; do
-        case $key in
-        */id:1/lun/id:1/status) volume=$value ;;
-        */id:1/lun/id:1/size) size=$value ;;
-        */id:1/lun/id:1/format_state) formatting=$value ;;
-        */id:1/lun/id:1/format_progress) progress=$value ;;
-        */id:1/status) target=$value ;;
-        esac
-    done <$OUT/tree
+broken() {
+    indent <$OUT/log
+    fail "this failed: $*"
 }
 
-show_status() {
-    look
-    note "target: ${target:-none}, volume: ${volume:-none}"
+# show COMMAND...: shows the command and what it prints, whatever it thinks of the volumes.
+show() {
+    note "$ $*"
+    "$@" | indent
 }
+
+# ---- the live status ----
 
 bar() {
     filled=$(($1 * 40 / 100))
     line=$(printf '%*s' $filled '' | tr ' ' '#')$(printf '%*s' $((40 - filled)) '' | tr ' ' '-')
     if [ "$DEMO_TERMINAL" = 1 ]; then
-        printf '\r     %8s  [%s] %3d %%' "$(seconds $(($(clock) - started)))" "$line" "$1"
+        printf '\r   %8s  Photos  [%s] %3d %%' "$(took)" "$line" "$1"
         bar_open=1
     else
-        printf '     %8s  [%s] %3d %%\n' "$(seconds $(($(clock) - started)))" "$line" "$1"
+        printf '   %8s  Photos  [%s] %3d %%\n' "$(took)" "$line" "$1"
     fi
 }
 
@@ -94,48 +79,100 @@ close_bar() {
     bar_open=
 }
 
-# Shows each text once, and the progress while there is some.
-show_changes() {
-    look
-    if [ "$target/$volume" != "$shown" ]; then
+# Shows what vvstat says of the volume, once each; a format as a bar.
+show_status() {
+    now=$(vvstat -no SHARE,STATUS,USED,SIZE)
+    [ "$now" != "$shown" ] || return 0
+    shown=$now
+    case $now in
+    *"Formatting "[0-9]*)
+        percent=${now##*Formatting }
+        bar "${percent%%%*}"
+        ;;
+    *)
         close_bar
-        printf '     %8s  target: %s, volume: %s\n' "$(seconds $(($(clock) - started)))" "$target" "$volume"
-        shown=$target/$volume
-    fi
-    if [ "$formatting" = 1 ]; then was_formatting=1; fi
-    if [ -n "$was_formatting" ] && [ "$progress" != "$shown_progress" ]; then
-        bar "$progress"
-        shown_progress=$progress
-    fi
+        printf '   %8s  %s\n' "$(took)" "$now"
+        ;;
+    esac
 }
 
-# watch OPTION...: runs the tool and shows what others see of it meanwhile.
+# watch COMMAND...: runs it and shows the status meanwhile.
 watch() {
-    shown= shown_progress= was_formatting= bar_open=
-    began "$@"
-    remvol "$@" >$OUT/log 2>&1 &
+    bar_open=
+    note "$ $*"
+    "$@" >$OUT/log 2>&1 &
     running=$!
     while kill -0 $running 2>/dev/null; do
-        show_changes
+        show_status
         sleep 0.2
     done
-    status=0
-    wait $running || status=$?
-    show_changes
+    wait $running || broken "$@"
+    show_status
     close_bar
-    ended $status "${1#--}"
 }
 
-# ---- the values of a result file ----
+# watch_until COMMAND...: shows the status until the command succeeds, a minute at most.
+watch_until() {
+    limit=$(($(clock) + 6000))
+    until "$@"; do
+        show_status
+        [ "$(clock)" -lt $limit ] || fail "waited a minute for '$*'"
+        sleep 0.2
+    done
+    show_status
+}
 
-values() { sed -n "s|^ *<$1>\(.*\)</$1>$|\1|p" "$2"; }
+is_lost() { ! vvstat -x >/dev/null; }
+is_well() { vvstat -x >/dev/null; }
+is_mailed() { [ -s $OUT/mail ]; }
+
+# ---- the other machines ----
+
+# The desk is on a cable of its own: the one that is cut leads to the storage server alone.
+desk_up() {
+    ip -batch - <<END
+netns add desk
+link add lan0 type veth peer name d0 netns desk
+addr add 192.168.7.1/24 dev lan0
+link set lan0 up
+END
+    ip -n desk addr add $DESK/24 dev d0
+    ip -n desk link set d0 up
+    printf 'username = maria\npassword = secret\n' >$OUT/maria
+}
+
+# at_desk COMMANDS: what smbclient does at the desk in the share.
+at_desk() {
+    (cd $OUT && nsenter --net=/run/netns/desk smbclient //192.168.7.1/Photos -A $OUT/maria -t 60 -c "$1" >$OUT/log 2>&1) ||
+        broken smbclient "$1"
+}
+
+samba_up() {
+    mkdir -p /etc/samba /var/lib/samba/private /var/cache/samba /var/log/samba /run/samba
+    printf '[global]\n   load printers = no\n   disable spoolss = yes\n   include = /run/remvol/smb-shares.conf\n' >/etc/samba/smb.conf
+    printf '%s\n' nobody:x:65534:65534::/:/bin/false maria:x:1000:1000::/:/bin/false >>/etc/passwd
+    printf '%s\n' nogroup:x:65534: maria:x:1000: >>/etc/group
+    printf 'secret\nsecret\n' | smbpasswd -s -a maria >/dev/null
+    smbd -D
+}
+
+# No mail leaves this machine: what would be sent is kept.
+mail_up() {
+    mkdir -p /etc/remvol
+    echo "MAILADDR admin@example.org" >/etc/remvol/remvol.conf
+    printf '#!/bin/sh\ncat >%s/mail.new && mv %s/mail.new %s/mail\n' $OUT $OUT $OUT >/usr/sbin/sendmail
+    chmod 755 /usr/sbin/sendmail
+}
 
 # ---- the demonstration ----
 
 say
-say "${bold}A remote disk becomes a shared folder$plain"
-note "This is a virtual appliance: Debian's kernel, open-iscsi, and remvol as it was just built."
-note "At the other end of its network cable, at $PORTAL, a storage server offers two disks."
+say "${bold}A remote disk becomes a shared folder, and outlives a cut cable$plain"
+note "This is a virtual appliance: Debian's kernel, open-iscsi, Samba, and remvol as it was just built."
+note "A storage server at $PORTAL is on one network cable, a desk at $DESK on another."
+desk_up
+samba_up &
+mail_up
 target_start
 target_add 1 iqn.2026-01.org.example:backup
 lun_add 1 1 512M
@@ -146,64 +183,64 @@ lun_add 2 1 2G
 echo $((8 << 20)) >/proc/sys/vm/dirty_bytes
 sed -i 's/^\[defaults\]/&\n\tlazy_itable_init = 0/' /etc/mke2fs.conf
 
-headline "Start the initiator"
-run --init
+headline "Start, and see what the storage server offers"
+run remvol --init
+remvol-events >/dev/null 2>&1 &
+events=$!
+remvol-keeper >/dev/null 2>&1 &
+keeper=$!
+run remvol --search -i $PORTAL -p 3260 -o $OUT/targets.xml
+sed -n 's|^ *<name>\(.*\)</name>$|\1|p' $OUT/targets.xml | indent
 
-headline "Which targets does $PORTAL offer?"
-run --search -i $PORTAL -p 3260 -o $OUT/targets.xml
-values name $OUT/targets.xml | while read -r name; do note "$name"; done
+headline "Make the volume \"Photos\" of one of its disks, and watch it come"
+begin
+run remvol --add -n $TARGET -l 1 -i $PORTAL -p 3260 -s Photos -c 0
+watch remvol --connect -n $TARGET
+remember "a remote disk of 2 GiB formatted, mounted, shared" "$(took)"
 
-headline "Which disks does $TARGET hold?"
-run --search_lun -n $TARGET -i $PORTAL -p 3260 -c 0 -o $OUT/luns.xml
-note "LUN $(values lun $OUT/luns.xml), $(values size $OUT/luns.xml) bytes, file system: $(values fstype $OUT/luns.xml)"
+headline "Somebody at the desk saves a photo"
+wait_for 30 smbcontrol smbd ping
+dd if=/dev/urandom of=$OUT/sea.jpg bs=1M count=4 2>/dev/null
+(cd $OUT && sha256sum sea.jpg >sums)
+begin
+at_desk "put sea.jpg"
+remember "a photo of 4 MiB saved from another machine" "$(took)"
+note "$DESK $ smbclient //192.168.7.1/Photos -c 'put sea.jpg'   $(took)"
+note "sha256 $(cut -c 1-32 $OUT/sums)..."
+show vvstat
 
-headline "Add it as the volume \"Photos\""
-run --add -n $TARGET -l 1 -i $PORTAL -p 3260 -s Photos -c 0
-show_status
+headline "The cable to the storage server is cut"
+begin
+cable_cut 0
+watch_until is_lost
+remember "cable cut: the status said so after" "$(took)"
+watch_until is_mailed
+remember "                 and a warning was mailed after" "$(took)"
+note "This would have been mailed:"
+sed -n -e '/^To:/p' -e '/^Subject:/p' -e '/^Volume/p' $OUT/mail | fold -s -w 90 | sed 's/^/   | /'
+show vvstat
 
-headline "Connect: log in, make a partition, format, mount, share"
-note "(the status texts and the progress are read from the configuration tree, as the"
-note "administration pages do it)"
-watch --connect -n $TARGET
-note "$(df -h $FOLDER | tail -n 1)"
+headline "The cable is put back, and nobody touches anything"
+begin
+cable_plug 0
+watch_until is_well
+remember "cable back: healthy again, by itself, after" "$(took)"
 
-headline "Write a file into the folder"
-echo "A picture of the sea, $(date -u +%F)" >$FOLDER/sea.txt
-dd if=/dev/urandom of=$FOLDER/sea.raw bs=1M count=4 2>/dev/null
-(cd $FOLDER && sha256sum sea.*) | tee $OUT/sums | sed 's/^\(................\)[0-9a-f]*/     \1.../'
+headline "The photo, as the desk sees it"
+rm $OUT/sea.jpg
+at_desk "get sea.jpg"
+(cd $OUT && sha256sum -c sums >check) || fail "the photo is not what was saved"
+note "$DESK $ smbclient //192.168.7.1/Photos -c 'get sea.jpg'"
+note "sha256 $(sha256sum $OUT/sea.jpg | cut -c 1-32)...   $(cat $OUT/check)"
+remember "the photo is what was saved, byte for byte" OK
 
-headline "Status"
-run --status
-show_status
-note "used/total bytes: $size"
-
-headline "Disconnect"
-watch --disconnect -n $TARGET
-expect_not "the folder is gone" test -e $FOLDER
-note "$FOLDER is gone, and so is the session: $(iscsiadm -m session 2>&1)"
-
-headline "Connect again and read the file back"
-watch --connect -n $TARGET
-note "$(cat $FOLDER/sea.txt)"
-(cd $FOLDER && sha256sum -c $OUT/sums >$OUT/check) || fail "the files are not what was written"
-sed 's/^/     /' $OUT/check
-
-headline "What the appliance keeps over a restart: /etc/NAS_CFG/vv.xml"
-sed -n '/<iscsi>/,/<\/iscsi>/s/^/    /p' /etc/NAS_CFG/vv.xml
-
-headline "Delete the target with its volume"
-run --del -n $TARGET
-show_status
-note "targets left: $(tree_get /iscsi/initiator/count)"
-
-headline "Stop the initiator"
-started=$(clock)
+kill $events $keeper
+run remvol --del -n $TARGET
 remvol --deinit >$OUT/log 2>&1 || :
-note "$ remvol --deinit"
 
 say
 say "${bold}Summary$plain"
 cat $OUT/summary
 say
-say "  All of it ran for real: $(wc -l <$OUT/summary) commands, a disk of 2 GiB partitioned, formatted and mounted; 2 files"
-say "  written, unmounted, and read back unchanged. The appliance ran $(seconds "$(clock)")."
+say "  All of it ran for real: kernel, initiator, file system and Samba in an emulated machine"
+say "  that ran $(seconds "$(clock)"), the storage server and the desk at the other ends of its cables."

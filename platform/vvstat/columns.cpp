@@ -155,11 +155,12 @@ std::vector<size_t> first_columns(size_t count) {
   return columns;
 }
 
-// The cells that the columns take when nothing is cut.
+// The cells that the columns take when nothing is cut; one with a width is never narrower.
 size_t natural_width(const std::vector<Row>& rows, const std::vector<size_t>& columns, const Layout& layout) {
   size_t sum = 0;
   for (const size_t column : columns) {
-    size_t width = std::string_view(kColumns[column].name).size();
+    size_t width =
+        std::max(std::string_view(kColumns[column].name).size(), static_cast<size_t>(kColumns[column].width));
     for (const Row& row : rows) width = std::max(width, platform::cells(cell(kColumns[column], row, layout)));
     sum += width + 1;
   }

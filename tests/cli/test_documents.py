@@ -1,9 +1,11 @@
 """The documents: their worked examples work, and they know every command, option and status text."""
 
+import json
 import os
 import pathlib
 import re
 import subprocess
+import xml.etree.ElementTree
 
 import pytest
 
@@ -118,6 +120,37 @@ def test_the_check_of_the_monitoring_guide(box, wanted, status, line):
         box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/conn_set": wanted})
     done = box.run(["/check_remvol"], env={"LD_PRELOAD": None})
     assert (done.status, done.lines[0].startswith(line)) == (status, True), done.stdout
+
+
+def recorded():
+    """What the recording of the demonstration shows, without its colours."""
+    header, *events = map(json.loads, (DOCS / "demo.cast").read_text().splitlines())
+    assert header["version"] == 2 and header["width"] > 80 and header["height"] > 24
+    times = [moment for moment, kind, _ in events]
+    assert times[0] == 0 and times == sorted(times) and {kind for _, kind, _ in events} == {"o"}
+    return re.sub(r"\x1b\[[0-9;]*m", "", "".join(text for _, _, text in events)).replace("\r\n", "\n")
+
+
+def test_the_recording_tells_the_whole_story():
+    told = recorded()
+    headlines = [line.removesuffix("$plain\"") for line in (TOP / "lab/demo.sh").read_text().splitlines()
+                 if line.startswith("headline ")]
+    for number, line in enumerate(headlines, 1):
+        assert f"\n{number}. {line.removeprefix('headline ')[1:-1]}\n".replace("\\", "") in told, line
+    for text in ("all 1 healthy", "1 of 1 needs attention", "Subject: lost on", "sea.jpg: OK", "\nlab: demo: ok"):
+        assert text in told
+
+
+def test_the_summary_of_the_readme_is_the_recording_s():
+    summary, = re.findall(r"^```\n(Summary\n.*?)^```", (TOP / "README.md").read_text(), re.M | re.S)
+    assert "\n" + summary in recorded()
+
+
+def test_the_picture_is_the_recording_s_end():
+    rows = ["".join(row.itertext()) for row in xml.etree.ElementTree.parse(DOCS / "demo.svg").getroot()
+            if row.tag.endswith("}text")]
+    lines = [line.strip() for line in recorded().splitlines() if line.strip()]
+    assert len(rows) > 20 and [" ".join(row.split()) for row in rows] == [" ".join(line.split()) for line in lines[-len(rows):]]
 
 
 PAGES = sorted(path.name for path in (DOCS / "man").iterdir())

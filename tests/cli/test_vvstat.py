@@ -496,6 +496,16 @@ def test_the_target_is_shown_where_there_is_room(example):
     assert not vvstat(example, env={"COLUMNS": "100"}).lines[0].endswith(" TARGET")
 
 
+def test_the_target_takes_the_room_of_nothing_else(example):
+    seen = set()
+    for columns in range(70, 131):
+        lines = vvstat(example, env={"COLUMNS": str(columns)}).lines
+        shown = lines[0].endswith(" TARGET")
+        seen.add(shown)
+        assert lines[1].split()[6:] == ["10.9.0.2:3260", *([T1_NAME] if shown else [])], columns
+    assert seen == {False, True}
+
+
 def test_sentences_are_folded_to_the_screen(example):
     change(example, {"conn_state": "0"})
     for line in vvstat(example, env={"COLUMNS": "40"}).stdout.split("\n\n")[1].splitlines():
