@@ -15,8 +15,6 @@ namespace {
 
 using ktree::client::Result;
 
-constexpr char kSocket[] = "/var/run/ktree_sock_vv";
-constexpr char kRoot[] = "/iscsi/initiator";
 constexpr size_t kPathSize = 128;
 
 __attribute__((format(printf, 1, 0))) std::string path_of(const char* format, va_list arguments) {
@@ -54,10 +52,10 @@ std::string content_of(int file) {
 
 }  // namespace
 
-TreeReader::TreeReader() {
+TreeReader::TreeReader(const char* socket, const char* root) {
   const int file = memfd_create("listing", MFD_CLOEXEC);
   ktree::client::Reason reason;
-  const Result result = file < 0 ? Result::failed : ktree::client::list_to(kSocket, kRoot, file, reason);
+  const Result result = file < 0 ? Result::failed : ktree::client::list_to(socket, root, file, reason);
   answered_ = result == Result::done || result == Result::missing;
   if (result == Result::done) take(content_of(file));
   if (file >= 0) close(file);

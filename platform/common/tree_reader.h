@@ -11,11 +11,17 @@ namespace platform {
 
 inline constexpr int kTargets = 8, kLuns = 8;  // slots; those in use are the first ones
 
-// Everything below /iscsi/initiator at one moment, had with one request.
+// The tree of the volumes, and the machine's general one.
+inline constexpr char kVolumesTree[] = "/var/run/ktree_sock_vv", kGeneralTree[] = "/var/run/ktree_sock";
+
+// Everything of a tree below one path at one moment, had with one request.
 class TreeReader {
  public:
-  // Asks the daemon, which has five seconds to answer.
-  TreeReader();
+  // Asks the daemon for the targets and volumes; it has five seconds to answer.
+  TreeReader() : TreeReader(kVolumesTree, "/iscsi/initiator") {}
+
+  // Asks the daemon on `socket` for what is below `root`.
+  TreeReader(const char* socket, const char* root);
 
   // Takes the values from a listing, as `ktreec -t` prints it; a line that is none is left out.
   explicit TreeReader(std::string_view listing);

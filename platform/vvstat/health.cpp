@@ -7,15 +7,6 @@ namespace {
 
 const Problem kNone;
 
-// A name as a word of the shell, since people copy commands.
-std::string quoted(const std::string& name) {
-  constexpr char kPlain[] = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789.:-_";
-  if (!name.empty() && name.find_first_not_of(kPlain) == std::string::npos) return name;
-  std::string word = "'";
-  for (const char byte : name) byte == '\'' ? word += "'\\''" : word += byte;
-  return word += "'";
-}
-
 std::string connect(const Target& target) {
   return connect_command(target.name);
 }
@@ -139,6 +130,14 @@ std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& fa
     for (size_t n = 0; n < target.volumes.size(); ++n) rows.push_back(row_of(target, facts[at], n));
   }
   return rows;
+}
+
+std::string quoted(const std::string& name) {
+  constexpr char kPlain[] = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789.:-_";
+  if (!name.empty() && name.find_first_not_of(kPlain) == std::string::npos) return name;
+  std::string word = "'";
+  for (const char byte : name) byte == '\'' ? word += "'\\''" : word += byte;
+  return word += "'";
 }
 
 std::string connect_command(const std::string& target_name) {

@@ -53,6 +53,9 @@ struct Row {
 // The rows in the order of the tree. They point into `status`.
 std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& facts);
 
+// A name as a word of the shell, since people copy commands.
+std::string quoted(const std::string& name);
+
 // The command that connects the target, to be given to a shell: the name is one word of it, whatever it
 // holds.
 std::string connect_command(const std::string& target_name);

@@ -85,7 +85,7 @@ def test_the_manual_page_has_every_command_and_option_of_the_tool():
         assert re.search(rf"^\.[BI]\w* .*(?<![\w-]){word}(?![\w-])", page, re.M), word
 
 
-@pytest.mark.parametrize("program, page", [("vvstat", "vvstat.1"), ("ktree", "ktree.8"), ("ktreec", "ktreec.1"),
+@pytest.mark.parametrize("program, page", [("vv", "vv.8"), ("vvstat", "vvstat.1"), ("ktree", "ktree.8"), ("ktreec", "ktreec.1"),
                                            ("remvol-events", "remvol-events.8"), ("remvol-keeper", "remvol-keeper.8"),
                                            ("remvol-notify", "remvol-notify.8")])
 def test_a_manual_page_has_every_option_of_its_program(program, page):

@@ -7,6 +7,8 @@ import shlex
 
 import pytest
 
+from harness.tree import Tree
+
 PACKAGING = pathlib.Path(__file__).resolve().parents[2] / "packaging"
 SMB_CONF = "/etc/samba/smb.conf"
 BLOCK = """
@@ -357,9 +359,35 @@ def test_completion(complete, line, offered):
     assert complete(line) == offered
 
 
+@pytest.mark.parametrize("line, offered", [
+    ("vv ", ["discover", "luns", "add", "connect", "disconnect", "format", "delete", "rename-portal", "password",
+             "status", "--help", "--version"]),
+    ("vv format ", ["Two\\ words", "q\\'uote"]),
+    ("vv format q --d", ["--destroy-data"]),
+    ("vv di", ["discover", "disconnect"]),
+    ("vv connect ", ["Two\\ words", "iqn.t1", "iqn.t2", "q\\'uote"]),
+    ("vv connect Tw", ["Two\\ words"]),
+    ("vv connect --", ["--json", "--help", "--version"]),
+    ("vv add Photos --p", ["--portal", "--password-file"]),
+    ("vv add Photos --portal ", ["10.9.0.2"]),
+    ("vv add Photos --portal 10.9.0.2 --p", ["--password-file"]),
+    ("vv add Photos --target ", ["iqn.found", "iqn.t1", "iqn.t2"]),
+    ("vv add Photos --lun ", []),
+    ("vv add Ph", []),
+    ("vv luns iqn.f", ["iqn.found"]),
+    ("vv discover ", ["10.9.0.2"]),
+    ("vv status q", ["q\\'uote"]),
+    ("vv nothing --", []),
+])
+def test_completion_of_vv(complete, line, offered):
+    Tree(complete.box, "/var/run/ktree_sock").start().set("/temp/vv_search/id:1/name", "iqn.found")
+    assert complete(line) == offered
+
+
 def test_completion_without_the_tree(complete):
     complete.box.tree.stop()
     assert complete("remvol --connect -n ") == []
+    assert complete("vv connect ") == []
 
 
 # --- the installation ---

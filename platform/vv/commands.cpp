@@ -1,0 +1,31 @@
+#include "commands.h"
+
+#include "search_commands.h"
+#include "target_commands.h"
+#include "volume_commands.h"
+
+namespace vv {
+namespace {
+
+constexpr Command kCommands[] = {
+    {"discover", "PORTAL", 0, 0, discover, "lists the targets that a portal offers"},
+    {"luns", "TARGET", kPortal | kUser, 0, luns, "lists a target's LUNs; --portal"},
+    {"add", "SHARE", kPortal | kTarget | kLun | kUser, kLun, add,
+     "makes a LUN a share; --portal, --target, --lun"},
+    {"connect", "SHARE|TARGET", 0, 0, connect, "logs in, and mounts the target's volumes"},
+    {"disconnect", "SHARE|TARGET", kYes, 0, disconnect, "unmounts the target's volumes, and logs out"},
+    {"format", "SHARE", kDestroyData | kYes, 0, format, "makes a new file system on the share's LUN"},
+    {"delete", "SHARE|TARGET", kYes, 0, remove, "ends its use here; the data stays on the storage server"},
+    {"rename-portal", "SHARE|TARGET", kPortal, kPortal, rename_portal, "the target is at another portal now"},
+    {"password", "SHARE|TARGET", kUser | kNoPassword | kYes, 0, password,
+     "changes the user and the password of the target"},
+    {"status", nullptr, 0, 0, status, "how the volumes are, and what is wrong: vvstat(1)"},
+};
+
+}  // namespace
+
+std::span<const Command> commands() {
+  return kCommands;
+}
+
+}  // namespace vv

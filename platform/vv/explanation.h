@@ -1,0 +1,40 @@
+// Why something failed, and what a person does about it.
+#ifndef PLATFORM_VV_EXPLANATION_H
+#define PLATFORM_VV_EXPLANATION_H
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "health.h"
+
+namespace vv {
+
+struct Failure {
+  std::string step;                  // that failed, such as "login"
+  std::string why;                   // a sentence without its full stop
+  std::string advice;                // what to try; empty when nothing is known
+  std::vector<std::string> details;  // lines of the tool and of the kernel, as they came
+};
+
+// The steps that can fail, as they are named.
+inline constexpr char kDiscoveryStep[] = "discovery", kLoginStep[] = "login", kLunsStep[] = "LUN search",
+                      kStoreStep[] = "settings", kDiskStep[] = "disk", kFormatStep[] = "format",
+                      kMountStep[] = "mount", kUnmountStep[] = "unmount", kLogoutStep[] = "logout",
+                      kToolStep[] = "start of the tool";
+
+// What is known of the failure from what the tool and its commands printed: their last word on it is in
+// `why`, or it is empty when nothing in it tells.
+Failure explain_output(std::string_view output, const char* step);
+
+// Why a volume is not as it should be after the tool was to bring it up, from the tree, the kernel and what
+// the tool printed.
+Failure explain_volume(const vvstat::Row& row, std::string_view output);
+
+// Lines of the tool's own log, without their prefix, that tell of a failure, and those of the commands that
+// it ran.
+std::vector<std::string> telling_lines(std::string_view output);
+
+}  // namespace vv
+
+#endif

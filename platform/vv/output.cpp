@@ -1,0 +1,122 @@
+#include "output.h"
+
+#include <libsmartcols.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+
+#include "list.h"
+#include "options.h"
+#include "utf8.h"
+
+namespace vv {
+namespace {
+
+struct TableEnd {
+  void operator()(libscols_table* table) const { scols_unref_table(table); }
+};
+using Scols = std::unique_ptr<libscols_table, TableEnd>;
+
+bool add_column(libscols_table* table, const Column& column) {
+  libscols_column* added = scols_table_new_column(table, column.name, 0, column.number ? SCOLS_FL_RIGHT : 0);
+  return added != nullptr &&
+         scols_column_set_json_type(added, column.number ? SCOLS_JSON_NUMBER : SCOLS_JSON_STRING) == 0;
+}
+
+bool add_row(libscols_table* table, const std::vector<std::string>& row) {
+  libscols_line* line = scols_table_new_line(table, nullptr);
+  if (line == nullptr) return false;
+  for (size_t at = 0; at < row.size(); ++at) {
+    if (row[at].empty()) continue;
+    if (scols_line_set_data(line, at, platform::printable(row[at]).c_str()) != 0) return false;
+  }
+  return true;
+}
+
+Scols filled(const Table& table) {
+  Scols made(scols_new_table());
+  bool good = made != nullptr && scols_table_set_name(made.get(), table.name) == 0;
+  for (const Column& column : table.columns) good = good && add_column(made.get(), column);
+  for (const auto& row : table.rows) good = good && add_row(made.get(), row);
+  return good ? std::move(made) : nullptr;
+}
+
+std::string joined(const std::vector<std::string>& lines) {
+  std::string text;
+  for (const std::string& line : lines) append(text, line, "; ");
+  return text;
+}
+
+const char* word_of(int status) {
+  if (status == kDone) return "done";
+  return status == kRefused ? "refused" : "failed";
+}
+
+std::string as_json(const Outcome& outcome) {
+  const Failure& failure = outcome.failure;
+  return shown({"outcomes",
+                {{"command"},
+                 {"share"},
+                 {"target"},
+                 {"outcome"},
+                 {"status", true},
+                 {"message"},
+                 {"step"},
+                 {"why"},
+                 {"advice"},
+                 {"details"}},
+                {{outcome.command, outcome.share, outcome.target, word_of(outcome.status),
+                  std::to_string(outcome.status), outcome.message, failure.step, failure.why, failure.advice,
+                  joined(failure.details)}}},
+               true);
+}
+
+void tell_failure(const Outcome& outcome) {
+  const Failure& failure = outcome.failure;
+  fprintf(stderr, "vv: %s\n", outcome.message.c_str());
+  if (!failure.step.empty()) fprintf(stderr, "  step: %s\n", failure.step.c_str());
+  if (!failure.why.empty()) fprintf(stderr, "  why:  %s\n", failure.why.c_str());
+  if (!failure.advice.empty()) fprintf(stderr, "  try:  %s\n", failure.advice.c_str());
+  for (const std::string& detail : failure.details) fprintf(stderr, "  said: %s\n", detail.c_str());
+}
+
+}  // namespace
+
+std::string shown(const Table& table, bool json) {
+  const Scols made = filled(table);
+  if (made == nullptr) return {};
+  scols_table_enable_noencoding(made.get(), 1);  // add_row() has done it
+  scols_table_enable_json(made.get(), json);
+  scols_table_set_termforce(made.get(), SCOLS_TERMFORCE_NEVER);
+  char* text = nullptr;
+  if (scols_print_table_to_string(made.get(), &text) != 0) return {};
+  const std::unique_ptr<char, decltype(&free)> owned(text, free);
+  // The library ends all lines but the last one.
+  return std::string(text).append("\n");
+}
+
+void put(const std::string& text) {
+  fwrite(text.data(), 1, text.size(), stdout);
+}
+
+int tell(const Outcome& outcome, bool json) {
+  if (json) {
+    put(as_json(outcome));
+  } else if (outcome.status == kDone) {
+    put(outcome.message + "\n");
+  } else {
+    tell_failure(outcome);
+  }
+  return finish(outcome.status);
+}
+
+int finish(int status) {
+  if (ferror(stdout) == 0 && fflush(stdout) == 0) return status;
+  fprintf(stderr, "vv: write error: %s\n", strerror(errno));
+  return kFailed;
+}
+
+}  // namespace vv

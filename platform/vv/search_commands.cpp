@@ -1,0 +1,122 @@
+#include "search_commands.h"
+
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "columns.h"
+#include "job.h"
+#include "list.h"
+#include "searches.h"
+#include "secret.h"
+#include "utf8.h"
+
+namespace vv {
+namespace {
+
+using vvstat::Row;
+
+// The shares of the target's volumes.
+std::string shares_on(const Look& look, const std::string& name) {
+  const vvstat::Target* target = look.target(name);
+  std::string shares;
+  if (target == nullptr) return shares;
+  for (const Row* row : look.volumes_of(*target)) append(shares, row->volume->share);
+  return shares;
+}
+
+std::string size_of(const FoundLun& lun, bool bytes) {
+  return bytes ? std::to_string(lun.size) : vvstat::readable_size(lun.size);
+}
+
+Table table_of(const Look& look, const std::string& target, const FoundLuns& found, bool json) {
+  Table table{"luns", {{"LUN", true}, {"SIZE", true}, {"FSTYPE"}, {"SHARE"}}, {}};
+  for (const FoundLun& lun : found.luns) {
+    const Row* row = look.lun(target, lun.number);
+    table.rows.push_back({std::to_string(lun.number), size_of(lun, json), lun.file_system,
+                          row != nullptr ? row->volume->share : ""});
+  }
+  return table;
+}
+
+bool general_tree_answers(Job& job, const SearchTurn& turn) {
+  return turn.reachable() || job.refuse(kUnreachable, why_unreachable("general", "remvol-general-tree"));
+}
+
+// Fills the portal that the options name, or that is stored of the target.
+bool find_portal(Job& job, const std::string& target_name, Portal& portal) {
+  std::string why;
+  if (!job.options.portal.empty())
+    return read_portal(job.options.portal, portal, why) || job.refuse(kUsage, platform::printable(why));
+  const vvstat::Target* target = job.before.target(target_name);
+  if (target == nullptr) return job.refuse(kUsage, "this target is not configured here; it needs --portal");
+  portal = stored_portal(target->address, target->port);
+  return true;
+}
+
+int tell_luns_failed(Job& job, const FoundLuns& found, const ToolRun& run) {
+  Failure failure = explain_run(run, found.login_failed ? kLoginStep : kLunsStep);
+  if (found.login_failed && job.options.user.empty() && failure.advice.empty())
+    failure.advice = "where the target asks for a password, --user NAME";
+  return job.failed("the target's LUNs cannot be listed", failure);
+}
+
+}  // namespace
+
+bool discover_targets(Job& job, const Portal& portal, std::vector<std::string>& names) {
+  const SearchTurn turn;
+  if (!general_tree_answers(job, turn)) return false;
+  const ToolRun run = job.run(search_arguments(portal), "");
+  const FoundTargets found = read_found_targets();
+  if (!run.succeeded() || !found.done)
+    return job.refuse(kFailed, "the portal " + portal.text() + " cannot be asked for its targets",
+                      explain_run(run, kDiscoveryStep));
+  names = found.names;
+  return true;
+}
+
+int discover(const Options& options) {
+  Job job(options);
+  Portal portal;
+  std::string why;
+  std::vector<std::string> names;
+  if (!read_portal(options.name, portal, why)) {
+    job.refuse(kUsage, platform::printable(why));
+    return job.end();
+  }
+  if (!discover_targets(job, portal, names)) return job.end();
+  Table table{"targets", {{"TARGET"}, {"SHARES"}}, {}};
+  for (const std::string& name : names) table.rows.push_back({name, shares_on(job.before, name)});
+  if (names.empty() && !options.json) return job.done("the portal offers no target to this machine");
+  put(shown(table, options.json));
+  return finish(kDone);
+}
+
+int luns(const Options& options) {
+  Job job(options);
+  Portal portal;
+  Credentials credentials;
+  if (!find_portal(job, options.name, portal)) return job.end();
+  if (!read_credentials(options, credentials)) return kUsage;
+  if (credentials.user.empty()) credentials = stored_credentials(options.name);
+  const SearchTurn turn;
+  if (!general_tree_answers(job, turn)) return job.end();
+  const ToolRun run = job.run(search_lun_arguments(options.name, portal, credentials), "");
+  const FoundLuns found = read_found_luns(options.name);
+  if (!run.succeeded() || !found.done) return tell_luns_failed(job, found, run);
+  if (found.luns.empty() && !options.json) return job.done("the target offers no LUN to this machine");
+  put(shown(table_of(job.before, options.name, found, options.json), options.json));
+  return finish(kDone);
+}
+
+int status(const Options& options) {
+  char name[] = "vvstat";
+  options.rest[-1] = name;
+  execvp(name, options.rest - 1);
+  fprintf(stderr, "vv: %s: %s\n", name, strerror(errno));
+  return kFailed;
+}
+
+}  // namespace vv

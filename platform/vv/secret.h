@@ -1,0 +1,18 @@
+// Passwords: from a file, from standard input, or from a person.
+#ifndef PLATFORM_VV_SECRET_H
+#define PLATFORM_VV_SECRET_H
+
+#include <string>
+
+#include "options.h"
+#include "tool.h"
+
+namespace vv {
+
+// Fills the credentials with the user of the options and the password that is asked for in the way that they
+// say; leaves them alone when there is no user. Returns false after saying what is wrong.
+bool read_credentials(const Options& options, Credentials& credentials);
+
+}  // namespace vv
+
+#endif

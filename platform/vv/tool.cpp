@@ -1,0 +1,136 @@
+#include "tool.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/mman.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstring>
+
+namespace vv {
+namespace {
+
+constexpr char kTool[] = "remvol";
+constexpr int kLookEvery = 200;  // milliseconds
+
+// User and secret count only behind "-c 1".
+Arguments with_credentials(Arguments arguments, const Credentials& credentials) {
+  const bool any = !credentials.user.empty();
+  arguments.insert(arguments.end(), {"-c", any ? "1" : "0"});
+  if (any) arguments.insert(arguments.end(), {"-U", credentials.user, "-P", credentials.secret});
+  return arguments;
+}
+
+Arguments with_portal(Arguments arguments, const Portal& portal) {
+  arguments.insert(arguments.end(), {"-i", portal.address, "-p", std::to_string(portal.port)});
+  return arguments;
+}
+
+// What the tool prints goes into a memory file: unlike a pipe it has room for everything, and the tool may go
+// on writing to it when the reader is gone.
+pid_t start(const Arguments& arguments, int output) {
+  std::vector<char*> words{const_cast<char*>(kTool)};
+  for (const std::string& argument : arguments) words.push_back(const_cast<char*>(argument.c_str()));
+  words.push_back(nullptr);
+  posix_spawn_file_actions_t files;
+  posix_spawn_file_actions_init(&files);
+  posix_spawn_file_actions_addopen(&files, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+  posix_spawn_file_actions_adddup2(&files, output, STDOUT_FILENO);
+  posix_spawn_file_actions_adddup2(&files, output, STDERR_FILENO);
+  posix_spawnattr_t attributes;
+  sigset_t usual;
+  sigemptyset(&usual);
+  sigaddset(&usual, SIGINT);
+  sigaddset(&usual, SIGQUIT);
+  posix_spawnattr_init(&attributes);
+  posix_spawnattr_setsigdefault(&attributes, &usual);
+  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
+  pid_t process = -1;
+  if (posix_spawnp(&process, kTool, &files, &attributes, words.data(), environ) != 0) process = -1;
+  posix_spawnattr_destroy(&attributes);
+  posix_spawn_file_actions_destroy(&files);
+  return process;
+}
+
+int wait_for(pid_t process, const std::function<void()>& look) {
+  const auto handle = static_cast<int>(syscall(SYS_pidfd_open, process, 0));
+  pollfd ended{handle, POLLIN, 0};
+  while (handle >= 0 && poll(&ended, 1, kLookEvery) == 0) look();
+  if (handle >= 0) close(handle);
+  int status = 0;
+  while (waitpid(process, &status, 0) < 0 && errno == EINTR) {
+  }
+  look();
+  return status;
+}
+
+std::string content_of(int file) {
+  std::string text;
+  char buffer[4096];
+  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
+    text.append(buffer, static_cast<size_t>(n));
+  return text;
+}
+
+}  // namespace
+
+Credentials::~Credentials() {
+  explicit_bzero(secret.data(), secret.size());
+}
+
+Arguments search_arguments(const Portal& portal) {
+  return with_portal({"--search"}, portal);
+}
+
+Arguments search_lun_arguments(const std::string& target, const Portal& portal,
+                               const Credentials& credentials) {
+  return with_credentials(with_portal({"--search_lun", "-n", target}, portal), credentials);
+}
+
+Arguments add_arguments(const std::string& target, int lun, const std::string& share, const Portal& portal,
+                        const Credentials& credentials) {
+  Arguments arguments = with_portal({"--add", "-n", target, "-l", std::to_string(lun)}, portal);
+  arguments.insert(arguments.end(), {"-s", share});
+  return with_credentials(std::move(arguments), credentials);
+}
+
+Arguments modify_arguments(const std::string& target, const Credentials& credentials) {
+  return with_credentials({"--modify", "-n", target}, credentials);
+}
+
+Arguments modify_address_arguments(const std::string& target, const Portal& portal) {
+  return with_portal({"--modify_address", "-n", target}, portal);
+}
+
+Arguments target_arguments(const char* command, const std::string& target) {
+  return {command, "-n", target};
+}
+
+Arguments lun_arguments(const char* command, const std::string& target, int lun) {
+  return {command, "-n", target, "-l", std::to_string(lun)};
+}
+
+ToolRun run_tool(const Arguments& arguments, const std::function<void()>& look) {
+  ToolRun run;
+  const int output = memfd_create("output", MFD_CLOEXEC);
+  if (output < 0) return run;
+  const sighandler_t interrupt = signal(SIGINT, SIG_IGN), quit = signal(SIGQUIT, SIG_IGN);
+  const pid_t process = start(arguments, output);
+  if (process > 0) {
+    const int status = wait_for(process, look);
+    run.started = true;
+    run.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    run.signal = WIFSIGNALED(status) ? WTERMSIG(status) : 0;
+  }
+  signal(SIGINT, interrupt);
+  signal(SIGQUIT, quit);
+  run.output = content_of(output);
+  close(output);
+  return run;
+}
+
+}  // namespace vv

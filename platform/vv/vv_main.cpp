@@ -1,0 +1,14 @@
+// vv: the front end for a person at a terminal. It finds what is meant, runs the tool, shows how it gets on,
+// and explains what went wrong.
+#include <sys/prctl.h>
+
+#include "columns.h"
+#include "options.h"
+
+int main(int argc, char** argv) {
+  prctl(PR_SET_DUMPABLE, 0);  // a core would hold the passwords
+  vvstat::use_utf8();
+  vv::Options options;
+  const int status = vv::read_options(argc, argv, options);
+  return status >= 0 ? status : options.command->run(options);
+}
