@@ -15,6 +15,7 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "volume/mount.h"
+#include "volume/mount_table.h"
 
 namespace remvol {
 
@@ -185,7 +186,8 @@ int check_mnt_dev_degrade_to_ro(const char* device, const char* mount_path) {
     LOG(0, "failed to get proc mounts access right for %s", device);
     return -2;
   }
-  if (now == kMountedRo || (has_path && sys_mount_point(mount_path) != 0 && refuses_writes(mount_path))) {
+  if (now == kMountedRo || (has_path && sys_mount_point(mount_path) != 0 &&
+                            (has_lost_disk(mount_path) || refuses_writes(mount_path)))) {
     LOG(2, "the access right is degrade to ro for dev %s", device);
     return 1;
   }

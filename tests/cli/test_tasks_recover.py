@@ -54,6 +54,15 @@ def degrade(box, share):
     assert done.status == 0, done.stderr
 
 
+def mount_a_disk(site, box, share):
+    """Has the share on a disk of its own, with a file system that takes files."""
+    box.path("/dev/sdb1").unlink(missing_ok=True)
+    box.disk("sdb1", 8 << 20)
+    done = box.run(["sh", "-c", f"PATH=/usr/sbin:/usr/bin:/sbin:/bin; umount /mnt/VV/{share} && mkfs.ext4 -q /dev/sdb1 && "
+                                f"mount /dev/sdb1 /mnt/VV/{share}"], env={"LD_PRELOAD": None})
+    assert done.status == 0, done.stderr
+
+
 class TestReopen:
     @pytest.mark.parametrize("state", ["0", "1", "2", "4"])
     def test_a_target_that_is_to_be_connected_is_marked(self, site, box, state):
@@ -82,6 +91,23 @@ class TestReopen:
         assert done.status == 255
         assert messages(done)[-2:] == [f"Can not find: {name}", "task_oiscsi_evt_reopen failed"]
         assert settings(box) == before
+
+
+class TestLostDisk:
+    """The session was closed under the volume: nothing shows it but that the disk is gone from sysfs. A write need not
+    fail as such: ext4 that cannot read its bitmaps says that it is full."""
+
+    def test_its_volume_is_brought_up_anew(self, lost, box):
+        mount_a_disk(lost, box, "a")
+        done = box.run(["/bin/mount", "-t", "tmpfs", "none", "/sys/dev/block"], env={"LD_PRELOAD": None})
+        assert done.status == 0, done.stderr
+        assert READ_ONLY % "sdb" in messages(recover(box))
+        assert_order(box.shell(), 'umount -f "/mnt/VV/a"', LOGOUT)
+
+    def test_a_volume_with_its_disk_stays(self, lost, box):
+        mount_a_disk(lost, box, "a")
+        assert READ_ONLY % "sdb" not in messages(recover(box))
+        assert not any("umount" in line for line in box.shell())
 
 
 class TestSurvivedVolumes:
