@@ -132,6 +132,15 @@ void put_into_environment(const Event& event) {
   setenv("REMVOL_MESSAGE", event.message.c_str(), 1);
 }
 
+bool run_programs(const Event& event, const Config& config) {
+  put_into_environment(event);
+  bool good = true;
+  if (!config.program.empty())
+    good = run({config.program, name_of(event.kind), event.target, event.share}) && good;
+  for (const std::string& program : programs()) good = run({program}) && good;
+  return good;
+}
+
 std::string rest_of(std::string_view line) {
   const size_t first = line.find_first_not_of(" \t");
   const size_t last = line.find_last_not_of(" \t\r");
@@ -163,13 +172,13 @@ Config parse_config(std::string_view text) {
   return config;
 }
 
-bool deliver(const Event& event, const Config& config) {
-  bool good = log_event(event);
-  put_into_environment(event);
-  if (!config.program.empty())
-    good = run({config.program, name_of(event.kind), event.target, event.share}) && good;
-  for (const std::string& program : programs()) good = run({program}) && good;
-  if (!config.mail_address.empty()) good = mail_event(event, config) && good;
+bool deliver(const std::vector<Event>& events, const Config& config) {
+  bool good = true;
+  for (const Event& event : events) good = log_event(event) && good;
+  if (!config.mail_address.empty()) {
+    for (const Event& event : events) good = mail_event(event, config) && good;
+  }
+  for (const Event& event : events) good = run_programs(event, config) && good;
   return good;
 }
 

@@ -4,6 +4,7 @@
 
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "history.h"
 
@@ -19,11 +20,11 @@ struct Config {
 // Reads the text of the file; a line that is not known is named on standard error.
 Config parse_config(std::string_view text);
 
-// Writes the event to the journal, with its priority, a MESSAGE_ID that the catalog explains, EVENT=, TARGET=
-// and SHARE=; runs the program of the configuration and those in /etc/remvol/events.d; mails it by
-// sendmail(8). Each program that it runs is ended after 30 seconds. Returns false when something of it
-// failed, which is said on standard error.
-bool deliver(const Event& event, const Config& config);
+// Writes each event to the journal, with its priority, a MESSAGE_ID that the catalog explains, EVENT=,
+// TARGET= and SHARE=; mails each by sendmail(8); then, for each, runs the program of the configuration and
+// those in /etc/remvol/events.d: one that hangs holds no message up. Each program that it runs is ended after
+// 30 seconds. Returns false when something of it failed, which is said on standard error.
+bool deliver(const std::vector<Event>& events, const Config& config);
 
 }  // namespace notify
 

@@ -54,10 +54,7 @@ bool look(const vvstat::Status& status, std::vector<Event>& events) {
 }
 
 int tell(const std::vector<Event>& events) {
-  const Config config = read_config();
-  bool good = true;
-  for (const Event& event : events) good = deliver(event, config) && good;
-  return good ? 0 : kFailed;
+  return deliver(events, read_config()) ? 0 : kFailed;
 }
 
 int look_and_tell() {

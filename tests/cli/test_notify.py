@@ -194,6 +194,17 @@ def test_mail(example):  # noqa: F811
     assert lines[lines.index("") + 1] == "Volume Backup: is not mounted; mount it again"
 
 
+def test_a_program_holds_no_mail_up(example):  # noqa: F811
+    """Of several events at once all are mailed before the first program runs, which may take its 30 seconds."""
+    program(example, "/usr/sbin/sendmail", "cat >/dev/null; echo mail >>/order")
+    program(example, f"{PROGRAMS}/1", "echo program >>/order")
+    example.write(CONFIG, "MAILADDR root\nPROGRAM /etc/remvol/events.d/1\n")
+    notify(example)
+    lose(example)
+    assert notify(example).status == 0
+    assert example.path("/order").read_text().split() == ["mail", "mail", *["program"] * 4]
+
+
 def test_a_machine_without_mail_says_so(example):  # noqa: F811
     example.run(["rm", "-f", "/usr/sbin/sendmail"])
     example.write(CONFIG, "MAILADDR root\n")
