@@ -46,6 +46,7 @@ target $name
 ip 10.9.0.2
 port 3260
 conn_set 1
+lun/count 1
 lun/id:1/lun 1
 lun/id:1/share share$n
 lun/id:1/enable 1

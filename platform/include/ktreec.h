@@ -24,7 +24,8 @@ int ktreec_set(const char* socket, unsigned flags, const char* path, const char*
 
 /* Reads the value at `path` into `buffer` of `size` bytes, always NUL-terminated when size > 0. Returns the
  * bytes put there without the NUL (at most size - 1), 0 for an empty value, -1 when the node is missing, has
- * no value, or on any error (the buffer then holds the empty text). */
+ * no value, or on any error (the buffer then holds the empty text). errno is ENODATA when the daemon has
+ * answered that there is no such node or value, and nothing else makes it that. */
 int ktreec_get_wb(const char* socket, unsigned flags, const char* path, char* buffer, size_t size);
 
 /* Deletes the node at `path` and all below it; the later children of the same name move down by one. Returns

@@ -78,7 +78,7 @@ bool dump_settings(const Command& command, Caller caller) {
 // there was no socket before the command, nothing is known of that.
 bool was_change_lost(const TreeInstance& tree, Caller caller) {
   if (tree.inode == 0) return false;
-  if (is_same_tree(tree) && tree_answers(result_key())) return false;
+  if (tree == tree_instance() && tree_answers(result_key())) return false;
   LOG_AT(caller, 0, "the configuration tree was started anew meanwhile, what was changed may be lost");
   return true;
 }

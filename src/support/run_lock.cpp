@@ -2,10 +2,12 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdint>
+#include <cstdio>
 
 #include "support/files.h"
 #include "support/text.h"
@@ -82,6 +84,15 @@ LockTry RunLock::take_again(const char* name, LockMode mode) {
 // Unlocked by name, not by closing alone: a child that was forked meanwhile shares the open file.
 void RunLock::pause() {
   if (fd_ >= 0) flock(fd_, LOCK_UN);
+}
+
+long long RunLock::changes() const {
+  struct stat info {};
+  return fd_ >= 0 && fstat(fd_, &info) == 0 ? info.st_size : 0;
+}
+
+void RunLock::count_change() {
+  if (fd_ >= 0 && ftruncate(fd_, changes() + 1) != 0) perror(kRunDir);
 }
 
 void RunLock::release() {

@@ -51,6 +51,14 @@ class RunLock {
   // Lets the lock go, and keeps its file open.
   void pause();
 
+  // For what a lock keeps in place: how often count_change() was called, by whatever run, since the lock's
+  // file was made. With the lock held, and not changed since, all that was read under it before is still so.
+  // The file's length is the number, since a length takes no room on a full disk.
+  [[nodiscard]] long long changes() const;
+
+  // With the lock held alone: what it keeps in place is about to change.
+  void count_change();
+
   void release();
 
  private:

@@ -40,20 +40,19 @@ bool tree_answers(const char* key) {
   return ktreec_get_wb(main_socket, 0, key, value, sizeof value) >= 0 || tree_takes_connections();
 }
 
+bool TreeInstance::operator==(const TreeInstance& other) const {
+  return inode == other.inode && made.tv_sec == other.made.tv_sec && made.tv_nsec == other.made.tv_nsec;
+}
+
 TreeInstance tree_instance() {
   struct stat info;
   if (stat(main_socket, &info) != 0) return {};
   return {info.st_ino, info.st_mtim};
 }
 
-bool is_same_tree(const TreeInstance& before) {
-  const TreeInstance now = tree_instance();
-  return now.inode == before.inode && now.made.tv_sec == before.made.tv_sec &&
-         now.made.tv_nsec == before.made.tv_nsec;
-}
-
 int tree_get(const char* key, char* buffer, size_t size) {
   memset(buffer, 0, size);
+  errno = 0;
   return ktreec_get_wb(main_socket, 0, key, buffer, size);
 }
 
@@ -66,8 +65,13 @@ bool tree_present(const char* key) {
   return tree_read(key, value);
 }
 
+bool tree_present_surely(const char* key) {
+  return tree_present(key) || (errno != ENODATA && tree_present(key));
+}
+
 bool tree_is_missing(const char* key, const char* present) {
-  return !tree_present(key) && tree_present(present) && !tree_present(key);
+  if (tree_present(key)) return false;
+  return errno == ENODATA || (tree_present(present) && !tree_present(key));
 }
 
 bool tree_is_loaded() {

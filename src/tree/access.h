@@ -22,21 +22,21 @@ inline constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
 // Returns whether a daemon serves the tree: it has `key`, also with an empty value, or takes a connection.
 [[nodiscard]] bool tree_answers(const char* key);
 
-// The tree's daemon by its socket: another one, or one that was started anew, has another socket.
+// The tree's daemon by its socket: another one, or one that was started anew, has another socket. That one
+// has loaded the settings file, and knows nothing of what was stored since.
 struct TreeInstance {
   ino_t inode = 0;
   timespec made = {};
+
+  [[nodiscard]] bool operator==(const TreeInstance& other) const;
 };
 
 // Returns which daemon answers now; all zero when there is no socket.
 [[nodiscard]] TreeInstance tree_instance();
 
-// Returns whether the daemon that was there at `before` is there still. One that was started anew has loaded
-// the settings file, and knows nothing of what was stored since.
-[[nodiscard]] bool is_same_tree(const TreeInstance& before);
-
 // Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns what the read gives: the number
-// of bytes, -1 for a key that is missing.
+// of bytes, -1 for a key that is missing; errno is ENODATA when the tree has said so, and it is no read that
+// failed (a tree's library of another platform may not tell).
 int tree_get(const char* key, char* buffer, size_t size);
 
 // The same. Returns whether the key is present.
@@ -50,8 +50,12 @@ template <size_t N>
 // Returns whether `key` is present.
 [[nodiscard]] bool tree_present(const char* key);
 
-// Returns whether `key` is missing for certain. A read that failed looks like a missing key: it counts when
-// it is so twice, and `present`, a key that is there, can be read in between.
+// The same for a key that counts, or seems free and is to be written to: where a read may have failed, it is
+// looked at once more.
+[[nodiscard]] bool tree_present_surely(const char* key);
+
+// Returns whether `key` is missing for certain: the tree has said so, or it cannot be read twice, and
+// `present`, a key that is there, can be read in between.
 [[nodiscard]] bool tree_is_missing(const char* key, const char* present);
 
 // Returns whether the tree answers and was loaded: a read does not tell a missing key from a tree that is not

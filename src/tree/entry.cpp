@@ -71,16 +71,11 @@ int count_luns_at(int n) {
   return count;
 }
 
-// A read that failed looks like a key that is not there. What is counted, or seems free and is to be written
-// to, is looked at once more.
-bool is_present(const char* key) {
-  return tree_present(key) || tree_present(key);
-}
-
 // Counts the LUNs of the slot `n` as it is now, also those behind an empty one.
 int count_all_luns_at(int n) {
   int count = 0;
-  for (int m = 1; m <= kMaxLunsPerTarget; m++) count += is_present(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
+  for (int m = 1; m <= kMaxLunsPerTarget; m++)
+    count += tree_present_surely(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
   return count;
 }
 
@@ -228,7 +223,7 @@ int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int 
 int ktree_update_current_targetcnt() {
   const SlotsHeld held;
   int count = 0;
-  for (int n = 1; n <= kMaxTargets; n++) count += is_present(KeyText(key::kTargetName, n)) ? 1 : 0;
+  for (int n = 1; n <= kMaxTargets; n++) count += tree_present_surely(KeyText(key::kTargetName, n)) ? 1 : 0;
   return tree_write_with_tries(key::kTargetCount, NumberText("%d", count));
 }
 
@@ -360,6 +355,7 @@ int ktree_add_lun_entry(TargetEntry* entry) {
   const int m = ktree_get_free_lun_dbidx(n);
   if (m <= 0 || !may_take_lun_slot(n, m, entry->lun)) return kFailed;
   entry->lun_db_idx = m;
+  slots_move();
   remember_lun(n, m, entry->lun);
   const Caller here;
   const bool stored = set_value(KeyText(key::kLunNumber, n, m), entry->lun, here) &&
@@ -386,6 +382,7 @@ int ktree_add_entry(TargetEntry* entry) {
   }
   if (!known) n = slot_to_take(n, entry->target_name);
   if (n < 1) return kFailed;
+  slots_move();
   entry->db_idx = n;
   remember_target(n, entry->target_name);
   const Caller here;

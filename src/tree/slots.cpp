@@ -1,7 +1,9 @@
 #include "tree/slots.h"
 
+#include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <ctime>
 
 #include "support/run_lock.h"
 #include "support/text.h"
@@ -31,29 +33,61 @@ KnownSlot known_slots[kMaxTargets + 1];
 RunLock slots_lock;  // open for as long as the run lives
 int holders = 0;
 bool are_locked = false;  // false also while they are held without a lock, since none can be had
+bool are_moved = false;   // this run stores or deletes a slot since they are held
 
-// What was read from a target slot since the slots are held; empty: nothing.
+// What the tree has answered for a value that defines a slot.
+template <size_t N>
+struct Seen {
+  enum { kNothing, kMissing, kValue } what;
+  char value[N];
+};
+
+// What was read from a target slot since then nobody has changed slots.
 struct SeenSlot {
-  TargetName target;
-  char luns[kMaxLunsPerTarget + 1][16];
+  Seen<sizeof(TargetName)> target;
+  Seen<16> luns[kMaxLunsPerTarget + 1];
 };
 
 SeenSlot seen_slots[kMaxTargets + 1];
+
+// By what it is known that nobody has: the lock's count, and that it is the same tree. For a second only,
+// since a person at ktreec asks for no lock.
+struct SeenWhen {
+  long long changes = -1;
+  TreeInstance tree = {};
+  time_t second = 0;
+};
+
+SeenWhen seen_when;
 
 void forget_seen_slots() {
   memset(seen_slots, 0, sizeof seen_slots);
 }
 
+void forget_changed_slots() {
+  timespec now;
+  clock_gettime(CLOCK_MONOTONIC, &now);
+  const SeenWhen present = {slots_lock.changes(), tree_instance(), now.tv_sec};
+  const bool unchanged = are_locked && present.changes == seen_when.changes &&
+                         present.second == seen_when.second && present.tree == seen_when.tree;
+  if (!unchanged) forget_seen_slots();
+  seen_when = present;
+}
+
 // Reads the value at `key`, which defines a slot, or takes it from `seen`; null: nothing is kept of it.
 // Returns what tree_get() does.
 template <size_t N>
-int get_slot_value(const char* key, char (*seen)[N], Value& value) {
-  if (seen != nullptr && (*seen)[0] != '\0') {
-    copy_text(value, *seen);
-    return static_cast<int>(strlen(value));
+int get_slot_value(const char* key, Seen<N>* seen, Value& value) {
+  if (seen != nullptr && seen->what != seen->kNothing) {
+    copy_text(value, seen->value);
+    return seen->what == seen->kMissing ? -1 : static_cast<int>(strlen(value));
   }
   const int length = tree_get(key, value, sizeof value);
-  if (seen != nullptr && are_locked && length > 0 && strlen(value) < N) copy_text(*seen, value);
+  if (seen == nullptr || !are_locked) return length;
+  if (length == -1 && errno == ENODATA && !are_moved) seen->what = seen->kMissing;
+  if (length <= 0 || strlen(value) >= N) return length;
+  seen->what = seen->kValue;
+  copy_text(seen->value, value);
   return length;
 }
 
@@ -70,7 +104,7 @@ int known_lun(int n, int m) {
 }
 
 int get_target_name(int n, TargetName& name) {
-  TargetName* const seen = is_target_slot(n) ? &seen_slots[n].target : nullptr;
+  auto* const seen = is_target_slot(n) ? &seen_slots[n].target : nullptr;
   return get_slot_value(KeyText(key::kTargetName, n), seen, name);
 }
 
@@ -128,13 +162,14 @@ void SlotsHeld::take() {
   if (holders++ > 0) return;
   const LockMode mode = purpose_ == kChange ? LockMode::kExclusive : LockMode::kShared;
   are_locked = slots_lock.take_again(kSlotsLock, mode) == LockTry::kTaken;
+  forget_changed_slots();
 }
 
 void SlotsHeld::let_go() {
   held_ = false;
   if (--holders > 0) return;
-  forget_seen_slots();
-  are_locked = false;
+  if (are_moved) forget_seen_slots();
+  are_locked = are_moved = false;
   slots_lock.pause();
 }
 
@@ -174,8 +209,14 @@ bool is_lun_slot_free(int n, int m) {
   return get_lun_number(n, m, number) == -1 || number[0] == '\0';
 }
 
-int delete_slot(const char* path) {
+void slots_move() {
+  slots_lock.count_change();
+  are_moved = true;
   forget_seen_slots();
+}
+
+int delete_slot(const char* path) {
+  slots_move();
   return tree_delete(path);
 }
 

@@ -55,7 +55,7 @@ class HeldSlot {
 };
 
 // What defines a slot: the name of the target in it, the number of the LUN. Read from the tree, but only once
-// while the slots are held, since nobody moves them then. Return whether it is there.
+// as long as no run moves slots. Return whether it is there.
 [[nodiscard]] bool read_target_name(int n, char (&name)[256]);
 [[nodiscard]] bool read_lun_number(int n, int m, int* lun);
 
@@ -66,6 +66,10 @@ class HeldSlot {
 // The same by the looser rule of the free-slot searches (tree_slot_is_free).
 [[nodiscard]] bool is_target_slot_free(int n);
 [[nodiscard]] bool is_lun_slot_free(int n, int m);
+
+// With the slots held for a change, and before this run stores or deletes one: nobody believes any more what
+// was read before.
+void slots_move();
 
 // Deletes the slot of a target or a LUN at `path`, with the slots held for a change: those behind it move
 // down. Returns 0 or -103 (not logged).

@@ -160,6 +160,7 @@ void delete_fw_flag() {
 int version_upgrade_v0_to_v1() {
   LOG(1, "v0 to v1 start");
   const SlotsHeld held(SlotsHeld::kChange);  // a LUN that is half converted looks like garbage to other runs
+  slots_move();
   const int result = upgrade_targets(Caller());
   LOG(1, "v0 to v1 end, ret = %d", result);
   return result;

@@ -14,6 +14,9 @@ import re
 import shlex
 
 INITIATOR = "/iscsi/initiator"
+
+# What a run does, with the slots locked, that stores or deletes one: nobody believes any more what was read before.
+SLOTS_MOVE = "truncate -s +1 /run/remvol/slots.lock"
 PORTAL = "10.9.0.2"
 SHARES = "winshare_reload ; macshare_reload"
 SESSIONS = "iscsiadm -m session >/tmp/remvol_session.tmp 2>&1"

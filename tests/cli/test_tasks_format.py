@@ -2,7 +2,7 @@
 
 import pytest
 
-from appliance import DETAILS, SHARES, assert_order, messages, settings
+from appliance import DETAILS, SHARES, SLOTS_MOVE, assert_order, messages, settings
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
 LOGIN = "iscsiadm -m node -T iqn.t1 -p 10.9.0.2:3260 -I default --login"
@@ -156,6 +156,7 @@ class TestFormat:
         assert volume.mounted("data")
 
     def test_an_entry_that_cannot_be_read(self, volume, box):
+        box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/target", through=True, effect=SLOTS_MOVE)
         box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/lun/id:1/lun", ret=-1, skip=1, times=1)
         self.refused(volume, box, ["Can not get lun entry 0 under target iqn.t1"], "-n", "iqn.t1", "-l", "0")
 

@@ -2,7 +2,7 @@
 
 import pytest
 
-from appliance import INITIATOR, SESSIONS, assert_order, messages, settings
+from appliance import INITIATOR, SESSIONS, SLOTS_MOVE, assert_order, messages, settings
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
 LOGIN = "iscsiadm -m node -T iqn.t1 -p 10.9.0.2:3260 -I default --login"
@@ -243,8 +243,9 @@ class TestDegradedVolumes:
 
     def test_a_target_that_vanishes_ends_disconnected(self, lost, box):
         degrade(box, "a")
-        # The connection looks the target up again and does not find it: so many reads come before that one.
-        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=19, times=1)
+        # The connection, which comes behind that state, looks the target up again and does not find it.
+        box.hook("ktreec_set", f"{INITIATOR}/id:1/conn_state", value="2", through=True, effect=SLOTS_MOVE)
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=1, times=1)
         assert recover(box).status == 255
         assert lost.target("conn_state") == "0"
         assert_order(lost.trace(), "set id:1/conn_state=2", "set id:1/conn_state=0")
@@ -264,6 +265,7 @@ class TestDegradedVolumes:
         key = f"{INITIATOR}/id:1/lun/id:1/lun"
         # Read: by the first walk, its look at the format state and its step to the next slot, by the presence check
         # of the second walk, then by the entry.
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", through=True, effect=SLOTS_MOVE)
         box.hook("ktreec_get_wb", key, ret=-1, skip=4, times=1)
         recover(box)
         umounts = [line for line in box.shell() if line.startswith("umount")]

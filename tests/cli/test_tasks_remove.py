@@ -2,7 +2,7 @@
 
 import pytest
 
-from appliance import SHARES, assert_order, messages, settings
+from appliance import SHARES, SLOTS_MOVE, assert_order, messages, settings
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
 RECORD_DELETE = "iscsiadm -m node -I default -T iqn.t1 -p 10.9.0.2:3260 -o delete"
@@ -195,6 +195,7 @@ class TestLun:
     def test_an_entry_that_cannot_be_read(self, site, box):
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
         # The name is read by the look-up of the slot, by the two walks of the count, then by the entry.
+        box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/target", through=True, effect=SLOTS_MOVE)
         box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/lun/id:1/lun", ret=-1, skip=2, times=1)
         done = box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0")
         assert done.status == 255

@@ -1,11 +1,15 @@
 // What slot numbers stand for while other runs add and delete slots.
 #include "tree/slots.h"
 
+#include <chrono>
 #include <filesystem>
+#include <fstream>
 #include <regex>
 #include <string>
+#include <thread>
 
 #include "fakes.h"
+#include "ktreec.h"
 #include "support/text.h"
 #include "tree/entry.h"
 #include "tree/half_made.h"
@@ -42,6 +46,18 @@ class HeldSlots : public VolumeTest {
 
   // What another run does.
   static void delete_first_target() { fakes::tree_delete("/iscsi/initiator/id:1"); }
+
+  // What a person does, who asks for no lock.
+  static void delete_by_hand() { ktreec_del("/var/run/ktree_sock_vv", 0, "/iscsi/initiator/id:1"); }
+
+  static void store_by_hand(const char* path, const char* value) {
+    ktreec_set("/var/run/ktree_sock_vv", 0, path, value);
+  }
+
+  static int target_in_a_new_hold() {
+    const SlotsHeld held;
+    return HeldSlot(2, 1).target();
+  }
 };
 
 // The first test: a run opens its lock on the slots once.
@@ -92,8 +108,61 @@ TEST_F(HeldSlots, AreReadAnewAfterADeletionOfOurOwn) {
   EXPECT_FALSE(HeldSlot(2, 1));
 }
 
+TEST_F(HeldSlots, AreBelievedFromHoldToHold) {
+  EXPECT_EQ(target_in_a_new_hold(), 2);
+  fakes::on("ktreec_get_wb", std::regex("/(target|lun)$")).returns(-1);
+  EXPECT_EQ(target_in_a_new_hold(), 2);
+}
+
+TEST_F(HeldSlots, AreBelievedForASecondOnly) {
+  EXPECT_EQ(target_in_a_new_hold(), 2);
+  delete_by_hand();
+  std::this_thread::sleep_for(std::chrono::milliseconds(1010));
+  EXPECT_EQ(target_in_a_new_hold(), 1);
+}
+
+TEST_F(HeldSlots, AreReadAnewFromAnotherDaemon) {
+  std::ofstream("/run/ktree_sock_vv").flush();
+  EXPECT_EQ(target_in_a_new_hold(), 2);
+  delete_by_hand();
+  std::ofstream("/run/ktree_sock_vv.new").flush();
+  std::filesystem::rename("/run/ktree_sock_vv.new", "/run/ktree_sock_vv");
+  EXPECT_EQ(target_in_a_new_hold(), 1);
+}
+
+TEST_F(HeldSlots, AnEmptyOneIsReadOnce) {
+  const SlotsHeld held;
+  EXPECT_TRUE(is_target_slot_free(3));
+  EXPECT_TRUE(is_lun_slot_free(1, 2));
+  store_by_hand("/iscsi/initiator/id:3/target", "iqn.t3");
+  store_by_hand("/iscsi/initiator/id:1/lun/id:2/lun", "1");
+  EXPECT_TRUE(is_target_slot_free(3));
+  EXPECT_TRUE(is_lun_slot_free(1, 2));
+}
+
+TEST_F(HeldSlots, OneThatOnlySeemsEmptySinceAReadFailedIsReadAgain) {
+  fakes::on("ktreec_get_wb", "/iscsi/initiator/id:1/target").times(1).returns(-1);
+  const SlotsHeld held;
+  EXPECT_TRUE(is_target_slot_free(1));
+  EXPECT_FALSE(is_target_slot_free(1));
+}
+
+TEST_F(HeldSlots, AreReadAnewByAllWhenOneIsStored) {
+  EXPECT_TRUE(is_target_slot_free(3));
+  {
+    const SlotsHeld held(SlotsHeld::kChange);
+    const auto before = std::filesystem::file_size("/run/remvol/slots.lock");
+    slots_move();
+    EXPECT_EQ(std::filesystem::file_size("/run/remvol/slots.lock"), before + 1);
+  }
+  fakes::tree_set({{"/iscsi/initiator/id:3/target", "iqn.t3"}});
+  const SlotsHeld held;
+  EXPECT_FALSE(is_target_slot_free(3));
+}
+
 TEST_F(HeldSlots, AreReadAnewWhenTheyWereEmpty) {
   const SlotsHeld held(SlotsHeld::kChange);
+  slots_move();
   EXPECT_EQ(ktree_get_dbidx_by_targetname("iqn.t3"), -1);
   fakes::tree_set({{"/iscsi/initiator/id:3/target", "iqn.t3"}});
   EXPECT_EQ(ktree_get_dbidx_by_targetname("iqn.t3"), 3);

@@ -2,6 +2,8 @@
 
 #include "ktreec.h"
 
+#include <cerrno>
+
 #include "ktree/client/calls.h"
 
 #define KTREEC_EXPORT extern "C" __attribute__((visibility("default")))
@@ -29,6 +31,9 @@ KTREEC_EXPORT int ktreec_get_wb(const char* socket, unsigned, const char* path, 
   const Result result =
       path == nullptr ? Result::refused : ktree::client::get(socket, path, buffer, size - 1, received);
   buffer[result == Result::done ? received : 0] = '\0';
+  if (result == Result::missing) {
+    errno = ENODATA;
+  }
   return result == Result::done ? static_cast<int>(received) : -1;
 }
 

@@ -103,7 +103,8 @@ std::vector<std::string> commands();
 // What was asked of the tree, refused or not: "set PATH=VALUE", "del PATH", "dump FILE".
 std::vector<std::string> writes();
 
-// The tree in memory, as a test sees it: no rule applies and nothing is logged.
+// The tree in memory, as a test sees it: no rule applies and nothing is logged. What a test sets or deletes,
+// another run does, and so counts a change of the slots.
 using Values = std::vector<std::pair<std::string, std::string>>;
 void tree_set(const Values& values, const char* socket = kMainSocket);
 std::optional<std::string> tree_get(const std::string& path, const char* socket = kMainSocket);
