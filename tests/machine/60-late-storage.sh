@@ -15,11 +15,11 @@ says_so() { ! vvstat >/tmp/vvstat.out && ! grep -q Running /tmp/vvstat.out; }
 wait_for 60 says_so
 sleep 100
 expect "the texts are right" says_so
-tries=$(messages remvol-events | grep -c $IQN:t1)
+lines=$(messages remvol-events | grep -c $IQN:t1)
 target_start
 all_there() { mounted Photos && mounted Music && vvstat; }
 wait_for 75 all_there
 booted
 sleep 5
-[ "$tries" -le 3 ] || fail "$tries lines in the log before the storage was there"
+[ "$lines" -le 3 ] || fail "$lines lines in the log before the storage was there"
 expect_equal "the file" "text of Photos" "$(cat /mnt/VV/Photos/file)"
