@@ -2,6 +2,7 @@
 
 #include <getopt.h>
 
+#include <algorithm>
 #include <charconv>
 #include <cstdio>
 #include <cstring>
@@ -9,6 +10,7 @@
 #include <string_view>
 
 #include "commands.h"
+#include "completion.h"
 
 namespace vv {
 namespace {
@@ -116,6 +118,12 @@ int print_version() {
   return kDone;
 }
 
+// For the shells.
+int print_completions(const std::vector<std::string>& words) {
+  for (const std::string& word : completions(words)) puts(word.c_str());
+  return kDone;
+}
+
 // Says so and returns false when the command takes no such option.
 bool may_take(const Command& command, int letter, unsigned& given) {
   for (const Row& row : kOptions) {
@@ -211,10 +219,25 @@ const Command* find_command(const char* name) {
   return nullptr;
 }
 
+std::vector<std::string> options_of(const Command& command) {
+  std::vector<std::string> names;
+  for (const Row& row : kOptions) {
+    if (row.help != nullptr && takes(command, row)) names.push_back(std::string("--") + row.name);
+  }
+  return names;
+}
+
+bool takes_value(const std::string& option) {
+  return std::any_of(std::begin(kOptions), std::end(kOptions), [&option](const Row& row) {
+    return row.argument != nullptr && option == std::string("--") + row.name;
+  });
+}
+
 int read_options(int argc, char** argv, Options& options) {
   const std::string_view first = argc > 1 ? argv[1] : "";
   if (first == "-h" || first == "--help") return print_help();
   if (first == "-V" || first == "--version") return print_version();
+  if (first == "--complete") return print_completions({argv + 2, argv + argc});
   options.command = argc > 1 ? find_command(argv[1]) : nullptr;
   if (options.command == nullptr) {
     if (argc > 1) fprintf(stderr, "vv: there is no command \"%s\"\n", argv[1]);

@@ -3,6 +3,7 @@
 #define PLATFORM_VV_OPTIONS_H
 
 #include <string>
+#include <vector>
 
 namespace vv {
 
@@ -45,6 +46,12 @@ struct Command {
 
 // The command of that name; null when there is none.
 const Command* find_command(const char* name);
+
+// The options that the command takes, as "--lun".
+std::vector<std::string> options_of(const Command& command);
+
+// True for an option that a value follows.
+bool takes_value(const std::string& option);
 
 // Reads the command line. Returns -1 to go on, or the exit status to end with.
 int read_options(int argc, char** argv, Options& options);

@@ -359,29 +359,88 @@ def test_completion(complete, line, offered):
     assert complete(line) == offered
 
 
-@pytest.mark.parametrize("line, offered", [
-    ("vv ", ["discover", "luns", "add", "connect", "disconnect", "format", "delete", "rename-portal", "password",
-             "status", "--help", "--version"]),
-    ("vv format ", ["Two\\ words", "q\\'uote"]),
-    ("vv format q --d", ["--destroy-data"]),
+COMMANDS = ["discover", "luns", "add", "connect", "disconnect", "format", "delete", "rename-portal", "password", "status"]
+
+# What the shells offer behind a line; bash and zsh keep this order.
+COMPLETIONS = [
+    ("vv ", [*COMMANDS, "--help", "--version"]),
     ("vv di", ["discover", "disconnect"]),
-    ("vv connect ", ["Two\\ words", "iqn.t1", "iqn.t2", "q\\'uote"]),
-    ("vv connect Tw", ["Two\\ words"]),
+    ("vv connect ", ["Two words", "q'uote", "iqn.t1", "iqn.t2"]),
+    ("vv connect Tw", ["Two words"]),
     ("vv connect --", ["--json", "--help", "--version"]),
+    ("vv connect iqn.t1 ", []),
+    ("vv format ", ["Two words", "q'uote"]),
+    ("vv format q --d", ["--destroy-data"]),
+    ("vv format --yes q", ["q'uote"]),
     ("vv add Photos --p", ["--portal", "--password-file"]),
-    ("vv add Photos --portal ", ["10.9.0.2"]),
+    ("vv add Photos --portal ", ["10.9.0.2:3260"]),
     ("vv add Photos --portal 10.9.0.2 --p", ["--password-file"]),
-    ("vv add Photos --target ", ["iqn.found", "iqn.t1", "iqn.t2"]),
-    ("vv add Photos --lun ", []),
-    ("vv add Ph", []),
+    ("vv add Photos --target ", ["iqn.t1", "iqn.t2", "iqn.found"]),
+    ("vv add Photos --target iqn.found --lun ", ["5"]),
+    ("vv add Photos --target iqn.t1 --lun ", []),
+    ("vv add Photos --user ", []),
+    ("vv add ", []),
     ("vv luns iqn.f", ["iqn.found"]),
-    ("vv discover ", ["10.9.0.2"]),
-    ("vv status q", ["q\\'uote"]),
+    ("vv luns --portal 10.9.0.2 iqn.f", ["iqn.found"]),
+    ("vv discover ", ["10.9.0.2:3260"]),
+    ("vv status q", ["q'uote"]),
     ("vv nothing --", []),
-])
-def test_completion_of_vv(complete, line, offered):
-    Tree(complete.box, "/var/run/ktree_sock").start().set("/temp/vv_search/id:1/name", "iqn.found")
-    assert complete(line) == offered
+]
+FOUND = {"/temp/vv_search/id:1/name": "iqn.found", "/temp/vv_search_lun/target_name": "iqn.found",
+         "/temp/vv_search_lun/err_code": 0, "/temp/vv_search_lun/lun/count": 2,
+         "/temp/vv_search_lun/lun/id:1/lun": 4, "/temp/vv_search_lun/lun/id:1/avaliable": 0,
+         "/temp/vv_search_lun/lun/id:2/lun": 5, "/temp/vv_search_lun/lun/id:2/avaliable": 1}
+
+
+@pytest.fixture
+def shells(complete):
+    """What each shell offers behind a line."""
+    box = complete.box
+    box.tree.set({"/iscsi/initiator/id:1/port": 3260, "/iscsi/initiator/id:3/target": "iqn.\x1b[2J",
+                  "/iscsi/initiator/id:2/ip": "10.9.0.2", "/iscsi/initiator/id:2/port": 3260,
+                  "/iscsi/initiator/id:3/ip": "10.9.0.2", "/iscsi/initiator/id:3/port": 3260})
+    Tree(box, "/var/run/ktree_sock").start().set(FOUND)
+
+    def lines(argv):
+        done = box.run(argv, env={"LD_PRELOAD": None})
+        assert (done.status, done.stderr) == (0, ""), done.stderr
+        return [word for word in done.stdout.split("\n") if word]
+
+    def bash(line):
+        return [shlex.split(word)[0] for word in complete(line)]
+
+    def zsh(line):
+        words = line.split(" ")
+        script = (f"words=({shlex.join(words)}); CURRENT=$#words; compadd() {{ print -rl -- \"${{(@P)2}}\" }}\n"
+                  f"_files() {{ print FILES }}\n. {PACKAGING}/zsh/_vv")
+        return [word for word in lines(["zsh", "-f", "-c", script]) if word.startswith(words[-1]) or word == "FILES"]
+
+    def fish(line):
+        return lines(["fish", "--no-config", "-c", f"source {PACKAGING}/fish/vv.fish; complete -C {shlex.quote(line)}"])
+
+    return {"bash": bash, "zsh": zsh, "fish": fish}
+
+
+@pytest.mark.parametrize("shell", ["bash", "zsh", "fish"])
+def test_completion_of_vv(shells, shell):
+    for line, offered in COMPLETIONS:
+        found = shells[shell](line)
+        if shell == "fish":  # has an order of its own
+            found, offered = sorted(found), sorted(offered)
+        assert found == offered, line
+
+
+@pytest.mark.parametrize("shell", ["bash", "zsh", "fish"])
+def test_completion_of_a_file(shells, shell):
+    offered = shells[shell]("vv add Photos --password-file /etc/host")
+    assert offered == ["FILES"] if shell == "zsh" else "/etc/hosts" in offered
+
+
+def test_completion_of_a_word_with_a_blank(complete):
+    script = (f". {PACKAGING}/completion/vv; COMP_WORDS=(vv connect 'Two\\ w') COMP_CWORD=2; _vv; "
+              "printf '%s\\n' \"${COMPREPLY[@]}\"")
+    done = complete.box.run(["bash", "--norc", "-c", script], env={"LD_PRELOAD": None})
+    assert done.stdout == "Two\\ words\n"
 
 
 def test_completion_without_the_tree(complete):
