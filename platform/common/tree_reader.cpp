@@ -8,6 +8,7 @@
 #include <cstdio>
 #include <cstdlib>
 
+#include "file_text.h"
 #include "ktree/client/calls.h"
 
 namespace platform {
@@ -39,15 +40,6 @@ std::string unescaped(std::string_view text) {
     text.remove_prefix(escaped ? 4 : 1);
   }
   return value;
-}
-
-// All of a memory file.
-std::string content_of(int file) {
-  std::string text;
-  char buffer[1 << 14];
-  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
-    text.append(buffer, static_cast<size_t>(n));
-  return text;
 }
 
 }  // namespace

@@ -10,6 +10,7 @@
 #include <cstring>
 
 #include "delivery.h"
+#include "file_text.h"
 #include "history.h"
 #include "kernel.h"
 #include "report.h"
@@ -32,7 +33,7 @@ bool complain(const char* subject) {
 Config read_config() {
   const int file = open(kConfig, O_RDONLY | O_CLOEXEC);
   if (file < 0) return {};
-  const Config config = parse_config(vvstat::content_of(file));
+  const Config config = parse_config(platform::content_of(file));
   close(file);
   return config;
 }
@@ -43,7 +44,7 @@ bool look(const vvstat::Status& status, std::vector<Event>& events) {
   mkdir(kRunFolder, 0700);
   const int file = open(vvstat::kHistoryFile, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
   if (file < 0 || flock(file, LOCK_EX) != 0) return complain(vvstat::kHistoryFile);
-  History history = vvstat::history_of(vvstat::content_of(file));
+  History history = vvstat::history_of(platform::content_of(file));
   events = compare(vvstat::assess(status, vvstat::read_facts(status)), time(nullptr), history);
   const std::string text = vvstat::text_of(history);
   const bool written = ftruncate(file, 0) == 0 &&

@@ -19,7 +19,7 @@ constexpr struct {
   const char* step = nullptr;  // that failed, where this tells it; what else was said matters then
 } kReasons[] = {
     {"authorization", "the target refused the user name or the password",
-     "look at the target's user and password on the storage server"},
+     "set those of the storage server: vv password SHARE --user NAME"},
     {"Connection refused", "the storage server's machine answers, but nothing listens at that port",
      "look at the port, and whether the storage server's iSCSI service runs"},
     {"No route to host", "the storage server's machine does not answer",
@@ -96,6 +96,14 @@ std::vector<std::string> telling_lines(std::string_view output) {
     if (lines.empty() || lines.back() != shown) lines.push_back(std::move(shown));
   }
   return lines;
+}
+
+std::vector<std::string> warnings_in(std::string_view output) {
+  std::vector<std::string> warnings = telling_lines(output);
+  std::erase_if(warnings, [](const std::string& line) {
+    return !line.starts_with("remvol: ") && !line.starts_with("ktreec_dump(");
+  });
+  return warnings;
 }
 
 Failure explain_output(std::string_view output, const char* step) {

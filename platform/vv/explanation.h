@@ -17,6 +17,9 @@ struct Failure {
   std::vector<std::string> details;  // lines of the tool and of the kernel, as they came
 };
 
+// Stands in an advice for the name of the share.
+inline constexpr char kShareToName[] = "SHARE";
+
 // The steps that can fail, as they are named.
 inline constexpr char kDiscoveryStep[] = "discovery", kLoginStep[] = "login", kLunsStep[] = "LUN search",
                       kStoreStep[] = "settings", kDiskStep[] = "disk", kFormatStep[] = "format",
@@ -30,6 +33,9 @@ Failure explain_output(std::string_view output, const char* step);
 // Why a volume is not as it should be after the tool was to bring it up, from the tree, the kernel and what
 // the tool printed.
 Failure explain_volume(const vvstat::Row& row, std::string_view output);
+
+// What a run that succeeded could not do all the same, such as to save the settings.
+std::vector<std::string> warnings_in(std::string_view output);
 
 // Lines of the tool's own log, without their prefix, that tell of a failure, and those of the commands that
 // it ran.

@@ -95,6 +95,7 @@ ToolRun Job::run(const Arguments& arguments, const std::string& target_name) {
   outcome_.target = target_name;
   Progress progress(target_name, !options.json);
   ToolRun run = run_tool(arguments, [&progress] { progress.look(); });
+  warnings_ = warnings_in(run.output);
   // It puts right what a run that was ended, or a format that failed, has left.
   if (run.started && !run.succeeded()) run_tool({"--status"}, [] {});
   return run;
@@ -108,12 +109,17 @@ bool Job::refuse(int status, const std::string& message, const Failure& failure)
 }
 
 int Job::done(const std::string& message) {
-  refuse(kDone, message);
+  refuse(kDone, message, {"", "", "", warnings_});
   return end();
 }
 
 int Job::failed(const std::string& message, const Failure& failure) {
   refuse(kFailed, message, failure);
+  std::string& advice = outcome_.failure.advice;
+  const size_t name = advice.find(kShareToName);
+  if (name != std::string::npos && !options.name.empty())
+    advice.replace(name, std::string_view(kShareToName).size(),
+                   platform::printable(vvstat::quoted(options.name)));
   return end();
 }
 
@@ -139,11 +145,12 @@ int Job::tell_brought_up(const std::string& target_name, const std::string& shar
   if (now == nullptr) return failed(name + " was deleted meanwhile", explain_run(run, kStoreStep));
   std::string message;
   for (const Row* each : after.volumes_of(*now)) {
-    if (!share.empty() && each->volume->share != share) continue;
+    if (share.empty() ? !each->volume->enabled : each->volume->share != share) continue;
     if (!is_up(*each)) return tell_not_up(*each, run);
     append(message, up_message(*each), "\n");
   }
-  if (!run.succeeded()) return failed(name + " was not brought up", explain_run(run, kLoginStep));
+  if (!run.succeeded() || !after.in_use(target_name))
+    return failed(name + " was not brought up", explain_run(run, kLoginStep));
   return done(message.empty() ? name + " is connected" : message);
 }
 

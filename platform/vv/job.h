@@ -52,6 +52,7 @@ class Job {
   int tell_not_up(const vvstat::Row& ailing, const ToolRun& run);
 
   Outcome outcome_;
+  std::vector<std::string> warnings_;  // of the run
   KernelLog kernel_;
 };
 

@@ -107,6 +107,8 @@ int tell(const Outcome& outcome, bool json) {
     put(as_json(outcome));
   } else if (outcome.status == kDone) {
     put(outcome.message + "\n");
+    for (const std::string& warning : outcome.failure.details)
+      fprintf(stderr, "  said: %s\n", warning.c_str());
   } else {
     tell_failure(outcome);
   }

@@ -58,8 +58,8 @@ bool find_portal(Job& job, const std::string& target_name, Portal& portal) {
 
 int tell_luns_failed(Job& job, const FoundLuns& found, const ToolRun& run) {
   Failure failure = explain_run(run, found.login_failed ? kLoginStep : kLunsStep);
-  if (found.login_failed && job.options.user.empty() && failure.advice.empty())
-    failure.advice = "where the target asks for a password, --user NAME";
+  if (run.output.find("authorization") != std::string::npos)
+    failure.advice = "give those of the storage server: --user NAME, and --password-file FILE";
   return job.failed("the target's LUNs cannot be listed", failure);
 }
 

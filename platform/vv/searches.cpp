@@ -58,7 +58,7 @@ FoundLuns found_luns(const TreeReader& tree, const std::string& target) {
   found.login_failed = code == kLoginFailed;
   if (!found.done || tree.value(LUNS "/target_name") != target) return found;
   const int count = tree.number(0, LUNS "/lun/count");
-  for (int n = 1; n <= count; n++) {
+  for (int n = 1; n <= count && !tree.value(LUNS "/lun/id:%d/lun", n).empty(); n++) {
     FoundLun lun;
     lun.number = tree.number(-1, LUNS "/lun/id:%d/lun", n);
     lun.size = strtoull(tree.value(LUNS "/lun/id:%d/size", n).c_str(), nullptr, 10);

@@ -25,13 +25,6 @@ bool is_stored(const std::string& target, const Credentials& credentials) {
   return stored.user == credentials.user && stored.secret == credentials.secret;
 }
 
-bool has_session(const Job& job) {
-  for (const Row& row : job.before.rows()) {
-    if (row.target == job.target && !row.session.empty()) return true;
-  }
-  return false;
-}
-
 }  // namespace
 
 int password(const Options& options) {
@@ -63,7 +56,7 @@ int rename_portal(const Options& options) {
   }
   const std::string name = platform::printable(options.name);
   const std::string target = job.target->name;
-  if (has_session(job))
+  if (job.before.in_use(target))
     return job.failed(name + " is connected, and its portal is not changed",
                       {kStoreStep,
                        "a portal is changed while the target is not connected",

@@ -11,6 +11,8 @@
 
 #include <cstring>
 
+#include "file_text.h"
+
 namespace vv {
 namespace {
 
@@ -68,14 +70,6 @@ int wait_for(pid_t process, const std::function<void()>& look) {
   return status;
 }
 
-std::string content_of(int file) {
-  std::string text;
-  char buffer[4096];
-  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
-    text.append(buffer, static_cast<size_t>(n));
-  return text;
-}
-
 }  // namespace
 
 Credentials::~Credentials() {
@@ -128,7 +122,7 @@ ToolRun run_tool(const Arguments& arguments, const std::function<void()>& look) 
   }
   signal(SIGINT, interrupt);
   signal(SIGQUIT, quit);
-  run.output = content_of(output);
+  run.output = platform::content_of(output);
   close(output);
   return run;
 }

@@ -21,13 +21,6 @@ std::string others_mounted(const Job& job) {
   return names;
 }
 
-bool is_gone(const Look& look, const Target& target) {
-  for (const Row* row : look.volumes_of(target)) {
-    if (row->mounted || !row->session.empty()) return false;
-  }
-  return true;
-}
-
 std::string shown_name(const Job& job) {
   return platform::printable(job.options.name);
 }
@@ -38,6 +31,11 @@ int connect(const Options& options) {
   Job job(options);
   if (!job.find_share_or_target()) return job.end();
   const std::string share = job.row != nullptr ? job.row->volume->share : "";
+  // The tool logs out of a target that shows no disk of a volume.
+  if (job.before.volumes_of(*job.target).empty()) {
+    job.refuse(kUsage, "no share is configured of this target");
+    return job.end();
+  }
   const ToolRun run = job.run(target_arguments("--connect", job.target->name), job.target->name);
   return job.tell_brought_up(job.target->name, share, run);
 }
@@ -49,7 +47,7 @@ int disconnect(const Options& options) {
   if (!others.empty() && !job.confirm("This disconnects the whole target, also " + others + ". Go on?"))
     return job.end();
   const ToolRun run = job.run(target_arguments("--disconnect", job.target->name), job.target->name);
-  if (!run.succeeded() || !is_gone(Look(), *job.target))
+  if (!run.succeeded() || Look().in_use(job.target->name))
     return job.failed(shown_name(job) + " is not disconnected", explain_run(run, kUnmountStep));
   return job.done(shown_name(job) + " is disconnected, and stays so until it is connected");
 }

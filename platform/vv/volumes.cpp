@@ -2,6 +2,8 @@
 
 #include <glob.h>
 
+#include <algorithm>
+
 #include "list.h"
 #include "sessions.h"
 #include "tree_reader.h"
@@ -49,6 +51,12 @@ std::vector<const Row*> Look::volumes_of(const Target& target) const {
     if (row.volume != nullptr && row.target->name == target.name) found.push_back(&row);
   }
   return found;
+}
+
+bool Look::in_use(const std::string& target) const {
+  return std::any_of(rows_.begin(), rows_.end(), [&target](const Row& row) {
+    return row.target->name == target && (row.mounted || !row.session.empty());
+  });
 }
 
 std::string Look::share_names() const {

@@ -35,6 +35,9 @@ class Look {
   // The rows of the target's volumes.
   std::vector<const vvstat::Row*> volumes_of(const vvstat::Target& target) const;
 
+  // True while the target has a session, or a volume of it is mounted.
+  bool in_use(const std::string& target) const;
+
   // Names of all shares, for a message: "Backup, Photos".
   std::string share_names() const;
 

@@ -5,6 +5,7 @@
 
 #include <cstdio>
 
+#include "file_text.h"
 #include "utf8.h"
 
 namespace vvstat {
@@ -78,18 +79,10 @@ History history_of(std::string_view text) {
   return history;
 }
 
-std::string content_of(int file) {
-  std::string text;
-  char buffer[4096];
-  for (ssize_t n; (n = pread(file, buffer, sizeof buffer, static_cast<off_t>(text.size()))) > 0;)
-    text.append(buffer, static_cast<size_t>(n));
-  return text;
-}
-
 History read_history() {
   const int file = open(kHistoryFile, O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
   if (file < 0) return {};
-  const History history = history_of(content_of(file));
+  const History history = history_of(platform::content_of(file));
   close(file);
   return history;
 }

@@ -36,9 +36,6 @@ std::string key_of(const Row& row);
 std::string text_of(const History& history);
 History history_of(std::string_view text);
 
-// All of an open file, from its beginning.
-std::string content_of(int file);
-
 // The history as it is in the file; empty when it cannot be read.
 History read_history();
 

@@ -1,20 +1,15 @@
 """vv: the front end for a person at a terminal."""
 
-import fcntl
 import json
-import os
 import pathlib
-import pty
 import re
-import struct
-import termios
 
 import jsonschema
 import pytest
 
 from appliance import settings
+from harness.terminal import Terminal
 from harness.tree import Tree
-from harness.world import Running
 
 T = "iqn.2026-01.org.example:t"
 T1, T2 = f"{T}1", f"{T}2"
@@ -47,6 +42,7 @@ class Machine:
         done = self.box.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None})
         assert done.status == 0
         self.box.write("/fake/session", SESSION)
+        self.box.path("/etc/NAS_CFG").mkdir(exist_ok=True)
         for operation in ("login", "logout"):
             self.box.fake("iscsiadm", re.compile(f"^-m node .*--{operation}$"),
                           effect='sh /fake/initiator/iscsiadm "$@" && sh /fake/session "$@"')
@@ -298,7 +294,8 @@ def test_luns_of_a_target_that_refuses_the_login(machine):
     machine.box.fake("iscsiadm", re.compile("--login$"), stderr=sample("login-no-secret.err"), status=24, first=True)
     done = machine.vv("luns", T1, "--portal", "10.9.0.2")
     assert (done.status, done.stdout) == (1, "")
-    assert "  step: login\n  why:  the target refused the user name or the password\n" in done.stderr
+    assert ("  step: login\n  why:  the target refused the user name or the password\n"
+            "  try:  give those of the storage server: --user NAME") in done.stderr
     assert "authorization failure" in done.stderr
 
 
@@ -473,7 +470,8 @@ def test_a_login_that_the_target_refuses(photos):
     assert (done.status, done.stdout) == (1, "")
     assert ("vv: Photos is not mounted as it should be\n"
             "  step: login\n"
-            "  why:  the target refused the user name or the password\n") in done.stderr
+            "  why:  the target refused the user name or the password\n"
+            "  try:  set those of the storage server: vv password Photos --user NAME\n") in done.stderr
     assert "  said: iscsiadm: initiator reported error (24 - iSCSI login failed due to authorization failure)\n" in done.stderr
 
 
@@ -498,6 +496,51 @@ def test_another_share_of_the_target_may_fail(photos):
     assert photos.vv("connect", "Photos").status == 0
     assert photos.vv("connect", "Music").status == 1
     assert photos.vv("connect", T1).status == 1
+
+
+def test_a_share_that_is_switched_off(photos):
+    photos.store(T1, conn_set=0, luns=[("Photos", 1), ("Music", 2, {"enable": 0})])
+    photos.target(T1, {1: "sdb", 2: "sdc"})
+    assert photos.vv("connect", T1).stdout == "Photos is mounted on /mnt/VV/Photos\n"
+    done = photos.vv("connect", "Music")
+    assert done.status == 1 and "why:  it is switched off in the settings" in done.stderr
+
+
+def test_a_target_without_shares(photos):
+    photos.store(T2, slot=2, conn_set=0)
+    done = photos.vv("connect", T2)
+    assert (done.status, done.stderr) == (2, "vv: no share is configured of this target\n")
+    assert photos.vv("disconnect", T2).status == 0
+    photos.box.write("/sys/class/iscsi_session/session9/targetname", T2 + "\n")
+    photos.box.write("/sys/class/iscsi_session/session9/state", "LOGGED_IN\n")
+    assert photos.vv("rename-portal", T2, "--portal", "10.9.0.3").status == 1
+    assert photos.vv("disconnect", T2).status == 1
+
+
+def test_what_could_not_be_saved_is_told(photos):
+    photos.box.path("/etc/NAS_CFG").rmdir()
+    told = "remvol: the settings are not saved, there is no /etc/NAS_CFG"
+    assert photos.vv("disconnect", "Photos").stderr == f"  said: {told}\n"
+    status, outcome = photos.says("disconnect", "Photos")
+    assert (status, outcome["outcomes"][0]["details"]) == (0, told)
+
+
+def test_two_adds_of_one_name(machine):
+    """The second one is told of the first's, whoever of the two it is."""
+    machine.offers(T1)
+    started = [machine.box.start(["vv", "add", "Photos", "--portal", "10.9.0.2", "--lun", lun]) for lun in "12"]
+    ends = sorted(one.wait().status for one in started)
+    assert ends[0] == 0 and ends[1] in (1, 2)
+    assert machine.site.lun("share") == "Photos" and machine.site.lun("share", 2) is None
+
+
+def test_two_searches_do_not_mix(machine):
+    for n in (1, 2):
+        machine.target(f"{T}{n}", {n: f"sd{'ab'[n - 1]}"}, size=n << 30)
+    started = [machine.box.start(["vv", "luns", f"{T}{1 + n % 2}", "--portal", "10.9.0.2", "--json"]) for n in range(6)]
+    for n, one in enumerate(started):
+        done = one.wait()
+        assert [lun["lun"] for lun in json.loads(done.stdout)["luns"]] == [1 + n % 2], done.stderr
 
 
 def test_a_signal_ends_the_tool(photos):
@@ -769,52 +812,14 @@ def test_the_portal_of_a_connected_target_is_not_changed(machine):
 # --- at a terminal ---
 
 
-class Terminal:
-    """A run with a terminal of its own."""
-
-    def __init__(self, box, *words, columns=80):
-        self.box, self.text = box, ""
-        self.master, slave = pty.openpty()
-        fcntl.ioctl(slave, termios.TIOCSWINSZ, struct.pack("HHHH", 24, columns, 0, 0))
-        number = next(box.numbers)
-        unused = [os.memfd_create("unused", os.MFD_CLOEXEC) for _ in range(2)]
-        argv = ["/usr/bin/setsid", "--ctty", "--wait", "env", "--default-signal=INT", "vv", *words]
-        self.running = box.running[number] = Running(box, number, argv, *unused)
-        streams = [os.dup(slave) for _ in range(3)]
-        variables = [f"{key}={value}" for key, value in box.env().items()]
-        box.send(["run", number, "/", len(argv), *argv, *variables], streams)
-        for fd in (*streams, slave):
-            os.close(fd)
-        os.set_blocking(self.master, False)
-
-    def read(self):
-        try:
-            while data := os.read(self.master, 65536):
-                self.text += data.decode()
-        except OSError:
-            pass
-        return self.text
-
-    def type(self, keys):
-        os.write(self.master, keys.encode())
-
-    def wait_for(self, text):
-        self.box.wait_until(lambda: text in self.read(), what=f"{text!r} in {self.text!r}")
-
-    def end(self):
-        status = self.running.wait().status
-        self.read()
-        os.close(self.master)
-        return status
-
-    def shows_what_is_typed(self):
-        return bool(termios.tcgetattr(self.master)[3] & termios.ECHO)
+def at_a_terminal(machine, *words):
+    return Terminal(machine.box, ["vv", *words], whole=True)
 
 
 @pytest.mark.parametrize("answer, status", [("y", 0), ("Yes", 0), ("n", 4), ("", 4), ("yess", 4)])
 def test_a_person_is_asked(machine, answer, status):
     connected(machine)
-    terminal = Terminal(machine.box, "delete", "Photos")
+    terminal = at_a_terminal(machine, "delete", "Photos")
     terminal.wait_for("This ends the use of Photos here; the data stays on the storage server. Go on? [y/N] ")
     terminal.type(answer + "\n")
     assert terminal.end() == status
@@ -824,14 +829,14 @@ def test_a_person_is_asked(machine, answer, status):
 
 def test_the_end_of_the_input_is_no_yes(machine):
     connected(machine)
-    terminal = Terminal(machine.box, "delete", "Photos")
+    terminal = at_a_terminal(machine, "delete", "Photos")
     terminal.wait_for("[y/N] ")
     terminal.type("\x04")
     assert terminal.end() == 4
 
 
 def test_a_password_is_typed_unseen(machine, words):
-    terminal = Terminal(machine.box, "luns", T1, "--portal", "10.9.0.2", "--user", "maria")
+    terminal = at_a_terminal(machine, "luns", T1, "--portal", "10.9.0.2", "--user", "maria")
     terminal.wait_for("Password of maria: ")
     machine.box.wait_until(lambda: not terminal.shows_what_is_typed())
     terminal.type("the secret\n")
@@ -842,7 +847,7 @@ def test_a_password_is_typed_unseen(machine, words):
 
 
 def test_a_terminal_that_is_interrupted_shows_again_what_is_typed(machine, words):
-    terminal = Terminal(machine.box, "luns", T1, "--portal", "10.9.0.2", "--user", "maria")
+    terminal = at_a_terminal(machine, "luns", T1, "--portal", "10.9.0.2", "--user", "maria")
     terminal.wait_for("Password of maria: ")
     machine.box.wait_until(lambda: not terminal.shows_what_is_typed())
     terminal.type("half\x03")
@@ -860,7 +865,7 @@ done
 
 def test_a_format_has_a_bar(machine):
     connected(machine).box.fake("mke2fs", effect=MKE2FS)
-    terminal = Terminal(machine.box, "format", "Photos", "--destroy-data")
+    terminal = at_a_terminal(machine, "format", "Photos", "--destroy-data")
     terminal.wait_for("This destroys ext4 on sdb1. Go on? [y/N] ")
     terminal.type("y\n")
     terminal.wait_for("Photos: formatting [##")
@@ -873,7 +878,7 @@ def test_a_format_has_a_bar(machine):
 
 def test_an_interrupted_format_is_told_as_failed(machine):
     connected(machine).box.fake("mke2fs", effect="sleep 20")
-    terminal = Terminal(machine.box, "format", "Photos", "--destroy-data", "--yes")
+    terminal = at_a_terminal(machine, "format", "Photos", "--destroy-data", "--yes")
     machine.box.wait_until(lambda: machine.box.runs("mke2fs"))
     terminal.type("\x03")
     assert terminal.end() == 1

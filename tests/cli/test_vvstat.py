@@ -1,21 +1,19 @@
 """vvstat: how the volumes are, for an operator and for programs."""
 
 import datetime
-import fcntl
 import json
 import os
 import pathlib
-import pty
 import re
 import signal
-import struct
-import termios
 import time
 import unicodedata
 
 import jsonschema
 import prometheus_client.parser
 import pytest
+
+from harness.terminal import Terminal
 
 SCHEMA = json.loads((pathlib.Path(__file__).resolve().parents[2] / "docs/vvstat.schema.json").read_text())
 T1, T2 = "/iscsi/initiator/id:1", "/iscsi/initiator/id:2"
@@ -558,50 +556,14 @@ def test_what_cannot_be_written_is_a_failure(example, options):
 # --- on a terminal ---
 
 
-class Terminal:
-    """vvstat on a terminal of its own."""
-
-    def __init__(self, box, *options, columns=200, lines=50, env=None, keys=False):
-        self.box = box
-        self.text = ""
-        self.master, slave = pty.openpty()
-        fcntl.ioctl(slave, termios.TIOCSWINSZ, struct.pack("HHHH", lines, columns, 0, 0))
-        variables = [f"{k}={v}" for k, v in box.env({"LD_PRELOAD": None, **(env or {})}).items()]
-        number = next(box.numbers)
-        out, err = os.dup(slave), os.memfd_create("err", os.MFD_CLOEXEC)
-        from harness.world import Running
-        self.running = box.running[number] = Running(box, number, ["vvstat"], os.memfd_create("unused"), err)
-        argv = ["vvstat", *options]
-        stdin = os.dup(slave) if keys else os.open("/dev/null", os.O_RDONLY)
-        box.send(["run", number, "/", len(argv), *argv, *variables], [stdin, out, err])
-        for fd in (stdin, out, slave):
-            os.close(fd)
-        os.set_blocking(self.master, False)
-
-    def read(self):
-        try:
-            while data := os.read(self.master, 65536):
-                self.text += data.decode()
-        except OSError:
-            pass
-        return self.text
-
-    def type(self, keys):
-        os.write(self.master, keys.encode())
-
-    def wait_for(self, text):
-        self.box.wait_until(lambda: text in self.read(), what=f"{text!r} in {self.text!r}")
-
-    def end(self):
-        result = self.running.wait()
-        self.read()
-        os.close(self.master)
-        return result.status
+def on_a_terminal(box, *options, columns=200, lines=50, env=None, keys=False):
+    return Terminal(box, ["vvstat", *options], columns=columns, lines=lines, keys=keys,
+                    env={"LD_PRELOAD": None, **(env or {})})
 
 
 def test_a_terminal_gets_colour(example):
     change(example, {"lun/id:2/format_state": "4", "lun/id:2/status": "Wait to Format"})
-    terminal = Terminal(example)
+    terminal = on_a_terminal(example)
     assert terminal.end() == 1
     assert "\x1b[32mRunning" in terminal.text
     assert "\x1b[31mWait to Format" in terminal.text
@@ -609,7 +571,7 @@ def test_a_terminal_gets_colour(example):
 
 
 def test_no_color_is_respected(example):
-    terminal = Terminal(example, env={"NO_COLOR": "1"})
+    terminal = on_a_terminal(example, env={"NO_COLOR": "1"})
     assert terminal.end() == 0
     assert "\x1b" not in terminal.text
 
@@ -633,7 +595,7 @@ def frames(terminal):
 
 def test_watch_redraws_in_place(example):
     change(example, {"lun/id:2/format_state": "1", "lun/id:2/format_progress": "37", "lun/id:2/status": "Formatting 37%"})
-    terminal = Terminal(example, "--watch")
+    terminal = on_a_terminal(example, "--watch")
     terminal.wait_for("Formatting 37%")
     change(example, {"lun/id:2/format_progress": "38", "lun/id:2/status": "Formatting 38%"})
     terminal.wait_for("Formatting 38%")
@@ -645,7 +607,7 @@ def test_watch_redraws_in_place(example):
 
 
 def test_watch_ends_with_q(example):
-    terminal = Terminal(example, "--watch", keys=True)
+    terminal = on_a_terminal(example, "--watch", keys=True)
     terminal.wait_for("healthy")
     terminal.type("?")
     terminal.type("q")
@@ -654,7 +616,7 @@ def test_watch_ends_with_q(example):
 
 
 def test_watch_says_what_a_small_terminal_has_no_room_for(example):
-    terminal = Terminal(example, "--watch", columns=60, lines=5, env={"NO_COLOR": "1"})
+    terminal = on_a_terminal(example, "--watch", columns=60, lines=5, env={"NO_COLOR": "1"})
     terminal.wait_for("\x1b[J")
     terminal.running.kill(signal.SIGTERM)
     assert terminal.end() == 0
@@ -666,7 +628,7 @@ def test_watch_says_what_a_small_terminal_has_no_room_for(example):
 
 @pytest.mark.parametrize("height", [1, 2, 3])
 def test_watch_in_a_tiny_terminal_shows_the_verdict(example, height):
-    terminal = Terminal(example, "--watch", columns=20, lines=height, env={"NO_COLOR": "1"})
+    terminal = on_a_terminal(example, "--watch", columns=20, lines=height, env={"NO_COLOR": "1"})
     terminal.wait_for("\x1b[J")
     terminal.running.kill(signal.SIGTERM)
     assert terminal.end() == 0
@@ -675,7 +637,7 @@ def test_watch_in_a_tiny_terminal_shows_the_verdict(example, height):
 
 
 def test_watch_goes_on_while_the_tree_is_away(example):
-    terminal = Terminal(example, "--watch")
+    terminal = on_a_terminal(example, "--watch")
     terminal.wait_for("healthy")
     example.tree.stop()
     terminal.wait_for("cannot be reached")

@@ -227,6 +227,10 @@ TEST(Searches, LunsAreThoseOfTheTargetThatWasAskedFor) {
   EXPECT_EQ(found.luns[0].size, 18446744073709551615ULL);
   EXPECT_EQ(found.luns[0].file_system, "");
   EXPECT_TRUE(found_luns(done, "b").luns.empty());
+  const platform::TreeReader many(
+      "/temp/vv_search_lun/target_name=a\n/temp/vv_search_lun/lun/count=2000000000\n"
+      "/temp/vv_search_lun/err_code=0\n");
+  EXPECT_TRUE(found_luns(many, "a").luns.empty());
   EXPECT_FALSE(found_luns(platform::TreeReader(list), "a").done);
   EXPECT_TRUE(
       found_luns(platform::TreeReader(list + "/temp/vv_search_lun/err_code=100\n"), "a").login_failed);

@@ -1,0 +1,15 @@
+// Text of files.
+#ifndef PLATFORM_COMMON_FILE_TEXT_H
+#define PLATFORM_COMMON_FILE_TEXT_H
+
+#include <string>
+
+namespace platform {
+
+// All of a file that can be read at any place, as far as it can be read; where the descriptor stands does not
+// matter, and stays.
+std::string content_of(int file);
+
+}  // namespace platform
+
+#endif
