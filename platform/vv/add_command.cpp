@@ -43,7 +43,7 @@ bool choose_target(Job& job, const Portal& portal, std::string& target) {
     return true;
   }
   std::string message = "the portal " + portal.text();
-  message += names.empty() ? " offers no target to this machine" : " offers several targets; name one:";
+  message += names.empty() ? " offers no target to this machine" : " offers several targets, name one";
   for (const std::string& name : names)
     message += "\n  --target " + platform::printable(vvstat::quoted(name));
   return job.refuse(kUsage, message);

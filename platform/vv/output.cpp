@@ -50,6 +50,19 @@ std::string joined(const std::vector<std::string>& lines) {
   return text;
 }
 
+// Lines of a message as one.
+std::string one_line(const std::string& message) {
+  std::string line;
+  for (const char byte : message) {
+    if (line.ends_with("; ") && byte == ' ') continue;
+    if (byte == '\n')
+      line += "; ";
+    else
+      line += byte;
+  }
+  return line;
+}
+
 const char* word_of(int status) {
   if (status == kDone) return "done";
   return status == kRefused ? "refused" : "failed";
@@ -69,8 +82,8 @@ std::string as_json(const Outcome& outcome) {
                  {"advice"},
                  {"details"}},
                 {{outcome.command, outcome.share, outcome.target, word_of(outcome.status),
-                  std::to_string(outcome.status), outcome.message, failure.step, failure.why, failure.advice,
-                  joined(failure.details)}}},
+                  std::to_string(outcome.status), one_line(outcome.message), failure.step, failure.why,
+                  failure.advice, joined(failure.details)}}},
                true);
 }
 

@@ -42,16 +42,19 @@ const char* step_of_format(int before, int now) {
   return before == vvstat::kFormatRunning && now != vvstat::kFormatFailed ? "formatted" : nullptr;
 }
 
-const char* step_of_volume(int before, int now) {
-  if (before == now) return nullptr;
-  if (now == vvstat::kBeingCreated) return "looking at its disk";
+const char* first_step(int before, int now) {
+  return before != now && now == vvstat::kBeingCreated ? "looking at its disk" : nullptr;
+}
+
+const char* last_step(int before, int now) {
   return before == vvstat::kBeingCreated && now == kReady ? "mounted" : nullptr;
 }
 
 void add_volume_steps(const Volume& before, const Volume& now, std::vector<std::string>& steps) {
   const std::string share = platform::printable(now.share) + ": ";
-  for (const char* step : {step_of_format(before.format_state, now.format_state),
-                           step_of_volume(before.volume_state, now.volume_state)}) {
+  for (const char* step : {first_step(before.volume_state, now.volume_state),
+                           step_of_format(before.format_state, now.format_state),
+                           last_step(before.volume_state, now.volume_state)}) {
     if (step != nullptr) steps.push_back(share + step);
   }
 }

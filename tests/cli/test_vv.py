@@ -357,8 +357,10 @@ def test_add_lists_several_targets(machine):
     before = settings(machine.box)
     done = machine.vv(*ADD)
     assert (done.status, done.stdout) == (2, "")
-    assert done.stderr == ("vv: the portal 10.9.0.2:3260 offers several targets; name one:\n"
+    assert done.stderr == ("vv: the portal 10.9.0.2:3260 offers several targets, name one\n"
                            f"  --target {T1}\n  --target {T2}\n")
+    assert machine.says(*ADD)[1]["outcomes"][0]["message"] == (
+        f"the portal 10.9.0.2:3260 offers several targets, name one; --target {T1}; --target {T2}")
     assert settings(machine.box) == before
     assert machine.vv(*ADD, "--target", T2).status == 0
     assert machine.site.target("target") == T2
@@ -451,6 +453,8 @@ def test_connect_by_the_targets_name_brings_all_its_shares(photos):
     done = photos.vv("connect", T1)
     assert (done.status, done.stdout) == (0, "Photos is mounted on /mnt/VV/Photos\n"
                                              "Ton & Film is mounted on /mnt/VV/Ton & Film\n")
+    assert photos.says("connect", T1)[1]["outcomes"][0]["message"] == (
+        "Photos is mounted on /mnt/VV/Photos; Ton & Film is mounted on /mnt/VV/Ton & Film")
     assert photos.says("connect", "Ton & Film")[1] == {"outcomes": [
         {"command": "connect", "share": "Ton & Film", "target": T1, "outcome": "done", "status": 0,
          "message": "Ton & Film is mounted on /mnt/VV/Ton & Film", "step": None, "why": None, "advice": None,

@@ -130,7 +130,7 @@ TEST(Progress, AVolumeIsKnownByItsLunNotByItsSlot) {
   const Target before = target_with(1, {volume_with(1, 0, 0), volume_with(2, 0, 1)});
   EXPECT_EQ(steps_between(before, target_with(1, {volume_with(2, 0, 0)})), Steps{"Photos: mounted"});
   EXPECT_EQ(steps_between(target_with(1, {}), target_with(1, {volume_with(3, 1, 1)})),
-            (Steps{"Photos: formatting", "Photos: looking at its disk"}));
+            (Steps{"Photos: looking at its disk", "Photos: formatting"}));
 }
 
 TEST(Progress, ABarFitsIntoItsLine) {
