@@ -259,7 +259,7 @@ PRIVATE_MOUNTS = """PrivateMounts PrivateTmp PrivateDevices ProtectSystem Protec
     ProtectKernelModules ProtectKernelLogs ProtectControlGroups ProtectProc ProcSubset ReadOnlyPaths ReadWritePaths
     InaccessiblePaths NoExecPaths ExecPaths BindPaths BindReadOnlyPaths TemporaryFileSystem MountFlags MountAPIVFS
     RootDirectory RootImage MountImages ExtensionImages DynamicUser PrivateUsers PrivateIPC NetworkNamespacePath
-    ProtectClock DeviceAllow DevicePolicy RuntimeDirectory StateDirectory""".split()
+    RuntimeDirectory StateDirectory""".split()
 
 
 class Unit(configparser.RawConfigParser):
@@ -277,6 +277,7 @@ def test_a_unit_that_mounts_for_others_has_no_mounts_of_its_own(name):
     assert not set(PRIVATE_MOUNTS) & set(service)
     assert service["NoNewPrivileges"] == "yes" and service["UMask"] == "0077"
     assert {"CapabilityBoundingSet", "SystemCallFilter", "RestrictNamespaces", "MemoryDenyWriteExecute"} <= set(service)
+    assert service["DevicePolicy"] == "closed" and service["ProtectClock"] == "yes"
 
 
 @pytest.mark.parametrize("path", sorted((PACKAGING / "units").glob("*.service")), ids=lambda path: path.name)
