@@ -52,6 +52,10 @@ bool is_taken_down() {
   return runs(kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"});
 }
 
+bool is_brought_up() {
+  return runs(kTool, {"--oiscsi_evt_recover", "--connect"});
+}
+
 // Starts a program that goes on when this one ends. Returns its process, or -1.
 pid_t start(std::initializer_list<const char*> words, const char* program) {
   std::vector<const char*> argv(words);
@@ -76,6 +80,7 @@ void keep_initiator(Daemon& daemon, bool tree_answers, bool taken_down) {
 
 std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
   const std::vector<platform::Session> sessions = platform::read_sessions();
+  const bool at_work = is_brought_up();
   platform::TreeReader tree;
   std::vector<Wanted> wanted;
   for (int n = 1; n <= platform::kTargets; n++) {
@@ -88,7 +93,7 @@ std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
     const bool is_taken =
         taken_down ||
         (first && tree.number(kDisconnected, "/iscsi/initiator/id:%d/conn_state", n) == kDisconnected);
-    wanted.push_back({name, connected, is_taken});
+    wanted.push_back({name, connected, is_taken, at_work});
   }
   answered = tree.answered();
   return wanted;

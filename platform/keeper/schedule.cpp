@@ -8,6 +8,9 @@ namespace {
 // A recovery logs out and in again: a session is missing only when it stays away for some looks.
 constexpr int kLooks = 3;
 
+// While somebody brings a target up, who needs all the longer where the machine is slow.
+constexpr int kLooksAtWork = 60;
+
 }  // namespace
 
 Schedule::Target& Schedule::find(const std::string& name) {
@@ -28,7 +31,8 @@ void Schedule::settle(Target& target, const Wanted& wanted, long now) {
   }
   // Only who loses its session while somebody is at it is meant.
   if (target.absent == 0 && wanted.is_taken) target.taken = true;
-  if (target.taken || target.missing || ++target.absent < kLooks) return;
+  if (target.taken || target.missing) return;
+  if (++target.absent < (wanted.at_work ? kLooksAtWork : kLooks)) return;
   target.missing = target.tell = true;
   target.pause = kFirstPause;
   target.due = now;

@@ -12,6 +12,7 @@ struct Wanted {
   std::string name;
   bool connected;  // it has a session, working or not
   bool is_taken;   // when it has none: somebody takes sessions away on purpose
+  bool at_work;    // when it has none: a recovery or a connection is under way, perhaps this target's
 };
 
 struct Try {

@@ -14,7 +14,7 @@ class KeeperSchedule : public testing::Test {
   // A look at one target; a second passes.
   void look(bool connected, bool is_taken = false) {
     now_++;
-    schedule_.look({{"a", connected, is_taken}}, now_);
+    schedule_.look({{"a", connected, is_taken, at_work_}}, now_);
   }
 
   Change change() {
@@ -38,6 +38,7 @@ class KeeperSchedule : public testing::Test {
   }
 
   Schedule schedule_;
+  bool at_work_ = false;
   long now_ = 100;
 };
 
@@ -46,6 +47,23 @@ TEST_F(KeeperSchedule, StepsGrowToAMinute) {
   EXPECT_EQ(change(), Change::kMissing);
   EXPECT_EQ(tries(250), (std::vector<long>{0, 1, 3, 7, 15, 31, 63, 123, 183, 243}));
   EXPECT_EQ(change(), Change::kNone);
+}
+
+TEST_F(KeeperSchedule, WhatARecoveryIsAtIsNotMissingYet) {
+  look(kConnected);
+  at_work_ = true;
+  for (int i = 0; i < 59; i++) look(kAbsent);
+  EXPECT_EQ(change(), Change::kNone);
+  at_work_ = false;
+  look(kAbsent);
+  EXPECT_EQ(change(), Change::kMissing);
+}
+
+TEST_F(KeeperSchedule, ARecoveryThatDoesNotEndIsNotWaitedForForEver) {
+  look(kConnected);
+  at_work_ = true;
+  for (int i = 0; i < 60; i++) look(kAbsent);
+  EXPECT_EQ(change(), Change::kMissing);
 }
 
 TEST_F(KeeperSchedule, OnlyTheFirstTryIsTheFirst) {
