@@ -9,6 +9,7 @@ import xml.etree.ElementTree
 
 import pytest
 
+from harness.documents import blocks_of
 from harness.ktree_daemon import BUILD, Daemon
 
 TOP = pathlib.Path(__file__).resolve().parents[2]
@@ -157,10 +158,7 @@ PAGES = sorted(path.name for path in (DOCS / "man").iterdir())
 
 
 def examples(page):
-    """The blocks of a manual page, as a person sees them."""
-    text = (DOCS / "man" / page).read_text()
-    return [re.sub(r"\\(.)", lambda escape: {"e": "\\", "-": "-"}[escape[1]], found)
-            for found in re.findall(r"^\.EX\n(.*?)^\.EE$", text, re.M | re.S)]
+    return blocks_of(DOCS / "man" / page)
 
 
 @pytest.mark.parametrize("page", PAGES)
