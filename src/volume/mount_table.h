@@ -31,8 +31,8 @@ Mounted find_mount(bool (*fits)(const MountLine& mount, const void* what), const
 // when it is null.
 Mounted find_mount_of(dev_t device, const char* path, MountLine* mount);
 
-// Returns whether what is mounted on `path` has lost its disk: its session was closed, and no other brings the
-// disk back. Where sysfs does not tell there is none lost.
+// Returns whether what is mounted on `path` has lost its disk: its session was closed, and no other brings
+// the disk back. Where sysfs does not tell there is none lost.
 bool has_lost_disk(const char* path);
 
 }  // namespace remvol
