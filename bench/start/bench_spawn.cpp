@@ -1,7 +1,7 @@
-// Runs commands in turn, many rounds, and prints for each the median of its wall time in microseconds and the
-// most memory that one of its runs had resident, in KiB: bench_spawn ROUNDS COMMAND [ARGUMENT...] [-- COMMAND
-// ...]. Their output is thrown away. In a round every command runs once, so that what else the machine does
-// hits all alike.
+// Runs commands in turn, many rounds: bench_spawn ROUNDS COMMAND [ARGUMENT...] [-- COMMAND ...]. Prints a
+// line a round, the wall time of each in microseconds, and a last one, the most memory that one of its runs
+// had resident, in KiB. Their output is thrown away, and an exit status above 1 ends it all. In a round every
+// command runs once, so that what else the machine does hits all alike.
 #include <fcntl.h>
 #include <spawn.h>
 #include <sys/resource.h>
@@ -36,7 +36,7 @@ std::vector<Command> read_commands(char** arguments) {
   return commands;
 }
 
-// Returns whether the command ended with status 0.
+// Returns whether the command ended with status 0 or 1.
 bool run(Command& command, const posix_spawn_file_actions_t& actions) {
   const auto begin = std::chrono::steady_clock::now();
   pid_t child = 0;
@@ -49,7 +49,7 @@ bool run(Command& command, const posix_spawn_file_actions_t& actions) {
   const std::chrono::duration<double, std::micro> taken = std::chrono::steady_clock::now() - begin;
   command.microseconds.push_back(taken.count());
   command.resident = std::max(command.resident, usage.ru_maxrss);
-  return status == 0;
+  return WIFEXITED(status) && WEXITSTATUS(status) <= 1;
 }
 
 }  // namespace
@@ -71,10 +71,11 @@ int main(int argc, char** argv) {
       return 2;
     }
   }
-  for (Command& command : commands) {
-    auto middle = command.microseconds.begin() + rounds / 2;
-    std::nth_element(command.microseconds.begin(), middle, command.microseconds.end());
-    printf("%.0f %ld\n", *middle, command.resident);
+  for (int i = 0; i < rounds; i++) {
+    for (const Command& command : commands) printf("%.1f ", command.microseconds[static_cast<size_t>(i)]);
+    puts("");
   }
+  for (const Command& command : commands) printf("%ld ", command.resident);
+  puts("");
   return 0;
 }

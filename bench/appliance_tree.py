@@ -1,0 +1,56 @@
+"""Trees of an appliance, as settings documents, and what iscsiadm says of such a one."""
+
+KEYS = {"ip": "10.9.0.2", "port": "3260", "chap": "1", "chap_name": "user", "chap_pwd": "secret-of-16-byte", "conn_set": "1",
+        "conn_state": "1", "status": "Connected"}
+LUN_KEYS = {"enable": "1", "vol_access_right": "1", "format_state": "0", "format_progress": "100", "volume_state": "0",
+            "status": "Running", "size": "1000000/100000000", "fs_type": "ext4"}
+
+
+def name_of(target):
+    return f"iqn.2026-01.org.example:storage.disk{target}"
+
+
+def disk_of(target, lun):
+    number = (target - 1) * 8 + lun - 1
+    return "sd" + (chr(ord("a") + number // 26 - 1) if number >= 26 else "") + chr(ord("a") + number % 26)
+
+
+def elements(values):
+    return "".join(f"<{key}>{value}</{key}>" for key, value in values.items())
+
+
+def lun(target, number):
+    disk = disk_of(target, number)
+    share = f"volume{target}-{number}"
+    return "<id>" + elements({"lun": number, "share": share, **LUN_KEYS, "dev": disk, "mnt_dev": f"/dev/{disk}1",
+                              "mnt": f"/mnt/VV/{share}"}) + "</id>"
+
+
+def document(targets, luns):
+    """The settings of so many targets with so many LUNs each."""
+    ids = "".join("<id>" + elements({"target": name_of(n), **KEYS}) + f"<lun><count>{luns}</count>" +
+                  "".join(lun(n, m) for m in range(1, luns + 1)) + "</lun></id>" for n in range(1, targets + 1))
+    head = elements({"ver": 1, "count": targets, "total_lun_count": targets * luns})
+    return f"<config><iscsi><initiator>{head}{ids}</initiator></iscsi></config>"
+
+
+def sessions(targets):
+    return "".join(f"tcp: [{n}] 10.9.0.2:3260,1 {name_of(n)} (non-flash)\n" for n in range(1, targets + 1))
+
+
+def sessions_in_detail(targets, luns):
+    text = ""
+    for n in range(1, targets + 1):
+        text += (f"Target: {name_of(n)} (non-flash)\n\tCurrent Portal: 10.9.0.2:3260,1\n"
+                 f"\t\tiSCSI Session State: LOGGED_IN\n\t\tHost Number: {n}\tState: running\n")
+        for m in range(1, luns + 1):
+            text += (f"\t\tscsi{n} Channel 00 Id 0 Lun: {m}\n"
+                     f"\t\t\tAttached scsi disk {disk_of(n, m)}\t\tState: running\n")
+    return text
+
+
+def wide(nodes, value="a value of thirty-two characters"):
+    """A settings document of so many nodes, at most 4,000 of one name side by side, below /bulk/a:N/b:M."""
+    full, rest = divmod(nodes, 4000)
+    folders = [4000] * full + ([rest] if rest else [])
+    return "<config><bulk>" + "".join("<a>" + f"<b>{value}</b>" * count + "</a>" for count in folders) + "</bulk></config>"
