@@ -15,12 +15,12 @@ locale_t utf8_locale() {
   return locale;
 }
 
-// How a character begins that takes N bytes: its first byte, the bits of it that tell so, the smallest
-// character that needs N bytes.
+// How a character begins that takes N bytes, from 2 on: its first byte, the bits of it that tell so, the
+// smallest character that needs N bytes.
 constexpr struct {
   unsigned char first, mask;
   wchar_t smallest;
-} kForms[] = {{0x00, 0x80, 0}, {0xc0, 0xe0, 0x80}, {0xe0, 0xf0, 0x800}, {0xf0, 0xf8, 0x10000}};
+} kForms[] = {{0xc0, 0xe0, 0x80}, {0xe0, 0xf0, 0x800}, {0xf0, 0xf8, 0x10000}};
 
 bool is_character(wchar_t character) {
   return character < 0xd800 || (character > 0xdfff && character <= 0x10ffff);
@@ -29,8 +29,12 @@ bool is_character(wchar_t character) {
 // Reads the character at the front of `text`. Returns the bytes that it takes, 0 when there is none.
 size_t first_character(std::string_view text, wchar_t& character) {
   const auto first = static_cast<unsigned char>(text.front());
-  for (size_t size = 1; size <= std::size(kForms); ++size) {
-    const auto& form = kForms[size - 1];
+  if (first < 0x80) {
+    character = first;
+    return 1;
+  }
+  for (size_t size = 2; size < 2 + std::size(kForms); ++size) {
+    const auto& form = kForms[size - 2];
     if ((first & form.mask) != form.first) continue;
     if (text.size() < size) return 0;
     character = first & ~form.mask;
@@ -61,6 +65,7 @@ bool is_plain(std::string_view bytes, const std::wstring& characters, size_t at)
 
 bool decode(std::string_view text, std::wstring& characters) {
   characters.clear();
+  characters.reserve(text.size());
   while (!text.empty()) {
     wchar_t character = 0;
     const size_t size = first_character(text, character);
@@ -89,8 +94,9 @@ bool is_invisible(wchar_t character) {
                  {0x2060, 0x206f},  {0x3164, 0x3164}, {0xfe00, 0xfe0f},   {0xfeff, 0xfeff},
                  {0xffa0, 0xffa0},  {0xfff0, 0xfffb}, {0x1bca0, 0x1bca3}, {0x1d173, 0x1d17a},
                  {0xe0000, 0xe0fff}};
-  for (const auto& range : kRanges) {
-    if (character >= range.first && character <= range.last) return true;
+  for (const auto& range : kRanges) {  // in their order
+    if (character < range.first) return false;
+    if (character <= range.last) return true;
   }
   return false;
 }
