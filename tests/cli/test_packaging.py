@@ -291,6 +291,13 @@ def test_what_a_unit_starts_is_installed(path):
         assert program.name in places[str(program.parent)]
 
 
+def test_a_unit_that_looks_at_volumes_may_write_to_them():
+    """A strict ProtectSystem makes every mount read-only in the unit: each volume would look as if it had become so."""
+    assert Unit("remvol-metrics.service")["Service"]["ProtectSystem"] == "strict"
+    text = (PACKAGING / "units/remvol-metrics.service").read_text()
+    assert re.search(r"^ReadWritePaths=-/mnt/VV$", text, re.M)
+
+
 # --- completion ---
 
 

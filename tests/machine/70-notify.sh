@@ -8,7 +8,12 @@ NEWS=/var/lib/news
 told() { grep -qsx "$2" "$NEWS/$1"; }
 
 # mailed EVENT SHARE: a mail says so.
-mailed() { grep -lsx "Subject: $1 on $(hostname)" $NEWS/mail.* | xargs -r grep -qs "^Volume $2: "; }
+mailed() {
+    for mail in $(grep -lsx "Subject: $1 on $(hostname)" $NEWS/mail.*); do
+        grep -q "^Volume $2: " "$mail" && return 0
+    done
+    return 1
+}
 
 mkdir -p $NEWS /etc/remvol/events.d
 printf '#!/bin/sh\ncat >%s/mail.$$\n' $NEWS >/usr/sbin/sendmail
@@ -47,8 +52,11 @@ mount -o remount,rw /mnt/VV/Music
 say "metrics"
 mkdir -p /var/lib/prometheus/node-exporter
 systemctl enable --now remvol-metrics.timer
+# What the unit sees of the volumes is what everybody sees: none is read-only because the unit may not write.
 has_metrics() { grep -q '^remvol_volume_seconds_since_change{share="Photos"' /var/lib/prometheus/node-exporter/remvol.prom; }
 wait_for 120 has_metrics
+expect "a volume that is well is so in the metrics" \
+    grep -q '^remvol_volume_healthy{share="Photos".* 1$' /var/lib/prometheus/node-exporter/remvol.prom
 
 say "what the documents tell an operator to do"
 expect_has "the units" remvol-keeper.service "$(systemctl status 'remvol*')"
