@@ -82,6 +82,12 @@ vv_works "Archive is reached at 10.9.1.2:3260" rename-portal Archive --portal 10
 vv_works "Archive is mounted" connect Archive
 expect "the file is there" test -e /mnt/VV/Archive/new
 
+# A file system that the kernel cannot mount: it says why.
+vv_works "Archive is disconnected" disconnect Archive
+dd if=/dev/zero of="$(lun_file 2 1)" bs=4k seek=257 count=4 conv=notrunc 2>/dev/null
+vv_fails 1 "step: mount" connect Archive
+expect_has "what the kernel says" "said: kernel: EXT4-fs ($(disk_of ${T}2 1)1): " "$(cat /tmp/vv.err)"
+
 # A target that does not answer any more, and a LUN that the storage server takes away.
 vv_works "Photos is deleted" delete Photos --yes
 expect_not "it is not mounted" mounted Photos
