@@ -65,8 +65,13 @@ bool tree_present(const char* key) {
   return tree_read(key, value);
 }
 
+bool tree_read_surely(const char* key, char* buffer, size_t size) {
+  return tree_read(key, buffer, size) || (errno != ENODATA && tree_read(key, buffer, size));
+}
+
 bool tree_present_surely(const char* key) {
-  return tree_present(key) || (errno != ENODATA && tree_present(key));
+  char value[256];
+  return tree_read_surely(key, value, sizeof value);
 }
 
 bool tree_is_missing(const char* key, const char* present) {

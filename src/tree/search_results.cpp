@@ -39,9 +39,8 @@ int publish_lun(const char* socket, const LunNode* lun, int k, int dbidx, Caller
 
 bool share_is_used_in(int dbidx, const char* share) {
   for (int m = 1; m <= kMaxLunsPerTarget; m++) {
-    const KeyText key(key::kLunShare, dbidx, m);
     char stored[256];
-    if (!tree_read(key, stored) && !tree_read(key, stored)) return false;  // one read may fail
+    if (!tree_read_surely(KeyText(key::kLunShare, dbidx, m), stored, sizeof stored)) return false;
     if (strcmp(stored, share) == 0) return true;
   }
   return false;

@@ -43,6 +43,21 @@ TEST_F(Access, ASlotIsFreeWhenMissingOrEmptyAlone) {
   EXPECT_FALSE(tree_slot_is_free("/odd"));
 }
 
+// A rule gives -1 without errno, as a read that failed does.
+TEST_F(Access, AReadThatMayHaveFailedIsDoneAgain) {
+  fakes::tree_set({{"/k", "v"}});
+  fakes::on("ktreec_get_wb", "/k").returns(-1).times(1);
+  EXPECT_TRUE(tree_present_surely("/k"));
+  fakes::on("ktreec_get_wb", "/k").returns(-1).times(1);
+  EXPECT_FALSE(tree_is_missing("/k", "/k"));
+}
+
+TEST_F(Access, WhatTheTreeSaysIsMissingIsAskedForOnce) {
+  fakes::on("ktreec_get_wb", "/k").text("v").returns(1).skip(1);  // it is there at a second look
+  EXPECT_FALSE(tree_present_surely("/k"));
+  EXPECT_TRUE(tree_present_surely("/k"));
+}
+
 TEST_F(Access, AWriteIsTriedThreeTimes) {
   fakes::on("ktreec_set", "/a").returns(-1).times(2);
   EXPECT_EQ(tree_write_with_tries("/a", "1"), 0);
