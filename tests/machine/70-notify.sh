@@ -64,7 +64,7 @@ expect_has "their messages" remvol-events "$(journalctl --no-pager -u 'remvol*')
 journalctl --no-pager -t winshare_reload
 expect_has "the listener" "the connection is lost" "$(journalctl --no-pager -b -u remvol-events)"
 journalctl --no-pager -b -u remvol-keeper
-yes '' | adduser --no-create-home --disabled-login maria >/dev/null
+printf '\n\n\n\n\ny\n' | adduser --no-create-home --disabled-login maria >/dev/null
 printf 'secret\nsecret\n' | smbpasswd -s -a maria
 printf '[Photos]\nusers = maria, @family\n' >/etc/remvol/shares.conf
 winshare_reload; macshare_reload
