@@ -1,4 +1,4 @@
-# timeout: 260
+# timeout: 600
 # The front end for a person, against a real target: from a portal's address to a share, and what it says when it fails.
 T=iqn.2026-01.org.example:t
 says() { vv "$@" >/tmp/vv.out 2>/tmp/vv.err; }
