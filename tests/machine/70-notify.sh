@@ -79,4 +79,4 @@ wait_for 60 vvstat Music
 expect_equal "a file of the volume that is back" "text of Music" "$(cat /mnt/VV/Music/file)"
 printf '[Match]\nMACAddress=00:90:a9:1b:2c:3d\n\n[Link]\nName=egiga0\n' >/etc/systemd/network/10-egiga0.link
 update-initramfs -u
-expect_has "the early system" etc/systemd/network/10-egiga0.link "$(lsinitramfs /initrd.img)"
+expect_has "the early system" 10-egiga0.link "$(lsinitramfs "/boot/initrd.img-$(uname -r)")"
