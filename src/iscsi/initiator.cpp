@@ -20,6 +20,7 @@
 #include "tree/access.h"
 #include "tree/keys.h"
 #include "tree/settings_file.h"
+#include "tree/slots.h"
 #include "tree/state.h"
 #include "upgrade/remvol_ver_upgrade.h"
 #include "volume/session_volumes.h"
@@ -102,8 +103,11 @@ void write_daemon_configuration(Caller caller) {
   LOG_AT(caller, 0, "write %s failed", kIscsidConf);
 }
 
-// Returns the exit status of the command that loads `file` into the tree.
+// Returns the exit status of the command that loads `file` into the tree, which moves all slots at once: a
+// run that has found them empty a moment ago must not take them for garbage.
 int load_tree(const char* file, Caller caller) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  slots_move();
   return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", main_socket, file), caller));
 }
 

@@ -59,10 +59,11 @@ int _refresh_target(TargetEntry* entry, SlotsHeld* held, Caller caller) {
   return kOk;
 }
 
-// Returns whether the slot was nameless and is gone.
+// Returns whether the slot was nameless and is gone. The tree is asked for the name anew: what this run has
+// read before is believed although a person at ktreec may have stored a target since.
 bool _delete_nameless_slot(int slot, Caller caller) {
   const SlotsHeld held(SlotsHeld::kChange);
-  if (is_target_stored_at(slot)) return false;
+  if (tree_present(KeyText(key::kTargetName, slot))) return false;
   const KeyText path(key::kTarget, slot);
   if (delete_slot(path) == kOk) return true;
   LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", path.c_str());
@@ -110,7 +111,7 @@ void _prune_slots_behind(int count, Caller caller = Caller()) {
   int slot = count + 1;
   for (int visited = count; visited < kMaxTargets; visited++) {
     if (!tree_present(KeyText(key::kTargetStatus, slot))) return;
-    if (!is_target_slot_free(slot)) {
+    if (!tree_slot_is_free(KeyText(key::kTargetName, slot))) {  // asked for anew, as above
       slot++;
       continue;
     }

@@ -14,7 +14,7 @@ namespace remvol {
 
 // Keeps the slots as they are while it lives. Runs that use them share this; one that adds or deletes slots
 // has it alone. It may be taken again inside of itself, but not changed from using to changing. Held for some
-// reads and writes of the tree, never while a command runs.
+// reads and writes of the tree, never while a command runs but that which loads the tree.
 class SlotsHeld {
  public:
   enum Purpose { kUse, kChange };
@@ -67,8 +67,8 @@ class HeldSlot {
 [[nodiscard]] bool is_target_slot_free(int n);
 [[nodiscard]] bool is_lun_slot_free(int n, int m);
 
-// With the slots held for a change, and before this run stores or deletes one: nobody believes any more what
-// was read before.
+// With the slots held for a change, and before this run stores, deletes or loads one: nobody believes any
+// more what was read before.
 void slots_move();
 
 // Deletes the slot of a target or a LUN at `path`, with the slots held for a change: those behind it move

@@ -170,6 +170,20 @@ def test_settings_that_are_lost_come_from_the_flash(bare_box, saved):
         assert kept.stat().st_mode & 0o777 == 0o600
 
 
+@pytest.mark.parametrize("source", [SAVED, COPY])
+def test_what_was_read_of_the_slots_before_settings_are_loaded_is_believed_no_more(bare_box, source):
+    box = bare_box
+    appliance(box)
+    box.path("/etc/NAS_CFG").mkdir()
+    box.write(source, settings("saved"))
+    box.hook("system", f"ktreec -S /var/run/ktree_sock_vv -l {source}", through=True, times=1,
+             effect="cd /run/remvol && stat -c %s slots.lock >/root/moves && ! flock -n slots.lock true && touch /root/held")
+    init(box)
+    assert prefix(box) == "saved"
+    assert box.path("/root/held").exists()
+    assert int(box.path("/root/moves").read_text()) >= 1
+
+
 def test_damaged_settings_without_a_copy_are_kept(bare_box):
     box = bare_box
     appliance(box)

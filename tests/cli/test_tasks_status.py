@@ -140,6 +140,16 @@ class TestBrokenSlots:
     def names(self, site):
         return [site.target("target", n) for n in range(1, 9)]
 
+    @pytest.mark.parametrize("count", [1, 0])
+    def test_a_slot_that_has_got_a_name_meanwhile_stays(self, site, box, count):
+        """The tree is loaded by hand, which asks for no lock, behind the first look at the slots."""
+        self.broken(site, 1)
+        box.tree.set(f"{INITIATOR}/count", count)
+        box.hook("ktreec_get_wb", f"{INITIATOR}/count", through=True, skip=1, times=1,
+                 effect=f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/id:1/target iqn.t1")
+        assert status(box).status == 0
+        assert site.target("target") == "iqn.t1"
+
     def test_a_slot_without_a_name_is_deleted_and_its_successor_visited_next(self, site, box):
         site.store("iqn.t1")
         self.broken(site, 2, ip="10.9.0.2")
