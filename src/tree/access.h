@@ -50,8 +50,8 @@ template <size_t N>
 // Returns whether `key` is present.
 [[nodiscard]] bool tree_present(const char* key);
 
-// The same, for what counts, or seems free and is to be written to: where a read may have failed, it is looked
-// at once more.
+// The same, for what counts, or seems free and is to be written to: where a read may have failed, it is
+// looked at once more.
 [[nodiscard]] bool tree_read_surely(const char* key, char* buffer, size_t size);
 [[nodiscard]] bool tree_present_surely(const char* key);
 
