@@ -11,6 +11,11 @@ std::string connect(const Target& target) {
   return connect_command(target.name);
 }
 
+// A connection alone leaves what is mounted as it is.
+std::string mount_anew(const Target& target) {
+  return "remvol --disconnect -n " + quoted(target.name) + " && " + connect(target);
+}
+
 // The tool stores that a target is not to be connected when somebody disconnects it, but also when a login
 // fails that somebody asked for.
 bool is_wanted(const Target& target) {
@@ -18,6 +23,7 @@ bool is_wanted(const Target& target) {
          target.connect_state == kConnectError;
 }
 
+constexpr char kRunning[] = "Running";  // the tool's text; more may follow
 constexpr char kHealsItself[] = "look at the network and the storage server; it heals by itself";
 
 // It stores so as well when a session shows no disk at start-up; the volumes' state alone tells that from a
@@ -77,11 +83,15 @@ Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts
   if (volume.volume_state == kBeingCreated)
     return {Ailment::kBusy, "Creating", "is being created", "wait", ""};
   if (!facts.mounted) return problem_of_unmounted(target, volume);
+  if (facts.disk_lost)
+    return {Ailment::kFailed, "No Disk", "its disk is gone, though its target is connected",
+            "have it mounted anew", mount_anew(target)};
   // A write-protected LUN is read-only from the beginning, and the tree says so.
   if (facts.read_only && !(facts.disk_read_only && volume.read_only))
     return {Ailment::kReadOnly, "Read Only",
             "became read-only: its file system has errors, or the LUN was write-protected",
-            "disconnect it, check its file system with e2fsck, connect it again", connect(target)};
+            "have it mounted anew; if it becomes so again, check its file system with e2fsck",
+            mount_anew(target)};
   return kNone;
 }
 
@@ -93,9 +103,11 @@ Row row_of(const Target& target, const TargetFacts& facts) {
   return row;
 }
 
-// What the tree says of a volume is kept unless the volume is not as well as it says.
-std::string status_of(const Volume& volume, const Problem& problem) {
-  const bool tells_so = problem.ailment == Ailment::kNone || !volume.status.starts_with("Running");
+// What the tree says of a volume is kept unless the volume is not as well as it says, or writable by now.
+std::string status_of(const Volume& volume, const VolumeFacts& facts, const Problem& problem) {
+  const bool runs = volume.status.starts_with(kRunning);
+  if (runs && problem.ailment == Ailment::kNone && facts.mounted && !facts.read_only) return kRunning;
+  const bool tells_so = problem.ailment == Ailment::kNone || !runs;
   return tells_so && !volume.status.empty() ? volume.status : problem.status;
 }
 
@@ -116,7 +128,7 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
   if (!row.wanted) row.problem = kNone;
   const bool lost = !row.healthy();
   if (row.wanted && !lost) row.problem = problem_of(target, volume, facts);
-  row.status = lost ? row.problem.status : status_of(volume, row.problem);
+  row.status = lost ? row.problem.status : status_of(volume, facts, row.problem);
   return row;
 }
 

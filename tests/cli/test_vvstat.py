@@ -131,6 +131,8 @@ def test_somebody_who_may_not_read_the_tree_is_told(example):
 # --- what is wrong ---
 
 CONNECT = f"remvol --connect -n {T1_NAME}"
+MOUNT_ANEW = f"remvol --disconnect -n {T1_NAME} && {CONNECT}"
+BECAME_READ_ONLY = "became read-only: its file system has errors, or the LUN was write-protected"
 FORMAT = f"remvol --format -n {T1_NAME} -l 0"
 HEALS = "look at the network and the storage server; it heals by itself"
 
@@ -229,8 +231,54 @@ def test_a_volume_that_became_read_only(example, right, disk, healthy):
     assert told["ro"] is True and told["healthy"] is healthy
     assert vvstat(example).status == (0 if healthy else 1)
     if not healthy:
-        check_problem(example, "Read Only", "became read-only: its file system has errors, or the LUN was write-protected",
-                      CONNECT)
+        check_problem(example, "Read Only", BECAME_READ_ONLY, MOUNT_ANEW)
+
+
+def test_a_volume_that_the_tree_takes_for_read_only_is_what_its_mount_is(example):
+    change(example, {"lun/id:1/vol_access_right": "0", "lun/id:1/status": "Running ( Read Only )"})
+    told = volumes(example)[0]
+    assert (told["status"], told["ro"], told["tree-status"]) == ("Running", False, "Running ( Read Only )")
+    run(example, "/bin/mount", "-o", "remount,ro", "/mnt/VV/Backup")
+    example.write("/sys/class/block/sdb/ro", "1\n")
+    assert volumes(example)[0]["status"] == "Running ( Read Only )" and vvstat(example).status == 0
+
+
+@pytest.fixture
+def on_a_disk(example):
+    """The first volume is an ext4 on a real disk; the kernel's name of that."""
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    example.disk("sdb", 64 << 20)
+    run(example, "/sbin/mke2fs", "-q", "-t", "ext4", "/dev/sdb")
+    run(example, "/bin/mount", "-o", "errors=remount-ro", "/dev/sdb", "/mnt/VV/Backup")
+    number = example.run(["stat", "-c", "%Hr:%Lr", "/dev/sdb"]).stdout.strip()
+    yield os.path.basename(os.readlink(f"/sys/dev/block/{number}"))
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+
+
+def test_a_file_system_that_refuses_writes_though_its_mount_does_not_say_so(example, on_a_disk):
+    assert vvstat(example).status == 0
+    pathlib.Path(f"/sys/fs/ext4/{on_a_disk}/trigger_fs_error").write_text("an error\n")
+    assert "ro" not in example.run(["findmnt", "-no", "OPTIONS", "/mnt/VV/Backup"]).stdout.strip().split(",")
+    check_problem(example, "Read Only", BECAME_READ_ONLY, MOUNT_ANEW)
+    assert volumes(example)[0]["ro"] is True
+
+
+def test_what_is_said_of_a_lost_connection_asks_no_disk(example, on_a_disk):
+    pathlib.Path(f"/sys/fs/ext4/{on_a_disk}/trigger_fs_error").write_text("an error\n")
+    session(example, 3, T1_NAME, "FAILED")
+    traced = example.run(["strace", "-f", "-e", "trace=openat", "vvstat"], env={"LD_PRELOAD": None}).stderr
+    assert "O_TMPFILE" not in traced
+
+
+def test_a_disk_that_is_gone_below_a_mount(example, on_a_disk):
+    run(example, "/bin/mount", "-t", "tmpfs", "disks", "/sys/dev/block")
+    check_problem(example, "No Disk", "its disk is gone, though its target is connected", MOUNT_ANEW)
+
+
+def test_a_file_system_with_errors_that_takes_writes_is_well(example, on_a_disk):
+    run(example, "/bin/mount", "-o", "remount,errors=continue", "/mnt/VV/Backup")
+    pathlib.Path(f"/sys/fs/ext4/{on_a_disk}/trigger_fs_error").write_text("an error\n")
+    assert vvstat(example).status == 0
 
 
 def test_a_volume_that_the_tree_takes_for_lost_is_well_when_it_is(example):
