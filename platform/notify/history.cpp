@@ -36,6 +36,10 @@ Kind kind_of(Ailment ailment) {
   }
 }
 
+unsigned bit_of(Ailment ailment) {
+  return 1U << static_cast<unsigned>(ailment);
+}
+
 bool is_formatting(const Row& row) {
   return row.volume != nullptr && row.volume->format_state == vvstat::kFormatRunning;
 }
@@ -59,14 +63,14 @@ void compare_health(const Row& row, time_t now, Past& past, std::vector<Event>& 
   past.formatting = is_formatting(row) || (past.formatting && ailment == Ailment::kBusy);
   if (formatted) events.push_back(event_of(Kind::kFormatDone, row, "its format is done"));
   if (!row.wanted) {
-    past.told = Ailment::kNone;
+    past.told = 0;
   } else if (ailment == Ailment::kNone) {
-    if (past.told == Ailment::kNone || now - past.since < kSettled) return;
+    if (past.told == 0 || now - past.since < kSettled) return;
     events.push_back(event_of(Kind::kBack, row, "is well again"));
-    past.told = Ailment::kNone;
-  } else if (ailment != Ailment::kBusy && ailment != past.told) {
+    past.told = 0;
+  } else if (ailment != Ailment::kBusy && (past.told & bit_of(ailment)) == 0) {
     events.push_back(event_of(kind_of(ailment), row, row.problem.what));
-    past.told = ailment;
+    past.told |= bit_of(ailment);
   }
 }
 

@@ -23,9 +23,9 @@ struct Event {
 
 std::string name_of(Kind kind);
 
-// Compares the rows with the history, brings it up to date, and returns what is to be told. A volume that
-// gets worse is told of at once; that it is well again when it has been so for a minute: a connection that
-// comes and goes is one loss and one return. Volumes that are no more are forgotten.
+// Compares the rows with the history, brings it up to date, and returns what is to be told. What is
+// wrong is told at once, and not again before the volume has been well for a minute, which is told then: a
+// connection that comes and goes is one loss and one return. Volumes that are no more are forgotten.
 std::vector<Event> compare(const std::vector<vvstat::Row>& rows, time_t now, History& history);
 
 }  // namespace notify

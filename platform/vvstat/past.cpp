@@ -14,9 +14,7 @@ namespace {
 // Between a volume's name and its last error; no printable text holds it.
 constexpr char kMark = '\t';
 
-bool is_ailment(unsigned number) {
-  return number <= static_cast<unsigned>(Ailment::kFailed);
-}
+constexpr unsigned kAilments = static_cast<unsigned>(Ailment::kFailed) + 1;
 
 // Reads a last error, as "TIME TEXT".
 void take_error(const std::string& text, Past& past) {
@@ -41,7 +39,7 @@ std::string text_of(const History& history) {
   for (const auto& [key, past] : history) {
     char numbers[64];
     snprintf(numbers, sizeof numbers, "%u %lld %u %u %u ", static_cast<unsigned>(past.now),
-             static_cast<long long>(past.since), static_cast<unsigned>(past.told), past.formatting ? 1U : 0U,
+             static_cast<long long>(past.since), past.told, past.formatting ? 1U : 0U,
              past.nearly_full ? 1U : 0U);
     text.append(numbers).append(key);
     if (!past.error.empty()) {
@@ -63,13 +61,13 @@ History history_of(std::string_view text) {
     int at = 0;
     if (sscanf(line.c_str(), "%u %lld %u %u %u %n", &now, &since, &told, &formatting, &nearly_full, &at) !=
             5 ||
-        at == 0 || line.size() == static_cast<size_t>(at) || !is_ailment(now) || !is_ailment(told))
+        at == 0 || line.size() == static_cast<size_t>(at) || now >= kAilments || told >> kAilments != 0)
       continue;
     const size_t name = static_cast<size_t>(at), mark = line.find(kMark, name);
     Past& past = history[line.substr(name, mark - name)];
     past = {static_cast<Ailment>(now),
             static_cast<time_t>(since),
-            static_cast<Ailment>(told),
+            told,
             formatting != 0,
             nearly_full != 0,
             "",

@@ -15,12 +15,12 @@ namespace vvstat {
 
 struct Past {
   Ailment now = Ailment::kNone;
-  time_t since = 0;               // it has been so
-  Ailment told = Ailment::kNone;  // what was last told of it
-  bool formatting = false;        // it was being formatted
-  bool nearly_full = false;       // and that was told
-  std::string error;              // what was wrong last, printable text; empty: nothing was
-  time_t error_time = 0;          // that began
+  time_t since = 0;          // it has been so
+  unsigned told = 0;         // what was told of it since it was well: a bit for each ailment
+  bool formatting = false;   // it was being formatted
+  bool nearly_full = false;  // and that was told
+  std::string error;         // what was wrong last, printable text; empty: nothing was
+  time_t error_time = 0;     // that began
   bool operator==(const Past&) const = default;
 };
 

@@ -78,6 +78,20 @@ TEST_F(Told, OneLossHoweverOftenItFlaps) {
   EXPECT_EQ(at(1060, Ailment::kNone), Names{"back"});
 }
 
+// The file system is read-only each time that the connection was away for long, until it is mounted anew.
+TEST_F(Told, OneLossAndOneReadOnlyHoweverOftenItFlaps) {
+  EXPECT_EQ(at(1, Ailment::kLost), Names{"lost"});
+  EXPECT_EQ(at(2, Ailment::kReadOnly), Names{"read-only"});
+  for (time_t time = 10; time < 1000; time += 50) {
+    EXPECT_EQ(at(time, Ailment::kNone), Names{});
+    EXPECT_EQ(at(time + 20, Ailment::kLost), Names{});
+    EXPECT_EQ(at(time + 30, Ailment::kReadOnly), Names{});
+  }
+  at(1000, Ailment::kNone);
+  EXPECT_EQ(at(1060, Ailment::kNone), Names{"back"});
+  EXPECT_EQ(at(1100, Ailment::kLost), Names{"lost"});
+}
+
 TEST_F(Told, WhatGetsWorseOnTheWay) {
   EXPECT_EQ(at(0, Ailment::kLost), Names{"lost"});
   EXPECT_EQ(at(1, Ailment::kReadOnly), Names{"read-only"});
@@ -145,7 +159,7 @@ TEST_F(Told, TheHistoryIsKeptAsText) {
   row_.used = 99;
   at(5, Ailment::kReadOnly);
   const std::string text = text_of(history_);
-  EXPECT_EQ(text, "3 1000005 3 0 1 iqn.t1 1 two words\\x0A\\x1B\t1000005 is ill\n");
+  EXPECT_EQ(text, "3 1000005 12 0 1 iqn.t1 1 two words\\x0A\\x1B\t1000005 is ill\n");
   EXPECT_EQ(history_of(text), history_);
 }
 
@@ -201,10 +215,10 @@ TEST_F(Told, NothingIsKnownOfAStranger) {
 }
 
 TEST(History, ALineOfAnEarlierVersionHasNoError) {
-  const History history = history_of("3 7 3 0 1 iqn.t1 1 two words\n");
+  const History history = history_of("3 7 8 0 1 iqn.t1 1 two words\n");
   ASSERT_EQ(history.size(), 1U);
   EXPECT_EQ(history.begin()->first, "iqn.t1 1 two words");
-  EXPECT_EQ(history.begin()->second, (Past{Ailment::kReadOnly, 7, Ailment::kReadOnly, false, true, "", 0}));
+  EXPECT_EQ(history.begin()->second, (Past{Ailment::kReadOnly, 7, 8, false, true, "", 0}));
 }
 
 TEST(History, AnErrorWithoutItsTimeIsLeftOut) {
@@ -214,7 +228,7 @@ TEST(History, AnErrorWithoutItsTimeIsLeftOut) {
 
 TEST(History, ALineThatIsNoneIsLeftOut) {
   for (const char* text :
-       {"", "\n", "x", "1 2 3", "9 1 0 0 0 k\n", "0 1 9 0 0 k", "-1 0 0 0 0 k", "0 0 0 0 0 "})
+       {"", "\n", "x", "1 2 3", "9 1 0 0 0 k\n", "0 1 32 0 0 k", "-1 0 0 0 0 k", "0 0 0 0 0 "})
     EXPECT_TRUE(history_of(text).empty()) << text;
   EXPECT_EQ(history_of("rubbish\n1 7 0 0 0 a b\n2 8").size(), 1U);
 }
