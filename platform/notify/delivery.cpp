@@ -2,9 +2,12 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <poll.h>
 #include <spawn.h>
+#include <strings.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <systemd/sd-journal.h>
@@ -18,11 +21,13 @@
 #include <vector>
 
 #include "report.h"
+#include "utf8.h"
 
 namespace notify {
 namespace {
 
 constexpr char kFolder[] = "/etc/remvol/events.d";
+constexpr int kPatience = 1000;  // milliseconds that a program is waited for before the next one starts
 
 struct Form {
   int priority;            // syslog(3)
@@ -60,29 +65,68 @@ bool log_event(const Event& event) {
   return result >= 0 || complain("journal", strerror(-result));
 }
 
-// Runs the words under timeout(1), which ends the program and what it started; `input` is its standard input,
-// or negative for none.
-bool run(std::vector<std::string> words, int input = -1) {
-  const std::string program = words.front();
-  words.insert(words.begin(), {"timeout", "--kill-after=2", "30"});
-  std::vector<char*> argv;
-  for (std::string& word : words) argv.push_back(word.data());
-  argv.push_back(nullptr);
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-  if (input >= 0) posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
-  pid_t child = -1;
-  const int error = posix_spawnp(&child, argv[0], &actions, nullptr, argv.data(), environ);
-  posix_spawn_file_actions_destroy(&actions);
-  if (error != 0) return complain(program, strerror(error));
-  int status = 0;
-  while (waitpid(child, &status, 0) < 0 && errno == EINTR) continue;
-  if (WIFEXITED(status) && WEXITSTATUS(status) == 0) return true;
-  constexpr int kTimedOut = 124, kKilled = 137;
-  const int exit = WIFEXITED(status) ? WEXITSTATUS(status) : kKilled;
-  return complain(program, exit == kTimedOut || exit == kKilled ? "took longer than 30 seconds" : "failed");
-}
+// Programs at work. One that takes its time is left to itself, so that it holds nothing up.
+class Runs {
+ public:
+  // Runs the words under timeout(1), which ends the program and what it started; `input` is its standard
+  // input, or negative for none.
+  void start(std::vector<std::string> words, int input = -1) {
+    const std::string program = words.front();
+    words.insert(words.begin(), {"timeout", "--kill-after=2", "30"});
+    std::vector<char*> argv;
+    for (std::string& word : words) argv.push_back(word.data());
+    argv.push_back(nullptr);
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    if (input >= 0) posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
+    pid_t child = -1;
+    const int error = posix_spawnp(&child, argv[0], &actions, nullptr, argv.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    if (error != 0)
+      note(complain(program, strerror(error)));
+    else if (ends_soon(child))
+      take_end({program, child});
+    else
+      running_.push_back({program, child});
+  }
+
+  void note(bool good) { good_ = good_ && good; }
+
+  // Waits for those that are still at work. Returns false when something failed.
+  bool end() {
+    for (const Running& running : running_) take_end(running);
+    running_.clear();
+    return good_;
+  }
+
+ private:
+  struct Running {
+    std::string program;
+    pid_t process;
+  };
+
+  static bool ends_soon(pid_t process) {
+    const int handle = static_cast<int>(syscall(SYS_pidfd_open, process, 0));
+    pollfd ended{handle, POLLIN, 0};
+    const bool soon = poll(&ended, 1, kPatience) > 0;
+    if (handle >= 0) close(handle);
+    return soon;
+  }
+
+  void take_end(const Running& running) {
+    int status = 0;
+    while (waitpid(running.process, &status, 0) < 0 && errno == EINTR) continue;
+    if (WIFEXITED(status) && WEXITSTATUS(status) == 0) return;
+    constexpr int kTimedOut = 124, kKilled = 137;
+    const int exit = WIFEXITED(status) ? WEXITSTATUS(status) : kKilled;
+    note(complain(running.program,
+                  exit == kTimedOut || exit == kKilled ? "took longer than 30 seconds" : "failed"));
+  }
+
+  std::vector<Running> running_;
+  bool good_ = true;
+};
 
 std::string host_name() {
   char name[HOST_NAME_MAX + 1] = "";
@@ -90,7 +134,7 @@ std::string host_name() {
   return name;
 }
 
-bool mail_event(const Event& event, const Config& config) {
+void mail_event(const Event& event, const Config& config, Runs& runs) {
   std::string text = "From: " + (config.mail_from.empty() ? "root" : config.mail_from) + "\n";
   text.append("To: ").append(config.mail_address).append("\n");
   text.append("Subject: ").append(name_of(event.kind)).append(" on ").append(host_name());
@@ -98,10 +142,10 @@ bool mail_event(const Event& event, const Config& config) {
   text.append(event.message).append("\n\nvvstat -x shows what needs attention.\n");
   const int mail = memfd_create("mail", MFD_CLOEXEC);
   if (mail < 0 || write(mail, text.data(), text.size()) < 0 || lseek(mail, 0, SEEK_SET) < 0)
-    return complain("mail", strerror(errno));
-  const bool sent = run({"sendmail", "-t"}, mail);
-  close(mail);
-  return sent;
+    runs.note(complain("mail", strerror(errno)));
+  else
+    runs.start({"sendmail", "-t"}, mail);
+  if (mail >= 0) close(mail);
 }
 
 // The rule of run-parts(8) for names.
@@ -132,19 +176,24 @@ void put_into_environment(const Event& event) {
   setenv("REMVOL_MESSAGE", event.message.c_str(), 1);
 }
 
-bool run_programs(const Event& event, const Config& config) {
+void run_programs(const Event& event, const Config& config, Runs& runs) {
   put_into_environment(event);
-  bool good = true;
-  if (!config.program.empty())
-    good = run({config.program, name_of(event.kind), event.target, event.share}) && good;
-  for (const std::string& program : programs()) good = run({program}) && good;
-  return good;
+  if (!config.program.empty()) runs.start({config.program, name_of(event.kind), event.target, event.share});
+  for (const std::string& program : programs()) runs.start({program});
 }
 
 std::string rest_of(std::string_view line) {
   const size_t first = line.find_first_not_of(" \t");
   const size_t last = line.find_last_not_of(" \t\r");
   return first == std::string_view::npos ? std::string() : std::string(line.substr(first, last - first + 1));
+}
+
+// Where the value of that word goes; null when there is no such word.
+std::string* place_of(const std::string& word, Config& config) {
+  if (strcasecmp(word.c_str(), "MAILADDR") == 0) return &config.mail_address;
+  if (strcasecmp(word.c_str(), "MAILFROM") == 0) return &config.mail_from;
+  if (strcasecmp(word.c_str(), "PROGRAM") == 0) return &config.program;
+  return nullptr;
 }
 
 }  // namespace
@@ -159,27 +208,25 @@ Config parse_config(std::string_view text) {
     const std::string word = all.substr(0, all.find_first_of(" \t"));
     const std::string value = rest_of(std::string_view(all).substr(word.size()));
     if (word.empty()) continue;
-    std::string* place = word == "MAILADDR"   ? &config.mail_address
-                         : word == "MAILFROM" ? &config.mail_from
-                         : word == "PROGRAM"  ? &config.program
-                                              : nullptr;
-    if (place != nullptr) {
+    std::string* place = place_of(word, config);
+    if (place == nullptr)
+      complain("remvol.conf", ("no such word: " + platform::printable(word)).c_str());
+    else if (value.empty())
+      complain("remvol.conf", (word + " has no value").c_str());
+    else
       *place = value;
-    } else {
-      complain("remvol.conf", ("no such word: " + word).c_str());
-    }
   }
   return config;
 }
 
 bool deliver(const std::vector<Event>& events, const Config& config) {
-  bool good = true;
-  for (const Event& event : events) good = log_event(event) && good;
+  Runs runs;
+  for (const Event& event : events) runs.note(log_event(event));
   if (!config.mail_address.empty()) {
-    for (const Event& event : events) good = mail_event(event, config) && good;
+    for (const Event& event : events) mail_event(event, config, runs);
   }
-  for (const Event& event : events) good = run_programs(event, config) && good;
-  return good;
+  for (const Event& event : events) run_programs(event, config, runs);
+  return runs.end();
 }
 
 }  // namespace notify

@@ -3,6 +3,7 @@
 import os
 import pathlib
 import re
+import signal
 import socket
 import struct
 
@@ -178,7 +179,19 @@ def test_a_program_that_hangs_is_ended(example):  # noqa: F811
     done = notify(example, "--test", timeout=60)
     assert done.status == 1 and f"{PROGRAMS}/1: took longer than 30 seconds" in done.stderr
     assert told(example)[0][0] == "test"
-    assert not any("1000" in argv for argv in example.processes().values())
+    example.wait_until(lambda: not any("1000" in argv for argv in example.processes().values()))
+
+
+def test_a_program_that_hangs_holds_nothing_up(example):  # noqa: F811
+    """Neither the other programs, nor those of other events."""
+    program(example, f"{PROGRAMS}/1", "exec sleep 1000")
+    program(example, f"{PROGRAMS}/2", TELL)
+    notify(example)
+    lose(example)
+    running = example.start(["remvol-notify"], env={"LD_PRELOAD": None})
+    example.wait_until(lambda: len(told(example)) == 2)
+    assert [line[2] for line in told(example)] == ["Backup", "Fotos 日本"]
+    running.kill(signal.SIGTERM)
 
 
 def test_mail(example):  # noqa: F811
@@ -217,9 +230,18 @@ def test_without_a_journal_standard_error_has_the_message(example):  # noqa: F81
     assert (done.status, done.stderr) == (0, "A test of what is told when something happens to a volume\n")
 
 
-def test_an_unknown_word_of_the_configuration_is_named(example):  # noqa: F811
-    example.write(CONFIG, "MAILADR root\n")
-    assert "remvol-notify: remvol.conf: no such word: MAILADR\n" in notify(example, "--test").stderr
+@pytest.mark.parametrize("line, said", [
+    ("MAILADR root", "no such word: MAILADR"), ("MAILADDR=root", "no such word: MAILADDR=root"),
+    ("\x1b[31m root", "no such word: \\x1B[31m"), ("MAILADDR", "MAILADDR has no value"), ("PROGRAM # none", "PROGRAM has no value")])
+def test_a_line_of_the_configuration_that_is_none_is_named(example, line, said):  # noqa: F811
+    example.write(CONFIG, line + "\n")
+    assert f"remvol-notify: remvol.conf: {said}\n" in notify(example, "--test").stderr
+
+
+def test_words_of_the_configuration_may_be_in_small_letters(example):  # noqa: F811
+    example.write(CONFIG, "program /opt/tell\n")
+    program(example, "/opt/tell", TELL)
+    assert notify(example, "--test").status == 0 and told(example)[0][4] == "test"
 
 
 def test_without_the_tree(example, journal):  # noqa: F811
