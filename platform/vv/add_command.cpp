@@ -1,6 +1,5 @@
 #include "job.h"
 #include "search_commands.h"
-#include "secret.h"
 #include "share_name.h"
 #include "utf8.h"
 #include "volume_commands.h"
@@ -110,7 +109,7 @@ int add(const Options& options) {
   }
   if (!find_place(job, portal, target) || !fits_what_is_stored(job, portal, target)) return job.end();
   Credentials credentials;
-  if (!read_credentials(options, credentials)) return kUsage;
+  if (!job.read_credentials(credentials)) return job.end();
   if (credentials.user.empty()) credentials = stored_credentials(target);
   const ToolRun run = job.run(add_arguments(target, options.lun, options.name, portal, credentials), target);
   return tell_added(job, target, run);

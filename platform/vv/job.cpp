@@ -6,6 +6,7 @@
 
 #include "list.h"
 #include "progress.h"
+#include "secret.h"
 #include "terminal.h"
 #include "utf8.h"
 
@@ -77,6 +78,11 @@ bool Job::find_share_or_target() {
   if (target == nullptr || before.share(options.name) != nullptr) return find_share();
   outcome_.target = target->name;
   return true;
+}
+
+bool Job::read_credentials(Credentials& credentials) {
+  std::string why;
+  return vv::read_credentials(options, credentials, why) || refuse(kUsage, why);
 }
 
 bool Job::confirm(const std::string& question) {

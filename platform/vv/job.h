@@ -27,6 +27,9 @@ class Job {
   // The same for a volume alone.
   bool find_share();
 
+  // Fills the credentials as the options say. Returns false after keeping why that cannot be.
+  bool read_credentials(Credentials& credentials);
+
   // Asks, unless the options say that nothing is to be asked. Returns false after keeping that it is refused.
   bool confirm(const std::string& question);
 

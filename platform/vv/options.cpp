@@ -11,6 +11,8 @@
 
 #include "commands.h"
 #include "completion.h"
+#include "output.h"
+#include "utf8.h"
 
 namespace vv {
 namespace {
@@ -104,18 +106,18 @@ int print_help() {
   }
   print_options(nullptr);
   fputs(kHelpEnd, stdout);
-  return kDone;
+  return finish(kDone);
 }
 
 int print_help_of(const Command& command) {
   printf("usage: vv %s [OPTION...] %s\n%s\n", command.name, command.argument, command.help);
   print_options(&command);
-  return kDone;
+  return finish(kDone);
 }
 
 int print_version() {
   puts("vv " REMVOL_VERSION);
-  return kDone;
+  return finish(kDone);
 }
 
 // For the shells.
@@ -138,7 +140,7 @@ bool may_take(const Command& command, int letter, unsigned& given) {
 bool read_lun(std::string_view text, int& lun) {
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), lun);
   if (error == std::errc() && end == text.data() + text.size() && lun >= 0 && lun <= kLastLun) return true;
-  fprintf(stderr, "vv: \"%s\" is no number of a LUN\n", std::string(text).c_str());
+  fprintf(stderr, "vv: \"%s\" is no number of a LUN\n", platform::printable(text).c_str());
   return false;
 }
 
@@ -240,7 +242,7 @@ int read_options(int argc, char** argv, Options& options) {
   if (first == "--complete") return print_completions({argv + 2, argv + argc});
   options.command = argc > 1 ? find_command(argv[1]) : nullptr;
   if (options.command == nullptr) {
-    if (argc > 1) fprintf(stderr, "vv: there is no command \"%s\"\n", argv[1]);
+    if (argc > 1) fprintf(stderr, "vv: there is no command \"%s\"\n", platform::printable(argv[1]).c_str());
     return wrong_usage();
   }
   options.rest = argv + 2;

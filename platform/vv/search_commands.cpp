@@ -10,7 +10,6 @@
 #include "job.h"
 #include "list.h"
 #include "searches.h"
-#include "secret.h"
 #include "utf8.h"
 
 namespace vv {
@@ -99,7 +98,7 @@ int luns(const Options& options) {
   Portal portal;
   Credentials credentials;
   if (!find_portal(job, options.name, portal)) return job.end();
-  if (!read_credentials(options, credentials)) return kUsage;
+  if (!job.read_credentials(credentials)) return job.end();
   if (credentials.user.empty()) credentials = stored_credentials(options.name);
   const SearchTurn turn;
   if (!general_tree_answers(job, turn)) return job.end();

@@ -4,7 +4,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdio>
 #include <cstring>
 
 #include "terminal.h"
@@ -39,22 +38,21 @@ const char* fault_of(const std::string& secret) {
 
 }  // namespace
 
-bool read_credentials(const Options& options, Credentials& credentials) {
+bool read_credentials(const Options& options, Credentials& credentials, std::string& why) {
   if (options.user.empty()) return true;
   credentials.user = options.user;
   const std::string& file = options.password_file;
   if (file.empty()) {
-    if (!ask_secret("Password of " + platform::printable(options.user) + ": ", credentials.secret)) {
-      fputs("vv: no password was typed; where there is no terminal, use --password-file\n", stderr);
+    why = "no password was typed; where there is no terminal, use --password-file";
+    if (!ask_secret("Password of " + platform::printable(options.user) + ": ", credentials.secret))
       return false;
-    }
   } else if (!read_file(file, credentials.secret)) {
-    fprintf(stderr, "vv: %s: %s\n", platform::printable(file).c_str(), strerror(errno));
+    why = platform::printable(file) + ": " + strerror(errno);
     return false;
   }
   const char* fault =
       options.user.size() > kMost ? "the user's name has more than 127 bytes" : fault_of(credentials.secret);
-  if (fault != nullptr) fprintf(stderr, "vv: %s\n", fault);
+  why = fault != nullptr ? fault : "";
   return fault == nullptr;
 }
 

@@ -10,8 +10,9 @@
 namespace vv {
 
 // Fills the credentials with the user of the options and the password that is asked for in the way that they
-// say; leaves them alone when there is no user. Returns false after saying what is wrong.
-bool read_credentials(const Options& options, Credentials& credentials);
+// say; leaves them alone when there is no user. Returns false when it cannot; `why`, printable text, says so
+// then.
+bool read_credentials(const Options& options, Credentials& credentials, std::string& why);
 
 }  // namespace vv
 

@@ -2,7 +2,6 @@
 
 #include "job.h"
 #include "list.h"
-#include "secret.h"
 #include "utf8.h"
 
 namespace vv {
@@ -31,7 +30,7 @@ int password(const Options& options) {
   Job job(options);
   Credentials credentials;
   if (!job.find_share_or_target()) return job.end();
-  if (!read_credentials(options, credentials)) return kUsage;
+  if (!job.read_credentials(credentials)) return job.end();
   const std::string names = mounted_shares(job);
   if (!names.empty() &&
       !job.confirm(names + " goes away for a moment; programs that have files open there are ended. Go on?"))

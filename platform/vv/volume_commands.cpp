@@ -3,7 +3,6 @@
 #include "job.h"
 #include "list.h"
 #include "search_commands.h"
-#include "secret.h"
 #include "utf8.h"
 
 namespace vv {

@@ -12,6 +12,7 @@
 #include "columns.h"
 #include "metrics.h"
 #include "past.h"
+#include "utf8.h"
 #include "verdict.h"
 #include "watch.h"
 
@@ -146,7 +147,7 @@ int show_again(Options options) {
     last = look();
     return page_of(last, options);
   });
-  return exit_status(last);
+  return finish(exit_status(last));
 }
 
 constexpr char kHelp[] =
@@ -191,7 +192,7 @@ int wrong_usage() {
 int take_columns(const char* names, Layout& layout) {
   std::string unknown;
   if (choose_columns(names, layout, unknown)) return kGoOn;
-  fprintf(stderr, "vvstat: there is no column \"%s\"\n", unknown.c_str());
+  fprintf(stderr, "vvstat: there is no column \"%s\"\n", platform::printable(unknown).c_str());
   return wrong_usage();
 }
 

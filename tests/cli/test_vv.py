@@ -332,6 +332,14 @@ def test_a_password_file_that_is_not_there(machine, words):
     assert words() == []
 
 
+@pytest.mark.parametrize("command", [("luns", T1, "--portal", "10.9.0.2"), ("password", "Photos"),
+                                     ("add", "Music", "--lun", "2", "--target", T1)])
+def test_a_password_that_is_none_as_json(photos, command):
+    status, told = photos.says(*command, "--user", "maria", "--password-file", "/none")
+    [outcome] = told["outcomes"]
+    assert (status, outcome["outcome"], outcome["message"]) == (2, "failed", "/none: No such file or directory")
+
+
 def test_a_password_without_a_terminal_to_ask_at(machine, words):
     done = machine.vv("luns", T1, "--portal", "10.9.0.2", "--user", "maria")
     assert done.status == 2 and "use --password-file" in done.stderr
@@ -628,10 +636,17 @@ def test_what_the_tool_prints_does_not_reach_the_terminal_as_it_is(photos):
     assert "\x1b" not in done.stderr and "\\x1B[2Jgone" in done.stderr
 
 
-def test_a_full_disk_is_a_failure(machine):
+@pytest.mark.parametrize("words", ["discover 10.9.0.2", "--help", "add --help", "--version", "add --version"])
+def test_a_full_disk_is_a_failure(machine, words):
     machine.offers(T1)
-    done = machine.box.run(["sh", "-c", "vv discover 10.9.0.2 >/dev/full"])
-    assert done.status == 1 and "write error: No space left on device" in done.stderr
+    done = machine.box.run(["sh", "-c", f"vv {words} >/dev/full"])
+    assert (done.status, done.stderr) == (1, "vv: write error: No space left on device\n")
+
+
+@pytest.mark.parametrize("words", [["\x1b[2J"], ["add", "a", "--lun", "\x1b[2J"]])
+def test_words_that_are_wrong_do_not_reach_the_terminal_as_they_are(box, words):
+    done = box.run(["vv", *words])
+    assert done.status == 2 and "\x1b" not in done.stderr
 
 
 # --- format ---

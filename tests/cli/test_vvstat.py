@@ -473,7 +473,8 @@ def test_chosen_columns(example):
         {"share": "Backup", "use%": 8}, {"share": "Fotos 日本", "use%": 0}, {"share": None, "use%": None}]
 
 
-@pytest.mark.parametrize("names, unknown", [("size,colour", "colour"), ("", ""), ("share,", ""), ("+", ""), ("shar", "shar")])
+@pytest.mark.parametrize("names, unknown", [("size,colour", "colour"), ("", ""), ("share,", ""), ("+", ""), ("shar", "shar"),
+                                            ("\x1b[2J", "\\x1B[2J")])
 def test_a_column_that_does_not_exist(example, names, unknown):
     done = vvstat(example, "-o", names)
     assert (done.status, done.stdout) == (2, "")
@@ -595,7 +596,7 @@ def test_the_usual_options(bare_box, options, status):
     assert told and not silent
 
 
-@pytest.mark.parametrize("options", [[], ["--json"], ["Backup"], ["--help"]])
+@pytest.mark.parametrize("options", [[], ["--json"], ["Backup"], ["--help"], ["--watch"]])
 def test_what_cannot_be_written_is_a_failure(example, options):
     done = example.run(["sh", "-c", '"$@" >/dev/full', "sh", "vvstat", *options], env={"LD_PRELOAD": None})
     assert (done.status, done.stderr) == (2, "vvstat: write error: No space left on device\n")
