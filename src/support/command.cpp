@@ -1,6 +1,7 @@
 #include "support/command.h"
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -12,6 +13,13 @@ int run_command(const char* command, Caller caller, Weight failure) {
   const int status = system(command);
   if (status != 0) LOG_AT(caller, failure, "system() of cmd '%s' failed", command);
   return status;
+}
+
+// Each has some faults at its start. It is the kernel that counts, so whoever runs a command need not.
+long command_mark() {
+  rusage children = {};
+  getrusage(RUSAGE_CHILDREN, &children);
+  return children.ru_minflt;
 }
 
 ErrorsHidden::ErrorsHidden() : kept_(fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, STDERR_FILENO + 1)) {

@@ -11,6 +11,9 @@ namespace remvol {
 // that does not run. Returns the raw status; see wait(2).
 int run_command(const char* command, Caller caller = Caller(), Weight failure = 0);
 
+// Returns a mark of the commands that this run has waited for: another one once a further command has ended.
+[[nodiscard]] long command_mark();
+
 // While it lives, what commands write to standard error goes nowhere: for one whose failure is expected, and
 // of which another way is known.
 class ErrorsHidden {

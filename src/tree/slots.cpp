@@ -5,6 +5,7 @@
 #include <cstring>
 #include <ctime>
 
+#include "support/command.h"
 #include "support/run_lock.h"
 #include "support/text.h"
 #include "tree/access.h"
@@ -39,6 +40,7 @@ bool are_moved = false;   // this run stores or deletes a slot since they are he
 template <size_t N>
 struct Seen {
   enum { kNothing, kMissing, kValue } what;
+  int commands;  // how many had been noticed
   char value[N];
 };
 
@@ -60,6 +62,16 @@ struct SeenWhen {
 
 SeenWhen seen_when;
 
+// What a slot holds is looked at behind a command to see what has become of it meanwhile, by whomever.
+int commands_noticed = 0;
+
+void notice_commands() {
+  static long last_mark = 0;
+  const long mark = command_mark();
+  if (mark != last_mark) commands_noticed++;
+  last_mark = mark;
+}
+
 void forget_seen_slots() {
   memset(seen_slots, 0, sizeof seen_slots);
 }
@@ -74,16 +86,24 @@ void forget_changed_slots() {
   seen_when = present;
 }
 
-// Reads the value at `key`, which defines a slot, or takes it from `seen`; null: nothing is kept of it.
-// Returns what tree_get() does.
+// What was read before the last command is believed by those who count slots and look for a free one, which
+// is looked at again.
+enum class Belief { kSinceCommand, kAny };
+
+// Reads the value at `key`, which defines a slot, or takes it from `seen` while the slots are held; null:
+// nothing is kept of it. Returns what tree_get() does.
 template <size_t N>
-int get_slot_value(const char* key, Seen<N>* seen, Value& value) {
-  if (seen != nullptr && seen->what != seen->kNothing) {
+int get_slot_value(const char* key, Seen<N>* seen, Value& value, Belief belief) {
+  if (!are_locked) seen = nullptr;
+  if (seen != nullptr && seen->what != seen->kNothing &&
+      (belief == Belief::kAny || seen->commands == commands_noticed)) {
     copy_text(value, seen->value);
     return seen->what == seen->kMissing ? -1 : static_cast<int>(strlen(value));
   }
   const int length = tree_get(key, value, sizeof value);
-  if (seen == nullptr || !are_locked) return length;
+  if (seen == nullptr) return length;
+  *seen = {};
+  seen->commands = commands_noticed;
   if (length == -1 && errno == ENODATA && !are_moved) seen->what = seen->kMissing;
   if (length <= 0 || strlen(value) >= N) return length;
   seen->what = seen->kValue;
@@ -103,14 +123,14 @@ int known_lun(int n, int m) {
   return known_slots[n].luns[m] - 1;
 }
 
-int get_target_name(int n, TargetName& name) {
+int get_target_name(int n, TargetName& name, Belief belief) {
   auto* const seen = is_target_slot(n) ? &seen_slots[n].target : nullptr;
-  return get_slot_value(KeyText(key::kTargetName, n), seen, name);
+  return get_slot_value(KeyText(key::kTargetName, n), seen, name, belief);
 }
 
-int get_lun_number(int n, int m, Value& number) {
+int get_lun_number(int n, int m, Value& number, Belief belief) {
   auto* const seen = is_lun_slot(n, m) ? &seen_slots[n].luns[m] : nullptr;
-  return get_slot_value(KeyText(key::kLunNumber, n, m), seen, number);
+  return get_slot_value(KeyText(key::kLunNumber, n, m), seen, number, belief);
 }
 
 bool holds_target(int n, const char* target_name) {
@@ -163,6 +183,7 @@ void SlotsHeld::take() {
   const LockMode mode = purpose_ == kChange ? LockMode::kExclusive : LockMode::kShared;
   are_locked = slots_lock.take_again(kSlotsLock, mode) == LockTry::kTaken;
   forget_changed_slots();
+  notice_commands();
 }
 
 void SlotsHeld::let_go() {
@@ -179,12 +200,12 @@ HeldSlot::HeldSlot(int n, int m, Caller caller)
 }
 
 bool read_target_name(int n, TargetName& name) {
-  return get_target_name(n, name) > 0 && name[0] != '\0';
+  return get_target_name(n, name, Belief::kSinceCommand) > 0 && name[0] != '\0';
 }
 
 bool read_lun_number(int n, int m, int* lun) {
   Value number;
-  if (get_lun_number(n, m, number) <= 0 || number[0] == '\0') return false;
+  if (get_lun_number(n, m, number, Belief::kSinceCommand) <= 0 || number[0] == '\0') return false;
   *lun = atoi(number);
   return true;
 }
@@ -201,12 +222,12 @@ bool is_lun_stored_at(int n, int m) {
 
 bool is_target_slot_free(int n) {
   TargetName name;
-  return get_target_name(n, name) == -1 || name[0] == '\0';
+  return get_target_name(n, name, Belief::kAny) == -1 || name[0] == '\0';
 }
 
 bool is_lun_slot_free(int n, int m) {
   Value number;
-  return get_lun_number(n, m, number) == -1 || number[0] == '\0';
+  return get_lun_number(n, m, number, Belief::kAny) == -1 || number[0] == '\0';
 }
 
 void slots_move() {

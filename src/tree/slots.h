@@ -55,7 +55,7 @@ class HeldSlot {
 };
 
 // What defines a slot: the name of the target in it, the number of the LUN. Read from the tree, but only once
-// as long as no run moves slots. Return whether it is there.
+// as long as no run moves slots and no command runs. Return whether it is there.
 [[nodiscard]] bool read_target_name(int n, char (&name)[256]);
 [[nodiscard]] bool read_lun_number(int n, int m, int* lun);
 
@@ -63,7 +63,8 @@ class HeldSlot {
 [[nodiscard]] bool is_target_stored_at(int n);
 [[nodiscard]] bool is_lun_stored_at(int n, int m);
 
-// The same by the looser rule of the free-slot searches (tree_slot_is_free).
+// The same by the looser rule of the free-slot searches (tree_slot_is_free), also by what was read before a
+// command ran.
 [[nodiscard]] bool is_target_slot_free(int n);
 [[nodiscard]] bool is_lun_slot_free(int n, int m);
 

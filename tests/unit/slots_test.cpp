@@ -1,6 +1,9 @@
 // What slot numbers stand for while other runs add and delete slots.
 #include "tree/slots.h"
 
+#include <sys/wait.h>
+#include <unistd.h>
+
 #include <chrono>
 #include <filesystem>
 #include <fstream>
@@ -121,6 +124,15 @@ TEST_F(HeldSlots, AreBelievedForASecondOnly) {
   EXPECT_EQ(target_in_a_new_hold(), 1);
 }
 
+TEST_F(HeldSlots, AreReadAnewBehindACommand) {
+  EXPECT_EQ(target_in_a_new_hold(), 2);
+  delete_by_hand();
+  const pid_t command = fork();
+  if (command == 0) _exit(0);
+  ASSERT_EQ(waitpid(command, nullptr, 0), command);
+  EXPECT_EQ(target_in_a_new_hold(), 1);
+}
+
 TEST_F(HeldSlots, AreReadAnewFromAnotherDaemon) {
   std::ofstream("/run/ktree_sock_vv").flush();
   EXPECT_EQ(target_in_a_new_hold(), 2);
@@ -138,6 +150,15 @@ TEST_F(HeldSlots, AnEmptyOneIsReadOnce) {
   store_by_hand("/iscsi/initiator/id:1/lun/id:2/lun", "1");
   EXPECT_TRUE(is_target_slot_free(3));
   EXPECT_TRUE(is_lun_slot_free(1, 2));
+}
+
+TEST_F(HeldSlots, AreReadAnewByWhoDoesNotHoldThem) {
+  {
+    const SlotsHeld held;
+    EXPECT_TRUE(is_target_slot_free(3));
+  }
+  store_by_hand("/iscsi/initiator/id:3/target", "iqn.t3");
+  EXPECT_FALSE(is_target_slot_free(3));
 }
 
 TEST_F(HeldSlots, OneThatOnlySeemsEmptySinceAReadFailedIsReadAgain) {
