@@ -70,11 +70,23 @@ int look_and_tell() {
   return looked ? told : kFailed;
 }
 
+// Of each volume of the target; of the target itself where it has none, or the tree does not answer.
 int tell_of_failed_recovery(const char* target) {
   const std::string name = platform::printable(target);
-  const std::string command = platform::printable(vvstat::connect_command(target));
-  return tell({{Kind::kRecoveryFailed, name, "",
-                "Target " + name + ": its recovery failed and is not tried again; run: " + command}});
+  const std::string end =
+      " failed and is not tried again; run: " + platform::printable(vvstat::connect_command(target));
+  std::vector<Event> events;
+  for (const vvstat::Target& each : vvstat::read_status(platform::TreeReader()).targets) {
+    if (each.name != target) continue;
+    for (const vvstat::Volume& volume : each.volumes) {
+      const std::string share = platform::printable(volume.share);
+      events.push_back(
+          {Kind::kRecoveryFailed, name, share, "Volume " + share + ": the recovery of its target" + end});
+    }
+  }
+  if (events.empty())
+    events.push_back({Kind::kRecoveryFailed, name, "", "Target " + name + ": its recovery" + end});
+  return tell(events);
 }
 
 constexpr char kHelp[] =

@@ -23,7 +23,8 @@ bool is_wanted(const Target& target) {
          target.connect_state == kConnectError;
 }
 
-constexpr char kRunning[] = "Running";  // the tool's text; more may follow
+// The tool's texts.
+constexpr char kRunning[] = "Running", kRunningReadOnly[] = "Running ( Read Only )";
 constexpr char kHealsItself[] = "look at the network and the storage server; it heals by itself";
 
 // It stores so as well when a session shows no disk at start-up; the volumes' state alone tells that from a
@@ -103,12 +104,11 @@ Row row_of(const Target& target, const TargetFacts& facts) {
   return row;
 }
 
-// What the tree says of a volume is kept unless the volume is not as well as it says, or writable by now.
-std::string status_of(const Volume& volume, const VolumeFacts& facts, const Problem& problem) {
-  const bool runs = volume.status.starts_with(kRunning);
-  if (runs && problem.ailment == Ailment::kNone && facts.mounted && !facts.read_only) return kRunning;
-  const bool tells_so = problem.ailment == Ailment::kNone || !runs;
-  return tells_so && !volume.status.empty() ? volume.status : problem.status;
+// What the tree says of a volume is kept unless the kernel knows better.
+std::string status_of(const Volume& volume, const Row& row) {
+  if (row.wanted && row.healthy() && row.mounted) return row.read_only ? kRunningReadOnly : kRunning;
+  const bool tells_so = row.healthy() || !volume.status.starts_with(kRunning);
+  return tells_so && !volume.status.empty() ? volume.status : row.problem.status;
 }
 
 Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
@@ -128,7 +128,7 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
   if (!row.wanted) row.problem = kNone;
   const bool lost = !row.healthy();
   if (row.wanted && !lost) row.problem = problem_of(target, volume, facts);
-  row.status = lost ? row.problem.status : status_of(volume, facts, row.problem);
+  row.status = lost ? row.problem.status : status_of(volume, row);
   return row;
 }
 

@@ -128,6 +128,15 @@ def test_a_recovery_that_is_given_up(example, journal):  # noqa: F811
     assert (entry["EVENT"], entry["PRIORITY"], entry["TARGET"]) == ("recovery-failed", "3", "iqn.\\x1B")
 
 
+def test_a_recovery_that_is_given_up_is_told_of_each_volume(example, journal):  # noqa: F811
+    assert notify(example, "--recovery-failed", T1_NAME).status == 0
+    entries = journal.entries()
+    assert [(e["EVENT"], e["PRIORITY"], e["TARGET"], e["SHARE"]) for e in entries] == [
+        ("recovery-failed", "3", T1_NAME, "Backup"), ("recovery-failed", "3", T1_NAME, "Fotos 日本")]
+    assert entries[0]["MESSAGE"] == ("Volume Backup: the recovery of its target failed and is not tried again; "
+                                     f"run: remvol --connect -n {T1_NAME}")
+
+
 def test_the_command_of_a_message_can_be_copied_whatever_the_name_is(example, journal):  # noqa: F811
     notify(example, "--recovery-failed", "iqn.x;reboot")
     assert journal.entries()[0]["MESSAGE"].endswith("; run: remvol --connect -n 'iqn.x;reboot'")

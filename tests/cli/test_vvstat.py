@@ -283,8 +283,10 @@ def test_a_file_system_with_errors_that_takes_writes_is_well(example, on_a_disk)
 
 def test_a_volume_that_the_tree_takes_for_lost_is_well_when_it_is(example):
     """The texts of the tree are as old as the last command."""
-    change(example, {"lun/id:1/volume_state": "2"})
+    change(example, {"lun/id:1/volume_state": "2", "lun/id:1/status": "Offline"})
     assert vvstat(example).status == 0
+    told = volumes(example)[0]
+    assert (told["status"], told["tree-status"]) == ("Running", "Offline")
 
 
 @pytest.mark.parametrize("values", [{"conn_set": "0", "conn_state": "0"}, {"conn_set": "0", "conn_state": "3"},
