@@ -47,11 +47,13 @@ add_compile_options(
 # Each kind of processor has its own way to see to it that a jump ends where one may.
 foreach(protection IN ITEMS -fcf-protection -mbranch-protection=standard)
   string(MAKE_C_IDENTIFIER "has${protection}" known)
+  set(CMAKE_REQUIRED_FLAGS -Werror)  # clang takes another processor's with a warning
   check_cxx_compiler_flag(${protection} ${known})
   if(${known})
     add_compile_options(${protection})
   endif()
 endforeach()
+unset(CMAKE_REQUIRED_FLAGS)
 add_link_options(-Wl,-z,relro,-z,now -Wl,--as-needed)
 if(REMVOL_SANITIZE)
   add_compile_options(-fsanitize=${REMVOL_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
