@@ -65,6 +65,15 @@ void begin_line(Weight weight, FILE* stream) {
   if (is_journal(fileno(stream))) fprintf(stream, "<%d>", weight.priority);
 }
 
+void print_open(Weight weight, const char* format, ...) {
+  begin_line(weight);
+  va_list arguments;
+  va_start(arguments, format);
+  vprintf(format, arguments);
+  va_end(arguments);
+  if (is_journal(STDOUT_FILENO)) putchar('\n');
+}
+
 void log_prefix(Weight weight, const char* file, const char* function, int line) {
   if (debug_level >= weight.level) {
     begin_line(weight);

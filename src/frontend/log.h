@@ -51,6 +51,10 @@ struct Caller {
 // weight's priority. The level is not looked at.
 void begin_line(Weight weight, FILE* stream = stdout);
 
+// Prints a text that has no newline of its own on standard output, whatever the debug level: programs know it
+// as it is. In the journal it is a line.
+[[gnu::format(printf, 2, 3)]] void print_open(Weight weight, const char* format, ...);
+
 // Prints the prefix when the debug level is at least the message's; flushes standard output in every case.
 void log_prefix(Weight weight, const char* file, const char* function, int line);
 

@@ -1,7 +1,5 @@
 #include "iscsi/address.h"
 
-#include <cstdio>
-
 #include "frontend/log.h"
 #include "frontend/request.h"
 #include "iscsi/discovery.h"
@@ -33,7 +31,7 @@ bool check_request(const TargetEntry& request, Caller caller) {
 
 // The refusals are no failures: what is printed tells them from a change. It has no newline of its own.
 int refuse_connected(const TargetEntry& request) {
-  printf("%s is connecting, disconnect it before modifying its address.", request.target_name);
+  print_open(kNote, "%s is connecting, disconnect it before modifying its address.", request.target_name);
   return kOk;
 }
 
@@ -51,13 +49,13 @@ int modify_address(const TargetEntry& request, Caller caller) {
   if (!check_request(request, caller)) return kFailed;
   const int dbidx = ktree_get_dbidx_by_targetname(request.target_name);
   if (dbidx <= 0) {
-    printf("Target %s is not existed in config", request.target_name);
+    print_open(0, "Target %s is not existed in config", request.target_name);
     return kFailed;
   }
   if (check_target_connected(request.target_name) != 0) return refuse_connected(request);
   switch (Portal_search_target(request.target_name, request.ip, request.port)) {
     case 0:
-      printf("Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
+      print_open(kNote, "Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
       return kOk;
     case 1:
       return store_portal(request, dbidx, caller);

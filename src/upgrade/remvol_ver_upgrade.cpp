@@ -3,7 +3,6 @@
 
 #include <algorithm>
 #include <climits>
-#include <cstdio>
 #include <cstdlib>
 
 #include "frontend/log.h"
@@ -109,7 +108,7 @@ int upgrade_targets(Caller caller) {
 
 int upgrade_from(int stored, int current, Caller caller) {
   if (stored > current) {
-    printf("remvol: Do not support settings downgrade to version %d", current);
+    print_open(0, "remvol: Do not support settings downgrade to version %d", current);
     return kFailed;
   }
   if (current == stored) {

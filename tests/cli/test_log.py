@@ -106,6 +106,14 @@ class TestJournal:
         assert in_a_unit(box, "remvol", "--search", "-i", "nobody") == [
             (4, "ip address nobody -> error"), (3, "execute failed.")]
 
+    @pytest.mark.parametrize("options, text", [
+        (["--verupgrade"], "remvol: Do not support settings downgrade to version 1"),
+        (["--modify_address", "-n", "iqn.t1", "-i", "10.9.0.2", "-p", "3260"], "Target iqn.t1 is not existed in config"),
+    ])
+    def test_a_text_without_a_newline_of_its_own_is_a_line(self, box, options, text):
+        box.tree.set("/iscsi/initiator/ver", "2")
+        assert in_a_unit(box, "remvol", *options) == [(4, text), (3, "execute failed.")]
+
     def test_flow_and_detail_are_none(self, box):
         box.debug(2)
         box.path("/etc/NAS_CFG").mkdir()
