@@ -93,7 +93,8 @@ bool Job::confirm(const std::string& question) {
     case Answer::kNo:
       return refuse(kRefused, "nothing was changed");
     default:
-      return refuse(kRefused, "there is no terminal to ask at; --yes means that nothing is to be asked");
+      return refuse(kRefused,
+                    question + "\n  there is no terminal to ask at; --yes means that nothing is to be asked");
   }
 }
 

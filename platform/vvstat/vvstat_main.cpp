@@ -234,14 +234,23 @@ int take_option(int letter, Options& options) {
   }
 }
 
+// Whether anything is asked of the output that metrics do not have.
+bool asks_for_more(const Options& options) {
+  const Layout& layout = options.layout;
+  return options.watch || options.ailing_only || options.name != nullptr || layout.form != Form::kTable ||
+         layout.bytes || !layout.headings || !layout.columns.empty();
+}
+
 int take_arguments(int argc, char** argv, Options& options) {
   for (int letter; (letter = getopt_long(argc, argv, "xwo:bnrJPhV", kLongOptions, nullptr)) != -1;) {
     const int status = take_option(letter, options);
     if (status != kGoOn) return status;
   }
   if (optind < argc) options.name = argv[optind++];
-  const bool alone = !options.metrics || (!options.watch && options.name == nullptr);
-  return optind == argc && alone && !(options.watch && options.name != nullptr) ? kGoOn : wrong_usage();
+  return optind == argc && !(options.metrics && asks_for_more(options)) &&
+                 !(options.watch && options.name != nullptr)
+             ? kGoOn
+             : wrong_usage();
 }
 
 // Colour for a terminal, unless NO_COLOR asks for none (no-color.org).

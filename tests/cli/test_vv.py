@@ -589,8 +589,9 @@ def test_disconnect_asks_when_other_shares_go_as_well(photos):
     assert photos.vv("connect", T1).status == 0
     done = photos.vv("disconnect", "Photos")
     assert (done.status, done.stdout) == (4, "")
-    assert "--yes" in done.stderr and photos.site.mounted("Music")
-    assert photos.says("disconnect", "Photos")[1]["outcomes"][0]["outcome"] == "refused"
+    assert "also Music. Go on?" in done.stderr and "--yes" in done.stderr and photos.site.mounted("Music")
+    [outcome] = photos.says("disconnect", "Photos")[1]["outcomes"]
+    assert outcome["outcome"] == "refused" and "also Music" in outcome["message"]
     assert photos.vv("disconnect", T1).status == 0  # says so itself
 
 

@@ -590,7 +590,8 @@ def test_eight_targets_with_eight_volumes(box):
 
 
 @pytest.mark.parametrize("options, status", [(["--help"], 0), (["-h"], 0), (["--version"], 0), (["-V"], 0),
-                                             (["--nonsense"], 2), (["one", "more"], 2), (["-w", "Backup"], 2), (["-P", "Backup"], 2), (["-Pw"], 2), (["-o"], 2)])
+                                             (["--nonsense"], 2), (["one", "more"], 2), (["-w", "Backup"], 2), (["-P", "Backup"], 2), (["-Pw"], 2), (["-o"], 2),
+                                             (["-PJ"], 2), (["-Pr"], 2), (["-Px"], 2), (["-Pb"], 2), (["-Pn"], 2), (["-P", "-o", "SHARE"], 2)])
 def test_the_usual_options(bare_box, options, status):
     done = vvstat(bare_box, *options)
     assert done.status == status
