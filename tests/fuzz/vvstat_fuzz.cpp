@@ -56,7 +56,8 @@ std::vector<TargetFacts> facts_of(const Status& status, uint8_t byte) {
   constexpr const char* kSessions[] = {"", "LOGGED_IN", "FAILED", "FREE"};
   std::vector<TargetFacts> all;
   for (const Target& target : status.targets) {
-    const VolumeFacts volume{(byte & 4U) != 0, (byte & 8U) != 0, (byte & 16U) != 0, byte, byte * 3ULL};
+    const VolumeFacts volume{(byte & 4U) != 0, (byte & 8U) != 0, (byte & 16U) != 0, (byte & 32U) != 0, byte,
+                             byte * 3ULL};
     all.push_back(
         {kSessions[byte & 3U], "10.0.0.1", std::vector<VolumeFacts>(target.volumes.size(), volume)});
   }
