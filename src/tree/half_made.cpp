@@ -47,9 +47,12 @@ void drop_half_made_luns_of(int n) {
   }
 }
 
-// A LUN is counted right after it was stored; a run that was killed in between has not counted it.
+// A LUN is counted right after it was stored; a run that was killed in between has not counted it. A count
+// that no run is known to have left so stays.
 void count_luns_of(int n) {
-  if (is_target_stored_at(n) && tree_read_number(KeyText(key::kTargetLunCount, n), 0) < last_lun_at(n))
+  char name[256];
+  if (read_target_name(n, name) && tree_read_number(KeyText(key::kTargetLunCount, n), 0) < last_lun_at(n) &&
+      IdleTarget(name))
     ktree_update_current_luncnt(n);
 }
 

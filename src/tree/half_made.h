@@ -8,8 +8,8 @@ namespace remvol {
 // Deletes the LUN slots of stored targets that have a number, but no share.
 void drop_half_made_luns();
 
-// The same, and the target slots that have a name, but neither an address nor a LUN. LUNs that are stored and
-// not counted are counted.
+// The same, and the target slots that have a name, but neither an address nor a LUN. LUNs that a run that
+// has ended has stored and not counted are counted.
 void drop_half_made_slots();
 
 // Returns whether behind the counted slots is a target that a run has stored and not counted, since it was

@@ -180,6 +180,11 @@ class TestHalfMadeSlots:
         status(box)
         assert (stored.target("lun/count"), box.tree.get(f"{INITIATOR}/total_lun_count")) == ("2", "2")
 
+    def test_a_count_of_luns_that_no_run_is_known_to_have_left_stays(self, stored, box):
+        box.tree.delete(f"{INITIATOR}/id:1/lun/count")
+        status(box)
+        assert stored.target("lun/count") is None
+
 
 class TestOneAfterAnother:
     def test_two_connections_of_a_target_follow_one_another(self, stored, box):
