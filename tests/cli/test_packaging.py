@@ -280,6 +280,17 @@ def test_a_unit_that_mounts_for_others_has_no_mounts_of_its_own(name):
     assert service["DevicePolicy"] == "closed" and service["ProtectClock"] == "yes"
 
 
+def capabilities(name):
+    lines = re.findall(r"^CapabilityBoundingSet=(.*)$", (PACKAGING / "units" / name).read_text(), re.M)
+    return set(" ".join(lines).split())
+
+
+def test_the_notifier_may_do_as_the_listeners_child_what_it_may_do_in_its_own_unit():
+    """Whichever is the first to see it has a loss mailed: a mail server's programs need the same of both."""
+    assert "CAP_CHOWN" in capabilities("remvol-notify.service")
+    assert capabilities("remvol-notify.service") <= capabilities("remvol-events.service")
+
+
 @pytest.mark.parametrize("path", sorted((PACKAGING / "units").glob("*.service")), ids=lambda path: path.name)
 def test_what_a_unit_starts_is_installed(path):
     helpers = {p.name for p in (PACKAGING / "helpers").iterdir()}

@@ -14,7 +14,7 @@ at_most remvol-notify.service 5.0
 at_most remvol-metrics.service 5.0
 # They run the tool, which mounts for everybody: nothing of what needs a mount namespace of its own can be asked for.
 at_most remvol-keeper.service 5.2
-at_most remvol-events.service 5.4
+at_most remvol-events.service 5.6
 at_most remvol.service 5.5
 
 units=$(systemctl list-unit-files --no-legend 'remvol*' | awk '{print $1}')
