@@ -9,6 +9,7 @@ unit() { cat "$units/$1.service" "$units/$1.service.d"/*.conf 2>/dev/null | sed 
 # as_unit NAME KEY: runs the command of a unit, of several the last one.
 as_unit() {
     capabilities=$(unit "$1" CapabilityBoundingSet | tr 'A-Z ' 'a-z\n' | sed -n 's/^cap_/,+/p' | tr -d '\n')
+    [ "$(unit "$1" LimitMEMLOCK)" != infinity ] || ulimit -l unlimited
     # shellcheck disable=SC2046 # a list
     exec setpriv --no-new-privs --bounding-set "-all$capabilities" $(unit "$1" "$2" | tail -n 1)
 }
