@@ -55,6 +55,15 @@ Link link_of(const std::string& session, const std::string& state) {
 
 }  // namespace
 
+bool is_any_session() {
+  bool any = false;
+  for_entries(kFolder, [&any](std::string_view name) {
+    any = name.starts_with(kSession);
+    return !any;
+  });
+  return any;
+}
+
 std::vector<Session> read_sessions() {
   std::vector<Session> sessions;
   for_entries(kFolder, [&sessions](std::string_view name) {

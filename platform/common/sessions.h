@@ -21,7 +21,11 @@ struct Session {
   Link link;
 };
 
-// Lists the sessions; one that vanishes meanwhile is left out.
+// Returns whether there is a session, also one that has no target's name yet: the kernel tells of a new one
+// before the initiator has named it.
+bool is_any_session();
+
+// Lists the sessions that have a target's name; one that vanishes meanwhile is left out.
 std::vector<Session> read_sessions();
 
 // The address of the portal that the session's connection was made to, as it was given; empty when it has

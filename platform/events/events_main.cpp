@@ -91,14 +91,14 @@ void follow_sessions(Daemon& daemon, bool any) {
 }
 
 void look(Daemon& daemon) {
-  follow_sessions(daemon, !read_sessions().empty());
+  follow_sessions(daemon, platform::is_any_session());
   // Read again: a connection may have been lost before the socket was open.
   daemon.targets.look(read_sessions());
 }
 
 void look_after_a_gap(Daemon& daemon) {
   daemon.gap = false;
-  follow_sessions(daemon, !read_sessions().empty());
+  follow_sessions(daemon, platform::is_any_session());
   daemon.targets.look_after_a_gap(read_sessions());
 }
 

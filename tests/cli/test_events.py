@@ -193,6 +193,17 @@ def test_a_first_login_is_neither_loss_nor_return(events):
     events.wait_runs(reopen("iqn.a"))
 
 
+def test_a_session_that_is_named_after_it_was_told_of_is_followed(events):
+    events.start()
+    events.session(1, "", state="FREE", luns=False)
+    events.uevent()
+    events.sync()
+    events.session(1, "iqn.a")
+    events.state(1, "FAILED")
+    events.send(message(LOST, 1))
+    events.wait_runs(reopen("iqn.a"))
+
+
 @pytest.mark.parametrize("answer", [
     login_response(1, status=2),
     login_response(1, flags=0x81),
