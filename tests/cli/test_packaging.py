@@ -451,8 +451,8 @@ def test_completion_of_vv(shells, shell):
 
 @pytest.mark.parametrize("shell", ["bash", "zsh", "fish"])
 def test_completion_of_a_file(shells, shell):
-    offered = shells[shell]("vv add Photos --password-file /etc/host")
-    assert offered == ["FILES"] if shell == "zsh" else "/etc/hosts" in offered
+    offered = shells[shell]("vv add Photos --password-file /etc/passw")
+    assert offered == ["FILES"] if shell == "zsh" else "/etc/passwd" in offered
 
 
 def test_completion_of_a_word_with_a_blank(complete):
