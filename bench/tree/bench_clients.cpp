@@ -46,7 +46,7 @@ Dialogue ktree_dialogue(const std::string& path, const std::string& value) {
   const uint32_t room = ktree::kMaxValueBytes;
   const ktree::RequestHeader request = {
       static_cast<uint32_t>(sizeof request - ktree::kLengthBytes + path.size() + sizeof room),
-      static_cast<uint8_t>(ktree::Operation::get), 0, static_cast<uint16_t>(path.size())};
+      static_cast<uint8_t>(ktree::Operation::kGet), 0, static_cast<uint16_t>(path.size())};
   const ktree::ReplyHeader reply = {
       static_cast<uint32_t>(sizeof reply - ktree::kLengthBytes + value.size()), 0, {}};
   return {bytes_of(&request, sizeof request) + path + bytes_of(&room, sizeof room),

@@ -44,17 +44,13 @@ constexpr int kCalls = 32;
 }
 
 void write_all(int fd, const char* data, size_t size) {
-  if (write(fd, data, size) != static_cast<ssize_t>(size)) {
-    fail("write");
-  }
+  if (write(fd, data, size) != static_cast<ssize_t>(size)) fail("write");
 }
 
 void read_all(int fd, char* data, size_t size) {
   for (size_t have = 0; have < size;) {
     const ssize_t n = read(fd, data + have, size - have);
-    if (n <= 0) {
-      fail("read");
-    }
+    if (n <= 0) fail("read");
     have += static_cast<size_t>(n);
   }
 }
@@ -65,12 +61,8 @@ void pin_to(const char* cpus) {
   const unsigned long last = *end == '-' ? strtoul(end + 1, nullptr, 10) : cpu;
   cpu_set_t set;
   CPU_ZERO(&set);
-  for (; cpu <= last; cpu++) {
-    CPU_SET(cpu, &set);
-  }
-  if (sched_setaffinity(0, sizeof set, &set) != 0) {
-    fail("sched_setaffinity");
-  }
+  for (; cpu <= last; cpu++) CPU_SET(cpu, &set);
+  if (sched_setaffinity(0, sizeof set, &set) != 0) fail("sched_setaffinity");
 }
 
 int connect_to(const char* path) {
@@ -78,9 +70,7 @@ int connect_to(const char* path) {
   address.sun_family = AF_UNIX;
   snprintf(address.sun_path, sizeof address.sun_path, "%s", path);
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (fd < 0 || connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-    fail(path);
-  }
+  if (fd < 0 || connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) fail(path);
   return fd;
 }
 
@@ -89,9 +79,7 @@ class Echo {
  public:
   Echo(size_t request, size_t reply, const char* cpus) : request_(request), reply_(reply) {
     int fds[2];
-    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds) != 0) {
-      fail("socketpair");
-    }
+    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds) != 0) fail("socketpair");
     fflush(stdout);
     child_ = fork();
     if (child_ == 0) {
@@ -118,9 +106,7 @@ class Echo {
  private:
   [[noreturn]] void answer(int fd) {
     for (;;) {
-      if (read(fd, request_.data(), request_.size()) <= 0) {
-        _exit(0);
-      }
+      if (read(fd, request_.data(), request_.size()) <= 0) _exit(0);
       write_all(fd, reply_.data(), reply_.size());
     }
   }
@@ -177,9 +163,7 @@ struct Kind {
 
   void measure(int calls) {
     const auto start = std::chrono::steady_clock::now();
-    for (int i = 0; i < calls; i++) {
-      call();
-    }
+    for (int i = 0; i < calls; i++) call();
     const std::chrono::duration<double, std::micro> time = std::chrono::steady_clock::now() - start;
     rounds.push_back(time.count() / calls);
   }
@@ -187,17 +171,13 @@ struct Kind {
 
 void fill(const char* ktree, Redis& redis) {
   for_each_entry_of_full_tree([&](const std::string& path, const std::string& value) {
-    if (ktreec_set(ktree, 0, path.c_str(), value.c_str()) != 0) {
-      fail(path.c_str());
-    }
+    if (ktreec_set(ktree, 0, path.c_str(), value.c_str()) != 0) fail(path.c_str());
     redis.set(path.c_str(), value.c_str());
   });
 }
 
 void set_tree(const char* socket) {
-  if (ktreec_set(socket, 0, kPath, kValue) != 0) {
-    fail("ktreec_set");
-  }
+  if (ktreec_set(socket, 0, kPath, kValue) != 0) fail("ktreec_set");
 }
 
 void get_tree(const char* socket) {
@@ -235,18 +215,12 @@ int main(int argc, char** argv) {
       {"redis GET", [&] { redis.get(kPath, kValue); }, {}},
   }};
   for (int i = 0; i < rounds; i++) {
-    for (Kind& kind : kinds) {
-      kind.measure(kCalls);
-    }
+    for (Kind& kind : kinds) kind.measure(kCalls);
   }
-  for (const Kind& kind : kinds) {
-    printf("%s\t", kind.name);
-  }
+  for (const Kind& kind : kinds) printf("%s\t", kind.name);
   for (size_t i = 0; i < kinds[0].rounds.size(); i++) {
     puts("");
-    for (const Kind& kind : kinds) {
-      printf("%.3f\t", kind.rounds[i]);
-    }
+    for (const Kind& kind : kinds) printf("%.3f\t", kind.rounds[i]);
   }
   puts("");
   return 0;

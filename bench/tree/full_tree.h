@@ -42,17 +42,11 @@ void for_each_entry_of_full_tree(Visit visit) {
       {"mnt_dev", "/dev/sdb1"},
       {"mnt", "/mnt/VV/Photographs of the family"},
   };
-  for (const auto& [key, value] : of_all) {
-    visit(root + key, std::string(value));
-  }
+  for (const auto& [key, value] : of_all) visit(root + key, std::string(value));
   for (int i = 1; i <= 8; i++) {
     const std::string target = root + "id:" + std::to_string(i) + "/";
-    for (const auto& [key, value] : of_target) {
-      visit(target + key, std::string(value));
-    }
-    for (const auto& [key, value] : of_lun) {
-      visit(target + "lun/id:1/" + key, std::string(value));
-    }
+    for (const auto& [key, value] : of_target) visit(target + key, std::string(value));
+    for (const auto& [key, value] : of_lun) visit(target + "lun/id:1/" + key, std::string(value));
   }
   for (const char* command :
        {"init", "search", "add", "del", "format", "modify", "status", "connect", "disconnect"}) {

@@ -1,4 +1,4 @@
-#include "report.h"
+#include "common/report.h"
 
 #include <sys/socket.h>
 #include <sys/un.h>

@@ -1,4 +1,4 @@
-#include "sessions.h"
+#include "common/sessions.h"
 
 #include <dirent.h>
 #include <fcntl.h>

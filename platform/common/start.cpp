@@ -1,8 +1,8 @@
-#include "start.h"
+#include "common/start.h"
 
-#include <signal.h>
 #include <spawn.h>
 #include <unistd.h>
+#include <csignal>
 
 #include <cerrno>
 

@@ -1,4 +1,4 @@
-#include "tree_reader.h"
+#include "common/tree_reader.h"
 
 #include <sys/mman.h>
 #include <unistd.h>
@@ -8,7 +8,7 @@
 #include <cstdio>
 #include <cstdlib>
 
-#include "file_text.h"
+#include "common/file_text.h"
 #include "ktree/client/calls.h"
 
 namespace platform {
@@ -47,9 +47,9 @@ std::string unescaped(std::string_view text) {
 TreeReader::TreeReader(const char* socket, const char* root) {
   const int file = memfd_create("listing", MFD_CLOEXEC);
   ktree::client::Reason reason;
-  const Result result = file < 0 ? Result::failed : ktree::client::list_to(socket, root, file, reason);
-  answered_ = result == Result::done || result == Result::missing;
-  if (result == Result::done) take(content_of(file));
+  const Result result = file < 0 ? Result::kFailed : ktree::client::list_to(socket, root, file, reason);
+  answered_ = result == Result::kDone || result == Result::kMissing;
+  if (result == Result::kDone) take(content_of(file));
   if (file >= 0) close(file);
 }
 
@@ -61,8 +61,9 @@ void TreeReader::take(std::string_view listing) {
   while (!listing.empty()) {
     const std::string_view line = listing.substr(0, listing.find('\n'));
     const size_t equals = line.find('=');
-    if (equals != std::string_view::npos)
+    if (equals != std::string_view::npos) {
       values_.emplace(line.substr(0, equals), unescaped(line.substr(equals + 1)));
+    }
     listing.remove_prefix(std::min(line.size() + 1, listing.size()));
   }
 }

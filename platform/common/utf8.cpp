@@ -1,4 +1,4 @@
-#include "utf8.h"
+#include "common/utf8.h"
 
 #include <locale.h>
 
@@ -33,7 +33,7 @@ size_t first_character(std::string_view text, wchar_t& character) {
     character = first;
     return 1;
   }
-  for (size_t size = 2; size < 2 + std::size(kForms); ++size) {
+  for (size_t size = 2; size < 2 + std::size(kForms); size++) {
     const auto& form = kForms[size - 2];
     if ((first & form.mask) != form.first) continue;
     if (text.size() < size) return 0;
@@ -133,7 +133,7 @@ std::string printable(std::string_view text) {
   std::wstring characters;
   decode(text, characters);
   std::string shown;
-  for (size_t at = 0; !text.empty(); ++at) {
+  for (size_t at = 0; !text.empty(); at++) {
     wchar_t character = 0;
     const size_t size = first_character(text, character);
     const std::string_view bytes = text.substr(0, size);
@@ -146,7 +146,7 @@ std::string printable(std::string_view text) {
 
 std::string ascii(std::string_view text) {
   std::string shown;
-  for (size_t at = 0; at < text.size(); ++at) {
+  for (size_t at = 0; at < text.size(); at++) {
     const bool plain = static_cast<unsigned char>(text[at]) < 0x80;
     plain ? static_cast<void>(shown += text[at]) : append_escaped(shown, text.substr(at, 1));
   }

@@ -1,9 +1,9 @@
 // remvol-events: tells the tool when the connection of an iSCSI session is lost and when it is back.
 #include <poll.h>
-#include <signal.h>
 #include <sys/signalfd.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <csignal>
 
 #include <cerrno>
 #include <cstdio>
@@ -11,12 +11,12 @@
 #include <initializer_list>
 #include <string_view>
 
-#include "kernel_event.h"
-#include "netlink.h"
-#include "report.h"
-#include "sessions.h"
-#include "start.h"
-#include "targets.h"
+#include "common/report.h"
+#include "common/sessions.h"
+#include "common/start.h"
+#include "events/kernel_event.h"
+#include "events/netlink.h"
+#include "events/targets.h"
 
 namespace events {
 namespace {
@@ -56,12 +56,13 @@ pid_t start_tool(const Order& order) {
   const char* argv[] = {kTool, option, "-n", order.target.c_str(), nullptr};
   const pid_t process = platform::start(kTool, argv);
   const char* target = order.target.c_str();
-  if (process < 0)
+  if (process < 0) {
     platform::report(LOG_ERR, "remvol-events: %s: %s", target, strerror(errno));
-  else if (reopen)
+  } else if (reopen) {
     platform::report(LOG_WARNING, "remvol-events: %s: the connection is lost", target);
-  else
+  } else {
     platform::report(LOG_NOTICE, "remvol-events: %s: the session is back", target);
+  }
   return process;
 }
 
@@ -70,8 +71,9 @@ void notify(const Outcome& outcome) {
   const char* changes[] = {kNotifier, nullptr};
   const char* failure[] = {kNotifier, "--recovery-failed", outcome.given_up.c_str(), nullptr};
   const auto start = platform::start;
-  if (start(kNotifier, changes) < 0 || (!outcome.given_up.empty() && start(kNotifier, failure) < 0))
+  if (start(kNotifier, changes) < 0 || (!outcome.given_up.empty() && start(kNotifier, failure) < 0)) {
     complain(kNotifier);
+  }
 }
 
 void give_orders(Daemon& daemon) {

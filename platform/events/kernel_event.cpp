@@ -1,4 +1,4 @@
-#include "kernel_event.h"
+#include "events/kernel_event.h"
 
 #include <linux/netlink.h>
 

@@ -1,4 +1,4 @@
-#include "netlink.h"
+#include "events/netlink.h"
 
 #include <linux/netlink.h>
 #include <sys/socket.h>

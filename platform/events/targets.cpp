@@ -1,4 +1,4 @@
-#include "targets.h"
+#include "events/targets.h"
 
 #include <algorithm>
 

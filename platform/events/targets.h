@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "kernel_event.h"
-#include "sessions.h"
+#include "common/sessions.h"
+#include "events/kernel_event.h"
 
 namespace events {
 

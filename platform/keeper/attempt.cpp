@@ -1,4 +1,4 @@
-#include "attempt.h"
+#include "keeper/attempt.h"
 
 #include <fcntl.h>
 #include <mntent.h>
@@ -15,7 +15,7 @@
 #include <cstdio>
 #include <vector>
 
-#include "tree_reader.h"
+#include "common/tree_reader.h"
 
 namespace keeper {
 namespace {
@@ -108,8 +108,9 @@ bool portal_answers(const std::string& address, const std::string& port) {
   addrinfo* found = nullptr;
   if (getaddrinfo(bare.c_str(), port.c_str(), &hints, &found) != 0) return false;
   bool answers = false;
-  for (const addrinfo* one = found; one != nullptr && !answers; one = one->ai_next)
+  for (const addrinfo* one = found; one != nullptr && !answers; one = one->ai_next) {
     answers = accepts_at_a_port(*one);
+  }
   freeaddrinfo(found);
   return answers;
 }

@@ -1,11 +1,11 @@
 // remvol-keeper: sees to it that what should be there is there: the initiator's daemon, and a session of each
 // target that is to be connected.
 #include <poll.h>
-#include <signal.h>
 #include <sys/signalfd.h>
 #include <sys/wait.h>
-#include <time.h>
 #include <unistd.h>
+#include <csignal>
+#include <ctime>
 
 #include <algorithm>
 #include <cerrno>
@@ -16,14 +16,14 @@
 #include <string_view>
 #include <vector>
 
-#include "attempt.h"
-#include "netlink.h"
-#include "processes.h"
-#include "report.h"
-#include "schedule.h"
-#include "sessions.h"
-#include "start.h"
-#include "tree_reader.h"
+#include "common/report.h"
+#include "common/sessions.h"
+#include "common/start.h"
+#include "common/tree_reader.h"
+#include "events/netlink.h"
+#include "keeper/attempt.h"
+#include "keeper/processes.h"
+#include "keeper/schedule.h"
 
 namespace keeper {
 namespace {
@@ -107,12 +107,13 @@ void try_again(Daemon& daemon, const Try& next) {
 void tell(Daemon& daemon) {
   std::string target;
   for (Change change; (change = daemon.schedule.next_change(target)) != Change::kNone;) {
-    if (change == Change::kMissing)
+    if (change == Change::kMissing) {
       platform::report(LOG_WARNING,
                        "remvol-keeper: %s should be connected and is not, it is tried until it is",
                        target.c_str());
-    else
+    } else {
       platform::report(LOG_NOTICE, "remvol-keeper: %s is connected again", target.c_str());
+    }
   }
 }
 

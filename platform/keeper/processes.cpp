@@ -1,4 +1,4 @@
-#include "processes.h"
+#include "keeper/processes.h"
 
 #include <dirent.h>
 #include <fcntl.h>

@@ -1,4 +1,4 @@
-#include "schedule.h"
+#include "keeper/schedule.h"
 
 #include <algorithm>
 

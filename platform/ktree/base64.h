@@ -1,5 +1,6 @@
 // Base64 as RFC 4648, section 4, writes it: with padding, without line breaks.
-#pragma once
+#ifndef PLATFORM_KTREE_BASE64_H
+#define PLATFORM_KTREE_BASE64_H
 
 #include <string>
 #include <string_view>
@@ -16,9 +17,7 @@ void encode_base64(std::string_view bytes, Put put) {
     for (size_t k = 0; k < 3; k++) {
       triple = triple << 8 | (k < have ? static_cast<unsigned char>(bytes[i + k]) : 0U);
     }
-    for (size_t k = 0; k < 4; k++) {
-      put(k <= have ? kDigits[triple >> (18 - 6 * k) & 63U] : '=');
-    }
+    for (size_t k = 0; k < 4; k++) put(k <= have ? kDigits[triple >> (18 - 6 * k) & 63U] : '=');
   }
 }
 
@@ -27,3 +26,5 @@ void encode_base64(std::string_view bytes, Put put) {
 [[nodiscard]] bool decode_base64(std::string_view text, std::string& bytes);
 
 }  // namespace ktree
+
+#endif

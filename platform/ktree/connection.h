@@ -1,5 +1,6 @@
 // One client of the daemon: its descriptor and what of a request has come or of a reply has not gone yet.
-#pragma once
+#ifndef PLATFORM_KTREE_CONNECTION_H
+#define PLATFORM_KTREE_CONNECTION_H
 
 #include <cstddef>
 #include <cstdint>
@@ -54,3 +55,5 @@ struct ConnectionList {
 [[nodiscard]] int64_t send_some(const Connection& connection, std::string_view bytes);
 
 }  // namespace ktree
+
+#endif

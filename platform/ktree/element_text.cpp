@@ -20,20 +20,14 @@ std::string_view without_leading_blanks(std::string_view text) {
 
 bool ElementText::add_encoded(std::string_view piece) {
   for (char c : piece) {
-    if (kXmlBlanks.find(c) == std::string_view::npos) {
-      text_ += c;
-    }
+    if (kXmlBlanks.find(c) == std::string_view::npos) text_ += c;
   }
   return text_.size() <= kMaxEncodedBytes;
 }
 
 bool ElementText::add(std::string_view piece) {
-  if (encoded_) {
-    return add_encoded(piece);
-  }
-  if (has_children_ && text_.empty()) {
-    piece = without_leading_blanks(piece);
-  }
+  if (encoded_) return add_encoded(piece);
+  if (has_children_ && text_.empty()) piece = without_leading_blanks(piece);
   std::string_view kept = cut_ ? std::string_view() : piece.substr(0, kMaxValueBytes - text_.size());
   std::string_view rest = piece.substr(kept.size());
   text_ += kept;
@@ -52,12 +46,8 @@ void ElementText::begin_child() {
 const char* ElementText::finish(std::string& value, bool& present) {
   if (encoded_) {
     present = true;
-    if (!decode_base64(text_, value)) {
-      return "text that is not base64";
-    }
-    if (value.find('\0') != std::string::npos) {
-      return "a value with a NUL byte";
-    }
+    if (!decode_base64(text_, value)) return "text that is not base64";
+    if (value.find('\0') != std::string::npos) return "a value with a NUL byte";
     return value.size() > kMaxValueBytes ? kTooLong : nullptr;
   }
   std::string_view kept = trim_blanks(text_);

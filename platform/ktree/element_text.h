@@ -1,5 +1,6 @@
 // The text of one element of a settings file, gathered piece by piece, and the value it stands for.
-#pragma once
+#ifndef PLATFORM_KTREE_ELEMENT_TEXT_H
+#define PLATFORM_KTREE_ELEMENT_TEXT_H
 
 #include <string>
 #include <string_view>
@@ -32,3 +33,5 @@ class ElementText {
 };
 
 }  // namespace ktree
+
+#endif

@@ -42,9 +42,7 @@ bool socket_address(const std::string& path, sockaddr_un& address) {
 // True when a process listens there; one that is too busy to take the connection at once does, too.
 bool is_answered(const sockaddr_un& address) {
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-  if (fd < 0) {
-    return true;
-  }
+  if (fd < 0) return true;
   const bool refused = connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 &&
                        (errno == ECONNREFUSED || errno == ENOENT);
   close(fd);
@@ -63,12 +61,8 @@ Endpoint::~Endpoint() {
     remove(pid_);
     close(folder_);
   }
-  if (pid_file_ >= 0) {
-    close(pid_file_);
-  }
-  if (listener_ >= 0) {
-    close(listener_);
-  }
+  if (pid_file_ >= 0) close(pid_file_);
+  if (listener_ >= 0) close(listener_);
 }
 
 // Opens the lock file for this user alone: a file that others can open they can lock for ever.
@@ -79,9 +73,7 @@ int Endpoint::open_lock(const std::string& name) const {
       (info.st_mode & 077) == 0) {
     return fd;
   }
-  if (fd >= 0) {
-    close(fd);
-  }
+  if (fd >= 0) close(fd);
   return unlinkat(folder_, name.c_str(), 0) == 0 ? kNoLock : -1;
 }
 
@@ -89,9 +81,7 @@ int Endpoint::open_lock(const std::string& name) const {
 bool Endpoint::take_lock(const std::string& name, int& lock) const {
   for (int i = 0; i < kLockTries; i++) {
     lock = open_lock(name);
-    if (lock == -1) {
-      return false;
-    }
+    if (lock == -1) return false;
     struct stat mine = {};
     struct stat there = {};
     if (lock != kNoLock && flock(lock, LOCK_EX | LOCK_NB) == 0 && fstat(lock, &mine) == 0 &&
@@ -124,9 +114,7 @@ bool Endpoint::open(const std::string& socket_path, const std::string& name, std
 }
 
 bool Endpoint::open_locked(const std::string& socket_path, const std::string& name, std::string& error) {
-  if (!make_free(socket_path, error)) {
-    return false;
-  }
+  if (!make_free(socket_path, error)) return false;
   pid_.name = name_of(socket_path) + "_" + name + ".pid";
   if (!write_pid()) {
     error = system_error(folder_of(socket_path) + "/" + pid_.name);
@@ -146,9 +134,7 @@ bool Endpoint::make_free(const std::string& socket_path, std::string& error) con
     error = system_error(socket_path);
     return false;
   }
-  if (lstat(socket_path.c_str(), &info) != 0) {
-    return true;
-  }
+  if (lstat(socket_path.c_str(), &info) != 0) return true;
   if (!S_ISSOCK(info.st_mode)) {
     error = socket_path + ": there is a file of this name that is not a socket";
     return false;
@@ -166,13 +152,9 @@ bool Endpoint::make_free(const std::string& socket_path, std::string& error) con
 
 bool Endpoint::listen_on(const std::string& socket_path) {
   sockaddr_un address = {};
-  if (!socket_address(socket_path, address)) {
-    return false;
-  }
+  if (!socket_address(socket_path, address)) return false;
   listener_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-  if (listener_ < 0) {
-    return false;
-  }
+  if (listener_ < 0) return false;
   // The mask makes the socket private from its first moment; a chmod after the bind would leave a gap.
   const mode_t mask = umask(0177);
   const int bound = bind(listener_, reinterpret_cast<const sockaddr*>(&address), sizeof address);
@@ -188,9 +170,7 @@ bool Endpoint::write_pid() {
   const std::string temporary = pid_.name + ".new";
   unlinkat(folder_, temporary.c_str(), 0);
   pid_file_ = openat(folder_, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-  if (pid_file_ < 0) {
-    return false;
-  }
+  if (pid_file_ < 0) return false;
   const bool written = write(pid_file_, text, static_cast<size_t>(length)) == length;
   if (written && renameat(folder_, temporary.c_str(), folder_, pid_.name.c_str()) == 0) {
     return remember(pid_, pid_.name);
@@ -203,9 +183,7 @@ bool Endpoint::write_pid() {
 
 bool Endpoint::remember(OwnFile& file, const std::string& name) const {
   struct stat info = {};
-  if (fstatat(folder_, name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
-    return false;
-  }
+  if (fstatat(folder_, name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) return false;
   file = {name, info.st_dev, info.st_ino};
   return true;
 }

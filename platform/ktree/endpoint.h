@@ -1,5 +1,6 @@
 // The daemon's places in the file system: its socket and the file with its process number.
-#pragma once
+#ifndef PLATFORM_KTREE_ENDPOINT_H
+#define PLATFORM_KTREE_ENDPOINT_H
 
 #include <sys/types.h>
 
@@ -48,3 +49,5 @@ class Endpoint {
 };
 
 }  // namespace ktree
+
+#endif

@@ -96,9 +96,7 @@ void limit_process() {
 // Every client may have a memory file with the daemon, so two descriptors are reckoned for each.
 size_t client_limit() {
   rlimit files = {};
-  if (getrlimit(RLIMIT_NOFILE, &files) != 0) {
-    return 1;
-  }
+  if (getrlimit(RLIMIT_NOFILE, &files) != 0) return 1;
   const size_t limit = std::max<size_t>(files.rlim_cur, kOwnDescriptors + 2);
   return std::min((limit - kOwnDescriptors) / 2, kMaxClients);
 }
@@ -123,20 +121,14 @@ void tell_ready() {
   constexpr char kReady[] = "READY=1";
   const char* path = getenv("NOTIFY_SOCKET");
   sockaddr_un address = {};
-  if (path == nullptr || path[0] == '\0' || strlen(path) >= sizeof address.sun_path) {
-    return;
-  }
+  if (path == nullptr || path[0] == '\0' || strlen(path) >= sizeof address.sun_path) return;
   address.sun_family = AF_UNIX;
   strcpy(address.sun_path, path);
-  if (path[0] == '@') {
-    address.sun_path[0] = '\0';
-  }
+  if (path[0] == '@') address.sun_path[0] = '\0';
   const auto length = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + strlen(path));
   const int fd = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
   sendto(fd, kReady, sizeof kReady - 1, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&address), length);
-  if (fd >= 0) {
-    close(fd);
-  }
+  if (fd >= 0) close(fd);
 }
 
 int run_daemon(const Options& options) {

@@ -1,5 +1,6 @@
 // Limits of the configuration tree, the same for the daemon, its client and the settings file.
-#pragma once
+#ifndef PLATFORM_KTREE_LIMITS_H
+#define PLATFORM_KTREE_LIMITS_H
 
 #include <cstddef>
 
@@ -20,3 +21,5 @@ constexpr size_t kMaxTreeBytes = size_t{32} << 20;  // names and values together
 constexpr size_t kMaxDocumentBytes = size_t{256} << 20;
 
 }  // namespace ktree
+
+#endif

@@ -1,5 +1,6 @@
 // The text form of a subtree, for people and scripts.
-#pragma once
+#ifndef PLATFORM_KTREE_LISTING_H
+#define PLATFORM_KTREE_LISTING_H
 
 #include <string_view>
 
@@ -15,3 +16,5 @@ namespace ktree {
 [[nodiscard]] bool write_listing(const Node& node, const Path& path, int fd);
 
 }  // namespace ktree
+
+#endif

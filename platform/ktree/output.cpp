@@ -10,9 +10,7 @@ namespace ktree {
 
 void Output::put(std::string_view text) {
   while (!text.empty()) {
-    if (used_ == buffer_.size()) {
-      flush();
-    }
+    if (used_ == buffer_.size()) flush();
     size_t part = std::min(text.size(), buffer_.size() - used_);
     memcpy(buffer_.data() + used_, text.data(), part);
     used_ += part;

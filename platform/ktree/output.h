@@ -1,5 +1,6 @@
 // Buffered writing to a descriptor, for the documents that the daemon fills in memory files.
-#pragma once
+#ifndef PLATFORM_KTREE_OUTPUT_H
+#define PLATFORM_KTREE_OUTPUT_H
 
 #include <array>
 #include <cstddef>
@@ -14,9 +15,7 @@ class Output {
   Output& operator=(const Output&) = delete;
 
   void put(char c) {
-    if (used_ == buffer_.size()) {
-      flush();
-    }
+    if (used_ == buffer_.size()) flush();
     buffer_[used_++] = c;
   }
   void put(std::string_view text);
@@ -34,3 +33,5 @@ class Output {
 };
 
 }  // namespace ktree
+
+#endif

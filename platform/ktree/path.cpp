@@ -14,14 +14,10 @@ bool is_name_part(char c) {
 // "1" to "4096" without leading zeros; 0 for anything else.
 uint16_t parse_number(std::string_view text) {
   constexpr size_t kMaxDigits = 4;
-  if (text.empty() || text.size() > kMaxDigits || text.front() == '0') {
-    return 0;
-  }
+  if (text.empty() || text.size() > kMaxDigits || text.front() == '0') return 0;
   unsigned number = 0;
   for (char c : text) {
-    if (c < '0' || c > '9') {
-      return 0;
-    }
+    if (c < '0' || c > '9') return 0;
     number = number * 10 + static_cast<unsigned>(c - '0');
   }
   return number <= kMaxNumber ? static_cast<uint16_t>(number) : uint16_t{0};
@@ -39,31 +35,21 @@ bool parse_element(std::string_view text, Element& element) {
 }  // namespace
 
 bool valid_name(std::string_view text) {
-  if (text.empty() || !is_name_start(text.front())) {
-    return false;
-  }
+  if (text.empty() || !is_name_start(text.front())) return false;
   for (char c : text) {
-    if (!is_name_part(c)) {
-      return false;
-    }
+    if (!is_name_part(c)) return false;
   }
   return true;
 }
 
 bool parse_path(std::string_view text, Path& path) {
   path.depth = 0;
-  if (text.size() > kMaxPathBytes || text.empty()) {
-    return false;
-  }
+  if (text.size() > kMaxPathBytes || text.empty()) return false;
   while (!text.empty()) {
-    if (text.front() != '/' || path.depth == path.elements.size()) {
-      return false;
-    }
+    if (text.front() != '/' || path.depth == path.elements.size()) return false;
     text.remove_prefix(1);
     std::string_view element = text.substr(0, text.find('/'));
-    if (!parse_element(element, path.elements[path.depth])) {
-      return false;
-    }
+    if (!parse_element(element, path.elements[path.depth])) return false;
     path.depth++;
     text.remove_prefix(element.size());
   }
@@ -71,13 +57,9 @@ bool parse_path(std::string_view text, Path& path) {
 }
 
 size_t number_length(size_t number) {
-  if (number == 1) {
-    return 0;
-  }
+  if (number == 1) return 0;
   size_t length = 1;
-  for (; number > 0; number /= 10) {
-    length++;
-  }
+  for (; number > 0; number /= 10) length++;
   return length;
 }
 

@@ -2,7 +2,8 @@
 //
 // A path is a slash and elements joined by slashes. An element is a name, or a name, a colon and a number
 // from 1 to 4096; a bare name means 1. A name is [A-Za-z_][A-Za-z0-9_.-]*. A path is at most 1,023 bytes.
-#pragma once
+#ifndef PLATFORM_KTREE_PATH_H
+#define PLATFORM_KTREE_PATH_H
 
 #include <array>
 #include <cstddef>
@@ -40,3 +41,5 @@ struct Path {
 [[nodiscard]] size_t number_length(size_t number);
 
 }  // namespace ktree
+
+#endif

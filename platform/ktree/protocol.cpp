@@ -6,9 +6,7 @@ namespace ktree {
 
 size_t request_size(std::string_view bytes) {
   uint32_t length = 0;
-  if (bytes.size() < sizeof length) {
-    return kMoreNeeded;
-  }
+  if (bytes.size() < sizeof length) return kMoreNeeded;
   memcpy(&length, bytes.data(), sizeof length);
   const size_t size = sizeof length + size_t{length};
   return size < sizeof(RequestHeader) || size > kMaxRequestBytes ? kNoRequest : size;
@@ -16,13 +14,11 @@ size_t request_size(std::string_view bytes) {
 
 bool parse_request(std::string_view bytes, Request& request) {
   RequestHeader header = {};
-  if (bytes.size() < sizeof header || request_size(bytes) != bytes.size()) {
-    return false;
-  }
+  if (bytes.size() < sizeof header || request_size(bytes) != bytes.size()) return false;
   memcpy(&header, bytes.data(), sizeof header);
   bytes.remove_prefix(sizeof header);
-  if (header.operation < static_cast<uint8_t>(Operation::get) ||
-      header.operation > static_cast<uint8_t>(Operation::list) || header.zero != 0 ||
+  if (header.operation < static_cast<uint8_t>(Operation::kGet) ||
+      header.operation > static_cast<uint8_t>(Operation::kList) || header.zero != 0 ||
       header.path_length > bytes.size()) {
     return false;
   }

@@ -3,7 +3,8 @@
 //
 // Numbers are in the byte order of the machine. A client sends one request and waits for its reply before it
 // sends the next one.
-#pragma once
+#ifndef PLATFORM_KTREE_PROTOCOL_H
+#define PLATFORM_KTREE_PROTOCOL_H
 
 #include <cstdint>
 #include <string_view>
@@ -13,21 +14,21 @@
 namespace ktree {
 
 enum class Operation : uint8_t {
-  get = 1,   // value: the most bytes of the value that the client wants, a 32-bit number
-  set = 2,   // value: the value
-  del = 3,   // no value
-  dump = 4,  // no path, no value; a memory file is passed, which the daemon fills with the settings file
-  load = 5,  // no path, no value; a memory file is passed, which holds the settings file
-  list =
+  kGet = 1,   // value: the most bytes of the value that the client wants, a 32-bit number
+  kSet = 2,   // value: the value
+  kDel = 3,   // no value
+  kDump = 4,  // no path, no value; a memory file is passed, which the daemon fills with the settings file
+  kLoad = 5,  // no path, no value; a memory file is passed, which holds the settings file
+  kList =
       6,  // no value; a memory file is passed, which the daemon fills with the listing; the path may be "/"
 };
 
 enum class Status : uint8_t {
-  done = 0,     // a get: the value follows
-  missing = 1,  // no such node, or no value in it
-  refused = 2,  // a bad path or value, or the tree would get too large
-  damaged = 3,  // a load: the document is damaged; a text of at most kMaxErrorBytes follows that says where
-  failed = 4,   // the memory file is of no use, or memory is short
+  kDone = 0,     // a get: the value follows
+  kMissing = 1,  // no such node, or no value in it
+  kRefused = 2,  // a bad path or value, or the tree would get too large
+  kDamaged = 3,  // a load: the document is damaged; a text of at most kMaxErrorBytes follows that says where
+  kFailed = 4,   // the memory file is of no use, or memory is short
 };
 
 struct RequestHeader {
@@ -68,3 +69,5 @@ constexpr size_t kNoRequest = SIZE_MAX;
 [[nodiscard]] bool parse_request(std::string_view bytes, Request& request);
 
 }  // namespace ktree
+
+#endif

@@ -12,18 +12,14 @@ constexpr int kMostNeeded = 1024;
 }  // namespace
 
 bool Series::starts() {
-  if (running() || ++replies_ < needed_) {
-    return false;
-  }
+  if (running() || ++replies_ < needed_) return false;
   trust_ = kMostTrust;
   return true;
 }
 
 bool Series::ends(bool came) {
   trust_ = came ? std::min(trust_ + 1, kMostTrust) : std::max(trust_ - kInVain, 0);
-  if (running()) {
-    return false;
-  }
+  if (running()) return false;
   replies_ = 0;
   needed_ = std::min(needed_ * 2, kMostNeeded);
   return true;

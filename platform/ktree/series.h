@@ -4,7 +4,8 @@
 // process that blocks in read(2) is (unix_write_space() in the kernel), has its processor out of its sleep
 // when the request is there, which saves a sixth of the round trip between two processors. Where it wakes in
 // vain too often, because the client does not go on at once or both share a processor, it had better sleep.
-#pragma once
+#ifndef PLATFORM_KTREE_SERIES_H
+#define PLATFORM_KTREE_SERIES_H
 
 namespace ktree {
 
@@ -26,3 +27,5 @@ class Series {
 };
 
 }  // namespace ktree
+
+#endif

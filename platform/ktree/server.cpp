@@ -58,9 +58,7 @@ Server::~Server() {
       delete connection;
     }
   }
-  if (epoll_ >= 0) {
-    close(epoll_);
-  }
+  if (epoll_ >= 0) close(epoll_);
 }
 
 bool Server::watch(int fd, void* tag, uint32_t events, int action) const {
@@ -80,9 +78,7 @@ bool Server::run() {
   while (running_) {
     epoll_event events[kEventsATurn];
     const int ready = epoll_wait(epoll_, events, kEventsATurn, wait_time());
-    if (ready < 0 && errno != EINTR) {
-      return false;
-    }
+    if (ready < 0 && errno != EINTR) return false;
     take_turn(events, ready);
     keep_time();
   }
@@ -103,35 +99,23 @@ void Server::take_turn(const epoll_event* events, int count) {
       serve(*static_cast<Connection*>(tag), events[i].events);
     }
   }
-  if (accepting) {
-    accept_clients();
-  }
+  if (accepting) accept_clients();
 }
 
 // Milliseconds until something is due, -1 when nothing ever will be without an event.
 int Server::wait_time() const {
-  if (stuck_.first == nullptr && accept_again_ == 0) {
-    return -1;
-  }
+  if (stuck_.first == nullptr && accept_again_ == 0) return -1;
   int64_t due = INT64_MAX;
-  if (stuck_.first != nullptr) {
-    due = stuck_.first->since + kStuckMilliseconds;
-  }
-  if (accept_again_ != 0) {
-    due = std::min(due, accept_again_);
-  }
+  if (stuck_.first != nullptr) due = stuck_.first->since + kStuckMilliseconds;
+  if (accept_again_ != 0) due = std::min(due, accept_again_);
   return static_cast<int>(std::max<int64_t>(0, due - now_milliseconds()));
 }
 
 // Does what is due by the clock.
 void Server::keep_time() {
-  if (stuck_.first == nullptr && accept_again_ == 0) {
-    return;
-  }
+  if (stuck_.first == nullptr && accept_again_ == 0) return;
   const int64_t now = now_milliseconds();
-  while (stuck_.first != nullptr && now - stuck_.first->since >= kStuckMilliseconds) {
-    drop(*stuck_.first);
-  }
+  while (stuck_.first != nullptr && now - stuck_.first->since >= kStuckMilliseconds) drop(*stuck_.first);
   if (accept_again_ != 0 && now >= accept_again_ && watch(listener_, &listener_, EPOLLIN, EPOLL_CTL_MOD)) {
     accept_again_ = 0;
   }
@@ -141,9 +125,7 @@ void Server::keep_time() {
 // requests of those that came before it are looked at in between.
 void Server::accept_clients() {
   for (int i = 0; i < kEventsATurn; i++) {
-    if (clients_ >= max_clients_ && (i > 0 || !make_room())) {
-      return;
-    }
+    if (clients_ >= max_clients_ && (i > 0 || !make_room())) return;
     const int fd = accept4(listener_, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC);
     if (fd >= 0) {
       welcome(fd);
@@ -165,18 +147,14 @@ void Server::welcome(int fd) {
     return;
   }
   connection->fd = fd;
-  if (!is_welcome(fd) || !watch(fd, connection.get(), kNextRequest, EPOLL_CTL_ADD)) {
-    return;
-  }
+  if (!is_welcome(fd) || !watch(fd, connection.get(), kNextRequest, EPOLL_CTL_ADD)) return;
   clients_++;
   idle_.append(*connection.release());
 }
 
 // A listener that stays readable while no descriptor is free would turn the loop into a busy one.
 void Server::pause_accepting() {
-  if (watch(listener_, &listener_, 0, EPOLL_CTL_MOD)) {
-    accept_again_ = now_milliseconds() + kAcceptPause;
-  }
+  if (watch(listener_, &listener_, 0, EPOLL_CTL_MOD)) accept_again_ = now_milliseconds() + kAcceptPause;
 }
 
 // Drops the client that is needed least. Returns false when there is none.
@@ -186,9 +164,7 @@ bool Server::make_room() {
     Connection* idle = idle_for_longest();
     victim = idle == nullptr ? victim : idle;
   }
-  if (victim == nullptr) {
-    return false;
-  }
+  if (victim == nullptr) return false;
   drop(*victim);
   return true;
 }
@@ -196,9 +172,7 @@ bool Server::make_room() {
 // A client whose request has come in the meantime is not idle.
 Connection* Server::idle_for_longest() const {
   Connection* connection = idle_.first;
-  while (connection != nullptr && has_input(connection->fd)) {
-    connection = connection->next;
-  }
+  while (connection != nullptr && has_input(connection->fd)) connection = connection->next;
   return connection;
 }
 
@@ -223,16 +197,10 @@ bool Server::receive_part(Connection& connection) {
   char* buffer = started ? connection.bytes.get() : request_.data();
   const size_t room = started ? connection.size : request_.size();
   const int64_t n = receive(connection, buffer + connection.used, room - connection.used);
-  if (n < 0) {
-    drop(connection);
-  }
-  if (n <= 0) {
-    return false;
-  }
+  if (n < 0) drop(connection);
+  if (n <= 0) return false;
   const size_t have = connection.used + static_cast<size_t>(n);
-  if (started) {
-    connection.used = have;
-  }
+  if (started) connection.used = have;
   return take_request(connection, {buffer, have});
 }
 
@@ -258,14 +226,10 @@ bool Server::take_request(Connection& connection, std::string_view bytes) {
 // Keeps the part of a request that has come, with room for `size` bytes in all. Returns false when memory is
 // short.
 bool Server::keep_part(Connection& connection, std::string_view bytes, size_t size) {
-  if (connection.bytes == nullptr) {
-    mark_stuck(connection);
-  }
+  if (connection.bytes == nullptr) mark_stuck(connection);
   if (connection.size < size) {
     std::unique_ptr<char[]> room = room_for(size);
-    if (room == nullptr) {
-      return false;
-    }
+    if (room == nullptr) return false;
     memcpy(room.get(), bytes.data(), bytes.size());
     connection.bytes = std::move(room);
     connection.used = bytes.size();
@@ -324,9 +288,7 @@ void Server::keep_reply(Connection& connection, std::string_view rest) {
   connection.size = rest.size();
   connection.sending = true;
   mark_stuck(connection);
-  if (!watch(connection.fd, &connection, kReplyTaken, EPOLL_CTL_MOD)) {
-    drop(connection);
-  }
+  if (!watch(connection.fd, &connection, kReplyTaken, EPOLL_CTL_MOD)) drop(connection);
 }
 
 void Server::continue_reply(Connection& connection) {
@@ -337,9 +299,7 @@ void Server::continue_reply(Connection& connection) {
     return;
   }
   connection.used += static_cast<size_t>(n);
-  if (connection.used == connection.size) {
-    settle(connection);
-  }
+  if (connection.used == connection.size) settle(connection);
 }
 
 // The reply has gone: the client is idle, and the last one to be dropped for others, unless it has said that

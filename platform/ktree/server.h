@@ -1,5 +1,6 @@
 // The daemon's loop: many clients, one thread, nothing that waits for one of them.
-#pragma once
+#ifndef PLATFORM_KTREE_SERVER_H
+#define PLATFORM_KTREE_SERVER_H
 
 #include <array>
 #include <cstddef>
@@ -74,3 +75,5 @@ class Server {
 };
 
 }  // namespace ktree
+
+#endif

@@ -34,40 +34,36 @@ Service::Answer Service::handle(const Request& request) {
   try {
     return carry_out(request);
   } catch (const std::bad_alloc&) {
-    return {Status::failed, {}};
+    return {Status::kFailed, {}};
   }
 }
 
 Service::Answer Service::carry_out(const Request& request) {
   switch (request.operation) {
-    case Operation::get:
+    case Operation::kGet:
       return get(request);
-    case Operation::set:
+    case Operation::kSet:
       return set(request);
-    case Operation::del:
+    case Operation::kDel:
       return del(request);
-    case Operation::dump:
+    case Operation::kDump:
       return dump(request);
-    case Operation::load:
+    case Operation::kLoad:
       return load(request);
-    case Operation::list:
+    case Operation::kList:
       return list(request);
   }
-  return {Status::refused, {}};
+  return {Status::kRefused, {}};
 }
 
 Service::Answer Service::get(const Request& request) const {
   uint32_t wanted = 0;
   Path path;
-  if (request.value.size() != sizeof wanted || !parse_path(request.path, path)) {
-    return {Status::refused, {}};
-  }
+  if (request.value.size() != sizeof wanted || !parse_path(request.path, path)) return {Status::kRefused, {}};
   memcpy(&wanted, request.value.data(), sizeof wanted);
   const Node* node = tree_.find(path);
-  if (node == nullptr || !node->has_value()) {
-    return {Status::missing, {}};
-  }
-  return {Status::done, node->value().substr(0, wanted)};
+  if (node == nullptr || !node->has_value()) return {Status::kMissing, {}};
+  return {Status::kDone, node->value().substr(0, wanted)};
 }
 
 Service::Answer Service::set(const Request& request) {
@@ -75,50 +71,44 @@ Service::Answer Service::set(const Request& request) {
   const bool carried =
       request.value.size() <= kMaxValueBytes && request.value.find('\0') == std::string_view::npos;
   if (!carried || !parse_path(request.path, path) || !tree_.set(path, request.value)) {
-    return {Status::refused, {}};
+    return {Status::kRefused, {}};
   }
-  return {Status::done, {}};
+  return {Status::kDone, {}};
 }
 
 Service::Answer Service::del(const Request& request) {
   Path path;
-  if (!request.value.empty() || !parse_path(request.path, path)) {
-    return {Status::refused, {}};
-  }
-  return {tree_.remove(path) ? Status::done : Status::missing, {}};
+  if (!request.value.empty() || !parse_path(request.path, path)) return {Status::kRefused, {}};
+  return {tree_.remove(path) ? Status::kDone : Status::kMissing, {}};
 }
 
 Service::Answer Service::dump(const Request& request) const {
-  return {is_new_document(request.document) && write_settings(tree_, request.document) ? Status::done
-                                                                                       : Status::failed,
+  return {is_new_document(request.document) && write_settings(tree_, request.document) ? Status::kDone
+                                                                                       : Status::kFailed,
           {}};
 }
 
 Service::Answer Service::load(const Request& request) {
-  return is_memory_file(request.document) ? load_document(request.document) : Answer{Status::failed, {}};
+  return is_memory_file(request.document) ? load_document(request.document) : Answer{Status::kFailed, {}};
 }
 
 Service::Answer Service::load_document(int fd) {
   Tree loaded;
   if (!read_settings(fd, loaded, error_)) {
-    return {Status::damaged, std::string_view(error_).substr(0, kMaxErrorBytes)};
+    return {Status::kDamaged, std::string_view(error_).substr(0, kMaxErrorBytes)};
   }
   tree_.swap(loaded);
-  return {Status::done, {}};
+  return {Status::kDone, {}};
 }
 
 Service::Answer Service::list(const Request& request) const {
   Path path;
   path.depth = 0;
-  if (request.path != "/" && !parse_path(request.path, path)) {
-    return {Status::refused, {}};
-  }
+  if (request.path != "/" && !parse_path(request.path, path)) return {Status::kRefused, {}};
   const Node* node = tree_.find(path);
-  if (node == nullptr) {
-    return {Status::missing, {}};
-  }
+  if (node == nullptr) return {Status::kMissing, {}};
   const bool written = is_new_document(request.document) && write_listing(*node, path, request.document);
-  return {written ? Status::done : Status::failed, {}};
+  return {written ? Status::kDone : Status::kFailed, {}};
 }
 
 }  // namespace ktree

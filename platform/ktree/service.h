@@ -1,5 +1,6 @@
 // What the daemon does with a request.
-#pragma once
+#ifndef PLATFORM_KTREE_SERVICE_H
+#define PLATFORM_KTREE_SERVICE_H
 
 #include <string>
 
@@ -15,7 +16,7 @@ class Service {
     Status status;
     std::string_view body;
   };
-  // When memory is short the answer is Status::failed, and the tree is as it was.
+  // When memory is short the answer is Status::kFailed, and the tree is as it was.
   [[nodiscard]] Answer handle(const Request& request);
 
   // Makes the tree what the settings file in `fd` holds, or leaves it as it was. Throws std::bad_alloc when
@@ -36,3 +37,5 @@ class Service {
 };
 
 }  // namespace ktree
+
+#endif

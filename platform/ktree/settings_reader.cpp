@@ -77,9 +77,7 @@ class SettingsReader {
 
 SettingsReader::SettingsReader(Tree& tree, std::string& error)
     : tree_(tree), error_(error), parser_(XML_ParserCreate(nullptr)) {
-  if (parser_ == nullptr) {
-    throw std::bad_alloc();
-  }
+  if (parser_ == nullptr) throw std::bad_alloc();
   error_.clear();
   XML_SetUserData(parser_, this);
   XML_SetElementHandler(parser_, on_start, on_end);
@@ -88,9 +86,7 @@ SettingsReader::SettingsReader(Tree& tree, std::string& error)
 }
 
 void SettingsReader::refuse(const char* what) {
-  if (!error_.empty()) {
-    return;
-  }
+  if (!error_.empty()) return;
   char text[160];
   snprintf(text, sizeof text, "line %lu: %s", static_cast<unsigned long>(XML_GetCurrentLineNumber(parser_)),
            what);
@@ -100,26 +96,20 @@ void SettingsReader::refuse(const char* what) {
 
 void* SettingsReader::chunk() {
   void* room = XML_GetBuffer(parser_, kChunk);
-  if (room == nullptr) {
-    throw std::bad_alloc();
-  }
+  if (room == nullptr) throw std::bad_alloc();
   return room;
 }
 
 bool SettingsReader::feed(size_t size) {
   if (XML_ParseBuffer(parser_, static_cast<int>(size), size == 0) != XML_STATUS_OK) {
-    if (memory_is_short_ || XML_GetErrorCode(parser_) == XML_ERROR_NO_MEMORY) {
-      throw std::bad_alloc();
-    }
+    if (memory_is_short_ || XML_GetErrorCode(parser_) == XML_ERROR_NO_MEMORY) throw std::bad_alloc();
     refuse(XML_ErrorString(XML_GetErrorCode(parser_)));
     return false;
   }
   fed_ += size;
   understood_ =
       std::max(understood_, static_cast<size_t>(std::max<XML_Index>(0, XML_GetCurrentByteIndex(parser_))));
-  if (fed_ > kMaxDocumentBytes || fed_ - understood_ > kMaxToken) {
-    refuse("a document that is too long");
-  }
+  if (fed_ > kMaxDocumentBytes || fed_ - understood_ > kMaxToken) refuse("a document that is too long");
   return error_.empty();
 }
 
@@ -128,9 +118,7 @@ bool SettingsReader::feed(size_t size) {
 template <typename Act>
 void SettingsReader::call(void* self, Act act) {
   auto* reader = static_cast<SettingsReader*>(self);
-  if (reader->memory_is_short_ || !reader->error_.empty()) {
-    return;
-  }
+  if (reader->memory_is_short_ || !reader->error_.empty()) return;
   try {
     act(*reader);
   } catch (const std::bad_alloc&) {
@@ -214,14 +202,10 @@ void SettingsReader::start_node(std::string_view name) {
 void SettingsReader::read_attribute(std::string_view name, std::string_view value) {
   OpenElement& element = open_.back();
   if (name == kEncodingAttribute) {
-    if (value != kBase64) {
-      refuse("an encoding that is not base64");
-    }
+    if (value != kBase64) refuse("an encoding that is not base64");
     element.text.set_encoded();
   } else if (name == kValueAttribute) {
-    if (value != kNoValue) {
-      refuse("a value attribute that is not none");
-    }
+    if (value != kNoValue) refuse("a value attribute that is not none");
     element.no_value = true;
   }
 }
@@ -230,9 +214,7 @@ void SettingsReader::end_root() {
   bool present = false;
   open_.back().text.begin_child();
   const char* wrong = open_.back().text.finish(value_, present);
-  if (wrong != nullptr || present) {
-    refuse("text outside every node");
-  }
+  if (wrong != nullptr || present) refuse("text outside every node");
   open_.pop_back();
 }
 
@@ -247,9 +229,7 @@ void SettingsReader::end_node() {
   if (wrong == nullptr && present && !tree_.set_value(*element.node, value_)) {
     wrong = "a tree that is too large";
   }
-  if (wrong != nullptr) {
-    refuse(wrong);
-  }
+  if (wrong != nullptr) refuse(wrong);
   open_.pop_back();
 }
 
@@ -262,12 +242,8 @@ bool read_all(SettingsReader& reader, Read read) {
       reader.refuse("the document cannot be read");
       return false;
     }
-    if (!reader.feed(static_cast<size_t>(size))) {
-      return false;
-    }
-    if (size == 0) {
-      return true;
-    }
+    if (!reader.feed(static_cast<size_t>(size))) return false;
+    if (size == 0) return true;
   }
 }
 

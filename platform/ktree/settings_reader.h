@@ -1,5 +1,6 @@
 // Reads the XML of the settings file into a tree.
-#pragma once
+#ifndef PLATFORM_KTREE_SETTINGS_READER_H
+#define PLATFORM_KTREE_SETTINGS_READER_H
 
 #include <string>
 #include <string_view>
@@ -17,3 +18,5 @@ namespace ktree {
 [[nodiscard]] bool read_settings(std::string_view document, Tree& tree, std::string& error);
 
 }  // namespace ktree
+
+#endif

@@ -12,9 +12,7 @@ namespace {
 constexpr unsigned kMaxIndent = 16;  // keeps a deep tree's document small
 
 void indent(Output& out, unsigned depth) {
-  for (unsigned i = std::min(depth, kMaxIndent); i > 0; i--) {
-    out.put(' ');
-  }
+  for (unsigned i = std::min(depth, kMaxIndent); i > 0; i--) out.put(' ');
 }
 
 void put_attribute(Output& out, std::string_view name, std::string_view value) {
@@ -58,12 +56,8 @@ void write_node(Output& out, const Node& node, unsigned depth) {
   indent(out, depth);
   out.put('<');
   out.put(name);
-  if (encoded) {
-    put_attribute(out, kEncodingAttribute, kBase64);
-  }
-  if (!node.has_value() && !has_children) {
-    put_attribute(out, kValueAttribute, kNoValue);
-  }
+  if (encoded) put_attribute(out, kEncodingAttribute, kBase64);
+  if (!node.has_value() && !has_children) put_attribute(out, kValueAttribute, kNoValue);
   if (node.value().empty() && !has_children) {
     out.put("/>\n");
     return;

@@ -1,5 +1,6 @@
 // Writes the tree as the XML of the settings file.
-#pragma once
+#ifndef PLATFORM_KTREE_SETTINGS_WRITER_H
+#define PLATFORM_KTREE_SETTINGS_WRITER_H
 
 #include "ktree/tree.h"
 
@@ -9,3 +10,5 @@ namespace ktree {
 [[nodiscard]] bool write_settings(const Tree& tree, int fd);
 
 }  // namespace ktree
+
+#endif

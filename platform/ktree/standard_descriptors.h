@@ -1,5 +1,6 @@
 // The descriptors 0 to 2 of a process that was started without some of them.
-#pragma once
+#ifndef PLATFORM_KTREE_STANDARD_DESCRIPTORS_H
+#define PLATFORM_KTREE_STANDARD_DESCRIPTORS_H
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -13,9 +14,9 @@ inline void fill_standard_descriptors() {
   do {
     fd = open("/dev/null", O_RDONLY);
   } while (fd >= 0 && fd <= STDERR_FILENO);
-  if (fd >= 0) {
-    close(fd);
-  }
+  if (fd >= 0) close(fd);
 }
 
 }  // namespace ktree
+
+#endif

@@ -24,7 +24,7 @@ bool load_file(const std::string& file, Service& service, std::string& reason) {
   bool loaded = false;
   if (S_ISREG(info.st_mode)) {
     const Service::Answer answer = service.load_document(fd);
-    loaded = answer.status == Status::done;
+    loaded = answer.status == Status::kDone;
     reason = answer.body;
   } else {
     reason = "not a regular file";
@@ -50,17 +50,13 @@ void load_first(const std::vector<std::string>& files, Service& service) {
   for (const std::string& file : files) {
     std::string reason;
     if (load_file(file, service, reason)) {
-      if (passed_over) {
-        platform::report(LOG_WARNING, "ktree: loaded %s instead", file.c_str());
-      }
+      if (passed_over) platform::report(LOG_WARNING, "ktree: loaded %s instead", file.c_str());
       return;
     }
     const bool is_there = access(file.c_str(), F_OK) == 0;
     platform::report(is_there ? LOG_WARNING : LOG_NOTICE, "ktree: %s: %s", file.c_str(), reason.c_str());
     passed_over = true;
-    if (is_there) {
-      keep_damaged(file);
-    }
+    if (is_there) keep_damaged(file);
   }
 }
 

@@ -1,5 +1,6 @@
 // The settings files that the daemon is started with.
-#pragma once
+#ifndef PLATFORM_KTREE_START_SETTINGS_H
+#define PLATFORM_KTREE_START_SETTINGS_H
 
 #include <string>
 #include <vector>
@@ -14,3 +15,5 @@ namespace ktree {
 void load_first(const std::vector<std::string>& files, Service& service);
 
 }  // namespace ktree
+
+#endif

@@ -39,24 +39,18 @@ void unlink_sibling(Node& parent, Node& node) {
 void leave_group(Node& parent, Node& node, unsigned number) {
   Group* group = node.group;
   group->members.erase(group->members.begin() + (number - 1));
-  if (group->members.empty()) {
-    parent.groups.erase(group_position(parent, group->name));
-  }
+  if (group->members.empty()) parent.groups.erase(group_position(parent, group->name));
 }
 
 }  // namespace
 
 Tree::~Tree() {
-  while (root_.first_child != nullptr) {
-    destroy(std::exchange(root_.first_child, root_.first_child->next));
-  }
+  while (root_.first_child != nullptr) destroy(std::exchange(root_.first_child, root_.first_child->next));
 }
 
 const Node* Tree::find(const Path& path) const {
   const Node* node = &root_;
-  for (size_t i = 0; i < path.depth && node != nullptr; i++) {
-    node = find_child(*node, path.elements[i]);
-  }
+  for (size_t i = 0; i < path.depth && node != nullptr; i++) node = find_child(*node, path.elements[i]);
   return node;
 }
 
@@ -94,14 +88,10 @@ bool Tree::set(const Path& path, std::string_view value) {
   size_t existing = 0;
   for (; existing < path.depth; existing++) {
     Node* child = find_child(*node, path.elements[existing]);
-    if (child == nullptr) {
-      break;
-    }
+    if (child == nullptr) break;
     node = child;
   }
-  if (!fits(growth_by(*node, path, existing, value))) {
-    return false;
-  }
+  if (!fits(growth_by(*node, path, existing, value))) return false;
   if (existing == path.depth) {
     store_value(*node, value);
     return true;
@@ -137,28 +127,20 @@ bool Tree::remove(const Path& path) {
   Node* node = &root_;
   for (size_t i = 0; i < path.depth; i++) {
     parent = std::exchange(node, find_child(*node, path.elements[i]));
-    if (node == nullptr) {
-      return false;
-    }
+    if (node == nullptr) return false;
   }
-  if (parent == nullptr) {
-    return false;
-  }
+  if (parent == nullptr) return false;
   take_out(*parent, *node, path.elements[path.depth - 1].number);
   return true;
 }
 
 Node* Tree::append_child(Node& parent, std::string_view name) {
-  if (members_of(parent, name) >= kMaxNumber || !fits({1, name.size()})) {
-    return nullptr;
-  }
+  if (members_of(parent, name) >= kMaxNumber || !fits({1, name.size()})) return nullptr;
   return make_child(parent, name);
 }
 
 bool Tree::set_value(Node& node, std::string_view value) {
-  if (value.size() > kMaxValueBytes || !fits({0, value.size()})) {
-    return false;
-  }
+  if (value.size() > kMaxValueBytes || !fits({0, value.size()})) return false;
   store_value(node, value);
   return true;
 }
@@ -197,21 +179,15 @@ void Tree::store_value(Node& node, std::string_view value) {
     bytes_ += value.size() - node.size;
     node.size = static_cast<uint32_t>(value.size());
   }
-  if (!value.empty()) {
-    memcpy(node.text.get(), value.data(), value.size());
-  }
+  if (!value.empty()) memcpy(node.text.get(), value.data(), value.size());
 }
 
 // Frees `node`, which nothing leads to any more, and all below it; no deeper than a path can be.
 void Tree::destroy(Node* node) {
-  if (node->group != nullptr) {
-    bytes_ -= node->group->name.size();
-  }
+  if (node->group != nullptr) bytes_ -= node->group->name.size();
   bytes_ -= node->size;
   node_count_--;
-  while (node->first_child != nullptr) {
-    destroy(std::exchange(node->first_child, node->first_child->next));
-  }
+  while (node->first_child != nullptr) destroy(std::exchange(node->first_child, node->first_child->next));
   delete node;
 }
 

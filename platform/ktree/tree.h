@@ -1,7 +1,8 @@
 // The configuration tree in memory: nodes in the order in which they were made, and by name and number.
 //
 // `name:N` is the N-th child of that name. Taking one out moves the later ones of the same name down by one.
-#pragma once
+#ifndef PLATFORM_KTREE_TREE_H
+#define PLATFORM_KTREE_TREE_H
 
 #include <cstddef>
 #include <cstdint>
@@ -42,9 +43,7 @@ struct Node {
 // Calls visit(child, number) for the children of `node` in the order in which they were made.
 template <typename Visit>
 void for_each_child(const Node& node, Visit visit) {
-  for (const auto& group : node.groups) {
-    group->visited = 0;
-  }
+  for (const auto& group : node.groups) group->visited = 0;
   for (const Node* child = node.first_child; child != nullptr; child = child->next) {
     visit(*child, ++child->group->visited);
   }
@@ -102,3 +101,5 @@ class Tree {
 };
 
 }  // namespace ktree
+
+#endif

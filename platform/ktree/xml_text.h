@@ -1,5 +1,6 @@
 // What XML 1.0 can carry as plain text, and what a reader of the settings file makes of it.
-#pragma once
+#ifndef PLATFORM_KTREE_XML_TEXT_H
+#define PLATFORM_KTREE_XML_TEXT_H
 
 #include <string_view>
 
@@ -21,3 +22,5 @@ constexpr char kNoValue[] = "none";
 [[nodiscard]] bool needs_encoding(std::string_view value, bool has_children);
 
 }  // namespace ktree
+
+#endif

@@ -1,4 +1,4 @@
-#include "delivery.h"
+#include "notify/delivery.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -20,8 +20,8 @@
 #include <cstring>
 #include <vector>
 
-#include "report.h"
-#include "utf8.h"
+#include "common/report.h"
+#include "common/utf8.h"
 
 namespace notify {
 namespace {
@@ -83,12 +83,13 @@ class Runs {
     pid_t child = -1;
     const int error = posix_spawnp(&child, argv[0], &actions, nullptr, argv.data(), environ);
     posix_spawn_file_actions_destroy(&actions);
-    if (error != 0)
+    if (error != 0) {
       note(complain(program, strerror(error)));
-    else if (ends_soon(child))
+    } else if (ends_soon(child)) {
       take_end({program, child});
-    else
+    } else {
       running_.push_back({program, child});
+    }
   }
 
   void note(bool good) { good_ = good_ && good; }
@@ -141,10 +142,11 @@ void mail_event(const Event& event, const Config& config, Runs& runs) {
   text.append("\nContent-Type: text/plain; charset=utf-8\nAuto-Submitted: auto-generated\n\n");
   text.append(event.message).append("\n\nvvstat -x shows what needs attention.\n");
   const int mail = memfd_create("mail", MFD_CLOEXEC);
-  if (mail < 0 || write(mail, text.data(), text.size()) < 0 || lseek(mail, 0, SEEK_SET) < 0)
+  if (mail < 0 || write(mail, text.data(), text.size()) < 0 || lseek(mail, 0, SEEK_SET) < 0) {
     runs.note(complain("mail", strerror(errno)));
-  else
+  } else {
     runs.start({"sendmail", "-t"}, mail);
+  }
   if (mail >= 0) close(mail);
 }
 
@@ -158,11 +160,12 @@ std::vector<std::string> programs() {
   std::vector<std::string> found;
   dirent** entries = nullptr;
   const int count = scandir(kFolder, &entries, is_program_name, alphasort);
-  for (int at = 0; at < count; ++at) {
+  for (int at = 0; at < count; at++) {
     const std::string path = std::string(kFolder) + "/" + entries[at]->d_name;
     struct stat info {};
-    if (stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) && (info.st_mode & S_IXUSR) != 0)
+    if (stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) && (info.st_mode & S_IXUSR) != 0) {
       found.push_back(path);
+    }
     free(entries[at]);
   }
   free(entries);
@@ -209,12 +212,13 @@ Config parse_config(std::string_view text) {
     const std::string value = rest_of(std::string_view(all).substr(word.size()));
     if (word.empty()) continue;
     std::string* place = place_of(word, config);
-    if (place == nullptr)
+    if (place == nullptr) {
       complain("remvol.conf", ("no such word: " + platform::printable(word)).c_str());
-    else if (value.empty())
+    } else if (value.empty()) {
       complain("remvol.conf", (word + " has no value").c_str());
-    else
+    } else {
       *place = value;
+    }
   }
   return config;
 }

@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "history.h"
+#include "notify/history.h"
 
 namespace notify {
 

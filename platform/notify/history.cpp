@@ -1,8 +1,8 @@
-#include "history.h"
+#include "notify/history.h"
 
 #include <utility>
 
-#include "utf8.h"
+#include "common/utf8.h"
 
 namespace notify {
 namespace {

@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "past.h"
+#include "vvstat/past.h"
 
 namespace notify {
 

@@ -9,14 +9,14 @@
 #include <cstdio>
 #include <cstring>
 
-#include "delivery.h"
-#include "file_text.h"
-#include "history.h"
-#include "kernel.h"
-#include "report.h"
-#include "status.h"
-#include "tree_reader.h"
-#include "utf8.h"
+#include "common/file_text.h"
+#include "common/report.h"
+#include "common/tree_reader.h"
+#include "common/utf8.h"
+#include "notify/delivery.h"
+#include "notify/history.h"
+#include "vvstat/kernel.h"
+#include "vvstat/status.h"
 
 namespace notify {
 namespace {
@@ -84,8 +84,9 @@ int tell_of_failed_recovery(const char* target) {
           {Kind::kRecoveryFailed, name, share, "Volume " + share + ": the recovery of its target" + end});
     }
   }
-  if (events.empty())
+  if (events.empty()) {
     events.push_back({Kind::kRecoveryFailed, name, "", "Target " + name + ": its recovery" + end});
+  }
   return tell(events);
 }
 

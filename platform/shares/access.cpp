@@ -1,14 +1,14 @@
-#include "access.h"
+#include "shares/access.h"
 
 #include <sys/stat.h>
 
 #include <algorithm>
 #include <cerrno>
 
-#include "server_config.h"
-#include "share_file.h"
-#include "share_name.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "shares/server_config.h"
+#include "shares/share_file.h"
+#include "shares/share_name.h"
 
 namespace shares {
 namespace {
@@ -25,14 +25,16 @@ const char* refusal(std::string_view name) {
   std::wstring characters;
   if (name.empty()) return "a name is empty";
   if (!platform::decode(name, characters)) return "a name is not UTF-8";
-  for (size_t at = 0; at < characters.size(); ++at) {
-    if (platform::is_control(characters[at]) || platform::is_hidden(characters, at))
+  for (size_t at = 0; at < characters.size(); at++) {
+    if (platform::is_control(characters[at]) || platform::is_hidden(characters, at)) {
       return "a name holds a character that is not seen";
+    }
   }
   if (characters.find_first_of(kForbidden) != std::wstring::npos ||
       std::wstring_view(kForbiddenFirst).find(characters.front()) != std::wstring_view::npos ||
-      characters.back() == L'\\')
+      characters.back() == L'\\') {
     return "a name holds a character that the file servers do not take";
+  }
   return nullptr;
 }
 
@@ -66,8 +68,9 @@ const char* take_heading(std::string_view line, Access& access) {
 // The only option is "users = LIST".
 const char* take_option(std::string_view line, Access& access) {
   const size_t equals = line.find('=');
-  if (equals == std::string_view::npos || trim(line.substr(0, equals)) != "users")
+  if (equals == std::string_view::npos || trim(line.substr(0, equals)) != "users") {
     return "this is neither [SHARE] nor users = NAME, ...";
+  }
   if (access.rules.empty()) return "no [SHARE] stands above it";
   if (!access.rules.back().names.empty()) return "this share has a list already";
   return take_names(trim(line.substr(equals + 1)), access.rules.back());
@@ -82,15 +85,16 @@ Access wrong(int line, const char* why) {
 Access parse_access(std::string_view text) {
   Access access;
   int heading = 0;
-  for (int number = 1; !text.empty(); ++number) {
+  for (int number = 1; !text.empty(); number++) {
     const size_t end = std::min(text.find('\n'), text.size());
     const std::string_view line = trim(text.substr(0, end));
     text.remove_prefix(std::min(end + 1, text.size()));
     if (line.empty() || line.starts_with('#') || line.starts_with(';')) continue;
     const bool heads = line.starts_with('[');
     if (heads && heading != 0 && access.rules.back().names.empty()) return wrong(heading, "it has no list");
-    if (const char* why = heads ? take_heading(line, access) : take_option(line, access))
+    if (const char* why = heads ? take_heading(line, access) : take_option(line, access)) {
       return wrong(number, why);
+    }
     if (heads) heading = number;
   }
   if (heading != 0 && access.rules.back().names.empty()) return wrong(heading, "it has no list");
@@ -102,8 +106,9 @@ Access read_access(const char* file) {
   struct stat info {};
   if (lstat(file, &info) != 0 && errno == ENOENT) return {};
   const std::string text = read_file(file);
-  if (stat(file, &info) != 0 || !S_ISREG(info.st_mode) || text.size() != static_cast<size_t>(info.st_size))
+  if (stat(file, &info) != 0 || !S_ISREG(info.st_mode) || text.size() != static_cast<size_t>(info.st_size)) {
     return wrong(0, "it cannot be read");
+  }
   return parse_access(text);
 }
 

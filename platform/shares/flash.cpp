@@ -1,15 +1,15 @@
-#include "flash.h"
+#include "shares/flash.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
-#include <time.h>
 #include <unistd.h>
 #include <cerrno>
+#include <ctime>
 
-#include "lock_file.h"
+#include "shares/lock_file.h"
 
 namespace flash {
 namespace {
@@ -124,7 +124,7 @@ bool UserLock::leave(const char* folder) {
   if (take_lock(users_, LOCK_EX | LOCK_NB) && recall(opened)) {
     const timespec wait{0, kBusyWait};
     for (int tries = 0; !(closed = make_read_only(folder, opened)) && errno == EBUSY && tries < kBusyTries;
-         ++tries) {
+         tries++) {
       nanosleep(&wait, nullptr);
     }
     if (closed) record(Opened::kNot);

@@ -14,9 +14,9 @@
 #include <cstring>
 #include <initializer_list>
 
-#include "flash.h"
-#include "report.h"
-#include "settings_copy.h"
+#include "common/report.h"
+#include "shares/flash.h"
+#include "shares/settings_copy.h"
 
 namespace {
 
@@ -73,8 +73,9 @@ int exit_status(int wait_status) {
 }
 
 void leave(flash::UserLock& lock) {
-  if (!lock.leave(kFolder))
+  if (!lock.leave(kFolder)) {
     platform::report(LOG_WARNING, "flashrun: %s stays writable: %s", kFolder, strerror(errno));
+  }
 }
 
 // Starts the command in the process group `group`, waits for its end and puts back settings that it left

@@ -3,9 +3,9 @@
 #include <cerrno>
 #include <cstring>
 
-#include "process.h"
-#include "reload.h"
-#include "server_config.h"
+#include "shares/process.h"
+#include "shares/reload.h"
+#include "shares/server_config.h"
 
 using namespace shares;
 
@@ -36,7 +36,8 @@ int main(int argc, char** argv) {
     log_line(LOG_WARNING, "%s does not include %s; nobody sees the shares", kConfig, kShares);
   }
   // netatalk(8): SIGHUP makes it and its servers read the configuration again.
-  if (done.changed && run({"killall", "-q", "-HUP", "netatalk"}) != 0)
+  if (done.changed && run({"killall", "-q", "-HUP", "netatalk"}) != 0) {
     log_line(LOG_WARNING, "netatalk does not run");
+  }
   return 0;
 }

@@ -1,8 +1,7 @@
-#include "process.h"
+#include "shares/process.h"
 
 #include <fcntl.h>
 #include <poll.h>
-#include <signal.h>
 #include <spawn.h>
 #include <sys/file.h>
 #include <sys/mman.h>
@@ -10,13 +9,14 @@
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <csignal>
 
 #include <cstdarg>
 #include <cstdlib>
 #include <string_view>
 
-#include "lock_file.h"
-#include "report.h"
+#include "common/report.h"
+#include "shares/lock_file.h"
 
 namespace shares {
 namespace {
@@ -30,7 +30,7 @@ pid_t start_quietly(const std::vector<std::string>& words, int output) {
   argv.push_back(nullptr);
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
-  for (int stream = 0; stream <= 2; ++stream) {
+  for (int stream = 0; stream <= 2; stream++) {
     posix_spawn_file_actions_addopen(&actions, stream, "/dev/null", O_RDWR, 0);
   }
   if (output >= 0) posix_spawn_file_actions_adddup2(&actions, output, STDOUT_FILENO);

@@ -1,14 +1,14 @@
-#include "reload.h"
+#include "shares/reload.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
 
-#include "access.h"
-#include "process.h"
-#include "utf8.h"
-#include "volume_list.h"
+#include "common/utf8.h"
+#include "shares/access.h"
+#include "shares/process.h"
+#include "shares/volume_list.h"
 
 namespace shares {
 namespace {
@@ -77,9 +77,10 @@ void tell_of_strangers(const Access& access, const std::vector<Volume>& volumes)
     const bool known = std::any_of(volumes.begin(), volumes.end(), [&rule](const Volume& volume) {
       return folded_name(volume.name) == rule.folded;
     });
-    if (!known)
+    if (!known) {
       log_line(LOG_WARNING, "%s: no volume has the share name \"%s\"", kAccessFile,
                platform::printable(rule.share).c_str());
+    }
   }
 }
 

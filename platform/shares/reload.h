@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "share_file.h"
-#include "share_name.h"
+#include "shares/share_file.h"
+#include "shares/share_name.h"
 
 namespace shares {
 

@@ -1,12 +1,12 @@
-#include "server_config.h"
+#include "shares/server_config.h"
 
 #include <sys/stat.h>
 
 #include <algorithm>
 #include <cctype>
 
-#include "share_file.h"
-#include "share_name.h"
+#include "shares/share_file.h"
+#include "shares/share_name.h"
 
 namespace shares {
 namespace {
@@ -121,7 +121,7 @@ ServerConfig read_server_config(const char* file, const char* generated) {
   FileId ours{};
   const bool have_ours = identify(generated, ours);
   std::vector<FileId> seen;
-  for (size_t i = 0; i < config.includes.size() && seen.size() < kMaxFiles; ++i) {
+  for (size_t i = 0; i < config.includes.size() && seen.size() < kMaxFiles; i++) {
     const Include include = config.includes[i];
     const std::string path = whole_path(include.file);
     FileId id{};

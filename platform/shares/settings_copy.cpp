@@ -1,4 +1,4 @@
-#include "settings_copy.h"
+#include "shares/settings_copy.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -10,8 +10,8 @@
 #include <cstdio>
 #include <cstring>
 
-#include "lock_file.h"
-#include "report.h"
+#include "common/report.h"
+#include "shares/lock_file.h"
 
 namespace flash {
 namespace {
@@ -232,8 +232,9 @@ bool KeptSettings::keep() {
   make_name(name_, kKept);
   kept_ = openat(folder_, name_, kMaking, 0600);
   if (kept_ < 0) return false;
-  if (flock(kept_, LOCK_EX | LOCK_NB) == 0 && copy_out(settings.fd, kept_) && fsync(folder_) == 0)
+  if (flock(kept_, LOCK_EX | LOCK_NB) == 0 && copy_out(settings.fd, kept_) && fsync(folder_) == 0) {
     return true;
+  }
   unlinkat(folder_, name_, 0);
   close(kept_);
   kept_ = -1;

@@ -1,4 +1,4 @@
-#include "share_file.h"
+#include "shares/share_file.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>

@@ -1,8 +1,8 @@
-#include "share_name.h"
+#include "shares/share_name.h"
 
 #include <algorithm>
 
-#include "utf8.h"
+#include "common/utf8.h"
 
 namespace shares {
 
@@ -20,7 +20,7 @@ const NameRules kNetatalkNames = {L"%<>*?|/\\+=;:\",[]$", {L"global", L"homes"},
 namespace {
 
 bool hides_something(const std::wstring& characters) {
-  for (size_t at = 0; at < characters.size(); ++at) {
+  for (size_t at = 0; at < characters.size(); at++) {
     if (platform::is_hidden(characters, at)) return true;
   }
   return false;
@@ -40,10 +40,12 @@ const char* name_refusal(std::string_view name, const NameRules& rules) {
   std::wstring characters;
   if (name.empty() || name == "." || name == "..") return "it names no folder";
   if (!platform::decode(name, characters)) return "it is not UTF-8";
-  if (std::any_of(characters.begin(), characters.end(), platform::is_control))
+  if (std::any_of(characters.begin(), characters.end(), platform::is_control)) {
     return "it holds a control character";
-  if (hides_something(characters))
+  }
+  if (hides_something(characters)) {
     return "it holds a character that is not seen or that turns the text around";
+  }
   if (characters.find_first_of(rules.forbidden) != std::wstring::npos) {
     return "it holds a character that the file server does not allow in names";
   }

@@ -1,9 +1,9 @@
-#include "volume_list.h"
+#include "shares/volume_list.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
 
-#include "tree_reader.h"
+#include "common/tree_reader.h"
 
 namespace shares {
 namespace {
@@ -54,9 +54,9 @@ bool read_volumes(std::vector<Volume>& volumes) {
   const platform::TreeReader tree;
   if (!tree.answered()) return false;
   // The slots in use are the first ones; one that was damaged must not hide those behind it.
-  for (int target = 1; target <= platform::kTargets; ++target) {
+  for (int target = 1; target <= platform::kTargets; target++) {
     if (tree.value("/iscsi/initiator/id:%d/target", target).empty()) continue;
-    for (int lun = 1; lun <= platform::kLuns; ++lun) {
+    for (int lun = 1; lun <= platform::kLuns; lun++) {
       if (tree.value("/iscsi/initiator/id:%d/lun/id:%d/lun", target, lun).empty()) continue;
       read_volume(tree, target, lun, volumes);
     }

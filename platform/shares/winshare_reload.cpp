@@ -14,10 +14,10 @@
 #include <string>
 #include <string_view>
 
-#include "process.h"
-#include "reload.h"
-#include "server_config.h"
-#include "share_name.h"
+#include "shares/process.h"
+#include "shares/reload.h"
+#include "shares/server_config.h"
+#include "shares/share_name.h"
 
 using namespace shares;
 
@@ -65,8 +65,9 @@ bool samba_runs() {
 
 void tell_samba(const Reload& done) {
   if (!samba_runs()) log_line(LOG_NOTICE, "Samba does not run; it finds the shares when it starts");
-  if (run({"smbcontrol", "all", "reload-config"}) != 0)
+  if (run({"smbcontrol", "all", "reload-config"}) != 0) {
     log_line(LOG_WARNING, "smbcontrol failed; Samba may not know the shares");
+  }
   for (const std::vector<Section>* shares : {&done.gone, &done.barred}) {
     for (const Section& share : *shares) run({"smbcontrol", "smbd", "close-share", share.name});
   }

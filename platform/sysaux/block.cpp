@@ -1,17 +1,17 @@
-#include "block.h"
+#include "sysaux/block.h"
 
-#include <errno.h>
 #include <fcntl.h>
-#include <limits.h>
-#include <stdio.h>
-#include <stdlib.h>
-#include <string.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
 #include <sys/uio.h>
 #include <unistd.h>
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
 
-#include "fd.h"
+#include "sysaux/fd.h"
 
 namespace sysaux {
 

@@ -3,10 +3,10 @@
 //
 // Source: https://docs.kernel.org/admin-guide/sysfs-rules.html; sizes and starts are in units of 512 bytes
 // whatever the sector size of the disk is.
-#ifndef SYSAUX_BLOCK_H
-#define SYSAUX_BLOCK_H
+#ifndef PLATFORM_SYSAUX_BLOCK_H
+#define PLATFORM_SYSAUX_BLOCK_H
 
-#include <stddef.h>
+#include <cstddef>
 
 namespace sysaux {
 

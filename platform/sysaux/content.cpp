@@ -1,37 +1,37 @@
-#include "content.h"
+#include "sysaux/content.h"
 
 #include <blkid/blkid.h>
-#include <stdio.h>
-#include <string.h>
+#include <cstdio>
+#include <cstring>
 
-#include "block.h"
-#include "copies.h"
+#include "sysaux/block.h"
+#include "sysaux/copies.h"
 
 namespace sysaux {
 
 namespace {
 
-enum class Answer { found, nothing, ambivalent, failed };
+enum class Answer { kFound, kNothing, kAmbivalent, kFailed };
 
 // The answers of blkid_do_safeprobe. Its manual has -1 for an error; the library passes on any negative
 // errno.
 Answer answer_of(int result) {
   switch (result) {
     case 0:
-      return Answer::found;
+      return Answer::kFound;
     case 1:
-      return Answer::nothing;
+      return Answer::kNothing;
     case -2:
-      return Answer::ambivalent;
+      return Answer::kAmbivalent;
     default:
-      return Answer::failed;
+      return Answer::kFailed;
   }
 }
 
 int collect(blkid_partlist table, Extent* extents, int max) {
   const int all = table != nullptr ? blkid_partlist_numof_partitions(table) : 0;
   int count = 0;
-  for (int i = 0; i < all && count < max; ++i) {
+  for (int i = 0; i < all && count < max; i++) {
     blkid_partition partition = blkid_partlist_get_partition(table, i);
     long long size = blkid_partition_get_size(partition);
     // The kernel shows no more of a container than its first two sectors, so that nobody formats it.
@@ -68,10 +68,10 @@ class Probe {
   }
 
   Answer run(int superblock_flags) {
-    if (!ready_) return Answer::failed;
+    if (!ready_) return Answer::kFailed;
     blkid_probe_set_superblocks_flags(probe_, BLKID_SUBLKS_TYPE | superblock_flags);
     const Answer answer = answer_of(blkid_do_safeprobe(probe_));
-    return answer == Answer::failed && has_several() ? Answer::ambivalent : answer;
+    return answer == Answer::kFailed && has_several() ? Answer::kAmbivalent : answer;
   }
 
   const char* value(const char* tag) const {
@@ -103,7 +103,7 @@ class Probe {
     int count = 0, result = 0;
     blkid_reset_probe(probe_);
     while ((result = blkid_do_probe(probe_)) == 0) {
-      if (value("TYPE") != nullptr) ++count;
+      if (value("TYPE") != nullptr) count++;
     }
     return result == 1 && count > 1;
   }
@@ -127,10 +127,10 @@ bool is_unknown_boot_sector(Probe& probe) {
 
 Content recognise_copy(int device, char name[16]) {
   const char* found = nullptr;
-  if (!find_copy(device, &found)) return Content::unreadable;
-  if (found == nullptr) return Content::nothing;
+  if (!find_copy(device, &found)) return Content::kUnreadable;
+  if (found == nullptr) return Content::kNothing;
   snprintf(name, 16, "%.15s", found);
-  return Content::signature;
+  return Content::kSignature;
 }
 
 }  // namespace
@@ -142,27 +142,27 @@ Content recognise(int device, char name[16]) {
   // a format with something else: so they are read where nothing else is found.
   probe.leave_out_zfs(true);
   Answer answer = probe.run(0);
-  if (answer == Answer::found && probe.value("TYPE") != nullptr) {
+  if (answer == Answer::kFound && probe.value("TYPE") != nullptr) {
     snprintf(name, 16, "%.15s", probe.value("TYPE"));
-    return Content::signature;
+    return Content::kSignature;
   }
   probe.leave_out_zfs(false);
   answer = probe.run(0);
-  if (answer != Answer::ambivalent && answer != Answer::failed && probe.value("TYPE") == nullptr) {
+  if (answer != Answer::kAmbivalent && answer != Answer::kFailed && probe.value("TYPE") == nullptr) {
     answer = probe.run(BLKID_SUBLKS_BADCSUM);
   }
-  if (answer == Answer::nothing) return recognise_copy(device, name);
-  if (answer != Answer::found && answer != Answer::ambivalent) return Content::unreadable;
-  const char* type = answer == Answer::found ? probe.value("TYPE") : "ambivalent";
+  if (answer == Answer::kNothing) return recognise_copy(device, name);
+  if (answer != Answer::kFound && answer != Answer::kAmbivalent) return Content::kUnreadable;
+  const char* type = answer == Answer::kFound ? probe.value("TYPE") : "ambivalent";
   const char* found = type != nullptr ? type : probe.value("PTTYPE");
   snprintf(name, 16, "%.15s", found != nullptr ? found : "unknown");
-  if (type != nullptr || is_unknown_boot_sector(probe)) return Content::signature;
-  return table_has_partitions(probe) ? Content::partitions : Content::empty_table;
+  if (type != nullptr || is_unknown_boot_sector(probe)) return Content::kSignature;
+  return table_has_partitions(probe) ? Content::kPartitions : Content::kEmptyTable;
 }
 
 int read_table(int disk, Extent* extents, int max) {
   Probe probe(disk);
-  if (probe.run(0) == Answer::failed || probe.has_lost_gpt()) return -1;
+  if (probe.run(0) == Answer::kFailed || probe.has_lost_gpt()) return -1;
   return probe.partitions(extents, max);
 }
 

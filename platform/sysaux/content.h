@@ -1,18 +1,18 @@
 // What a block device carries, recognised by libblkid's low-level probing. The library's cache, which may be
 // old, is never asked.
-#ifndef SYSAUX_CONTENT_H
-#define SYSAUX_CONTENT_H
+#ifndef PLATFORM_SYSAUX_CONTENT_H
+#define PLATFORM_SYSAUX_CONTENT_H
 
-#include "partitions.h"
+#include "sysaux/partitions.h"
 
 namespace sysaux {
 
 enum class Content {
-  nothing,      // no signature that libblkid knows
-  signature,    // a file system, LVM, RAID, encryption, swap ... or several that contradict each other
-  empty_table,  // a partition table without partitions, and nothing else
-  partitions,   // a partition table with partitions
-  unreadable,   // a read failed, so nothing is known
+  kNothing,     // no signature that libblkid knows
+  kSignature,   // a file system, LVM, RAID, encryption, swap ... or several that contradict each other
+  kEmptyTable,  // a partition table without partitions, and nothing else
+  kPartitions,  // a partition table with partitions
+  kUnreadable,  // a read failed, so nothing is known
 };
 
 // Recognises what the open device carries. A signature whose checksum is wrong counts: it marks data that

@@ -1,7 +1,7 @@
-#include "copies.h"
+#include "sysaux/copies.h"
 
-#include <stdint.h>
 #include <unistd.h>
+#include <cstdint>
 
 #include <string_view>
 
@@ -28,19 +28,19 @@ constexpr Mark kMarks[] = {
     {"damaged_ntfs", -512, "\xebR\x90NTFS "},       {"damaged_ntfs", -4096, "\xebR\x90NTFS "},
 };
 
-enum class Found { yes, no, failed };
+enum class Found { kYes, kNo, kFailed };
 
 // Reads from one place; what lies beyond an end of the device is not there.
 Found read_at(int device, long long end, long long at, void* data, size_t size) {
-  if (at < 0 || at + static_cast<long long>(size) > end) return Found::no;
-  return pread(device, data, size, at) == static_cast<ssize_t>(size) ? Found::yes : Found::failed;
+  if (at < 0 || at + static_cast<long long>(size) > end) return Found::kNo;
+  return pread(device, data, size, at) == static_cast<ssize_t>(size) ? Found::kYes : Found::kFailed;
 }
 
 Found has_mark(int device, long long end, const Mark& mark) {
   char bytes[16];
   const Found found = read_at(device, end, mark.at < 0 ? end + mark.at : mark.at, bytes, mark.bytes.size());
-  if (found != Found::yes) return found;
-  return mark.bytes == std::string_view(bytes, mark.bytes.size()) ? Found::yes : Found::no;
+  if (found != Found::kYes) return found;
+  return mark.bytes == std::string_view(bytes, mark.bytes.size()) ? Found::kYes : Found::kNo;
 }
 
 uint16_t little16(const unsigned char* bytes) {
@@ -56,10 +56,10 @@ Found has_ext_copy(int device, long long end, int shift) {
   const long long at = (8 * block + (shift == 0 ? 1 : 0)) * block;
   unsigned char super[92];
   const Found found = read_at(device, end, at, super, sizeof super);
-  if (found != Found::yes) return found;
+  if (found != Found::kYes) return found;
   const bool fits = little16(super + kMagicAt) == kMagic && little16(super + kGroupAt) == 1 &&
                     little16(super + kBlockSizeAt) == shift;
-  return fits ? Found::yes : Found::no;
+  return fits ? Found::kYes : Found::kNo;
 }
 
 // mkfs.xfs divides a device below 4 TiB into four allocation groups, each with a superblock at its start; in
@@ -81,14 +81,14 @@ Found has_uberblock(int device, long long end, int label) {
   constexpr std::string_view kLittle{"\x0c\xb1\xba\0\0\0\0\0", 8}, kBig{"\0\0\0\0\0\xba\xb1\x0c", 8};
   const long long first = label < 2 ? 0 : end - end % kLabel - 4 * kLabel;
   char ring[kRing];
-  if (end < kSmallest) return Found::no;
+  if (end < kSmallest) return Found::kNo;
   const Found found = read_at(device, end, first + label * kLabel + kRingAt, ring, sizeof ring);
-  if (found != Found::yes) return found;
+  if (found != Found::kYes) return found;
   for (size_t at = 0; at < sizeof ring; at += kStep) {
     const std::string_view magic(ring + at, kLittle.size());
-    if (magic == kLittle || magic == kBig) return Found::yes;
+    if (magic == kLittle || magic == kBig) return Found::kYes;
   }
-  return Found::no;
+  return Found::kNo;
 }
 
 }  // namespace
@@ -98,13 +98,13 @@ bool find_copy(int device, const char** name) {
   bool readable = end >= 0;
   *name = nullptr;
   const auto note = [&](Found found, const char* kind) {
-    if (found == Found::failed) readable = false;
-    if (found == Found::yes && *name == nullptr) *name = kind;
+    if (found == Found::kFailed) readable = false;
+    if (found == Found::kYes && *name == nullptr) *name = kind;
   };
   for (const Mark& mark : kMarks) note(has_mark(device, end, mark), mark.name);
-  for (int shift = 0; shift <= 2; ++shift) note(has_ext_copy(device, end, shift), "damaged_ext");
+  for (int shift = 0; shift <= 2; shift++) note(has_ext_copy(device, end, shift), "damaged_ext");
   note(has_xfs_copy(device, end), "damaged_xfs");
-  for (int label = 0; label < 4; ++label) note(has_uberblock(device, end, label), "damaged_zfs");
+  for (int label = 0; label < 4; label++) note(has_uberblock(device, end, label), "damaged_zfs");
   return readable || *name != nullptr;
 }
 

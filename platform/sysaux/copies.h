@@ -1,8 +1,8 @@
 // Copies that file systems keep of their first sectors, and of their root. libblkid looks for few of them, so
 // a file system whose first sectors are lost would pass for an empty device although all of its files can be
 // had back.
-#ifndef SYSAUX_COPIES_H
-#define SYSAUX_COPIES_H
+#ifndef PLATFORM_SYSAUX_COPIES_H
+#define PLATFORM_SYSAUX_COPIES_H
 
 namespace sysaux {
 

@@ -1,14 +1,14 @@
 // Sizes of disks and partitions, and whether a node can be used at all.
 #include <fcntl.h>
-#include <limits.h>
-#include <stdarg.h>
-#include <stdio.h>
-#include <string.h>
 #include <sys/stat.h>
+#include <climits>
+#include <cstdarg>
+#include <cstdio>
+#include <cstring>
 
-#include "block.h"
-#include "fd.h"
 #include "sysaux.h"
+#include "sysaux/block.h"
+#include "sysaux/fd.h"
 
 using sysaux::Fd;
 

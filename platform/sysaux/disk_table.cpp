@@ -3,17 +3,17 @@
 // (https://systemd.io/BLOCK_DEVICE_LOCKING).
 #include <fcntl.h>
 #include <libfdisk/libfdisk.h>
-#include <string.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <time.h>
 #include <unistd.h>
+#include <cstring>
+#include <ctime>
 
-#include "block.h"
-#include "content.h"
-#include "fd.h"
-#include "modules.h"
-#include "partitions.h"
+#include "sysaux/block.h"
+#include "sysaux/content.h"
+#include "sysaux/fd.h"
+#include "sysaux/modules.h"
+#include "sysaux/partitions.h"
 
 using namespace sysaux;
 
@@ -32,7 +32,7 @@ struct LockedDisk {
 
 bool lock(int device) {
   constexpr int kTries = 600;  // 30 seconds
-  for (int i = 0; i < kTries; ++i) {
+  for (int i = 0; i < kTries; i++) {
     if (flock(device, LOCK_EX | LOCK_NB) == 0) return true;
     nanosleep(&kPause, nullptr);
   }
@@ -122,7 +122,7 @@ bool is_blank(const LockedDisk& disk) {
   if (!read_partitions(disk.block_dir.get(), &known) || known.count > 0) return false;
   if (!first_mebibyte_readable(disk.device.get())) return false;
   const Content content = recognise(disk.device.get(), name);
-  return content == Content::nothing || content == Content::empty_table;
+  return content == Content::kNothing || content == Content::kEmptyTable;
 }
 
 // Adds the one partition from the first to the last aligned sector and tells where it is.

@@ -1,6 +1,6 @@
 // A file descriptor that closes itself.
-#ifndef SYSAUX_FD_H
-#define SYSAUX_FD_H
+#ifndef PLATFORM_SYSAUX_FD_H
+#define PLATFORM_SYSAUX_FD_H
 
 #include <unistd.h>
 

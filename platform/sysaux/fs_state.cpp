@@ -1,10 +1,10 @@
 // The state that an ext2, ext3 or ext4 file system records about itself.
-#include <errno.h>
 #include <ext2fs/ext2fs.h>
 #include <fcntl.h>
 #include <unistd.h>
+#include <cerrno>
 
-#include "modules.h"
+#include "sysaux/modules.h"
 
 // How libext2fs reads the device. Its own way, unix_io_manager, begins with an fsync of the device; that
 // makes the disk write out its cache, to no end where only a superblock is read. A thread has one device open

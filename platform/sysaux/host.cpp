@@ -1,13 +1,13 @@
 // The appliance's own name and hardware addresses.
 #include <net/if.h>
 #include <net/if_arp.h>
-#include <string.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <unistd.h>
+#include <cstring>
 
-#include "fd.h"
 #include "sysaux.h"
+#include "sysaux/fd.h"
 
 extern "C" {
 

@@ -1,10 +1,10 @@
-#include "modules.h"
+#include "sysaux/modules.h"
 
 #include <dlfcn.h>
-#include <limits.h>
-#include <stdio.h>
-#include <string.h>
 #include <sys/stat.h>
+#include <climits>
+#include <cstdio>
+#include <cstring>
 
 #include "sysaux.h"
 

@@ -2,8 +2,8 @@
 // libext2fs) is loaded when such a call is first made, so that a program which makes none does not pay for it
 // at its start. The modules lie beside libsysaux.so and export only these functions; the contracts are those
 // of the public calls of the same name in sysaux.h.
-#ifndef SYSAUX_MODULES_H
-#define SYSAUX_MODULES_H
+#ifndef PLATFORM_SYSAUX_MODULES_H
+#define PLATFORM_SYSAUX_MODULES_H
 
 #define SYSAUX_EXPORT __attribute__((visibility("default")))
 

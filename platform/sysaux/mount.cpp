@@ -3,30 +3,30 @@
 // The kernel tells by statx(2), since Linux 5.8, whether a path is the root of a mount: one call, no table
 // read, and no I/O to the volume. Older kernels and paths that cannot be looked up (a mount that lost its
 // server) are answered from /proc/self/mounts by the C library, which decodes the octal escapes there.
-#include <errno.h>
 #include <fcntl.h>
-#include <limits.h>
 #include <mntent.h>
-#include <stdio.h>
-#include <stdlib.h>
-#include <string.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
 
-#include "fd.h"
 #include "sysaux.h"
+#include "sysaux/fd.h"
 
 namespace {
 
-enum class Answer { no, yes, unknown };
+enum class Answer { kNo, kYes, kUnknown };
 
 Answer ask_kernel(int directory, const char* path, int flags) {
   struct statx info;
   if (statx(directory, path, flags | AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC, 0, &info) != 0) {
-    return errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG ? Answer::no : Answer::unknown;
+    return errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG ? Answer::kNo : Answer::kUnknown;
   }
-  if ((info.stx_attributes_mask & STATX_ATTR_MOUNT_ROOT) == 0) return Answer::unknown;
-  return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0 ? Answer::yes : Answer::no;
+  if ((info.stx_attributes_mask & STATX_ATTR_MOUNT_ROOT) == 0) return Answer::kUnknown;
+  return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0 ? Answer::kYes : Answer::kNo;
 }
 
 bool listed_once(const char* path) {
@@ -35,8 +35,9 @@ bool listed_once(const char* path) {
   mntent entry;
   char line[2 * PATH_MAX];
   bool found = false;
-  while (!found && getmntent_r(table, &entry, line, sizeof line) != nullptr)
+  while (!found && getmntent_r(table, &entry, line, sizeof line) != nullptr) {
     found = strcmp(entry.mnt_dir, path) == 0;
+  }
   endmntent(table);
   return found;
 }
@@ -51,7 +52,7 @@ bool listed(const char* path) {
 
 bool is_mount_root(int directory, const char* path, int flags, const char* name) {
   const Answer answer = ask_kernel(directory, path, flags);
-  return answer == Answer::unknown ? listed(name) : answer == Answer::yes;
+  return answer == Answer::kUnknown ? listed(name) : answer == Answer::kYes;
 }
 
 }  // namespace

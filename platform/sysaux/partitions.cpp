@@ -1,18 +1,18 @@
-#include "partitions.h"
+#include "sysaux/partitions.h"
 
 #include <dirent.h>
 #include <fcntl.h>
 #include <linux/blkpg.h>
-#include <stdio.h>
-#include <stdlib.h>
-#include <string.h>
 #include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
-#include <time.h>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
 
-#include "block.h"
-#include "fd.h"
+#include "sysaux/block.h"
+#include "sysaux/fd.h"
 
 namespace sysaux {
 
@@ -22,8 +22,10 @@ static bool read_partition(int block_dir, const char* name, Partition* partition
   if (strlen(name) >= sizeof partition->name) return false;
   const Fd dir(openat(block_dir, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!dir.ok() || !read_number_at(dir.get(), "partition", &number)) return false;
-  if (!read_number_at(dir.get(), "start", &extent.start) || !read_number_at(dir.get(), "size", &extent.size))
+  if (!read_number_at(dir.get(), "start", &extent.start) ||
+      !read_number_at(dir.get(), "size", &extent.size)) {
     return false;
+  }
   extent.number = static_cast<int>(number);
   strcpy(partition->name, name);
   return true;
@@ -43,7 +45,7 @@ bool read_partitions(int block_dir, PartitionList* list) {
   own.release();
   while (const dirent* entry = readdir(entries)) {
     if (entry->d_type != DT_DIR || entry->d_name[0] == '.' || list->count == kMaxPartitions) continue;
-    if (read_partition(block_dir, entry->d_name, &list->at[list->count])) ++list->count;
+    if (read_partition(block_dir, entry->d_name, &list->at[list->count])) list->count++;
   }
   closedir(entries);
   qsort(list->at, static_cast<size_t>(list->count), sizeof list->at[0], by_number);
@@ -51,7 +53,7 @@ bool read_partitions(int block_dir, PartitionList* list) {
 }
 
 static const Partition* find_partition(const PartitionList& list, int number) {
-  for (int i = 0; i < list.count; ++i) {
+  for (int i = 0; i < list.count; i++) {
     if (list.at[i].extent.number == number) return &list.at[i];
   }
   return nullptr;
@@ -106,7 +108,7 @@ bool wait_for_node(int block_dir, const char* disk, const char* partition) {
   constexpr timespec kPause{0, 10'000'000};
   char dev_file[64];
   snprintf(dev_file, sizeof dev_file, "%s/dev", partition);
-  for (int i = 0; i < kTries; ++i) {
+  for (int i = 0; i < kTries; i++) {
     if (node_is_there(block_dir, dev_file, partition)) return true;
     if (!node_is_there(block_dir, "dev", disk)) return false;
     nanosleep(&kPause, nullptr);

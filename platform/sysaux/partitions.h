@@ -2,11 +2,11 @@
 //
 // Kernels exist that read no partition tables by themselves, and BLKRRPART succeeds there without effect; so
 // partitions are announced one by one (BLKPG, as partx(8) does), and what came of it is read back from sysfs.
-#ifndef SYSAUX_PARTITIONS_H
-#define SYSAUX_PARTITIONS_H
+#ifndef PLATFORM_SYSAUX_PARTITIONS_H
+#define PLATFORM_SYSAUX_PARTITIONS_H
 
-#include <stddef.h>
 #include <sys/types.h>
+#include <cstddef>
 
 namespace sysaux {
 

@@ -1,16 +1,16 @@
 // The module that recognises: file systems and partitions.
-#include <errno.h>
 #include <fcntl.h>
-#include <limits.h>
-#include <stdio.h>
-#include <string.h>
 #include <unistd.h>
+#include <cerrno>
+#include <climits>
+#include <cstdio>
+#include <cstring>
 
-#include "block.h"
-#include "content.h"
-#include "fd.h"
-#include "modules.h"
-#include "partitions.h"
+#include "sysaux/block.h"
+#include "sysaux/content.h"
+#include "sysaux/fd.h"
+#include "sysaux/modules.h"
+#include "sysaux/partitions.h"
 
 using namespace sysaux;
 
@@ -53,11 +53,12 @@ int list_unread_table(const char* device, int block_dir, NameList* names) {
   if (!disk.ok() && errno == ENOENT) return 0;  // without a node the kernel alone is asked
   if (!disk.ok() || !kernel_name(device, disk_name, sizeof disk_name)) return -1;
   const int count = read_table(disk.get(), extents, kMaxPartitions);
-  for (int i = 0; i < count; ++i) {
+  for (int i = 0; i < count; i++) {
     partition_name(disk_name, extents[i].number, name, sizeof name);
     names->add(name);
-    if (announce_partition(disk.get(), block_dir, extents[i], &shown))
+    if (announce_partition(disk.get(), block_dir, extents[i], &shown)) {
       wait_for_node(block_dir, disk_name, shown.name);
+    }
   }
   return count;
 }
@@ -86,9 +87,9 @@ int sysaux_probe_fs_type(char* out, const char* node) {
   if (!device.ok()) return -1;
   read_ahead(device.get());
   const Content content = recognise(device.get(), out);
-  if (content != Content::nothing && content != Content::unreadable) return 0;
+  if (content != Content::kNothing && content != Content::kUnreadable) return 0;
   if (!first_mebibyte_readable(device.get())) return -1;  // sys_check_dev does not accept it either
-  if (content == Content::nothing) return 1;
+  if (content == Content::kNothing) return 1;
   // A read failed further on: the node must not look empty, because an empty one is formatted.
   strcpy(out, "unreadable");
   return 0;
@@ -100,6 +101,6 @@ int sysaux_probe_partition_list(char* out, const char* device) {
   const Fd block_dir(open_block_dir(device));
   if (!block_dir.ok() || !read_partitions(block_dir.get(), &known)) return -1;
   if (known.count == 0) return list_unread_table(device, block_dir.get(), &names);
-  for (int i = 0; i < known.count; ++i) names.add(known.at[i].name);
+  for (int i = 0; i < known.count; i++) names.add(known.at[i].name);
   return known.count;
 }

@@ -1,8 +1,8 @@
 // Text helpers and the shell runner.
-#include <stdarg.h>
-#include <stdio.h>
-#include <stdlib.h>
-#include <string.h>
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
 
 #include "sysaux.h"
 
@@ -27,7 +27,7 @@ int str_insert_back_slash(char* out, size_t size, const char* text) {
   out[0] = '\0';
   if (text == nullptr) return -1;
   size_t used = 0;
-  for (const char* from = text; *from != '\0'; ++from) {
+  for (const char* from = text; *from != '\0'; from++) {
     const bool special = strchr("\"\\$`", *from) != nullptr;
     if (used + (special ? 2 : 1) >= size) {
       out[0] = '\0';

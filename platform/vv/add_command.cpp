@@ -1,8 +1,8 @@
-#include "job.h"
-#include "search_commands.h"
-#include "share_name.h"
-#include "utf8.h"
-#include "volume_commands.h"
+#include "common/utf8.h"
+#include "shares/share_name.h"
+#include "vv/job.h"
+#include "vv/search_commands.h"
+#include "vv/volume_commands.h"
 
 namespace vv {
 namespace {
@@ -19,8 +19,9 @@ std::string fault_of_name(const Look& look, const std::string& share) {
   const char* refusal = shares::name_refusal(share, shares::kSambaNames);
   if (refusal != nullptr) return platform::printable(share) + " cannot be the name of a share: " + refusal;
   for (const Row& row : look.rows()) {
-    if (row.volume == nullptr || shares::folded_name(row.volume->share) != shares::folded_name(share))
+    if (row.volume == nullptr || shares::folded_name(row.volume->share) != shares::folded_name(share)) {
       continue;
+    }
     return "there is a share " + platform::printable(row.volume->share) + " already: LUN " +
            std::to_string(row.volume->lun) + " of " + platform::printable(row.target->name);
   }
@@ -43,8 +44,9 @@ bool choose_target(Job& job, const Portal& portal, std::string& target) {
   }
   std::string message = "the portal " + portal.text();
   message += names.empty() ? " offers no target to this machine" : " offers several targets, name one";
-  for (const std::string& name : names)
+  for (const std::string& name : names) {
     message += "\n  --target " + platform::printable(vvstat::quoted(name));
+  }
   return job.refuse(kUsage, message);
 }
 
@@ -54,8 +56,9 @@ bool find_place(Job& job, Portal& portal, std::string& target) {
   const Target* stored = options.target.empty() ? nullptr : job.before.target(options.target);
   target = options.target;
   if (options.portal.empty()) {
-    if (stored == nullptr)
+    if (stored == nullptr) {
       return job.refuse(kUsage, "add needs --portal, for a target that is not configured yet");
+    }
     portal = stored_portal(stored->address, stored->port);
     return true;
   }
@@ -66,14 +69,17 @@ bool find_place(Job& job, Portal& portal, std::string& target) {
 
 // A stored target is changed by its own commands alone: the tool would overwrite its settings.
 bool fits_what_is_stored(Job& job, const Portal& portal, const std::string& target) {
-  if (const Row* row = job.before.lun(target, job.options.lun))
+  if (const Row* row = job.before.lun(target, job.options.lun)) {
     return job.refuse(kUsage, "LUN " + std::to_string(job.options.lun) + " of this target is the share " +
                                   platform::printable(row->volume->share) + " already");
-  if (volumes_in(job.before) >= kMostVolumes)
+  }
+  if (volumes_in(job.before) >= kMostVolumes) {
     return job.refuse(kUsage, "8 volumes are configured, which is the most");
+  }
   const Target* stored = job.before.target(target);
-  if (stored == nullptr && job.before.targets().size() >= platform::kTargets)
+  if (stored == nullptr && job.before.targets().size() >= platform::kTargets) {
     return job.refuse(kUsage, "8 targets are configured, which is the most");
+  }
   if (stored == nullptr) return true;
   const Portal there = stored_portal(stored->address, stored->port);
   if (there.text() == portal.text()) return true;

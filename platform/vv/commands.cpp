@@ -1,8 +1,8 @@
-#include "commands.h"
+#include "vv/commands.h"
 
-#include "search_commands.h"
-#include "target_commands.h"
-#include "volume_commands.h"
+#include "vv/search_commands.h"
+#include "vv/target_commands.h"
+#include "vv/volume_commands.h"
 
 namespace vv {
 namespace {

@@ -4,7 +4,7 @@
 
 #include <span>
 
-#include "options.h"
+#include "vv/options.h"
 
 namespace vv {
 

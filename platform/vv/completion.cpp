@@ -1,13 +1,13 @@
-#include "completion.h"
+#include "vv/completion.h"
 
 #include <algorithm>
 #include <string_view>
 
-#include "commands.h"
-#include "options.h"
-#include "searches.h"
-#include "utf8.h"
-#include "volumes.h"
+#include "common/utf8.h"
+#include "vv/commands.h"
+#include "vv/options.h"
+#include "vv/searches.h"
+#include "vv/volumes.h"
 
 namespace vv {
 namespace {
@@ -36,8 +36,9 @@ void add_found_targets(Words& offered) {
 
 void add_portals(Words& offered) {
   const Look look;
-  for (const vvstat::Target& target : look.targets())
+  for (const vvstat::Target& target : look.targets()) {
     offered.push_back(stored_portal(target.address, target.port).text());
+  }
 }
 
 // The free ones that the last search has found.
@@ -66,7 +67,7 @@ Words first_words() {
 
 // Whether the command's own argument stands before the last word already.
 bool has_argument(const Words& words) {
-  for (size_t at = 1; at + 1 < words.size(); ++at) {
+  for (size_t at = 1; at + 1 < words.size(); at++) {
     if (!words[at].starts_with('-') && (at == 1 || !takes_value(words[at - 1]))) return true;
   }
   return false;

@@ -1,8 +1,8 @@
-#include "explanation.h"
+#include "vv/explanation.h"
 
 #include <algorithm>
 
-#include "utf8.h"
+#include "common/utf8.h"
 
 namespace vv {
 namespace {
@@ -113,10 +113,11 @@ Failure explain_output(std::string_view output, const char* step) {
     if (line == nullptr) continue;
     failure.why = reason.why;
     failure.advice = reason.advice;
-    if (reason.step == nullptr)
+    if (reason.step == nullptr) {
       failure.details = {*line};
-    else
+    } else {
       failure.step = reason.step;
+    }
     break;
   }
   std::vector<std::string>& lines = failure.details;
@@ -132,8 +133,9 @@ Failure explain_volume(const Row& row, std::string_view output) {
   if (!failure.why.empty()) return failure;
   failure.why = row.volume->enabled ? "its target was logged in to, but showed no disk of it"
                                     : "it is switched off in the settings";
-  if (row.volume->enabled)
+  if (row.volume->enabled) {
     failure.advice = "see whether the storage server still offers its LUN, and to this initiator";
+  }
   return failure;
 }
 

@@ -1,11 +1,11 @@
 #include <algorithm>
 #include <string_view>
 
-#include "columns.h"
-#include "job.h"
+#include "common/utf8.h"
 #include "sysaux.h"
-#include "utf8.h"
-#include "volume_commands.h"
+#include "vv/job.h"
+#include "vv/volume_commands.h"
+#include "vvstat/columns.h"
 
 namespace vv {
 namespace {
@@ -47,9 +47,10 @@ bool find_disk(Job& job, std::string& disk) {
   const Row& row = *job.row;
   const std::string connect = platform::printable(vv_command("connect", row.volume->share));
   disk = disk_of(row.target->name, row.volume->lun);
-  if (disk.empty())
+  if (disk.empty()) {
     return job.refuse(kFailed, platform::printable(row.volume->share) + " has no disk",
                       {kDiskStep, "its target is not connected, or shows no disk of it", connect, {}});
+  }
   if (disk == row.volume->device) return true;
   return job.refuse(kFailed, platform::printable(row.volume->share) + " has another disk by now",
                     {kDiskStep, "it was " + row.volume->device + " and is " + disk, connect, {}});
@@ -59,9 +60,10 @@ bool find_disk(Job& job, std::string& disk) {
 bool may_overwrite(Job& job, const std::string& disk, Content& content) {
   const std::string share = platform::printable(job.row->volume->share);
   content = content_of(disk);
-  if (!content.readable)
+  if (!content.readable) {
     return job.refuse(kFailed, "the disk of " + share + " cannot be read",
                       {kDiskStep, "what is on it is not known", "look at the kernel's log: dmesg", {}});
+  }
   if (content.what.empty() || job.options.destroy_data) return true;
   return job.refuse(kRefused,
                     share + " carries data: " + content.what +
@@ -79,8 +81,9 @@ int format(const Options& options) {
   const std::string share = platform::printable(options.name);
   const std::string loss =
       content.what.empty() ? "Nothing is recognised on it." : "This destroys " + content.what + ".";
-  if (!job.confirm("The LUN of " + share + ", " + disk + ", is formatted. " + loss + " Go on?"))
+  if (!job.confirm("The LUN of " + share + ", " + disk + ", is formatted. " + loss + " Go on?")) {
     return job.end();
+  }
   const vvstat::Volume& volume = *job.row->volume;
   const ToolRun run = job.run(lun_arguments("--format", job.target->name, volume.lun), job.target->name);
   return job.tell_brought_up(job.target->name, options.name, run);

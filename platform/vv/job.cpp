@@ -1,14 +1,14 @@
-#include "job.h"
+#include "vv/job.h"
 
 #include <unistd.h>
 
 #include <cstring>
 
-#include "list.h"
-#include "progress.h"
-#include "secret.h"
-#include "terminal.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vv/list.h"
+#include "vv/progress.h"
+#include "vv/secret.h"
+#include "vv/terminal.h"
 
 namespace vv {
 namespace {
@@ -124,9 +124,10 @@ int Job::failed(const std::string& message, const Failure& failure) {
   refuse(kFailed, message, failure);
   std::string& advice = outcome_.failure.advice;
   const size_t name = advice.find(kShareToName);
-  if (name != std::string::npos && !options.name.empty())
+  if (name != std::string::npos && !options.name.empty()) {
     advice.replace(name, std::string_view(kShareToName).size(),
                    platform::printable(vvstat::quoted(options.name)));
+  }
   return end();
 }
 
@@ -136,8 +137,9 @@ int Job::end() {
 
 int Job::tell_not_up(const Row& ailing, const ToolRun& run) {
   Failure failure = explain_volume(ailing, run.output);
-  for (const std::string& message : kernel_.messages_of(ailing.volume->device))
+  for (const std::string& message : kernel_.messages_of(ailing.volume->device)) {
     failure.details.push_back("kernel: " + message);
+  }
   outcome_.share = ailing.volume->share;
   return failed(platform::printable(ailing.volume->share) + " is not mounted as it should be", failure);
 }
@@ -145,8 +147,9 @@ int Job::tell_not_up(const Row& ailing, const ToolRun& run) {
 int Job::tell_brought_up(const std::string& target_name, const std::string& share, const ToolRun& run) {
   outcome_.share = share;
   const std::string name = platform::printable(share.empty() ? target_name : share);
-  if (!run.started || run.signal != 0)
+  if (!run.started || run.signal != 0) {
     return failed(name + " was not brought up", explain_run(run, kToolStep));
+  }
   const Look after;
   const Target* now = after.target(target_name);
   if (now == nullptr) return failed(name + " was deleted meanwhile", explain_run(run, kStoreStep));
@@ -156,8 +159,9 @@ int Job::tell_brought_up(const std::string& target_name, const std::string& shar
     if (!is_up(*each)) return tell_not_up(*each, run);
     append(message, up_message(*each), "\n");
   }
-  if (!run.succeeded() || !after.in_use(target_name))
+  if (!run.succeeded() || !after.in_use(target_name)) {
     return failed(name + " was not brought up", explain_run(run, kLoginStep));
+  }
   return done(message.empty() ? name + " is connected" : message);
 }
 

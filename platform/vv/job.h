@@ -4,11 +4,11 @@
 
 #include <string>
 
-#include "kernel_log.h"
-#include "options.h"
-#include "output.h"
-#include "tool.h"
-#include "volumes.h"
+#include "vv/kernel_log.h"
+#include "vv/options.h"
+#include "vv/output.h"
+#include "vv/tool.h"
+#include "vv/volumes.h"
 
 namespace vv {
 

@@ -1,4 +1,4 @@
-#include "kernel_log.h"
+#include "vv/kernel_log.h"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -6,7 +6,7 @@
 #include <cctype>
 #include <cerrno>
 
-#include "utf8.h"
+#include "common/utf8.h"
 
 namespace vv {
 namespace {
@@ -14,7 +14,7 @@ namespace {
 constexpr size_t kMost = 3;
 
 bool ends_name(std::string_view text, size_t at) {
-  while (at < text.size() && isdigit(static_cast<unsigned char>(text[at])) != 0) ++at;
+  while (at < text.size() && isdigit(static_cast<unsigned char>(text[at])) != 0) at++;
   return at == text.size() || isalnum(static_cast<unsigned char>(text[at])) == 0;
 }
 

@@ -1,4 +1,4 @@
-#include "options.h"
+#include "vv/options.h"
 
 #include <getopt.h>
 
@@ -9,10 +9,10 @@
 #include <iterator>
 #include <string_view>
 
-#include "commands.h"
-#include "completion.h"
-#include "output.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vv/commands.h"
+#include "vv/completion.h"
+#include "vv/output.h"
 
 namespace vv {
 namespace {
@@ -189,8 +189,9 @@ bool fits(const Options& options, unsigned given) {
   const char* wrong = nullptr;
   if (options.user.empty() && !options.password_file.empty()) wrong = "--password-file needs --user";
   if (options.no_password && !options.user.empty()) wrong = "either --user or --no-password";
-  if ((command.takes & kNoPassword) != 0 && !options.no_password && options.user.empty())
+  if ((command.takes & kNoPassword) != 0 && !options.no_password && options.user.empty()) {
     wrong = "password needs --user, or --no-password";
+  }
   if (wrong != nullptr) fprintf(stderr, "vv: %s\n", wrong);
   return wrong == nullptr;
 }

@@ -1,4 +1,4 @@
-#include "output.h"
+#include "vv/output.h"
 
 #include <libsmartcols.h>
 
@@ -8,9 +8,9 @@
 #include <cstring>
 #include <memory>
 
-#include "list.h"
-#include "options.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vv/list.h"
+#include "vv/options.h"
 
 namespace vv {
 namespace {
@@ -29,7 +29,7 @@ bool add_column(libscols_table* table, const Column& column) {
 bool add_row(libscols_table* table, const std::vector<std::string>& row) {
   libscols_line* line = scols_table_new_line(table, nullptr);
   if (line == nullptr) return false;
-  for (size_t at = 0; at < row.size(); ++at) {
+  for (size_t at = 0; at < row.size(); at++) {
     if (row[at].empty()) continue;
     if (scols_line_set_data(line, at, platform::printable(row[at]).c_str()) != 0) return false;
   }
@@ -55,10 +55,11 @@ std::string one_line(const std::string& message) {
   std::string line;
   for (const char byte : message) {
     if (line.ends_with("; ") && byte == ' ') continue;
-    if (byte == '\n')
+    if (byte == '\n') {
       line += "; ";
-    else
+    } else {
       line += byte;
+    }
   }
   return line;
 }
@@ -120,8 +121,9 @@ int tell(const Outcome& outcome, bool json) {
     put(as_json(outcome));
   } else if (outcome.status == kDone) {
     put(outcome.message + "\n");
-    for (const std::string& warning : outcome.failure.details)
+    for (const std::string& warning : outcome.failure.details) {
       fprintf(stderr, "  said: %s\n", warning.c_str());
+    }
   } else {
     tell_failure(outcome);
   }

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "explanation.h"
+#include "vv/explanation.h"
 
 namespace vv {
 

@@ -1,4 +1,4 @@
-#include "portal.h"
+#include "vv/portal.h"
 
 #include <arpa/inet.h>
 #include <netdb.h>

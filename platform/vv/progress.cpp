@@ -1,4 +1,4 @@
-#include "progress.h"
+#include "vv/progress.h"
 
 #include <sys/ioctl.h>
 #include <unistd.h>
@@ -7,7 +7,7 @@
 #include <cstdio>
 #include <string_view>
 
-#include "utf8.h"
+#include "common/utf8.h"
 
 namespace vv {
 namespace {
@@ -29,8 +29,9 @@ const Volume* same_lun(const Target& target, int lun) {
 void add_target_steps(const Target& before, const Target& now, std::vector<std::string>& steps) {
   if (before.connect_state == now.connect_state) return;
   const std::string name = platform::printable(now.name);
-  if (now.connect_state == vvstat::kConnecting)
+  if (now.connect_state == vvstat::kConnecting) {
     steps.push_back("logging in to " + name + " at " + now.address + ":" + std::to_string(now.port));
+  }
   if (now.connect_state == vvstat::kConnected) steps.push_back("logged in to " + name);
 }
 

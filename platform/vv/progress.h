@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "status.h"
+#include "vvstat/status.h"
 
 namespace vv {
 

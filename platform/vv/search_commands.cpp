@@ -1,4 +1,4 @@
-#include "search_commands.h"
+#include "vv/search_commands.h"
 
 #include <unistd.h>
 
@@ -6,11 +6,11 @@
 #include <cstdio>
 #include <cstring>
 
-#include "columns.h"
-#include "job.h"
-#include "list.h"
-#include "searches.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vv/job.h"
+#include "vv/list.h"
+#include "vv/searches.h"
+#include "vvstat/columns.h"
 
 namespace vv {
 namespace {
@@ -47,8 +47,9 @@ bool general_tree_answers(Job& job, const SearchTurn& turn) {
 // Fills the portal that the options name, or that is stored of the target.
 bool find_portal(Job& job, const std::string& target_name, Portal& portal) {
   std::string why;
-  if (!job.options.portal.empty())
+  if (!job.options.portal.empty()) {
     return read_portal(job.options.portal, portal, why) || job.refuse(kUsage, platform::printable(why));
+  }
   const vvstat::Target* target = job.before.target(target_name);
   if (target == nullptr) return job.refuse(kUsage, "this target is not configured here; it needs --portal");
   portal = stored_portal(target->address, target->port);
@@ -57,8 +58,9 @@ bool find_portal(Job& job, const std::string& target_name, Portal& portal) {
 
 int tell_luns_failed(Job& job, const FoundLuns& found, const ToolRun& run) {
   Failure failure = explain_run(run, found.login_failed ? kLoginStep : kLunsStep);
-  if (run.output.find("authorization") != std::string::npos)
+  if (run.output.find("authorization") != std::string::npos) {
     failure.advice = "give those of the storage server: --user NAME, and --password-file FILE";
+  }
   return job.failed("the target's LUNs cannot be listed", failure);
 }
 
@@ -69,9 +71,10 @@ bool discover_targets(Job& job, const Portal& portal, std::vector<std::string>& 
   if (!general_tree_answers(job, turn)) return false;
   const ToolRun run = job.run(search_arguments(portal), "");
   const FoundTargets found = read_found_targets();
-  if (!run.succeeded() || !found.done)
+  if (!run.succeeded() || !found.done) {
     return job.refuse(kFailed, "the portal " + portal.text() + " cannot be asked for its targets",
                       explain_run(run, kDiscoveryStep));
+  }
   names = found.names;
   return true;
 }

@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "job.h"
-#include "options.h"
-#include "portal.h"
+#include "vv/job.h"
+#include "vv/options.h"
+#include "vv/portal.h"
 
 namespace vv {
 

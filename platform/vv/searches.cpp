@@ -1,4 +1,4 @@
-#include "searches.h"
+#include "vv/searches.h"
 
 #include <sys/file.h>
 #include <unistd.h>
@@ -7,7 +7,7 @@
 #include <cstdlib>
 
 #include "ktree/client/calls.h"
-#include "lock_file.h"
+#include "shares/lock_file.h"
 
 #define TARGETS "/temp/vv_search"
 #define LUNS "/temp/vv_search_lun"
@@ -23,7 +23,7 @@ constexpr char kUnknown[] = "unknown";  // the tool's word for a file system tha
 constexpr int kLoginFailed = 100;
 
 bool forget(const char* path) {
-  return ktree::client::del(platform::kGeneralTree, path) != Result::unreachable;
+  return ktree::client::del(platform::kGeneralTree, path) != Result::kUnreachable;
 }
 
 }  // namespace

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "tree_reader.h"
+#include "common/tree_reader.h"
 
 namespace vv {
 

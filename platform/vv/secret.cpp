@@ -1,4 +1,4 @@
-#include "secret.h"
+#include "vv/secret.h"
 
 #include <fcntl.h>
 #include <unistd.h>
@@ -6,8 +6,8 @@
 #include <cerrno>
 #include <cstring>
 
-#include "terminal.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vv/terminal.h"
 
 namespace vv {
 namespace {
@@ -31,8 +31,9 @@ bool read_file(const std::string& name, std::string& text) {
 const char* fault_of(const std::string& secret) {
   if (secret.empty()) return "the password is empty";
   if (secret.size() > kMost) return "the password has more than 127 bytes";
-  if (secret.find_first_of(std::string_view("\n\0", 2)) != std::string::npos)
+  if (secret.find_first_of(std::string_view("\n\0", 2)) != std::string::npos) {
     return "the password has more than one line";
+  }
   return nullptr;
 }
 
@@ -44,8 +45,9 @@ bool read_credentials(const Options& options, Credentials& credentials, std::str
   const std::string& file = options.password_file;
   if (file.empty()) {
     why = "no password was typed; where there is no terminal, use --password-file";
-    if (!ask_secret("Password of " + platform::printable(options.user) + ": ", credentials.secret))
+    if (!ask_secret("Password of " + platform::printable(options.user) + ": ", credentials.secret)) {
       return false;
+    }
   } else if (!read_file(file, credentials.secret)) {
     why = platform::printable(file) + ": " + strerror(errno);
     return false;

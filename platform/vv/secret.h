@@ -4,8 +4,8 @@
 
 #include <string>
 
-#include "options.h"
-#include "tool.h"
+#include "vv/options.h"
+#include "vv/tool.h"
 
 namespace vv {
 

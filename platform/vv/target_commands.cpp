@@ -1,8 +1,8 @@
-#include "target_commands.h"
+#include "vv/target_commands.h"
 
-#include "job.h"
-#include "list.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vv/job.h"
+#include "vv/list.h"
 
 namespace vv {
 namespace {
@@ -33,12 +33,15 @@ int password(const Options& options) {
   if (!job.read_credentials(credentials)) return job.end();
   const std::string names = mounted_shares(job);
   if (!names.empty() &&
-      !job.confirm(names + " goes away for a moment; programs that have files open there are ended. Go on?"))
+      !job.confirm(names +
+                   " goes away for a moment; programs that have files open there are ended. Go on?")) {
     return job.end();
+  }
   const Target target = *job.target;
   const ToolRun run = job.run(modify_arguments(target.name, credentials), target.name);
-  if (!run.succeeded() || !is_stored(target.name, credentials))
+  if (!run.succeeded() || !is_stored(target.name, credentials)) {
     return job.failed("the password is not changed", explain_run(run, kStoreStep));
+  }
   if (target.wanted) return job.tell_brought_up(target.name, job.row != nullptr ? options.name : "", run);
   return job.done("the password is stored\nconnect it: " +
                   platform::printable(vv_command("connect", options.name)));
@@ -55,18 +58,20 @@ int rename_portal(const Options& options) {
   }
   const std::string name = platform::printable(options.name);
   const std::string target = job.target->name;
-  if (job.before.in_use(target))
+  if (job.before.in_use(target)) {
     return job.failed(name + " is connected, and its portal is not changed",
                       {kStoreStep,
                        "a portal is changed while the target is not connected",
                        platform::printable(vv_command("disconnect", options.name)),
                        {}});
+  }
   const ToolRun run = job.run(modify_address_arguments(target, portal), target);
   const Look after;
   const Target* now = after.target(target);
   // The tool succeeds as well when it refuses.
-  if (!run.succeeded() || now == nullptr || stored_portal(now->address, now->port).text() != portal.text())
+  if (!run.succeeded() || now == nullptr || stored_portal(now->address, now->port).text() != portal.text()) {
     return job.failed("the portal of " + name + " is not changed", explain_run(run, kDiscoveryStep));
+  }
   return job.done(name + " is reached at " + portal.text() +
                   " from now on\nconnect it: " + platform::printable(vv_command("connect", options.name)));
 }

@@ -2,7 +2,7 @@
 #ifndef PLATFORM_VV_TARGET_COMMANDS_H
 #define PLATFORM_VV_TARGET_COMMANDS_H
 
-#include "options.h"
+#include "vv/options.h"
 
 namespace vv {
 

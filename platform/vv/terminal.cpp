@@ -1,10 +1,10 @@
-#include "terminal.h"
+#include "vv/terminal.h"
 
 #include <fcntl.h>
-#include <signal.h>
 #include <strings.h>
 #include <termios.h>
 #include <unistd.h>
+#include <csignal>
 
 #include <cerrno>
 #include <cstring>

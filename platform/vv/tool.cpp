@@ -1,17 +1,17 @@
-#include "tool.h"
+#include "vv/tool.h"
 
 #include <fcntl.h>
 #include <poll.h>
-#include <signal.h>
 #include <spawn.h>
 #include <sys/mman.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <csignal>
 
 #include <cstring>
 
-#include "file_text.h"
+#include "common/file_text.h"
 
 namespace vv {
 namespace {

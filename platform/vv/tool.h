@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "portal.h"
+#include "vv/portal.h"
 
 namespace vv {
 

@@ -1,9 +1,9 @@
-#include "volume_commands.h"
+#include "vv/volume_commands.h"
 
-#include "job.h"
-#include "list.h"
-#include "search_commands.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vv/job.h"
+#include "vv/list.h"
+#include "vv/search_commands.h"
 
 namespace vv {
 namespace {
@@ -43,11 +43,13 @@ int disconnect(const Options& options) {
   Job job(options);
   if (!job.find_share_or_target()) return job.end();
   const std::string others = job.row != nullptr ? others_mounted(job) : "";
-  if (!others.empty() && !job.confirm("This disconnects the whole target, also " + others + ". Go on?"))
+  if (!others.empty() && !job.confirm("This disconnects the whole target, also " + others + ". Go on?")) {
     return job.end();
+  }
   const ToolRun run = job.run(target_arguments("--disconnect", job.target->name), job.target->name);
-  if (!run.succeeded() || Look().in_use(job.target->name))
+  if (!run.succeeded() || Look().in_use(job.target->name)) {
     return job.failed(shown_name(job) + " is not disconnected", explain_run(run, kUnmountStep));
+  }
   return job.done(shown_name(job) + " is disconnected, and stays so until it is connected");
 }
 
@@ -59,19 +61,22 @@ int remove(const Options& options) {
   std::string names = shown_name(job);
   if (whole) {
     names.clear();
-    for (const Row* row : job.before.volumes_of(*job.target))
+    for (const Row* row : job.before.volumes_of(*job.target)) {
       append(names, platform::printable(row->volume->share));
+    }
     names = shown_name(job) + " with " + (names.empty() ? "no share" : names);
   }
-  if (!job.confirm("This ends the use of " + names + " here; the data stays on the storage server. Go on?"))
+  if (!job.confirm("This ends the use of " + names + " here; the data stays on the storage server. Go on?")) {
     return job.end();
+  }
   const Arguments arguments = whole ? target_arguments("--del", job.target->name)
                                     : lun_arguments("--del_lun", job.target->name, job.row->volume->lun);
   const ToolRun run = job.run(arguments, job.target->name);
   const Look after;
   const bool gone = whole ? after.target(options.name) == nullptr : after.share(options.name) == nullptr;
-  if (!run.succeeded() || !gone)
+  if (!run.succeeded() || !gone) {
     return job.failed(shown_name(job) + " is not deleted", explain_run(run, kStoreStep));
+  }
   return job.done(names + " is deleted; the data is still on the storage server");
 }
 

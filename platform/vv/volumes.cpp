@@ -1,12 +1,12 @@
-#include "volumes.h"
+#include "vv/volumes.h"
 
 #include <glob.h>
 
 #include <algorithm>
 
-#include "list.h"
-#include "sessions.h"
-#include "tree_reader.h"
+#include "common/sessions.h"
+#include "common/tree_reader.h"
+#include "vv/list.h"
 
 namespace vv {
 namespace {

@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "health.h"
-#include "status.h"
-#include "tool.h"
+#include "vv/tool.h"
+#include "vvstat/health.h"
+#include "vvstat/status.h"
 
 namespace vv {
 

@@ -2,8 +2,8 @@
 // and explains what went wrong.
 #include <sys/prctl.h>
 
-#include "columns.h"
-#include "options.h"
+#include "vv/options.h"
+#include "vvstat/columns.h"
 
 int main(int argc, char** argv) {
   prctl(PR_SET_DUMPABLE, 0);  // a core would hold the passwords

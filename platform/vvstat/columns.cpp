@@ -1,4 +1,4 @@
-#include "columns.h"
+#include "vvstat/columns.h"
 
 #include <libsmartcols.h>
 #include <locale.h>
@@ -10,8 +10,8 @@
 #include <iterator>
 #include <memory>
 
-#include "moment.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vvstat/moment.h"
 
 namespace vvstat {
 namespace {
@@ -144,14 +144,15 @@ std::string cell(const Column& column, const Row& row, const Layout& layout) {
 size_t find_column(std::string_view name) {
   size_t at = 0;
   while (at < std::size(kColumns) && (name.size() != std::string_view(kColumns[at].name).size() ||
-                                      strncasecmp(name.data(), kColumns[at].name, name.size()) != 0))
-    ++at;
+                                      strncasecmp(name.data(), kColumns[at].name, name.size()) != 0)) {
+    at++;
+  }
   return at;
 }
 
 std::vector<size_t> first_columns(size_t count) {
   std::vector<size_t> columns;
-  for (size_t at = 0; at < count; ++at) columns.push_back(at);
+  for (size_t at = 0; at < count; at++) columns.push_back(at);
   return columns;
 }
 
@@ -192,13 +193,14 @@ bool add_row(libscols_table* table, const Row& row, const std::vector<size_t>& c
              const Layout& layout) {
   libscols_line* line = scols_table_new_line(table, nullptr);
   if (line == nullptr) return false;
-  for (size_t at = 0; at < columns.size(); ++at) {
+  for (size_t at = 0; at < columns.size(); at++) {
     const Column& column = kColumns[columns[at]];
     const std::string text = cell(column, row, layout);
     if (text.empty()) continue;
     if (scols_line_set_data(line, at, text.c_str()) != 0) return false;
-    if (columns[at] == find_column("STATUS") && row.wanted)
+    if (columns[at] == find_column("STATUS") && row.wanted) {
       scols_cell_set_color(scols_line_get_cell(line, at), row.healthy() ? kGood : kBad);
+    }
   }
   return true;
 }
@@ -218,7 +220,7 @@ std::string readable_size(unsigned long long bytes) {
   constexpr char kUnits[] = "BKMGTPE";
   auto size = static_cast<double>(bytes);
   size_t unit = 0;
-  for (; size >= 1024; ++unit) size /= 1024;
+  for (; size >= 1024; unit++) size /= 1024;
   char text[32];
   snprintf(text, sizeof text, "%.*f%c", unit == 0 || size >= 9.95 ? 0 : 1, size, kUnits[unit]);
   return text;
@@ -235,8 +237,9 @@ bool choose_columns(std::string_view names, Layout& layout, std::string& unknown
     const size_t column = find_column(name);
     unknown = name;
     if (column == std::size(kColumns)) return false;
-    if (std::find(layout.columns.begin(), layout.columns.end(), column) == layout.columns.end())
+    if (std::find(layout.columns.begin(), layout.columns.end(), column) == layout.columns.end()) {
       layout.columns.push_back(column);
+    }
     if (name.size() == names.size()) return true;
     names.remove_prefix(name.size() + 1);
   }

@@ -1,4 +1,4 @@
-#include "health.h"
+#include "vvstat/health.h"
 
 #include <algorithm>
 
@@ -49,50 +49,61 @@ Problem problem_of(const Target& target, const TargetFacts& facts) {
     default:
       return {Ailment::kFailed, "Disconnected", "is not connected", "connect it", connect(target)};
   }
-  if (facts.session.empty())
+  if (facts.session.empty()) {
     return {Ailment::kLost, "No Session", "the target's session is gone, although nobody disconnected it",
             "connect it again", connect(target)};
-  if (facts.session != "LOGGED_IN")
+  }
+  if (facts.session != "LOGGED_IN") {
     return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
+  }
   return kNone;
 }
 
 Problem problem_of_unmounted(const Target& target, const Volume& volume) {
   const std::string format =
       "remvol --format -n " + quoted(target.name) + " -l " + std::to_string(volume.lun);
-  if (volume.format_state == kFormatFailed)
+  if (volume.format_state == kFormatFailed) {
     return {Ailment::kFailed, "Format Failed", "its format failed",
             "look at the storage server and the kernel's log", format};
-  if (volume.volume_state == kUnsupported)
+  }
+  if (volume.volume_state == kUnsupported) {
     return {Ailment::kFailed, "Unsupported", "what is on its disk cannot be mounted here",
             "the data is left as it is; this destroys it", format};
-  if (volume.volume_state == kVolumeFailed)
+  }
+  if (volume.volume_state == kVolumeFailed) {
     return {Ailment::kFailed, "Failed", "its partition, format or mount failed",
             "look at the kernel's log for errors of the disk", connect(target)};
-  if (volume.device.empty())
+  }
+  if (volume.device.empty()) {
     return {Ailment::kFailed, "No Disk", "its LUN has no disk here",
             "see whether the storage server still offers it", connect(target)};
+  }
   return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again", connect(target)};
 }
 
 Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {
-  if (volume.format_state == kFormatRunning)
+  if (volume.format_state == kFormatRunning) {
     return {Ailment::kBusy, "Formatting", "is being formatted, " + std::to_string(volume.progress) + "%",
             "wait", ""};
-  if (volume.format_state == kFormatWaiting)
+  }
+  if (volume.format_state == kFormatWaiting) {
     return {Ailment::kBusy, "Wait to Format", "waits until another volume is formatted", "wait", ""};
-  if (volume.volume_state == kBeingCreated)
+  }
+  if (volume.volume_state == kBeingCreated) {
     return {Ailment::kBusy, "Creating", "is being created", "wait", ""};
+  }
   if (!facts.mounted) return problem_of_unmounted(target, volume);
-  if (facts.disk_lost)
+  if (facts.disk_lost) {
     return {Ailment::kFailed, "No Disk", "its disk is gone, though its target is connected",
             "have it mounted anew", mount_anew(target)};
+  }
   // A write-protected LUN is read-only from the beginning, and the tree says so.
-  if (facts.read_only && !(facts.disk_read_only && volume.read_only))
+  if (facts.read_only && !(facts.disk_read_only && volume.read_only)) {
     return {Ailment::kReadOnly, "Read Only",
             "became read-only: its file system has errors, or the LUN was write-protected",
             "have it mounted anew; if it becomes so again, check its file system with e2fsck",
             mount_anew(target)};
+  }
   return kNone;
 }
 
@@ -136,10 +147,10 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
 
 std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& facts) {
   std::vector<Row> rows;
-  for (size_t at = 0; at < status.targets.size(); ++at) {
+  for (size_t at = 0; at < status.targets.size(); at++) {
     const Target& target = status.targets[at];
     if (target.volumes.empty()) rows.push_back(row_of(target, facts[at]));
-    for (size_t n = 0; n < target.volumes.size(); ++n) rows.push_back(row_of(target, facts[at], n));
+    for (size_t n = 0; n < target.volumes.size(); n++) rows.push_back(row_of(target, facts[at], n));
   }
   return rows;
 }

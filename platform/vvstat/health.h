@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "kernel.h"
-#include "status.h"
+#include "vvstat/kernel.h"
+#include "vvstat/status.h"
 
 namespace vvstat {
 

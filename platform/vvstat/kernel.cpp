@@ -1,4 +1,4 @@
-#include "kernel.h"
+#include "vvstat/kernel.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -10,7 +10,7 @@
 #include <climits>
 #include <cstdio>
 
-#include "sessions.h"
+#include "common/sessions.h"
 
 namespace vvstat {
 namespace {
@@ -73,8 +73,9 @@ VolumeFacts facts_of(const Volume& volume, bool answering) {
   dev_t device{};
   struct statvfs space {};
   if (volume.mount_point.empty() || !is_mount_point(volume.mount_point, device) ||
-      statvfs(volume.mount_point.c_str(), &space) != 0)
+      statvfs(volume.mount_point.c_str(), &space) != 0) {
     return facts;
+  }
   const std::string disk = disk_of(device);
   facts.mounted = true;
   facts.disk_lost = major(device) != 0 && disk.empty() && access("/sys/dev/block", F_OK) == 0;

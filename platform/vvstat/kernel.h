@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "status.h"
+#include "vvstat/status.h"
 
 namespace vvstat {
 

@@ -1,10 +1,10 @@
-#include "metrics.h"
+#include "vvstat/metrics.h"
 
 #include <algorithm>
 #include <iterator>
 #include <string_view>
 
-#include "utf8.h"
+#include "common/utf8.h"
 
 namespace vvstat {
 namespace {

@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "health.h"
+#include "vvstat/health.h"
 
 namespace vvstat {
 

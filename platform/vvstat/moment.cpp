@@ -1,4 +1,4 @@
-#include "moment.h"
+#include "vvstat/moment.h"
 
 namespace vvstat {
 namespace {

@@ -1,12 +1,12 @@
-#include "past.h"
+#include "vvstat/past.h"
 
 #include <fcntl.h>
 #include <unistd.h>
 
 #include <cstdio>
 
-#include "file_text.h"
-#include "utf8.h"
+#include "common/file_text.h"
+#include "common/utf8.h"
 
 namespace vvstat {
 namespace {
@@ -61,8 +61,9 @@ History history_of(std::string_view text) {
     int at = 0;
     if (sscanf(line.c_str(), "%u %lld %u %u %u %n", &now, &since, &told, &formatting, &nearly_full, &at) !=
             5 ||
-        at == 0 || line.size() == static_cast<size_t>(at) || now >= kAilments || told >> kAilments != 0)
+        at == 0 || line.size() == static_cast<size_t>(at) || now >= kAilments || told >> kAilments != 0) {
       continue;
+    }
     const size_t name = static_cast<size_t>(at), mark = line.find(kMark, name);
     Past& past = history[line.substr(name, mark - name)];
     past = {static_cast<Ailment>(now),

@@ -1,4 +1,4 @@
-#include "status.h"
+#include "vvstat/status.h"
 
 #include <algorithm>
 
@@ -34,7 +34,7 @@ Target read_target(const TreeReader& tree, int index) {
   target.wanted = tree.number(0, TARGET "conn_set", index) != 0;
   target.connect_state = tree.number(-1, TARGET "conn_state", index);
   target.status = tree.value(TARGET "status", index);
-  for (int lun = 1; lun <= platform::kLuns; ++lun) {
+  for (int lun = 1; lun <= platform::kLuns; lun++) {
     if (tree.value(LUN "lun", index, lun).empty()) break;
     target.volumes.push_back(read_volume(tree, index, lun));
   }
@@ -45,7 +45,7 @@ Target read_target(const TreeReader& tree, int index) {
 
 Status read_status(const TreeReader& tree) {
   Status status{tree.answered(), {}};
-  for (int index = 1; index <= platform::kTargets; ++index) {
+  for (int index = 1; index <= platform::kTargets; index++) {
     if (tree.value(TARGET "target", index).empty()) break;
     status.targets.push_back(read_target(tree, index));
   }

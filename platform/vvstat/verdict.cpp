@@ -1,9 +1,9 @@
-#include "verdict.h"
+#include "vvstat/verdict.h"
 
 #include <string_view>
 
-#include "moment.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "vvstat/moment.h"
 
 namespace vvstat {
 namespace {

@@ -9,12 +9,12 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "columns.h"
-#include "metrics.h"
-#include "past.h"
-#include "utf8.h"
-#include "verdict.h"
-#include "watch.h"
+#include "common/utf8.h"
+#include "vvstat/columns.h"
+#include "vvstat/metrics.h"
+#include "vvstat/past.h"
+#include "vvstat/verdict.h"
+#include "vvstat/watch.h"
 
 namespace vvstat {
 namespace {
@@ -122,8 +122,9 @@ int show_one(const Options& options) {
   }
   std::vector<Row> rows;
   for (const Row& row : seen.rows) {
-    if (row.target->name == options.name || (row.volume != nullptr && row.volume->share == options.name))
+    if (row.target->name == options.name || (row.volume != nullptr && row.volume->share == options.name)) {
       rows.push_back(row);
+    }
   }
   if (rows.empty()) {
     fprintf(stderr, "vvstat: there is no share and no target of this name\n");

@@ -1,11 +1,11 @@
-#include "watch.h"
+#include "vvstat/watch.h"
 
 #include <poll.h>
-#include <signal.h>
 #include <sys/ioctl.h>
 #include <sys/signalfd.h>
 #include <termios.h>
 #include <unistd.h>
+#include <csignal>
 
 #include <algorithm>
 #include <cstdio>

@@ -5,8 +5,8 @@
 
 #include <cstdint>
 
-#include "../../platform/sysaux/content.h"
 #include "require.h"
+#include "sysaux/content.h"
 
 using namespace sysaux;
 
@@ -26,9 +26,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static Extent extents[kMax];
   const Content content = recognise(disk, name);
   require_ended(name);
-  require((name[0] == '\0') == (content == Content::nothing || content == Content::unreadable));
+  require((name[0] == '\0') == (content == Content::kNothing || content == Content::kUnreadable));
   const int count = read_table(disk, extents, kMax);
   require(count >= -1 && count <= kMax);
-  if (content == Content::nothing || content == Content::empty_table) require(count <= 0);
+  if (content == Content::kNothing || content == Content::kEmptyTable) require(count <= 0);
   return 0;
 }

@@ -7,8 +7,8 @@
 #include <cstdio>
 #include <cstring>
 
-#include "../../platform/sysaux/disk_table.cpp"  // NOLINT(bugprone-suspicious-include): its own parts are called
 #include "require.h"
+#include "sysaux/disk_table.cpp"  // NOLINT(bugprone-suspicious-include): its own parts are called
 
 namespace {
 
@@ -54,7 +54,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   Extent extent{};
   if (!write_new_table(disk.path, &extent)) {
     require(memcmp(start_before, disk.bytes, kPart) == 0 && memcmp(end_before, disk.end(), kPart) == 0);
-  } else if (content == Content::nothing || content == Content::empty_table) {
+  } else if (content == Content::kNothing || content == Content::kEmptyTable) {
     Extent found[4];
     require(read_table(disk.fd, found, 4) == 1);
     require(found[0].start == extent.start && found[0].size == extent.size && found[0].number == 1);

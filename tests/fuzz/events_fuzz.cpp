@@ -1,5 +1,5 @@
 // What arrives on the netlink socket: no datagram is read beyond its end, and every one comes to an end.
-#include "kernel_event.h"
+#include "events/kernel_event.h"
 
 #include <cstdlib>
 

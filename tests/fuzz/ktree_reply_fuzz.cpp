@@ -43,7 +43,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (size < 2 || size > 32768) return 0;
   const size_t room = data[0];
   // A get may be sent again, a delete may not.
-  const Operation operation = (data[1] & 1) != 0 ? Operation::get : Operation::del;
+  const Operation operation = (data[1] & 1) != 0 ? Operation::kGet : Operation::kDel;
   reply = data + 2;
   reply_size = size - 2;
   std::string body(room + 8, 'x');
@@ -52,7 +52,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     const Result result = request("/hostile", call);
     require(call.size <= room);
     require(body.compare(room, 8, "xxxxxxxx") == 0);
-    if (result == Result::unreachable) continue;
+    if (result == Result::kUnreachable) continue;
     require(reply_size >= sizeof(ReplyHeader));
     ReplyHeader header;
     memcpy(&header, reply, sizeof header);
@@ -65,8 +65,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const uint8_t* const bad = reinterpret_cast<const uint8_t*>("\xff\xff\xff\xff\0\0\0\0");
   reply = bad;
   reply_size = 8;
-  Call call = {Operation::del, "/a", "", -1, nullptr, 0, 0};
-  while (request("/hostile", call) != Result::unreachable) {
+  Call call = {Operation::kDel, "/a", "", -1, nullptr, 0, 0};
+  while (request("/hostile", call) != Result::kUnreachable) {
   }
   return 0;
 }

@@ -32,7 +32,7 @@ bool serve(Service& service, std::string_view& bytes, int document) {
   request.document = document;
   const Service::Answer answer = service.handle(request);
   require(sizeof(ReplyHeader) + answer.body.size() <= kMaxReplyBytes);
-  require(answer.body.empty() || answer.status == Status::done || answer.status == Status::damaged);
+  require(answer.body.empty() || answer.status == Status::kDone || answer.status == Status::kDamaged);
   bytes.remove_prefix(size);
   return true;
 }

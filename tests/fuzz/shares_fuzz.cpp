@@ -4,11 +4,11 @@
 #include <cstdlib>
 #include <string>
 
-#include "access.h"
-#include "server_config.h"
-#include "share_file.h"
-#include "share_name.h"
-#include "utf8.h"
+#include "common/utf8.h"
+#include "shares/access.h"
+#include "shares/server_config.h"
+#include "shares/share_file.h"
+#include "shares/share_name.h"
 
 namespace {
 

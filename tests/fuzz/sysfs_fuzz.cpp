@@ -5,9 +5,9 @@
 
 #include <string>
 
-#include "../../platform/sysaux/block.h"
 #include "frontend/log.h"
 #include "require.h"
+#include "sysaux/block.h"
 #include "volume/device.h"
 #include "wrapped_files.h"
 

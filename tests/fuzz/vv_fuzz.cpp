@@ -3,12 +3,12 @@
 #include <cstdint>
 #include <string>
 
-#include "explanation.h"
-#include "kernel_log.h"
-#include "portal.h"
+#include "common/utf8.h"
 #include "require.h"
-#include "searches.h"
-#include "utf8.h"
+#include "vv/explanation.h"
+#include "vv/kernel_log.h"
+#include "vv/portal.h"
+#include "vv/searches.h"
 
 namespace {
 

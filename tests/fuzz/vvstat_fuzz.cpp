@@ -5,11 +5,11 @@
 #include <cstdint>
 #include <string>
 
-#include "columns.h"
-#include "metrics.h"
+#include "common/utf8.h"
 #include "require.h"
-#include "utf8.h"
-#include "verdict.h"
+#include "vvstat/columns.h"
+#include "vvstat/metrics.h"
+#include "vvstat/verdict.h"
 
 using namespace vvstat;
 

@@ -1,5 +1,5 @@
 // When a target that is missing is tried again.
-#include "schedule.h"
+#include "keeper/schedule.h"
 
 #include <gtest/gtest.h>
 

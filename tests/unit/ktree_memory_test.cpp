@@ -77,13 +77,13 @@ class File {
 
 std::string listing_of(Service& service) {
   const File file("");
-  EXPECT_EQ(service.handle({Operation::list, "/", "", file.fd()}).status, Status::done);
+  EXPECT_EQ(service.handle({Operation::kList, "/", "", file.fd()}).status, Status::kDone);
   return file.text();
 }
 
 void load(Service& service, const char* document) {
   const File file(document);
-  ASSERT_EQ(service.handle({Operation::load, "", "", file.fd()}).status, Status::done);
+  ASSERT_EQ(service.handle({Operation::kLoad, "", "", file.fd()}).status, Status::kDone);
 }
 
 struct Case {
@@ -113,31 +113,31 @@ TEST_P(Memory, RunsOutAtEveryAllocation) {
     const bool ran_out = allocations_left == 0;
     allocations_left = 0;
     if (!ran_out) {
-      EXPECT_EQ(status, Status::done);
+      EXPECT_EQ(status, Status::kDone);
       break;
     }
     failures++;
-    EXPECT_EQ(status, Status::failed) << n;
+    EXPECT_EQ(status, Status::kFailed) << n;
     EXPECT_EQ(listing_of(service), before) << n;
     // The count of what the tree holds is right as well: it takes what it took before, and gives it back.
-    EXPECT_EQ(service.handle({Operation::set, "/new/id:3", "v", -1}).status, Status::done);
-    EXPECT_EQ(service.handle({Operation::del, "/new", "", -1}).status, Status::done);
+    EXPECT_EQ(service.handle({Operation::kSet, "/new/id:3", "v", -1}).status, Status::kDone);
+    EXPECT_EQ(service.handle({Operation::kDel, "/new", "", -1}).status, Status::kDone);
     EXPECT_EQ(listing_of(service), before) << n;
   }
   EXPECT_GE(failures, request.at_least);
 }
 
 INSTANTIATE_TEST_SUITE_P(Requests, Memory,
-                         testing::Values(Case{"replace", Operation::set, "/a", "another value", nullptr, 1},
-                                         Case{"branch", Operation::set,
+                         testing::Values(Case{"replace", Operation::kSet, "/a", "another value", nullptr, 1},
+                                         Case{"branch", Operation::kSet,
                                               "/new/branch:3/with/id:5/a_name_that_no_string_keeps", "v",
                                               nullptr, 20},
-                                         Case{"sibling", Operation::set, "/b/id:9/c", "v", nullptr, 8},
-                                         Case{"second_group", Operation::set, "/b/a", "v", nullptr, 3},
-                                         Case{"del", Operation::del, "/b/id:1", "", nullptr, 0},
-                                         Case{"dump", Operation::dump, "", "", "", 0},
-                                         Case{"load", Operation::load, "", "", kOther, 20},
-                                         Case{"list", Operation::list, "/", "", "", 0}),
+                                         Case{"sibling", Operation::kSet, "/b/id:9/c", "v", nullptr, 8},
+                                         Case{"second_group", Operation::kSet, "/b/a", "v", nullptr, 3},
+                                         Case{"del", Operation::kDel, "/b/id:1", "", nullptr, 0},
+                                         Case{"dump", Operation::kDump, "", "", "", 0},
+                                         Case{"load", Operation::kLoad, "", "", kOther, 20},
+                                         Case{"list", Operation::kList, "/", "", "", 0}),
                          [](const auto& instance) { return std::string(instance.param.name); });
 
 // What a tree reckons that it holds is exact after a set that ran out of memory.

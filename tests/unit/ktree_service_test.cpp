@@ -37,7 +37,7 @@ class ServiceTest : public testing::Test {
     Request request = {};
     if (!parse_request(bytes, request)) {
       ADD_FAILURE() << "not a request";
-      return Status::failed;
+      return Status::kFailed;
     }
     request.document = document;
     const Service::Answer answer = service_.handle(request);
@@ -45,10 +45,10 @@ class ServiceTest : public testing::Test {
     return answer.status;
   }
   Status set(const std::string& path, const std::string& value) {
-    return call(request(Operation::set, path, value));
+    return call(request(Operation::kSet, path, value));
   }
   Status get(const std::string& path, uint32_t bytes = 65535) {
-    return call(request(Operation::get, path, limit(bytes)));
+    return call(request(Operation::kGet, path, limit(bytes)));
   }
 
   Service service_;
@@ -56,7 +56,7 @@ class ServiceTest : public testing::Test {
 };
 
 TEST(Frame, SizeIsKnownFromFourBytes) {
-  const std::string bytes = request(Operation::get, "/a", limit(1));
+  const std::string bytes = request(Operation::kGet, "/a", limit(1));
   EXPECT_EQ(request_size(bytes), bytes.size());
   EXPECT_EQ(request_size(bytes.substr(0, 4)), bytes.size());
   for (size_t size = 0; size < 4; size++) {
@@ -91,43 +91,43 @@ TEST(Frame, ThatDoesNotHoldTogetherIsNone) {
 }
 
 TEST_F(ServiceTest, SetsAndGets) {
-  EXPECT_EQ(get("/a"), Status::missing);
-  EXPECT_EQ(set("/a", "value"), Status::done);
-  EXPECT_EQ(get("/a"), Status::done);
+  EXPECT_EQ(get("/a"), Status::kMissing);
+  EXPECT_EQ(set("/a", "value"), Status::kDone);
+  EXPECT_EQ(get("/a"), Status::kDone);
   EXPECT_EQ(body_, "value");
-  EXPECT_EQ(get("/a", 3), Status::done);
+  EXPECT_EQ(get("/a", 3), Status::kDone);
   EXPECT_EQ(body_, "val");
-  EXPECT_EQ(get("/a", 0), Status::done);
+  EXPECT_EQ(get("/a", 0), Status::kDone);
   EXPECT_EQ(body_, "");
 }
 
 TEST_F(ServiceTest, RefusesBadPathsAndChangesNothing) {
-  EXPECT_EQ(set("/a/b:0", "x"), Status::refused);
-  EXPECT_EQ(get("/a"), Status::missing);
-  EXPECT_EQ(set("/", "x"), Status::refused);
-  EXPECT_EQ(set("", "x"), Status::refused);
-  EXPECT_EQ(get("/a:4097"), Status::refused);
-  EXPECT_EQ(call(request(Operation::del, "/")), Status::refused);
+  EXPECT_EQ(set("/a/b:0", "x"), Status::kRefused);
+  EXPECT_EQ(get("/a"), Status::kMissing);
+  EXPECT_EQ(set("/", "x"), Status::kRefused);
+  EXPECT_EQ(set("", "x"), Status::kRefused);
+  EXPECT_EQ(get("/a:4097"), Status::kRefused);
+  EXPECT_EQ(call(request(Operation::kDel, "/")), Status::kRefused);
 }
 
 TEST_F(ServiceTest, RefusesValuesThatATreeCannotHold) {
-  EXPECT_EQ(set("/a", std::string("x\0y", 3)), Status::refused);
-  EXPECT_EQ(set("/a", std::string(65536, 'x')), Status::refused);
-  EXPECT_EQ(get("/a"), Status::missing);
-  EXPECT_EQ(set("/a", std::string(65535, 'x')), Status::done);
+  EXPECT_EQ(set("/a", std::string("x\0y", 3)), Status::kRefused);
+  EXPECT_EQ(set("/a", std::string(65536, 'x')), Status::kRefused);
+  EXPECT_EQ(get("/a"), Status::kMissing);
+  EXPECT_EQ(set("/a", std::string(65535, 'x')), Status::kDone);
 }
 
 TEST_F(ServiceTest, RefusesAGetWithoutItsLimit) {
-  ASSERT_EQ(set("/a", "x"), Status::done);
-  EXPECT_EQ(call(request(Operation::get, "/a")), Status::refused);
-  EXPECT_EQ(call(request(Operation::get, "/a", "123")), Status::refused);
+  ASSERT_EQ(set("/a", "x"), Status::kDone);
+  EXPECT_EQ(call(request(Operation::kGet, "/a")), Status::kRefused);
+  EXPECT_EQ(call(request(Operation::kGet, "/a", "123")), Status::kRefused);
 }
 
 TEST_F(ServiceTest, Deletes) {
-  ASSERT_EQ(set("/a/b", "x"), Status::done);
-  EXPECT_EQ(call(request(Operation::del, "/a")), Status::done);
-  EXPECT_EQ(call(request(Operation::del, "/a")), Status::missing);
-  EXPECT_EQ(get("/a/b"), Status::missing);
+  ASSERT_EQ(set("/a/b", "x"), Status::kDone);
+  EXPECT_EQ(call(request(Operation::kDel, "/a")), Status::kDone);
+  EXPECT_EQ(call(request(Operation::kDel, "/a")), Status::kMissing);
+  EXPECT_EQ(get("/a/b"), Status::kMissing);
 }
 
 TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
@@ -137,11 +137,11 @@ TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
   const int sealed = memfd_create("sealed", MFD_CLOEXEC | MFD_ALLOW_SEALING);
   ASSERT_EQ(fcntl(sealed, F_ADD_SEALS, F_SEAL_WRITE), 0);
   for (int document : {-1, null, pipes[1]}) {
-    EXPECT_EQ(call(request(Operation::dump, ""), document), Status::failed);
-    EXPECT_EQ(call(request(Operation::load, ""), document), Status::failed);
-    EXPECT_EQ(call(request(Operation::list, "/"), document), Status::failed);
+    EXPECT_EQ(call(request(Operation::kDump, ""), document), Status::kFailed);
+    EXPECT_EQ(call(request(Operation::kLoad, ""), document), Status::kFailed);
+    EXPECT_EQ(call(request(Operation::kList, "/"), document), Status::kFailed);
   }
-  EXPECT_EQ(call(request(Operation::dump, ""), sealed), Status::failed);
+  EXPECT_EQ(call(request(Operation::kDump, ""), sealed), Status::kFailed);
   for (int fd : {null, pipes[0], pipes[1], sealed}) {
     close(fd);
   }
@@ -149,14 +149,14 @@ TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
 
 TEST_F(ServiceTest, LoadsWhatItDumped) {
   const int document = memfd_create("document", MFD_CLOEXEC);
-  ASSERT_EQ(set("/a", "x"), Status::done);
-  ASSERT_EQ(call(request(Operation::dump, ""), document), Status::done);
-  ASSERT_EQ(set("/a", "y"), Status::done);
-  ASSERT_EQ(set("/b", "z"), Status::done);
-  ASSERT_EQ(call(request(Operation::load, ""), document), Status::done);
-  EXPECT_EQ(get("/a"), Status::done);
+  ASSERT_EQ(set("/a", "x"), Status::kDone);
+  ASSERT_EQ(call(request(Operation::kDump, ""), document), Status::kDone);
+  ASSERT_EQ(set("/a", "y"), Status::kDone);
+  ASSERT_EQ(set("/b", "z"), Status::kDone);
+  ASSERT_EQ(call(request(Operation::kLoad, ""), document), Status::kDone);
+  EXPECT_EQ(get("/a"), Status::kDone);
   EXPECT_EQ(body_, "x");
-  EXPECT_EQ(get("/b"), Status::missing);
+  EXPECT_EQ(get("/b"), Status::kMissing);
   close(document);
 }
 
@@ -164,21 +164,21 @@ TEST_F(ServiceTest, ADamagedDocumentLeavesTheTreeAsItWas) {
   const int document = memfd_create("document", MFD_CLOEXEC);
   const std::string text = "<config>\n<a>new</a>\n<b>\n</config>";
   ASSERT_EQ(write(document, text.data(), text.size()), static_cast<ssize_t>(text.size()));
-  ASSERT_EQ(set("/a", "old"), Status::done);
-  EXPECT_EQ(call(request(Operation::load, ""), document), Status::damaged);
+  ASSERT_EQ(set("/a", "old"), Status::kDone);
+  EXPECT_EQ(call(request(Operation::kLoad, ""), document), Status::kDamaged);
   EXPECT_EQ(body_, "line 4: mismatched tag");
-  EXPECT_EQ(get("/a"), Status::done);
+  EXPECT_EQ(get("/a"), Status::kDone);
   EXPECT_EQ(body_, "old");
   close(document);
 }
 
 TEST_F(ServiceTest, ListsTheRootAndNodes) {
   const int document = memfd_create("document", MFD_CLOEXEC);
-  ASSERT_EQ(set("/a", "x"), Status::done);
-  EXPECT_EQ(call(request(Operation::list, "/"), document), Status::done);
-  EXPECT_EQ(call(request(Operation::list, "/a:1"), document), Status::done);
-  EXPECT_EQ(call(request(Operation::list, "/b"), document), Status::missing);
-  EXPECT_EQ(call(request(Operation::list, ""), document), Status::refused);
+  ASSERT_EQ(set("/a", "x"), Status::kDone);
+  EXPECT_EQ(call(request(Operation::kList, "/"), document), Status::kDone);
+  EXPECT_EQ(call(request(Operation::kList, "/a:1"), document), Status::kDone);
+  EXPECT_EQ(call(request(Operation::kList, "/b"), document), Status::kMissing);
+  EXPECT_EQ(call(request(Operation::kList, ""), document), Status::kRefused);
   char text[64] = "";
   EXPECT_EQ(pread(document, text, sizeof text, 0), 5);
   EXPECT_STREQ(text, "/a=x\n");

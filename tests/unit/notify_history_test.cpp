@@ -1,5 +1,5 @@
 // What is told of a volume, and how often.
-#include "history.h"
+#include "notify/history.h"
 
 #include <gtest/gtest.h>
 

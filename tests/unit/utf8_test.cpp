@@ -1,5 +1,5 @@
 // Texts of users as UTF-8.
-#include "utf8.h"
+#include "common/utf8.h"
 
 #include <gtest/gtest.h>
 

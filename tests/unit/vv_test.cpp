@@ -4,13 +4,13 @@
 #include <fstream>
 #include <sstream>
 
-#include "explanation.h"
-#include "kernel_log.h"
-#include "portal.h"
-#include "progress.h"
-#include "searches.h"
-#include "tool.h"
-#include "volumes.h"
+#include "vv/explanation.h"
+#include "vv/kernel_log.h"
+#include "vv/portal.h"
+#include "vv/progress.h"
+#include "vv/searches.h"
+#include "vv/tool.h"
+#include "vv/volumes.h"
 
 namespace vv {
 namespace {

@@ -15,40 +15,36 @@ Call plain_call(Operation operation, std::string_view path, std::string_view val
 }
 
 Result file_result(int error, Reason& reason) {
-  if (error == 0) {
-    return Result::done;
-  }
+  if (error == 0) return Result::kDone;
   snprintf(reason.text, sizeof reason.text, "%s", strerror(error));
-  return Result::failed;
+  return Result::kFailed;
 }
 
 // Lets the daemon fill `document`.
 Result fetch(const char* socket, Operation operation, const char* path, const MemoryFile& document,
              Reason& reason) {
-  if (document.fd() < 0) {
-    return file_result(errno, reason);
-  }
+  if (document.fd() < 0) return file_result(errno, reason);
   Call call = plain_call(operation, path, {}, document.fd());
   const Result result = request(socket, call);
-  return result == Result::failed ? file_result(EIO, reason) : result;
+  return result == Result::kFailed ? file_result(EIO, reason) : result;
 }
 
 }  // namespace
 
 Result set(const char* socket, const char* path, const char* value) {
-  Call call = plain_call(Operation::set, path, value, -1);
+  Call call = plain_call(Operation::kSet, path, value, -1);
   return request(socket, call);
 }
 
 Result del(const char* socket, const char* path) {
-  Call call = plain_call(Operation::del, path, {}, -1);
+  Call call = plain_call(Operation::kDel, path, {}, -1);
   return request(socket, call);
 }
 
 Result get(const char* socket, const char* path, char* buffer, size_t room, size_t& size) {
   const auto wanted = static_cast<uint32_t>(room < kMaxValueBytes ? room : kMaxValueBytes);
-  Call call = {Operation::get, path, {reinterpret_cast<const char*>(&wanted), sizeof wanted}, -1, buffer,
-               wanted,         0};
+  Call call = {Operation::kGet, path, {reinterpret_cast<const char*>(&wanted), sizeof wanted}, -1, buffer,
+               wanted,          0};
   const Result result = request(socket, call);
   size = call.size;
   return result;
@@ -57,35 +53,33 @@ Result get(const char* socket, const char* path, char* buffer, size_t room, size
 Result dump(const char* socket, const char* file, Reason& reason) {
   reason.text[0] = '\0';
   const MemoryFile document;
-  const Result result = fetch(socket, Operation::dump, "", document, reason);
-  return result == Result::done ? file_result(document.replace_file(file), reason) : result;
+  const Result result = fetch(socket, Operation::kDump, "", document, reason);
+  return result == Result::kDone ? file_result(document.replace_file(file), reason) : result;
 }
 
 Result dump_to(const char* socket, int fd, Reason& reason) {
   reason.text[0] = '\0';
   const MemoryFile document;
-  const Result result = fetch(socket, Operation::dump, "", document, reason);
-  return result == Result::done ? file_result(document.write_to(fd), reason) : result;
+  const Result result = fetch(socket, Operation::kDump, "", document, reason);
+  return result == Result::kDone ? file_result(document.write_to(fd), reason) : result;
 }
 
 Result list_to(const char* socket, const char* path, int fd, Reason& reason) {
   reason.text[0] = '\0';
   const MemoryFile document;
-  const Result result = fetch(socket, Operation::list, path, document, reason);
-  return result == Result::done ? file_result(document.write_to(fd), reason) : result;
+  const Result result = fetch(socket, Operation::kList, path, document, reason);
+  return result == Result::kDone ? file_result(document.write_to(fd), reason) : result;
 }
 
 Result load(const char* socket, const char* file, Reason& reason) {
   reason.text[0] = '\0';
   const MemoryFile document;
   const int wrong = document.fd() < 0 ? errno : document.read_from(file);
-  if (wrong != 0) {
-    return file_result(wrong, reason);
-  }
-  Call call = {Operation::load, {}, {}, document.fd(), reason.text, kMaxErrorBytes, 0};
+  if (wrong != 0) return file_result(wrong, reason);
+  Call call = {Operation::kLoad, {}, {}, document.fd(), reason.text, kMaxErrorBytes, 0};
   const Result result = request(socket, call);
   reason.text[call.size] = '\0';
-  return result == Result::failed ? file_result(EIO, reason) : result;
+  return result == Result::kFailed ? file_result(EIO, reason) : result;
 }
 
 }  // namespace ktree::client

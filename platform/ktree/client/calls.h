@@ -1,6 +1,7 @@
 // The operations of the client, with more to tell than the C interface can: ktreec_*() and the ktreec program
 // are made of these.
-#pragma once
+#ifndef PLATFORM_KTREE_CLIENT_CALLS_H
+#define PLATFORM_KTREE_CLIENT_CALLS_H
 
 #include <cstddef>
 
@@ -32,3 +33,5 @@ struct Reason {
 [[nodiscard]] Result list_to(const char* socket, const char* path, int fd, Reason& reason);
 
 }  // namespace ktree::client
+
+#endif

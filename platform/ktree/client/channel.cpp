@@ -47,10 +47,10 @@ struct Deadline {
 
 // What became of one try.
 enum class Outcome {
-  answered,
-  not_sent,   // the daemon cannot have read the whole request
-  lost,       // the connection ended, the daemon may have carried the request out
-  timed_out,  // or the daemon speaks another language
+  kAnswered,
+  kNotSent,   // the daemon cannot have read the whole request
+  kLost,      // the connection ended, the daemon may have carried the request out
+  kTimedOut,  // or the daemon speaks another language
 };
 
 // A thread of the parent may have held a lock at the fork; in the child nobody would ever release it.
@@ -63,12 +63,8 @@ void unlock_in_child() {
 
 Channel* make_channel(const char* socket) {
   auto* channel = static_cast<Channel*>(calloc(1, sizeof(Channel)));
-  if (channel == nullptr) {
-    return nullptr;
-  }
-  if (channels == nullptr) {
-    pthread_atfork(nullptr, nullptr, unlock_in_child);
-  }
+  if (channel == nullptr) return nullptr;
+  if (channels == nullptr) pthread_atfork(nullptr, nullptr, unlock_in_child);
   pthread_mutex_init(&channel->lock, nullptr);
   channel->fd = -1;
   channel->address.sun_family = AF_UNIX;
@@ -81,25 +77,17 @@ Channel* make_channel(const char* socket) {
 // The channel of `socket`, made at its first use; null when the path is no socket's. Never removed.
 Channel* find_channel(const char* socket) {
   const size_t length = strlen(socket);
-  if (length == 0 || length >= sizeof(sockaddr_un::sun_path)) {
-    return nullptr;
-  }
+  if (length == 0 || length >= sizeof(sockaddr_un::sun_path)) return nullptr;
   pthread_mutex_lock(&channels_lock);
   Channel* channel = channels;
-  while (channel != nullptr && strcmp(channel->address.sun_path, socket) != 0) {
-    channel = channel->next;
-  }
-  if (channel == nullptr) {
-    channel = make_channel(socket);
-  }
+  while (channel != nullptr && strcmp(channel->address.sun_path, socket) != 0) channel = channel->next;
+  if (channel == nullptr) channel = make_channel(socket);
   pthread_mutex_unlock(&channels_lock);
   return channel;
 }
 
 void disconnect(Channel& channel) {
-  if (channel.fd >= 0) {
-    close(channel.fd);
-  }
+  if (channel.fd >= 0) close(channel.fd);
   channel.fd = -1;
 }
 
@@ -109,21 +97,15 @@ bool wait_for(int fd, short events, Deadline& deadline) {
   for (;;) {
     pollfd entry = {fd, events, 0};
     const int ready = poll(&entry, 1, static_cast<int>(deadline.left()));
-    if (ready > 0) {
-      return true;
-    }
-    if (ready == 0 || errno != EINTR) {
-      return false;
-    }
+    if (ready > 0) return true;
+    if (ready == 0 || errno != EINTR) return false;
   }
 }
 
 // Opens a socket above the standard descriptors: a program that runs without them would print into it.
 int open_socket() {
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (fd < 0 || fd > STDERR_FILENO) {
-    return fd;
-  }
+  if (fd < 0 || fd > STDERR_FILENO) return fd;
   const int above = fcntl(fd, F_DUPFD_CLOEXEC, STDERR_FILENO + 1);
   close(fd);
   return above;
@@ -132,9 +114,7 @@ int open_socket() {
 // Connects `fd`, which waits while the daemon's backlog is full. A signal may interrupt that.
 bool connect_to(int fd, const sockaddr_un& address, const Deadline& deadline) {
   while (connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-    if (errno != EINTR || deadline.left() == 0) {
-      return false;
-    }
+    if (errno != EINTR || deadline.left() == 0) return false;
   }
   return true;
 }
@@ -144,9 +124,7 @@ bool connect_channel(Channel& channel, Deadline& deadline) {
   const int64_t left = deadline.left();
   const timeval limit = {left / 1000, (left % 1000) * 1000 + 1};
   const int fd = open_socket();
-  if (fd < 0) {
-    return false;
-  }
+  if (fd < 0) return false;
   if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &limit, sizeof limit) != 0 ||
       setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit) != 0 ||
       !connect_to(fd, channel.address, deadline)) {
@@ -202,9 +180,7 @@ Outcome send_request(int fd, const Call& call, Deadline& deadline) {
   msghdr message = {};
   message.msg_iov = parts.part;
   message.msg_iovlen = parts.count;
-  if (call.document >= 0) {
-    pass_descriptor(message, reinterpret_cast<cmsghdr*>(control), call.document);
-  }
+  if (call.document >= 0) pass_descriptor(message, reinterpret_cast<cmsghdr*>(control), call.document);
   while (parts.left > 0) {
     const ssize_t n = sendmsg(fd, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
     if (n > 0) {
@@ -212,19 +188,19 @@ Outcome send_request(int fd, const Call& call, Deadline& deadline) {
       message.msg_control = nullptr;
       message.msg_controllen = 0;
     } else if (errno != EINTR && errno != EAGAIN) {
-      return Outcome::not_sent;
+      return Outcome::kNotSent;
     } else if (!wait_for(fd, POLLOUT, deadline)) {
-      return Outcome::timed_out;
+      return Outcome::kTimedOut;
     }
   }
-  return Outcome::answered;
+  return Outcome::kAnswered;
 }
 
 // The end of the connection as a receive sees it. The kernel says ECONNRESET when the other side closed with
 // something of ours unread (unix(7) sockets do, unix_release_sock() in the kernel): the request was then not
 // carried out.
 Outcome lost_connection(ssize_t received) {
-  return received < 0 && errno == ECONNRESET ? Outcome::not_sent : Outcome::lost;
+  return received < 0 && errno == ECONNRESET ? Outcome::kNotSent : Outcome::kLost;
 }
 
 Outcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& deadline) {
@@ -235,74 +211,62 @@ Outcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& deadlin
   size_t have = 0;
   size_t wanted = sizeof header;
   while (have < wanted) {
-    if (deadline.tight && !wait_for(fd, POLLIN, deadline)) {
-      return Outcome::timed_out;
-    }
+    if (deadline.tight && !wait_for(fd, POLLIN, deadline)) return Outcome::kTimedOut;
     const ssize_t n = recvmsg(fd, &message, deadline.tight ? MSG_DONTWAIT : 0);
     deadline.tight = true;
     if (n > 0) {
       parts.advance(static_cast<size_t>(n));
       have += static_cast<size_t>(n);
-      if (have >= sizeof header) {
-        wanted = kLengthBytes + size_t{header.length};
-      }
+      if (have >= sizeof header) wanted = kLengthBytes + size_t{header.length};
       if (wanted < sizeof header || wanted > sizeof header + call.room || have > wanted) {
-        return Outcome::timed_out;
+        return Outcome::kTimedOut;
       }
     } else if (n == 0 || (errno != EINTR && errno != EAGAIN)) {
       return lost_connection(n);
     }
   }
   call.size = wanted - sizeof header;
-  return Outcome::answered;
+  return Outcome::kAnswered;
 }
 
 Outcome try_once(Channel& channel, Call& call, ReplyHeader& header, Deadline& deadline) {
   const Outcome sent = send_request(channel.fd, call, deadline);
-  return sent == Outcome::answered ? receive_reply(channel.fd, call, header, deadline) : sent;
+  return sent == Outcome::kAnswered ? receive_reply(channel.fd, call, header, deadline) : sent;
 }
 
 // A delete that was carried out must not be sent again: it would take the next sibling.
 bool may_try_again(Outcome outcome, Operation operation) {
-  return outcome == Outcome::not_sent || (outcome == Outcome::lost && operation != Operation::del);
+  return outcome == Outcome::kNotSent || (outcome == Outcome::kLost && operation != Operation::kDel);
 }
 
 Result result_of(uint8_t status) {
   switch (static_cast<Status>(status)) {
-    case Status::done:
-      return Result::done;
-    case Status::missing:
-      return Result::missing;
-    case Status::refused:
-      return Result::refused;
-    case Status::damaged:
-      return Result::damaged;
-    case Status::failed:
+    case Status::kDone:
+      return Result::kDone;
+    case Status::kMissing:
+      return Result::kMissing;
+    case Status::kRefused:
+      return Result::kRefused;
+    case Status::kDamaged:
+      return Result::kDamaged;
+    case Status::kFailed:
       break;
   }
-  return Result::failed;
+  return Result::kFailed;
 }
 
 Result request_on(Channel& channel, Call& call) {
   Deadline deadline = {Deadline::now() + kRequestMilliseconds, false};
-  if (channel.fd >= 0 && channel.owner != getpid()) {
-    disconnect(channel);
-  }
+  if (channel.fd >= 0 && channel.owner != getpid()) disconnect(channel);
   for (int i = 0; i < kTries; i++) {
-    if (channel.fd < 0 && !connect_channel(channel, deadline)) {
-      return Result::unreachable;
-    }
+    if (channel.fd < 0 && !connect_channel(channel, deadline)) return Result::kUnreachable;
     ReplyHeader header = {};
     const Outcome outcome = try_once(channel, call, header, deadline);
-    if (outcome == Outcome::answered) {
-      return result_of(header.status);
-    }
+    if (outcome == Outcome::kAnswered) return result_of(header.status);
     disconnect(channel);
-    if (!may_try_again(outcome, call.operation)) {
-      break;
-    }
+    if (!may_try_again(outcome, call.operation)) break;
   }
-  return Result::unreachable;
+  return Result::kUnreachable;
 }
 
 }  // namespace
@@ -310,12 +274,8 @@ Result request_on(Channel& channel, Call& call) {
 Result request(const char* socket, Call& call) {
   call.size = 0;
   Channel* channel = find_channel(socket == nullptr ? kDefaultSocket : socket);
-  if (channel == nullptr) {
-    return Result::unreachable;
-  }
-  if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) {
-    return Result::refused;
-  }
+  if (channel == nullptr) return Result::kUnreachable;
+  if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) return Result::kRefused;
   pthread_mutex_lock(&channel->lock);
   const Result result = request_on(*channel, call);
   pthread_mutex_unlock(&channel->lock);

@@ -2,7 +2,8 @@
 //
 // This code is part of a library that any program may load, C programs too: it needs nothing of the C++
 // runtime and throws nothing.
-#pragma once
+#ifndef PLATFORM_KTREE_CLIENT_CHANNEL_H
+#define PLATFORM_KTREE_CLIENT_CHANNEL_H
 
 #include <cstddef>
 #include <cstdint>
@@ -18,12 +19,12 @@ inline constexpr char kDefaultSocket[] = "/var/run/ktree_sock";
 constexpr int64_t kRequestMilliseconds = 5000;
 
 enum class Result {
-  done,
-  missing,
-  refused,
-  damaged,
-  failed,       // the daemon, or a file here, could not do it
-  unreachable,  // no daemon answers
+  kDone,
+  kMissing,
+  kRefused,
+  kDamaged,
+  kFailed,       // the daemon, or a file here, could not do it
+  kUnreachable,  // no daemon answers
 };
 
 struct Call {
@@ -44,3 +45,5 @@ struct Call {
 [[nodiscard]] Result request(const char* socket, Call& call);
 
 }  // namespace ktree::client
+
+#endif

@@ -36,23 +36,15 @@ int copy_all(int from, int to) {
   off_t offset = 0;
   for (;;) {
     const ssize_t n = pread(from, buffer, sizeof buffer, offset);
-    if (n == 0) {
-      return 0;
-    }
+    if (n == 0) return 0;
     if (n < 0) {
-      if (errno == EINTR) {
-        continue;
-      }
+      if (errno == EINTR) continue;
       return errno;
     }
     const int wrong = write_all(to, buffer, static_cast<size_t>(n));
-    if (wrong != 0) {
-      return wrong;
-    }
+    if (wrong != 0) return wrong;
     offset += n;
-    if (static_cast<size_t>(offset) > kMaxDocumentBytes) {
-      return EFBIG;
-    }
+    if (static_cast<size_t>(offset) > kMaxDocumentBytes) return EFBIG;
   }
 }
 
@@ -75,9 +67,7 @@ int open_folder_of(const char* file) {
 // True when `name` is "FILE.NUMBER.tmp" of the file called `file`.
 bool is_temporary_of(const char* name, const char* file) {
   const size_t length = strlen(file);
-  if (strncmp(name, file, length) != 0 || name[length] != '.') {
-    return false;
-  }
+  if (strncmp(name, file, length) != 0 || name[length] != '.') return false;
   const char* number = name + length + 1;
   const size_t digits = strspn(number, "0123456789");
   return digits > 0 && strcmp(number + digits, kTemporaryEnd) == 0;
@@ -92,9 +82,7 @@ void remove_left_over(int folder, const char* name) {
       flock(fd, LOCK_EX | LOCK_NB) == 0) {
     unlinkat(folder, name, 0);
   }
-  if (fd >= 0) {
-    close(fd);
-  }
+  if (fd >= 0) close(fd);
 }
 
 // A process that is killed in the middle of a dump leaves its file behind, with all that the settings hold.
@@ -102,9 +90,7 @@ void remove_left_overs_of(const char* file) {
   const int folder = open_folder_of(file);
   DIR* entries = folder < 0 ? nullptr : fdopendir(folder);
   if (entries == nullptr) {
-    if (folder >= 0) {
-      close(folder);
-    }
+    if (folder >= 0) close(folder);
     return;
   }
   const char* slash = strrchr(file, '/');
@@ -130,22 +116,16 @@ class Replacement {
       return ENAMETOOLONG;
     }
     int wrong = make();
-    for (int i = 0; i < kCreateTries && wrong == EBUSY; i++) {
-      wrong = make();
-    }
+    for (int i = 0; i < kCreateTries && wrong == EBUSY; i++) wrong = make();
     return wrong;
   }
 
   // Writes it to the disk and gives it the name `file`. Returns 0 or an errno value.
   int commit(const char* file) {
-    if (fsync(fd_) != 0) {
-      return errno;
-    }
+    if (fsync(fd_) != 0) return errno;
     const int closed = close(fd_);
     fd_ = -1;
-    if (closed != 0 || rename(path_, file) != 0) {
-      return errno;
-    }
+    if (closed != 0 || rename(path_, file) != 0) return errno;
     path_[0] = '\0';
     return 0;
   }
@@ -156,12 +136,8 @@ class Replacement {
   Replacement(const Replacement&) = delete;
   Replacement& operator=(const Replacement&) = delete;
   ~Replacement() {
-    if (fd_ >= 0) {
-      close(fd_);
-    }
-    if (path_[0] != '\0') {
-      unlink(path_);
-    }
+    if (fd_ >= 0) close(fd_);
+    if (path_[0] != '\0') unlink(path_);
   }
 
  private:
@@ -194,9 +170,7 @@ class Replacement {
 // A rename is on the disk when its folder is.
 int sync_folder_of(const char* file) {
   const int fd = open_folder_of(file);
-  if (fd < 0) {
-    return errno;
-  }
+  if (fd < 0) return errno;
   // A file system without this operation says EINVAL (fsync(2)); there is nothing more to be done then.
   const int wrong = fsync(fd) == 0 || errno == EINVAL ? 0 : errno;
   close(fd);
@@ -206,9 +180,7 @@ int sync_folder_of(const char* file) {
 // What a rename over `file` must not replace.
 int check_replaceable(const char* file) {
   struct stat info = {};
-  if (stat(file, &info) != 0 || S_ISREG(info.st_mode)) {
-    return 0;
-  }
+  if (stat(file, &info) != 0 || S_ISREG(info.st_mode)) return 0;
   return S_ISDIR(info.st_mode) ? EISDIR : EINVAL;
 }
 
@@ -217,25 +189,19 @@ int check_replaceable(const char* file) {
 MemoryFile::MemoryFile() : fd_(memfd_create("ktree", MFD_CLOEXEC)) {}
 
 MemoryFile::~MemoryFile() {
-  if (fd_ >= 0) {
-    close(fd_);
-  }
+  if (fd_ >= 0) close(fd_);
 }
 
 int MemoryFile::read_from(const char* file) const {
   // Opening a pipe would wait for its other end.
   const int fd = open(file, O_RDONLY | O_CLOEXEC | O_NONBLOCK);
-  if (fd < 0) {
-    return errno;
-  }
+  if (fd < 0) return errno;
   struct stat info = {};
   int wrong = fstat(fd, &info) != 0   ? errno
               : S_ISREG(info.st_mode) ? 0
               : S_ISDIR(info.st_mode) ? EISDIR
                                       : EINVAL;
-  if (wrong == 0) {
-    wrong = copy_all(fd, fd_);
-  }
+  if (wrong == 0) wrong = copy_all(fd, fd_);
   close(fd);
   return wrong;
 }
@@ -246,17 +212,11 @@ int MemoryFile::write_to(int fd) const {
 
 int MemoryFile::replace_file(const char* file) const {
   int wrong = check_replaceable(file);
-  if (wrong != 0) {
-    return wrong;
-  }
+  if (wrong != 0) return wrong;
   Replacement replacement;
   wrong = replacement.create(file);
-  if (wrong == 0) {
-    wrong = write_to(replacement.fd());
-  }
-  if (wrong == 0) {
-    wrong = replacement.commit(file);
-  }
+  if (wrong == 0) wrong = write_to(replacement.fd());
+  if (wrong == 0) wrong = replacement.commit(file);
   return wrong == 0 ? sync_folder_of(file) : wrong;
 }
 

@@ -1,5 +1,6 @@
 // Documents on their way between a file and the daemon.
-#pragma once
+#ifndef PLATFORM_KTREE_CLIENT_DOCUMENT_H
+#define PLATFORM_KTREE_CLIENT_DOCUMENT_H
 
 #include <cstddef>
 
@@ -33,3 +34,5 @@ class MemoryFile {
 };
 
 }  // namespace ktree::client
+
+#endif

@@ -14,7 +14,7 @@ using ktree::client::Result;
 namespace {
 
 int status(Result result) {
-  return result == Result::done ? 0 : -1;
+  return result == Result::kDone ? 0 : -1;
 }
 
 }  // namespace
@@ -24,17 +24,13 @@ KTREEC_EXPORT int ktreec_set(const char* socket, unsigned, const char* path, con
 }
 
 KTREEC_EXPORT int ktreec_get_wb(const char* socket, unsigned, const char* path, char* buffer, size_t size) {
-  if (buffer == nullptr || size == 0) {
-    return -1;
-  }
+  if (buffer == nullptr || size == 0) return -1;
   size_t received = 0;
   const Result result =
-      path == nullptr ? Result::refused : ktree::client::get(socket, path, buffer, size - 1, received);
-  buffer[result == Result::done ? received : 0] = '\0';
-  if (result == Result::missing) {
-    errno = ENODATA;
-  }
-  return result == Result::done ? static_cast<int>(received) : -1;
+      path == nullptr ? Result::kRefused : ktree::client::get(socket, path, buffer, size - 1, received);
+  buffer[result == Result::kDone ? received : 0] = '\0';
+  if (result == Result::kMissing) errno = ENODATA;
+  return result == Result::kDone ? static_cast<int>(received) : -1;
 }
 
 KTREEC_EXPORT int ktreec_del(const char* socket, unsigned, const char* path) {

@@ -48,16 +48,16 @@ int complain(const char* subject, const char* text) {
 // word.
 int conclude(const Arguments& arguments, Result result, const char* subject, const char* reason) {
   switch (result) {
-    case Result::done:
+    case Result::kDone:
       return EXIT_SUCCESS;
-    case Result::missing:
+    case Result::kMissing:
       return kNo;
-    case Result::refused:
+    case Result::kRefused:
       return complain(subject, "not a path or a value that the tree can take");
-    case Result::damaged:
-    case Result::failed:
+    case Result::kDamaged:
+    case Result::kFailed:
       return complain(subject, reason);
-    case Result::unreachable:
+    case Result::kUnreachable:
       break;
   }
   const char* socket = arguments.socket == nullptr ? ktree::client::kDefaultSocket : arguments.socket;
@@ -70,7 +70,7 @@ int do_get(const Arguments& arguments) {
   size_t size = 0;
   const Result result =
       ktree::client::get(arguments.socket, arguments.operands[0], value, ktree::kMaxValueBytes, size);
-  if (result == Result::done) {
+  if (result == Result::kDone) {
     value[size] = '\n';
     if (fwrite(value, 1, size + 1, stdout) != size + 1 || fflush(stdout) != 0) {
       return complain("standard output", strerror(errno));
@@ -126,9 +126,7 @@ constexpr Operation kOperations[] = {
 
 const Operation* find_operation(const char* option) {
   for (const Operation& operation : kOperations) {
-    if (strcmp(operation.option, option) == 0) {
-      return &operation;
-    }
+    if (strcmp(operation.option, option) == 0) return &operation;
   }
   return nullptr;
 }
@@ -143,26 +141,16 @@ int usage_error(const char* text) {
 const char* parse(char** word, Arguments& arguments, const Operation*& operation) {
   while (*word != nullptr) {
     if (strcmp(*word, "-S") == 0) {
-      if (*++word == nullptr) {
-        return "-S wants a socket";
-      }
+      if (*++word == nullptr) return "-S wants a socket";
       arguments.socket = *word++;
       continue;
     }
-    if (operation != nullptr) {
-      return "one operation at a time";
-    }
+    if (operation != nullptr) return "one operation at a time";
     operation = find_operation(*word++);
-    if (operation == nullptr) {
-      return "no such operation";
-    }
+    if (operation == nullptr) return "no such operation";
     int taken = 0;
-    for (; taken < operation->most_operands && *word != nullptr; taken++) {
-      arguments.operands[taken] = *word++;
-    }
-    if (taken < operation->least_operands) {
-      return "an operand is missing";
-    }
+    for (; taken < operation->most_operands && *word != nullptr; taken++) arguments.operands[taken] = *word++;
+    if (taken < operation->least_operands) return "an operand is missing";
   }
   return operation == nullptr ? "no operation" : nullptr;
 }
