@@ -61,6 +61,8 @@ void print_without_secrets(Weight weight, const char* text) {
 
 int debug_level = 0;
 
+const LogScope* LogScope::innermost_ = nullptr;
+
 void begin_line(Weight weight, FILE* stream) {
   if (is_journal(fileno(stream))) fprintf(stream, "<%d>", weight.priority);
 }
@@ -74,16 +76,16 @@ void print_open(Weight weight, const char* format, ...) {
   if (is_journal(STDOUT_FILENO)) putchar('\n');
 }
 
-void log_prefix(Weight weight, const char* file, const char* function, int line) {
+void log_prefix(Weight weight, const char* file, int line) {
   if (debug_level >= weight.level) {
     begin_line(weight);
-    printf("(%s:%s:%d): ", file, function, line);
+    printf("(%s:%s:%d): ", file, LogScope::function(), line);
   }
   fflush(stdout);
 }
 
-void log_message(Weight weight, const char* file, const char* function, int line, const char* format, ...) {
-  log_prefix(weight, file, function, line);
+void log_message(Weight weight, const char* file, int line, const char* format, ...) {
+  log_prefix(weight, file, line);
   if (debug_level >= weight.level) {
     char* text = nullptr;
     va_list arguments;

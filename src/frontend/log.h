@@ -37,14 +37,26 @@ inline constexpr Weight kCommandFailed(0, 3);
 // The process-wide debug level. Negative silences everything. Set once by main.
 extern int debug_level;
 
-// Where a message comes from. As a default argument it names the function that made the call, so that a
-// shared helper logs in its caller's name.
-struct Caller {
-  const char* function;
-  int line;
+// The function in whose name messages are told: it has an object of this at its beginning. What it calls and
+// has none of its own logs in its name, so that a reader of the log finds the step, and not the helper of
+// many steps.
+class LogScope {
+ public:
+  // As a default argument __builtin_FUNCTION() names the function that has the object.
+  explicit LogScope(const char* function = __builtin_FUNCTION()) : function_(function), outer_(innermost_) {
+    innermost_ = this;
+  }
+  ~LogScope() { innermost_ = outer_; }
+  LogScope(const LogScope&) = delete;
+  LogScope& operator=(const LogScope&) = delete;
 
-  constexpr Caller(const char* function_name = __builtin_FUNCTION(), int line_number = __builtin_LINE())
-      : function(function_name), line(line_number) {}
+  // Returns the name of the innermost function that has one.
+  static const char* function() { return innermost_ != nullptr ? innermost_->function_ : "main"; }
+
+ private:
+  static const LogScope* innermost_;
+  const char* function_;
+  const LogScope* outer_;
 };
 
 // Begins a line that is no message of the log, on standard output or standard error: the journal gets the
@@ -55,13 +67,14 @@ void begin_line(Weight weight, FILE* stream = stdout);
 // as it is. In the journal it is a line.
 [[gnu::format(printf, 2, 3)]] void print_open(Weight weight, const char* format, ...);
 
-// Prints the prefix when the debug level is at least the message's; flushes standard output in every case.
-void log_prefix(Weight weight, const char* file, const char* function, int line);
+// Prints the prefix, with the innermost scope's function, when the debug level is at least the message's;
+// flushes standard output in every case.
+void log_prefix(Weight weight, const char* file, int line);
 
 // Prints prefix, message and a newline when the debug level is at least the message's; flushes in every case.
 // The secret in a command of iscsiadm is masked.
-[[gnu::format(printf, 5, 6)]] void log_message(Weight weight, const char* file, const char* function,
-                                               int line, const char* format, ...);
+[[gnu::format(printf, 4, 5)]] void log_message(Weight weight, const char* file, int line, const char* format,
+                                               ...);
 
 }  // namespace remvol
 
@@ -70,12 +83,8 @@ void log_prefix(Weight weight, const char* file, const char* function, int line)
 #define LOG_SOURCE "src.cpp"
 #endif
 
-// LOG(1, "get %s db_idx=%d", name, n); logs in the name of the enclosing function. In place of a level stands
-// a weight where the priority is another than the level's: LOG(kNote, "ip: %s", address).
-#define LOG(weight, ...) ::remvol::log_message(weight, LOG_SOURCE, __func__, __LINE__, __VA_ARGS__)
-
-// LOG_AT(caller, 0, "..."); logs in the name of `caller`.
-#define LOG_AT(caller, weight, ...) \
-  ::remvol::log_message(weight, LOG_SOURCE, (caller).function, (caller).line, __VA_ARGS__)
+// LOG(1, "get %s db_idx=%d", name, n); logs in the name of the innermost scope. In place of a level stands a
+// weight where the priority is another than the level's: LOG(kNote, "ip: %s", address).
+#define LOG(weight, ...) ::remvol::log_message(weight, LOG_SOURCE, __LINE__, __VA_ARGS__)
 
 #endif

@@ -64,29 +64,29 @@ void copy_to_flash() {
 }
 
 // Dumps the tree. Returns whether the settings file may go to the flash.
-bool dump_settings(const Command& command, Caller caller) {
+bool dump_settings(const Command& command) {
   // A tree that was told to end may be gone already, which is nothing to tell of.
   if (command.ends_tree)
     return !dump_would_bury_settings() && ktreec_dump(main_socket, 0, kSettingsFile) == 0;
   RunLock lock;
   lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one
-  return store_settings(caller);
+  return store_settings();
 }
 
 // Returns whether the tree that the command has changed is gone, and the change with it: its daemon was
 // started anew and has loaded the settings of before, or does not answer any more. Logged at level 0. Where
 // there was no socket before the command, nothing is known of that.
-bool was_change_lost(const TreeInstance& tree, Caller caller) {
+bool was_change_lost(const TreeInstance& tree) {
   if (tree.inode == 0) return false;
   if (tree == tree_instance() && tree_answers(result_key())) return false;
-  LOG_AT(caller, 0, "the configuration tree was started anew meanwhile, what was changed may be lost");
+  LOG(0, "the configuration tree was started anew meanwhile, what was changed may be lost");
   return true;
 }
 
-int succeed(const Command& command, int result, const TreeInstance& tree, Caller caller) {
+int succeed(const Command& command, int result, const TreeInstance& tree) {
   record_result(NumberText("%d", result));
-  const bool stored = dump_settings(command, caller);
-  if (command.persists && was_change_lost(tree, caller)) return fail(false);
+  const bool stored = dump_settings(command);
+  if (command.persists && was_change_lost(tree)) return fail(false);
   if (command.persists && stored) copy_to_flash();
   if (command.persists) reload_share_services();
   return result;
@@ -97,20 +97,20 @@ const char* failure_message(const Command& command) {
   return for_all ? command.failure_all : command.failure;
 }
 
-int run(const Command& command, const Options& options, Caller caller) {
+int run(const Command& command, const Options& options) {
   record_result("");
   if ((OPT_FLAG & command.required) != command.required) {
-    LOG_AT(caller, 1, "OPT_FLAG: %08x", OPT_FLAG);
+    LOG(1, "OPT_FLAG: %08x", OPT_FLAG);
     return fail(false);
   }
   if (command.run == nullptr) return fail(false);
   const TreeInstance tree = tree_instance();
   const int result = command.run(options);
   if (result != 0 && !command.reports_value) {
-    LOG_AT(caller, 1, "%s", failure_message(command));
+    LOG(1, "%s", failure_message(command));
     return fail(false);
   }
-  return succeed(command, result, tree, caller);
+  return succeed(command, result, tree);
 }
 
 void keep_program_path(int argc, char** argv) {
@@ -122,22 +122,23 @@ void leave_no_core() {
   prctl(PR_SET_DUMPABLE, 0);
 }
 
-void log_arguments(int argc, char** argv, const int* shown, Caller caller) {
+void log_arguments(int argc, char** argv, const int* shown) {
   for (int i = 0; i < argc; i++) {
-    LOG_AT(caller, 1, "arg[%d]: '%.*s%s'", i, shown[i], argv[i], shown[i] < 0 ? "" : kMaskedSecret);
+    LOG(1, "arg[%d]: '%.*s%s'", i, shown[i], argv[i], shown[i] < 0 ? "" : kMaskedSecret);
   }
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
+  const LogScope scope;
   leave_no_core();
   const Memory<int> shown = allocate<int>(static_cast<size_t>(argc) + 1);
   if (!shown) return fail(false);
   hide_secrets(argc, argv, shown.get());
   debug_level = dbg_get_remvol_debug_lv();
   keep_program_path(argc, argv);
-  log_arguments(argc, argv, shown.get(), Caller());
+  log_arguments(argc, argv, shown.get());
   request_target = TargetEntry();
   Options options;
   switch (parse_options(argc, argv, &options)) {
@@ -156,5 +157,5 @@ int main(int argc, char** argv) {
             __func__);
     abort();
   }
-  return run(kCommands[options.command], options, Caller());
+  return run(kCommands[options.command], options);
 }

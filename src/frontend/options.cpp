@@ -23,8 +23,6 @@ namespace {
 
 constexpr int kVersion = 1;
 constexpr size_t kAddressSize = sizeof(TargetEntry::ip);
-// Reading the command line is main's work, and its messages have always borne main's name.
-#define LOG_AS_MAIN(level, ...) LOG_AT(Caller("main"), level, __VA_ARGS__)
 
 constexpr char kSecretOption = 'P';
 constexpr char kShortOptions[] = "i:p:n:s:vc:U:P:d:l:ho:w:";
@@ -41,7 +39,7 @@ const option* long_options() {
 
 ParseEnd choose_command(int index, Options* options) {
   if (options->command >= 0) {
-    LOG_AS_MAIN(1, "Command parameter check failed, %d & %d", options->command, index);
+    LOG(1, "Command parameter check failed, %d & %d", options->command, index);
     return ParseEnd::kFail;
   }
   gs_str_command = kCommands[index].name;
@@ -52,21 +50,21 @@ ParseEnd choose_command(int index, Options* options) {
 }
 
 void log_option(int option) {
-  LOG_AS_MAIN(1, "opt('%c') with arg '%s'", option, option == kSecretOption ? kMaskedSecret : optarg);
-  LOG_AS_MAIN(1, "OPT_FLAG: %08x", OPT_FLAG);
+  LOG(1, "opt('%c') with arg '%s'", option, option == kSecretOption ? kMaskedSecret : optarg);
+  LOG(1, "OPT_FLAG: %08x", OPT_FLAG);
 }
 
 // Returns whether the argument fits into a field of `size` bytes; logs when it does not.
 bool fits_field(int option, size_t size) {
   if (strlen(optarg) < size) return true;
-  LOG_AS_MAIN(0, "Command parameter check failed, -%c takes at most %zu bytes", option, size - 1);
+  LOG(0, "Command parameter check failed, -%c takes at most %zu bytes", option, size - 1);
   return false;
 }
 
 template <size_t N>
 ParseEnd take_name(int option, unsigned bit, char (&field)[N]) {
   if (check_name(optarg) < 0) {
-    LOG_AS_MAIN(1, "Command parameter check failed, wrong name: '%s'", optarg);
+    LOG(1, "Command parameter check failed, wrong name: '%s'", optarg);
     return ParseEnd::kFail;
   }
   if (!fits_field(option, N)) return ParseEnd::kFail;
@@ -114,18 +112,18 @@ ParseEnd take_address() {
   OPT_FLAG |= kOptAddress;
   log_option('i');
   if (_resovle_net_address_to_ip(request_target.ip, &request_target.inet_type, optarg) != 0) {
-    LOG_AS_MAIN(0, "ip address %s -> error", optarg);
+    LOG(0, "ip address %s -> error", optarg);
     return ParseEnd::kFail;
   }
-  LOG_AS_MAIN(1, "get ip address %s = %s, inet_type = %s", optarg, request_target.ip,
-              request_target.inet_type == AF_INET ? "AF_INET" : "AF_INET6");
+  LOG(1, "get ip address %s = %s, inet_type = %s", optarg, request_target.ip,
+      request_target.inet_type == AF_INET ? "AF_INET" : "AF_INET6");
   return ParseEnd::kReady;
 }
 
 ParseEnd store_debug_level() {
   const NumberText value("%d", atoi(optarg));
-  LOG_AS_MAIN(kNote, "ktreec_set %s=%s", key::kDebugLevel, value.c_str());
-  if (tree_write(key::kDebugLevel, value) != kOk) LOG_AS_MAIN(0, "ktreec_set(%s) failed ", key::kDebugLevel);
+  LOG(kNote, "ktreec_set %s=%s", key::kDebugLevel, value.c_str());
+  if (tree_write(key::kDebugLevel, value) != kOk) LOG(0, "ktreec_set(%s) failed ", key::kDebugLevel);
   return ParseEnd::kExit;
 }
 
@@ -169,19 +167,18 @@ ParseEnd take_option(int option, int index, Options* options) {
   }
 }
 
-int format_ipv4(char* address, const sockaddr_in& socket, Caller caller) {
+int format_ipv4(char* address, const sockaddr_in& socket) {
   char text[kAddressSize] = "";
-  if (inet_ntop(AF_INET, &socket.sin_addr, text, sizeof text) == nullptr)
-    LOG_AT(caller, 1, "inet_ntop failed");
+  if (inet_ntop(AF_INET, &socket.sin_addr, text, sizeof text) == nullptr) LOG(1, "inet_ntop failed");
   memcpy(address, text, sizeof text);
   return kOk;
 }
 
-int format_ipv6(char* address, const sockaddr_in6& socket, Caller caller) {
+int format_ipv6(char* address, const sockaddr_in6& socket) {
   char text[INET6_ADDRSTRLEN] = "";
   if (inet_ntop(AF_INET6, &socket.sin6_addr, text, sizeof text) == nullptr) {
     puts("get address failed");
-    LOG_AT(caller, 1, "inet_ntop failed");
+    LOG(1, "inet_ntop failed");
     return kFailed;
   }
   snprintf(address, kAddressSize, "[%s]", text);
@@ -220,6 +217,7 @@ int check_name(const char*) {
 }
 
 int _resovle_net_address_to_ip(char* address, int* family, const char* host) {
+  const LogScope scope;
   if (address == nullptr || family == nullptr || host == nullptr || host[0] == '\0') return kFailed;
   addrinfo hints = {};
   hints.ai_socktype = SOCK_STREAM;
@@ -233,9 +231,8 @@ int _resovle_net_address_to_ip(char* address, int* family, const char* host) {
   sockaddr_storage socket = {};
   memcpy(&socket, found->ai_addr, found->ai_addrlen);
   freeaddrinfo(found);
-  if (*family == AF_INET) return format_ipv4(address, reinterpret_cast<const sockaddr_in&>(socket), Caller());
-  if (*family == AF_INET6)
-    return format_ipv6(address, reinterpret_cast<const sockaddr_in6&>(socket), Caller());
+  if (*family == AF_INET) return format_ipv4(address, reinterpret_cast<const sockaddr_in&>(socket));
+  if (*family == AF_INET6) return format_ipv6(address, reinterpret_cast<const sockaddr_in6&>(socket));
   LOG(1, "get ip address failed\n");
   return kFailed;
 }

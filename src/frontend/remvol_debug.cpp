@@ -8,6 +8,7 @@
 namespace remvol {
 
 int dbg_get_remvol_debug_lv() {
+  const LogScope scope;
   const int level = tree_read_number(key::kDebugLevel, 0);
   LOG(1, "get debug level = %d", level);
   return level;

@@ -16,13 +16,13 @@ namespace remvol {
 namespace {
 
 // Returns whether the request names a target and a portal; logs what is missing.
-bool check_request(const TargetEntry& request, Caller caller) {
+bool check_request(const TargetEntry& request) {
   if (request.target_name[0] == '\0') {
-    LOG_AT(caller, 0, "target name is not given");
+    LOG(0, "target name is not given");
   } else if (request.ip[0] == '\0') {
-    LOG_AT(caller, 0, "ip is not given");
+    LOG(0, "ip is not given");
   } else if (request.port < 1 || request.port > 65535) {
-    LOG_AT(caller, 0, "Port is not valid");
+    LOG(0, "Port is not valid");
   } else {
     return true;
   }
@@ -35,18 +35,18 @@ int refuse_connected(const TargetEntry& request) {
   return kOk;
 }
 
-int store_portal(const TargetEntry& request, int dbidx, Caller caller) {
+int store_portal(const TargetEntry& request, int dbidx) {
   const HeldSlot slot(dbidx);
   if (!slot || tree_write(KeyText(key::kTargetIp, slot.target()), request.ip) != kOk ||
       tree_write(KeyText(key::kTargetPort, slot.target()), NumberText("%d", request.port)) != kOk) {
-    LOG_AT(caller, 0, "ktreec_set() failed");
+    LOG(0, "ktreec_set() failed");
     return kTreeFailed;
   }
   return kOk;
 }
 
-int modify_address(const TargetEntry& request, Caller caller) {
-  if (!check_request(request, caller)) return kFailed;
+int modify_address(const TargetEntry& request) {
+  if (!check_request(request)) return kFailed;
   const int dbidx = ktree_get_dbidx_by_targetname(request.target_name);
   if (dbidx <= 0) {
     print_open(0, "Target %s is not existed in config", request.target_name);
@@ -58,11 +58,11 @@ int modify_address(const TargetEntry& request, Caller caller) {
       print_open(kNote, "Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
       return kOk;
     case 1:
-      return store_portal(request, dbidx, caller);
+      return store_portal(request, dbidx);
     case 2:
       return refuse_connected(request);
     default:
-      LOG_AT(caller, 0, "Portal_search_target() failed");
+      LOG(0, "Portal_search_target() failed");
       return 1;
   }
 }
@@ -70,8 +70,9 @@ int modify_address(const TargetEntry& request, Caller caller) {
 }  // namespace
 
 int task_modify_target_address() {
+  const LogScope scope;
   LOG(1, "task_modify_target_ip start");
-  const int result = modify_address(request_target, Caller());
+  const int result = modify_address(request_target);
   LOG(1, "task_modify_target_ip end, ret = %d", result);
   return result;
 }

@@ -35,13 +35,13 @@ bool find_tree_daemon(const char* pid_file, pid_t* pid) {
 // group of the script that runs the tool, it would take that script and its other children along, this
 // tool's tree daemon among them. The tool itself may be a session leader, which cannot change its group, so a
 // child does.
-int start_daemon(const char* command, Caller caller) {
+int start_daemon(const char* command) {
   fflush(stdout);
   const pid_t child = fork();
-  if (child < 0) return run_command(command, caller);
+  if (child < 0) return run_command(command);
   if (child == 0) {
     setpgid(0, 0);
-    _exit(run_command(command, caller) == 0 ? EXIT_SUCCESS : EXIT_FAILURE);
+    _exit(run_command(command) == 0 ? EXIT_SUCCESS : EXIT_FAILURE);
   }
   int status = 0;
   while (waitpid(child, &status, 0) < 0) {
@@ -50,8 +50,8 @@ int start_daemon(const char* command, Caller caller) {
   return status;
 }
 
-void start_tree_daemon(const char* socket, Caller caller) {
-  start_daemon(CommandText("ktree -n config -s %s 1>/dev/null 2>/dev/null &", socket), caller);
+void start_tree_daemon(const char* socket) {
+  start_daemon(CommandText("ktree -n config -s %s 1>/dev/null 2>/dev/null &", socket));
   sleep(1);
 }
 

@@ -32,71 +32,71 @@ PathText discovery_path() {
 }
 
 // Asks the portal for its targets. Returns whether the command succeeded.
-bool discover(const char* address, int port, const char* iface, const char* path, Caller caller) {
-  return run_command(discovery_command(address, port, iface, path), caller) == 0;
+bool discover(const char* address, int port, const char* iface, const char* path) {
+  return run_command(discovery_command(address, port, iface, path)) == 0;
 }
 
 // Reads the names that lines of the requested address show, in ascending order. The same name stays as often
 // as it is offered. Returns false when memory is too short for them.
-bool read_names(FILE* file, DiscoveredNames* names, Caller caller) {
+bool read_names(FILE* file, DiscoveredNames* names) {
   DiscoveredName last = {};
   char line[kListingLineSize];
   for (int lines = 0; fgets(line, sizeof line, file) != nullptr;) {
     if (!is_discovery_line_of(line, request_target.ip)) continue;
     lines++;
     if (read_discovered_name(line, last.text) && !names->add(last)) {
-      LOG_AT(caller, 0, "out of memory for the names that %s offers", request_target.ip);
+      LOG(0, "out of memory for the names that %s offers", request_target.ip);
       return false;
     }
-    LOG_AT(caller, 3, "line %d: %s", lines, last.text);
+    LOG(3, "line %d: %s", lines, last.text);
   }
   names->sort();
-  LOG_AT(caller, kNote, "vector size: %ld", static_cast<long>(names->size()));
+  LOG(kNote, "vector size: %ld", static_cast<long>(names->size()));
   return true;
 }
 
 // Replaces the stored names. A failed write leaves its place empty.
-void publish_names(const char* socket, const DiscoveredNames& names, Caller caller) {
+void publish_names(const char* socket, const DiscoveredNames& names) {
   if (ktreec_del(socket, 0, key::kSearch) != 0) {
-    LOG_AT(caller, 0, "ktreec_del() failed, path: '%s'", key::kSearch);
+    LOG(0, "ktreec_del() failed, path: '%s'", key::kSearch);
   }
   int i = 0;
   for (const DiscoveredName& name : names) {
-    LOG_AT(caller, 3, "vector(%d): %s", i, name.text);
+    LOG(3, "vector(%d): %s", i, name.text);
     i++;
     if (tree_write_to(socket, KeyText(key::kSearchName, i), name.text) != kOk) {
-      LOG_AT(caller, 0, "ktreec_set() failed");
+      LOG(0, "ktreec_set() failed");
     }
   }
 }
 
 // The search itself. Returns the result of task_search.
-int search_portal(const char* socket, Caller caller) {
+int search_portal(const char* socket) {
   const TargetEntry& request = request_target;
   const TempFile path(discovery_path());
-  LOG_AT(caller, kNote, "ip: %s, port: %d", request.ip, request.port);
-  int result = discover(request.ip, request.port, request.iface, path, caller) ? 0 : 1;
+  LOG(kNote, "ip: %s, port: %d", request.ip, request.port);
+  int result = discover(request.ip, request.port, request.iface, path) ? 0 : 1;
   File file(fopen(path, "re"));
   if (file == nullptr) return 2;
   DiscoveredNames names;
-  if (!read_names(file.get(), &names, caller)) return 1;
-  publish_names(socket, names, caller);
+  if (!read_names(file.get(), &names)) return 1;
+  publish_names(socket, names);
   file.reset();
   if (tree_write_to(socket, key::kSearchDone, "1") != kOk) {
-    LOG_AT(caller, 0, "ktreec_set() failed");
+    LOG(0, "ktreec_set() failed");
     result = 1;
   }
   return result;
 }
 
 // Returns whether the arguments name a target and a portal; logs what is wrong.
-bool check_arguments(const char* name, const char* address, int port, Caller caller) {
+bool check_arguments(const char* name, const char* address, int port) {
   if (name == nullptr || address == nullptr) {
-    LOG_AT(caller, 0, "target name or ip is not given");
+    LOG(0, "target name or ip is not given");
   } else if (name[0] == '\0' || address[0] == '\0') {
-    LOG_AT(caller, 0, "target_name or ip is not valid");
+    LOG(0, "target_name or ip is not valid");
   } else if (port < 1 || port > 65535) {
-    LOG_AT(caller, 0, "Port is not valid");
+    LOG(0, "Port is not valid");
   } else {
     return true;
   }
@@ -104,17 +104,17 @@ bool check_arguments(const char* name, const char* address, int port, Caller cal
 }
 
 // Names the requested target and portal, not the arguments of the question.
-int not_offered(Caller caller) {
+int not_offered() {
   const TargetEntry& request = request_target;
-  LOG_AT(caller, 2, "Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
+  LOG(2, "Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
   return 0;
 }
 
-bool find_offer(FILE* file, const char* name, const char* address, int port, Caller caller) {
+bool find_offer(FILE* file, const char* name, const char* address, int port) {
   char line[kListingLineSize];
   while (fgets(line, sizeof line, file) != nullptr) {
     if (!discovery_line_offers(line, name, address, port)) continue;
-    LOG_AT(caller, 2, "get target at %s", line);
+    LOG(2, "get target at %s", line);
     return true;
   }
   return false;
@@ -123,13 +123,14 @@ bool find_offer(FILE* file, const char* name, const char* address, int port, Cal
 }  // namespace
 
 int task_search() {
+  const LogScope scope;
   LOG(2, "start");
   // Without an interface no private daemon is started, and what is dumped at the end is the default tree.
   const char* socket = nullptr;
   int result = 1;
   if (get_iface_name(&request_target) == 0) {
     socket = open_results(kTargetResults);
-    result = search_portal(socket, Caller());
+    result = search_portal(socket);
   }
   LOG(2, "end, ret = %d", result);
   close_results(kTargetResults, socket);
@@ -137,7 +138,8 @@ int task_search() {
 }
 
 int Portal_search_target(const char* name, const char* address, int port) {
-  if (!check_arguments(name, address, port, Caller())) return kFailed;
+  const LogScope scope;
+  if (!check_arguments(name, address, port)) return kFailed;
   if (check_target_connected(name) != 0) {
     LOG(1, "%s is connecting.", name);
     return 2;
@@ -146,16 +148,16 @@ int Portal_search_target(const char* name, const char* address, int port) {
   if (_get_iface_name(iface, sizeof iface, address) != 0) return kFailed;
   LOG(2, "ip: %s, port: %d", address, port);
   const TempFile path(discovery_path());
-  if (!discover(address, port, iface, path, Caller())) return not_offered(Caller());
+  if (!discover(address, port, iface, path)) return not_offered();
   File file(fopen(path, "re"));
   if (file == nullptr) {
     LOG(1, "discovery target failed at IP: %s Port: %d", address, port);
     return 0;
   }
-  const bool offered = find_offer(file.get(), name, address, port, Caller());
+  const bool offered = find_offer(file.get(), name, address, port);
   file.reset();
   _remove_file(path);
-  return offered ? 1 : not_offered(Caller());
+  return offered ? 1 : not_offered();
 }
 
 }  // namespace remvol

@@ -39,29 +39,31 @@ constexpr IfaceRecord kIfaceRecords[] = {
 // Makes or updates one record. Whether it existed before does not matter: the update decides. `mac` is not
 // used.
 int _set_iface_config(const char* iface, const char* /*mac*/, const char* netif) {
+  const LogScope scope;
   if (iface == nullptr || iface[0] == '\0' || netif == nullptr || netif[0] == '\0') return kFailed;
-  run_command(new_iface_command(iface), Caller(), kNote);
+  run_command(new_iface_command(iface), kNote);
   return run_command(bind_iface_command(iface, netif)) == 0 ? kOk : kFailed;
 }
 
-bool answers_from(const char* address, const char* netif, Caller caller) {
-  LOG_AT(caller, 2, "ping_ip %s from %s", address, netif);
+bool answers_from(const char* address, const char* netif) {
+  LOG(2, "ping_ip %s from %s", address, netif);
   if (ping_ip(address, netif) != 1) return false;
-  LOG_AT(caller, 1, "ping_ip %s from %s successed", address, netif);
+  LOG(1, "ping_ip %s from %s successed", address, netif);
   return true;
 }
 
 // A link-local address says nothing about the network that it is in: the port from which it answers does.
-const char* iface_of_link_local(const char* address, Caller caller) {
+const char* iface_of_link_local(const char* address) {
   if (_ktree_get_bonding_mode_enable() == 1) return kIfaceBond;
-  if (is_lan0_linked() == 1 && answers_from(address, kLan0, caller)) return kIface0;
-  if (is_lan1_linked() == 1 && answers_from(address, kLan1, caller)) return kIface1;
+  if (is_lan0_linked() == 1 && answers_from(address, kLan0)) return kIface0;
+  if (is_lan1_linked() == 1 && answers_from(address, kLan1)) return kIface1;
   return kIface0;
 }
 
 }  // namespace
 
 int Iface_Config_Gen() {
+  const LogScope scope;
   for (const IfaceRecord& record : kIfaceRecords) {
     char mac[32] = "";
     if (record.read_mac(mac) != 0) continue;
@@ -72,6 +74,7 @@ int Iface_Config_Gen() {
 }
 
 int get_iface_name(TargetEntry* entry) {
+  const LogScope scope;
   if (entry == nullptr || entry->ip[0] == '\0') return kFailed;
   int result = kOk;
   if (entry->iface[0] == '\0') {
@@ -85,18 +88,20 @@ int get_iface_name(TargetEntry* entry) {
 }
 
 int _get_iface_name(char* out, size_t size, const char* address) {
+  const LogScope scope;
   if (out == nullptr || address == nullptr || size == 0) return kFailed;
   const char* iface = kDefaultIface;
   if (address[0] != '\0') {
     memset(out, 0, size);
     const bool link_local = is_ipv6_text(address) != 0 && is_ipv6_link_local(address) == 1;
-    if (link_local) iface = iface_of_link_local(address, Caller());
+    if (link_local) iface = iface_of_link_local(address);
   }
   snprintf(out, size, "%s", iface);
   return kOk;
 }
 
 int _ktree_get_bonding_mode_enable() {
+  const LogScope scope;
   char value[128];
   if (tree_read(key::kBondingEnable, value)) return atoi(value) != 0 ? 1 : 0;
   LOG(kNote, "get bonding mode status failed");

@@ -95,82 +95,82 @@ bool write_iscsid_conf(const char* settings) {
   return fclose(file.release()) == 0 && written;
 }
 
-void write_daemon_configuration(Caller caller) {
-  run_command(CommandText("echo -e \"%s\" > %s", iscsid_settings("\\n").c_str(), kIscsidConf), caller);
+void write_daemon_configuration() {
+  run_command(CommandText("echo -e \"%s\" > %s", iscsid_settings("\\n").c_str(), kIscsidConf));
   // The echo of dash knows no -e: it writes it into the file.
   const ConfText settings = iscsid_settings("\n");
   if (iscsid_conf_holds(settings) || write_iscsid_conf(settings)) return;
-  LOG_AT(caller, 0, "write %s failed", kIscsidConf);
+  LOG(0, "write %s failed", kIscsidConf);
 }
 
 // Returns the exit status of the command that loads `file` into the tree, which moves all slots at once: a
 // run that has found them empty a moment ago must not take them for garbage.
-int load_tree(const char* file, Caller caller) {
+int load_tree(const char* file) {
   const SlotsHeld held(SlotsHeld::kChange);
   slots_move();
-  return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", main_socket, file), caller));
+  return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", main_socket, file)));
 }
 
 // A daemon that a busy machine has not started in its second is waited for: without its settings the tree
 // would count as fresh, and be dumped over them.
-int load_saved_settings(Caller caller) {
-  int ended = load_tree(kSettingsFile, caller);
+int load_saved_settings() {
+  int ended = load_tree(kSettingsFile);
   for (int i = 0; i < kLoadTries && ended == kTreeUnreachable && access(kSettingsFile, F_OK) == 0; i++) {
     sleep(1);
-    ended = load_tree(kSettingsFile, caller);
+    ended = load_tree(kSettingsFile);
   }
   return ended;
 }
 
 // Settings that are missing or damaged are replaced by their copy on the configuration flash.
-void load_settings(Caller caller) {
-  if (load_saved_settings(caller) != kSettingsRefused) return;
-  keep_damaged_settings(caller);
-  if (access(kFlashCopy, F_OK) != 0 || load_tree(kFlashCopy, caller) != 0) return;
-  LOG_AT(caller, 0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
+void load_settings() {
+  if (load_saved_settings() != kSettingsRefused) return;
+  keep_damaged_settings();
+  if (access(kFlashCopy, F_OK) != 0 || load_tree(kFlashCopy) != 0) return;
+  LOG(0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
 }
 
 // A killed daemon leaves its pid file behind. The result key was set a moment ago.
-void start_settings_daemon(Caller caller) {
+void start_settings_daemon() {
   if (check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult))) return;
-  start_tree_daemon(main_socket, caller);
-  load_settings(caller);
+  start_tree_daemon(main_socket);
+  load_settings();
 }
 
 // A module that is not loaded is no failure here.
-void reload_modules(Caller caller) {
+void reload_modules() {
   for (const char* module : kModules) System("rmmod %s 1>/dev/null 2>/dev/null", module);
   for (int i = kModuleCount - 1; i >= 0; i--) {
-    run_command(CommandText("insmod %s/%s", kModuleFolder, kModules[i]), caller);
+    run_command(CommandText("insmod %s/%s", kModuleFolder, kModules[i]));
   }
 }
 
-InitiatorName write_initiator_name(Caller caller) {
-  const InitiatorName name = make_initiator_name(caller);
-  run_command(shell_command("echo 'InitiatorName=%s' > %s", name.c_str(), kNameFile), caller);
+InitiatorName write_initiator_name() {
+  const InitiatorName name = make_initiator_name();
+  run_command(shell_command("echo 'InitiatorName=%s' > %s", name.c_str(), kNameFile));
   return name;
 }
 
 // Returns whether the last module was unloaded.
-bool unload_modules(Caller caller) {
+bool unload_modules() {
   bool unloaded = false;
-  for (const char* module : kModules) unloaded = run_command(CommandText("rmmod %s", module), caller) == 0;
+  for (const char* module : kModules) unloaded = run_command(CommandText("rmmod %s", module)) == 0;
   return unloaded;
 }
 
 }  // namespace
 
 int task_init() {
-  const Caller caller;
+  const LogScope scope;
   LOG(2, "start");
-  start_settings_daemon(caller);
+  start_settings_daemon();
   if (is_remvol_ver_changed() != 0) version_upgrade();
   set_remvol_ver_to_db(kSettingsVersion);
-  run_command("killall -q -SIGTERM iscsid", Caller(), kNote);
-  reload_modules(caller);
+  run_command("killall -q -SIGTERM iscsid", kNote);
+  reload_modules();
   run_command("mkdir -p /etc/iscsi");
-  write_daemon_configuration(caller);
-  const InitiatorName name = write_initiator_name(caller);
+  write_daemon_configuration();
+  const InitiatorName name = write_initiator_name();
   drop_empty_records();
   start_daemon("iscsid -f >/dev/null 2>&1 &");
   Iface_Config_Gen();
@@ -181,6 +181,7 @@ int task_init() {
 }
 
 int task_deinit(int system_off) {
+  const LogScope scope;
   LOG(2, system_off != 0 ? "system off" : "deinit start");
   Target_umount_all();
   close_sessions(nullptr, kLogoutAllCommand);
@@ -191,7 +192,7 @@ int task_deinit(int system_off) {
     LOG(1, "update share folder status");
     reload_share_services();
     LOG(1, "finish share folder status");
-    succeeded = unload_modules(Caller());
+    succeeded = unload_modules();
   }
   stop_tree_daemon(kSettingsPidFile);
   return succeeded ? 0 : 1;

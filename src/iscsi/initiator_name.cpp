@@ -34,21 +34,22 @@ bool read_octets(const char* octets, Text<16>* name) {
 
 }  // namespace
 
-InitiatorName make_initiator_name(Caller caller) {
+InitiatorName make_initiator_name() {
   char prefix[256];
-  LOG_AT(caller, 1, "strNode: %s", key::kInitiatorPrefix);
+  LOG(1, "strNode: %s", key::kInitiatorPrefix);
   if (!tree_read(key::kInitiatorPrefix, prefix)) copy_text(prefix, kDefaultPrefix);
   char host[256] = "";
   const bool has_host = sys_hostname(host, sizeof host) == 0;
   if (has_host) str_to_lower(host);
   char unique_name[16] = "";
   const bool is_unique = get_mac_as_unique_name(unique_name) == 0;
-  if (!is_unique) LOG_AT(caller, 1, "get_mac_as_unique_name failed");
+  if (!is_unique) LOG(1, "get_mac_as_unique_name failed");
   return InitiatorName("%s%s%sinitiator%s%s", prefix, has_host ? host : "", has_host ? ":" : "",
                        is_unique ? "-" : "", is_unique ? unique_name : "");
 }
 
 int get_mac_as_unique_name(char* out) {
+  const LogScope scope;
   char mac[32] = "";
   if (get_lan0_mac_text(mac) != 0) {
     LOG(kNote, "ERROR : get lan1 mac from ktree failed");

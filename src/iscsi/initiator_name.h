@@ -11,7 +11,7 @@ namespace remvol {
 using InitiatorName = Text<256>;
 
 // Builds the name. The prefix comes from the tree; what cannot be read is left out.
-InitiatorName make_initiator_name(Caller caller = Caller());
+InitiatorName make_initiator_name();
 
 // Puts the last three octets of the first LAN port's hardware address into `out`, which holds at least 7
 // bytes, as 6 characters: 00:90:A9:1B:2C:3D gives 1b2c3d. Returns 0 (with `out` unchanged when the address

@@ -26,6 +26,7 @@ bool breaks_line(const char* value) {
 }
 
 CommandText refused(const char* reason) {
+  const LogScope scope;
   LOG(0, "cmd of iscsiadm is refused, %s", reason);
   return CommandText("%s", kRefusedCommand);
 }

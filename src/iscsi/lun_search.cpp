@@ -35,26 +35,26 @@ bool log_in() {
 
 // Makes sure of a session, given whether the target is connected; `logged_in` tells whether it was opened
 // here. Returns 0 or -1.
-int open_session(const char* socket, int connected, bool* logged_in, Caller caller) {
+int open_session(const char* socket, int connected, bool* logged_in) {
   if (connected == 1) return kOk;
   if (connected != 0) {
-    LOG_AT(caller, 0, "check_target_connected failed");
+    LOG(0, "check_target_connected failed");
     return kFailed;
   }
   *logged_in = log_in();
   if (*logged_in) return kOk;
-  LOG_AT(caller, 0, "Target_Connect %s failed", request_target.target_name);
+  LOG(0, "Target_Connect %s failed", request_target.target_name);
   ktree_update_search_lun_err_code(socket, kSearchLoginFailed);
   return kFailed;
 }
 
 // Lists the LUNs of the session and publishes them. A list that is empty although a LUN was ready, since all
 // are too small, is neither printed nor stored.
-int publish_luns(const char* socket, Caller caller) {
+int publish_luns(const char* socket) {
   const char* name = request_target.target_name;
   const int ready = _wait_sess_lun_ready(name, kWaitSeconds);
   if (ready == 1) {
-    LOG_AT(caller, 1, "Can not find any available LUN on target %s", name);
+    LOG(1, "Can not find any available LUN on target %s", name);
     print_lun_list(nullptr, name);
     ktree_update_search_lun_result(socket, nullptr, name);
     ktree_update_search_lun_err_code(socket, kSearchDone);
@@ -62,7 +62,7 @@ int publish_luns(const char* socket, Caller caller) {
   }
   LunNode* luns = nullptr;
   if (ready != 0 || _get_sess_lun_list(&luns, name) != 0) {
-    LOG_AT(caller, 0, "get session lun list failed");
+    LOG(0, "get session lun list failed");
     return kFailed;
   }
   if (luns != nullptr) {
@@ -76,7 +76,7 @@ int publish_luns(const char* socket, Caller caller) {
 
 // The search itself. While it is logged in for its own sake no other run brings the target up: the session
 // would be closed under that run's volumes.
-int search_luns(const char* socket, Caller caller) {
+int search_luns(const char* socket) {
   const char* name = request_target.target_name;
   std::optional<BriefTargetHold> hold;
   int connected = check_target_connected(name);
@@ -84,8 +84,8 @@ int search_luns(const char* socket, Caller caller) {
     connected = check_target_connected(name);
   }
   bool logged_in = false;
-  int result = open_session(socket, connected, &logged_in, caller);
-  if (result == kOk) result = publish_luns(socket, caller);
+  int result = open_session(socket, connected, &logged_in);
+  if (result == kOk) result = publish_luns(socket);
   if (logged_in) _target_disconnect(&request_target);
   return result;
 }
@@ -93,10 +93,11 @@ int search_luns(const char* socket, Caller caller) {
 }  // namespace
 
 int task_search_lun() {
+  const LogScope scope;
   LOG(2, "start");
   if (request_target.target_name[0] == '\0') return kFailed;
   const char* socket = open_results(kLunResults);
-  const int result = search_luns(socket, Caller());
+  const int result = search_luns(socket);
   close_results(kLunResults, socket);
   LOG(2, "end, ret = %d", result);
   return result;

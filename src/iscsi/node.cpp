@@ -45,6 +45,7 @@ constexpr char kAlreadyExists[] = "initiator reported error (15 - already exists
 
 // Returns the result of the last setting alone, as 0 or -1.
 int _target_chap_gen(const TargetEntry* entry) {
+  const LogScope scope;
   if (entry == nullptr || entry->iface[0] == '\0') return kFailed;
   if (entry->chap != 1) return run_command(no_auth_command(*entry)) == 0 ? kOk : kFailed;
   run_command(chap_method_command(*entry));
@@ -58,8 +59,14 @@ int _target_chap_apply(TargetEntry* entry) {
   return kOk;
 }
 
-int log_out(const TargetEntry* entry, Caller caller) {
-  return close_sessions(entry->target_name, logout_command(*entry), caller);
+int delete_record(TargetEntry* entry) {
+  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
+  run_command(delete_node_command(*entry));
+  return kOk;
+}
+
+int log_out(const TargetEntry* entry) {
+  return close_sessions(entry->target_name, logout_command(*entry));
 }
 
 // Reads the output of a login until it says that a session to this node is already open.
@@ -78,25 +85,26 @@ bool log_in(const char* command, FILE** output) {
   return *output != nullptr && login_found_session(*output);
 }
 
-void close_own_session(const TargetEntry& entry, Caller caller) {
+void close_own_session(const TargetEntry& entry) {
   const SessionClosing closing(entry.target_name);
-  run_command(portal_logout_command(entry), caller);
+  run_command(portal_logout_command(entry));
 }
 
-void log_in_again(const TargetEntry& entry, Caller caller = Caller()) {
-  close_own_session(entry, caller);
+void log_in_again(const TargetEntry& entry) {
+  close_own_session(entry);
   const LoginUnderWay under_way;
-  run_command(login_again_command(entry), caller);
+  run_command(login_again_command(entry));
 }
 
 // Names the requested target, not `name`: at start-up there is none. Returns whether the session is there.
-bool confirm_login(const char* name, Caller caller) {
+bool confirm_login(const char* name) {
   if (check_target_connected(name) == 1) return true;
-  LOG_AT(caller, 0, "Can not find target %s in session\n, connect failed.", request_target.target_name);
+  LOG(0, "Can not find target %s in session\n, connect failed.", request_target.target_name);
   return false;
 }
 
 int _target_connect_run(const TargetEntry& entry) {
+  const LogScope scope;
   if (entry.port < kMinPort || entry.port > kMaxPort) return kFailed;
   const CommandText login = login_command(entry);
   LOG(1, "try to login - cmd: %s \n", login.c_str());
@@ -104,7 +112,7 @@ int _target_connect_run(const TargetEntry& entry) {
   if (log_in(login, &output)) log_in_again(entry);
   if (output == nullptr) return 1;
   pclose(output);
-  return confirm_login(entry.target_name, Caller()) ? 0 : 1;
+  return confirm_login(entry.target_name) ? 0 : 1;
 }
 
 // Returns whether one of the target's volumes is mounted: the appliance is running, and the session was there
@@ -131,7 +139,7 @@ int update_dev_at_start(TargetEntry* entry) {
 }
 
 // Logs in to one stored target and mounts its volumes. Returns whether it came to the mounting.
-bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
+bool load_connected_target(TargetEntry* entry, int* result) {
   *result = Target_Connect(entry);
   if (*result != 0) {
     ktree_set_connect_state(entry->db_idx, kConnectError);
@@ -139,8 +147,8 @@ bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
   }
   *result = update_dev_at_start(entry);
   if (*result != 0) {
-    if (*result == kTreeFailed) LOG_AT(caller, 0, "ktree failed");
-    give_up_session(entry, *result, kVolumeLost, caller);
+    if (*result == kTreeFailed) LOG(0, "ktree failed");
+    give_up_session(entry, *result, kVolumeLost);
     *result = -1;
     return false;
   }
@@ -150,7 +158,7 @@ bool load_connected_target(TargetEntry* entry, int* result, Caller caller) {
 }
 
 // Brings up what is stored of the target at slot `n`. Returns whether it came to the mounting.
-bool load_target(int n, int* result, Caller caller) {
+bool load_target(int n, int* result) {
   TargetEntry entry;
   bool mounted = false;
   // By slot, not by name: the search for a name would stop at an empty slot before this one.
@@ -158,7 +166,7 @@ bool load_target(int n, int* result, Caller caller) {
     const TargetHold hold(entry.target_name);
     if (hold.waited() && ktree_get_entry_by_dbidx(n, &entry) != kOk) return false;
     Target_Config_Gen(&entry);
-    mounted = entry.conn_set != 0 && load_connected_target(&entry, result, caller);
+    mounted = entry.conn_set != 0 && load_connected_target(&entry, result);
   }
   ktree_update_status(&entry);
   return mounted;
@@ -167,15 +175,15 @@ bool load_target(int n, int* result, Caller caller) {
 }  // namespace
 
 int Target_Config_Gen(TargetEntry* entry) {
-  if (_target_record_delete(entry) != kOk) return kFailed;
+  const LogScope scope;
+  if (delete_record(entry) != kOk) return kFailed;
   run_command(new_node_command(*entry));
   return _target_chap_apply(entry);
 }
 
 int _target_record_delete(TargetEntry* entry) {
-  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
-  run_command(delete_node_command(*entry));
-  return kOk;
+  const LogScope scope;
+  return delete_record(entry);
 }
 
 int _target_login(TargetEntry* entry) {
@@ -184,44 +192,48 @@ int _target_login(TargetEntry* entry) {
 }
 
 int Target_Connect(TargetEntry* entry) {
+  const LogScope scope;
   ktree_set_connect_state(entry->db_idx, kConnecting);
   if (_target_login(entry) != 0) return kFailed;
-  return confirm_login(entry->target_name, Caller()) ? kOk : kFailed;
+  return confirm_login(entry->target_name) ? kOk : kFailed;
 }
 
 int Target_Logout(TargetEntry* entry) {
-  const int result = log_out(entry, Caller());
+  const LogScope scope;
+  const int result = log_out(entry);
   entry->conn_set = 0;
   ktree_set_connect_state(entry->db_idx, kDisconnected);
   return result;
 }
 
-void give_up_session(TargetEntry* entry, int reason, VolumeState state, Caller caller) {
+void give_up_session(TargetEntry* entry, int reason, VolumeState state) {
   if (reason == kTargetNotListed) {
-    LOG_AT(caller, 1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
+    LOG(1, "Can not find Target: %s on iscsiadm -m session", entry->target_name);
   } else if (reason == kNoRunningDisk) {
-    LOG_AT(caller, 1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
+    LOG(1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
   }
   // A listing that failed, or a disk that does not run just now, is no reason to pull it from under a volume.
   if (has_session_volume(entry->target_name)) {
-    LOG_AT(caller, 0, "the session of target %s stays, a volume is mounted from it", entry->target_name);
+    LOG(0, "the session of target %s stays, a volume is mounted from it", entry->target_name);
     return;
   }
   // Written after a logout that worked; readers of the log know it so.
-  if (Target_Logout(entry) == kOk) LOG_AT(caller, 1, "Logout Fail on Target: %s ", entry->target_name);
+  if (Target_Logout(entry) == kOk) LOG(1, "Logout Fail on Target: %s ", entry->target_name);
   ktree_record_connect_set(entry);
   ktree_update_all_volume_state(entry, state);
 }
 
 int _target_disconnect(const TargetEntry* entry) {
+  const LogScope scope;
   if (entry->target_name[0] == '\0') {
     LOG(0, "parameter error");
     return kFailed;
   }
-  return log_out(entry, Caller());
+  return log_out(entry);
 }
 
 int Target_Disconnect(TargetEntry* entry) {
+  const LogScope scope;
   LOG(2, "start");
   if (entry->db_idx < 1) entry->db_idx = ktree_get_dbidx_by_targetname(entry->target_name);
   if (entry->db_idx < 1) {
@@ -233,7 +245,7 @@ int Target_Disconnect(TargetEntry* entry) {
   reload_share_services();
   LOG(1, "finish share folder status");
   LOG(2, "logout start");
-  const int result = log_out(entry, Caller());
+  const int result = log_out(entry);
   LOG(2, "logout end ");
   ktree_set_connect_state(entry->db_idx, kDisconnected);
   entry->conn_set = 0;
@@ -244,12 +256,13 @@ int Target_Disconnect(TargetEntry* entry) {
 }
 
 int Target_load_all() {
+  const LogScope scope;
   LOG(2, "start");
   int mounted = 0;
   int result = 0;
   remember_all_targets();
   for (int n = 1; n <= kMaxTargets; n++) {
-    if (is_target_stored(n) && load_target(n, &result, Caller())) mounted++;
+    if (is_target_stored(n) && load_target(n, &result)) mounted++;
   }
   if (mounted > 0) reload_share_services();
   ktree_update_current_targetcnt();

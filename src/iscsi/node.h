@@ -30,7 +30,7 @@ int Target_Logout(TargetEntry* entry);
 // Gives up a login whose session shows no disk that could be mounted: logs out, stores that the target stays
 // disconnected and `state` for all its LUNs. `reason` is the result of ktree_update_dev; it and the outcome
 // are logged in the caller's name.
-void give_up_session(TargetEntry* entry, int reason, VolumeState state, Caller caller);
+void give_up_session(TargetEntry* entry, int reason, VolumeState state);
 
 // Logs out and changes nothing else. Returns 0, 1 when the command failed, -1 for an empty target name.
 int _target_disconnect(const TargetEntry* entry);

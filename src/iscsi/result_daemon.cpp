@@ -11,29 +11,29 @@ namespace remvol {
 
 namespace {
 
-void stop(const ResultDaemon& daemon, Caller caller) {
+void stop(const ResultDaemon& daemon) {
   if (stop_tree_daemon(daemon.pid_file)) return;
-  LOG_AT(caller, 0, "system() of cmd 'kill -SIGTERM `cat %s`' failed", daemon.pid_file);
+  LOG(0, "system() of cmd 'kill -SIGTERM `cat %s`' failed", daemon.pid_file);
 }
 
 }  // namespace
 
-const char* open_results(const ResultDaemon& daemon, Caller caller) {
+const char* open_results(const ResultDaemon& daemon) {
   if (output_file == nullptr) return nullptr;
   if (check_path_exist(daemon.socket) == 0) {
-    stop(daemon, caller);
+    stop(daemon);
     sleep(1);
     _remove_file(daemon.socket);
     _remove_file(daemon.pid_file);
   }
-  start_tree_daemon(daemon.socket, caller);
+  start_tree_daemon(daemon.socket);
   return daemon.socket;
 }
 
-void close_results(const ResultDaemon& daemon, const char* socket, Caller caller) {
+void close_results(const ResultDaemon& daemon, const char* socket) {
   if (output_file == nullptr) return;
   ktreec_dump(socket, 0, output_file);
-  stop(daemon, caller);
+  stop(daemon);
 }
 
 }  // namespace remvol

@@ -42,12 +42,11 @@ struct DeviceUpdate {
 };
 
 // Reads on to the next usable LUN of the target called `name`. Returns false when there is no further one.
-bool next_usable_lun(FILE* file, DetailedListing* listing, char (&line)[kListingLineSize], const char* name,
-                     Caller caller) {
+bool next_usable_lun(FILE* file, DetailedListing* listing, char (&line)[kListingLineSize], const char* name) {
   while (fgets(line, sizeof line, file) != nullptr) {
     const ListingLine what = read_listing_line(listing, line, name);
-    if (what == ListingLine::kHost) LOG_AT(caller, 2, "get host num = %u", listing->host);
-    if (what == ListingLine::kLun) LOG_AT(caller, 2, "get lun = %u", listing->lun);
+    if (what == ListingLine::kHost) LOG(2, "get host num = %u", listing->host);
+    if (what == ListingLine::kLun) LOG(2, "get lun = %u", listing->lun);
     if (what == ListingLine::kDisk) return true;
     if (what == ListingLine::kEnd) return false;
   }
@@ -58,8 +57,8 @@ Text<64> device_name(const DetailedListing& listing) {
   return Text<64>("%.*s", static_cast<int>(listing.device_length), listing.disk);
 }
 
-void log_disk(const DetailedListing& listing, Caller caller) {
-  LOG_AT(caller, 2, "ptr: '%s', len: %d", listing.disk, static_cast<int>(listing.device_length) + 1);
+void log_disk(const DetailedListing& listing) {
+  LOG(2, "ptr: '%s', len: %d", listing.disk, static_cast<int>(listing.device_length) + 1);
 }
 
 // Draws a name that no file has, so that concurrent runs keep apart. After kMaxDraws the last one is taken:
@@ -76,36 +75,36 @@ PathText draw_temp_path(const char* user) {
 
 // Lists the sessions in detail into the drawn file `path`, which a listing without result does not leave
 // behind.
-int list_in_detail(const char* path, Caller caller) {
+int list_in_detail(const char* path) {
   const CommandText command = session_luns_command(path);
-  LOG_AT(caller, 2, "run cmd: %s", command.c_str());
-  const int listed = list_sessions(command, caller);
+  LOG(2, "run cmd: %s", command.c_str());
+  const int listed = list_sessions(command);
   if (listed != 0) _remove_file(path);
   return listed;
 }
 
 // Returns 0, or -1 after logging what is wrong with the name.
-int check_name(const char* name, Caller caller) {
+int check_name(const char* name) {
   if (name == nullptr) {
-    LOG_AT(caller, 0, "parameter error");
+    LOG(0, "parameter error");
     return kFailed;
   }
   if (name[0] == '\0') {
-    LOG_AT(caller, 0, "target name error");
+    LOG(0, "target name error");
     return kFailed;
   }
   return kOk;
 }
 
 // Stores the device name of one usable LUN, when the tree holds the LUN.
-void store_device(TargetEntry* entry, const DetailedListing& listing, DeviceUpdate* update, Caller caller) {
+void store_device(TargetEntry* entry, const DetailedListing& listing, DeviceUpdate* update) {
   const int lun_dbidx = ktree_get_dbidx_by_lun(entry->db_idx, listing.lun);
   if (lun_dbidx < 1) return;
-  log_disk(listing, caller);
+  log_disk(listing);
   copy_text(entry->dev, device_name(listing));
   const HeldSlot slot(entry->db_idx, lun_dbidx);
   if (!slot || tree_write(KeyText(key::kLunDev, slot.target(), slot.lun()), entry->dev) != kOk) {
-    LOG_AT(caller, 0, "ktreec_set() failed");
+    LOG(0, "ktreec_set() failed");
     update->result = kTreeFailed;
   }
   update->found = true;
@@ -113,11 +112,11 @@ void store_device(TargetEntry* entry, const DetailedListing& listing, DeviceUpda
 
 // Replaces the stored device names of the target by those in the listing at `path`, in one step for other
 // runs: a LUN that is attached never reads as if it had no disk.
-int store_listed_devices(TargetEntry* entry, const char* path, Caller caller) {
+int store_listed_devices(TargetEntry* entry, const char* path) {
   const SlotsHeld held(SlotsHeld::kChange);
   const int cleaned = ktree_clean_target_dev(entry);
   if (cleaned != kOk) {
-    LOG_AT(caller, 0, "ktree_clean_target_dev for %s failed", entry != nullptr ? entry->target_name : "");
+    LOG(0, "ktree_clean_target_dev for %s failed", entry != nullptr ? entry->target_name : "");
     return cleaned;
   }
   copy_text(entry->dev, "");
@@ -127,23 +126,23 @@ int store_listed_devices(TargetEntry* entry, const char* path, Caller caller) {
   DetailedListing listing = kDeviceListing;
   char line[kListingLineSize];
   DeviceUpdate update;
-  while (next_usable_lun(file.get(), &listing, line, entry->target_name, caller)) {
-    store_device(entry, listing, &update, caller);
+  while (next_usable_lun(file.get(), &listing, line, entry->target_name)) {
+    store_device(entry, listing, &update);
   }
   if (update.result == kOk && listing.match == 0) update.result = kTargetNotListed;
   if (update.result == kOk && !update.found) update.result = kNoRunningDisk;
-  LOG_AT(caller, 2, "end");
+  LOG(2, "end");
   return update.result;
 }
 
 // Makes a node for one usable LUN. Returns null when it is too small, or out of memory.
-LunNode* make_lun_node(const DetailedListing& listing, Caller caller) {
+LunNode* make_lun_node(const DetailedListing& listing) {
   const Text<64> device = device_name(listing);
-  log_disk(listing, caller);
-  LOG_AT(caller, 2, "get dev_node = %s", device.c_str());
+  log_disk(listing);
+  LOG(2, "get dev_node = %s", device.c_str());
   _create_device_node(device);
   const long long size = sys_get_disk_space("/dev/%s", device.c_str());
-  LOG_AT(caller, 2, "get size = %lld", size);
+  LOG(2, "get size = %lld", size);
   if (size < kMinLunSize) return nullptr;
   LunNode* node = lun_node_new();
   if (node == nullptr) return nullptr;
@@ -154,20 +153,21 @@ LunNode* make_lun_node(const DetailedListing& listing, Caller caller) {
   return node;
 }
 
-void read_fs_type(LunNode* node, Caller caller) {
+void read_fs_type(LunNode* node) {
   const Text<32> partition("/dev/%s1", node->dev);
   bool known = false;
   if (check_path_exist(partition) == 0) {
-    LOG_AT(caller, 2, "try to get_fs_type from %s", partition.c_str());
+    LOG(2, "try to get_fs_type from %s", partition.c_str());
     known = sys_get_fs_type(node->fs_type, partition) == 0;
   }
   if (!known) copy_text(node->fs_type, "unknown");
-  LOG_AT(caller, 2, "get fstype = %s", node->fs_type);
+  LOG(2, "get fstype = %s", node->fs_type);
 }
 
 }  // namespace
 
 int ktree_clean_target_dev(TargetEntry* entry) {
+  const LogScope scope;
   if (entry == nullptr) return kFailed;
   if (entry->db_idx < 1) {
     if (entry->target_name[0] == '\0') return kFailed;
@@ -187,6 +187,7 @@ int ktree_clean_target_dev(TargetEntry* entry) {
 }
 
 int ktree_update_dev(TargetEntry* entry) {
+  const LogScope scope;
   LOG(2, "start");
   // One run after another lists and stores, so that what is stored is the newest listing. It lasts no longer
   // than the listing.
@@ -196,11 +197,12 @@ int ktree_update_dev(TargetEntry* entry) {
   const int listed = list_sessions(session_devices_command(path));
   // No session at all changes nothing: the stored device names stay.
   if (listed != 0) return listed < 0 ? listed : kOk;
-  return store_listed_devices(entry, path, Caller());
+  return store_listed_devices(entry, path);
 }
 
 int _wait_sess_lun_ready(const char* name, int wait_seconds) {
-  if (check_name(name, Caller()) != kOk) return kFailed;
+  const LogScope scope;
+  if (check_name(name) != kOk) return kFailed;
   const PathText drawn = draw_temp_path("wait");
   DetailedListing listing = kLunListing;
   bool ready = false;
@@ -209,7 +211,7 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
     polls--;
     LOG(1, "wait lun ready iter = %d", polls);
     const TempFile path(drawn);
-    const int listed = list_in_detail(path, Caller());
+    const int listed = list_in_detail(path);
     if (listed != 0) return listed < 0 ? listed : kOk;
     const File file(fopen(path, "re"));
     if (file == nullptr) continue;
@@ -217,17 +219,17 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
     listing.match = kLunListing.match;
     listing.after_lun = false;
     char line[kListingLineSize];
-    ready = next_usable_lun(file.get(), &listing, line, name, Caller());
+    ready = next_usable_lun(file.get(), &listing, line, name);
     _remove_file(path);
   }
   return ready ? 0 : 1;
 }
 
 int _get_sess_lun_list(LunNode** head, const char* name) {
-  const Caller caller;
-  if (check_name(head != nullptr ? name : nullptr, caller) != kOk) return kFailed;
+  const LogScope scope;
+  if (check_name(head != nullptr ? name : nullptr) != kOk) return kFailed;
   const TempFile path(draw_temp_path("get"));
-  const int listed = list_in_detail(path, caller);
+  const int listed = list_in_detail(path);
   if (listed != 0) return listed < 0 ? listed : kOk;
   *head = nullptr;
   const File file(fopen(path, "re"));
@@ -235,10 +237,10 @@ int _get_sess_lun_list(LunNode** head, const char* name) {
 
   DetailedListing listing = kLunListing;
   char line[kListingLineSize];
-  while (next_usable_lun(file.get(), &listing, line, name, caller)) {
-    LunNode* node = make_lun_node(listing, caller);
+  while (next_usable_lun(file.get(), &listing, line, name)) {
+    LunNode* node = make_lun_node(listing);
     if (node == nullptr) continue;
-    read_fs_type(node, caller);
+    read_fs_type(node);
     if (*head == nullptr)
       *head = node;
     else

@@ -13,16 +13,17 @@
 
 namespace remvol {
 
-int list_sessions(const char* command, Caller caller) {
+int list_sessions(const char* command) {
   const int status = system(command);
   if (status == 0) return 0;
   if (command_exit_code(status) == kNoSessionExit) return 1;
-  LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
-  log_command_status(status, caller);
+  LOG(0, "system() of cmd '%s' failed", command);
+  log_command_status(status);
   return kListingFailed;
 }
 
 int check_target_connected(const char* name) {
+  const LogScope scope;
   if (name == nullptr || name[0] == '\0') return kFailed;
   const TempFile path(Text<512>("/tmp/%s_session.tmp", program_name()));
   const int listed = list_sessions(sessions_command(path));

@@ -12,7 +12,7 @@ int check_target_connected(const char* name);
 
 // Runs `command`, which lists the sessions. Returns 0; 1 when there is no session at all; -106 when the
 // command failed, which is logged in the caller's name.
-int list_sessions(const char* command, Caller caller = Caller());
+int list_sessions(const char* command);
 
 }  // namespace remvol
 

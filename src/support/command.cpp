@@ -9,9 +9,9 @@
 
 namespace remvol {
 
-int run_command(const char* command, Caller caller, Weight failure) {
+int run_command(const char* command, Weight failure) {
   const int status = system(command);
-  if (status != 0) LOG_AT(caller, failure, "system() of cmd '%s' failed", command);
+  if (status != 0) LOG(failure, "system() of cmd '%s' failed", command);
   return status;
 }
 
@@ -39,12 +39,13 @@ int command_exit_code(int status) {
   return (status >> 8) & 0xff;
 }
 
-void log_command_status(int status, Caller caller) {
+void log_command_status(int status) {
   const int exited = (status & 0x7f) == 0 ? 1 : 0;
-  LOG_AT(caller, 2, "!!!ret=%d, WIFEXITED=%d, WEXITSTATUS=%d", status, exited, command_exit_code(status));
+  LOG(2, "!!!ret=%d, WIFEXITED=%d, WEXITSTATUS=%d", status, exited, command_exit_code(status));
 }
 
 int process_system_cmd_mt(const char* command, int cycles, int max_wait_us) {
+  const LogScope scope;
   srand(static_cast<unsigned>(time(nullptr)));
   int status = 0;
   for (int cycle = 0; cycle < cycles; cycle++) {
@@ -53,7 +54,7 @@ int process_system_cmd_mt(const char* command, int cycles, int max_wait_us) {
       LOG(kNote, "retry cmd : cycle = %d, time = %d", cycle, wait);
       usleep(static_cast<useconds_t>(wait));
     }
-    status = run_command(command, Caller(), kNote);
+    status = run_command(command, kNote);
     if (status == 0) return 0;
     log_command_status(status);
   }

@@ -50,6 +50,7 @@ bool is_own_folder(const struct stat& found) {
 }  // namespace
 
 int check_path_exist(const char* path) {
+  const LogScope scope;
   if (path == nullptr || path[0] == '\0') return -1;
   if (access(path, F_OK) == 0) return 0;
   LOG(2, "file path is not vaild : %s", path);
@@ -57,6 +58,7 @@ int check_path_exist(const char* path) {
 }
 
 int make_dir_include_parent(const char* path, mode_t mode) {
+  const LogScope scope;
   if (path == nullptr) return -1;
   if (mode == 0) mode = 0700;
   const Memory<char> copy(strdup(path));
@@ -79,6 +81,7 @@ int make_dir_include_parent(const char* path, mode_t mode) {
 }
 
 int _remove_file(const char* path) {
+  const LogScope scope;
   LOG(2, "unlink %s ", path);
   return unlink(path) == 0 || errno == ENOENT ? 0 : -1;
 }

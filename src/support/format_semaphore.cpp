@@ -40,11 +40,11 @@ bool read_status(int sem_id, semid_ds* status) {
 
 // Removes a set that another user made or was given: whoever may change it can keep every format waiting.
 // Returns whether it was one.
-bool remove_stranger(int sem_id, Caller caller) {
+bool remove_stranger(int sem_id) {
   semid_ds status{};
   if (!read_status(sem_id, &status)) return false;
   if (status.sem_perm.uid == geteuid() && status.sem_perm.cuid == geteuid()) return false;
-  LOG_AT(caller, 0, "the format semaphore belongs to user %u, it is replaced", status.sem_perm.cuid);
+  LOG(0, "the format semaphore belongs to user %u, it is replaced", status.sem_perm.cuid);
   semctl(sem_id, 0, IPC_RMID);
   return true;
 }
@@ -60,10 +60,10 @@ void close_to_others(int sem_id) {
 }
 
 // Returns the id of a set that no other user made, or -1 with errno.
-int get_own_set(int flags, Caller caller) {
+int get_own_set(int flags) {
   for (int i = 0; i < kMaxReplaced; i++) {
     const int sem_id = semget(kFormatSemKey, 1, flags);
-    if (sem_id == -1 || !remove_stranger(sem_id, caller)) return sem_id;
+    if (sem_id == -1 || !remove_stranger(sem_id)) return sem_id;
   }
   errno = EACCES;
   return -1;
@@ -72,19 +72,19 @@ int get_own_set(int flags, Caller caller) {
 // Makes the semaphore set and gives it its value. The create is not exclusive: two runs that found it missing
 // at the same moment may both set the value, and both format then. That costs memory and time, not data,
 // since they format different volumes.
-int create_format_sem(int initial, Caller caller) {
-  LOG_AT(caller, 2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
-  const int sem_id = get_own_set(IPC_CREAT | kFormatSemMode, caller);
+int create_format_sem(int initial) {
+  LOG(2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
+  const int sem_id = get_own_set(IPC_CREAT | kFormatSemMode);
   if (sem_id == -1) {
-    LOG_AT(caller, 0, "semget(..., IPC_CREATE ) failed");
+    LOG(0, "semget(..., IPC_CREATE ) failed");
     return -1;
   }
   close_to_others(sem_id);
   semun value{};
   value.val = initial > 0 ? initial : 1;
-  LOG_AT(caller, 2, "try to semctl(%d,0,SETVAL, %d )", sem_id, value.val);
+  LOG(2, "try to semctl(%d,0,SETVAL, %d )", sem_id, value.val);
   if (semctl(sem_id, 0, SETVAL, value) != -1) return sem_id;
-  LOG_AT(caller, 0, "semctl() failed, errno = %d", errno);
+  LOG(0, "semctl() failed, errno = %d", errno);
   semctl(sem_id, 0, IPC_RMID);
   return -1;
 }
@@ -97,20 +97,21 @@ bool was_left_without_value(int sem_id) {
 }
 
 // Returns the id of the format semaphore, made when missing, or -1. One run at a time.
-int find_format_sem(int initial, Caller caller) {
-  const int sem_id = get_own_set(kFormatSemMode, caller);
-  if (sem_id != -1 && was_left_without_value(sem_id)) return create_format_sem(initial, caller);
+int find_format_sem(int initial) {
+  const int sem_id = get_own_set(kFormatSemMode);
+  if (sem_id != -1 && was_left_without_value(sem_id)) return create_format_sem(initial);
   if (sem_id != -1) return sem_id;
   const int error = errno;
-  LOG_AT(caller, 0, "semget(...) == -1, errno = %d", error);
-  if (error == ENOENT || error == EIDRM) return create_format_sem(initial, caller);
-  LOG_AT(caller, 0, "semget() failed");
+  LOG(0, "semget(...) == -1, errno = %d", error);
+  if (error == ENOENT || error == EIDRM) return create_format_sem(initial);
+  LOG(0, "semget() failed");
   return -1;
 }
 
 }  // namespace
 
 int format_sem_P(int* sem_id, int initial) {
+  const LogScope scope;
   if (held_sem_id != -1) {  // left by a format that could not write: waiting for it would never end
     *sem_id = held_sem_id;
     LOG(1, "pid = %lu, is in format critical section still", static_cast<unsigned long>(getpid()));
@@ -118,7 +119,7 @@ int format_sem_P(int* sem_id, int initial) {
   }
   RunLock lock;
   lock.take("format-semaphore.lock", LockMode::kExclusive);
-  const int found = find_format_sem(initial, Caller());
+  const int found = find_format_sem(initial);
   lock.release();
   if (found == -1) return -1;
   *sem_id = found;
@@ -134,6 +135,7 @@ int format_sem_P(int* sem_id, int initial) {
 }
 
 int format_sem_V(int* sem_id) {
+  const LogScope scope;
   held_sem_id = -1;
   const int waiting = semctl(*sem_id, 0, GETNCNT);
   LOG(2, "fmt_semncnt = %d", waiting);

@@ -50,6 +50,7 @@ int make_lock_dir() {
 }
 
 int get_recover_cri_flock() {
+  const LogScope scope;
   const int fd = open_lock_file(kRecoverLock);
   if (fd < 0) {
     begin_line(0, stderr);
@@ -67,6 +68,7 @@ int get_recover_cri_flock() {
 }
 
 int unlock_recover_cri_flock(int fd) {
+  const LogScope scope;
   const int result = set_record_lock(fd, F_UNLCK);
   if (result == kBadDescriptor) LOG(2, "wrong fd");
   close(fd);
@@ -74,6 +76,7 @@ int unlock_recover_cri_flock(int fd) {
 }
 
 int wait_flock(const char* path, int max_retries, int max_wait_us) {
+  const LogScope scope;
   // Of the current time the part that differs between runs which one event started in the same second: with
   // the same waits they would meet again at every try.
   timespec now;
@@ -106,6 +109,7 @@ int wait_flock(const char* path, int max_retries, int max_wait_us) {
 }
 
 int unlock_flock(int fd) {
+  const LogScope scope;
   const int result = set_record_lock(fd, F_UNLCK);
   if (result == kHeldElsewhere) LOG(2, "access fail");
   if (result == kBadDescriptor) LOG(2, "wrong fd");

@@ -41,6 +41,7 @@ void store_group(unsigned char* address, int index, const char* group) {
 }  // namespace
 
 int ping_ip(const char* address, const char* interface) {
+  const LogScope scope;
   if (address == nullptr || address[0] == '\0') return 0;
   const bool from_interface = interface != nullptr && interface[0] != '\0';
   if (is_ipv6_text(address)) {

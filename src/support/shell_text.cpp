@@ -74,6 +74,7 @@ bool compose(Composition* command, const char* format, va_list values) {
 
 // The values stay untold: one of them may be a secret.
 CommandText refuse(const char* command) {
+  const LogScope scope;
   LOG(0, "cmd '%s' is refused, a value in it is no plain text", command);
   return CommandText("%s", kRefusedCommand);
 }

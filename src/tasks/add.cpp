@@ -62,7 +62,7 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
 }
 
 // Stores the requested target and LUN, in one step for other runs. Returns 0 with both slots, or -1.
-int _store_requested_lun(int* dbidx, int* lun_dbidx, Caller caller = Caller()) {
+int _store_requested_lun(int* dbidx, int* lun_dbidx) {
   TargetEntry* const entry = &request_target;
   mark_target(entry->target_name);
   const SlotsHeld held(SlotsHeld::kChange);
@@ -75,12 +75,12 @@ int _store_requested_lun(int* dbidx, int* lun_dbidx, Caller caller = Caller()) {
     return kFailed;
   }
   if (ktree_check_duplicate_share_name(entry->share) != 0) {
-    LOG_AT(caller, 0, "share name %s has benn used", entry->share);
+    LOG(0, "share name %s has benn used", entry->share);
     return kFailed;
   }
   *lun_dbidx = ktree_add_lun_entry(entry);
   if (*lun_dbidx <= 0) {
-    LOG_AT(caller, 0, "can not add target %s with lun %d", entry->target_name, entry->lun);
+    LOG(0, "can not add target %s with lun %d", entry->target_name, entry->lun);
     return kFailed;
   }
   return kOk;
@@ -89,6 +89,7 @@ int _store_requested_lun(int* dbidx, int* lun_dbidx, Caller caller = Caller()) {
 }  // namespace
 
 int task_add() {
+  const LogScope scope;
   LOG(2, "start");
   int dbidx = 0;
   int lun_dbidx = 0;
@@ -109,6 +110,7 @@ int task_add() {
 }
 
 int task_share(const char* share) {
+  const LogScope scope;
   LOG(2, "start");
   const int used = ktree_check_duplicate_share_name(share);
   LOG(1, used != 0 ? "share name %s is not ok" : "share name %s is ok", share);

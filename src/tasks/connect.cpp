@@ -62,14 +62,14 @@ int _mount_enabled_luns(TargetEntry* entry, int dbidx) {
 }
 
 // Finds the disks of a target that was just logged in, and mounts them. Returns the command's result.
-int _present_volumes(TargetEntry* entry, Caller caller = Caller()) {
+int _present_volumes(TargetEntry* entry) {
   const int found = ktree_update_dev(entry);
   if (found == kTreeFailed) {
-    LOG_AT(caller, 0, "ktree failed, exit...");
+    LOG(0, "ktree failed, exit...");
     return kOk;  // the session stays, and so does the user's wish
   }
   if (found != kOk) {
-    give_up_session(entry, found, kVolumeFailed, caller);
+    give_up_session(entry, found, kVolumeFailed);
     return kFailed;
   }
   sleep(kSettleSeconds);
@@ -79,12 +79,12 @@ int _present_volumes(TargetEntry* entry, Caller caller = Caller()) {
   return result;
 }
 
-int _disconnect_all(Caller caller = Caller()) {
+int _disconnect_all() {
   Target_umount_all();
-  LOG_AT(caller, 1, "update share folder status");
+  LOG(1, "update share folder status");
   reload_share_services();
-  LOG_AT(caller, 1, "finish share folder status");
-  return close_sessions(nullptr, kLogoutAllCommand, caller);
+  LOG(1, "finish share folder status");
+  return close_sessions(nullptr, kLogoutAllCommand);
 }
 
 int _disconnect_requested() {
@@ -99,6 +99,7 @@ int _disconnect_requested() {
 }  // namespace
 
 int task_connect() {
+  const LogScope scope;
   LOG(2, "start");
   const TargetHold hold(request_target.target_name);
   TargetEntry entry;
@@ -125,6 +126,7 @@ int task_connect() {
 }
 
 int task_disconnect(int all) {
+  const LogScope scope;
   LOG(2, "start");
   const int result = all != 0 ? _disconnect_all() : _disconnect_requested();
   LOG(2, "end");

@@ -25,30 +25,30 @@ namespace {
 
 // Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry, no device or
 // another disk's; 1 unknown target or LUN.
-int _read_lun_to_format(TargetEntry* entry, Caller caller = Caller()) {
+int _read_lun_to_format(TargetEntry* entry) {
   if (request_target.target_name[0] == '\0' || request_target.lun < 0) return kFailed;
   int dbidx = 0;
   int lun_dbidx = 0;
-  const int found = find_requested_lun(&dbidx, &lun_dbidx, caller);
+  const int found = find_requested_lun(&dbidx, &lun_dbidx);
   if (found != kOk) return found;
-  if (read_requested_lun(entry, dbidx, lun_dbidx, caller) != kOk) return kFailed;
+  if (read_requested_lun(entry, dbidx, lun_dbidx) != kOk) return kFailed;
   if (entry->dev[0] == '\0') {
-    LOG_AT(caller, 2, "Can not get device");
+    LOG(2, "Can not get device");
     return kFailed;
   }
-  if (is_foreign_disk(entry, entry->dev, caller)) return kFailed;
+  if (is_foreign_disk(entry, entry->dev)) return kFailed;
   return kOk;
 }
 
 // Formats and mounts the LUN anew, with its FTP share taken down meanwhile. Returns -1 when the mount table
 // cannot be read, else the result of the mount.
-int _remake_volume(TargetEntry* entry, Caller caller = Caller()) {
+int _remake_volume(TargetEntry* entry) {
   ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0);
   ktree_update_lun_status(entry, 1);
   ktree_update_volume_state(entry, kVolumeCreating);
 
   FtpPath ftp_path;
-  if (take_ftp_share_down(entry, ftp_path, caller) != kOk) {
+  if (take_ftp_share_down(entry, ftp_path) != kOk) {
     ktree_update_volume_state(entry, kVolumeNormal);
     return kFailed;
   }
@@ -58,7 +58,7 @@ int _remake_volume(TargetEntry* entry, Caller caller = Caller()) {
     ktree_update_volume_state(entry, kVolumeFailed);
   }
   if (ftp_path[0] != '\0') {
-    LOG_AT(caller, 1, "mount_ftp : FTP SHARE PATH = %s", ftp_path);
+    LOG(1, "mount_ftp : FTP SHARE PATH = %s", ftp_path);
     Target_remount_ftp(entry, ftp_path);
   }
   ktree_update_lun_status(entry, 0);
@@ -68,6 +68,7 @@ int _remake_volume(TargetEntry* entry, Caller caller = Caller()) {
 
 // Writes the entry to its slot. A target that was deleted meanwhile is not stored again.
 void _update_stored_target(TargetEntry* entry) {
+  const LogScope scope;
   const SlotsHeld held(SlotsHeld::kChange);
   if (HeldSlot(entry->db_idx)) ktree_add_entry(entry);
 }
@@ -83,9 +84,9 @@ void _store_chap(TargetEntry* entry) {
 
 // Logs the target in with its new settings and mounts its volumes. A failure is stored, not returned: the
 // settings are to be kept either way.
-void _reconnect(TargetEntry* entry, int conn_set, Caller caller = Caller()) {
+void _reconnect(TargetEntry* entry, int conn_set) {
   if (Target_Connect(entry) != kOk) {
-    LOG_AT(caller, 0, "Reconnect failed , target name = %s", entry->target_name);
+    LOG(0, "Reconnect failed , target name = %s", entry->target_name);
     entry->conn_set = 0;
     ktree_record_connect_set(entry);
     ktree_set_connect_state(entry->db_idx, kConnectError);
@@ -101,6 +102,7 @@ void _reconnect(TargetEntry* entry, int conn_set, Caller caller = Caller()) {
 }  // namespace
 
 int task_format() {
+  const LogScope scope;
   TargetEntry entry = {};
   LOG(2, "start");
   const TargetHold hold(request_target.target_name, request_target.lun);
@@ -111,6 +113,7 @@ int task_format() {
 }
 
 int task_modify() {
+  const LogScope scope;
   LOG(2, "start");
   const TargetHold hold(request_target.target_name);
   int result = kFailed;

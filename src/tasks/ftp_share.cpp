@@ -7,17 +7,17 @@
 
 namespace remvol {
 
-int take_ftp_share_down(const TargetEntry* entry, FtpPath& path, Caller caller) {
+int take_ftp_share_down(const TargetEntry* entry, FtpPath& path) {
   memset(path, 0, sizeof path);
   switch (get_ftp_share_path(entry, path)) {
     case kMountTableUnreadable:
-      LOG_AT(caller, 2, "Can not read /proc/mounts");
+      LOG(2, "Can not read /proc/mounts");
       return kMountTableUnreadable;
     case kNoFtpShare:
-      LOG_AT(caller, 2, "Can not find ftp share folder");
+      LOG(2, "Can not find ftp share folder");
       return kOk;
     default:
-      LOG_AT(caller, 1, "umount_ftp : FTP SHARE PATH = %s", path);
+      LOG(1, "umount_ftp : FTP SHARE PATH = %s", path);
       Target_umount_ftp(entry, path);
       return kOk;
   }

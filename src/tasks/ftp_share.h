@@ -11,7 +11,7 @@ using FtpPath = char[512];
 
 // Unmounts the FTP mount of the entry's volume and leaves its path in `path`, empty when there is none. Logs
 // in the caller's name. Returns 0, or -105 when the mount table cannot be read.
-int take_ftp_share_down(const TargetEntry* entry, FtpPath& path, Caller caller = Caller());
+int take_ftp_share_down(const TargetEntry* entry, FtpPath& path);
 
 }  // namespace remvol
 

@@ -52,34 +52,34 @@ bool _is_formatting(const TargetEntry* lun) {
   return _is_running(check_mkfs_process_existing);
 }
 
-void _log_busy(const TargetEntry* lun, const char* work, Caller caller) {
-  LOG_AT(caller, 1, "One of target:%s 's LUN is %s", lun->target_name, work);
-  LOG_AT(caller, 1, "Skip it now, and kick it back to recover queue");
+void _log_busy(const TargetEntry* lun, const char* work) {
+  LOG(1, "One of target:%s 's LUN is %s", lun->target_name, work);
+  LOG(1, "Skip it now, and kick it back to recover queue");
 }
 
-void _check_lun(const TargetEntry* lun, TargetHealth* health, Caller caller) {
+void _check_lun(const TargetEntry* lun, TargetHealth* health) {
   const char* device = lun->dev[0] != '\0' ? lun->dev : lun->mnt_dev;
   const int degraded = check_mnt_dev_degrade_to_ro(device, lun->mnt);
   if (degraded == 1 || degraded == -1) {
-    LOG_AT(caller, 1, "dev %s access right is degraded to ro", device);
+    LOG(1, "dev %s access right is degraded to ro", device);
     health->degraded = true;
   }
   if (_is_formatting(lun)) {
-    _log_busy(lun, "formatting or waitting for format", caller);
+    _log_busy(lun, "formatting or waitting for format");
     health->busy = true;
   }
   if (_is_running([device] { return check_resizing_fs(device); })) {
-    _log_busy(lun, "resizing", caller);
+    _log_busy(lun, "resizing");
     health->busy = true;
   }
 }
 
-TargetHealth _check_luns(int dbidx, Caller caller) {
+TargetHealth _check_luns(int dbidx) {
   TargetHealth health;
   TargetEntry lun;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
     if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) break;
-    _check_lun(&lun, &health, caller);
+    _check_lun(&lun, &health);
   }
   return health;
 }
@@ -94,8 +94,8 @@ bool _is_lost(int dbidx) {
   return target.conn_set != 0 && state == kRecovering;
 }
 
-int _leave_target(const TargetEntry* entry, Caller caller) {
-  LOG_AT(caller, 1, "This target %s has not been set to connect", entry->target_name);
+int _leave_target(const TargetEntry* entry) {
+  LOG(1, "This target %s has not been set to connect", entry->target_name);
   return kOk;
 }
 
@@ -109,28 +109,27 @@ bool _store_recovered(TargetEntry* entry) {
   return true;
 }
 
-int _keep_volumes(TargetEntry* entry, Caller caller) {
-  if (!_store_recovered(entry)) return _leave_target(entry, caller);
+int _keep_volumes(TargetEntry* entry) {
+  if (!_store_recovered(entry)) return _leave_target(entry);
   ktree_update_status(entry);
   return kOk;
 }
 
 // Starts a run in the background that comes back for the target after a while.
-void _postpone(const TargetEntry* entry, Caller caller) {
+void _postpone(const TargetEntry* entry) {
   run_command(shell_command("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds,
-                            entry->target_name),
-              caller);
+                            entry->target_name));
 }
 
 // Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one
 // ends the walk.
-void _unmount_luns(int dbidx, Caller caller) {
+void _unmount_luns(int dbidx) {
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
     if (!is_lun_stored(dbidx, slot)) break;
     TargetEntry lun;
     if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) continue;
     FtpPath ftp_path;
-    take_ftp_share_down(&lun, ftp_path, caller);
+    take_ftp_share_down(&lun, ftp_path);
     Target_LUN_umount(&lun);
   }
 }
@@ -138,15 +137,15 @@ void _unmount_luns(int dbidx, Caller caller) {
 // Unmounts everything, logs out and connects the target again. Returns the result of the connection. A target
 // that another run is at for long is put off: to wait for its format would hold up the recovery of all
 // others.
-int _rebuild(TargetEntry* entry, Caller caller) {
+int _rebuild(TargetEntry* entry) {
   const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   if (hold.given_up()) {
-    LOG_AT(caller, 1, "another run is at target %s, its recovery is put off", entry->target_name);
-    _postpone(entry, caller);
+    LOG(1, "another run is at target %s, its recovery is put off", entry->target_name);
+    _postpone(entry);
     return kOk;
   }
-  if (!_is_lost(entry->db_idx)) return _leave_target(entry, caller);
-  _unmount_luns(entry->db_idx, caller);
+  if (!_is_lost(entry->db_idx)) return _leave_target(entry);
+  _unmount_luns(entry->db_idx);
   Target_Logout(entry);
   entry->conn_set = 1;
   ktree_set_connect_state(entry->db_idx, kConnecting);
@@ -160,28 +159,28 @@ int _rebuild(TargetEntry* entry, Caller caller) {
 }
 
 // Recovers the target named in the request record. Returns its result.
-int _recover_requested_target(Caller caller) {
+int _recover_requested_target() {
   const char* name = request_target.target_name;
-  LOG_AT(caller, 1, "==> Processing - %s", name);
+  LOG(1, "==> Processing - %s", name);
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
-    LOG_AT(caller, 1, "Can not find: %s", name);
+    LOG(1, "Can not find: %s", name);
     return kNotStored;
   }
-  if (!_is_lost(entry.db_idx)) return _leave_target(&entry, caller);
+  if (!_is_lost(entry.db_idx)) return _leave_target(&entry);
   // The looks take seconds: what is done then is for a target that nobody has taken away or brought up since.
-  const TargetHealth health = _check_luns(entry.db_idx, caller);
-  if (!health.degraded) return _keep_volumes(&entry, caller);
-  if (!health.busy) return _rebuild(&entry, caller);
-  _postpone(&entry, caller);
+  const TargetHealth health = _check_luns(entry.db_idx);
+  if (!health.degraded) return _keep_volumes(&entry);
+  if (!health.busy) return _rebuild(&entry);
+  _postpone(&entry);
   return kOk;
 }
 
 // Recovers the requested target and then whatever is queued. Returns the result of the last one.
-int _drain_queue(Caller caller = Caller()) {
+int _drain_queue() {
   int result = kOk;
   do {
-    result = _recover_requested_target(caller);
+    result = _recover_requested_target();
     request_target = TargetEntry{};
   } while (ktree_pop_recover_queue(request_target.target_name) == kOk &&
            request_target.target_name[0] != '\0');
@@ -189,12 +188,12 @@ int _drain_queue(Caller caller = Caller()) {
 }
 
 // Leaves the requested target to the run that is recovering. Returns 0, -1 or -103.
-int _queue_requested_target(Caller caller = Caller()) {
+int _queue_requested_target() {
   const char* name = request_target.target_name;
-  LOG_AT(caller, 1, "==> insert queue - %s", name);
+  LOG(1, "==> insert queue - %s", name);
   const int lock = wait_flock(kRecoverQueueLock, kQueueLockRetries, kQueueLockWaitUs);
   if (lock < 0) {
-    LOG_AT(caller, 0, "lock failed for %s, skip and exit", name);
+    LOG(0, "lock failed for %s, skip and exit", name);
     return kFailed;
   }
   const int result = ktree_insert_recover_queue(name);
@@ -202,9 +201,8 @@ int _queue_requested_target(Caller caller = Caller()) {
   return result;
 }
 
-}  // namespace
-
-int task_oiscsi_evt_reopen() {
+// Marks the requested target as being recovered. Returns 0 or kNotStored.
+int _mark_requested_target() {
   const char* name = request_target.target_name;
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
@@ -219,7 +217,8 @@ int task_oiscsi_evt_reopen() {
   return kOk;
 }
 
-int task_oiscsi_evt_recover(int wait_seconds) {
+// Recovers the requested target and all that are queued, or queues it where another run does.
+int _recover_or_queue(int wait_seconds) {
   if (wait_seconds > 0) {
     LOG(1, "Sleep %d seconds before add %s to recover queue...", wait_seconds, request_target.target_name);
     sleep(static_cast<unsigned>(wait_seconds));
@@ -229,9 +228,27 @@ int task_oiscsi_evt_recover(int wait_seconds) {
     return kFailed;
   }
   const int lock = get_recover_cri_flock();
-  if (lock < 0) return _queue_requested_target();  // another run works the queue off
+  if (lock < 0) return _queue_requested_target();
   const int result = _drain_queue();
   unlock_recover_cri_flock(lock);
+  return result;
+}
+
+}  // namespace
+
+int task_oiscsi_evt_reopen() {
+  const LogScope scope;
+  LOG(2, "start");
+  const int result = _mark_requested_target();
+  LOG(2, "end");
+  return result;
+}
+
+int task_oiscsi_evt_recover(int wait_seconds) {
+  const LogScope scope;
+  LOG(2, "start");
+  const int result = _recover_or_queue(wait_seconds);
+  LOG(2, "end");
   return result;
 }
 

@@ -31,7 +31,7 @@ int reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
 
 // Deletes a slot, or the whole target's when `lun_dbidx` is 0; the tree moves the slots behind it down. What
 // another run has deleted meanwhile is deleted. Returns 0 or kNotDeleted.
-int _delete_slot(int dbidx, int lun_dbidx, Caller caller) {
+int _delete_slot(int dbidx, int lun_dbidx) {
   const SlotsHeld held(SlotsHeld::kChange);
   const HeldSlot slot(dbidx, lun_dbidx);
   if (!slot) return kOk;
@@ -39,7 +39,7 @@ int _delete_slot(int dbidx, int lun_dbidx, Caller caller) {
       lun_dbidx > 0 ? KeyText(key::kLun, slot.target(), slot.lun()) : KeyText(key::kTarget, slot.target());
   for (int tries = 0; tries < kDeleteTries; tries++) {
     if (delete_slot(key) == kOk) return kOk;
-    LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", key.c_str());
+    LOG(0, "ktreec_del() of path '%s' failed", key.c_str());
   }
   return kNotDeleted;
 }
@@ -51,19 +51,19 @@ bool _has_at_most(int luns, int dbidx) {
 
 // Deletes the slot of the target at `dbidx`, of which LUN `lun` was the last one. When another run has stored
 // a further one since, that stays, and so does the target. Returns 0 or kNotDeleted.
-int _delete_slot_of_last_lun(int dbidx, int lun, Caller caller) {
+int _delete_slot_of_last_lun(int dbidx, int lun) {
   const SlotsHeld held(SlotsHeld::kChange);
   int lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);
   if (lun_dbidx <= 0) lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);  // the read may have failed
-  if (_has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return _delete_slot(dbidx, 0, caller);
-  const int result = lun_dbidx > 0 ? _delete_slot(dbidx, lun_dbidx, caller) : kOk;
+  if (_has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return _delete_slot(dbidx, 0);
+  const int result = lun_dbidx > 0 ? _delete_slot(dbidx, lun_dbidx) : kOk;
   ktree_update_current_luncnt(dbidx);
   return result;
 }
 
 // Removes the target in `entry`, volumes, session and node record first; `last_lun` is the LUN with which it
 // goes, or kEveryLun. Returns 0 or kNotDeleted.
-int _remove_target(TargetEntry* entry, int last_lun, Caller caller) {
+int _remove_target(TargetEntry* entry, int last_lun) {
   const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   TargetEntry lun;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
@@ -72,40 +72,48 @@ int _remove_target(TargetEntry* entry, int last_lun, Caller caller) {
   }
   Target_Disconnect(entry);
   _target_record_delete(entry);
-  if (last_lun == kEveryLun) return _delete_slot(entry->db_idx, 0, caller);
-  return _delete_slot_of_last_lun(entry->db_idx, last_lun, caller);
+  if (last_lun == kEveryLun) return _delete_slot(entry->db_idx, 0);
+  return _delete_slot_of_last_lun(entry->db_idx, last_lun);
 }
 
 // Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
-int _remove_lun(int dbidx, int lun_dbidx, Caller caller = Caller()) {
+int _remove_lun(int dbidx, int lun_dbidx) {
   TargetEntry lun;
-  if (read_requested_lun(&lun, dbidx, lun_dbidx, caller) != kOk) return kFailed;
+  if (read_requested_lun(&lun, dbidx, lun_dbidx) != kOk) return kFailed;
   reload_lun_share(&lun);
   Target_LUN_umount(&lun);
-  return _delete_slot(dbidx, lun_dbidx, caller);
+  return _delete_slot(dbidx, lun_dbidx);
 }
 
-int _remove_requested_target(int last_lun, Caller caller) {
-  LOG_AT(caller, 2, "start");
+int _remove_requested_target(int last_lun) {
+  LOG(2, "start");
   int result = kNotStored;
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {
-    result = _remove_target(&entry, last_lun, caller);
+    result = _remove_target(&entry, last_lun);
   } else {
-    LOG_AT(caller, 1, "Can not find: %s", request_target.target_name);
+    LOG(1, "Can not find: %s", request_target.target_name);
   }
   ktree_update_current_targetcnt();
-  LOG_AT(caller, 2, "end");
+  LOG(2, "end");
   return result;
+}
+
+// Told as the removal of a target is.
+int _remove_target_with_last_lun() {
+  const LogScope scope("task_del");
+  return _remove_requested_target(request_target.lun);
 }
 
 }  // namespace
 
 int task_del() {
-  return _remove_requested_target(kEveryLun, Caller());
+  const LogScope scope;
+  return _remove_requested_target(kEveryLun);
 }
 
 int task_del_lun() {
+  const LogScope scope;
   LOG(2, "start");
   const BriefTargetHold hold(request_target.target_name, is_no_lun_formatting);
   int dbidx = 0;
@@ -120,12 +128,12 @@ int task_del_lun() {
   if (result == kOk && _has_at_most(1, dbidx)) {
     LOG(2, "removing target %s", request_target.target_name);
     target_gone = true;
-    result = _remove_requested_target(request_target.lun, Caller("task_del"));
+    result = _remove_target_with_last_lun();
   } else if (result == kOk) {
     result = _remove_lun(dbidx, lun_dbidx);
     target_gone = result == kOk && _has_at_most(0, dbidx);
     // Another run has removed the others meanwhile.
-    if (target_gone) result = _remove_requested_target(request_target.lun, Caller("task_del"));
+    if (target_gone) result = _remove_target_with_last_lun();
   }
   if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);
   LOG(2, "end, ret = %d", result);

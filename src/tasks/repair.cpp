@@ -30,6 +30,7 @@ bool tells_of_work(const char* text_key) {
 }
 
 bool any_text_tells_of_work(int dbidx) {
+  const LogScope scope;
   const HeldSlot slot(dbidx);
   if (!slot) return false;
   const int n = slot.target();

@@ -41,15 +41,15 @@ void _refresh_luns(TargetEntry* entry, SlotsHeld* held) {
 
 // Refreshes the target in `entry`. The slots are let go of while the sessions are listed. Returns 0, also
 // when it had to be skipped, or -103.
-int _refresh_target(TargetEntry* entry, SlotsHeld* held, Caller caller) {
+int _refresh_target(TargetEntry* entry, SlotsHeld* held) {
   held->let_go();
   const int found = ktree_update_dev(entry);
   if (found == kTreeFailed) {
-    LOG_AT(caller, 0, "set value to ktree failed. Exit.");
+    LOG(0, "set value to ktree failed. Exit.");
     return kTreeFailed;
   }
   if (found == kListingFailed) {
-    LOG_AT(caller, 2, "iscsiadm -m session failed. Skip this target.");
+    LOG(2, "iscsiadm -m session failed. Skip this target.");
     held->take();
     return kOk;
   }
@@ -61,19 +61,19 @@ int _refresh_target(TargetEntry* entry, SlotsHeld* held, Caller caller) {
 
 // Returns whether the slot was nameless and is gone. The tree is asked for the name anew: what this run has
 // read before is believed although a person at ktreec may have stored a target since.
-bool _delete_nameless_slot(int slot, Caller caller) {
+bool _delete_nameless_slot(int slot) {
   const SlotsHeld held(SlotsHeld::kChange);
   if (tree_present(KeyText(key::kTargetName, slot))) return false;
   const KeyText path(key::kTarget, slot);
   if (delete_slot(path) == kOk) return true;
-  LOG_AT(caller, 0, "ktreec_del() of path '%s' failed", path.c_str());
+  LOG(0, "ktreec_del() of path '%s' failed", path.c_str());
   return false;
 }
 
 // Refreshes the targets and deletes slots without a name, garbage of an interrupted add or delete. The slot
 // that moves into a deleted one's place is visited next; no more slots are visited than were counted. Returns
 // 0 or -103.
-int _refresh_targets(int count, Caller caller = Caller()) {
+int _refresh_targets(int count) {
   SlotsHeld held;
   int slot = 1;
   for (int visited = 0; visited < count; visited++) {
@@ -81,13 +81,13 @@ int _refresh_targets(int count, Caller caller = Caller()) {
     char name[sizeof entry.target_name];
     if (!read_target_name(slot, name)) {
       held.let_go();
-      if (!_delete_nameless_slot(slot, caller)) slot++;
+      if (!_delete_nameless_slot(slot)) slot++;
       held.take();
       continue;
     }
     remember_target(slot, name);
     const bool found = ktree_get_entry_by_targetname(name, &entry) == kOk;
-    if (found && _refresh_target(&entry, &held, caller) != kOk) return kTreeFailed;
+    if (found && _refresh_target(&entry, &held) != kOk) return kTreeFailed;
     slot = target_slot_after(slot);
   }
   return kOk;
@@ -95,18 +95,18 @@ int _refresh_targets(int count, Caller caller = Caller()) {
 
 // The targets behind the counted ones, such as one whose add was refused, stay as they are, unless they show
 // work that nobody does any more. Returns 0 or -103.
-int _refresh_ended_work_behind(int count, Caller caller = Caller()) {
+int _refresh_ended_work_behind(int count) {
   SlotsHeld held;
   for (int slot = count + 1; slot <= kMaxTargets && is_target_stored(slot); slot++) {
     TargetEntry entry;
     if (ktree_get_entry_by_dbidx(slot, &entry) != kOk || !shows_ended_work(&entry)) continue;
-    if (_refresh_target(&entry, &held, caller) != kOk) return kTreeFailed;
+    if (_refresh_target(&entry, &held) != kOk) return kTreeFailed;
   }
   return kOk;
 }
 
 // Deletes the nameless slots behind the counted ones, up to the first without a status.
-void _prune_slots_behind(int count, Caller caller = Caller()) {
+void _prune_slots_behind(int count) {
   const SlotsHeld held(SlotsHeld::kChange);
   int slot = count + 1;
   for (int visited = count; visited < kMaxTargets; visited++) {
@@ -116,7 +116,7 @@ void _prune_slots_behind(int count, Caller caller = Caller()) {
       continue;
     }
     const KeyText path(key::kTarget, slot);
-    LOG_AT(caller, 0, "ktreec_del() of path '%s'", path.c_str());
+    LOG(0, "ktreec_del() of path '%s'", path.c_str());
     if (delete_slot(path) != kOk) slot++;
   }
 }
@@ -124,6 +124,7 @@ void _prune_slots_behind(int count, Caller caller = Caller()) {
 }  // namespace
 
 int task_status() {
+  const LogScope scope;
   LOG(2, "start");
   drop_half_made_slots();
   if (has_uncounted_target()) ktree_update_current_targetcnt();

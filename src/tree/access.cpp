@@ -101,14 +101,14 @@ int tree_write_to(const char* socket, const char* key, const char* value) {
   return ktreec_set(socket, 0, key, value) == 0 ? kOk : kTreeFailed;
 }
 
-int tree_write_with_tries(const char* key, const char* value, Caller caller) {
-  return tree_write_with_tries_to(main_socket, key, value, caller);
+int tree_write_with_tries(const char* key, const char* value) {
+  return tree_write_with_tries_to(main_socket, key, value);
 }
 
-int tree_write_with_tries_to(const char* socket, const char* key, const char* value, Caller caller) {
+int tree_write_with_tries_to(const char* socket, const char* key, const char* value) {
   for (int tries = 0; tries < kWriteTries; tries++) {
     if (tree_write_to(socket, key, value) == kOk) return kOk;
-    LOG_AT(caller, 0, "ktreec_set(%s) failed", key);
+    LOG(0, "ktreec_set(%s) failed", key);
   }
   return kTreeFailed;
 }

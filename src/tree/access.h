@@ -77,9 +77,8 @@ int tree_read_number(const char* key, int missing);
 
 // Sets `key` in up to 3 tries and logs "ktreec_set(%s) failed" in the caller's name after each failed one.
 // Returns 0, or -103 after the third.
-int tree_write_with_tries(const char* key, const char* value, Caller caller = Caller());
-int tree_write_with_tries_to(const char* socket, const char* key, const char* value,
-                             Caller caller = Caller());
+int tree_write_with_tries(const char* key, const char* value);
+int tree_write_with_tries_to(const char* socket, const char* key, const char* value);
 
 // Deletes `key` and all below it. Returns 0, or -103 (not logged).
 [[nodiscard]] int tree_delete(const char* key);

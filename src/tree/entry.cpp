@@ -43,16 +43,16 @@ void read_target_fields(TargetEntry* entry, int dbidx) {
 
 // Reads what the LUN slot `m` of the target in `slot` holds, which this run knows by the number `dbidx`, into
 // the LUN's fields. Returns whether both are stored.
-bool read_lun_at(TargetEntry* entry, int dbidx, const HeldSlot& slot, int m, Caller caller) {
+bool read_lun_at(TargetEntry* entry, int dbidx, const HeldSlot& slot, int m) {
   const int n = slot.target();
   if (!slot || !read_target_name(n, entry->target_name)) {
-    LOG_AT(caller, 0, "Can not get entry from %d", dbidx);
+    LOG(0, "Can not get entry from %d", dbidx);
     return false;
   }
   remember_target(dbidx, entry->target_name);
   entry->db_idx = dbidx;
   if (!read_lun_number(n, m, &entry->lun)) {
-    LOG_AT(caller, 2, "Can not get lun from %d", m);
+    LOG(2, "Can not get lun from %d", m);
     return false;
   }
   entry->lun_db_idx = m;
@@ -110,19 +110,20 @@ int read_state(const char* key, bool stored, int* value, int missing) {
 }
 
 // Writes one value of a new entry. Returns whether the tree took it.
-bool set_value(const char* key, const char* value, Caller caller) {
+bool set_value(const char* key, const char* value) {
   if (tree_write(key, value) == kOk) return true;
-  LOG_AT(caller, 0, "ktreec_set() failed");
+  LOG(0, "ktreec_set() failed");
   return false;
 }
 
-bool set_value(const char* key, int value, Caller caller) {
-  return set_value(key, NumberText("%d", value), caller);
+bool set_value(const char* key, int value) {
+  return set_value(key, NumberText("%d", value));
 }
 
 }  // namespace
 
 int ktree_get_dbidx_by_targetname(const char* target_name) {
+  const LogScope scope;
   if (target_name == nullptr) return kFailed;
   const SlotsHeld held;
   int dbidx = kFailed;
@@ -140,6 +141,7 @@ int ktree_get_dbidx_by_targetname(const char* target_name) {
 }
 
 int ktree_get_free_dbidx() {
+  const LogScope scope;
   for (int n = 1; n <= kMaxTargets; n++) {
     if (!is_target_slot_free(n)) continue;
     LOG(3, "free ent id: %d", n);
@@ -149,6 +151,7 @@ int ktree_get_free_dbidx() {
 }
 
 int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry) {
+  const LogScope scope;
   if (entry == nullptr) {
     LOG(0, "Entry is NULL");
     return kFailed;
@@ -168,6 +171,7 @@ int ktree_get_entry_by_targetname(const char* target_name, TargetEntry* entry) {
 }
 
 int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry) {
+  const LogScope scope;
   *entry = TargetEntry();
   const HeldSlot slot(dbidx);
   if (!slot || !read_target_name(slot.target(), entry->target_name)) return kFailed;
@@ -178,11 +182,13 @@ int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry) {
 }
 
 bool is_target_stored(int dbidx) {
+  const LogScope scope;
   const HeldSlot slot(dbidx);
   return slot && is_target_stored_at(slot.target());
 }
 
 bool is_lun_stored(int dbidx, int lun_dbidx) {
+  const LogScope scope;
   const HeldSlot slot(dbidx);
   int lun = 0;
   if (!slot || !read_lun_number(slot.target(), lun_dbidx, &lun)) return false;
@@ -191,15 +197,17 @@ bool is_lun_stored(int dbidx, int lun_dbidx) {
 }
 
 int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx) {
+  const LogScope scope;
   if (entry == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
   *entry = TargetEntry();
   const HeldSlot slot(dbidx);
-  if (!read_lun_at(entry, dbidx, slot, lun_dbidx, Caller())) return kFailed;
+  if (!read_lun_at(entry, dbidx, slot, lun_dbidx)) return kFailed;
   read_target_fields(entry, slot.target());
   return kOk;
 }
 
 int ktree_get_lun_of_target(TargetEntry* entry, int lun_dbidx) {
+  const LogScope scope("ktree_get_lun_entry_by_dbidx");
   copy_text(entry->share, "");
   copy_text(entry->dev, "");
   copy_text(entry->mnt_dev, "");
@@ -207,11 +215,11 @@ int ktree_get_lun_of_target(TargetEntry* entry, int lun_dbidx) {
   entry->lun = 0;
   entry->lun_db_idx = 0;
   const HeldSlot slot(entry->db_idx);
-  return read_lun_at(entry, entry->db_idx, slot, lun_dbidx, Caller("ktree_get_lun_entry_by_dbidx")) ? kOk
-                                                                                                    : kFailed;
+  return read_lun_at(entry, entry->db_idx, slot, lun_dbidx) ? kOk : kFailed;
 }
 
 int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int lun) {
+  const LogScope scope;
   const SlotsHeld held;
   if (ktree_get_lun_entry_by_dbidx(entry, dbidx, lun_dbidx) == kOk && entry->lun == lun) return kOk;
   remember_lun(dbidx, lun_dbidx, lun);
@@ -221,6 +229,7 @@ int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int 
 }
 
 int ktree_update_current_targetcnt() {
+  const LogScope scope;
   const SlotsHeld held;
   int count = 0;
   for (int n = 1; n <= kMaxTargets; n++) count += tree_present_surely(KeyText(key::kTargetName, n)) ? 1 : 0;
@@ -237,23 +246,27 @@ int ktree_get_total_luncnt() {
 }
 
 int ktree_count_target_luns(int dbidx) {
+  const LogScope scope;
   if (dbidx < 1) return kFailed;
   const HeldSlot slot(dbidx);
   return slot ? count_luns_at(slot.target()) : 0;
 }
 
 bool has_no_further_lun(int dbidx, int most) {
+  const LogScope scope;
   const HeldSlot slot(dbidx);
   return !slot || tree_is_missing(KeyText(key::kLunNumber, slot.target(), most + 1),
                                   KeyText(key::kTargetName, slot.target()));
 }
 
 int ktree_refresh_total_luncnt() {
+  const LogScope scope;
   const SlotsHeld held;
   return tree_write_with_tries(key::kTotalLunCount, NumberText("%d", ktree_get_total_luncnt()));
 }
 
 int ktree_update_current_luncnt(int dbidx) {
+  const LogScope scope;
   const HeldSlot slot(dbidx);
   if (!slot) return kTreeFailed;
   const int n = slot.target();
@@ -264,6 +277,7 @@ int ktree_update_current_luncnt(int dbidx) {
 }
 
 void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx) {
+  const LogScope scope;
   const SlotsHeld held(SlotsHeld::kChange);
   const int n = entry->db_idx;
   char share[kValueSize];
@@ -271,34 +285,38 @@ void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx) {
   const KeyText number(key::kLunNumber, n, lun_dbidx);
   const KeyText enable(key::kLunEnable, n, lun_dbidx);
   const KeyText right(key::kLunAccessRight, n, lun_dbidx);
-  const Caller here;
-  if (tree_is_missing(enable, number)) set_value(enable, 1, here);
-  if (tree_is_missing(right, number)) set_value(right, VOL_AC_RW, here);
+  if (tree_is_missing(enable, number)) set_value(enable, 1);
+  if (tree_is_missing(right, number)) set_value(right, VOL_AC_RW);
   if (tree_read_number(KeyText(key::kTargetLunCount, n), 0) != count_all_luns_at(n))
     ktree_update_current_luncnt(n);
 }
 
 int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value) {
+  const LogScope scope;
   const HeldSlot slot(dbidx, lun_dbidx);
   return read_state(KeyText(key::kLunFormatState, slot.target(), slot.lun()), bool(slot), value, -1);
 }
 
 int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value) {
+  const LogScope scope;
   const HeldSlot slot(dbidx, lun_dbidx);
   return read_state(KeyText(key::kLunFormatProgress, slot.target(), slot.lun()), bool(slot), value, 0);
 }
 
 int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value) {
+  const LogScope scope;
   const HeldSlot slot(dbidx, lun_dbidx);
   return read_state(KeyText(key::kLunVolumeState, slot.target(), slot.lun()), bool(slot), value, -1);
 }
 
 int ktree_get_connect_state(int dbidx, int* value) {
+  const LogScope scope;
   const HeldSlot slot(dbidx);
   return read_state(KeyText(key::kTargetConnState, slot.target()), bool(slot), value, -1);
 }
 
 int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
+  const LogScope scope;
   if (enable == nullptr || dbidx < 1 || lun_dbidx < 1) return kFailed;
   *enable = 0;
   const HeldSlot slot(dbidx, lun_dbidx);
@@ -314,6 +332,7 @@ int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
 }
 
 int ktree_get_free_lun_dbidx(int dbidx) {
+  const LogScope scope;
   if (ktree_get_total_luncnt() >= kMaxLuns) {
     LOG(2, "max number of lun = %d reached", kMaxLuns);
     return kFailed;
@@ -330,6 +349,7 @@ int ktree_get_free_lun_dbidx(int dbidx) {
 }
 
 int ktree_get_dbidx_by_lun(int dbidx, int lun) {
+  const LogScope scope;
   if (lun < 0) return kFailed;
   const HeldSlot slot(dbidx);
   if (!slot) return kFailed;
@@ -348,6 +368,7 @@ int ktree_get_dbidx_by_lun(int dbidx, int lun) {
 }
 
 int ktree_add_lun_entry(TargetEntry* entry) {
+  const LogScope scope;
   if (entry == nullptr) return kFailed;
   const SlotsHeld held(SlotsHeld::kChange);
   const int n = entry->db_idx >= 1 ? entry->db_idx : ktree_get_dbidx_by_targetname(entry->target_name);
@@ -357,17 +378,17 @@ int ktree_add_lun_entry(TargetEntry* entry) {
   entry->lun_db_idx = m;
   slots_move();
   remember_lun(n, m, entry->lun);
-  const Caller here;
-  const bool stored = set_value(KeyText(key::kLunNumber, n, m), entry->lun, here) &&
-                      set_value(KeyText(key::kLunShare, n, m), entry->share, here) &&
-                      set_value(KeyText(key::kLunEnable, n, m), 1, here) &&
-                      set_value(KeyText(key::kLunAccessRight, n, m), VOL_AC_RW, here);
+  const bool stored = set_value(KeyText(key::kLunNumber, n, m), entry->lun) &&
+                      set_value(KeyText(key::kLunShare, n, m), entry->share) &&
+                      set_value(KeyText(key::kLunEnable, n, m), 1) &&
+                      set_value(KeyText(key::kLunAccessRight, n, m), VOL_AC_RW);
   if (!stored) return kTreeFailed;
   ktree_update_current_luncnt(n);
   return m;
 }
 
 int ktree_add_entry(TargetEntry* entry) {
+  const LogScope scope;
   if (entry == nullptr || entry->target_name[0] == '\0' || entry->ip[0] == '\0' || entry->port < 0) {
     return kFailed;
   }
@@ -385,13 +406,12 @@ int ktree_add_entry(TargetEntry* entry) {
   slots_move();
   entry->db_idx = n;
   remember_target(n, entry->target_name);
-  const Caller here;
-  bool stored = set_value(KeyText(key::kTargetName, n), entry->target_name, here);
-  stored &= set_value(KeyText(key::kTargetChap, n), entry->chap, here);
-  stored &= set_value(KeyText(key::kTargetChapName, n), entry->chap_name, here);
-  stored &= set_value(KeyText(key::kTargetChapPwd, n), entry->chap_pwd, here);
-  stored &= set_value(KeyText(key::kTargetIp, n), entry->ip, here);
-  stored &= set_value(KeyText(key::kTargetPort, n), entry->port, here);
+  bool stored = set_value(KeyText(key::kTargetName, n), entry->target_name);
+  stored &= set_value(KeyText(key::kTargetChap, n), entry->chap);
+  stored &= set_value(KeyText(key::kTargetChapName, n), entry->chap_name);
+  stored &= set_value(KeyText(key::kTargetChapPwd, n), entry->chap_pwd);
+  stored &= set_value(KeyText(key::kTargetIp, n), entry->ip);
+  stored &= set_value(KeyText(key::kTargetPort, n), entry->port);
   return stored ? n : kFailed;
 }
 

@@ -28,6 +28,7 @@ bool is_half_made_target(int n) {
 }
 
 void drop(const char* path) {
+  const LogScope scope;
   LOG(0, "half made slot '%s' is deleted", path);
   if (delete_slot(path) != kOk) LOG(0, "ktreec_del() of path '%s' failed", path);
 }

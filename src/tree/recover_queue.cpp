@@ -12,6 +12,7 @@
 namespace remvol {
 
 int ktree_get_free_recover_queue_db_idx() {
+  const LogScope scope;
   for (int q = 1; q <= kMaxRecoverQueue; q++) {
     if (!tree_slot_is_free(KeyText(key::kRecoverName, q))) continue;
     LOG(3, "free ent id: %d", q);
@@ -21,6 +22,7 @@ int ktree_get_free_recover_queue_db_idx() {
 }
 
 int ktree_insert_recover_queue(const char* target_name) {
+  const LogScope scope;
   const int q = ktree_get_free_recover_queue_db_idx();
   if (q < 1) {
     LOG(0, "db failed or exceed max queue length");
@@ -32,6 +34,7 @@ int ktree_insert_recover_queue(const char* target_name) {
 }
 
 int ktree_pop_recover_queue(char* target_name) {
+  const LogScope scope;
   char name[256];
   if (!tree_read(KeyText(key::kRecoverName, 1), name)) return kFailed;
   memcpy(target_name, name, sizeof name);

@@ -15,26 +15,26 @@ namespace remvol {
 
 namespace {
 
-int publish(const char* socket, const char* key, const char* value, Caller caller) {
-  LOG_AT(caller, 1, "ktreec_set %s=%s", key, value);
+int publish(const char* socket, const char* key, const char* value) {
+  LOG(1, "ktreec_set %s=%s", key, value);
   if (tree_write_to(socket, key, value) == kOk) return kOk;
-  LOG_AT(caller, 0, "ktreec_set(%s) failed", key);
+  LOG(0, "ktreec_set(%s) failed", key);
   return kTreeFailed;
 }
 
 // Publishes the k-th LUN found. `dbidx` is the slot of its target, below 1 when the target is not stored.
-int publish_lun(const char* socket, const LunNode* lun, int k, int dbidx, Caller caller) {
+int publish_lun(const char* socket, const LunNode* lun, int k, int dbidx) {
   const NumberText number("%u", static_cast<unsigned>(lun->lun));
   const NumberText size("%llu", static_cast<unsigned long long>(lun->size));
-  int result = publish(socket, KeyText(key::kLunSearchLun, k), number, caller);
-  if (result == kOk) result = publish(socket, KeyText(key::kLunSearchSize, k), size, caller);
+  int result = publish(socket, KeyText(key::kLunSearchLun, k), number);
+  if (result == kOk) result = publish(socket, KeyText(key::kLunSearchSize, k), size);
   if (result != kOk) return result;
   const int in_system = dbidx >= 1 && ktree_get_dbidx_by_lun(dbidx, lun->lun) >= 1 ? 1 : 0;
   const int available = 1 - in_system;
   printf("lun%d, insys=%d, avail=%d\n", lun->lun, in_system, available);
-  result = publish(socket, KeyText(key::kLunSearchAvailable, k), NumberText("%d", available), caller);
+  result = publish(socket, KeyText(key::kLunSearchAvailable, k), NumberText("%d", available));
   if (result != kOk) return result;
-  return publish(socket, KeyText(key::kLunSearchFsType, k), lun->fs_type, caller);
+  return publish(socket, KeyText(key::kLunSearchFsType, k), lun->fs_type);
 }
 
 bool share_is_used_in(int dbidx, const char* share) {
@@ -49,24 +49,26 @@ bool share_is_used_in(int dbidx, const char* share) {
 }  // namespace
 
 int ktree_update_search_lun_result(const char* socket, const LunNode* luns, const char* target_name) {
+  const LogScope scope;
   if (target_name == nullptr) return kFailed;
-  const Caller here;
   const int dbidx = ktree_get_dbidx_by_targetname(target_name);
-  int result = publish(socket, key::kLunSearchTarget, target_name, here);
+  int result = publish(socket, key::kLunSearchTarget, target_name);
   if (result != kOk) return result;
   int count = 0;
   for (const LunNode* lun = luns; lun != nullptr; lun = lun->next) {
-    result = publish_lun(socket, lun, ++count, dbidx, here);
+    result = publish_lun(socket, lun, ++count, dbidx);
     if (result != kOk) return result;
   }
-  return publish(socket, key::kLunSearchCount, NumberText("%d", count), here);
+  return publish(socket, key::kLunSearchCount, NumberText("%d", count));
 }
 
 int ktree_update_search_lun_err_code(const char* socket, int code) {
+  const LogScope scope;
   return tree_write_with_tries_to(socket, key::kLunSearchError, NumberText("%d", code));
 }
 
 int ktree_check_duplicate_share_name(const char* share) {
+  const LogScope scope;
   const SlotsHeld held;
   for (int n = 1; n <= kMaxTargets; n++) {
     if (!share_is_used_in(n, share)) continue;

@@ -79,9 +79,9 @@ bool find_version(FileText text) {
 }
 
 // Where the folder is missing nobody keeps settings: that is no line of the log, which programs read.
-void tell_failed_dump(Caller caller) {
+void tell_failed_dump() {
   if (access(kSettingsFolder, F_OK) == 0) {
-    LOG_AT(caller, 0, "ktreec_dump(%s) failed", kSettingsFile);
+    LOG(0, "ktreec_dump(%s) failed", kSettingsFile);
   } else {
     begin_line(0, stderr);
     fprintf(stderr, "remvol: the settings are not saved, there is no %s\n", kSettingsFolder);
@@ -110,22 +110,22 @@ bool dump_would_bury_settings() {
   return !tree_present(key::kVersion) && settings_file_has_version(kSettingsFile);
 }
 
-bool store_settings(Caller caller) {
+bool store_settings() {
   if (dump_would_bury_settings()) {
-    LOG_AT(caller, 0, "%s is kept as it is: the tree was never loaded from it", kSettingsFile);
+    LOG(0, "%s is kept as it is: the tree was never loaded from it", kSettingsFile);
     return false;
   }
   if (ktreec_dump(main_socket, 0, kSettingsFile) == 0) return true;
-  tell_failed_dump(caller);
+  tell_failed_dump();
   return !settings_file_is_torn(kSettingsFile);
 }
 
 // By a link, so that there is a settings file at every moment; a file system without links gets it renamed.
-void keep_damaged_settings(Caller caller) {
+void keep_damaged_settings() {
   unlink(kDamagedSettingsFile);
   if (link(kSettingsFile, kDamagedSettingsFile) == 0 || errno == ENOENT) return;
   if (rename(kSettingsFile, kDamagedSettingsFile) == 0) return;
-  LOG_AT(caller, 0, "%s cannot be kept as %s", kSettingsFile, kDamagedSettingsFile);
+  LOG(0, "%s cannot be kept as %s", kSettingsFile, kDamagedSettingsFile);
 }
 
 }  // namespace remvol

@@ -20,10 +20,10 @@ namespace remvol {
 // Dumps the tree to kSettingsFile. A dump that is withheld or fails is logged at level 0 in the caller's
 // name; one for which there is no folder is told on standard error. Returns whether what kSettingsFile holds
 // then may go to the configuration flash.
-[[nodiscard]] bool store_settings(Caller caller = Caller());
+[[nodiscard]] bool store_settings();
 
 // Keeps kSettingsFile, which could not be loaded, under the name kDamagedSettingsFile as well.
-void keep_damaged_settings(Caller caller = Caller());
+void keep_damaged_settings();
 
 inline constexpr char kDamagedSettingsFile[] = "/etc/NAS_CFG/vv.xml.damaged";
 

@@ -158,20 +158,20 @@ int find_slot(int slot, int last, Holds holds) {
   return kGone;
 }
 
-int find_target(int n, Caller caller) {
+int find_target(int n) {
   if (!is_target_slot(n) || known_slots[n].target[0] == '\0') return n;
   const char* name = known_slots[n].target;
   const int now = find_slot(n, kMaxTargets, [name](int slot) { return holds_target(slot, name); });
-  if (now == kGone) LOG_AT(caller, 1, "target %s is stored no more", name);
+  if (now == kGone) LOG(1, "target %s is stored no more", name);
   return now;
 }
 
-int find_lun(int n, int m, int target, Caller caller) {
+int find_lun(int n, int m, int target) {
   if (!is_lun_slot(n, m) || known_lun(n, m) == kNoLun) return m;
   const int lun = known_lun(n, m);
   const int now =
       find_slot(m, kMaxLunsPerTarget, [target, lun](int slot) { return holds_lun(target, slot, lun); });
-  if (now == kGone) LOG_AT(caller, 1, "lun %d of target %s is stored no more", lun, known_slots[n].target);
+  if (now == kGone) LOG(1, "lun %d of target %s is stored no more", lun, known_slots[n].target);
   return now;
 }
 
@@ -194,8 +194,8 @@ void SlotsHeld::let_go() {
   slots_lock.pause();
 }
 
-HeldSlot::HeldSlot(int n, int m, Caller caller)
-    : target_(find_target(n, caller)), lun_(target_ != kGone ? find_lun(n, m, target_, caller) : kGone) {
+HeldSlot::HeldSlot(int n, int m)
+    : target_(find_target(n)), lun_(target_ != kGone ? find_lun(n, m, target_) : kGone) {
   found_ = target_ != kGone && (m == 0 || lun_ != kGone);
 }
 
@@ -262,11 +262,13 @@ void remember_all_targets() {
 }
 
 int target_slot_after(int n) {
+  const LogScope scope;
   const HeldSlot slot(n);
   return slot ? slot.target() + 1 : n;
 }
 
 int lun_slot_after(int n, int m) {
+  const LogScope scope;
   const HeldSlot slot(n, m);
   return slot ? slot.lun() + 1 : m;
 }

@@ -39,7 +39,7 @@ class SlotsHeld {
 class HeldSlot {
  public:
   // `m` 0: the target's slot alone. A slot that is stored no more is logged at level 1 in the caller's name.
-  explicit HeldSlot(int n, int m = 0, Caller caller = Caller());
+  explicit HeldSlot(int n, int m = 0);
 
   // False when what the slot stood for is stored no more. A number that this run has read nothing from, and
   // one in a tree that does not answer, is taken as it is.

@@ -11,6 +11,7 @@
 namespace remvol {
 
 int ktree_set_connect_state(int dbidx, int state) {
+  const LogScope scope;
   const SlotsHeld held(SlotsHeld::kChange);  // not between the looks of a run that composes the status
   const HeldSlot slot(dbidx);
   if (!slot) return kTreeFailed;
@@ -21,6 +22,7 @@ int ktree_set_connect_state(int dbidx, int state) {
 }
 
 int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx) {
+  const LogScope scope;
   if (right != VOL_AC_RW && right != VOL_AC_RO) {
     LOG(0, "volume access right should be VOL_AC_RW or VOL_AC_RO, but you given %d", right);
     return kFailed;
@@ -36,6 +38,7 @@ int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx) {
 }
 
 int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx) {
+  const LogScope scope;
   if (right == nullptr) {
     LOG(0, "vol_ac is null");
     return kFailed;
@@ -52,6 +55,7 @@ int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx) {
 }
 
 int ktree_update_formatting_state(const TargetEntry* entry, int state) {
+  const LogScope scope;
   if (entry->db_idx < 1 || entry->lun_db_idx < 1) {
     // Only a warning: the tree itself refuses a slot below 1.
     LOG(0, "target or lun db index not given");
@@ -74,6 +78,7 @@ bool is_no_lun_formatting(const char* target_name) {
 }
 
 int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent) {
+  const LogScope scope;
   if (dbidx < 1 || lun_dbidx < 1) {
     LOG(0, "target or lun db index not given");
     return kFailed;
@@ -87,6 +92,7 @@ int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent) {
 }
 
 int ktree_update_volume_state(const TargetEntry* entry, int state) {
+  const LogScope scope;
   const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
   if (!slot) return kTreeFailed;
   const KeyText key(key::kLunVolumeState, slot.target(), slot.lun());
@@ -111,6 +117,7 @@ int ktree_update_all_volume_state(TargetEntry* entry, int state) {
 
 int ktree_update_mount_info(TargetEntry* entry, const char* node, const char* mount_point,
                             const char* fs_type) {
+  const LogScope scope;
   copy_text(entry->mnt_dev, node);
   copy_text(entry->mnt, mount_point);
   const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
@@ -124,10 +131,12 @@ int ktree_update_mount_info(TargetEntry* entry, const char* node, const char* mo
 }
 
 int ktree_update_initiator_iqn(const char* name) {
+  const LogScope scope;
   return tree_write_with_tries(key::kInitiatorName, name);
 }
 
 int ktree_record_connect_set(const TargetEntry* entry) {
+  const LogScope scope;
   const HeldSlot slot(entry->db_idx);
   if (!slot) return kTreeFailed;
   const KeyText key(key::kTargetConnSet, slot.target());

@@ -22,9 +22,9 @@ using StatusText = Text<64>;
 
 constexpr int kStatusTries = 3;
 
-int write_logged(const char* key, const char* value, Caller caller) {
-  LOG_AT(caller, 1, "ktreec_set %s=%s", key, value);
-  return tree_write_with_tries(key, value, caller);
+int write_logged(const char* key, const char* value) {
+  LOG(1, "ktreec_set %s=%s", key, value);
+  return tree_write_with_tries(key, value);
 }
 
 // The text, marked when the volume is read-only.
@@ -64,70 +64,69 @@ StatusText unformatted_text(const TargetEntry* entry, const LunState& state) {
 }
 
 // Writes a status text and a size; both are tried even when the first fails.
-int write_status(const TargetEntry* entry, const char* text, const char* size, Caller caller) {
+int write_status(const TargetEntry* entry, const char* text, const char* size) {
   const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
   if (!slot) return kTreeFailed;
   const int n = slot.target();
   const int m = slot.lun();
-  const int status_result = write_logged(KeyText(key::kLunStatus, n, m), text, caller);
-  const int size_result = write_logged(KeyText(key::kLunSize, n, m), size, caller);
+  const int status_result = write_logged(KeyText(key::kLunStatus, n, m), text);
+  const int size_result = write_logged(KeyText(key::kLunSize, n, m), size);
   return status_result != kOk ? status_result : size_result;
 }
 
-int write_fs_type(const TargetEntry* entry, const char* fs_type, Caller caller) {
+int write_fs_type(const TargetEntry* entry, const char* fs_type) {
   const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
   if (!slot) return kTreeFailed;
-  return write_logged(KeyText(key::kLunFsType, slot.target(), slot.lun()), fs_type, caller);
+  return write_logged(KeyText(key::kLunFsType, slot.target(), slot.lun()), fs_type);
 }
 
 // The text of a LUN on which the file system `fs_type` was recognised.
-int write_recognised(const TargetEntry* entry, const LunState& state, const char* fs_type, Caller caller) {
-  const int type_result = write_fs_type(entry, fs_type, caller);
+int write_recognised(const TargetEntry* entry, const LunState& state, const char* fs_type) {
+  const int type_result = write_fs_type(entry, fs_type);
   unsigned long long total = 0;
   unsigned long long used = 0;
   unsigned long long available = 0;
   const MountPointText mount_point = mount_point_of(entry->share);
   int result = kOk;
   if (sys_get_df_info(mount_point, &total, &used, &available) == 0) {
-    result =
-        write_status(entry, with_right("Running", state.right), Text<64>("%llu/%llu", used, total), caller);
+    result = write_status(entry, with_right("Running", state.right), Text<64>("%llu/%llu", used, total));
   } else {
-    result = write_status(entry, unmounted_text(entry, state), "0/0", caller);
+    result = write_status(entry, unmounted_text(entry, state), "0/0");
   }
   return type_result != kOk ? type_result : result;
 }
 
 // The size of a disabled LUN stays as it was.
-int write_disabled(const TargetEntry* entry, Caller caller) {
+int write_disabled(const TargetEntry* entry) {
   const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
   if (!slot) return kTreeFailed;
-  return write_logged(KeyText(key::kLunStatus, slot.target(), slot.lun()), "Disable", caller);
+  return write_logged(KeyText(key::kLunStatus, slot.target(), slot.lun()), "Disable");
 }
 
-int compose_lun_status(const TargetEntry* entry, bool formatting, const LunState& state, Caller caller) {
-  if (!state.enabled) return write_disabled(entry, caller);
-  if (formatting) return write_status(entry, progress_text(entry), "0/0", caller);
-  if (entry->dev[0] == '\0') return write_status(entry, "Offline", "0/0", caller);
+int compose_lun_status(const TargetEntry* entry, bool formatting, const LunState& state) {
+  if (!state.enabled) return write_disabled(entry);
+  if (formatting) return write_status(entry, progress_text(entry), "0/0");
+  if (entry->dev[0] == '\0') return write_status(entry, "Offline", "0/0");
   char fs_type[16] = "";
   if (sys_get_fs_type(fs_type, entry->mnt_dev) == 0) {
-    return write_recognised(entry, state, fs_type, caller);
+    return write_recognised(entry, state, fs_type);
   }
-  return write_status(entry, unformatted_text(entry, state), "0/0", caller);
+  return write_status(entry, unformatted_text(entry, state), "0/0");
 }
 
-int write_target_status(int dbidx, const char* text, Caller caller) {
+int write_target_status(int dbidx, const char* text) {
   const HeldSlot slot(dbidx);
   if (!slot) return kTreeFailed;
-  return write_logged(KeyText(key::kTargetStatus, slot.target()), text, caller);
+  return write_logged(KeyText(key::kTargetStatus, slot.target()), text);
 }
 
 // Writes a status text and the connect state that goes with it; the result of the latter hides that of the
 // former. `printed` is the state that a failure names: those who read the log know it as 1 for a connected
 // target and 0 for every other.
-int write_with_state(int dbidx, const char* text, int state, int printed, Caller caller) {
-  write_target_status(dbidx, text, caller);
+int write_with_state(int dbidx, const char* text, int state, int printed) {
+  write_target_status(dbidx, text);
   const int result = ktree_set_connect_state(dbidx, state);
-  if (result != kOk) LOG_AT(caller, 0, "ktree_set_connect_state(%d, %d) failed", dbidx, printed);
+  if (result != kOk) LOG(0, "ktree_set_connect_state(%d, %d) failed", dbidx, printed);
   return result;
 }
 
@@ -137,11 +136,11 @@ int read_connect_state(int dbidx) {
   return state;
 }
 
-int write_target_state(int n, bool connected, int state, Caller caller) {
-  if (connected) return write_with_state(n, "Connected", kConnected, 1, caller);
-  if (state == kConnecting) return write_with_state(n, "Connecting", kConnecting, 0, caller);
-  if (state != kConnectError) return write_with_state(n, "Disconnected", kDisconnected, 0, caller);
-  return write_target_status(n, "Connect Error", caller);
+int write_target_state(int n, bool connected, int state) {
+  if (connected) return write_with_state(n, "Connected", kConnected, 1);
+  if (state == kConnecting) return write_with_state(n, "Connecting", kConnecting, 0);
+  if (state != kConnectError) return write_with_state(n, "Disconnected", kDisconnected, 0);
+  return write_target_status(n, "Connect Error");
 }
 
 }  // namespace
@@ -151,20 +150,20 @@ int ktree_update_status(const TargetEntry* entry) {
 }
 
 int ktree_update_status(const TargetEntry* entry, int state) {
+  const LogScope scope;
   const int n = entry->db_idx;
-  const Caller here;
   bool connected = false;
   // While the sessions are listed another run may bring the target up, or fail to: what it wrote counts then.
   for (int tries = 0; tries < kStatusTries; tries++) {
-    if (state == kRecovering && entry->conn_set == 1) return write_target_status(n, "Reconnecting", here);
+    if (state == kRecovering && entry->conn_set == 1) return write_target_status(n, "Reconnecting");
     connected = check_target_connected(entry->target_name) == 1;
     const SlotsHeld held(SlotsHeld::kChange);
     const int seen = std::exchange(state, read_connect_state(n));
-    if (state == seen) return write_target_state(n, connected, state, here);
+    if (state == seen) return write_target_state(n, connected, state);
   }
   const SlotsHeld held(SlotsHeld::kChange);
-  if (state == kRecovering && entry->conn_set == 1) return write_target_status(n, "Reconnecting", here);
-  return write_target_state(n, connected, state, here);
+  if (state == kRecovering && entry->conn_set == 1) return write_target_status(n, "Reconnecting");
+  return write_target_state(n, connected, state);
 }
 
 int read_lun_state(int dbidx, int lun_dbidx, LunState* state) {
@@ -178,6 +177,7 @@ int read_lun_state(int dbidx, int lun_dbidx, LunState* state) {
 }
 
 int ktree_update_lun_status(const TargetEntry* entry, int formatting) {
+  const LogScope scope;
   LOG(2, "update lun status start");
   if (entry->db_idx < 1 || entry->lun_db_idx < 1) {
     LOG(1, "target or lun db index not given");
@@ -188,14 +188,15 @@ int ktree_update_lun_status(const TargetEntry* entry, int formatting) {
     LOG(0, "ktree_get_lun_vol_access_right() failed");
     return kFailed;
   }
-  const int result = compose_lun_status(entry, formatting != 0, state, Caller());
+  const int result = compose_lun_status(entry, formatting != 0, state);
   LOG(2, "update status end");
   return result;
 }
 
 int ktree_update_lun_status(const TargetEntry* entry, const LunState& state) {
+  const LogScope scope;
   LOG(2, "update lun status start");
-  const int result = compose_lun_status(entry, state.format == kFormatting, state, Caller());
+  const int result = compose_lun_status(entry, state.format == kFormatting, state);
   LOG(2, "update status end");
   return result;
 }

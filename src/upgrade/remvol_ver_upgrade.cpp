@@ -32,33 +32,32 @@ constexpr MovedState kMovedStates[] = {
     {key::kOldVolumeState, key::kLunVolumeState},
 };
 
-int set_value(const char* key, const char* value, Caller caller) {
+int set_value(const char* key, const char* value) {
   if (tree_write(key, value) == kOk) return kOk;
-  LOG_AT(caller, 0, "ktreec_set() failed");
+  LOG(0, "ktreec_set() failed");
   return kFailed;
 }
 
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wformat-nonliteral"  // the formats are those of the table above
-void move_state(int n, const MovedState& state, Caller caller) {
+void move_state(int n, const MovedState& state) {
   char value[256];
   if (!tree_read(KeyText(state.from, n), value)) return;
   const KeyText key(state.to, n, kLunSlot);
   const NumberText number("%d", atoi(value));
-  if (tree_write(key, number) != kOk)
-    LOG_AT(caller, 0, "ktreec_set %s= %s failed", key.c_str(), number.c_str());
+  if (tree_write(key, number) != kOk) LOG(0, "ktreec_set %s= %s failed", key.c_str(), number.c_str());
 }
 #pragma GCC diagnostic pop
 
 // The target's share becomes its LUN's. A share that is missing is logged as a failed write: that is how
 // those who read the log know it.
-int move_share(int n, Caller caller) {
+int move_share(int n) {
   char share[256];
   if (!tree_read(KeyText(key::kOldShare, n), share)) {
-    LOG_AT(caller, 0, "ktreec_set() failed");
+    LOG(0, "ktreec_set() failed");
     return kFailed;
   }
-  return set_value(KeyText(key::kLunShare, n, kLunSlot), share, caller);
+  return set_value(KeyText(key::kLunShare, n, kLunSlot), share);
 }
 
 // A conversion would make the first LUN of such a target its number 0 and forget the others. One that was
@@ -68,55 +67,55 @@ bool is_in_todays_form(int n) {
          tree_present(KeyText(key::kLunShare, n, kLunSlot));
 }
 
-int upgrade_target(int n, Caller caller) {
+int upgrade_target(int n) {
   const KeyText name(key::kTargetName, n);
   if (tree_slot_is_free(name)) {
-    LOG_AT(caller, 2, "get %s fail", name.c_str());
+    LOG(2, "get %s fail", name.c_str());
     return kFailed;
   }
   if (is_in_todays_form(n)) {
-    LOG_AT(caller, 1, "%s is in today's form", name.c_str());
+    LOG(1, "%s is in today's form", name.c_str());
     return kOk;
   }
-  if (set_value(KeyText(key::kTargetLunCount, n), "1", caller) != kOk ||
-      set_value(KeyText(key::kLunNumber, n, kLunSlot), "0", caller) != kOk ||
-      set_value(KeyText(key::kLunEnable, n, kLunSlot), "1", caller) != kOk ||
-      set_value(KeyText(key::kLunAccessRight, n, kLunSlot), NumberText("%d", VOL_AC_RW), caller) != kOk ||
-      move_share(n, caller) != kOk) {
+  if (set_value(KeyText(key::kTargetLunCount, n), "1") != kOk ||
+      set_value(KeyText(key::kLunNumber, n, kLunSlot), "0") != kOk ||
+      set_value(KeyText(key::kLunEnable, n, kLunSlot), "1") != kOk ||
+      set_value(KeyText(key::kLunAccessRight, n, kLunSlot), NumberText("%d", VOL_AC_RW)) != kOk ||
+      move_share(n) != kOk) {
     return kFailed;
   }
-  for (const MovedState& state : kMovedStates) move_state(n, state, caller);
+  for (const MovedState& state : kMovedStates) move_state(n, state);
   return kOk;
 }
 
-int upgrade_targets(Caller caller) {
+int upgrade_targets() {
   char text[256];
   if (!tree_read(key::kTargetCount, text)) {
-    LOG_AT(caller, 1, "%s is NULL or disappear, exit func", key::kTargetCount);
+    LOG(1, "%s is NULL or disappear, exit func", key::kTargetCount);
     return kOk;
   }
   const int count = atoi(text);
   if (count <= 0) {
-    LOG_AT(caller, 1, "%s = 0, exit func", key::kTargetCount);
+    LOG(1, "%s = 0, exit func", key::kTargetCount);
     return kOk;
   }
   for (int n = 1; n <= count; n++) {
-    if (upgrade_target(n, caller) != kOk) return kFailed;
+    if (upgrade_target(n) != kOk) return kFailed;
   }
   return kOk;
 }
 
-int upgrade_from(int stored, int current, Caller caller) {
+int upgrade_from(int stored, int current) {
   if (stored > current) {
     print_open(0, "remvol: Do not support settings downgrade to version %d", current);
     return kFailed;
   }
   if (current == stored) {
-    LOG_AT(caller, 2, "the same version, EXIT");
+    LOG(2, "the same version, EXIT");
     return kOk;
   }
   if (stored != 0) {
-    LOG_AT(caller, 1, "Not supported versions, EXIT");
+    LOG(1, "Not supported versions, EXIT");
     return kOk;
   }
   const int result = version_upgrade_v0_to_v1();
@@ -146,6 +145,7 @@ int is_remvol_ver_changed() {
 }
 
 int set_remvol_ver_to_db(int version) {
+  const LogScope scope;
   const NumberText value("%d", version);
   if (tree_write(key::kVersion, value) == kOk) return kOk;
   LOG(0, "ktreec_set %s = %s failed", key::kVersion, value.c_str());
@@ -153,25 +153,28 @@ int set_remvol_ver_to_db(int version) {
 }
 
 void delete_fw_flag() {
+  const LogScope scope;
   if (tree_delete(key::kFirmwareUpgrade) != kOk) LOG(2, "ktreec_del %s failed", key::kFirmwareUpgrade);
 }
 
 int version_upgrade_v0_to_v1() {
+  const LogScope scope;
   LOG(1, "v0 to v1 start");
   const SlotsHeld held(SlotsHeld::kChange);  // a LUN that is half converted looks like garbage to other runs
   slots_move();
-  const int result = upgrade_targets(Caller());
+  const int result = upgrade_targets();
   LOG(1, "v0 to v1 end, ret = %d", result);
   return result;
 }
 
 int version_upgrade() {
+  const LogScope scope;
   LOG(1, "Start remvol settings upgrade");
   int stored = 0;
   int current = 0;
   int result = compare_remvol_ver(&stored, &current) < 0 ? kFailed : kOk;
   LOG(2, "preious version = %d, now version = %d", stored, current);
-  if (result == kOk) result = upgrade_from(stored, current, Caller());
+  if (result == kOk) result = upgrade_from(stored, current);
   delete_fw_flag();
   LOG(1, "Finish remvol settings upgrade");
   return result;

@@ -57,24 +57,24 @@ int field_right(const char* field) {
 }
 
 // Returns whether the table line of `source` is one of `device`: the device itself or a partition of it.
-bool is_source_of(const char* source, const char* device, Caller caller = Caller()) {
+bool is_source_of(const char* source, const char* device) {
   const char* match = strstr(source, device);
   if (match == nullptr) return false;
-  LOG_AT(caller, 2, "get a possible entry dev = |%s|", match);
+  LOG(2, "get a possible entry dev = |%s|", match);
   const char next = match[strlen(device)];
   if (next == '\0' || isdigit(static_cast<unsigned char>(next)) != 0) return true;
-  LOG_AT(caller, 2, "%s is not under %s, skip", match, device);
+  LOG(2, "%s is not under %s, skip", match, device);
   return false;
 }
 
 // Return the right that one line of a table gives `device`; kNotMounted when it is of another one. They cut
 // the line up.
-using LineReader = int (*)(char* line, const char* device, Caller caller);
+using LineReader = int (*)(char* line, const char* device);
 
-int read_mount_line(char* line, const char* device, Caller caller) {
+int read_mount_line(char* line, const char* device) {
   char* rest = nullptr;
   const char* source = strtok_r(line, kSeparators, &rest);
-  if (source == nullptr || !is_source_of(source, device, caller)) return kNotMounted;
+  if (source == nullptr || !is_source_of(source, device)) return kNotMounted;
   while (const char* field = strtok_r(nullptr, kSeparators, &rest)) {
     if (field[0] == '/') continue;
     const int right = field_right(field);
@@ -85,14 +85,14 @@ int read_mount_line(char* line, const char* device, Caller caller) {
 
 // A line of /proc/self/mountinfo, see proc_pid_mountinfo(5): the mount's own options are its sixth field, the
 // source is the second one after the separator.
-int read_mountinfo_line(char* line, const char* device, Caller caller) {
+int read_mountinfo_line(char* line, const char* device) {
   char* separator = strstr(line, " - ");
   if (separator == nullptr) return kNotMounted;
   *separator = '\0';
   char* rest = nullptr;
   strtok_r(separator + 3, kSeparators, &rest);
   const char* source = strtok_r(nullptr, kSeparators, &rest);
-  if (source == nullptr || !is_source_of(source, device, caller)) return kNotMounted;
+  if (source == nullptr || !is_source_of(source, device)) return kNotMounted;
   const char* options = strtok_r(line, kSeparators, &rest);
   for (int field = 1; field < 6 && options != nullptr; field++)
     options = strtok_r(nullptr, kSeparators, &rest);
@@ -100,20 +100,19 @@ int read_mountinfo_line(char* line, const char* device, Caller caller) {
 }
 
 // Reads a table up to the first line that decides, in reads of at most `limit` characters.
-int read_table(const char* device, const char* table, LineReader read_line, int limit,
-               Caller caller = Caller()) {
+int read_table(const char* device, const char* table, LineReader read_line, int limit) {
   const File file(fopen(table, "re"));
   if (!file) {
-    LOG_AT(caller, 0, "failed to open mtab file at %s", table);
+    LOG(0, "failed to open mtab file at %s", table);
     return kTableUnreadable;
   }
   int right = kNotMounted;
   char line[kMountInfoLine + 1];
   while (right != kMountedRw && right != kMountedRo && fgets(line, limit + 1, file.get()) != nullptr) {
-    const int found = read_line(line, device, caller);
+    const int found = read_line(line, device);
     if (found != kNotMounted) right = found;
   }
-  LOG_AT(caller, 2, "get mnt file access right = %d for dev %s", right, device);
+  LOG(2, "get mnt file access right = %d for dev %s", right, device);
   return right;
 }
 
@@ -132,11 +131,13 @@ bool is_mtab_live() {
 }  // namespace
 
 int get_mnt_ac_right_from_mnt_file(const char* device, const char* table) {
+  const LogScope scope;
   if (!is_valid(device)) return kTableUnreadable;
   return read_table(device, table, read_mount_line, kMountLine);
 }
 
 int get_mtab_access_right(const char* device) {
+  const LogScope scope;
   if (!is_valid(device)) {
     LOG(0, "dev is not valid value");
     return kTableUnreadable;
@@ -148,6 +149,7 @@ int get_mtab_access_right(const char* device) {
 }
 
 int get_proc_mount_access_right(const char* device) {
+  const LogScope scope;
   if (!is_valid(device)) {
     LOG(0, "dev is not valid value");
     return kTableUnreadable;
@@ -158,6 +160,7 @@ int get_proc_mount_access_right(const char* device) {
 }
 
 int check_mnt_dev_degrade_to_ro(const char* device, const char* mount_path) {
+  const LogScope scope;
   if (!is_valid(device)) {
     LOG(0, "dev is not valid!");
     return -2;

@@ -28,24 +28,24 @@ struct DirCloser {
 };
 
 // Returns where sysfs describes the device: a partition below its disk. Logs the disk of a partition.
-PathText sysfs_dir(const char* name, Caller caller = Caller()) {
+PathText sysfs_dir(const char* name) {
   char parent[256];
   if (!get_parent_disk(parent, name)) return PathText("%s/%s", kBlockDir, name);
-  LOG_AT(caller, 2, "get parent dev = %s", parent);
+  LOG(2, "get parent dev = %s", parent);
   return PathText("%s/%s/%s", kBlockDir, parent, name);
 }
 
-bool parse_number(const char* text, unsigned* number, Caller caller = Caller()) {
+bool parse_number(const char* text, unsigned* number) {
   errno = 0;
   *number = static_cast<unsigned>(strtol(text, nullptr, 10));
   if (errno == 0) return true;
   const int error = errno;
-  LOG_AT(caller, 0, "strtol failed, error = %d (%s)", error, strerror(error));
+  LOG(0, "strtol failed, error = %d (%s)", error, strerror(error));
   return false;
 }
 
 // Makes the node unless it is a block device already, whatever its numbers.
-void make_node(const char* name, const DeviceId& id, Caller caller = Caller()) {
+void make_node(const char* name, const DeviceId& id) {
   const PathText node("%s/%s", kNodeDir, name);
   struct stat status;
   if (stat(node, &status) == 0) {
@@ -55,16 +55,16 @@ void make_node(const char* name, const DeviceId& id, Caller caller = Caller()) {
   errno = 0;
   if (mknod(node, kNodeMode, makedev(id.major, id.minor)) == 0 && errno == 0) return;
   const int error = errno;
-  LOG_AT(caller, 0, "mknod failed with errno = %d (%s)", error, strerror(error));
+  LOG(0, "mknod failed with errno = %d (%s)", error, strerror(error));
 }
 
 // Makes the nodes of the disk's partitions. Whether an entry is a directory is asked by its bare name, which
 // the working directory seldom has, and an answer that fails leaves the one before in force: in the usual
 // case the partitions' nodes are left to the kernel.
-void make_partition_nodes(const char* disk, const char* directory_path, Caller caller = Caller()) {
+void make_partition_nodes(const char* disk, const char* directory_path) {
   const std::unique_ptr<DIR, DirCloser> directory(opendir(directory_path));
   if (!directory) {
-    LOG_AT(caller, 0, "can not open directory : %s", directory_path);
+    LOG(0, "can not open directory : %s", directory_path);
     return;
   }
   struct stat status {};
@@ -73,8 +73,8 @@ void make_partition_nodes(const char* disk, const char* directory_path, Caller c
     if (strncmp(name, disk, strlen(disk)) != 0 || strcmp(name, disk) == 0) continue;
     lstat(name, &status);
     if (!S_ISDIR(status.st_mode)) continue;
-    LOG_AT(caller, 2, "create sub node : %s", name);
-    if (_create_device_node(name) != 0) LOG_AT(caller, 2, "fail to make device node : %s", name);
+    LOG(2, "create sub node : %s", name);
+    if (_create_device_node(name) != 0) LOG(2, "fail to make device node : %s", name);
   }
 }
 
@@ -97,6 +97,7 @@ Text<256> disk_of_node(const char* node) {
 }
 
 int _get_dev_id(DeviceId* id, const char* name) {
+  const LogScope scope;
   if (name == nullptr || name[0] == '\0') return -1;
   const PathText path("%s/dev", sysfs_dir(name).c_str());
   if (check_path_exist(path) != 0) return -1;
@@ -112,6 +113,7 @@ int _get_dev_id(DeviceId* id, const char* name) {
 }
 
 int _create_device_node(const char* name) {
+  const LogScope scope;
   if (name == nullptr) {
     LOG(0, "dev_ostel_n is null");
     return -1;

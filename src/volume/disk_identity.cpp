@@ -97,12 +97,11 @@ bool has_disk(const char* node) {
   return check_path_exist(Text<512>("/sys/block/%s", disk_of_node(node).c_str())) == 0;
 }
 
-bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller) {
+bool is_foreign_disk(const TargetEntry* entry, const char* node) {
   const DiskOwner owner = disk_owner(entry, node);
   if (owner == kDiskOurs) remember_own_disk(entry, node);
   if (owner == kDiskOurs || (owner == kDiskUnknown && !was_own_disk(entry, node))) return false;
-  LOG_AT(caller, 0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun,
-         entry->target_name);
+  LOG(0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun, entry->target_name);
   return true;
 }
 

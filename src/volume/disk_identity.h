@@ -29,7 +29,7 @@ bool has_disk(const char* node);
 // it or ends its users may be done. That is logged at level 0 in the caller's name. A disk that this run has
 // seen to be the entry's and that sysfs knows nothing of any more counts as another one: its session was
 // closed meanwhile, and the name may be given anew at any moment.
-bool is_foreign_disk(const TargetEntry* entry, const char* node, Caller caller = Caller());
+bool is_foreign_disk(const TargetEntry* entry, const char* node);
 
 }  // namespace remvol
 

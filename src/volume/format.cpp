@@ -48,42 +48,42 @@ const char* find_format_command(const char* fs_type) {
   return nullptr;
 }
 
-bool check_arguments(const TargetEntry* entry, const char* partition, Caller caller = Caller()) {
+bool check_arguments(const TargetEntry* entry, const char* partition) {
   if (entry->dev[0] == '\0') {
-    LOG_AT(caller, 0, "dev node name is empty");
+    LOG(0, "dev node name is empty");
     return false;
   }
   if (entry->db_idx <= 0 || entry->lun_db_idx <= 0) {
-    LOG_AT(caller, 0, "target or lun db index is not given");
+    LOG(0, "target or lun db index is not given");
     return false;
   }
   if (partition == nullptr) {
-    LOG_AT(caller, 0, "no formatting dev to do");
+    LOG(0, "no formatting dev to do");
     return false;
   }
   return true;
 }
 
 // A state that could not be stored is logged and forgotten: the format goes on.
-void note_update(int result, Caller caller = Caller()) {
-  if (result != 0) LOG_AT(caller, 0, "Update ktree FAILED");
+void note_update(int result) {
+  if (result != 0) LOG(0, "Update ktree FAILED");
 }
 
 // A partition that carried ext2 or ext3 keeps its kind.
-void choose_fs(FsName& fs_type, const char* partition, Caller caller = Caller()) {
+void choose_fs(FsName& fs_type, const char* partition) {
   char found[64] = "";
   if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') {
-    LOG_AT(caller, 2, "set strFS to default fs: %s", kDefaultFs);
+    LOG(2, "set strFS to default fs: %s", kDefaultFs);
     copy_text(fs_type, kDefaultFs);
     return;
   }
   copy_text(fs_type, found);
 }
 
-CommandText make_format_command(FsName& fs_type, const char* partition, Caller caller = Caller()) {
+CommandText make_format_command(FsName& fs_type, const char* partition) {
   const char* command = find_format_command(fs_type);
   if (command == nullptr) {
-    LOG_AT(caller, 1, "%s is not supported by this program, set file system type to %s", fs_type, kDefaultFs);
+    LOG(1, "%s is not supported by this program, set file system type to %s", fs_type, kDefaultFs);
     copy_text(fs_type, kDefaultFs);
     command = find_format_command(fs_type);
   }
@@ -91,81 +91,79 @@ CommandText make_format_command(FsName& fs_type, const char* partition, Caller c
 }
 
 // Returns the running mke2fs, or null when it could not be started three times.
-FILE* start_mke2fs(FsName& fs_type, const char* partition, Caller caller = Caller()) {
+FILE* start_mke2fs(FsName& fs_type, const char* partition) {
   CommandText command;
   for (int tries = 0; tries < kStartTries; tries++) {
-    command = make_format_command(fs_type, partition, caller);
-    LOG_AT(caller, 2, "popen(%s)", command.c_str());
+    command = make_format_command(fs_type, partition);
+    LOG(2, "popen(%s)", command.c_str());
     FILE* output = popen(command, "r");
     if (output != nullptr) return output;
-    LOG_AT(caller, 0, "popen(%s , ...) failed", command.c_str());
+    LOG(0, "popen(%s , ...) failed", command.c_str());
   }
-  LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
+  LOG(0, "system() of cmd '%s' failed", command.c_str());
   return nullptr;
 }
 
 // Publishes the progress until the output ends. How mke2fs ended is not asked: mounting notices a missing
 // file system.
-void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition, Caller caller = Caller()) {
+void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition) {
   FormatProgress progress{};
   char text[kFormatReadSize];
   while (fgets(text, sizeof text, output) != nullptr) {
     if (!update_format_progress(&progress, text)) continue;
-    LOG_AT(caller, 2, "%s : Percent=%d", partition, progress.percent);
-    note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, progress.percent), caller);
+    LOG(2, "%s : Percent=%d", partition, progress.percent);
+    note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, progress.percent));
   }
   pclose(output);
-  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100), caller);
+  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100));
 }
 
 // Whether the partition, chosen a while ago, may still be formatted. Returns 0, kRefused or kFormatLeftAlone.
-int look_again(const TargetEntry* entry, const char* partition, ContentMark seen_empty,
-               Caller caller = Caller()) {
-  if (is_foreign_disk(entry, partition, caller)) return kRefused;
+int look_again(const TargetEntry* entry, const char* partition, ContentMark seen_empty) {
+  if (is_foreign_disk(entry, partition)) return kRefused;
   if (is_node_mounted(partition)) {
-    LOG_AT(caller, 0, "%s is mounted by now, it is not formatted", partition);
+    LOG(0, "%s is mounted by now, it is not formatted", partition);
     return kFormatLeftAlone;
   }
   if (seen_empty == kNoMark || content_mark(partition) == seen_empty) return 0;
   char found[64] = "";
   if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') return 0;
-  LOG_AT(caller, 0, "%s carries %s by now, it is not formatted", partition, found);
+  LOG(0, "%s carries %s by now, it is not formatted", partition, found);
   return kFormatLeftAlone;
 }
 
 // Whether nothing but the entry's own disk would be overwritten, in this moment, and nobody uses it.
-bool may_overwrite(const TargetEntry* entry, const char* partition, Caller caller) {
-  if (is_foreign_disk(entry, partition, caller)) return false;
+bool may_overwrite(const TargetEntry* entry, const char* partition) {
+  if (is_foreign_disk(entry, partition)) return false;
   if (!is_node_claimed(partition)) return true;
-  LOG_AT(caller, 0, "%s is in use, it is not formatted", partition);
+  LOG(0, "%s is in use, it is not formatted", partition);
   return false;
 }
 
 // Ends everybody else on the partition. Returns 0 or kRefused.
-int end_users(const TargetEntry* entry, const char* partition, Caller caller) {
+int end_users(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
   wait_for_udev(partition);
-  if (is_foreign_disk(entry, partition, caller)) return kRefused;
+  if (is_foreign_disk(entry, partition)) return kRefused;
   System("%s", shell_command("fuser -mk \"%s\"", partition).c_str());
   return 0;
 }
 
 // Returns 0, kRefused or kNotWritable.
-int wipe_beginning(const TargetEntry* entry, const char* partition, Caller caller) {
+int wipe_beginning(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
-  if (!may_overwrite(entry, partition, caller)) return kRefused;
+  if (!may_overwrite(entry, partition)) return kRefused;
   if (System("%s", shell_command("dd if=/dev/zero of=%s bs=1M count=1", partition).c_str()) == 0) return 0;
-  LOG_AT(caller, 1, "dd %s failed, this device is not able to write.", partition);
+  LOG(1, "dd %s failed, this device is not able to write.", partition);
   return kNotWritable;
 }
 
 // Starts mke2fs and waits until it has opened the disk: before that it says nothing. From then on the disk's
 // name can go to no other. Returns 0, kRefused or kNotStarted.
-int begin_making(const TargetEntry* entry, FsName& fs_type, const char* partition, FILE** output,
-                 Caller caller) {
+int begin_making(const TargetEntry* entry, FsName& fs_type, const char* partition, FILE** output) {
   const SessionKept kept(entry->target_name);
-  if (!may_overwrite(entry, partition, caller)) return kRefused;
-  *output = start_mke2fs(fs_type, partition, caller);
+  if (!may_overwrite(entry, partition)) return kRefused;
+  *output = start_mke2fs(fs_type, partition);
   if (*output == nullptr) return kNotStarted;
   pollfd said = {fileno(*output), POLLIN, 0};
   if (said.fd >= 0) poll(&said, 1, kFirstWordMs);
@@ -174,29 +172,30 @@ int begin_making(const TargetEntry* entry, FsName& fs_type, const char* partitio
 
 // Makes the file system, everybody else on the partition ended and its beginning wiped before. Returns 0,
 // kRefused, kNotWritable, or kNotStarted.
-int make_file_system(TargetEntry* entry, const char* partition, Caller caller = Caller()) {
-  note_update(ktree_update_formatting_state(entry, kFormatting), caller);
-  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0), caller);
-  note_update(ktree_update_lun_status(entry, 1), caller);
-  LOG_AT(caller, 2, "format partition %s", partition);
+int make_file_system(TargetEntry* entry, const char* partition) {
+  note_update(ktree_update_formatting_state(entry, kFormatting));
+  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0));
+  note_update(ktree_update_lun_status(entry, 1));
+  LOG(2, "format partition %s", partition);
   const DiskHeld disk(partition);
-  int result = end_users(entry, partition, caller);
+  int result = end_users(entry, partition);
   if (result != 0) return result;
   FsName fs_type;
-  choose_fs(fs_type, partition, caller);
-  result = wipe_beginning(entry, partition, caller);
+  choose_fs(fs_type, partition);
+  result = wipe_beginning(entry, partition);
   if (result != 0) return result;
   sleep(1);
   FILE* output = nullptr;
-  result = begin_making(entry, fs_type, partition, &output, caller);
+  result = begin_making(entry, fs_type, partition, &output);
   if (result != 0) return result;
-  follow_mke2fs(output, entry, partition, caller);
+  follow_mke2fs(output, entry, partition);
   return 0;
 }
 
 }  // namespace
 
 int Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty) {
+  const LogScope scope;
   if (!check_arguments(entry, partition)) return -1;
   int sem_id = -1;
   note_update(ktree_update_formatting_state(entry, kFormatWaiting));
@@ -218,10 +217,12 @@ int Target_format(TargetEntry* entry, const char* partition, ContentMark seen_em
 }
 
 int check_mkfs_process_existing() {
+  const LogScope scope;
   return is_command_running_on("mke2fs", "/dev/sd") ? 0 : 1;
 }
 
 int check_resizing_fs(const char* device) {
+  const LogScope scope;
   LOG(2, "checking if device %s is resizing...", device);
   return is_command_running_on("resize2fs", device) ? 0 : 1;
 }

@@ -71,34 +71,34 @@ struct Volume {
   MountPointText mount_point;
 };
 
-int check_entry(const TargetEntry* entry, Caller caller = Caller()) {
+int check_entry(const TargetEntry* entry) {
   if (entry == nullptr || entry->dev[0] == '\0') {
-    LOG_AT(caller, 0, "Error entry");
+    LOG(0, "Error entry");
     return kFailed;
   }
   if (entry->db_idx <= 0 || entry->lun_db_idx <= 0) {
-    LOG_AT(caller, 0, "Error entry - db_idx or lun_db_idx is not given");
+    LOG(0, "Error entry - db_idx or lun_db_idx is not given");
     return kFailed;
   }
   if (entry->share[0] == '\0') {
-    LOG_AT(caller, 0, "Error entry - share name is empty");
+    LOG(0, "Error entry - share name is empty");
     return kFailed;
   }
-  if (!is_share_inside_root(entry->share, caller)) return kMountNoMountPoint;
+  if (!is_share_inside_root(entry->share)) return kMountNoMountPoint;
   return kOk;
 }
 
 // Updates a state of the LUN; a failure is logged.
-int note_update(int result, Caller caller = Caller()) {
-  if (result != 0) LOG_AT(caller, 0, "Update ktree FAILED");
+int note_update(int result) {
+  if (result != 0) LOG(0, "Update ktree FAILED");
   return result;
 }
 
-int record_access_right(const TargetEntry* entry, int right, Caller caller = Caller()) {
+int record_access_right(const TargetEntry* entry, int right) {
   const int result = ktree_update_lun_vol_access_right(right, entry->db_idx, entry->lun_db_idx);
   if (result != 0) {
-    LOG_AT(caller, 0, "ktree_update_lun_vol_access_right to %s, FAILED, ret = %d",
-           right == VOL_AC_RW ? "RW" : "RO", result);
+    LOG(0, "ktree_update_lun_vol_access_right to %s, FAILED, ret = %d", right == VOL_AC_RW ? "RW" : "RO",
+        result);
   }
   return result;
 }
@@ -156,151 +156,149 @@ int pick_partition(Volume* volume) {
 // Data that nobody asked to overwrite is never formatted: what is recognised on a second look is mounted, and
 // what was recognised on the first is not taken for empty on the second, which only a fault can make of it.
 // Returns whether the node can be used.
-bool protect_data(Volume* volume, Caller caller) {
+bool protect_data(Volume* volume) {
   const bool known = volume->fs_type[0] != '\0';
   if (known && volume->looks_empty) volume->force_format = 0;
   if (known || volume->force_format != 0) return true;
-  LOG_AT(caller, 0, "%s carried a file system a moment ago and shows none now, it is left alone",
-         volume->node.c_str());
+  LOG(0, "%s carried a file system a moment ago and shows none now, it is left alone", volume->node.c_str());
   return false;
 }
 
-int create_file_system(Volume* volume, Caller caller = Caller()) {
-  LOG_AT(caller, kNote, "Got FS type = %s, creating volume", volume->fs_type);
+int create_file_system(Volume* volume) {
+  LOG(kNote, "Got FS type = %s, creating volume", volume->fs_type);
   volume->held.release();
   const int result = Target_format(volume->entry, volume->node, volume->seen_empty);
   if (result == 0 || (result == kFormatLeftAlone && !volume->asked)) return kOk;
-  if (result == -2 && record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
-  LOG_AT(caller, 0, "Create Format FAILED");
+  if (result == -2 && record_access_right(volume->entry, VOL_AC_RO) != 0) return kTreeFailed;
+  LOG(0, "Create Format FAILED");
   return kMountFormatFailed;
 }
 
-int keep_file_system(Volume* volume, Caller caller = Caller()) {
-  LOG_AT(caller, 1, "Got FS type = %s, skip creating volume", volume->fs_type);
+int keep_file_system(Volume* volume) {
+  LOG(1, "Got FS type = %s, skip creating volume", volume->fs_type);
   if (strcmp(volume->fs_type, "ext4") == 0 && sys_check_fs_state(volume->node) != 0) {
     volume->held.release();  // the look takes its time, and another run may kill who holds the node
     System("%s", command_on_node("e2fsck -n -f", volume->node).c_str());  // changes nothing
   }
   const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
-  return note_update(result, caller) != 0 ? kTreeFailed : kOk;
+  return note_update(result) != 0 ? kTreeFailed : kOk;
 }
 
 // Leaves the chosen partition with a known file system.
-int prepare_file_system(Volume* volume, Caller caller = Caller()) {
-  LOG_AT(caller, 2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
+int prepare_file_system(Volume* volume) {
+  LOG(2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
   if (!volume->asked) volume->seen_empty = content_mark(volume->node);
   detect_fs(volume);
-  if (!protect_data(volume, caller)) return kMountNoPartition;
-  const int result =
-      volume->force_format != 0 ? create_file_system(volume, caller) : keep_file_system(volume, caller);
+  if (!protect_data(volume)) return kMountNoPartition;
+  const int result = volume->force_format != 0 ? create_file_system(volume) : keep_file_system(volume);
   if (result != kOk) return result;
   const bool found = detect_fs(volume) && !(volume->force_format != 0 && is_remains(volume->fs_type));
   volume->held.release();
   return found ? kOk : kFailed;
 }
 
-int make_mount_point(const Volume* volume, Caller caller = Caller()) {
+int make_mount_point(const Volume* volume) {
   const CommandText command = command_on_path("mkdir -p", volume->mount_point);
-  LOG_AT(caller, 1, "cmd = %s", command.c_str());
+  LOG(1, "cmd = %s", command.c_str());
   make_bare_folder(volume->mount_point);
   if (system(command) == 0) return kOk;
-  LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
+  LOG(0, "system() of cmd '%s' failed", command.c_str());
   return kMountNoMountPoint;
 }
 
-int mount_file_system(const Volume* volume, Caller caller = Caller()) {
+int mount_file_system(const Volume* volume) {
   if (is_mountable(volume->fs_type)) {
-    run_mount(volume->fs_type, volume->node, volume->mount_point, caller);
+    run_mount(volume->fs_type, volume->node, volume->mount_point);
     return kOk;
   }
-  LOG_AT(caller, 1, "Unsupported filesystem type %s", volume->fs_type);
+  LOG(1, "Unsupported filesystem type %s", volume->fs_type);
   const int result = ktree_update_volume_state(volume->entry, kVolumeUnsupported);
-  if (note_update(result, caller) != 0) return kTreeFailed;
+  if (note_update(result) != 0) return kTreeFailed;
   return kMountUnsupported;
 }
 
-int record_read_only(const Volume* volume, Caller caller) {
-  if (record_access_right(volume->entry, VOL_AC_RO, caller) != 0) return kTreeFailed;
+int record_read_only(const Volume* volume) {
+  if (record_access_right(volume->entry, VOL_AC_RO) != 0) return kTreeFailed;
   return kMountReadOnly;
 }
 
 // Opens the volume to everybody and records whether that could be written.
-int open_to_everybody(const Volume* volume, Caller caller = Caller()) {
+int open_to_everybody(const Volume* volume) {
   if (system(command_on_path("chmod 777", volume->mount_point)) == 0) {
-    record_access_right(volume->entry, VOL_AC_RW, caller);
+    record_access_right(volume->entry, VOL_AC_RW);
     return kOk;
   }
-  LOG_AT(caller, 1, "change mode 777 to %s failed, this might be a read only filesystem",
-         volume->entry->share);
-  return record_read_only(volume, caller);
+  LOG(1, "change mode 777 to %s failed, this might be a read only filesystem", volume->entry->share);
+  return record_read_only(volume);
 }
 
-int record_mount(const Volume* volume, Caller caller = Caller()) {
+int record_mount(const Volume* volume) {
   ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
   if (strcmp(volume->fs_type, "ext4") == 0) {
     // A file system that is older than its partition's growth fills it in the background.
     System("%s", shell_command("resize2fs -fp %s &", volume->node.c_str()).c_str());
   }
-  note_update(ktree_update_volume_state(volume->entry, kVolumeNormal), caller);
-  return open_to_everybody(volume, caller);
+  note_update(ktree_update_volume_state(volume->entry, kVolumeNormal));
+  return open_to_everybody(volume);
 }
 
-void record_failed_mount(const Volume* volume, Caller caller = Caller()) {
-  note_update(ktree_update_volume_state(volume->entry, kVolumeFailed), caller);
+void record_failed_mount(const Volume* volume) {
+  note_update(ktree_update_volume_state(volume->entry, kVolumeFailed));
   const CommandText command = command_on_path("rm -rf", volume->mount_point);
-  if (is_removal_unsafe(volume->mount_point, caller)) return;
+  if (is_removal_unsafe(volume->mount_point)) return;
   drop_bare_folder(volume->mount_point);
   if (system(command) == 0) return;
-  LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
+  LOG(0, "system() of cmd '%s' failed", command.c_str());
 }
 
-int record_outcome(const Volume* volume, Caller caller = Caller()) {
-  if (sys_mount_point(volume->mount_point) != 0) return record_mount(volume, caller);
-  record_failed_mount(volume, caller);
+int record_outcome(const Volume* volume) {
+  if (sys_mount_point(volume->mount_point) != 0) return record_mount(volume);
+  record_failed_mount(volume);
   return kOk;
 }
 
 // A volume that is in use where it belongs is neither checked, formatted nor mounted over: its state is
 // recorded as after a mount, with all that follows one (its partition may have grown). One that has turned
 // read-only since may take the chmod in memory alone.
-int keep_standing(const Volume* volume, Caller caller = Caller()) {
-  LOG_AT(caller, 1, "%s is mounted on %s already", volume->node.c_str(), volume->mount_point.c_str());
+int keep_standing(const Volume* volume) {
+  LOG(1, "%s is mounted on %s already", volume->node.c_str(), volume->mount_point.c_str());
   int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
-  if (note_update(result, caller) != 0) return kTreeFailed;
-  result = record_mount(volume, caller);
+  if (note_update(result) != 0) return kTreeFailed;
+  result = record_mount(volume);
   if (result != kOk || !refuses_writes(volume->mount_point)) return result;
-  LOG_AT(caller, 1, "%s takes no writes any more", volume->mount_point.c_str());
-  return record_read_only(volume, caller);
+  LOG(1, "%s takes no writes any more", volume->mount_point.c_str());
+  return record_read_only(volume);
 }
 
 // Mounts the file system and records what became of that. No other run closes the session meanwhile, or
 // removes the mount point.
-int put_in_place(const Volume* volume, Caller caller = Caller()) {
+int put_in_place(const Volume* volume) {
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
-  if (is_foreign_disk(volume->entry, volume->node, caller)) return kMountTooSmall;
-  int result = make_mount_point(volume, caller);
-  if (result == kOk) result = mount_file_system(volume, caller);
-  if (result == kOk) result = record_outcome(volume, caller);
+  if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
+  int result = make_mount_point(volume);
+  if (result == kOk) result = mount_file_system(volume);
+  if (result == kOk) result = record_outcome(volume);
   return result;
 }
 
 // Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.
-int bring_up(Volume* volume, Caller caller = Caller()) {
-  int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format, caller);
+int bring_up(Volume* volume) {
+  int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format);
   if (result == kOk && !volume->asked && find_partition(volume, is_standing)) {
-    return keep_standing(volume, caller);
+    return keep_standing(volume);
   }
   if (result == kOk) result = pick_partition(volume);
-  if (result == kOk) result = prepare_file_system(volume, caller);
-  if (result == kOk && is_standing(volume)) return keep_standing(volume, caller);  // another run was quicker
-  if (result == kOk) result = put_in_place(volume, caller);
+  if (result == kOk) result = prepare_file_system(volume);
+  if (result == kOk && is_standing(volume)) return keep_standing(volume);  // another run was quicker
+  if (result == kOk) result = put_in_place(volume);
   return result;
 }
 
 }  // namespace
 
 int Target_mount(TargetEntry* entry, int force_format, int update_share) {
+  const LogScope scope;
   LOG(2, "start");
   int result = check_entry(entry);
   if (result != kOk) return result;
@@ -318,6 +316,7 @@ int Target_mount(TargetEntry* entry, int force_format, int update_share) {
 }
 
 int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share) {
+  const LogScope scope;
   if (entry == nullptr || entry->db_idx < 1) return kFailed;
   LOG(2, "start");
   for (int lun = 1; lun <= kMaxLunsPerTarget; lun = lun_slot_after(entry->db_idx, lun)) {
@@ -332,6 +331,7 @@ int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share)
 }
 
 int remount_mnt_path(const char* path, int wait_seconds) {
+  const LogScope scope;
   if (path == nullptr) {
     LOG(0, "mnt_path not vaild");
     return kFailed;

@@ -50,12 +50,12 @@ CommandText full_command(const char* text, const char* node, const char* mount_p
 }
 
 // Returns whether the mount took hold within its tries.
-bool run_with_retries(const char* command, Caller caller) {
-  LOG_AT(caller, 1, "cmd = %s", command);
+bool run_with_retries(const char* command) {
+  LOG(1, "cmd = %s", command);
   for (int retries = 0; system(command) != 0; retries++) {
     if (retries == kMountRetries) return false;
-    LOG_AT(caller, 0, "system() of cmd '%s' failed", command);
-    LOG_AT(caller, kNote, "wait %u micro seconds", kMountRetryWait);
+    LOG(0, "system() of cmd '%s' failed", command);
+    LOG(kNote, "wait %u micro seconds", kMountRetryWait);
     usleep(kMountRetryWait);
   }
   return true;
@@ -81,13 +81,13 @@ bool is_mountable(const char* fs_type) {
   return find_command(fs_type) != nullptr;
 }
 
-void run_mount(const char* fs_type, const char* node, const char* mount_point, Caller caller) {
+void run_mount(const char* fs_type, const char* node, const char* mount_point) {
   const MountCommand* mount = find_command(fs_type);
-  if (run_with_retries(full_command(mount->text, node, mount_point), caller)) return;
+  if (run_with_retries(full_command(mount->text, node, mount_point))) return;
   if (mount->stock == nullptr || !lacks_driver(kUfsd)) return;
   const CommandText command = full_command(mount->stock, node, mount_point);
-  LOG_AT(caller, 1, "cmd = %s", command.c_str());
-  if (system(command) != 0) LOG_AT(caller, 0, "system() of cmd '%s' failed", command.c_str());
+  LOG(1, "cmd = %s", command.c_str());
+  if (system(command) != 0) LOG(0, "system() of cmd '%s' failed", command.c_str());
 }
 
 }  // namespace remvol

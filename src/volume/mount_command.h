@@ -13,7 +13,7 @@ bool is_mountable(const char* fs_type);
 // kernel without the driver that the command names, the stock kernel's own driver for that file system is
 // tried once after them. Requires is_mountable(fs_type). Failures are logged in the caller's name; whether
 // the mount took hold is for the caller to ask.
-void run_mount(const char* fs_type, const char* node, const char* mount_point, Caller caller = Caller());
+void run_mount(const char* fs_type, const char* node, const char* mount_point);
 
 }  // namespace remvol
 

@@ -79,13 +79,13 @@ MountPointText mount_point_of(const char* share) {
   return MountPointText("%s%s", kMountRoot, share);
 }
 
-bool is_share_inside_root(const char* share, Caller caller) {
+bool is_share_inside_root(const char* share) {
   if (leaves_root(share)) {
-    LOG_AT(caller, 0, "share name %s leaves %s", share, kMountRoot);
+    LOG(0, "share name %s leaves %s", share, kMountRoot);
     return false;
   }
   if (has_link_below_root(mount_point_of(share))) {
-    LOG_AT(caller, 0, "share name %s leads through a symbolic link below %s", share, kMountRoot);
+    LOG(0, "share name %s leads through a symbolic link below %s", share, kMountRoot);
     return false;
   }
   return true;
@@ -113,21 +113,21 @@ void detach_mounts(const char* path) {
   }
 }
 
-bool is_removal_unsafe(const char* path, Caller caller) {
+bool is_removal_unsafe(const char* path) {
   char real[PATH_MAX];
   const char* name = realpath(path, real) != nullptr ? real : path;
   MountLine mount;
   const Mounted mounted = find_mount_below(name, &mount);
   if (mounted == Mounted::yes) {
-    LOG_AT(caller, 0, "%s is not removed, %s is mounted on %s", path, mount.source, mount.path);
+    LOG(0, "%s is not removed, %s is mounted on %s", path, mount.source, mount.path);
     return true;
   }
   if (mounted == Mounted::unknown && sys_mount_point(path) != 0) {
-    LOG_AT(caller, 0, "%s is not removed, it is a mount point", path);
+    LOG(0, "%s is not removed, it is a mount point", path);
     return true;
   }
   if (!is_on_root_file_system(name)) {
-    LOG_AT(caller, 0, "%s is not removed, it is not on the file system of %s", path, kMountRoot);
+    LOG(0, "%s is not removed, it is not on the file system of %s", path, kMountRoot);
     return true;
   }
   return false;

@@ -31,7 +31,7 @@ MountPointText mount_point_of(const char* share);
 // Returns whether the share's mount point lies below the mount root. It does not when the name has a
 // component "..", or none besides empty ones and ".", or when a component of the path below the root is a
 // symbolic link; that is logged at level 0 in the caller's name.
-bool is_share_inside_root(const char* share, Caller caller = Caller());
+bool is_share_inside_root(const char* share);
 
 // Returns the shell command `verb "path"`, the path escaped. A path too long for that (more
 // than 1,023 characters that all need escaping) gives a command that does nothing and fails.
@@ -48,7 +48,7 @@ void detach_mounts(const char* path);
 // Returns whether "rm -rf" of `path` would run into a mounted file system: one is mounted on the path or
 // below it, or the path lies inside another volume. Where the kernel's table cannot be read, the path itself
 // is asked. Logged at level 0 in the caller's name.
-bool is_removal_unsafe(const char* path, Caller caller = Caller());
+bool is_removal_unsafe(const char* path);
 
 }  // namespace remvol
 

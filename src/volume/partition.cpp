@@ -26,13 +26,13 @@ int list_partitions(const char* device, PartitionList& partitions) {
   return sys_get_partition_list(partitions, device);
 }
 
-bool create_partition(const TargetEntry* entry, const char* device, Caller caller) {
-  LOG_AT(caller, 2, "No partitions found on %s, try to create partition...", device);
+bool create_partition(const TargetEntry* entry, const char* device) {
+  LOG(2, "No partitions found on %s, try to create partition...", device);
   ktree_update_volume_state(entry, kVolumeCreating);
-  LOG_AT(caller, 2, "Creating partition on %s", device);
+  LOG(2, "Creating partition on %s", device);
   const SessionKept kept(entry->target_name);
-  if (is_foreign_disk(entry, device, caller) || sys_create_1_partition(device) != 0) {
-    LOG_AT(caller, 0, "Create partition FAILED");
+  if (is_foreign_disk(entry, device) || sys_create_1_partition(device) != 0) {
+    LOG(0, "Create partition FAILED");
     ktree_update_volume_state(entry, kVolumeFailed);
     return false;
   }
@@ -43,13 +43,13 @@ bool create_partition(const TargetEntry* entry, const char* device, Caller calle
 
 // A partition that could not be grown is used as it is; the volume state then stays "creating" until a later
 // step sets it.
-void expand_partition(const TargetEntry* entry, const char* device, Caller caller) {
-  LOG_AT(caller, 2, "%s, try to expand partition...", device);
-  LOG_AT(caller, 2, "Expanding partition on %s", device);
+void expand_partition(const TargetEntry* entry, const char* device) {
+  LOG(2, "%s, try to expand partition...", device);
+  LOG(2, "Expanding partition on %s", device);
   ktree_update_volume_state(entry, kVolumeCreating);
   const SessionKept kept(entry->target_name);
-  if (is_foreign_disk(entry, device, caller) || sys_expand_1_partition(device) != 0) {
-    LOG_AT(caller, 0, "Expand partition FAILED");
+  if (is_foreign_disk(entry, device) || sys_expand_1_partition(device) != 0) {
+    LOG(0, "Expand partition FAILED");
     return;
   }
   ktree_update_volume_state(entry, kVolumeNormal);
@@ -58,26 +58,26 @@ void expand_partition(const TargetEntry* entry, const char* device, Caller calle
 
 // Gives an empty disk its partition, which is to be formatted then. A partition that the kernel did not have
 // (`had_one`) and has by now is another run's: it is taken as it is. Returns false when there is none.
-bool fill_disk(const TargetEntry* entry, const char* device, bool had_one, int* force_format, Caller caller) {
+bool fill_disk(const TargetEntry* entry, const char* device, bool had_one, int* force_format) {
   const auto filled_elsewhere = [&] { return !had_one && has_partition(entry->dev); };
   if (filled_elsewhere()) return true;
-  if (!create_partition(entry, device, caller)) return filled_elsewhere();
+  if (!create_partition(entry, device)) return filled_elsewhere();
   *force_format = 1;
   return true;
 }
 
 // Returns false when an empty disk could not be given its partition.
 bool adjust_partitions(const TargetEntry* entry, const char* device, PartitionList& partitions,
-                       int* force_format, Caller caller) {
+                       int* force_format) {
   const bool had_one = has_partition(entry->dev);
   const int count = list_partitions(device, partitions);
   if (count == 0) {
-    if (!fill_disk(entry, device, had_one, force_format, caller)) return false;
+    if (!fill_disk(entry, device, had_one, force_format)) return false;
     list_partitions(device, partitions);
   } else if (count == 1) {
-    LOG_AT(caller, 2, "one partition found on %s", device);
+    LOG(2, "one partition found on %s", device);
     if (check_1part_disk_need_to_expand(device) == 1) {
-      expand_partition(entry, device, caller);
+      expand_partition(entry, device);
       list_partitions(device, partitions);
     }
   }
@@ -87,6 +87,7 @@ bool adjust_partitions(const TargetEntry* entry, const char* device, PartitionLi
 }  // namespace
 
 int check_1part_disk_need_to_expand(const char* device) {
+  const LogScope scope;
   if (device == nullptr || device[0] == '\0') {
     LOG(0, "dev string error!");
     return -1;
@@ -103,26 +104,25 @@ int check_1part_disk_need_to_expand(const char* device) {
   return part_size + kExpandMargin < disk_size ? 1 : 0;
 }
 
-int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format,
-                       Caller caller) {
+int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format) {
   const Text<64> device("/dev/%s", entry->dev);
-  if (is_foreign_disk(entry, device, caller)) return kMountTooSmall;  // the LUN itself has no disk here
+  if (is_foreign_disk(entry, device)) return kMountTooSmall;  // the LUN itself has no disk here
   const long long disk_size = sys_get_disk_space("%s", device.c_str());
-  LOG_AT(caller, 2, "get disk_size = %lld", disk_size);
+  LOG(2, "get disk_size = %lld", disk_size);
   if (disk_size <= kUnusableDiskSize) {
-    LOG_AT(caller, 0, "The disk size < 1MB, it might be a fake one. treat this disk as offline");
+    LOG(0, "The disk size < 1MB, it might be a fake one. treat this disk as offline");
     return kMountTooSmall;
   }
-  if (!adjust_partitions(entry, device, partitions, force_format, caller)) return kMountNoPartition;
+  if (!adjust_partitions(entry, device, partitions, force_format)) return kMountNoPartition;
   if (partitions[0] == '\0') {
-    LOG_AT(caller, 0, "Create partition FAILED");
+    LOG(0, "Create partition FAILED");
     ktree_update_volume_state(entry, kVolumeFailed);
     return kMountNoPartition;
   }
   if (check_path_exist(device) != 0) {
     const int result = _create_device_node(entry->dev);
     if (result != 0) {
-      LOG_AT(caller, 0, "create device node failed");
+      LOG(0, "create device node failed");
       return result;
     }
   }

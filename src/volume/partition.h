@@ -19,8 +19,7 @@ int check_1part_disk_need_to_expand(const char* device);
 // partitions and makes the disk's node when missing. Keeps the volume state meanwhile. Returns 0,
 // kMountTooSmall (also for a disk that is not the entry's: the LUN is offline then), kMountNoPartition, or -1
 // when the node could not be made.
-int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format,
-                       Caller caller = Caller());
+int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format);
 
 }  // namespace remvol
 

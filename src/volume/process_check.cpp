@@ -18,14 +18,14 @@ struct DirCloser {
   void operator()(DIR* directory) const { closedir(directory); }
 };
 
-bool is_listed(const char* name, const char* device, Caller caller) {
+bool is_listed(const char* name, const char* device) {
   const Text<256> command("ps -w | grep %s | grep -v 'grep'", name);
   FILE* list = popen(command, "r");
   if (list == nullptr) return false;
   char line[1024];
   bool found = false;
   while (!found && fgets(line, sizeof line, list) != nullptr) {
-    LOG_AT(caller, 2, "get ps mke2fs buf = %s", line);
+    LOG(2, "get ps mke2fs buf = %s", line);
     found = strstr(line, device) != nullptr;
   }
   pclose(list);
@@ -61,8 +61,8 @@ bool has_process(const char* name, const char* device) {
 
 // The `ps -w` of procps lists no arguments, and only processes of the caller's own terminal: there the device
 // is found in the process's own files.
-bool is_command_running_on(const char* name, const char* device, Caller caller) {
-  return is_listed(name, device, caller) || has_process(name, device);
+bool is_command_running_on(const char* name, const char* device) {
+  return is_listed(name, device) || has_process(name, device);
 }
 
 }  // namespace remvol

@@ -27,14 +27,14 @@ bool find_session_volume(const char* target_name, MountLine* mount) {
 }
 
 // Returns whether none is left.
-bool unmount_session_volumes(const char* target_name, Caller caller) {
+bool unmount_session_volumes(const char* target_name) {
   MountLine mount;
   for (int volumes = 0; find_session_volume(target_name, &mount); volumes++) {
     TargetEntry entry = {};
     copy_text(entry.share, mount.path + strlen(kMountRoot));
     copy_text(entry.mnt_dev, mount.source);
     if (volumes < kMaxVolumes && Target_LUN_umount(&entry) == 0) continue;
-    LOG_AT(caller, 0, "the session of %s stays, it is mounted on %s", mount.source, mount.path);
+    LOG(0, "the session of %s stays, it is mounted on %s", mount.source, mount.path);
     return false;
   }
   return true;
@@ -47,10 +47,10 @@ bool has_session_volume(const char* target_name) {
   return find_session_volume(target_name, &mount);
 }
 
-int close_sessions(const char* target_name, const char* logout, Caller caller) {
+int close_sessions(const char* target_name, const char* logout) {
   const SessionClosing closing(target_name);
-  if (!unmount_session_volumes(target_name, caller)) return 1;
-  return run_command(logout, caller) == 0 ? 0 : 1;
+  if (!unmount_session_volumes(target_name)) return 1;
+  return run_command(logout) == 0 ? 0 : 1;
 }
 
 }  // namespace remvol

@@ -38,52 +38,52 @@ constexpr size_t kFtpPathSize = 512;
 
 // Ends the users of the node that was mounted, unless its name belongs to another disk by now. A name that is
 // no disk's becomes none's until then.
-void kill_node_users(const TargetEntry* entry, Caller caller = Caller()) {
+void kill_node_users(const TargetEntry* entry) {
   const SessionKept kept(entry->target_name);
   wait_for_udev(entry->mnt_dev);
   LoginsHeldOff logins;
   if (!has_disk(entry->mnt_dev)) logins.begin();
-  if (is_foreign_disk(entry, entry->mnt_dev, caller)) return;
+  if (is_foreign_disk(entry, entry->mnt_dev)) return;
   System("%s", command_on_node("fuser -mk", entry->mnt_dev).c_str());
 }
 
-void kill_users(const char* mount_point, Caller caller = Caller()) {
-  LOG_AT(caller, 2, "start fuser");
+void kill_users(const char* mount_point) {
+  LOG(2, "start fuser");
   const CommandText command = command_on_path("fuser -mk", mount_point);
   const int status = process_system_cmd_mt(command, kKillTries, kKillMaxWait);
-  if (status != 0) LOG_AT(caller, 1, "cmd '%s' return code = %d", command.c_str(), status);
+  if (status != 0) LOG(1, "cmd '%s' return code = %d", command.c_str(), status);
 }
 
-bool force_umount(const char* mount_point, Caller caller = Caller()) {
-  LOG_AT(caller, 2, "start umount");
+bool force_umount(const char* mount_point) {
+  LOG(2, "start umount");
   const CommandText command = command_on_path("umount -f", mount_point);
   if (system(command) == 0) return true;
-  LOG_AT(caller, 0, "cmd '%s' failed", command.c_str());
+  LOG(0, "cmd '%s' failed", command.c_str());
   return false;
 }
 
 // Unmounts the path with its users killed. Another round starts only while something is mounted there: on a
 // path that another run has unmounted meanwhile, the kill would hit every process that uses the system's own
 // disk.
-void umount_with_rounds(const char* mount_point, Caller caller = Caller()) {
-  kill_users(mount_point, caller);
+void umount_with_rounds(const char* mount_point) {
+  kill_users(mount_point);
   sleep(1);
-  bool done = force_umount(mount_point, caller);
+  bool done = force_umount(mount_point);
   for (int round = 0; !done && round < kFurtherRounds && sys_mount_point(mount_point) != 0; round++) {
-    kill_users(mount_point, caller);
-    done = force_umount(mount_point, caller);
+    kill_users(mount_point);
+    done = force_umount(mount_point);
   }
-  LOG_AT(caller, 2, "end umount");
+  LOG(2, "end umount");
 }
 
 // Removes the mount point, whether or not the unmount worked. What is still mounted is detached first, so
 // that the removal never deletes a volume's files; when that cannot be had, nothing is removed.
-int remove_mount_point(const char* mount_point, Caller caller = Caller()) {
-  if (is_removal_unsafe(mount_point, caller)) return kFailed;
+int remove_mount_point(const char* mount_point) {
+  if (is_removal_unsafe(mount_point)) return kFailed;
   drop_bare_folder(mount_point);
   const CommandText command = command_on_path("rm -rf", mount_point);
   if (system(command) == 0) return kOk;
-  LOG_AT(caller, 0, "cmd '%s' failed", command.c_str());
+  LOG(0, "cmd '%s' failed", command.c_str());
   return kFailed;
 }
 
@@ -101,6 +101,7 @@ void umount_luns(int dbidx) {
 }  // namespace
 
 int Target_LUN_umount(const TargetEntry* entry) {
+  const LogScope scope;
   LOG(2, "start");
   if (entry == nullptr || entry->share[0] == '\0' || !is_share_inside_root(entry->share)) {
     LOG(2, "end");
@@ -123,6 +124,7 @@ int Target_LUN_umount(const TargetEntry* entry) {
 }
 
 void unmount_if_deleted(const TargetEntry* entry) {
+  const LogScope scope;
   if (!HeldSlot(entry->db_idx, entry->lun_db_idx)) Target_LUN_umount(entry);
 }
 
@@ -133,6 +135,7 @@ int Target_umount_all_lun(int dbidx) {
 }
 
 int Target_umount_all() {
+  const LogScope scope;
   LOG(2, "start");
   remember_all_targets();
   for (int dbidx = 1; dbidx <= kMaxTargets; dbidx++) {
@@ -143,6 +146,7 @@ int Target_umount_all() {
 }
 
 int get_ftp_share_path(const TargetEntry* entry, char* path) {
+  const LogScope scope;
   if (is_foreign_disk(entry, entry->mnt_dev)) {  // a mount of that node is another volume's
     path[0] = '\0';
     return kNoFtpShare;
@@ -168,6 +172,7 @@ int get_ftp_share_path(const TargetEntry* entry, char* path) {
 }
 
 int Target_umount_ftp(const TargetEntry*, const char* path) {
+  const LogScope scope;
   LOG(1, "start umount ftp");
   const CommandText kill = command_on_path("fuser -mk", path);
   const int status = system(kill);
@@ -182,6 +187,7 @@ int Target_umount_ftp(const TargetEntry*, const char* path) {
 }
 
 int Target_remount_ftp(const TargetEntry*, const char* path) {
+  const LogScope scope;
   LOG(1, "start mount ftp");
   if (path[0] == '\0') return kFailed;
   reload_share_services();

@@ -2,6 +2,7 @@
 
 import pytest
 
+import harness
 from appliance import INITIATOR, SESSIONS, SLOTS_MOVE, assert_order, messages, settings
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
@@ -47,6 +48,16 @@ def lost(site, box):
     site.debug(1)
     box.forget()
     return site
+
+
+
+@pytest.mark.parametrize("handle, function", [(reopen, "task_oiscsi_evt_reopen"), (recover, "task_oiscsi_evt_recover")])
+@pytest.mark.parametrize("name", ["iqn.t1", "iqn.nobody"])
+def test_the_log_tells_of_begin_and_end(lost, box, handle, function, name):
+    lost.debug(2)
+    told = harness.messages(handle(box, name=name).stdout)
+    own = [text for file, said_by, text in told if said_by == function]
+    assert (own[0], own[-1]) == ("start", "end")
 
 
 def degrade(box, share):

@@ -81,10 +81,38 @@ class Command : public fakes::Test {};
 
 TEST_F(Command, AFailureIsLoggedInTheCallersName) {
   fakes::on("system", "bad").returns(512);
-  const auto caller_of_it = [] { EXPECT_EQ(run_command("bad", Caller("task_add")), 512); };
+  const auto caller_of_it = [] {
+    const LogScope scope("task_add");
+    EXPECT_EQ(run_command("bad"), 512);
+  };
   EXPECT_EQ(logged(0, caller_of_it), Texts{"src.cpp:task_add: system() of cmd 'bad' failed"});
   EXPECT_EQ(logged(3, [] { EXPECT_EQ(run_command("good"), 0); }), Texts{});
   EXPECT_EQ(command_exit_code(512), 2);
+}
+
+class Scope : public fakes::Test {};
+
+TEST_F(Scope, AHelperLogsInTheNameOfTheInnermostFunctionWithOne) {
+  const auto helper = [] { LOG(0, "told"); };
+  const auto told = logged(0, [&] {
+    const LogScope task("task_add");
+    {
+      const LogScope step("Target_mount");
+      helper();
+    }
+    helper();
+  });
+  EXPECT_EQ(told, (Texts{"src.cpp:Target_mount: told", "src.cpp:task_add: told"}));
+}
+
+std::string function_of_a_scope() {
+  const LogScope scope;
+  return LogScope::function();
+}
+
+TEST_F(Scope, HasTheNameOfTheFunctionThatItStandsIn) {
+  EXPECT_EQ(function_of_a_scope(), "function_of_a_scope");
+  EXPECT_STREQ(LogScope::function(), "main");
 }
 
 // A folder of its own for a test.
