@@ -13,7 +13,9 @@
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
+#include "volume/disk_identity.h"
 #include "volume/mount.h"
+#include "volume/mount_point.h"
 #include "volume/unmount.h"
 
 namespace remvol {
@@ -74,7 +76,8 @@ int _store_requested_lun(int* dbidx, int* lun_dbidx) {
     ktree_complete_lun_entry(entry, stored);
     return kFailed;
   }
-  if (ktree_check_duplicate_share_name(entry->share) != 0) {
+  if (ktree_check_duplicate_share_name(entry->share) != 0 ||
+      is_foreign_mount(entry, mount_point_of(entry->share))) {
     LOG(0, "share name %s has benn used", entry->share);
     return kFailed;
   }

@@ -8,6 +8,7 @@
 #include "support/files.h"
 #include "support/text.h"
 #include "volume/device.h"
+#include "volume/mount_table.h"
 
 namespace remvol {
 
@@ -71,6 +72,21 @@ bool was_own_disk(const TargetEntry* entry, const char* node) {
          strcmp(own_disk.target_name, entry->target_name) == 0 && own_disk.lun == entry->lun;
 }
 
+void log_foreign(const TargetEntry* entry, const char* node) {
+  LOG(0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun, entry->target_name);
+}
+
+struct Place {
+  const TargetEntry* entry;
+  const char* path;
+};
+
+// A disk keeps its name for as long as it is mounted.
+bool is_others_mount(const MountLine& mount, const void* what) {
+  const auto* place = static_cast<const Place*>(what);
+  return strcmp(mount.path, place->path) == 0 && disk_owner(place->entry, mount.source) == kDiskForeign;
+}
+
 }  // namespace
 
 DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
@@ -101,7 +117,16 @@ bool is_foreign_disk(const TargetEntry* entry, const char* node) {
   const DiskOwner owner = disk_owner(entry, node);
   if (owner == kDiskOurs) remember_own_disk(entry, node);
   if (owner == kDiskOurs || (owner == kDiskUnknown && !was_own_disk(entry, node))) return false;
-  LOG(0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun, entry->target_name);
+  log_foreign(entry, node);
+  return true;
+}
+
+bool is_foreign_mount(const TargetEntry* entry, const char* path) {
+  char real[PATH_MAX];
+  const Place place = {entry, realpath(path, real) != nullptr ? real : path};
+  MountLine mount;
+  if (find_mount(is_others_mount, &place, &mount) != Mounted::yes) return false;
+  log_foreign(entry, mount.source);
   return true;
 }
 

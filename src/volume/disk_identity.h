@@ -31,6 +31,10 @@ bool has_disk(const char* node);
 // closed meanwhile, and the name may be given anew at any moment.
 bool is_foreign_disk(const TargetEntry* entry, const char* node);
 
+// Returns whether a disk that is known to be another one than the entry's is mounted on `path`: what is
+// mounted there is left alone then, and nothing mounted over it. That is logged at level 0.
+[[nodiscard]] bool is_foreign_mount(const TargetEntry* entry, const char* path);
+
 }  // namespace remvol
 
 #endif

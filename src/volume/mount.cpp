@@ -276,6 +276,7 @@ int put_in_place(const Volume* volume) {
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
   if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
+  if (is_foreign_mount(volume->entry, volume->mount_point)) return kMountNoMountPoint;
   int result = make_mount_point(volume);
   if (result == kOk) result = mount_file_system(volume);
   if (result == kOk) result = record_outcome(volume);

@@ -7,7 +7,7 @@ namespace remvol {
 enum MountResult : int {
   kMountNoPartition = -2,   // none could be made, or none is usable
   kMountFormatFailed = -3,  // formatting failed
-  kMountNoMountPoint = -4,  // the mount point could not be made, or would lie outside "/mnt/VV/"
+  kMountNoMountPoint = -4,  // could not be made, lies outside "/mnt/VV/", or another disk is mounted there
   kMountUnsupported = -6,   // not a file system that can be mounted; volume state 5 is recorded
   kMountReadOnly = -7,      // mounted but not writable; VOL_AC_RO is recorded, no share service is reloaded
   kMountTooSmall = -8,      // a disk of 1 MiB or less, or of another LUN by now: the LUN is offline

@@ -31,7 +31,9 @@ namespace {
 
 constexpr int kFurtherRounds = 3;
 constexpr int kKillTries = 3;
-constexpr int kKillMaxWait = 200000;  // microseconds
+constexpr int kKillMaxWait = 200000;       // microseconds
+constexpr int kTreeLooks = 50;             // 5 seconds
+constexpr useconds_t kTreePause = 100000;  // microseconds
 constexpr char kProcMounts[] = "/proc/mounts";
 constexpr char kPublicFtp[] = "/home/Public";
 constexpr size_t kFtpPathSize = 512;
@@ -87,6 +89,21 @@ int remove_mount_point(const char* mount_point) {
   return kFailed;
 }
 
+// Returns whether the entry's LUN is stored no more. A tree that was started anew is waited for until it has
+// loaded its settings: a volume that they do not know would be nobody's, and its share name given again.
+bool is_deleted(const TargetEntry* entry) {
+  bool deleted = false;
+  bool stored = false;
+  const auto look = [&] {
+    const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+    deleted = !slot;
+    stored = slot && is_lun_stored_at(slot.target(), slot.lun());
+    return deleted || stored;
+  };
+  for (int looks = 0; !look() && looks < kTreeLooks; looks++) usleep(kTreePause);
+  return deleted;
+}
+
 // Unmounts every LUN of the target up to the first empty slot.
 void umount_luns(int dbidx) {
   for (int lun = 1; lun <= kMaxLunsPerTarget; lun = lun_slot_after(dbidx, lun)) {
@@ -113,6 +130,7 @@ int Target_LUN_umount(const TargetEntry* entry) {
   // system's own disk; between the look and the removal another run could mount.
   const MountPointHold hold(mount_point);
   if (check_path_exist(mount_point) != 0) return kOk;
+  if (is_foreign_mount(entry, mount_point)) return kFailed;
   if (sys_mount_point(mount_point) != 0) {
     remount_mnt_path(mount_point, 0);
     umount_with_rounds(mount_point);
@@ -125,7 +143,7 @@ int Target_LUN_umount(const TargetEntry* entry) {
 
 void unmount_if_deleted(const TargetEntry* entry) {
   const LogScope scope;
-  if (!HeldSlot(entry->db_idx, entry->lun_db_idx)) Target_LUN_umount(entry);
+  if (is_deleted(entry)) Target_LUN_umount(entry);
 }
 
 int Target_umount_all_lun(int dbidx) {

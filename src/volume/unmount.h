@@ -10,7 +10,8 @@ namespace remvol {
 // point; -1 for a bad entry or when the mount point could not be removed.
 int Target_LUN_umount(const TargetEntry* entry);
 
-// Unmounts a volume whose LUN was deleted from the tree while this run mounted it.
+// Unmounts a volume whose LUN was deleted from the tree while this run mounted it, or is unknown to a tree
+// that was started anew meanwhile.
 void unmount_if_deleted(const TargetEntry* entry);
 
 // Unmounts every LUN of the target up to the first empty slot. Returns 0, or -1 when the slot is empty.

@@ -120,6 +120,11 @@ class Site:
         done = self.box.run(["sh", "-c", f"mkdir -p {shlex.quote(path)} && PATH=/bin:/usr/bin mount -t tmpfs {words}"])
         assert done.status == 0, done.stderr
 
+    def mount_anew(self, dev, path):
+        """The same from another disk, in place of what is mounted there."""
+        assert self.box.run(["sh", "-c", f"PATH=/bin:/usr/bin umount {shlex.quote(path)}"]).status == 0
+        self.mount(dev, path)
+
     # --- stored targets ---
 
     def store(self, name="iqn.t1", *, slot=1, luns=(), ip=PORTAL, port=3260, chap=0, **settings):

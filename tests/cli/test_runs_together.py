@@ -508,6 +508,32 @@ class TestATreeThatIsStartedAnew:
         assert box.remvol(*TestAdding.ADD).status == 255
 
 
+    def test_an_added_volume_that_the_new_tree_does_not_know_is_taken_away(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        site.log_in("iqn.t1")
+        site.disk("sdb")
+        box.tree.set(f"{INITIATOR}/ver", 1)
+        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
+                   "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & sleep 0.3")
+        box.hook("system", re.compile("^chmod 777 "), through=True, effect=restart, times=1)
+        box.hook("usleep", "100000", skip=3, times=1, through=True,
+                 effect=f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1")
+        done = box.remvol(*TestAdding.ADD)
+        assert done.status == 255
+        assert any("mount -t ext4" in line for line in box.shell())
+        assert "/mnt/VV/a" not in box.run(["cat", "/proc/mounts"]).stdout
+
+    def test_a_volume_whose_tree_does_not_come_back_stays(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        site.log_in("iqn.t1")
+        site.disk("sdb")
+        box.hook("system", re.compile("^chmod 777 "), through=True, times=1,
+                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+        assert box.remvol(*TestAdding.ADD).status == 255
+        assert box.trace("usleep").count("usleep 100000") == 50
+        assert "/mnt/VV/a" in box.run(["cat", "/proc/mounts"]).stdout
+
+
 class TestStrangersAndTemporaryFiles:
     def test_a_run_beside_another_lists_into_a_file_of_its_own(self, stored, box):
         box.fake("iscsiadm", "-m session", exact=True, delay=1, times=1, status=21)

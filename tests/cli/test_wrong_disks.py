@@ -3,7 +3,7 @@
 import re
 
 import pytest
-from appliance import messages, settings
+from appliance import INITIATOR, messages, settings
 from harness.volumes import drive, luns
 
 __all__ = ["luns"]
@@ -74,9 +74,11 @@ class TestNamesThatMoved:
     @pytest.mark.parametrize("whose", OTHERS)
     def test_a_disconnect_does_not_end_the_others_users(self, volume, box, whose):
         turn_into(box, whose)
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/mnt_dev", "/dev/sdb2")
+        volume.mount_anew("sdc", "/mnt/VV/data")
         done = box.remvol("--disconnect", "-n", "iqn.t1")
         assert done.status == 0
-        assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
+        assert f"/dev/sdb2 {LEFT_ALONE}" in messages(done)
         assert ran(box, "fuser") == ['fuser -mk "/mnt/VV/data"']
         assert not volume.mounted("data")
 
@@ -147,6 +149,52 @@ class TestNamesThatMoved:
         assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
         assert not ran(box, "mkdir", "mount -t")
         assert (done.status, volume.lun("volume_state")) == (0, "2")
+
+
+class TestMountPointsOfOthers:
+    """Another disk is mounted where the share's volume belongs: one that was mounted for an add whose tree was
+    started anew, so that the share name was given again."""
+
+    @pytest.mark.parametrize("whose", OTHERS)
+    def test_it_is_not_unmounted(self, volume, box, whose):
+        turn_into(box, whose)
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/mnt_dev", "/dev/sdb2")
+        done = drive(box, "unmount", 1, 1)
+        assert done.result == -1
+        assert messages(done) == [f"/dev/sdb2 {LEFT_ALONE}", f"/dev/sdb1 {LEFT_ALONE}"]
+        assert volume.mounted("data")
+        assert not ran(box, "fuser", "umount", "remount", "rm -rf")
+
+    def test_a_volume_that_has_lost_its_disk_is_taken_away(self, volume, box):
+        box.session_disk("sdb", "iqn.t1")
+        box.fake("fuser", "-mk /dev/sdb1", effect="rm -r /sys/block/sdb", first=True)
+        assert box.remvol("--disconnect", "-n", "iqn.t1").status == 0
+        assert not volume.mounted("data")
+
+    @pytest.mark.parametrize("whose", OTHERS)
+    def test_nothing_is_mounted_over_it(self, volume, box, whose):
+        turn_into(box, whose)
+        volume.offer("iqn.t1", {0: "sdc"})
+        volume.disk("sdc")
+        box.session_disk("sdc", "iqn.t1", session=2)
+        done = box.remvol("--connect", "-n", "iqn.t1")
+        assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
+        assert (done.status, volume.lun("volume_state")) == (0, "3")
+        assert not ran(box, "mkdir", "mount -t", "chmod", "rm -rf")
+
+    @pytest.mark.parametrize("whose", ["another target", "another LUN"])
+    def test_its_share_name_is_not_given_again(self, site, box, whose):
+        site.mount("sdb", "/mnt/VV/data")
+        turn_into(box, whose)
+        done = box.remvol("--add", "-n", "iqn.t1", "-l", "0", "-i", "10.9.0.2", "-p", "3260", "-s", "data")
+        assert (done.status, site.lun("share")) == (255, None)
+        assert messages(done) == [f"/dev/sdb1 {LEFT_ALONE}", "share name data has benn used"]
+
+    def test_its_own_lun_gets_it_back(self, site, box):
+        site.mount("sdb", "/mnt/VV/data")
+        turn_into(box, "the LUN's own")
+        done = box.remvol("--add", "-n", "iqn.t1", "-l", "0", "-i", "10.9.0.2", "-p", "3260", "-s", "data")
+        assert (done.status, site.lun("share")) == (0, "data")
 
 
 def while_waiting(box, effect):
