@@ -2,9 +2,9 @@
 
 #include <spawn.h>
 #include <unistd.h>
-#include <csignal>
 
 #include <cerrno>
+#include <csignal>
 
 namespace platform {
 

@@ -6,6 +6,9 @@
 
 namespace platform {
 
+// The tool, found through PATH.
+inline constexpr char kTool[] = "remvol";
+
 // Starts the program `file` (found through PATH when it has no slash) with the arguments `argv`, ended by a
 // null, with the signals as usual and in a process group of its own: it goes on when the caller is stopped.
 // Returns its process number, or -1 with errno.

@@ -14,7 +14,7 @@
 namespace platform {
 namespace {
 
-using ktree::client::Result;
+using ktree::client::CallResult;
 
 constexpr size_t kPathSize = 128;
 
@@ -47,9 +47,10 @@ std::string unescaped(std::string_view text) {
 TreeReader::TreeReader(const char* socket, const char* root) {
   const int file = memfd_create("listing", MFD_CLOEXEC);
   ktree::client::Reason reason;
-  const Result result = file < 0 ? Result::kFailed : ktree::client::list_to(socket, root, file, reason);
-  answered_ = result == Result::kDone || result == Result::kMissing;
-  if (result == Result::kDone) take(content_of(file));
+  const CallResult result =
+      file < 0 ? CallResult::kFailed : ktree::client::list_to(socket, root, file, reason);
+  answered_ = result == CallResult::kDone || result == CallResult::kMissing;
+  if (result == CallResult::kDone) take(content_of(file));
   if (file >= 0) close(file);
 }
 

@@ -1,11 +1,12 @@
 // remvol-events: tells the tool when the connection of an iSCSI session is lost and when it is back.
+
 #include <poll.h>
 #include <sys/signalfd.h>
 #include <sys/wait.h>
 #include <unistd.h>
-#include <csignal>
 
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <initializer_list>
@@ -23,7 +24,6 @@ namespace {
 
 using platform::read_sessions;
 
-constexpr char kTool[] = "remvol";
 constexpr char kNotifier[] = "remvol-notify";
 constexpr int kMuchHurry = 50, kSomeHurry = 1000;  // milliseconds between looks
 
@@ -53,8 +53,8 @@ int open_signals() {
 pid_t start_tool(const Order& order) {
   const bool reopen = order.action == Action::kReopen;
   const char* option = reopen ? "--oiscsi_evt_reopen" : "--oiscsi_evt_recover";
-  const char* argv[] = {kTool, option, "-n", order.target.c_str(), nullptr};
-  const pid_t process = platform::start(kTool, argv);
+  const char* argv[] = {platform::kTool, option, "-n", order.target.c_str(), nullptr};
+  const pid_t process = platform::start(platform::kTool, argv);
   const char* target = order.target.c_str();
   if (process < 0) {
     platform::report(LOG_ERR, "remvol-events: %s: %s", target, strerror(errno));
@@ -67,11 +67,11 @@ pid_t start_tool(const Order& order) {
 }
 
 // The tree is up to date now: people and programs are told of what has changed.
-void notify(const Outcome& outcome) {
+void notify(const OrderEnd& end) {
   const char* changes[] = {kNotifier, nullptr};
-  const char* failure[] = {kNotifier, "--recovery-failed", outcome.given_up.c_str(), nullptr};
+  const char* failure[] = {kNotifier, "--recovery-failed", end.given_up.c_str(), nullptr};
   const auto start = platform::start;
-  if (start(kNotifier, changes) < 0 || (!outcome.given_up.empty() && start(kNotifier, failure) < 0)) {
+  if (start(kNotifier, changes) < 0 || (!end.given_up.empty() && start(kNotifier, failure) < 0)) {
     complain(kNotifier);
   }
 }
@@ -111,8 +111,8 @@ void take_signals(Daemon& daemon) {
   }
   int status = 0;
   for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) {
-    const Outcome outcome = daemon.targets.ended(child, status != 0);
-    if (outcome.ordered) notify(outcome);
+    const OrderEnd end = daemon.targets.ended(child, status != 0);
+    if (end.ordered) notify(end);
   }
 }
 
@@ -153,7 +153,7 @@ void take_iscsi_events(Daemon& daemon) {
   take_messages(daemon, daemon.iscsi, [&daemon](const unsigned char* message, size_t size) {
     KernelEvent event{};
     while (take_kernel_event(message, size, event)) {
-      if (event.kind != Kind::kOther) daemon.targets.take(event, read_sessions());
+      if (event.kind != KernelEventKind::kOther) daemon.targets.take(event, read_sessions());
     }
   });
 }

@@ -51,13 +51,13 @@ bool accepts_login(const unsigned char* pdu, size_t size) {
 
 KernelEvent read_event(const unsigned char* data, size_t size) {
   UserEvent received;
-  if (size < sizeof received) return {Kind::kOther, 0};
+  if (size < sizeof received) return {KernelEventKind::kOther, 0};
   memcpy(&received, data, sizeof received);
   const uint32_t session = received.from_kernel.session;
-  if (received.type == kConnectionError) return {Kind::kConnectionLost, session};
+  if (received.type == kConnectionError) return {KernelEventKind::kConnectionLost, session};
   const bool accepted =
       received.type == kReceivedPdu && accepts_login(data + sizeof received, size - sizeof received);
-  return {accepted ? Kind::kLoggedIn : Kind::kOther, session};
+  return {accepted ? KernelEventKind::kLoggedIn : KernelEventKind::kOther, session};
 }
 
 }  // namespace

@@ -7,14 +7,14 @@
 
 namespace events {
 
-enum class Kind {
+enum class KernelEventKind {
   kOther,           // nothing that matters here
   kConnectionLost,  // a session's connection failed
   kLoggedIn,        // the target accepted the last step of a login
 };
 
 struct KernelEvent {
-  Kind kind;
+  KernelEventKind kind;
   uint32_t session;  // its number, as in /sys/class/iscsi_session/session%u
 };
 

@@ -48,11 +48,11 @@ void Targets::order_reopen(Target& target) {
 void Targets::take(const KernelEvent& event, const std::vector<Session>& sessions) {
   const auto session = std::find_if(sessions.begin(), sessions.end(),
                                     [&event](const Session& other) { return other.number == event.session; });
-  if (event.kind != Kind::kOther && session != sessions.end() && session->link != Link::kNew) {
+  if (event.kind != KernelEventKind::kOther && session != sessions.end() && session->link != Link::kNew) {
     Target& target = find(session->target);
-    target.answered = event.kind == Kind::kLoggedIn && (target.suspect > 0 || target.lost);
+    target.answered = event.kind == KernelEventKind::kLoggedIn && (target.suspect > 0 || target.lost);
     // A logout ends in a connection error as well: the session is then gone a moment later.
-    if (event.kind == Kind::kConnectionLost && !target.lost) target.suspect = kSuspectLooks;
+    if (event.kind == KernelEventKind::kConnectionLost && !target.lost) target.suspect = kSuspectLooks;
   }
   look(sessions);
 }
@@ -113,11 +113,11 @@ void Targets::started(const std::string& target, pid_t process) {
   chosen.busy = process > 0;
 }
 
-Outcome Targets::ended(pid_t process, bool failed) {
-  Outcome outcome;
+OrderEnd Targets::ended(pid_t process, bool failed) {
+  OrderEnd end;
   for (Target& target : targets_) {
     if (!target.busy || target.process != process) continue;
-    outcome.ordered = true;
+    end.ordered = true;
     target.busy = false;
     if (!target.recovering) continue;
     if (!failed) {
@@ -126,10 +126,10 @@ Outcome Targets::ended(pid_t process, bool failed) {
       target.retries++;
       target.pause = kRetryPause;
     } else if (!target.lost) {
-      outcome.given_up = target.name;
+      end.given_up = target.name;
     }
   }
-  return outcome;
+  return end;
 }
 
 Hurry Targets::hurry() const {

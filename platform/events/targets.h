@@ -24,7 +24,7 @@ struct Order {
 };
 
 // What the end of a process means.
-struct Outcome {
+struct OrderEnd {
   bool ordered = false;  // it did an order
   std::string given_up;  // the target whose recovery failed for the last time; empty for none
 };
@@ -51,7 +51,7 @@ class Targets {
 
   // The process has ended. A recovery that failed is tried again some seconds later, a few times: runs that
   // come together wait for each other only so long.
-  Outcome ended(pid_t process, bool failed);
+  OrderEnd ended(pid_t process, bool failed);
 
   Hurry hurry() const;
 

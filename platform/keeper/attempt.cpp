@@ -15,12 +15,12 @@
 #include <cstdio>
 #include <vector>
 
+#include "common/start.h"
 #include "common/tree_reader.h"
 
 namespace keeper {
 namespace {
 
-constexpr char kTool[] = "remvol";
 constexpr int kPatience = 3000;  // milliseconds
 constexpr const char* kPorts[] = {"egiga0", "egiga1", "bond0"};
 
@@ -50,16 +50,16 @@ bool accepts_at_a_port(const addrinfo& address) {
 }
 
 // Runs the tool silently: that a target is missing was told, and why is told by whoever connects it by hand.
-int run_tool(std::vector<const char*> arguments) {
-  arguments.insert(arguments.begin(), kTool);
+int run_silently(std::vector<const char*> arguments) {
+  arguments.insert(arguments.begin(), platform::kTool);
   arguments.push_back(nullptr);
   posix_spawn_file_actions_t files;
   posix_spawn_file_actions_init(&files);
   posix_spawn_file_actions_addopen(&files, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
   posix_spawn_file_actions_addopen(&files, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
   pid_t process = -1;
-  const int error =
-      posix_spawnp(&process, kTool, &files, nullptr, const_cast<char* const*>(arguments.data()), environ);
+  const int error = posix_spawnp(&process, platform::kTool, &files, nullptr,
+                                 const_cast<char* const*>(arguments.data()), environ);
   posix_spawn_file_actions_destroy(&files);
   int status = 0;
   if (error != 0 || waitpid(process, &status, 0) < 0) return 1;
@@ -71,7 +71,7 @@ struct Stored {
   std::vector<std::string> shares;
 };
 
-bool read_target(const std::string& target, Stored& stored) {
+bool read_stored(const std::string& target, Stored& stored) {
   platform::TreeReader tree;
   for (int n = 1; n <= platform::kTargets; n++) {
     if (tree.value("/iscsi/initiator/id:%d/target", n) != target) continue;
@@ -117,13 +117,13 @@ bool portal_answers(const std::string& address, const std::string& port) {
 
 int try_target(const std::string& target, bool refresh) {
   Stored stored;
-  if (!read_target(target, stored)) return 1;
+  if (!read_stored(target, stored)) return 1;
   const bool mounted = has_mounted(stored);
   // Says "Reconnecting", which is also what a recovery wants to find.
-  if (mounted) run_tool({"--oiscsi_evt_reopen", "-n", target.c_str()});
-  if (refresh) run_tool({"--status"});
+  if (mounted) run_silently({"--oiscsi_evt_reopen", "-n", target.c_str()});
+  if (refresh) run_silently({"--status"});
   if (!portal_answers(stored.address, stored.port)) return 1;
-  return run_tool({mounted ? "--oiscsi_evt_recover" : "--connect", "-n", target.c_str()});
+  return run_silently({mounted ? "--oiscsi_evt_recover" : "--connect", "-n", target.c_str()});
 }
 
 }  // namespace keeper

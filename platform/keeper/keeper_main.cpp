@@ -1,16 +1,17 @@
 // remvol-keeper: sees to it that what should be there is there: the initiator's daemon, and a session of each
 // target that is to be connected.
+
 #include <poll.h>
 #include <sys/signalfd.h>
 #include <sys/wait.h>
 #include <unistd.h>
-#include <csignal>
-#include <ctime>
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <cstdio>
 #include <cstring>
+#include <ctime>
 #include <initializer_list>
 #include <string>
 #include <string_view>
@@ -28,7 +29,7 @@
 namespace keeper {
 namespace {
 
-constexpr char kInitiator[] = "iscsid", kTool[] = "remvol";
+constexpr char kInitiator[] = "iscsid";
 constexpr int kLooksWithoutInitiator = 2;
 constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 constexpr int kDisconnected = 0;         // connect state of the tree
@@ -49,15 +50,15 @@ long now() {
 
 // Sessions go because somebody wants it.
 bool is_taken_down() {
-  return runs(kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"});
+  return runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"});
 }
 
 bool is_brought_up() {
-  return runs(kTool, {"--oiscsi_evt_recover", "--connect"});
+  return runs(platform::kTool, {"--oiscsi_evt_recover", "--connect"});
 }
 
 // Starts a program that goes on when this one ends. Returns its process, or -1.
-pid_t start(std::initializer_list<const char*> words, const char* program) {
+pid_t start_program(std::initializer_list<const char*> words, const char* program) {
   std::vector<const char*> argv(words);
   argv.push_back(nullptr);
   const pid_t process = platform::start(program, argv.data());
@@ -68,14 +69,14 @@ pid_t start(std::initializer_list<const char*> words, const char* program) {
 // Without the daemon no lost session is healed and none is made. Who stops it on purpose stops the tree as
 // well, or is still at work.
 void keep_initiator(Daemon& daemon, bool tree_answers, bool taken_down) {
-  if (!tree_answers || taken_down || runs(kInitiator) || runs(kTool, {"--init"})) {
+  if (!tree_answers || taken_down || runs(kInitiator) || runs(platform::kTool, {"--init"})) {
     daemon.no_initiator = 0;
     return;
   }
   if (++daemon.no_initiator < kLooksWithoutInitiator) return;
   daemon.no_initiator = 0;
   platform::report(LOG_WARNING, "remvol-keeper: %s is gone, starting another one", kInitiator);
-  start({kInitiator, "-f"}, kInitiator);
+  start_program({kInitiator, "-f"}, kInitiator);
 }
 
 std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
@@ -100,8 +101,8 @@ std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
 }
 
 void try_again(Daemon& daemon, const Try& next) {
-  daemon.process =
-      start({"remvol-keeper", next.first ? "--try-first" : "--try", next.target.c_str()}, "/proc/self/exe");
+  daemon.process = start_program({"remvol-keeper", next.first ? "--try-first" : "--try", next.target.c_str()},
+                                 "/proc/self/exe");
 }
 
 void tell(Daemon& daemon) {

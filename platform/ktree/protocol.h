@@ -23,7 +23,7 @@ enum class Operation : uint8_t {
       6,  // no value; a memory file is passed, which the daemon fills with the listing; the path may be "/"
 };
 
-enum class Status : uint8_t {
+enum class ReplyStatus : uint8_t {
   kDone = 0,     // a get: the value follows
   kMissing = 1,  // no such node, or no value in it
   kRefused = 2,  // a bad path or value, or the tree would get too large

@@ -253,7 +253,7 @@ void Server::answer(Connection& connection, std::string_view bytes) {
     return;
   }
   request.document = connection.document;
-  const Service::Answer answer = service_.handle(request);
+  const Service::Reply answer = service_.handle(request);
   connection.close_document();
 
   ReplyHeader header = {};

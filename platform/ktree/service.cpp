@@ -30,15 +30,15 @@ bool is_new_document(int fd) {
 }  // namespace
 
 // A client that asks for more than the machine has must not cost the others their tree.
-Service::Answer Service::handle(const Request& request) {
+Service::Reply Service::handle(const Request& request) {
   try {
     return carry_out(request);
   } catch (const std::bad_alloc&) {
-    return {Status::kFailed, {}};
+    return {ReplyStatus::kFailed, {}};
   }
 }
 
-Service::Answer Service::carry_out(const Request& request) {
+Service::Reply Service::carry_out(const Request& request) {
   switch (request.operation) {
     case Operation::kGet:
       return get(request);
@@ -53,62 +53,63 @@ Service::Answer Service::carry_out(const Request& request) {
     case Operation::kList:
       return list(request);
   }
-  return {Status::kRefused, {}};
+  return {ReplyStatus::kRefused, {}};
 }
 
-Service::Answer Service::get(const Request& request) const {
+Service::Reply Service::get(const Request& request) const {
   uint32_t wanted = 0;
   Path path;
-  if (request.value.size() != sizeof wanted || !parse_path(request.path, path)) return {Status::kRefused, {}};
+  if (request.value.size() != sizeof wanted || !parse_path(request.path, path))
+    return {ReplyStatus::kRefused, {}};
   memcpy(&wanted, request.value.data(), sizeof wanted);
   const Node* node = tree_.find(path);
-  if (node == nullptr || !node->has_value()) return {Status::kMissing, {}};
-  return {Status::kDone, node->value().substr(0, wanted)};
+  if (node == nullptr || !node->has_value()) return {ReplyStatus::kMissing, {}};
+  return {ReplyStatus::kDone, node->value().substr(0, wanted)};
 }
 
-Service::Answer Service::set(const Request& request) {
+Service::Reply Service::set(const Request& request) {
   Path path;
   const bool carried =
       request.value.size() <= kMaxValueBytes && request.value.find('\0') == std::string_view::npos;
   if (!carried || !parse_path(request.path, path) || !tree_.set(path, request.value)) {
-    return {Status::kRefused, {}};
+    return {ReplyStatus::kRefused, {}};
   }
-  return {Status::kDone, {}};
+  return {ReplyStatus::kDone, {}};
 }
 
-Service::Answer Service::del(const Request& request) {
+Service::Reply Service::del(const Request& request) {
   Path path;
-  if (!request.value.empty() || !parse_path(request.path, path)) return {Status::kRefused, {}};
-  return {tree_.remove(path) ? Status::kDone : Status::kMissing, {}};
+  if (!request.value.empty() || !parse_path(request.path, path)) return {ReplyStatus::kRefused, {}};
+  return {tree_.remove(path) ? ReplyStatus::kDone : ReplyStatus::kMissing, {}};
 }
 
-Service::Answer Service::dump(const Request& request) const {
-  return {is_new_document(request.document) && write_settings(tree_, request.document) ? Status::kDone
-                                                                                       : Status::kFailed,
+Service::Reply Service::dump(const Request& request) const {
+  return {is_new_document(request.document) && write_settings(tree_, request.document) ? ReplyStatus::kDone
+                                                                                       : ReplyStatus::kFailed,
           {}};
 }
 
-Service::Answer Service::load(const Request& request) {
-  return is_memory_file(request.document) ? load_document(request.document) : Answer{Status::kFailed, {}};
+Service::Reply Service::load(const Request& request) {
+  return is_memory_file(request.document) ? load_document(request.document) : Reply{ReplyStatus::kFailed, {}};
 }
 
-Service::Answer Service::load_document(int fd) {
+Service::Reply Service::load_document(int fd) {
   Tree loaded;
   if (!read_settings(fd, loaded, error_)) {
-    return {Status::kDamaged, std::string_view(error_).substr(0, kMaxErrorBytes)};
+    return {ReplyStatus::kDamaged, std::string_view(error_).substr(0, kMaxErrorBytes)};
   }
   tree_.swap(loaded);
-  return {Status::kDone, {}};
+  return {ReplyStatus::kDone, {}};
 }
 
-Service::Answer Service::list(const Request& request) const {
+Service::Reply Service::list(const Request& request) const {
   Path path;
   path.depth = 0;
-  if (request.path != "/" && !parse_path(request.path, path)) return {Status::kRefused, {}};
+  if (request.path != "/" && !parse_path(request.path, path)) return {ReplyStatus::kRefused, {}};
   const Node* node = tree_.find(path);
-  if (node == nullptr) return {Status::kMissing, {}};
+  if (node == nullptr) return {ReplyStatus::kMissing, {}};
   const bool written = is_new_document(request.document) && write_listing(*node, path, request.document);
-  return {written ? Status::kDone : Status::kFailed, {}};
+  return {written ? ReplyStatus::kDone : ReplyStatus::kFailed, {}};
 }
 
 }  // namespace ktree

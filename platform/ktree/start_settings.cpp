@@ -23,8 +23,8 @@ bool load_file(const std::string& file, Service& service, std::string& reason) {
   }
   bool loaded = false;
   if (S_ISREG(info.st_mode)) {
-    const Service::Answer answer = service.load_document(fd);
-    loaded = answer.status == Status::kDone;
+    const Service::Reply answer = service.load_document(fd);
+    loaded = answer.status == ReplyStatus::kDone;
     reason = answer.body;
   } else {
     reason = "not a regular file";

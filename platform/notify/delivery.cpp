@@ -29,13 +29,13 @@ namespace {
 constexpr char kFolder[] = "/etc/remvol/events.d";
 constexpr int kPatience = 1000;  // milliseconds that a program is waited for before the next one starts
 
-struct Form {
+struct LogForm {
   int priority;            // syslog(3)
   const char* message_id;  // in packaging/remvol.catalog
 };
 
-// By the numbers of Kind.
-constexpr Form kForms[] = {
+// By the numbers of EventKind.
+constexpr LogForm kLogForms[] = {
     {LOG_ERR, "9ed0f88078e84644a9615f20f9b7ec79"},      // lost
     {LOG_NOTICE, "a8b67254a84d414cb92c138f6c361f06"},   // back
     {LOG_ERR, "cec71bd45f8842eca898881f1e7c00d3"},      // read-only
@@ -53,7 +53,7 @@ bool complain(const std::string& subject, const char* why) {
 
 // Where no journal listens, standard error gets the message.
 bool log_event(const Event& event) {
-  const Form& form = kForms[static_cast<size_t>(event.kind)];
+  const LogForm& form = kLogForms[static_cast<size_t>(event.kind)];
   if (access("/run/systemd/journal/socket", W_OK) != 0) {
     fprintf(stderr, "%s\n", event.message.c_str());
     return true;

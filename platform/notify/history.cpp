@@ -17,7 +17,7 @@ std::string share_of(const Row& row) {
   return row.volume != nullptr ? platform::printable(row.volume->share) : std::string();
 }
 
-Event event_of(Kind kind, const Row& row, std::string_view what) {
+Event event_of(EventKind kind, const Row& row, std::string_view what) {
   const std::string target = platform::printable(row.target->name);
   std::string message = row.volume != nullptr ? "Volume " + share_of(row) : "Target " + target;
   message.append(": ").append(what);
@@ -25,14 +25,14 @@ Event event_of(Kind kind, const Row& row, std::string_view what) {
   return {kind, target, share_of(row), message};
 }
 
-Kind kind_of(Ailment ailment) {
+EventKind kind_of(Ailment ailment) {
   switch (ailment) {
     case Ailment::kLost:
-      return Kind::kLost;
+      return EventKind::kLost;
     case Ailment::kReadOnly:
-      return Kind::kReadOnly;
+      return EventKind::kReadOnly;
     default:
-      return Kind::kVolumeFailed;
+      return EventKind::kVolumeFailed;
   }
 }
 
@@ -61,12 +61,12 @@ void compare_health(const Row& row, time_t now, Past& past, std::vector<Event>& 
   remember_error(row, now, past);
   const bool formatted = past.formatting && row.wanted && row.healthy();
   past.formatting = is_formatting(row) || (past.formatting && ailment == Ailment::kBusy);
-  if (formatted) events.push_back(event_of(Kind::kFormatDone, row, "its format is done"));
+  if (formatted) events.push_back(event_of(EventKind::kFormatDone, row, "its format is done"));
   if (!row.wanted) {
     past.told = 0;
   } else if (ailment == Ailment::kNone) {
     if (past.told == 0 || now - past.since < kSettled) return;
-    events.push_back(event_of(Kind::kBack, row, "is well again"));
+    events.push_back(event_of(EventKind::kBack, row, "is well again"));
     past.told = 0;
   } else if (ailment != Ailment::kBusy && (past.told & bit_of(ailment)) == 0) {
     events.push_back(event_of(kind_of(ailment), row, row.problem.what));
@@ -78,7 +78,7 @@ void compare_space(const Row& row, Past& past, std::vector<Event>& events) {
   if (row.size == 0) return;
   const double part = static_cast<double>(row.used) / static_cast<double>(row.size);
   if (part >= kNearlyFull && !past.nearly_full) {
-    events.push_back(event_of(Kind::kNearlyFull, row, "is nearly full"));
+    events.push_back(event_of(EventKind::kNearlyFull, row, "is nearly full"));
     past.nearly_full = true;
   } else if (part < kNotSoFull) {
     past.nearly_full = false;
@@ -93,7 +93,7 @@ Past first_look(time_t now) {
 
 }  // namespace
 
-std::string name_of(Kind kind) {
+std::string name_of(EventKind kind) {
   constexpr const char* kNames[] = {"lost",          "back",        "read-only",   "recovery-failed",
                                     "volume-failed", "format-done", "nearly-full", "test"};
   return kNames[static_cast<size_t>(kind)];

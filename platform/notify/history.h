@@ -12,16 +12,25 @@ namespace notify {
 
 using vvstat::Ailment, vvstat::History, vvstat::Past;
 
-enum class Kind { kLost, kBack, kReadOnly, kRecoveryFailed, kVolumeFailed, kFormatDone, kNearlyFull, kTest };
+enum class EventKind {
+  kLost,
+  kBack,
+  kReadOnly,
+  kRecoveryFailed,
+  kVolumeFailed,
+  kFormatDone,
+  kNearlyFull,
+  kTest
+};
 
 struct Event {
-  Kind kind;
+  EventKind kind;
   std::string target;
   std::string share;    // empty for one of a target without volumes
   std::string message;  // a sentence for a person, of printable text
 };
 
-std::string name_of(Kind kind);
+std::string name_of(EventKind kind);
 
 // Compares the rows with the history, brings it up to date, and returns what is to be told. What is
 // wrong is told at once, and not again before the volume has been well for a minute, which is told then: a

@@ -80,12 +80,12 @@ int tell_of_failed_recovery(const char* target) {
     if (each.name != target) continue;
     for (const vvstat::Volume& volume : each.volumes) {
       const std::string share = platform::printable(volume.share);
-      events.push_back(
-          {Kind::kRecoveryFailed, name, share, "Volume " + share + ": the recovery of its target" + end});
+      events.push_back({EventKind::kRecoveryFailed, name, share,
+                        "Volume " + share + ": the recovery of its target" + end});
     }
   }
   if (events.empty()) {
-    events.push_back({Kind::kRecoveryFailed, name, "", "Target " + name + ": its recovery" + end});
+    events.push_back({EventKind::kRecoveryFailed, name, "", "Target " + name + ": its recovery" + end});
   }
   return tell(events);
 }
@@ -115,7 +115,8 @@ int run(int argc, char** argv) {
       case -1:
         return look_and_tell();
       case 't':
-        return tell({{Kind::kTest, "", "", "A test of what is told when something happens to a volume"}});
+        return tell(
+            {{EventKind::kTest, "", "", "A test of what is told when something happens to a volume"}});
       case 'r':
         return tell_of_failed_recovery(target);
       case 'h':

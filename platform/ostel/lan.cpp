@@ -1,11 +1,13 @@
 // The link of a LAN port, asked from the driver (ethtool's ioctl) in the network namespace of the caller;
 // /sys/class/net would answer for the namespace in which /sys was mounted.
+
 #include <linux/ethtool.h>
 #include <linux/sockios.h>
 #include <net/if.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <unistd.h>
+
 #include <cstring>
 
 #include "ostel_common.h"

@@ -4,10 +4,12 @@
 // waits; a guard in a process group of its own, which runs the command and closes the flash behind it; the
 // command, in flashrun's group. When flashrun is killed the guard goes on; when the guard is killed flashrun
 // closes the flash.
+
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
+
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
@@ -20,19 +22,20 @@
 
 namespace {
 
-using flash::kFolder;
-constexpr char kSettings[] = "/usr/local/config/vv.xml";
+using flash::kFlashFolder;
+constexpr char kFlashSettings[] = "/usr/local/config/vv.xml";
 constexpr int kTorn = 1, kUsage = 2, kCannotRun = 126, kNotFound = 127, kKilled = 128;
 
 // The settings hold secrets. A copy that is there already keeps its mode when cp writes into it, so it is
 // taken from everybody but its owner before it gets new ones.
 void protect_settings() {
   struct stat info = {};
-  const int fd = open(kSettings, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
+  const int fd = open(kFlashSettings, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
   if (fd < 0) return;
   if (fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && (info.st_mode & 077) != 0 &&
       fchmod(fd, info.st_mode & 0700) != 0) {
-    platform::report(LOG_WARNING, "flashrun: %s stays readable for others: %s", kSettings, strerror(errno));
+    platform::report(LOG_WARNING, "flashrun: %s stays readable for others: %s", kFlashSettings,
+                     strerror(errno));
   }
   close(fd);
 }
@@ -73,8 +76,8 @@ int exit_status(int wait_status) {
 }
 
 void leave(flash::UserLock& lock) {
-  if (!lock.leave(kFolder)) {
-    platform::report(LOG_WARNING, "flashrun: %s stays writable: %s", kFolder, strerror(errno));
+  if (!lock.leave(kFlashFolder)) {
+    platform::report(LOG_WARNING, "flashrun: %s stays writable: %s", kFlashFolder, strerror(errno));
   }
 }
 
@@ -117,10 +120,10 @@ int main(int argc, char** argv) {
   const sigset_t awaited = awaited_signals();
   sigset_t callers_mask;
   sigprocmask(SIG_BLOCK, &awaited, &callers_mask);
-  if (!flash::is_mount(kFolder)) return run_command(command, getpgrp(), callers_mask, true);
+  if (!flash::is_mount(kFlashFolder)) return run_command(command, getpgrp(), callers_mask, true);
   flash::UserLock lock;
-  if (!lock.enter(kFolder)) {
-    platform::report(LOG_WARNING, "flashrun: %s cannot be made writable: %s", kFolder, strerror(errno));
+  if (!lock.enter(kFlashFolder)) {
+    platform::report(LOG_WARNING, "flashrun: %s cannot be made writable: %s", kFlashFolder, strerror(errno));
   }
   const pid_t guard = fork();
   if (guard == 0) run_guard(command, lock, callers_mask);

@@ -9,8 +9,8 @@
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
-#include <csignal>
 
+#include <csignal>
 #include <cstdarg>
 #include <cstdlib>
 #include <string_view>

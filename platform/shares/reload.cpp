@@ -13,18 +13,18 @@
 namespace shares {
 namespace {
 
-Section share_of(const Volume& volume, const Server& server, const AccessRule* rule) {
+Section share_of(const SharedVolume& volume, const ShareServer& server, const AccessRule* rule) {
   std::string options = volume.read_only ? "\tread only = yes\n" : "\tread only = no\n";
   if (rule != nullptr) options += access_option(*rule);
   if (volume.extended_attributes) options += server.attribute_options;
   return make_section(volume.name, volume.path, options);
 }
 
-std::vector<Section> shares_of(const std::vector<Volume>& volumes, const Server& server,
+std::vector<Section> shares_of(const std::vector<SharedVolume>& volumes, const ShareServer& server,
                                const Access& access) {
   std::vector<Section> sections;
   std::vector<std::wstring> taken = server.taken;
-  for (const Volume& volume : volumes) {
+  for (const SharedVolume& volume : volumes) {
     const std::wstring folded = folded_name(volume.name);
     const AccessRule* rule = rule_of(access, volume.name);
     const char* why = volume.failure;
@@ -72,9 +72,9 @@ std::vector<Section> barred_in(const std::vector<Section>& now, const std::vecto
 }
 
 // A rule for a share that is misspelt bars nobody.
-void tell_of_strangers(const Access& access, const std::vector<Volume>& volumes) {
+void tell_of_strangers(const Access& access, const std::vector<SharedVolume>& volumes) {
   for (const AccessRule& rule : access.rules) {
-    const bool known = std::any_of(volumes.begin(), volumes.end(), [&rule](const Volume& volume) {
+    const bool known = std::any_of(volumes.begin(), volumes.end(), [&rule](const SharedVolume& volume) {
       return folded_name(volume.name) == rule.folded;
     });
     if (!known) {
@@ -93,7 +93,7 @@ void tell_what_is_wrong(const Access& access) {
   }
 }
 
-std::vector<Section> shares_of_tree(const Server& server, const std::vector<Volume>& volumes,
+std::vector<Section> shares_of_tree(const ShareServer& server, const std::vector<SharedVolume>& volumes,
                                     const std::vector<Section>& before) {
   if (server.withdraw) return {};
   const Access access = read_access(kAccessFile);
@@ -114,9 +114,9 @@ Wish read_wish(int argc, char** argv) {
   return Wish::kWrong;
 }
 
-Reload reload_shares(const Server& server) {
+Reload reload_shares(const ShareServer& server) {
   const std::vector<Section> before = parse_sections(read_file(server.file));
-  std::vector<Volume> volumes;
+  std::vector<SharedVolume> volumes;
   Reload done{};
   done.has_tree = server.withdraw || read_volumes(volumes);
   done.shares = done.has_tree ? shares_of_tree(server, volumes, before) : still_mounted(before);

@@ -11,7 +11,7 @@
 namespace shares {
 
 // A file server, as a reload sees it.
-struct Server {
+struct ShareServer {
   const char* reload;  // name of the reload program
   const char* file;    // the generated file
   const NameRules& names;
@@ -41,7 +41,7 @@ inline constexpr char kAccessFile[] = "/etc/remvol/shares.conf";
 // log says, shares stay as they are as long as they are mounted, and none comes. A volume that failed or
 // whose name the server cannot use is left out with a line in the log, and so is a change that cannot be
 // written.
-Reload reload_shares(const Server& server);
+Reload reload_shares(const ShareServer& server);
 
 }  // namespace shares
 

@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "common/fd.h"
 #include "common/report.h"
 #include "shares/lock_file.h"
 
@@ -23,42 +24,20 @@ constexpr char kTurn[] = "flash.copy";
 constexpr int kReading = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
 constexpr int kMaking = O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
 
-// A descriptor that is closed at the end of its scope.
-struct Fd {
-  int fd;
-  explicit Fd(int opened) : fd(opened) {}
-  Fd(const Fd&) = delete;
-  Fd& operator=(const Fd&) = delete;
-  ~Fd() {
-    if (fd >= 0) close(fd);
-  }
-};
-
 // Only one at a time writes temporary files, so that what is there at the start was left behind. The copy is
 // made also when the lock cannot be had: the names are each process's own.
 class Turn {
  public:
-  Turn() : file_(open_lock_file(kTurn)) { held_ = file_.fd >= 0 && take_lock(file_.fd, LOCK_EX); }
+  Turn() : file_(open_lock_file(kTurn)) { held_ = file_.ok() && take_lock(file_.get(), LOCK_EX); }
   bool held() const { return held_; }
 
  private:
-  Fd file_;
+  platform::Fd file_;
   bool held_;
 };
 
 void make_name(char (&name)[64], const char* ending) {
   snprintf(name, sizeof name, "%s%ld%s", kPrefix, static_cast<long>(getpid()), ending);
-}
-
-bool write_all(int fd, const char* data, size_t size) {
-  while (size > 0) {
-    const ssize_t n = write(fd, data, size);
-    if (n < 0 && errno == EINTR) continue;
-    if (n <= 0) return false;
-    data += n;
-    size -= static_cast<size_t>(n);
-  }
-  return true;
 }
 
 // Copies all of `from` and writes it out.
@@ -69,7 +48,7 @@ bool copy_out(int from, int to) {
     if (n < 0 && errno == EINTR) continue;
     if (n < 0) return false;
     if (n == 0) return fsync(to) == 0;
-    if (!write_all(to, buffer, static_cast<size_t>(n))) return false;
+    if (!platform::write_all(to, buffer, static_cast<size_t>(n))) return false;
     offset += n;
   }
 }
@@ -96,21 +75,21 @@ bool is_whole(int fd) {
 
 // Gives `name` the name of the settings, and has that on the disk.
 bool take_the_name(int folder, const char* name) {
-  return renameat(folder, name, folder, kSettings) == 0 && fsync(folder) == 0;
+  return renameat(folder, name, folder, kSettingsName) == 0 && fsync(folder) == 0;
 }
 
 // Ends the use of a kept copy. Returns false when the settings were torn; it has taken their place then.
 bool end_keeping(int folder, const char* name) {
-  const Fd settings(openat(folder, kSettings, kReading));
-  const bool torn = settings.fd >= 0 && !is_whole(settings.fd);
+  const platform::Fd settings(openat(folder, kSettingsName, kReading));
+  const bool torn = settings.ok() && !is_whole(settings.get());
   if (!torn) {
-    if (settings.fd >= 0) fsync(settings.fd);
+    if (settings.ok()) fsync(settings.get());
     fsync(folder);
     unlinkat(folder, name, 0);
     return true;
   }
   const bool put_back = take_the_name(folder, name);
-  platform::report(LOG_WARNING, "flashrun: %s/%s was torn, %s", kFolder, kSettings,
+  platform::report(LOG_WARNING, "flashrun: %s/%s was torn, %s", kFlashFolder, kSettingsName,
                    put_back ? "the former one is back" : strerror(errno));
   return false;
 }
@@ -125,8 +104,8 @@ void clear_one(int folder, const char* name) {
   if (strncmp(name, kPrefix, sizeof kPrefix - 1) != 0) return;
   if (ends_with(name, kNew)) unlinkat(folder, name, 0);
   if (!ends_with(name, kKept)) return;
-  const Fd kept(openat(folder, name, kReading));
-  if (kept.fd >= 0 && flock(kept.fd, LOCK_EX | LOCK_NB) == 0) end_keeping(folder, name);
+  const platform::Fd kept(openat(folder, name, kReading));
+  if (kept.ok() && flock(kept.get(), LOCK_EX | LOCK_NB) == 0) end_keeping(folder, name);
 }
 
 // Removes what killed runs left in the folder.
@@ -143,9 +122,9 @@ bool replace_settings(int folder, int from) {
   char name[64];
   make_name(name, kNew);
   unlinkat(folder, name, 0);
-  const Fd to(openat(folder, name, kMaking, 0600));
-  if (to.fd < 0) return false;
-  if (fchmod(to.fd, 0600) == 0 && copy_out(from, to.fd) && take_the_name(folder, name)) return true;
+  const platform::Fd to(openat(folder, name, kMaking, 0600));
+  if (!to.ok()) return false;
+  if (fchmod(to.get(), 0600) == 0 && copy_out(from, to.get()) && take_the_name(folder, name)) return true;
   const int error = errno;
   unlinkat(folder, name, 0);
   errno = error;
@@ -170,13 +149,13 @@ int split_line(char* line, const char** words) {
 
 bool is_settings_name(const char* path) {
   const char* slash = strrchr(path, '/');
-  return strcmp(slash == nullptr ? path : slash + 1, kSettings) == 0;
+  return strcmp(slash == nullptr ? path : slash + 1, kSettingsName) == 0;
 }
 
 // Returns whether "cp SOURCE TARGET" writes the settings in the folder.
 bool leads_to_settings(const char* source, const char* target) {
-  constexpr size_t kLength = sizeof kFolder - 1;
-  if (source[0] == '-' || strncmp(target, kFolder, kLength) != 0) return false;
+  constexpr size_t kLength = sizeof kFlashFolder - 1;
+  if (source[0] == '-' || strncmp(target, kFlashFolder, kLength) != 0) return false;
   const char* rest = target + kLength;
   if (strcmp(rest, "/vv.xml") == 0) return true;
   return (strcmp(rest, "") == 0 || strcmp(rest, "/") == 0) && is_settings_name(source);
@@ -203,16 +182,17 @@ bool SettingsCopy::parse(char** command) {
 }
 
 int SettingsCopy::run() const {
-  const Fd from(open(source, O_RDONLY | O_NONBLOCK | O_CLOEXEC));
-  if (!is_regular(from.fd)) {
+  const platform::Fd from(open(source, O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+  if (!is_regular(from.get())) {
     platform::report(LOG_WARNING, "flashrun: %s: %s", source, strerror(errno));
     return 1;
   }
-  const Fd folder(open(kFolder, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const platform::Fd folder(open(kFlashFolder, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   const Turn turn;
-  if (turn.held() && folder.fd >= 0) clear_left_overs(folder.fd);
-  if (folder.fd >= 0 && replace_settings(folder.fd, from.fd)) return 0;
-  platform::report(LOG_WARNING, "flashrun: %s is not copied to %s: %s", source, kFolder, strerror(errno));
+  if (turn.held() && folder.ok()) clear_left_overs(folder.get());
+  if (folder.ok() && replace_settings(folder.get(), from.get())) return 0;
+  platform::report(LOG_WARNING, "flashrun: %s is not copied to %s: %s", source, kFlashFolder,
+                   strerror(errno));
   return 1;
 }
 
@@ -222,17 +202,17 @@ KeptSettings::~KeptSettings() {
 }
 
 bool KeptSettings::keep() {
-  folder_ = open(kFolder, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  folder_ = open(kFlashFolder, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   if (folder_ < 0) return false;
   const Turn turn;
   if (!turn.held()) return false;
   clear_left_overs(folder_);
-  const Fd settings(openat(folder_, kSettings, kReading));
-  if (!is_whole(settings.fd)) return false;
+  const platform::Fd settings(openat(folder_, kSettingsName, kReading));
+  if (!is_whole(settings.get())) return false;
   make_name(name_, kKept);
   kept_ = openat(folder_, name_, kMaking, 0600);
   if (kept_ < 0) return false;
-  if (flock(kept_, LOCK_EX | LOCK_NB) == 0 && copy_out(settings.fd, kept_) && fsync(folder_) == 0) {
+  if (flock(kept_, LOCK_EX | LOCK_NB) == 0 && copy_out(settings.get(), kept_) && fsync(folder_) == 0) {
     return true;
   }
   unlinkat(folder_, name_, 0);

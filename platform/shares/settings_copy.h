@@ -7,8 +7,8 @@
 
 namespace flash {
 
-inline constexpr char kFolder[] = "/usr/local/config";
-inline constexpr char kSettings[] = "vv.xml";
+inline constexpr char kFlashFolder[] = "/usr/local/config";
+inline constexpr char kSettingsName[] = "vv.xml";
 
 // A command that does nothing but copy the settings: "cp [-f] SOURCE FOLDER[/[vv.xml]]", one line or words.
 struct SettingsCopy {

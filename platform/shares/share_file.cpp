@@ -7,6 +7,8 @@
 #include <cerrno>
 #include <cstdio>
 
+#include "common/fd.h"
+
 namespace shares {
 namespace {
 
@@ -19,15 +21,6 @@ std::string_view take_line(std::string_view& text) {
   const std::string_view line = text.substr(0, end == std::string_view::npos ? end : end + 1);
   text.remove_prefix(line.size());
   return line;
-}
-
-bool write_all(int fd, std::string_view text) {
-  while (!text.empty()) {
-    const ssize_t written = write(fd, text.data(), text.size());
-    if (written < 0) return false;
-    text.remove_prefix(static_cast<size_t>(written));
-  }
-  return true;
 }
 
 }  // namespace
@@ -81,7 +74,7 @@ bool replace_file(const char* path, std::string_view text) {
   unlink(draft.c_str());
   const int fd = open(draft.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
   if (fd < 0) return false;
-  bool good = write_all(fd, text) && fchmod(fd, 0644) == 0;
+  bool good = platform::write_all(fd, text.data(), text.size()) && fchmod(fd, 0644) == 0;
   const int error = errno;
   good = close(fd) == 0 && good;
   good = good && rename(draft.c_str(), path) == 0;

@@ -29,7 +29,7 @@ const char* failure_of(const platform::TreeReader& tree, int target, int lun) {
   }
 }
 
-void read_volume(const platform::TreeReader& tree, int target, int lun, std::vector<Volume>& volumes) {
+void add_volume(const platform::TreeReader& tree, int target, int lun, std::vector<SharedVolume>& volumes) {
   const std::string name = tree.value("/iscsi/initiator/id:%d/lun/id:%d/share", target, lun);
   const std::string path = kMountRoot + name;
   if (name.empty()) return;
@@ -50,7 +50,7 @@ bool is_mounted(const std::string& path) {
          (entry.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
 }
 
-bool read_volumes(std::vector<Volume>& volumes) {
+bool read_volumes(std::vector<SharedVolume>& volumes) {
   const platform::TreeReader tree;
   if (!tree.answered()) return false;
   // The slots in use are the first ones; one that was damaged must not hide those behind it.
@@ -58,7 +58,7 @@ bool read_volumes(std::vector<Volume>& volumes) {
     if (tree.value("/iscsi/initiator/id:%d/target", target).empty()) continue;
     for (int lun = 1; lun <= platform::kLuns; lun++) {
       if (tree.value("/iscsi/initiator/id:%d/lun/id:%d/lun", target, lun).empty()) continue;
-      read_volume(tree, target, lun, volumes);
+      add_volume(tree, target, lun, volumes);
     }
   }
   return true;

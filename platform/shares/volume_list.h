@@ -7,7 +7,7 @@
 
 namespace shares {
 
-struct Volume {
+struct SharedVolume {
   std::string name;  // share name, as the tree has it
   std::string path;  // where it is mounted
   bool read_only;
@@ -18,7 +18,7 @@ struct Volume {
 
 // Puts the volumes into `volumes`, in the tree's order. Returns false when the tree cannot be reached; the
 // list is then incomplete.
-bool read_volumes(std::vector<Volume>& volumes);
+bool read_volumes(std::vector<SharedVolume>& volumes);
 
 // True when `path` is a mount point.
 bool is_mounted(const std::string& path);

@@ -5,13 +5,14 @@
 #include <sys/sysmacros.h>
 #include <sys/uio.h>
 #include <unistd.h>
+
 #include <cerrno>
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 
-#include "sysaux/fd.h"
+#include "common/fd.h"
 
 namespace sysaux {
 
@@ -58,7 +59,7 @@ bool kernel_name(const char* node, char* name, size_t size) {
 }
 
 bool read_line_at(int dir, const char* name, char* text, size_t size) {
-  const Fd file(openat(dir, name, O_RDONLY | O_CLOEXEC));
+  const platform::Fd file(openat(dir, name, O_RDONLY | O_CLOEXEC));
   if (!file.ok()) return false;
   const ssize_t length = read(file.get(), text, size - 1);
   if (length <= 0) return false;

@@ -1,6 +1,7 @@
 #include "sysaux/content.h"
 
 #include <blkid/blkid.h>
+
 #include <cstdio>
 #include <cstring>
 
@@ -11,20 +12,20 @@ namespace sysaux {
 
 namespace {
 
-enum class Answer { kFound, kNothing, kAmbivalent, kFailed };
+enum class Finding { kFound, kNothing, kAmbivalent, kFailed };
 
 // The answers of blkid_do_safeprobe. Its manual has -1 for an error; the library passes on any negative
 // errno.
-Answer answer_of(int result) {
+Finding answer_of(int result) {
   switch (result) {
     case 0:
-      return Answer::kFound;
+      return Finding::kFound;
     case 1:
-      return Answer::kNothing;
+      return Finding::kNothing;
     case -2:
-      return Answer::kAmbivalent;
+      return Finding::kAmbivalent;
     default:
-      return Answer::kFailed;
+      return Finding::kFailed;
   }
 }
 
@@ -67,11 +68,11 @@ class Probe {
     }
   }
 
-  Answer run(int superblock_flags) {
-    if (!ready_) return Answer::kFailed;
+  Finding run(int superblock_flags) {
+    if (!ready_) return Finding::kFailed;
     blkid_probe_set_superblocks_flags(probe_, BLKID_SUBLKS_TYPE | superblock_flags);
-    const Answer answer = answer_of(blkid_do_safeprobe(probe_));
-    return answer == Answer::kFailed && has_several() ? Answer::kAmbivalent : answer;
+    const Finding answer = answer_of(blkid_do_safeprobe(probe_));
+    return answer == Finding::kFailed && has_several() ? Finding::kAmbivalent : answer;
   }
 
   const char* value(const char* tag) const {
@@ -141,19 +142,19 @@ Content recognise(int device, char name[16]) {
   // The labels of ZFS are a mebibyte, which takes most of the time, and the two at the end of a disk outlive
   // a format with something else: so they are read where nothing else is found.
   probe.leave_out_zfs(true);
-  Answer answer = probe.run(0);
-  if (answer == Answer::kFound && probe.value("TYPE") != nullptr) {
+  Finding answer = probe.run(0);
+  if (answer == Finding::kFound && probe.value("TYPE") != nullptr) {
     snprintf(name, 16, "%.15s", probe.value("TYPE"));
     return Content::kSignature;
   }
   probe.leave_out_zfs(false);
   answer = probe.run(0);
-  if (answer != Answer::kAmbivalent && answer != Answer::kFailed && probe.value("TYPE") == nullptr) {
+  if (answer != Finding::kAmbivalent && answer != Finding::kFailed && probe.value("TYPE") == nullptr) {
     answer = probe.run(BLKID_SUBLKS_BADCSUM);
   }
-  if (answer == Answer::kNothing) return recognise_copy(device, name);
-  if (answer != Answer::kFound && answer != Answer::kAmbivalent) return Content::kUnreadable;
-  const char* type = answer == Answer::kFound ? probe.value("TYPE") : "ambivalent";
+  if (answer == Finding::kNothing) return recognise_copy(device, name);
+  if (answer != Finding::kFound && answer != Finding::kAmbivalent) return Content::kUnreadable;
+  const char* type = answer == Finding::kFound ? probe.value("TYPE") : "ambivalent";
   const char* found = type != nullptr ? type : probe.value("PTTYPE");
   snprintf(name, 16, "%.15s", found != nullptr ? found : "unknown");
   if (type != nullptr || is_unknown_boot_sector(probe)) return Content::kSignature;
@@ -162,7 +163,7 @@ Content recognise(int device, char name[16]) {
 
 int read_table(int disk, Extent* extents, int max) {
   Probe probe(disk);
-  if (probe.run(0) == Answer::kFailed || probe.has_lost_gpt()) return -1;
+  if (probe.run(0) == Finding::kFailed || probe.has_lost_gpt()) return -1;
   return probe.partitions(extents, max);
 }
 

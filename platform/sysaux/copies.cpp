@@ -1,8 +1,8 @@
 #include "sysaux/copies.h"
 
 #include <unistd.h>
-#include <cstdint>
 
+#include <cstdint>
 #include <string_view>
 
 namespace sysaux {

@@ -1,16 +1,18 @@
 // Sizes of disks and partitions, and whether a node can be used at all.
+
 #include <fcntl.h>
 #include <sys/stat.h>
+
 #include <climits>
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
 
+#include "common/fd.h"
 #include "sysaux.h"
 #include "sysaux/block.h"
-#include "sysaux/fd.h"
 
-using sysaux::Fd;
+using platform::Fd;
 
 static long long size_of(int block_dir) {
   long long sectors = 0;
@@ -27,7 +29,7 @@ long long sys_get_disk_space(const char* format, ...) {
   const int length = vsnprintf(node, sizeof node, format, arguments);
   va_end(arguments);
   if (length < 0 || static_cast<size_t>(length) >= sizeof node) return -1;
-  const Fd block_dir(sysaux::open_block_dir(node));
+  const platform::Fd block_dir(sysaux::open_block_dir(node));
   return size_of(block_dir.get());
 }
 
@@ -36,14 +38,14 @@ long long sys_get_partition_size(const char* name) {
   if (name == nullptr || name[0] == '\0' || name[0] == '.' || strchr(name, '/') != nullptr) return -1;
   const int length = snprintf(path, sizeof path, "/sys/class/block/%s", name);
   if (length < 0 || static_cast<size_t>(length) >= sizeof path) return -1;
-  const Fd block_dir(open(path, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const platform::Fd block_dir(open(path, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   return size_of(block_dir.get());
 }
 
 int sys_check_dev(const char* node) {
   struct stat info;
   if (node == nullptr || stat(node, &info) != 0 || !S_ISBLK(info.st_mode)) return -1;
-  const Fd device(open(node, O_RDONLY | O_CLOEXEC));
+  const platform::Fd device(open(node, O_RDONLY | O_CLOEXEC));
   return device.ok() && sysaux::first_mebibyte_readable(device.get()) ? 0 : -1;
 }
 

@@ -1,17 +1,19 @@
 // The module that changes disks: writes the one partition, grows it. Both hold an exclusive lock on the whole
 // disk's node meanwhile, which keeps udev from re-reading the table in between
 // (https://systemd.io/BLOCK_DEVICE_LOCKING).
+
 #include <fcntl.h>
 #include <libfdisk/libfdisk.h>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
+
 #include <cstring>
 #include <ctime>
 
+#include "common/fd.h"
 #include "sysaux/block.h"
 #include "sysaux/content.h"
-#include "sysaux/fd.h"
 #include "sysaux/modules.h"
 #include "sysaux/partitions.h"
 
@@ -26,8 +28,8 @@ constexpr timespec kPause{0, 50'000'000};
 // one that wrote makes udev look at the disk, and it must find the lock still held then.
 struct LockedDisk {
   char name[32];  // the kernel's
-  Fd block_dir;
-  Fd device;
+  platform::Fd block_dir;
+  platform::Fd device;
 };
 
 bool lock(int device) {
@@ -55,19 +57,19 @@ void outlast_udev() {
 }
 
 // libfdisk's view of a disk: the table in memory, written by write().
-class Table {
+class DiskTable {
  public:
-  Table(const char* path, int device) : context_(fdisk_new_context()), device_(device) {
+  DiskTable(const char* path, int device) : context_(fdisk_new_context()), device_(device) {
     if (context_ == nullptr) return;
     fdisk_disable_dialogs(context_, 1);
     ready_ = fdisk_assign_device_by_fd(context_, device, path, 0) == 0;
   }
-  ~Table() {
+  ~DiskTable() {
     if (ready_) fdisk_deassign_device(context_, 1);
     fdisk_unref_context(context_);
   }
-  Table(const Table&) = delete;
-  Table& operator=(const Table&) = delete;
+  DiskTable(const DiskTable&) = delete;
+  DiskTable& operator=(const DiskTable&) = delete;
 
   bool ready() const { return ready_; }
   fdisk_context* context() const { return context_; }
@@ -93,7 +95,7 @@ class Table {
 };
 
 // The entries in use, and the last of them in `only` (to be released by the caller) when there is just one.
-int entries_in_use(const Table& table, fdisk_partition** only) {
+int entries_in_use(const DiskTable& table, fdisk_partition** only) {
   fdisk_table* entries = nullptr;
   *only = nullptr;
   if (fdisk_get_partitions(table.context(), &entries) != 0) return -1;
@@ -118,7 +120,7 @@ int entries_in_use(const Table& table, fdisk_partition** only) {
 // the kernel.
 bool is_blank(const LockedDisk& disk) {
   char name[16];
-  PartitionList known;
+  DiskPartitions known;
   if (!read_partitions(disk.block_dir.get(), &known) || known.count > 0) return false;
   if (!first_mebibyte_readable(disk.device.get())) return false;
   const Content content = recognise(disk.device.get(), name);
@@ -126,7 +128,7 @@ bool is_blank(const LockedDisk& disk) {
 }
 
 // Adds the one partition from the first to the last aligned sector and tells where it is.
-bool add_whole_disk_partition(const Table& table, Extent* extent) {
+bool add_whole_disk_partition(const DiskTable& table, Extent* extent) {
   fdisk_context* context = table.context();
   fdisk_partition* entry = fdisk_new_partition();
   fdisk_parttype* type =
@@ -150,9 +152,9 @@ bool add_whole_disk_partition(const Table& table, Extent* extent) {
 // else is refused. libfdisk's own reading of an old table is a second opinion: it lists also entries that
 // libblkid takes for invalid.
 bool write_new_table(const char* path, Extent* extent) {
-  const Fd device(open(path, O_RDWR | O_EXCL | O_CLOEXEC));
+  const platform::Fd device(open(path, O_RDWR | O_EXCL | O_CLOEXEC));
   if (!device.ok()) return false;
-  Table table(path, device.get());
+  DiskTable table(path, device.get());
   if (!table.ready()) return false;
   fdisk_partition* only = nullptr;
   if (fdisk_has_label(table.context()) != 0 && entries_in_use(table, &only) != 0) {
@@ -175,18 +177,18 @@ bool publish(const LockedDisk& disk, const Extent& extent) {
 
 constexpr fdisk_sector_t kDosEnd = UINT32_MAX;  // a DOS table counts sectors in 32 bits
 
-bool too_large_for_table(const Table& table) {
+bool too_large_for_table(const DiskTable& table) {
   return fdisk_is_label(table.context(), DOS) && fdisk_get_last_lba(table.context()) >= kDosEnd;
 }
 
 // Where the partition could end: at the last aligned sector that the table can describe.
-fdisk_sector_t last_possible_end(const Table& table) {
+fdisk_sector_t last_possible_end(const DiskTable& table) {
   fdisk_context* context = table.context();
   const fdisk_sector_t end = too_large_for_table(table) ? kDosEnd : fdisk_get_last_lba(context) + 1;
   return end - end % (fdisk_get_grain_size(context) / fdisk_get_sector_size(context));
 }
 
-bool is_plain(const Table& table, fdisk_partition* entry) {
+bool is_plain(const DiskTable& table, fdisk_partition* entry) {
   constexpr unsigned kProtectiveMbr = 0xEE;
   if (fdisk_is_label(table.context(), GPT)) return true;
   return fdisk_is_label(table.context(), DOS) && !fdisk_partition_is_container(entry) &&
@@ -196,7 +198,7 @@ bool is_plain(const Table& table, fdisk_partition* entry) {
 
 // The kernel must have no other partition than this one, and this one where the table has it.
 bool kernel_agrees(const LockedDisk& disk, const Extent& extent) {
-  PartitionList known;
+  DiskPartitions known;
   if (!read_partitions(disk.block_dir.get(), &known) || known.count > 1) return false;
   return known.count == 0 ||
          (known.at[0].extent.number == extent.number && known.at[0].extent.start == extent.start);
@@ -204,7 +206,7 @@ bool kernel_agrees(const LockedDisk& disk, const Extent& extent) {
 
 // Start and size are given: with "the default end" alone libfdisk changes nothing on an existing partition
 // and reports success.
-bool set_size(const Table& table, fdisk_partition* entry, fdisk_sector_t size) {
+bool set_size(const DiskTable& table, fdisk_partition* entry, fdisk_sector_t size) {
   fdisk_partition* wanted = fdisk_new_partition();
   fdisk_partition_set_start(wanted, fdisk_partition_get_start(entry));
   fdisk_partition_set_size(wanted, size);
@@ -216,7 +218,7 @@ bool set_size(const Table& table, fdisk_partition* entry, fdisk_sector_t size) {
 
 // Grows the entry in the table when there is room, and writes it; the backup header of a GPT moves to the end
 // of the disk with it. Tells where the partition is then.
-bool grow_entry(const LockedDisk& disk, Table* table, fdisk_partition* entry, Extent* extent) {
+bool grow_entry(const LockedDisk& disk, DiskTable* table, fdisk_partition* entry, Extent* extent) {
   *extent = table->extent_of(entry);
   if (!is_plain(*table, entry) || !kernel_agrees(disk, *extent)) return false;
   const fdisk_sector_t start = fdisk_partition_get_start(entry);
@@ -228,9 +230,9 @@ bool grow_entry(const LockedDisk& disk, Table* table, fdisk_partition* entry, Ex
 }
 
 bool write_grown_table(const char* path, const LockedDisk& disk, Extent* extent) {
-  const Fd device(open(path, O_RDWR | O_CLOEXEC));  // not exclusive: the volume may be mounted
+  const platform::Fd device(open(path, O_RDWR | O_CLOEXEC));  // not exclusive: the volume may be mounted
   if (!device.ok()) return false;
-  Table table(path, device.get());
+  DiskTable table(path, device.get());
   if (!table.ready() || fdisk_has_label(table.context()) == 0) return false;
   fdisk_partition* only = nullptr;
   if (entries_in_use(table, &only) != 1) return false;

@@ -1,7 +1,9 @@
 // The state that an ext2, ext3 or ext4 file system records about itself.
+
 #include <ext2fs/ext2fs.h>
 #include <fcntl.h>
 #include <unistd.h>
+
 #include <cerrno>
 
 #include "sysaux/modules.h"

@@ -1,13 +1,15 @@
 // The appliance's own name and hardware addresses.
+
 #include <net/if.h>
 #include <net/if_arp.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <unistd.h>
+
 #include <cstring>
 
+#include "common/fd.h"
 #include "sysaux.h"
-#include "sysaux/fd.h"
 
 extern "C" {
 
@@ -17,7 +19,7 @@ int sys_get_mac_addr(const char* interface, unsigned char mac[6]) {
   const size_t length = strlen(interface);
   if (length == 0 || length >= sizeof request.ifr_name) return -1;
   memcpy(request.ifr_name, interface, length);
-  const sysaux::Fd socket_fd(socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+  const platform::Fd socket_fd(socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
   if (!socket_fd.ok() || ioctl(socket_fd.get(), SIOCGIFHWADDR, &request) != 0) return -1;
   if (request.ifr_hwaddr.sa_family != ARPHRD_ETHER) return -1;
   memcpy(mac, request.ifr_hwaddr.sa_data, 6);

@@ -2,6 +2,7 @@
 
 #include <dlfcn.h>
 #include <sys/stat.h>
+
 #include <climits>
 #include <cstdio>
 #include <cstring>

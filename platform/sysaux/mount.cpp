@@ -3,30 +3,33 @@
 // The kernel tells by statx(2), since Linux 5.8, whether a path is the root of a mount: one call, no table
 // read, and no I/O to the volume. Older kernels and paths that cannot be looked up (a mount that lost its
 // server) are answered from /proc/self/mounts by the C library, which decodes the octal escapes there.
+
 #include <fcntl.h>
 #include <mntent.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
+
 #include <cerrno>
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 
+#include "common/fd.h"
 #include "sysaux.h"
-#include "sysaux/fd.h"
 
 namespace {
 
-enum class Answer { kNo, kYes, kUnknown };
+enum class KernelAnswer { kNo, kYes, kUnknown };
 
-Answer ask_kernel(int directory, const char* path, int flags) {
+KernelAnswer ask_kernel(int directory, const char* path, int flags) {
   struct statx info;
   if (statx(directory, path, flags | AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC, 0, &info) != 0) {
-    return errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG ? Answer::kNo : Answer::kUnknown;
+    return errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG ? KernelAnswer::kNo
+                                                                        : KernelAnswer::kUnknown;
   }
-  if ((info.stx_attributes_mask & STATX_ATTR_MOUNT_ROOT) == 0) return Answer::kUnknown;
-  return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0 ? Answer::kYes : Answer::kNo;
+  if ((info.stx_attributes_mask & STATX_ATTR_MOUNT_ROOT) == 0) return KernelAnswer::kUnknown;
+  return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0 ? KernelAnswer::kYes : KernelAnswer::kNo;
 }
 
 bool listed_once(const char* path) {
@@ -51,8 +54,8 @@ bool listed(const char* path) {
 }
 
 bool is_mount_root(int directory, const char* path, int flags, const char* name) {
-  const Answer answer = ask_kernel(directory, path, flags);
-  return answer == Answer::kUnknown ? listed(name) : answer == Answer::kYes;
+  const KernelAnswer answer = ask_kernel(directory, path, flags);
+  return answer == KernelAnswer::kUnknown ? listed(name) : answer == KernelAnswer::kYes;
 }
 
 }  // namespace
@@ -69,7 +72,7 @@ int sys_mount_point(const char* path) {
 int sys_get_df_info(const char* path, unsigned long long* total, unsigned long long* used,
                     unsigned long long* available) {
   if (path == nullptr || path[0] == '\0') return -1;
-  const sysaux::Fd place(open(path, O_PATH | O_CLOEXEC));
+  const platform::Fd place(open(path, O_PATH | O_CLOEXEC));
   struct statvfs space;
   if (!place.ok() || !is_mount_root(place.get(), "", AT_EMPTY_PATH, path)) return -1;
   if (fstatvfs(place.get(), &space) != 0) return -1;

@@ -6,13 +6,14 @@
 #include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
+
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
 
+#include "common/fd.h"
 #include "sysaux/block.h"
-#include "sysaux/fd.h"
 
 namespace sysaux {
 
@@ -20,7 +21,7 @@ static bool read_partition(int block_dir, const char* name, Partition* partition
   long long number = 0;
   Extent& extent = partition->extent;
   if (strlen(name) >= sizeof partition->name) return false;
-  const Fd dir(openat(block_dir, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const platform::Fd dir(openat(block_dir, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!dir.ok() || !read_number_at(dir.get(), "partition", &number)) return false;
   if (!read_number_at(dir.get(), "start", &extent.start) ||
       !read_number_at(dir.get(), "size", &extent.size)) {
@@ -36,10 +37,10 @@ static int by_number(const void* left, const void* right) {
          static_cast<const Partition*>(right)->extent.number;
 }
 
-bool read_partitions(int block_dir, PartitionList* list) {
+bool read_partitions(int block_dir, DiskPartitions* list) {
   list->count = 0;
   // A directory of its own, because reading it moves its offset.
-  Fd own(openat(block_dir, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  platform::Fd own(openat(block_dir, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   DIR* entries = own.ok() ? fdopendir(own.get()) : nullptr;
   if (entries == nullptr) return false;
   own.release();
@@ -52,7 +53,7 @@ bool read_partitions(int block_dir, PartitionList* list) {
   return true;
 }
 
-static const Partition* find_partition(const PartitionList& list, int number) {
+static const Partition* find_partition(const DiskPartitions& list, int number) {
   for (int i = 0; i < list.count; i++) {
     if (list.at[i].extent.number == number) return &list.at[i];
   }
@@ -76,7 +77,7 @@ static bool same(const Extent& left, const Extent& right) {
 }
 
 bool announce_partition(int disk, int block_dir, const Extent& extent, Partition* shown) {
-  PartitionList list;
+  DiskPartitions list;
   if (!read_partitions(block_dir, &list)) return false;
   const Partition* known = find_partition(list, extent.number);
   if (known == nullptr) {

@@ -6,6 +6,7 @@
 #define PLATFORM_SYSAUX_PARTITIONS_H
 
 #include <sys/types.h>
+
 #include <cstddef>
 
 namespace sysaux {
@@ -24,14 +25,14 @@ struct Partition {
   char name[32];  // DISK_NAME_LEN of the kernel
 };
 
-struct PartitionList {
+struct DiskPartitions {
   int count;
   Partition at[kMaxPartitions];
 };
 
 // Reads the partitions that the kernel has for the disk whose sysfs directory is `block_dir`, in the order of
 // their numbers. Returns false when the directory cannot be read.
-bool read_partitions(int block_dir, PartitionList* list);
+bool read_partitions(int block_dir, DiskPartitions* list);
 
 // Makes the kernel's view of one partition what `extent` says: adds it when it is not there, grows it when it
 // starts there. `disk` is an open descriptor of the whole disk. Returns true when sysfs then shows just that,

@@ -1,14 +1,16 @@
 // The module that recognises: file systems and partitions.
+
 #include <fcntl.h>
 #include <unistd.h>
+
 #include <cerrno>
 #include <climits>
 #include <cstdio>
 #include <cstring>
 
+#include "common/fd.h"
 #include "sysaux/block.h"
 #include "sysaux/content.h"
-#include "sysaux/fd.h"
 #include "sysaux/modules.h"
 #include "sysaux/partitions.h"
 
@@ -49,7 +51,7 @@ int list_unread_table(const char* device, int block_dir, NameList* names) {
   Partition shown;
   char disk_name[32];
   char name[64];
-  const Fd disk(open(device, O_RDONLY | O_CLOEXEC));
+  const platform::Fd disk(open(device, O_RDONLY | O_CLOEXEC));
   if (!disk.ok() && errno == ENOENT) return 0;  // without a node the kernel alone is asked
   if (!disk.ok() || !kernel_name(device, disk_name, sizeof disk_name)) return -1;
   const int count = read_table(disk.get(), extents, kMaxPartitions);
@@ -83,7 +85,7 @@ void read_ahead(int device) {
 
 int sysaux_probe_fs_type(char* out, const char* node) {
   out[0] = '\0';
-  const Fd device(open(node, O_RDONLY | O_CLOEXEC));
+  const platform::Fd device(open(node, O_RDONLY | O_CLOEXEC));
   if (!device.ok()) return -1;
   read_ahead(device.get());
   const Content content = recognise(device.get(), out);
@@ -96,9 +98,9 @@ int sysaux_probe_fs_type(char* out, const char* node) {
 }
 
 int sysaux_probe_partition_list(char* out, const char* device) {
-  PartitionList known;
+  DiskPartitions known;
   NameList names(out);
-  const Fd block_dir(open_block_dir(device));
+  const platform::Fd block_dir(open_block_dir(device));
   if (!block_dir.ok() || !read_partitions(block_dir.get(), &known)) return -1;
   if (known.count == 0) return list_unread_table(device, block_dir.get(), &names);
   for (int i = 0; i < known.count; i++) names.add(known.at[i].name);

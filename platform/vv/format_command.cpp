@@ -15,21 +15,21 @@ using vvstat::Row;
 constexpr size_t kTypeSize = 16, kListSize = 1024;  // as sysaux.h has them
 
 // What is on a disk, as far as it can be told.
-struct Content {
+struct DiskContent {
   bool readable = false;
   std::string what;  // such as "ext4 on sdb1"; empty when nothing is recognised
 };
 
 // Adds what is on a node. Returns false when it cannot be read.
-bool look_at(const std::string& name, Content& content) {
+bool look_at(const std::string& name, DiskContent& content) {
   char type[kTypeSize] = "";
   const int result = sys_get_fs_type(type, ("/dev/" + name).c_str());
   if (result == 0) content.what += (content.what.empty() ? "" : ", ") + std::string(type) + " on " + name;
   return result >= 0;
 }
 
-Content content_of(const std::string& disk) {
-  Content content;
+DiskContent read_content(const std::string& disk) {
+  DiskContent content;
   char names[kListSize] = "";
   const int count = sys_get_partition_list(names, ("/dev/" + disk).c_str());
   content.readable = count > 0 || (count == 0 && look_at(disk, content));
@@ -57,9 +57,9 @@ bool find_disk(Job& job, std::string& disk) {
 }
 
 // Returns false after keeping that there is data, or that nobody can tell.
-bool may_overwrite(Job& job, const std::string& disk, Content& content) {
+bool may_overwrite(Job& job, const std::string& disk, DiskContent& content) {
   const std::string share = platform::printable(job.row->volume->share);
-  content = content_of(disk);
+  content = read_content(disk);
   if (!content.readable) {
     return job.refuse(kFailed, "the disk of " + share + " cannot be read",
                       {kDiskStep, "what is on it is not known", "look at the kernel's log: dmesg", {}});
@@ -76,7 +76,7 @@ bool may_overwrite(Job& job, const std::string& disk, Content& content) {
 int format(const Options& options) {
   Job job(options);
   std::string disk;
-  Content content;
+  DiskContent content;
   if (!job.find_share() || !find_disk(job, disk) || !may_overwrite(job, disk, content)) return job.end();
   const std::string share = platform::printable(options.name);
   const std::string loss =

@@ -44,7 +44,7 @@ enum : int {
   kJsonOption
 };
 
-constexpr struct Row {
+constexpr struct OptionRow {
   int letter;
   unsigned bit;  // of the commands that take it; 0: all do
   const char* name;
@@ -71,7 +71,7 @@ constexpr struct Row {
 const option* long_options() {
   static option options[std::size(kOptions) + 1] = {};
   for (size_t i = 0; i < std::size(kOptions); i++) {
-    const Row& row = kOptions[i];
+    const OptionRow& row = kOptions[i];
     options[i] = {row.name, row.argument != nullptr ? required_argument : no_argument, nullptr, row.letter};
   }
   return options;
@@ -82,14 +82,14 @@ int wrong_usage() {
   return kUsage;
 }
 
-bool takes(const Command& command, const Row& row) {
+bool takes(const Command& command, const OptionRow& row) {
   return row.bit == 0 || (command.takes & row.bit) != 0;
 }
 
 // The options that a command takes; all of them without one.
 void print_options(const Command* command) {
   puts("\nOptions:");
-  for (const Row& row : kOptions) {
+  for (const OptionRow& row : kOptions) {
     if (row.help == nullptr || (command != nullptr && !takes(*command, row))) continue;
     std::string words = std::string("--") + row.name;
     if (row.argument != nullptr) words += std::string(" ") + row.argument;
@@ -128,7 +128,7 @@ int print_completions(const std::vector<std::string>& words) {
 
 // Says so and returns false when the command takes no such option.
 bool may_take(const Command& command, int letter, unsigned& given) {
-  for (const Row& row : kOptions) {
+  for (const OptionRow& row : kOptions) {
     if (row.letter != letter) continue;
     given |= row.bit;
     if (takes(command, row)) return true;
@@ -181,7 +181,7 @@ bool take_option(int letter, Options& options) {
 // What is there must go together.
 bool fits(const Options& options, unsigned given) {
   const Command& command = *options.command;
-  for (const Row& row : kOptions) {
+  for (const OptionRow& row : kOptions) {
     if ((command.needs & row.bit & ~given) == 0) continue;
     fprintf(stderr, "vv: %s needs --%s\n", command.name, row.name);
     return false;
@@ -224,14 +224,14 @@ const Command* find_command(const char* name) {
 
 std::vector<std::string> options_of(const Command& command) {
   std::vector<std::string> names;
-  for (const Row& row : kOptions) {
+  for (const OptionRow& row : kOptions) {
     if (row.help != nullptr && takes(command, row)) names.push_back(std::string("--") + row.name);
   }
   return names;
 }
 
 bool takes_value(const std::string& option) {
-  return std::any_of(std::begin(kOptions), std::end(kOptions), [&option](const Row& row) {
+  return std::any_of(std::begin(kOptions), std::end(kOptions), [&option](const OptionRow& row) {
     return row.argument != nullptr && option == std::string("--") + row.name;
   });
 }

@@ -1,13 +1,12 @@
 #include "vv/output.h"
 
-#include <libsmartcols.h>
-
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
 
+#include "common/scols.h"
 #include "common/utf8.h"
 #include "vv/list.h"
 #include "vv/options.h"
@@ -15,12 +14,7 @@
 namespace vv {
 namespace {
 
-struct TableEnd {
-  void operator()(libscols_table* table) const { scols_unref_table(table); }
-};
-using Scols = std::unique_ptr<libscols_table, TableEnd>;
-
-bool add_column(libscols_table* table, const Column& column) {
+bool add_column(libscols_table* table, const TableColumn& column) {
   libscols_column* added = scols_table_new_column(table, column.name, 0, column.number ? SCOLS_FL_RIGHT : 0);
   return added != nullptr &&
          scols_column_set_json_type(added, column.number ? SCOLS_JSON_NUMBER : SCOLS_JSON_STRING) == 0;
@@ -36,10 +30,10 @@ bool add_row(libscols_table* table, const std::vector<std::string>& row) {
   return true;
 }
 
-Scols filled(const Table& table) {
-  Scols made(scols_new_table());
+platform::ScolsTable filled(const Table& table) {
+  platform::ScolsTable made(scols_new_table());
   bool good = made != nullptr && scols_table_set_name(made.get(), table.name) == 0;
-  for (const Column& column : table.columns) good = good && add_column(made.get(), column);
+  for (const TableColumn& column : table.columns) good = good && add_column(made.get(), column);
   for (const auto& row : table.rows) good = good && add_row(made.get(), row);
   return good ? std::move(made) : nullptr;
 }
@@ -100,7 +94,7 @@ void tell_failure(const Outcome& outcome) {
 }  // namespace
 
 std::string shown(const Table& table, bool json) {
-  const Scols made = filled(table);
+  const platform::ScolsTable made = filled(table);
   if (made == nullptr) return {};
   scols_table_enable_noencoding(made.get(), 1);  // add_row() has done it
   scols_table_enable_json(made.get(), json);

@@ -9,14 +9,14 @@
 
 namespace vv {
 
-struct Column {
+struct TableColumn {
   const char* name;
   bool number = false;
 };
 
 struct Table {
   const char* name;  // of the list in JSON
-  std::vector<Column> columns;
+  std::vector<TableColumn> columns;
   std::vector<std::vector<std::string>> rows;
 };
 

@@ -13,12 +13,12 @@ namespace {
 
 constexpr int kLastPort = 65535;
 
-struct Parts {
+struct PortalParts {
   std::string_view host, port;
 };
 
 // What stands before and behind the colon of the port. An address of IPv6 without brackets has none.
-bool split(std::string_view text, Parts& parts) {
+bool split(std::string_view text, PortalParts& parts) {
   const size_t bracket = text.rfind(']');
   const bool bracketed = text.starts_with('[') && bracket != std::string_view::npos;
   const bool bare = !bracketed && std::count(text.begin(), text.end(), ':') > 1;
@@ -71,7 +71,7 @@ std::string Portal::text() const {
 }
 
 bool read_portal(const std::string& text, Portal& portal, std::string& why) {
-  Parts parts;
+  PortalParts parts;
   Portal read;
   if (!split(text, parts) || !read_port(parts.port, read.port)) {
     why = "\"" + text + "\" is no portal: an address such as 10.9.0.2, 10.9.0.2:3260 or [fd00::2]:3260 is";

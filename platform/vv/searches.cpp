@@ -15,7 +15,7 @@
 namespace vv {
 namespace {
 
-using ktree::client::Result;
+using ktree::client::CallResult;
 using platform::TreeReader;
 
 constexpr char kRoot[] = "/temp";
@@ -23,7 +23,7 @@ constexpr char kUnknown[] = "unknown";  // the tool's word for a file system tha
 constexpr int kLoginFailed = 100;
 
 bool forget(const char* path) {
-  return ktree::client::del(platform::kGeneralTree, path) != Result::kUnreachable;
+  return ktree::client::del(platform::kGeneralTree, path) != CallResult::kUnreachable;
 }
 
 }  // namespace

@@ -15,7 +15,7 @@ namespace {
 constexpr size_t kMost = 127;  // bytes that the tool takes of a user and of a password
 
 // Reads the file up to a byte more than the longest password and its end of line.
-bool read_file(const std::string& name, std::string& text) {
+bool read_password(const std::string& name, std::string& text) {
   const int file = name == "-" ? STDIN_FILENO : open(name.c_str(), O_RDONLY | O_CLOEXEC);
   if (file < 0) return false;
   text.reserve(kMost + 2);  // so that no copy of it stays elsewhere
@@ -48,7 +48,7 @@ bool read_credentials(const Options& options, Credentials& credentials, std::str
     if (!ask_secret("Password of " + platform::printable(options.user) + ": ", credentials.secret)) {
       return false;
     }
-  } else if (!read_file(file, credentials.secret)) {
+  } else if (!read_password(file, credentials.secret)) {
     why = platform::printable(file) + ": " + strerror(errno);
     return false;
   }

@@ -4,9 +4,9 @@
 #include <strings.h>
 #include <termios.h>
 #include <unistd.h>
-#include <csignal>
 
 #include <cerrno>
+#include <csignal>
 #include <cstring>
 #include <iterator>
 

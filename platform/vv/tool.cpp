@@ -7,16 +7,16 @@
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
-#include <csignal>
 
+#include <csignal>
 #include <cstring>
 
 #include "common/file_text.h"
+#include "common/start.h"
 
 namespace vv {
 namespace {
 
-constexpr char kTool[] = "remvol";
 constexpr int kLookEvery = 200;  // milliseconds
 
 // User and secret count only behind "-c 1".
@@ -34,8 +34,8 @@ Arguments with_portal(Arguments arguments, const Portal& portal) {
 
 // What the tool prints goes into a memory file: unlike a pipe it has room for everything, and the tool may go
 // on writing to it when the reader is gone.
-pid_t start(const Arguments& arguments, int output) {
-  std::vector<char*> words{const_cast<char*>(kTool)};
+pid_t start_tool(const Arguments& arguments, int output) {
+  std::vector<char*> words{const_cast<char*>(platform::kTool)};
   for (const std::string& argument : arguments) words.push_back(const_cast<char*>(argument.c_str()));
   words.push_back(nullptr);
   posix_spawn_file_actions_t files;
@@ -52,7 +52,7 @@ pid_t start(const Arguments& arguments, int output) {
   posix_spawnattr_setsigdefault(&attributes, &usual);
   posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
   pid_t process = -1;
-  if (posix_spawnp(&process, kTool, &files, &attributes, words.data(), environ) != 0) process = -1;
+  if (posix_spawnp(&process, platform::kTool, &files, &attributes, words.data(), environ) != 0) process = -1;
   posix_spawnattr_destroy(&attributes);
   posix_spawn_file_actions_destroy(&files);
   return process;
@@ -113,7 +113,7 @@ ToolRun run_tool(const Arguments& arguments, const std::function<void()>& look) 
   const int output = memfd_create("output", MFD_CLOEXEC);
   if (output < 0) return run;
   const sighandler_t interrupt = signal(SIGINT, SIG_IGN), quit = signal(SIGQUIT, SIG_IGN);
-  const pid_t process = start(arguments, output);
+  const pid_t process = start_tool(arguments, output);
   if (process > 0) {
     const int status = wait_for(process, look);
     run.started = true;

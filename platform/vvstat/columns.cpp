@@ -1,6 +1,5 @@
 #include "vvstat/columns.h"
 
-#include <libsmartcols.h>
 #include <locale.h>
 #include <strings.h>
 
@@ -10,6 +9,7 @@
 #include <iterator>
 #include <memory>
 
+#include "common/scols.h"
 #include "common/utf8.h"
 #include "vvstat/moment.h"
 
@@ -178,11 +178,6 @@ std::vector<size_t> columns_of(const std::vector<Row>& rows, const Layout& layou
   return columns;
 }
 
-struct TableEnd {
-  void operator()(libscols_table* table) const { scols_unref_table(table); }
-};
-using Table = std::unique_ptr<libscols_table, TableEnd>;
-
 bool add_column(libscols_table* table, const Column& column) {
   const int flags = (column.right ? SCOLS_FL_RIGHT : 0) | (column.width > 0 ? SCOLS_FL_TRUNC : 0);
   libscols_column* added = scols_table_new_column(table, column.name, column.width, flags);
@@ -205,8 +200,8 @@ bool add_row(libscols_table* table, const Row& row, const std::vector<size_t>& c
   return true;
 }
 
-Table table_of(const std::vector<Row>& rows, const Layout& layout) {
-  Table table(scols_new_table());
+platform::ScolsTable table_of(const std::vector<Row>& rows, const Layout& layout) {
+  platform::ScolsTable table(scols_new_table());
   const std::vector<size_t> columns = columns_of(rows, layout);
   bool good = table != nullptr && scols_table_set_name(table.get(), "volumes") == 0;
   for (const size_t column : columns) good = good && add_column(table.get(), kColumns[column]);
@@ -257,10 +252,10 @@ std::string describe_columns() {
   return text;
 }
 
-std::string report(const std::vector<Row>& rows, const Layout& asked) {
+std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {
   Layout layout = asked;
   layout.bytes = layout.bytes || layout.form == Form::kJson;
-  const Table table = table_of(rows, layout);
+  const platform::ScolsTable table = table_of(rows, layout);
   if (table == nullptr) return {};
   scols_table_enable_noencoding(table.get(), 1);  // cell() has done it
   scols_table_enable_json(table.get(), layout.form == Form::kJson);

@@ -32,7 +32,7 @@ std::string describe_columns();
 // The report. Text of users is shown with \xHH for bytes that are no UTF-8, and for characters that move a
 // cursor or cannot be seen. Secrets are not in it. The process must have a UTF-8 locale (use_utf8()) for all
 // else that is not ASCII. Empty when there is no memory for it.
-std::string report(const std::vector<Row>& rows, const Layout& layout);
+std::string volume_report(const std::vector<Row>& rows, const Layout& layout);
 
 // Everything of one row, a column a line; what is empty is left out. Text of users is shown as above.
 std::string block(const Row& row, bool bytes);

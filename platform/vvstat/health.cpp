@@ -7,13 +7,13 @@ namespace {
 
 const Problem kNone;
 
-std::string connect(const Target& target) {
+std::string connect_command_of(const Target& target) {
   return connect_command(target.name);
 }
 
 // A connection alone leaves what is mounted as it is.
 std::string mount_anew(const Target& target) {
-  return "remvol --disconnect -n " + quoted(target.name) + " && " + connect(target);
+  return "remvol --disconnect -n " + quoted(target.name) + " && " + connect_command_of(target);
 }
 
 // The tool stores that a target is not to be connected when somebody disconnects it, but also when a login
@@ -31,7 +31,7 @@ constexpr char kHealsItself[] = "look at the network and the storage server; it 
 // disconnection.
 Problem given_up(const Target& target) {
   return {Ailment::kFailed, "Given Up", "was given up at start-up: its target showed no disk",
-          "see whether the storage server still offers its LUNs", connect(target)};
+          "see whether the storage server still offers its LUNs", connect_command_of(target)};
 }
 
 // Nothing of a target's volumes can be had while it has a problem.
@@ -45,13 +45,13 @@ Problem problem_of(const Target& target, const TargetFacts& facts) {
       return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
     case kConnectError:
       return {Ailment::kFailed, "Connect Error", "the login failed",
-              "check the address, the password and the cable", connect(target)};
+              "check the address, the password and the cable", connect_command_of(target)};
     default:
-      return {Ailment::kFailed, "Disconnected", "is not connected", "connect it", connect(target)};
+      return {Ailment::kFailed, "Disconnected", "is not connected", "connect it", connect_command_of(target)};
   }
   if (facts.session.empty()) {
     return {Ailment::kLost, "No Session", "the target's session is gone, although nobody disconnected it",
-            "connect it again", connect(target)};
+            "connect it again", connect_command_of(target)};
   }
   if (facts.session != "LOGGED_IN") {
     return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
@@ -72,13 +72,13 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume) {
   }
   if (volume.volume_state == kVolumeFailed) {
     return {Ailment::kFailed, "Failed", "its partition, format or mount failed",
-            "look at the kernel's log for errors of the disk", connect(target)};
+            "look at the kernel's log for errors of the disk", connect_command_of(target)};
   }
   if (volume.device.empty()) {
     return {Ailment::kFailed, "No Disk", "its LUN has no disk here",
-            "see whether the storage server still offers it", connect(target)};
+            "see whether the storage server still offers it", connect_command_of(target)};
   }
-  return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again", connect(target)};
+  return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again", connect_command_of(target)};
 }
 
 Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {

@@ -28,7 +28,7 @@ bool is_mount_point(const std::string& path, dev_t& device) {
 }
 
 // The kernel's name of a disk or partition, such as "sdb1"; empty when there is none, or no more.
-std::string disk_of(dev_t device) {
+std::string disk_name_of(dev_t device) {
   const std::string link =
       "/sys/dev/block/" + std::to_string(major(device)) + ":" + std::to_string(minor(device));
   char target[PATH_MAX] = "";
@@ -76,7 +76,7 @@ VolumeFacts facts_of(const Volume& volume, bool answering) {
       statvfs(volume.mount_point.c_str(), &space) != 0) {
     return facts;
   }
-  const std::string disk = disk_of(device);
+  const std::string disk = disk_name_of(device);
   facts.mounted = true;
   facts.disk_lost = major(device) != 0 && disk.empty() && access("/sys/dev/block", F_OK) == 0;
   facts.read_only = (space.f_flag & ST_RDONLY) != 0 ||

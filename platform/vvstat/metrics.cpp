@@ -60,7 +60,7 @@ constexpr Metric kOfTargets[] = {
 };
 
 // A label's value: the format has escapes for three characters, and is UTF-8.
-std::string quoted(std::string_view text) {
+std::string label_value(std::string_view text) {
   std::string out = "\"";
   for (const char byte : platform::printable(text)) {
     if (byte == '"' || byte == '\\') out += '\\';
@@ -71,17 +71,17 @@ std::string quoted(std::string_view text) {
 
 std::string labels_of_volume(const Row& row) {
   std::string text = "{share=";
-  text += quoted(row.volume->share);
+  text += label_value(row.volume->share);
   text += ",lun=\"";
   text += std::to_string(row.volume->lun);
   text += "\",target=";
-  text += quoted(row.target->name);
+  text += label_value(row.target->name);
   return text += "}";
 }
 
 std::string labels_of_target(const Row& row) {
   std::string text = "{target=";
-  text += quoted(row.target->name);
+  text += label_value(row.target->name);
   return text += "}";
 }
 

@@ -3,12 +3,12 @@
 namespace vvstat {
 namespace {
 
-struct Parts {
+struct MomentParts {
   std::string date, minutes, clock, offset;  // "2026-11-21", "12:34", "12:34:56", "+01:00"
 };
 
 // A moment that no calendar has is the zeroth of January.
-Parts parts_of(time_t moment) {
+MomentParts parts_of(time_t moment) {
   struct tm parts {};
   if (localtime_r(&moment, &parts) == nullptr) parts = {};
   char date[32] = "", clock[16] = "", offset[16] = "";
@@ -27,17 +27,17 @@ std::string clock_of(time_t moment) {
 }
 
 std::string since_text(time_t moment, time_t now) {
-  const Parts parts = parts_of(moment);
+  const MomentParts parts = parts_of(moment);
   return parts.date == parts_of(now).date ? parts.clock : parts.date + " " + parts.minutes;
 }
 
 std::string date_and_clock(time_t moment) {
-  const Parts parts = parts_of(moment);
+  const MomentParts parts = parts_of(moment);
   return moment == 0 ? std::string() : parts.date + " " + parts.clock;
 }
 
 std::string date_for_programs(time_t moment) {
-  const Parts parts = parts_of(moment);
+  const MomentParts parts = parts_of(moment);
   return moment == 0 ? std::string() : parts.date + "T" + parts.clock + parts.offset;
 }
 

@@ -30,20 +30,20 @@ struct Options {
 };
 
 // One look at everything.
-struct Look {
+struct Snapshot {
   Status status;
   std::vector<Row> rows;
 };
 
-Look look() {
-  Look look;
+Snapshot look() {
+  Snapshot look;
   look.status = read_status(platform::TreeReader());
   look.rows = assess(look.status, read_facts(look.status));
   recall(read_history(), look.rows);
   return look;
 }
 
-int exit_status(const Look& look) {
+int exit_status(const Snapshot& look) {
   if (!look.status.reachable) return kUnreachable;
   return all_healthy(look.rows) ? 0 : kAiling;
 }
@@ -61,12 +61,12 @@ std::vector<Row> chosen(const std::vector<Row>& rows, bool ailing_only) {
   return some;
 }
 
-Page page_of(const Look& look, const Options& options) {
+Page page_of(const Snapshot& look, const Options& options) {
   if (!look.status.reachable) return {"", why_unreachable()};
   const std::vector<Row> rows = chosen(look.rows, options.ailing_only);
   Page page;
   const Layout& layout = options.layout;
-  if (!rows.empty() || layout.form == Form::kJson) page.table = report(rows, layout);
+  if (!rows.empty() || layout.form == Form::kJson) page.table = volume_report(rows, layout);
   // Whoever takes a report apart wants the rows alone.
   if (layout.form == Form::kTable && layout.headings) {
     page.verdict = verdict(look.rows, time(nullptr), layout.width);
@@ -94,7 +94,7 @@ size_t width_of_output() {
 }
 
 int show_once(const Options& options) {
-  const Look seen = look();
+  const Snapshot seen = look();
   if (!seen.status.reachable) {
     fputs(why_unreachable(), stderr);
     return kUnreachable;
@@ -108,14 +108,14 @@ int show_once(const Options& options) {
 
 // For a collector of metrics the absence of the tree is news as well.
 int show_metrics() {
-  const Look seen = look();
+  const Snapshot seen = look();
   put(metrics(seen.status.reachable, seen.rows, time(nullptr)));
   return finish(exit_status(seen));
 }
 
 // Everything of the volume of that share, or of all volumes of that target.
 int show_one(const Options& options) {
-  const Look seen = look();
+  const Snapshot seen = look();
   if (!seen.status.reachable) {
     fputs(why_unreachable(), stderr);
     return kUnreachable;
@@ -131,7 +131,7 @@ int show_one(const Options& options) {
     return kFailed;
   }
   if (options.layout.form != Form::kTable) {
-    put(report(rows, options.layout));
+    put(volume_report(rows, options.layout));
   } else {
     for (const Row& row : rows) {
       if (&row != rows.data()) put("\n");
@@ -142,7 +142,7 @@ int show_one(const Options& options) {
 }
 
 int show_again(Options options) {
-  Look last;
+  Snapshot last;
   watch([&options, &last](size_t width) {
     if (width != 0) options.layout.width = width;
     last = look();

@@ -5,9 +5,9 @@
 #include <sys/signalfd.h>
 #include <termios.h>
 #include <unistd.h>
-#include <csignal>
 
 #include <algorithm>
+#include <csignal>
 #include <cstdio>
 #include <initializer_list>
 #include <string_view>

@@ -49,10 +49,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   std::string body(room + 8, 'x');
   for (int i = 0; i < 2; i++) {  // the second finds what the first left of the connection
     Call call = {operation, "/a", "", -1, body.data(), room, 0};
-    const Result result = request("/hostile", call);
+    const CallResult result = request("/hostile", call);
     require(call.size <= room);
     require(body.compare(room, 8, "xxxxxxxx") == 0);
-    if (result == Result::kUnreachable) continue;
+    if (result == CallResult::kUnreachable) continue;
     require(reply_size >= sizeof(ReplyHeader));
     ReplyHeader header;
     memcpy(&header, reply, sizeof header);
@@ -66,7 +66,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   reply = bad;
   reply_size = 8;
   Call call = {Operation::kDel, "/a", "", -1, nullptr, 0, 0};
-  while (request("/hostile", call) != Result::kUnreachable) {
+  while (request("/hostile", call) != CallResult::kUnreachable) {
   }
   return 0;
 }

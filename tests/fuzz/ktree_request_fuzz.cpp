@@ -30,9 +30,10 @@ bool serve(Service& service, std::string_view& bytes, int document) {
     return false;
   }
   request.document = document;
-  const Service::Answer answer = service.handle(request);
+  const Service::Reply answer = service.handle(request);
   require(sizeof(ReplyHeader) + answer.body.size() <= kMaxReplyBytes);
-  require(answer.body.empty() || answer.status == Status::kDone || answer.status == Status::kDamaged);
+  require(answer.body.empty() || answer.status == ReplyStatus::kDone ||
+          answer.status == ReplyStatus::kDamaged);
   bytes.remove_prefix(size);
   return true;
 }

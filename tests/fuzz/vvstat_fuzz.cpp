@@ -85,15 +85,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
                                rows.begin() + static_cast<long>(std::min<size_t>(2, rows.size())));
   switch (data[1] >> 5U) {
     case 0:
-      check_text(report(first, layout), layout.width);
+      check_text(volume_report(first, layout), layout.width);
       break;
     case 1:
       layout.form = Form::kRaw;
-      check_text(report(first, layout), 0);
+      check_text(volume_report(first, layout), 0);
       break;
     case 2:
       layout.form = Form::kJson;
-      check_json(report(first, layout));
+      check_json(volume_report(first, layout));
       break;
     case 3:
       check_text(metrics(true, rows, 0), 0);

@@ -77,13 +77,13 @@ class File {
 
 std::string listing_of(Service& service) {
   const File file("");
-  EXPECT_EQ(service.handle({Operation::kList, "/", "", file.fd()}).status, Status::kDone);
+  EXPECT_EQ(service.handle({Operation::kList, "/", "", file.fd()}).status, ReplyStatus::kDone);
   return file.text();
 }
 
 void load(Service& service, const char* document) {
   const File file(document);
-  ASSERT_EQ(service.handle({Operation::kLoad, "", "", file.fd()}).status, Status::kDone);
+  ASSERT_EQ(service.handle({Operation::kLoad, "", "", file.fd()}).status, ReplyStatus::kDone);
 }
 
 struct Case {
@@ -109,19 +109,20 @@ TEST_P(Memory, RunsOutAtEveryAllocation) {
     const File file(request.document == nullptr ? "" : request.document);
     const int document = request.document == nullptr ? -1 : file.fd();
     allocations_left = n;
-    const Status status = service.handle({request.operation, request.path, request.value, document}).status;
+    const ReplyStatus status =
+        service.handle({request.operation, request.path, request.value, document}).status;
     const bool ran_out = allocations_left == 0;
     allocations_left = 0;
     if (!ran_out) {
-      EXPECT_EQ(status, Status::kDone);
+      EXPECT_EQ(status, ReplyStatus::kDone);
       break;
     }
     failures++;
-    EXPECT_EQ(status, Status::kFailed) << n;
+    EXPECT_EQ(status, ReplyStatus::kFailed) << n;
     EXPECT_EQ(listing_of(service), before) << n;
     // The count of what the tree holds is right as well: it takes what it took before, and gives it back.
-    EXPECT_EQ(service.handle({Operation::kSet, "/new/id:3", "v", -1}).status, Status::kDone);
-    EXPECT_EQ(service.handle({Operation::kDel, "/new", "", -1}).status, Status::kDone);
+    EXPECT_EQ(service.handle({Operation::kSet, "/new/id:3", "v", -1}).status, ReplyStatus::kDone);
+    EXPECT_EQ(service.handle({Operation::kDel, "/new", "", -1}).status, ReplyStatus::kDone);
     EXPECT_EQ(listing_of(service), before) << n;
   }
   EXPECT_GE(failures, request.at_least);

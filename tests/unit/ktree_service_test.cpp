@@ -33,21 +33,21 @@ std::string limit(uint32_t bytes) {
 
 class ServiceTest : public testing::Test {
  protected:
-  Status call(const std::string& bytes, int document = -1) {
+  ReplyStatus call(const std::string& bytes, int document = -1) {
     Request request = {};
     if (!parse_request(bytes, request)) {
       ADD_FAILURE() << "not a request";
-      return Status::kFailed;
+      return ReplyStatus::kFailed;
     }
     request.document = document;
-    const Service::Answer answer = service_.handle(request);
+    const Service::Reply answer = service_.handle(request);
     body_ = answer.body;
     return answer.status;
   }
-  Status set(const std::string& path, const std::string& value) {
+  ReplyStatus set(const std::string& path, const std::string& value) {
     return call(request(Operation::kSet, path, value));
   }
-  Status get(const std::string& path, uint32_t bytes = 65535) {
+  ReplyStatus get(const std::string& path, uint32_t bytes = 65535) {
     return call(request(Operation::kGet, path, limit(bytes)));
   }
 
@@ -91,43 +91,43 @@ TEST(Frame, ThatDoesNotHoldTogetherIsNone) {
 }
 
 TEST_F(ServiceTest, SetsAndGets) {
-  EXPECT_EQ(get("/a"), Status::kMissing);
-  EXPECT_EQ(set("/a", "value"), Status::kDone);
-  EXPECT_EQ(get("/a"), Status::kDone);
+  EXPECT_EQ(get("/a"), ReplyStatus::kMissing);
+  EXPECT_EQ(set("/a", "value"), ReplyStatus::kDone);
+  EXPECT_EQ(get("/a"), ReplyStatus::kDone);
   EXPECT_EQ(body_, "value");
-  EXPECT_EQ(get("/a", 3), Status::kDone);
+  EXPECT_EQ(get("/a", 3), ReplyStatus::kDone);
   EXPECT_EQ(body_, "val");
-  EXPECT_EQ(get("/a", 0), Status::kDone);
+  EXPECT_EQ(get("/a", 0), ReplyStatus::kDone);
   EXPECT_EQ(body_, "");
 }
 
 TEST_F(ServiceTest, RefusesBadPathsAndChangesNothing) {
-  EXPECT_EQ(set("/a/b:0", "x"), Status::kRefused);
-  EXPECT_EQ(get("/a"), Status::kMissing);
-  EXPECT_EQ(set("/", "x"), Status::kRefused);
-  EXPECT_EQ(set("", "x"), Status::kRefused);
-  EXPECT_EQ(get("/a:4097"), Status::kRefused);
-  EXPECT_EQ(call(request(Operation::kDel, "/")), Status::kRefused);
+  EXPECT_EQ(set("/a/b:0", "x"), ReplyStatus::kRefused);
+  EXPECT_EQ(get("/a"), ReplyStatus::kMissing);
+  EXPECT_EQ(set("/", "x"), ReplyStatus::kRefused);
+  EXPECT_EQ(set("", "x"), ReplyStatus::kRefused);
+  EXPECT_EQ(get("/a:4097"), ReplyStatus::kRefused);
+  EXPECT_EQ(call(request(Operation::kDel, "/")), ReplyStatus::kRefused);
 }
 
 TEST_F(ServiceTest, RefusesValuesThatATreeCannotHold) {
-  EXPECT_EQ(set("/a", std::string("x\0y", 3)), Status::kRefused);
-  EXPECT_EQ(set("/a", std::string(65536, 'x')), Status::kRefused);
-  EXPECT_EQ(get("/a"), Status::kMissing);
-  EXPECT_EQ(set("/a", std::string(65535, 'x')), Status::kDone);
+  EXPECT_EQ(set("/a", std::string("x\0y", 3)), ReplyStatus::kRefused);
+  EXPECT_EQ(set("/a", std::string(65536, 'x')), ReplyStatus::kRefused);
+  EXPECT_EQ(get("/a"), ReplyStatus::kMissing);
+  EXPECT_EQ(set("/a", std::string(65535, 'x')), ReplyStatus::kDone);
 }
 
 TEST_F(ServiceTest, RefusesAGetWithoutItsLimit) {
-  ASSERT_EQ(set("/a", "x"), Status::kDone);
-  EXPECT_EQ(call(request(Operation::kGet, "/a")), Status::kRefused);
-  EXPECT_EQ(call(request(Operation::kGet, "/a", "123")), Status::kRefused);
+  ASSERT_EQ(set("/a", "x"), ReplyStatus::kDone);
+  EXPECT_EQ(call(request(Operation::kGet, "/a")), ReplyStatus::kRefused);
+  EXPECT_EQ(call(request(Operation::kGet, "/a", "123")), ReplyStatus::kRefused);
 }
 
 TEST_F(ServiceTest, Deletes) {
-  ASSERT_EQ(set("/a/b", "x"), Status::kDone);
-  EXPECT_EQ(call(request(Operation::kDel, "/a")), Status::kDone);
-  EXPECT_EQ(call(request(Operation::kDel, "/a")), Status::kMissing);
-  EXPECT_EQ(get("/a/b"), Status::kMissing);
+  ASSERT_EQ(set("/a/b", "x"), ReplyStatus::kDone);
+  EXPECT_EQ(call(request(Operation::kDel, "/a")), ReplyStatus::kDone);
+  EXPECT_EQ(call(request(Operation::kDel, "/a")), ReplyStatus::kMissing);
+  EXPECT_EQ(get("/a/b"), ReplyStatus::kMissing);
 }
 
 TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
@@ -137,11 +137,11 @@ TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
   const int sealed = memfd_create("sealed", MFD_CLOEXEC | MFD_ALLOW_SEALING);
   ASSERT_EQ(fcntl(sealed, F_ADD_SEALS, F_SEAL_WRITE), 0);
   for (int document : {-1, null, pipes[1]}) {
-    EXPECT_EQ(call(request(Operation::kDump, ""), document), Status::kFailed);
-    EXPECT_EQ(call(request(Operation::kLoad, ""), document), Status::kFailed);
-    EXPECT_EQ(call(request(Operation::kList, "/"), document), Status::kFailed);
+    EXPECT_EQ(call(request(Operation::kDump, ""), document), ReplyStatus::kFailed);
+    EXPECT_EQ(call(request(Operation::kLoad, ""), document), ReplyStatus::kFailed);
+    EXPECT_EQ(call(request(Operation::kList, "/"), document), ReplyStatus::kFailed);
   }
-  EXPECT_EQ(call(request(Operation::kDump, ""), sealed), Status::kFailed);
+  EXPECT_EQ(call(request(Operation::kDump, ""), sealed), ReplyStatus::kFailed);
   for (int fd : {null, pipes[0], pipes[1], sealed}) {
     close(fd);
   }
@@ -149,14 +149,14 @@ TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
 
 TEST_F(ServiceTest, LoadsWhatItDumped) {
   const int document = memfd_create("document", MFD_CLOEXEC);
-  ASSERT_EQ(set("/a", "x"), Status::kDone);
-  ASSERT_EQ(call(request(Operation::kDump, ""), document), Status::kDone);
-  ASSERT_EQ(set("/a", "y"), Status::kDone);
-  ASSERT_EQ(set("/b", "z"), Status::kDone);
-  ASSERT_EQ(call(request(Operation::kLoad, ""), document), Status::kDone);
-  EXPECT_EQ(get("/a"), Status::kDone);
+  ASSERT_EQ(set("/a", "x"), ReplyStatus::kDone);
+  ASSERT_EQ(call(request(Operation::kDump, ""), document), ReplyStatus::kDone);
+  ASSERT_EQ(set("/a", "y"), ReplyStatus::kDone);
+  ASSERT_EQ(set("/b", "z"), ReplyStatus::kDone);
+  ASSERT_EQ(call(request(Operation::kLoad, ""), document), ReplyStatus::kDone);
+  EXPECT_EQ(get("/a"), ReplyStatus::kDone);
   EXPECT_EQ(body_, "x");
-  EXPECT_EQ(get("/b"), Status::kMissing);
+  EXPECT_EQ(get("/b"), ReplyStatus::kMissing);
   close(document);
 }
 
@@ -164,21 +164,21 @@ TEST_F(ServiceTest, ADamagedDocumentLeavesTheTreeAsItWas) {
   const int document = memfd_create("document", MFD_CLOEXEC);
   const std::string text = "<config>\n<a>new</a>\n<b>\n</config>";
   ASSERT_EQ(write(document, text.data(), text.size()), static_cast<ssize_t>(text.size()));
-  ASSERT_EQ(set("/a", "old"), Status::kDone);
-  EXPECT_EQ(call(request(Operation::kLoad, ""), document), Status::kDamaged);
+  ASSERT_EQ(set("/a", "old"), ReplyStatus::kDone);
+  EXPECT_EQ(call(request(Operation::kLoad, ""), document), ReplyStatus::kDamaged);
   EXPECT_EQ(body_, "line 4: mismatched tag");
-  EXPECT_EQ(get("/a"), Status::kDone);
+  EXPECT_EQ(get("/a"), ReplyStatus::kDone);
   EXPECT_EQ(body_, "old");
   close(document);
 }
 
 TEST_F(ServiceTest, ListsTheRootAndNodes) {
   const int document = memfd_create("document", MFD_CLOEXEC);
-  ASSERT_EQ(set("/a", "x"), Status::kDone);
-  EXPECT_EQ(call(request(Operation::kList, "/"), document), Status::kDone);
-  EXPECT_EQ(call(request(Operation::kList, "/a:1"), document), Status::kDone);
-  EXPECT_EQ(call(request(Operation::kList, "/b"), document), Status::kMissing);
-  EXPECT_EQ(call(request(Operation::kList, ""), document), Status::kRefused);
+  ASSERT_EQ(set("/a", "x"), ReplyStatus::kDone);
+  EXPECT_EQ(call(request(Operation::kList, "/"), document), ReplyStatus::kDone);
+  EXPECT_EQ(call(request(Operation::kList, "/a:1"), document), ReplyStatus::kDone);
+  EXPECT_EQ(call(request(Operation::kList, "/b"), document), ReplyStatus::kMissing);
+  EXPECT_EQ(call(request(Operation::kList, ""), document), ReplyStatus::kRefused);
   char text[64] = "";
   EXPECT_EQ(pread(document, text, sizeof text, 0), 5);
   EXPECT_STREQ(text, "/a=x\n");

@@ -14,23 +14,23 @@ struct Reason {
   char text[kMaxErrorBytes + 1];
 };
 
-[[nodiscard]] Result set(const char* socket, const char* path, const char* value);
-[[nodiscard]] Result del(const char* socket, const char* path);
+[[nodiscard]] CallResult set(const char* socket, const char* path, const char* value);
+[[nodiscard]] CallResult del(const char* socket, const char* path);
 
 // Puts at most `room` bytes of the value into `buffer` and their number into `size`.
-[[nodiscard]] Result get(const char* socket, const char* path, char* buffer, size_t room, size_t& size);
+[[nodiscard]] CallResult get(const char* socket, const char* path, char* buffer, size_t room, size_t& size);
 
 // Replaces `file` by the settings file of the tree.
-[[nodiscard]] Result dump(const char* socket, const char* file, Reason& reason);
+[[nodiscard]] CallResult dump(const char* socket, const char* file, Reason& reason);
 
 // Writes the settings file of the tree to `fd`.
-[[nodiscard]] Result dump_to(const char* socket, int fd, Reason& reason);
+[[nodiscard]] CallResult dump_to(const char* socket, int fd, Reason& reason);
 
 // Makes the tree what `file` holds.
-[[nodiscard]] Result load(const char* socket, const char* file, Reason& reason);
+[[nodiscard]] CallResult load(const char* socket, const char* file, Reason& reason);
 
 // Writes the listing of the subtree at `path` ("/" is the whole tree) to `fd`.
-[[nodiscard]] Result list_to(const char* socket, const char* path, int fd, Reason& reason);
+[[nodiscard]] CallResult list_to(const char* socket, const char* path, int fd, Reason& reason);
 
 }  // namespace ktree::client
 

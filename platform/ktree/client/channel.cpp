@@ -46,7 +46,7 @@ struct Deadline {
 };
 
 // What became of one try.
-enum class Outcome {
+enum class TryOutcome {
   kAnswered,
   kNotSent,   // the daemon cannot have read the whole request
   kLost,      // the connection ended, the daemon may have carried the request out
@@ -138,7 +138,7 @@ bool connect_channel(Channel& channel, Deadline& deadline) {
 }
 
 // The parts of a message that are still to be moved.
-struct Parts {
+struct MessageParts {
   iovec part[3];
   size_t count;
   size_t left;
@@ -167,15 +167,15 @@ void pass_descriptor(msghdr& message, cmsghdr* control, int fd) {
   memcpy(CMSG_DATA(control), &fd, sizeof fd);
 }
 
-Outcome send_request(int fd, const Call& call, Deadline& deadline) {
+TryOutcome send_request(int fd, const Call& call, Deadline& deadline) {
   RequestHeader header = {};
   header.length = static_cast<uint32_t>(sizeof header - kLengthBytes + call.path.size() + call.value.size());
   header.operation = static_cast<uint8_t>(call.operation);
   header.path_length = static_cast<uint16_t>(call.path.size());
-  Parts parts = {{readable(&header, sizeof header), readable(call.path.data(), call.path.size()),
-                  readable(call.value.data(), call.value.size())},
-                 3,
-                 sizeof header + call.path.size() + call.value.size()};
+  MessageParts parts = {{readable(&header, sizeof header), readable(call.path.data(), call.path.size()),
+                         readable(call.value.data(), call.value.size())},
+                        3,
+                        sizeof header + call.path.size() + call.value.size()};
   alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int))] = {};
   msghdr message = {};
   message.msg_iov = parts.part;
@@ -188,30 +188,30 @@ Outcome send_request(int fd, const Call& call, Deadline& deadline) {
       message.msg_control = nullptr;
       message.msg_controllen = 0;
     } else if (errno != EINTR && errno != EAGAIN) {
-      return Outcome::kNotSent;
+      return TryOutcome::kNotSent;
     } else if (!wait_for(fd, POLLOUT, deadline)) {
-      return Outcome::kTimedOut;
+      return TryOutcome::kTimedOut;
     }
   }
-  return Outcome::kAnswered;
+  return TryOutcome::kAnswered;
 }
 
 // The end of the connection as a receive sees it. The kernel says ECONNRESET when the other side closed with
 // something of ours unread (unix(7) sockets do, unix_release_sock() in the kernel): the request was then not
 // carried out.
-Outcome lost_connection(ssize_t received) {
-  return received < 0 && errno == ECONNRESET ? Outcome::kNotSent : Outcome::kLost;
+TryOutcome lost_connection(ssize_t received) {
+  return received < 0 && errno == ECONNRESET ? TryOutcome::kNotSent : TryOutcome::kLost;
 }
 
-Outcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& deadline) {
-  Parts parts = {{{&header, sizeof header}, {call.body, call.room}, {}}, 2, sizeof header + call.room};
+TryOutcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& deadline) {
+  MessageParts parts = {{{&header, sizeof header}, {call.body, call.room}, {}}, 2, sizeof header + call.room};
   msghdr message = {};
   message.msg_iov = parts.part;
   message.msg_iovlen = parts.count;
   size_t have = 0;
   size_t wanted = sizeof header;
   while (have < wanted) {
-    if (deadline.tight && !wait_for(fd, POLLIN, deadline)) return Outcome::kTimedOut;
+    if (deadline.tight && !wait_for(fd, POLLIN, deadline)) return TryOutcome::kTimedOut;
     const ssize_t n = recvmsg(fd, &message, deadline.tight ? MSG_DONTWAIT : 0);
     deadline.tight = true;
     if (n > 0) {
@@ -219,65 +219,65 @@ Outcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& deadlin
       have += static_cast<size_t>(n);
       if (have >= sizeof header) wanted = kLengthBytes + size_t{header.length};
       if (wanted < sizeof header || wanted > sizeof header + call.room || have > wanted) {
-        return Outcome::kTimedOut;
+        return TryOutcome::kTimedOut;
       }
     } else if (n == 0 || (errno != EINTR && errno != EAGAIN)) {
       return lost_connection(n);
     }
   }
   call.size = wanted - sizeof header;
-  return Outcome::kAnswered;
+  return TryOutcome::kAnswered;
 }
 
-Outcome try_once(Channel& channel, Call& call, ReplyHeader& header, Deadline& deadline) {
-  const Outcome sent = send_request(channel.fd, call, deadline);
-  return sent == Outcome::kAnswered ? receive_reply(channel.fd, call, header, deadline) : sent;
+TryOutcome try_once(Channel& channel, Call& call, ReplyHeader& header, Deadline& deadline) {
+  const TryOutcome sent = send_request(channel.fd, call, deadline);
+  return sent == TryOutcome::kAnswered ? receive_reply(channel.fd, call, header, deadline) : sent;
 }
 
 // A delete that was carried out must not be sent again: it would take the next sibling.
-bool may_try_again(Outcome outcome, Operation operation) {
-  return outcome == Outcome::kNotSent || (outcome == Outcome::kLost && operation != Operation::kDel);
+bool may_try_again(TryOutcome outcome, Operation operation) {
+  return outcome == TryOutcome::kNotSent || (outcome == TryOutcome::kLost && operation != Operation::kDel);
 }
 
-Result result_of(uint8_t status) {
-  switch (static_cast<Status>(status)) {
-    case Status::kDone:
-      return Result::kDone;
-    case Status::kMissing:
-      return Result::kMissing;
-    case Status::kRefused:
-      return Result::kRefused;
-    case Status::kDamaged:
-      return Result::kDamaged;
-    case Status::kFailed:
+CallResult result_of(uint8_t status) {
+  switch (static_cast<ReplyStatus>(status)) {
+    case ReplyStatus::kDone:
+      return CallResult::kDone;
+    case ReplyStatus::kMissing:
+      return CallResult::kMissing;
+    case ReplyStatus::kRefused:
+      return CallResult::kRefused;
+    case ReplyStatus::kDamaged:
+      return CallResult::kDamaged;
+    case ReplyStatus::kFailed:
       break;
   }
-  return Result::kFailed;
+  return CallResult::kFailed;
 }
 
-Result request_on(Channel& channel, Call& call) {
+CallResult request_on(Channel& channel, Call& call) {
   Deadline deadline = {Deadline::now() + kRequestMilliseconds, false};
   if (channel.fd >= 0 && channel.owner != getpid()) disconnect(channel);
   for (int i = 0; i < kTries; i++) {
-    if (channel.fd < 0 && !connect_channel(channel, deadline)) return Result::kUnreachable;
+    if (channel.fd < 0 && !connect_channel(channel, deadline)) return CallResult::kUnreachable;
     ReplyHeader header = {};
-    const Outcome outcome = try_once(channel, call, header, deadline);
-    if (outcome == Outcome::kAnswered) return result_of(header.status);
+    const TryOutcome outcome = try_once(channel, call, header, deadline);
+    if (outcome == TryOutcome::kAnswered) return result_of(header.status);
     disconnect(channel);
     if (!may_try_again(outcome, call.operation)) break;
   }
-  return Result::kUnreachable;
+  return CallResult::kUnreachable;
 }
 
 }  // namespace
 
-Result request(const char* socket, Call& call) {
+CallResult request(const char* socket, Call& call) {
   call.size = 0;
   Channel* channel = find_channel(socket == nullptr ? kDefaultSocket : socket);
-  if (channel == nullptr) return Result::kUnreachable;
-  if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) return Result::kRefused;
+  if (channel == nullptr) return CallResult::kUnreachable;
+  if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) return CallResult::kRefused;
   pthread_mutex_lock(&channel->lock);
-  const Result result = request_on(*channel, call);
+  const CallResult result = request_on(*channel, call);
   pthread_mutex_unlock(&channel->lock);
   return result;
 }

@@ -18,7 +18,7 @@ inline constexpr char kDefaultSocket[] = "/var/run/ktree_sock";
 // A request with its reply takes at most this long, connecting included.
 constexpr int64_t kRequestMilliseconds = 5000;
 
-enum class Result {
+enum class CallResult {
   kDone,
   kMissing,
   kRefused,
@@ -42,7 +42,7 @@ struct Call {
 // was restarted or made room for others, is opened again and the request sent again when it cannot have been
 // carried out, or when carrying it out twice does no harm. Calls from several threads to one socket follow
 // each other.
-[[nodiscard]] Result request(const char* socket, Call& call);
+[[nodiscard]] CallResult request(const char* socket, Call& call);
 
 }  // namespace ktree::client
 

@@ -12,23 +12,11 @@
 #include <cstdio>
 #include <cstring>
 
+#include "common/fd.h"
 #include "ktree/limits.h"
 
 namespace ktree::client {
 namespace {
-
-int write_all(int fd, const char* data, size_t size) {
-  while (size > 0) {
-    const ssize_t n = write(fd, data, size);
-    if (n > 0) {
-      data += n;
-      size -= static_cast<size_t>(n);
-    } else if (n == 0 || errno != EINTR) {
-      return n == 0 ? EIO : errno;
-    }
-  }
-  return 0;
-}
 
 // Copies `from`, from offset 0 to its end, to the position of `to`. Returns 0 or an errno value.
 int copy_all(int from, int to) {
@@ -41,8 +29,7 @@ int copy_all(int from, int to) {
       if (errno == EINTR) continue;
       return errno;
     }
-    const int wrong = write_all(to, buffer, static_cast<size_t>(n));
-    if (wrong != 0) return wrong;
+    if (!platform::write_all(to, buffer, static_cast<size_t>(n))) return errno;
     offset += n;
     if (static_cast<size_t>(offset) > kMaxDocumentBytes) return EFBIG;
   }

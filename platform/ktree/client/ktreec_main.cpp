@@ -12,8 +12,8 @@
 
 namespace {
 
+using ktree::client::CallResult;
 using ktree::client::Reason;
-using ktree::client::Result;
 
 constexpr int kNo = 1;  // the node is missing, or the daemon refused
 constexpr int kUsageError = 2;
@@ -34,7 +34,7 @@ constexpr char kUsage[] =
     "\n"
     "Exit status: 0 done, 1 missing or refused, 2 wrong usage, 3 the daemon cannot be reached.\n";
 
-struct Arguments {
+struct CommandLine {
   const char* socket;
   const char* operands[2];
 };
@@ -46,18 +46,18 @@ int complain(const char* subject, const char* text) {
 
 // The exit status for `result`. What went wrong is told with `subject`; a node that is missing goes without a
 // word.
-int conclude(const Arguments& arguments, Result result, const char* subject, const char* reason) {
+int conclude(const CommandLine& arguments, CallResult result, const char* subject, const char* reason) {
   switch (result) {
-    case Result::kDone:
+    case CallResult::kDone:
       return EXIT_SUCCESS;
-    case Result::kMissing:
+    case CallResult::kMissing:
       return kNo;
-    case Result::kRefused:
+    case CallResult::kRefused:
       return complain(subject, "not a path or a value that the tree can take");
-    case Result::kDamaged:
-    case Result::kFailed:
+    case CallResult::kDamaged:
+    case CallResult::kFailed:
       return complain(subject, reason);
-    case Result::kUnreachable:
+    case CallResult::kUnreachable:
       break;
   }
   const char* socket = arguments.socket == nullptr ? ktree::client::kDefaultSocket : arguments.socket;
@@ -65,12 +65,12 @@ int conclude(const Arguments& arguments, Result result, const char* subject, con
   return kUnreachable;
 }
 
-int do_get(const Arguments& arguments) {
+int do_get(const CommandLine& arguments) {
   static char value[ktree::kMaxValueBytes + 1];
   size_t size = 0;
-  const Result result =
+  const CallResult result =
       ktree::client::get(arguments.socket, arguments.operands[0], value, ktree::kMaxValueBytes, size);
-  if (result == Result::kDone) {
+  if (result == CallResult::kDone) {
     value[size] = '\n';
     if (fwrite(value, 1, size + 1, stdout) != size + 1 || fflush(stdout) != 0) {
       return complain("standard output", strerror(errno));
@@ -79,53 +79,54 @@ int do_get(const Arguments& arguments) {
   return conclude(arguments, result, arguments.operands[0], "");
 }
 
-int do_set(const Arguments& arguments) {
-  const Result result = ktree::client::set(arguments.socket, arguments.operands[0], arguments.operands[1]);
+int do_set(const CommandLine& arguments) {
+  const CallResult result =
+      ktree::client::set(arguments.socket, arguments.operands[0], arguments.operands[1]);
   return conclude(arguments, result, arguments.operands[0], "");
 }
 
-int do_del(const Arguments& arguments) {
-  const Result result = ktree::client::del(arguments.socket, arguments.operands[0]);
+int do_del(const CommandLine& arguments) {
+  const CallResult result = ktree::client::del(arguments.socket, arguments.operands[0]);
   return conclude(arguments, result, arguments.operands[0], "");
 }
 
-int do_list(const Arguments& arguments) {
+int do_list(const CommandLine& arguments) {
   const char* path = arguments.operands[0] == nullptr ? "/" : arguments.operands[0];
   Reason reason;
-  const Result result = ktree::client::list_to(arguments.socket, path, STDOUT_FILENO, reason);
+  const CallResult result = ktree::client::list_to(arguments.socket, path, STDOUT_FILENO, reason);
   return conclude(arguments, result, path, reason.text);
 }
 
-int do_load(const Arguments& arguments) {
+int do_load(const CommandLine& arguments) {
   Reason reason;
-  const Result result = ktree::client::load(arguments.socket, arguments.operands[0], reason);
+  const CallResult result = ktree::client::load(arguments.socket, arguments.operands[0], reason);
   return conclude(arguments, result, arguments.operands[0], reason.text);
 }
 
-int do_dump(const Arguments& arguments) {
+int do_dump(const CommandLine& arguments) {
   const char* file = arguments.operands[0];
   Reason reason;
   if (strcmp(file, "-") == 0) {
-    const Result result = ktree::client::dump_to(arguments.socket, STDOUT_FILENO, reason);
+    const CallResult result = ktree::client::dump_to(arguments.socket, STDOUT_FILENO, reason);
     return conclude(arguments, result, "standard output", reason.text);
   }
   return conclude(arguments, ktree::client::dump(arguments.socket, file, reason), file, reason.text);
 }
 
-struct Operation {
+struct ClientOperation {
   const char* option;
   int least_operands;
   int most_operands;
-  int (*run)(const Arguments& arguments);
+  int (*run)(const CommandLine& arguments);
 };
 
-constexpr Operation kOperations[] = {
+constexpr ClientOperation kOperations[] = {
     {"-g", 1, 1, do_get},  {"-s", 2, 2, do_set},  {"-d", 1, 1, do_del},
     {"-t", 0, 1, do_list}, {"-l", 1, 1, do_load}, {"-D", 1, 1, do_dump},
 };
 
-const Operation* find_operation(const char* option) {
-  for (const Operation& operation : kOperations) {
+const ClientOperation* find_operation(const char* option) {
+  for (const ClientOperation& operation : kOperations) {
     if (strcmp(operation.option, option) == 0) return &operation;
   }
   return nullptr;
@@ -138,7 +139,7 @@ int usage_error(const char* text) {
 
 // Takes the words after the program's name: the socket and one operation with its operands. Operands are
 // taken by their place, so a value may begin with a dash. Returns null, or what is wrong.
-const char* parse(char** word, Arguments& arguments, const Operation*& operation) {
+const char* parse(char** word, CommandLine& arguments, const ClientOperation*& operation) {
   while (*word != nullptr) {
     if (strcmp(*word, "-S") == 0) {
       if (*++word == nullptr) return "-S wants a socket";
@@ -171,8 +172,8 @@ int main(int argc, char** argv) {
     puts("ktreec " REMVOL_VERSION);
     return EXIT_SUCCESS;
   }
-  Arguments arguments = {};
-  const Operation* operation = nullptr;
+  CommandLine arguments = {};
+  const ClientOperation* operation = nullptr;
   const char* wrong = argc == 0 ? "no operation" : parse(argv + 1, arguments, operation);
   return wrong == nullptr ? operation->run(arguments) : usage_error(wrong);
 }
