@@ -1,5 +1,6 @@
 #include "notify/history.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "common/utf8.h"
@@ -44,6 +45,10 @@ bool is_formatting(const Row& row) {
   return row.volume != nullptr && row.volume->format_state == vvstat::kFormatRunning;
 }
 
+bool is_new(const Row& row, const Past& past) {
+  return past.made != 0 && row.made > past.made;
+}
+
 // Work that is under way is no error.
 void remember_error(const Row& row, time_t now, Past& past) {
   if (row.healthy() || past.now == Ailment::kBusy) return;
@@ -59,8 +64,9 @@ void compare_health(const Row& row, time_t now, Past& past, std::vector<Event>& 
   if (ailment != past.now || !row.wanted) past.since = now;
   past.now = ailment;
   remember_error(row, now, past);
-  const bool formatted = past.formatting && row.wanted && row.healthy();
+  const bool formatted = (past.formatting || is_new(row, past)) && row.wanted && row.healthy();
   past.formatting = is_formatting(row) || (past.formatting && ailment == Ailment::kBusy);
+  if (past.made == 0 || row.healthy()) past.made = std::max(past.made, row.made);
   if (formatted) events.push_back(event_of(EventKind::kFormatDone, row, "its format is done"));
   if (!row.wanted) {
     past.told = 0;
@@ -85,9 +91,12 @@ void compare_space(const Row& row, Past& past, std::vector<Event>& events) {
   }
 }
 
-Past first_look(time_t now) {
+// A volume that has come since the last look may have been formatted since then; its file system is of that
+// second or later. Of the others what is there now is nothing new, nor is what came before this second.
+Past first_look(const Row& row, time_t now, time_t last_look) {
   Past past;
   past.since = now;
+  past.made = last_look != 0 ? last_look - 1 : row.mounted ? row.made : now - 1;
   return past;
 }
 
@@ -99,13 +108,13 @@ std::string name_of(EventKind kind) {
   return kNames[static_cast<size_t>(kind)];
 }
 
-std::vector<Event> compare(const std::vector<Row>& rows, time_t now, History& history) {
+std::vector<Event> compare(const std::vector<Row>& rows, time_t now, time_t last_look, History& history) {
   std::vector<Event> events;
   History after;
   for (const Row& row : rows) {
     const std::string key = vvstat::key_of(row);
     const auto found = history.find(key);
-    Past past = found != history.end() ? found->second : first_look(now);
+    Past past = found != history.end() ? found->second : first_look(row, now, last_look);
     compare_health(row, now, past, events);
     compare_space(row, past, events);
     after.emplace(key, past);

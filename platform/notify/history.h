@@ -34,8 +34,12 @@ std::string name_of(EventKind kind);
 
 // Compares the rows with the history, brings it up to date, and returns what is to be told. What is
 // wrong is told at once, and not again before the volume has been well for a minute, which is told then: a
-// connection that comes and goes is one loss and one return. Volumes that are no more are forgotten.
-std::vector<Event> compare(const std::vector<vvstat::Row>& rows, time_t now, History& history);
+// connection that comes and goes is one loss and one return. A format is known by its state, or by a file
+// system that is younger than what was there before: it may have begun and ended between two looks.
+// `last_look` is when the history was made; 0: it is none, and what is found is no news. Volumes that are no
+// more are forgotten.
+std::vector<Event> compare(const std::vector<vvstat::Row>& rows, time_t now, time_t last_look,
+                           History& history);
 
 }  // namespace notify
 

@@ -38,17 +38,30 @@ Config read_config() {
   return config;
 }
 
+// When the history was made; 0 when it is none, because the file is new or damaged.
+time_t time_of(int file, bool fresh, const std::string& text, const History& history) {
+  struct stat info {};
+  if (fresh || (history.empty() && !text.empty()) || fstat(file, &info) != 0) return 0;
+  return info.st_mtime;
+}
+
 // Another look at the same time waits: each change is found by one of them. The file goes with the machine's
 // run time, so a torn one costs a message told twice.
 bool look(const vvstat::Status& status, std::vector<Event>& events) {
   mkdir(kRunFolder, 0700);
+  const bool fresh = access(vvstat::kHistoryFile, F_OK) != 0;
   const int file = open(vvstat::kHistoryFile, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
   if (file < 0 || flock(file, LOCK_EX) != 0) return complain(vvstat::kHistoryFile);
-  History history = vvstat::history_of(platform::content_of(file));
-  events = compare(vvstat::assess(status, vvstat::read_facts(status)), time(nullptr), history);
+  const std::string before = platform::content_of(file);
+  History history = vvstat::history_of(before);
+  const time_t last_look = time_of(file, fresh, before, history), now = time(nullptr);
+  events = compare(vvstat::assess(status, vvstat::read_facts(status)), now, last_look, history);
   const std::string text = vvstat::text_of(history);
+  // The time is set as well: an empty history is one, and writing nothing leaves the time as it was.
+  const timespec times[] = {{now, 0}, {now, 0}};
   const bool written = ftruncate(file, 0) == 0 &&
-                       pwrite(file, text.data(), text.size(), 0) == static_cast<ssize_t>(text.size());
+                       pwrite(file, text.data(), text.size(), 0) == static_cast<ssize_t>(text.size()) &&
+                       futimens(file, times) == 0;
   if (!written) complain(vvstat::kHistoryFile);
   close(file);
   return written;

@@ -105,6 +105,8 @@ constexpr Column kColumns[] = {
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->mount_point : std::string();
      }},
+    {"OPTIONS", "the options that it is mounted with", 0.2, kText, false,
+     [](const Row& row, const Layout&) { return row.options; }},
     {"DEVICE", "name of its disk", 0, kText, false,
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->device : std::string();
@@ -128,6 +130,8 @@ constexpr Column kColumns[] = {
      }},
     {"TREE-TARGET", "the target's status as the configuration tree has it", 0.2, kText, false,
      [](const Row& row, const Layout&) { return row.target->status; }},
+    {"OTHERWISE", "how the configuration tree has it, where that is not how it is", 0.2, kText, false,
+     [](const Row& row, const Layout&) { return row.otherwise; }},
 };
 
 // Whether the C library knows more than ASCII: see use_utf8().

@@ -97,6 +97,11 @@ Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts
     return {Ailment::kFailed, "No Disk", "its disk is gone, though its target is connected",
             "have it mounted anew", mount_anew(target)};
   }
+  if (facts.shut_down) {
+    return {Ailment::kFailed, "Shut Down", "its file system has shut itself down after an error",
+            "have it mounted anew; if it shuts itself down again, check its file system with xfs_repair",
+            mount_anew(target)};
+  }
   // A write-protected LUN is read-only from the beginning, and the tree says so.
   if (facts.read_only && !(facts.disk_read_only && volume.read_only)) {
     return {Ailment::kReadOnly, "Read Only",
@@ -107,11 +112,18 @@ Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts
   return kNone;
 }
 
+// The tree's texts are as old as the last command that wrote them.
+std::string otherwise(const Row& row, const std::string& text) {
+  if (!row.wanted || text.empty() || text == row.status) return {};
+  return "the configuration tree says \"" + text + "\"";
+}
+
 Row row_of(const Target& target, const TargetFacts& facts) {
   Row row{&target,           nullptr, target.status, facts.session, facts.address, false, false, 0, 0,
           is_wanted(target), {}};
   if (row.wanted) row.problem = problem_of(target, facts);
   if (!row.healthy()) row.status = row.problem.status;
+  row.otherwise = otherwise(row, target.status);
   return row;
 }
 
@@ -131,6 +143,8 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
   row.read_only = facts.mounted ? facts.read_only : volume.read_only;
   row.used = facts.used;
   row.size = facts.size;
+  row.made = facts.made;
+  row.options = facts.options;
   if (!row.wanted && volume.volume_state == kGivenUp) {
     row.wanted = true;
     row.problem = given_up(target);
@@ -140,6 +154,7 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
   const bool lost = !row.healthy();
   if (row.wanted && !lost) row.problem = problem_of(target, volume, facts);
   row.status = lost ? row.problem.status : status_of(volume, row);
+  row.otherwise = otherwise(row, volume.status);
   return row;
 }
 

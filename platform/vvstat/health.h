@@ -40,8 +40,12 @@ struct Row {
   bool read_only;           // mounted, and not to be written
   unsigned long long used;  // bytes; 0 while it is not mounted
   unsigned long long size;
-  bool wanted;      // it should be connected, as far as can be told, and is not switched off
-  Problem problem;  // of one that is wanted
+  bool wanted;            // it should be connected, as far as can be told, and is not switched off
+  Problem problem;        // of one that is wanted
+  time_t made = 0;        // its file system was, as far as is known; 0 while it is not mounted
+  std::string options{};  // of its mount
+  // How the configuration tree has it, where that is not how it is; empty: it is as the tree says.
+  std::string otherwise{};
   // What recall() adds.
   time_t since = 0;       // it is healthy, or not; 0: not known
   std::string error{};    // what was wrong with it last; empty: nothing, as far as is known

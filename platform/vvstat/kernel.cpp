@@ -11,6 +11,7 @@
 #include <cstdio>
 
 #include "common/sessions.h"
+#include "vvstat/mounts.h"
 
 namespace vvstat {
 namespace {
@@ -18,12 +19,21 @@ namespace {
 using platform::Link;
 using platform::Session;
 
-// statx(2) tells the root of a mount since Linux 5.8, from the inode at hand. `device` is what is mounted.
-bool is_mount_point(const std::string& path, dev_t& device) {
+// statx(2) tells the root of a mount since Linux 5.8, from the inode at hand, and with it when that was made:
+// the file system's own beginning. An XFS that has shut itself down fails even that; it is mounted all the
+// same.
+bool find_mount(const std::string& path, const std::vector<Mount>& mounts, VolumeFacts& facts,
+                dev_t& device) {
   struct statx info {};
   constexpr int kFlags = AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC | AT_SYMLINK_NOFOLLOW;
-  if (statx(AT_FDCWD, path.c_str(), kFlags, 0, &info) != 0) return false;
+  const bool answers = statx(AT_FDCWD, path.c_str(), kFlags, STATX_BTIME, &info) == 0;
+  facts.shut_down = !answers && errno == EIO;
+  const Mount* mount = mount_on(mounts, path);
+  if (mount != nullptr) facts.options = mount->options;
+  if (facts.shut_down && mount != nullptr) device = mount->device;
+  if (!answers) return facts.shut_down && mount != nullptr;
   device = makedev(info.stx_dev_major, info.stx_dev_minor);
+  if ((info.stx_mask & STATX_BTIME) != 0) facts.made = static_cast<time_t>(info.stx_btime.tv_sec);
   return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
 }
 
@@ -67,19 +77,19 @@ bool refuses_writes(const std::string& mount_point, const std::string& disk) {
   return refused;
 }
 
-VolumeFacts facts_of(const Volume& volume, bool answering) {
-  VolumeFacts facts;
-  facts.disk_read_only = is_read_only_disk(volume.device);
+VolumeFacts facts_of(const Volume& volume, bool answering, const std::vector<Mount>& mounts) {
+  VolumeFacts facts, unmounted;
+  facts.disk_read_only = unmounted.disk_read_only = is_read_only_disk(volume.device);
   dev_t device{};
   struct statvfs space {};
-  if (volume.mount_point.empty() || !is_mount_point(volume.mount_point, device) ||
+  if (volume.mount_point.empty() || !find_mount(volume.mount_point, mounts, facts, device) ||
       statvfs(volume.mount_point.c_str(), &space) != 0) {
-    return facts;
+    return unmounted;
   }
   const std::string disk = disk_name_of(device);
   facts.mounted = true;
   facts.disk_lost = major(device) != 0 && disk.empty() && access("/sys/dev/block", F_OK) == 0;
-  facts.read_only = (space.f_flag & ST_RDONLY) != 0 ||
+  facts.read_only = (space.f_flag & ST_RDONLY) != 0 || facts.shut_down ||
                     (answering && !disk.empty() && refuses_writes(volume.mount_point, disk));
   facts.size = static_cast<unsigned long long>(space.f_blocks) * space.f_frsize;
   facts.used = static_cast<unsigned long long>(space.f_blocks - space.f_bfree) * space.f_frsize;
@@ -98,6 +108,7 @@ const Session* session_of(const Target& target, const std::vector<Session>& sess
 
 std::vector<TargetFacts> read_facts(const Status& status) {
   const std::vector<Session> sessions = platform::read_sessions();
+  const std::vector<Mount> mounts = read_mounts();
   std::vector<TargetFacts> all;
   for (const Target& target : status.targets) {
     TargetFacts facts;
@@ -107,7 +118,7 @@ std::vector<TargetFacts> read_facts(const Status& status) {
       facts.address = platform::address_of(*session);
     }
     const bool answering = session != nullptr && session->link == Link::kUp;
-    for (const Volume& volume : target.volumes) facts.volumes.push_back(facts_of(volume, answering));
+    for (const Volume& volume : target.volumes) facts.volumes.push_back(facts_of(volume, answering, mounts));
     all.push_back(facts);
   }
   return all;

@@ -3,6 +3,7 @@
 #ifndef PLATFORM_VVSTAT_KERNEL_H
 #define PLATFORM_VVSTAT_KERNEL_H
 
+#include <ctime>
 #include <string>
 #include <vector>
 
@@ -17,6 +18,9 @@ struct VolumeFacts {
   bool disk_read_only = false;  // the disk itself is: the LUN is write-protected
   unsigned long long used = 0;  // bytes, while it is mounted
   unsigned long long size = 0;
+  bool shut_down = false;  // its file system refuses everything
+  time_t made = 0;         // its file system was; 0: it is not mounted, or does not tell
+  std::string options{};   // of the mount
 };
 
 struct TargetFacts {
@@ -25,11 +29,11 @@ struct TargetFacts {
   std::vector<VolumeFacts> volumes;  // in the order of the tree
 };
 
-// Reads /sys/class/iscsi_session, statx(2), statvfs(3), the disks' /sys/class/block/NAME/ro and the errors
-// that an ext4 has counted; none of it waits for a disk. One with errors, whose target answers, is asked for
-// a file without a name, which leaves nothing behind: only that tells whether it refuses writes. The facts
-// are in the order of status.targets; what cannot be read counts as not there. Of several sessions of one
-// target the one that is logged in counts.
+// Reads /sys/class/iscsi_session, statx(2), statvfs(3), /proc/self/mountinfo, the disks'
+// /sys/class/block/NAME/ro and the errors that an ext4 has counted; none of it waits for a disk. One with
+// errors, whose target answers, is asked for a file without a name, which leaves nothing behind: only that
+// tells whether it refuses writes. The facts are in the order of status.targets; what cannot be read counts
+// as not there. Of several sessions of one target the one that is logged in counts.
 std::vector<TargetFacts> read_facts(const Status& status);
 
 }  // namespace vvstat

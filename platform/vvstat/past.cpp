@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 
 #include "common/file_text.h"
@@ -11,7 +12,7 @@
 namespace vvstat {
 namespace {
 
-// Between a volume's name and its last error; no printable text holds it.
+// Between a volume's name, the time of its file system and its last error; no printable text holds it.
 constexpr char kMark = '\t';
 
 constexpr unsigned kAilments = static_cast<unsigned>(Ailment::kFailed) + 1;
@@ -23,6 +24,20 @@ void take_error(const std::string& text, Past& past) {
   if (sscanf(text.c_str(), "%lld %n", &time, &at) != 1 || at == 0) return;
   past.error_time = static_cast<time_t>(time);
   past.error = text.substr(static_cast<size_t>(at));
+}
+
+// Reads what stands behind a volume's name: "TIME", and after a mark the last error. Earlier versions wrote
+// the last error alone.
+void take_end(const std::string& text, Past& past) {
+  const size_t mark = text.find(kMark);
+  int at = 0;
+  long long time = 0;
+  if (mark == std::string::npos && text.find(' ') != std::string::npos) return take_error(text, past);
+  if (sscanf(text.c_str(), "%lld%n", &time, &at) == 1 &&
+      static_cast<size_t>(at) == std::min(mark, text.size())) {
+    past.made = static_cast<time_t>(time);
+  }
+  if (mark != std::string::npos) take_error(text.substr(mark + 1), past);
 }
 
 }  // namespace
@@ -42,6 +57,7 @@ std::string text_of(const History& history) {
              static_cast<long long>(past.since), past.told, past.formatting ? 1U : 0U,
              past.nearly_full ? 1U : 0U);
     text.append(numbers).append(key);
+    text.append(1, kMark).append(std::to_string(static_cast<long long>(past.made)));
     if (!past.error.empty()) {
       text.append(1, kMark).append(std::to_string(static_cast<long long>(past.error_time)));
       text.append(" ").append(past.error);
@@ -72,8 +88,9 @@ History history_of(std::string_view text) {
             formatting != 0,
             nearly_full != 0,
             "",
+            0,
             0};
-    if (mark != std::string::npos) take_error(line.substr(mark + 1), past);
+    if (mark != std::string::npos) take_end(line.substr(mark + 1), past);
   }
   return history;
 }

@@ -21,6 +21,7 @@ struct Past {
   bool nearly_full = false;  // and that was told
   std::string error;         // what was wrong last, printable text; empty: nothing was
   time_t error_time = 0;     // that began
+  time_t made = 0;           // a file system that was made later is a format that is not told; 0: not known
   bool operator==(const Past&) const = default;
 };
 

@@ -6,10 +6,11 @@ import re
 import signal
 import socket
 import struct
+import time
 
 import pytest
 
-from test_vvstat import T1, T1_NAME, change, example, run, session  # noqa: F401
+from test_vvstat import EXAMPLE, T1, T1_NAME, change, example, run, session  # noqa: F401
 
 PACKAGING = pathlib.Path(__file__).resolve().parents[2] / "packaging"
 CONFIG = "/etc/remvol/remvol.conf"
@@ -114,6 +115,37 @@ def test_a_format_that_is_done(example, journal):  # noqa: F811
     change(example, {"lun/id:1/format_state": "0"})
     notify(example)
     assert [(e["EVENT"], e["PRIORITY"]) for e in journal.entries()] == [("format-done", "5")]
+
+
+def test_a_format_between_two_looks(example, journal):  # noqa: F811
+    """Nothing in the tree tells of it any more, the file system does."""
+    notify(example)
+    now = int(time.time())
+    example.wait_until(lambda: int(time.time()) > now)  # the file system of before is older
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    example.disk("sdb", 64 << 20)
+    run(example, "/sbin/mke2fs", "-q", "-t", "ext4", "/dev/sdb")
+    run(example, "/bin/mount", "/dev/sdb", "/mnt/VV/Backup")
+    try:
+        assert notify(example).status == 0 and notify(example).status == 0
+        assert [(e["EVENT"], e["SHARE"]) for e in journal.entries()] == [("format-done", "Backup")]
+    finally:
+        run(example, "/bin/umount", "/mnt/VV/Backup")
+
+
+def test_a_first_volume_that_is_made_between_two_looks(example, journal):  # noqa: F811
+    example.tree.delete("/iscsi/initiator")
+    assert notify(example).status == 0
+    example.tree.set(EXAMPLE)
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    example.disk("sdb", 64 << 20)
+    run(example, "/sbin/mke2fs", "-q", "-t", "ext4", "/dev/sdb")
+    run(example, "/bin/mount", "/dev/sdb", "/mnt/VV/Backup")
+    try:
+        assert notify(example).status == 0
+        assert ("format-done", "Backup") in [(e["EVENT"], e["SHARE"]) for e in journal.entries()]
+    finally:
+        run(example, "/bin/umount", "/mnt/VV/Backup")
 
 
 def test_a_volume_that_is_nearly_full(example, journal):  # noqa: F811

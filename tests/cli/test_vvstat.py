@@ -211,7 +211,8 @@ def test_a_session_that_is_not_what_the_tree_says(example, state, status, proble
     else:
         session(example, 3, T1_NAME, state)
     check_problem(example, status, problem, command)
-    assert volumes(example)[0]["session"] == state
+    told = volumes(example)[0]
+    assert told["session"] == state and told["otherwise"] == 'the configuration tree says "Running"'
 
 
 def test_of_two_sessions_the_one_that_is_logged_in_counts(example):
@@ -224,6 +225,7 @@ def test_of_two_sessions_the_one_that_is_logged_in_counts(example):
                                                   ("0", "1", True), ("1", None, False)])
 def test_a_volume_that_became_read_only(example, right, disk, healthy):
     run(example, "/bin/mount", "-o", "remount,ro", "/mnt/VV/Backup")
+    assert volumes(example)[0]["options"].startswith("ro,")
     change(example, {"lun/id:1/vol_access_right": right})
     if disk is not None:
         example.write("/sys/class/block/sdb/ro", disk + "\n")
@@ -263,6 +265,22 @@ def test_a_file_system_that_refuses_writes_though_its_mount_does_not_say_so(exam
     assert volumes(example)[0]["ro"] is True
 
 
+def test_a_file_system_that_has_shut_itself_down(example):
+    """An XFS fails every question then, also whether something is mounted there."""
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    example.disk("sdb", 400 << 20)
+    run(example, "/sbin/mkfs.xfs", "-q", "/dev/sdb")
+    run(example, "/bin/mount", "/dev/sdb", "/mnt/VV/Backup")
+    try:
+        assert vvstat(example).status == 0
+        run(example, "/usr/sbin/xfs_io", "-x", "-c", "shutdown", "/mnt/VV/Backup")
+        check_problem(example, "Shut Down", "its file system has shut itself down after an error", MOUNT_ANEW)
+        told = volumes(example)[0]
+        assert told["mounted"] is True and told["ro"] is True and told["size"] > 300 << 20
+    finally:
+        run(example, "/bin/umount", "/mnt/VV/Backup")
+
+
 def test_what_is_said_of_a_lost_connection_asks_no_disk(example, on_a_disk):
     pathlib.Path(f"/sys/fs/ext4/{on_a_disk}/trigger_fs_error").write_text("an error\n")
     session(example, 3, T1_NAME, "FAILED")
@@ -288,6 +306,8 @@ def test_a_volume_that_the_tree_takes_for_lost_is_well_when_it_is(example):
     assert vvstat(example).status == 0
     told = volumes(example)[0]
     assert (told["status"], told["tree-status"]) == ("Running", "Offline")
+    assert told["otherwise"] == 'the configuration tree says "Offline"'
+    assert 'OTHERWISE    the configuration tree says "Offline"\n' in vvstat(example, "Backup").stdout
 
 
 @pytest.mark.parametrize("values", [{"conn_set": "0", "conn_state": "0"}, {"conn_set": "0", "conn_state": "3"},
@@ -406,12 +426,14 @@ def test_a_memory_that_is_none(example, make):
 
 def test_json(example):
     told = volumes(example)
+    options = told[0].pop("options").split(",")
+    assert options[0] == "rw" and options.count("relatime") == 1 and "size=20480k" in options
     assert told[0] == {
         "share": "Backup", "status": "Running", "used": 3 << 19, "size": 20 << 20, "use%": 8, "lun": 0,
         "portal": "10.9.0.2:3260", "target": T1_NAME, "healthy": True, "wanted": True, "problem": None, "advice": None,
         "command": None, "since": None, "last-error": None, "error-time": None, "mounted": True, "ro": False, "mountpoint": "/mnt/VV/Backup", "device": "sdb", "fstype": "ext4",
         "progress": None, "session": "LOGGED_IN", "address": "10.9.0.2", "tree-status": "Running",
-        "tree-target": "Connected"}
+        "tree-target": "Connected", "otherwise": None}
     assert told[1]["share"] == "Fotos 日本"
     assert told[2]["wanted"] is False and told[2]["healthy"] is True
     change(example, {"lun/id:2/format_state": "1", "lun/id:2/format_progress": "37"})

@@ -27,10 +27,11 @@ class Told : public testing::Test {
     row_.problem.ailment = ailment;
     row_.problem.what = ailment == Ailment::kNone ? "" : "is ill";
     std::vector<std::string> names;
-    for (const Event& event : compare({row_}, kStart + seconds, history_)) {
+    for (const Event& event : compare({row_}, kStart + seconds, last_look_, history_)) {
       names.push_back(name_of(event.kind));
       message_ = event.message;
     }
+    last_look_ = kStart + seconds;
     return names;
   }
 
@@ -46,6 +47,7 @@ class Told : public testing::Test {
   Volume volume_{};
   Row row_{};
   History history_;
+  time_t last_look_ = 0;
   std::string message_;
 };
 
@@ -116,6 +118,84 @@ TEST_F(Told, TheEndOfAFormat) {
   EXPECT_EQ(at(20, Ailment::kNone), Names{});
 }
 
+// Between two looks: no look has seen it under way.
+TEST_F(Told, TheEndOfAFormatThatNobodySaw) {
+  row_.made = kStart - 1000;
+  at(0, Ailment::kNone);
+  row_.made = kStart + 30;
+  EXPECT_EQ(at(60, Ailment::kNone), Names{"format-done"});
+  EXPECT_EQ(message_, "Volume Photos: its format is done");
+  EXPECT_EQ(at(120, Ailment::kNone), Names{});
+}
+
+TEST_F(Told, AFormatThatWasSeenIsToldOnce) {
+  at(0, Ailment::kNone);
+  volume_.format_state = vvstat::kFormatRunning;
+  at(10, Ailment::kBusy);
+  volume_.format_state = 0;
+  row_.made = kStart + 12;
+  EXPECT_EQ(at(20, Ailment::kNone), Names{"format-done"});
+  EXPECT_EQ(at(30, Ailment::kNone), Names{});
+}
+
+TEST_F(Told, AFormatInTheSecondOfALook) {
+  row_.mounted = false;
+  at(0, Ailment::kFailed);
+  row_.mounted = true;
+  row_.made = kStart;
+  EXPECT_EQ(at(1, Ailment::kNone), Names{"format-done"});
+}
+
+// It was unmounted, or could not be asked, for some looks.
+TEST_F(Told, AFormatBeforeAnEarlierLook) {
+  row_.made = kStart - 1000;
+  at(0, Ailment::kNone);
+  row_.mounted = false;
+  row_.made = 0;
+  at(60, Ailment::kFailed);
+  at(120, Ailment::kFailed);
+  row_.mounted = true;
+  row_.made = kStart + 90;
+  EXPECT_EQ(at(180, Ailment::kNone), Names{"format-done"});
+}
+
+TEST_F(Told, AVolumeThatCameWithItsFormat) {
+  compare({}, kStart, kStart - 60, history_);
+  last_look_ = kStart;
+  row_.made = kStart + 20;
+  EXPECT_EQ(at(60, Ailment::kNone), Names{"format-done"});
+}
+
+TEST_F(Told, NoFormatOfAFileSystemThatIsOlder) {
+  row_.made = kStart - 10;  // than the first look
+  EXPECT_EQ(at(0, Ailment::kNone), Names{});
+  compare({}, kStart + 60, kStart, history_);
+  last_look_ = kStart + 60;
+  row_.made = kStart + 50;  // than the volume
+  EXPECT_EQ(at(120, Ailment::kNone), Names{});
+  row_.made = kStart - 1000;  // a disk of before
+  EXPECT_EQ(at(180, Ailment::kNone), Names{});
+  row_.made = 0;  // it cannot be told
+  EXPECT_EQ(at(240, Ailment::kNone), Names{});
+}
+
+TEST_F(Told, NoFormatOfAVolumeWhosePastDoesNotTell) {
+  history_ = history_of("0 7 0 0 0 iqn.t1 1 Photos\n");
+  last_look_ = kStart - 60;
+  row_.made = kStart - 30;
+  EXPECT_EQ(at(0, Ailment::kNone), Names{});
+  row_.made = kStart + 30;
+  EXPECT_EQ(at(60, Ailment::kNone), Names{"format-done"});
+}
+
+TEST_F(Told, AFormatOfAVolumeThatIsIllIsToldWhenItIsWell) {
+  row_.made = kStart - 1000;
+  at(0, Ailment::kNone);
+  row_.made = kStart + 30;
+  EXPECT_EQ(at(60, Ailment::kReadOnly), Names{"read-only"});
+  EXPECT_EQ(at(120, Ailment::kNone), Names{"format-done"});
+}
+
 TEST_F(Told, AFormatThatFailedIsNotDone) {
   volume_.format_state = vvstat::kFormatRunning;
   at(0, Ailment::kBusy);
@@ -155,11 +235,12 @@ TEST_F(Told, ATargetWithoutVolumes) {
 
 TEST_F(Told, TheHistoryIsKeptAsText) {
   volume_.share = "two words\n\x1b";
+  row_.made = kStart;
   at(0, Ailment::kLost);
   row_.used = 99;
   at(5, Ailment::kReadOnly);
   const std::string text = text_of(history_);
-  EXPECT_EQ(text, "3 1000005 12 0 1 iqn.t1 1 two words\\x0A\\x1B\t1000005 is ill\n");
+  EXPECT_EQ(text, "3 1000005 12 0 1 iqn.t1 1 two words\\x0A\\x1B\t1000000\t1000005 is ill\n");
   EXPECT_EQ(history_of(text), history_);
 }
 
@@ -203,7 +284,7 @@ TEST_F(Told, TheLastErrorIsRemembered) {
 TEST_F(Told, AnotherErrorTakesItsPlace) {
   at(0, Ailment::kFailed);
   row_.problem.what = "is worse\t";
-  compare({row_}, kStart + 5, history_);
+  compare({row_}, kStart + 5, kStart, history_);
   EXPECT_EQ(recalled().error, "is worse\\x09");
   EXPECT_EQ(recalled().error_time, kStart + 5);
   EXPECT_EQ(recalled().since, kStart);
@@ -214,11 +295,16 @@ TEST_F(Told, NothingIsKnownOfAStranger) {
   EXPECT_EQ(recalled().error_time, 0);
 }
 
+TEST(History, ALineOfAnEarlierVersionHasAnErrorAlone) {
+  const Past past = history_of("3 7 8 0 1 iqn.t1 1 two words\t9 is ill\n")["iqn.t1 1 two words"];
+  EXPECT_EQ(past, (Past{Ailment::kReadOnly, 7, 8, false, true, "is ill", 9, 0}));
+}
+
 TEST(History, ALineOfAnEarlierVersionHasNoError) {
   const History history = history_of("3 7 8 0 1 iqn.t1 1 two words\n");
   ASSERT_EQ(history.size(), 1U);
   EXPECT_EQ(history.begin()->first, "iqn.t1 1 two words");
-  EXPECT_EQ(history.begin()->second, (Past{Ailment::kReadOnly, 7, 8, false, true, "", 0}));
+  EXPECT_EQ(history.begin()->second, (Past{Ailment::kReadOnly, 7, 8, false, true, "", 0, 0}));
 }
 
 TEST(History, AnErrorWithoutItsTimeIsLeftOut) {
