@@ -8,9 +8,11 @@ sys.path.insert(0, str(pathlib.Path(__file__).parent))
 
 from appliance import Site  # noqa: E402
 from harness import Box, build_folder  # noqa: E402
+from harness.traces import record_outside  # noqa: E402
 
 
 def pytest_configure(config):
+    record_outside()
     config.addinivalue_line("markers", "unsanitized: says nothing about a build with sanitizers, and is left out there")
     config.addinivalue_line("markers", "long: waits for half a minute, and starts first so that nothing waits for it")
 

@@ -28,6 +28,7 @@ class Terminal:
         number = next(box.numbers)
         err = os.memfd_create("err", os.MFD_CLOEXEC)
         self.running = box.running[number] = Running(box, number, argv, os.memfd_create("unused", os.MFD_CLOEXEC), err)
+        box.recorder.started(self.running)
         stdin = os.dup(slave) if keys or whole else os.open("/dev/null", os.O_RDONLY)
         variables = [f"{name}={value}" for name, value in box.env(env).items()]
         box.send(["run", number, "/", len(argv), *argv, *variables], [stdin, slave, slave if whole else err])
@@ -51,7 +52,7 @@ class Terminal:
 
     def end(self):
         status = self.running.wait().status
-        self.read()
+        self.box.recorder.shown(self.running, self.read())
         os.close(self.master)
         return status
 

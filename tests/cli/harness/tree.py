@@ -14,7 +14,7 @@ class Tree:
 
     def start(self, arguments=None):
         words = arguments or ["-n", "config", "-s", self.socket]
-        self.daemon = self.box.start(["ktree", *words], env={"LD_PRELOAD": None})
+        self.daemon = self.box.start(["ktree", *words], env={"LD_PRELOAD": None}, own=True)
         self.box.wait_until(self._answers, what="the tree's daemon")
         return self
 
@@ -32,7 +32,7 @@ class Tree:
         self.start()
 
     def _client(self, *args, input=None):
-        return self.box.run(["ktreec", "-S", self.socket, *args], env={"LD_PRELOAD": None}, input=input)
+        return self.box.run(["ktreec", "-S", self.socket, *args], env={"LD_PRELOAD": None}, input=input, own=True)
 
     def get(self, path):
         """The value at `path`, None when there is none."""
@@ -43,12 +43,16 @@ class Tree:
         values = path if isinstance(path, dict) else {path: value}
         script = 'while [ $# -gt 0 ]; do ktreec -S "$0" -s "$1" "$2" || exit 1; shift 2; done'
         words = [str(word) for pair in values.items() for word in pair]
-        done = self.box.run(["sh", "-c", script, self.socket, *words], env={"LD_PRELOAD": None})
+        done = self.box.run(["sh", "-c", script, self.socket, *words], env={"LD_PRELOAD": None}, own=True)
         assert done.status == 0, f"the tree refused {values}: {done.stderr}"
 
     def delete(self, path):
         done = self._client("-d", path)
         assert done.status == 0, f"the tree refused to delete {path}: {done.stderr}"
+
+    def text(self):
+        """All that it holds as the client prints it, "" when the daemon does not answer."""
+        return self._client("-t").stdout
 
     def dump(self, path=""):
         """Every value below `path`, as a dict from whole path to value, in the tree's order."""

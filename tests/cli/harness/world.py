@@ -13,6 +13,7 @@ import time
 
 from .disks import attach, detach, lead_to_controller, lead_to_session
 from .result import Arguments, Call, Result, escape, matcher, unescape
+from .traces import recorder
 from .tree import Tree
 from .under import SLOWER, keep, under, without
 
@@ -79,6 +80,7 @@ class Box:
         self._open()
         self.root = pathlib.Path(f"/proc/{self.pid}/root")
         self._prepare_fakes()
+        self.recorder = recorder(self)
         self.tree = Tree(self)
 
     def _open(self):
@@ -189,7 +191,8 @@ class Box:
             running.ended(int(words[2]))
         return True
 
-    def start(self, argv, *, input=None, env=None, cwd="/"):
+    def start(self, argv, *, input=None, env=None, cwd="/", own=False):
+        """`own`: a run of the box itself, which belongs to no trace."""
         number = next(self.numbers)
         stdin = os.memfd_create("in") if input is not None else os.open("/dev/null", os.O_RDONLY)
         if input is not None:
@@ -198,6 +201,8 @@ class Box:
         out, err = (os.memfd_create(name, os.MFD_CLOEXEC) for name in ("out", "err"))
         running = self.running[number] = Running(self, number, argv, out, err)
         variables = [f"{name}={value}" for name, value in self.env(env).items()]
+        if not own:
+            self.recorder.started(running)
         words = under(argv, self.build, "/fake/found")
         self.send(["run", number, cwd, len(words), *words, *variables], [stdin, out, err])
         os.close(stdin)
@@ -206,8 +211,8 @@ class Box:
                 raise TimeoutError(f"{argv} did not start")
         return running
 
-    def run(self, argv, *, input=None, env=None, cwd="/", timeout=TIMEOUT):
-        return self.start(argv, input=input, env=env, cwd=cwd).wait(timeout)
+    def run(self, argv, *, timeout=TIMEOUT, **options):
+        return self.start(argv, **options).wait(timeout)
 
     def debug(self, level):
         self.tree.set("/iscsi/initiator/dbg", level)
@@ -304,6 +309,7 @@ class Box:
         return [Arguments(call) for call in self.calls if call.kind == "run" and call.fields[0] == name]
 
     def forget(self):
+        self.recorder.forgotten()
         os.truncate(self.root / "fake" / "log", 0)
 
     # --- the end ---
@@ -319,6 +325,7 @@ class Box:
         return found + [p.read_text() for p in (self.root / "fake").glob("sanitizer.*")]
 
     def close(self):
+        self.recorder.close()
         keep((self.root / "fake").glob("found.*"), os.environ.get("PYTEST_CURRENT_TEST", "").rpartition(" ")[0])
         for loop in self.disks:
             detach(loop)
