@@ -63,6 +63,14 @@ int debug_level = 0;
 
 const LogScope* LogScope::innermost_ = nullptr;
 
+LogScope::LogScope(const char* function) : function_(function), outer_(innermost_) {
+  innermost_ = this;
+}
+
+LogScope::~LogScope() {
+  innermost_ = outer_;
+}
+
 void begin_line(Weight weight, FILE* stream) {
   if (is_journal(fileno(stream))) fprintf(stream, "<%d>", weight.priority);
 }

@@ -43,10 +43,8 @@ extern int debug_level;
 class LogScope {
  public:
   // As a default argument __builtin_FUNCTION() names the function that has the object.
-  explicit LogScope(const char* function = __builtin_FUNCTION()) : function_(function), outer_(innermost_) {
-    innermost_ = this;
-  }
-  ~LogScope() { innermost_ = outer_; }
+  explicit LogScope(const char* function = __builtin_FUNCTION());
+  ~LogScope();
   LogScope(const LogScope&) = delete;
   LogScope& operator=(const LogScope&) = delete;
 
