@@ -42,7 +42,7 @@ int fail(bool show_usage) {
   if (show_usage) print_usage();
   fflush(stdout);
   // Only the SMB service is reloaded, and on every failure: users of the shares see what is left of them.
-  (void)!system("winshare_reload");
+  reload_smb_shares();
   if (gs_str_command != nullptr) record_result("-1");
   begin_line(kCommandFailed);
   puts("execute failed.");

@@ -9,6 +9,7 @@
 #include "support/command.h"
 #include "support/lan.h"
 #include "support/net.h"
+#include "support/ping.h"
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"

@@ -3,25 +3,11 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "frontend/log.h"
-#include "support/shell_text.h"
-#include "support/text.h"
-
 namespace remvol {
 
 namespace {
 
 constexpr int kWords = 8;  // an IPv6 address is eight 16-bit words
-
-using AddressText = Text<256>;
-
-// The text between '[' and ']', or all of it without brackets.
-AddressText without_brackets(const char* address) {
-  const char* open = strchr(address, '[');
-  if (open == nullptr) return AddressText("%s", address);
-  const int length = static_cast<int>(strcspn(open + 1, "]"));
-  return AddressText("%.*s", length, open + 1);
-}
 
 int count_colons(const char* text) {
   int count = 0;
@@ -40,21 +26,11 @@ void store_group(unsigned char* address, int index, const char* group) {
 
 }  // namespace
 
-int ping_ip(const char* address, const char* interface) {
-  const LogScope scope;
-  if (address == nullptr || address[0] == '\0') return 0;
-  const bool from_interface = interface != nullptr && interface[0] != '\0';
-  if (is_ipv6_text(address)) {
-    const AddressText bare = without_brackets(address);
-    const CommandText command = from_interface
-                                    ? shell_command("ping -6 -W 1 -c 2 -I %s %s", interface, bare.c_str())
-                                    : shell_command("ping -6 -W 1 -c 2 %s", bare.c_str());
-    LOG(2, "run cmd = %s", command.c_str());
-    return system(command) == 0 ? 1 : 0;
-  }
-  const CommandText command = from_interface ? shell_command("ping -W 1 -c 2 -I %s %s", interface, address)
-                                             : shell_command("ping -W 1 -c 2 %s", address);
-  return system(command) == 0 ? 1 : 0;
+AddressText without_brackets(const char* address) {
+  const char* open = strchr(address, '[');
+  if (open == nullptr) return AddressText("%s", address);
+  const int length = static_cast<int>(strcspn(open + 1, "]"));
+  return AddressText("%.*s", length, open + 1);
 }
 
 int is_ipv6_text(const char* text) {

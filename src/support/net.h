@@ -1,14 +1,17 @@
-// Portal addresses: their form, and whether they answer.
+// Portal addresses: their form.
 #ifndef REMVOL_SUPPORT_NET_H
 #define REMVOL_SUPPORT_NET_H
 
 #include <cstddef>
 
+#include "support/text.h"
+
 namespace remvol {
 
-// Pings `address` (IPv6 may stand in square brackets) twice, from `interface` unless that is null or empty.
-// Returns 1 when it answers, else 0 (also for a null or empty address).
-int ping_ip(const char* address, const char* interface);
+using AddressText = Text<256>;
+
+// Returns the text between "[" and "]", or all of it without brackets.
+AddressText without_brackets(const char* address);
 
 // Returns non-zero when `text` is not empty and contains a colon.
 int is_ipv6_text(const char* text);

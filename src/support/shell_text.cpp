@@ -98,4 +98,10 @@ CommandText command_on_node(const char* verb, const char* node) {
   return is_plain_word(node) ? CommandText("%s %s", verb, node) : refuse(verb);
 }
 
+CommandText command_on_path(const char* verb, const char* path) {
+  char escaped[CommandText::size() / 2];
+  if (str_insert_back_slash(escaped, sizeof escaped, path) != 0) return CommandText("%s", kRefusedCommand);
+  return CommandText("%s \"%s\"", verb, escaped);
+}
+
 }  // namespace remvol

@@ -115,10 +115,13 @@ int _keep_volumes(TargetEntry* entry) {
   return kOk;
 }
 
-// Starts a run in the background that comes back for the target after a while.
+// The tool itself, in the background: it comes back for the target after a while.
+CommandText later_recovery_command(const char* target_name) {
+  return shell_command("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds, target_name);
+}
+
 void _postpone(const TargetEntry* entry) {
-  run_command(shell_command("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds,
-                            entry->target_name));
+  run_command(later_recovery_command(entry->target_name));
 }
 
 // Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one

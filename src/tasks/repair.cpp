@@ -11,6 +11,7 @@
 #include "tree/keys.h"
 #include "tree/slots.h"
 #include "tree/state.h"
+#include "volume/e2fsprogs.h"
 #include "volume/process_check.h"
 
 namespace remvol {
@@ -60,7 +61,7 @@ void repair_lun_state(const TargetEntry* lun, LunState* state) {
   if (!is_format_under_way(state->format) && state->volume != kVolumeCreating) return;
   const IdleTarget idle(lun->target_name, lun->lun);
   if (!idle) return;
-  if (lun->dev[0] != '\0' && has_process("mke2fs", Text<32>("/dev/%s", lun->dev))) return;
+  if (lun->dev[0] != '\0' && has_process(kMke2fs, Text<32>("/dev/%s", lun->dev))) return;
   if (is_format_under_way(state->format)) ktree_update_formatting_state(lun, kFormatIdle);
   if (state->volume == kVolumeCreating) ktree_update_volume_state(lun, kVolumeNormal);
   (void)read_lun_state(lun->db_idx, lun->lun_db_idx, state);

@@ -7,14 +7,17 @@
 #include <cstring>
 
 #include "frontend/log.h"
+#include "support/coreutils.h"
 #include "support/format_semaphore.h"
+#include "support/psmisc.h"
 #include "support/session_hold.h"
-#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
 #include "volume/disk_identity.h"
+#include "volume/e2fsprogs.h"
+#include "volume/file_systems.h"
 #include "volume/format_progress.h"
 #include "volume/process_check.h"
 
@@ -27,26 +30,7 @@ constexpr int kFirstWordMs = 5000;  // of mke2fs, at most
 constexpr int kRefused = -1;
 constexpr int kNotWritable = -2;
 constexpr int kNotStarted = -3;
-constexpr char kDefaultFs[] = "ext4";
 using FsName = char[16];
-
-// Blocks of 4096 bytes, none reserved. MKE2FS_SYNC has mke2fs sync after so many block groups; see mke2fs(8).
-struct FormatCommand {
-  const char* fs_type;
-  const char* text;  // the partition's node follows
-};
-constexpr FormatCommand kFormatCommands[] = {
-    {"ext2", "MKE2FS_SYNC=100 mke2fs -m0 -b4096"},
-    {"ext3", "MKE2FS_SYNC=100 mke2fs -j -m0 -b4096"},
-    {"ext4", "MKE2FS_SYNC=100 mke2fs -j -m0 -b4096 -T ext4"},
-};
-
-const char* find_format_command(const char* fs_type) {
-  for (const FormatCommand& command : kFormatCommands) {
-    if (strcmp(command.fs_type, fs_type) == 0) return command.text;
-  }
-  return nullptr;
-}
 
 bool check_arguments(const TargetEntry* entry, const char* partition) {
   if (entry->dev[0] == '\0') {
@@ -73,21 +57,21 @@ void note_update(int result) {
 void choose_fs(FsName& fs_type, const char* partition) {
   char found[64] = "";
   if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') {
-    LOG(2, "set strFS to default fs: %s", kDefaultFs);
-    copy_text(fs_type, kDefaultFs);
+    LOG(2, "set strFS to default fs: %s", kDefaultFileSystem);
+    copy_text(fs_type, kDefaultFileSystem);
     return;
   }
   copy_text(fs_type, found);
 }
 
 CommandText make_format_command(FsName& fs_type, const char* partition) {
-  const char* command = find_format_command(fs_type);
-  if (command == nullptr) {
-    LOG(1, "%s is not supported by this program, set file system type to %s", fs_type, kDefaultFs);
-    copy_text(fs_type, kDefaultFs);
-    command = find_format_command(fs_type);
+  const FileSystem* file_system = find_file_system(fs_type);
+  if (file_system == nullptr || file_system->make == nullptr) {
+    LOG(1, "%s is not supported by this program, set file system type to %s", fs_type, kDefaultFileSystem);
+    copy_text(fs_type, kDefaultFileSystem);
+    file_system = find_file_system(fs_type);
   }
-  return command_on_node(command, partition);
+  return file_system->make(partition);
 }
 
 // Returns the running mke2fs, or null when it could not be started three times.
@@ -145,7 +129,7 @@ int end_users(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
   wait_for_udev(partition);
   if (is_foreign_disk(entry, partition)) return kRefused;
-  System("%s", shell_command("fuser -mk \"%s\"", partition).c_str());
+  System("%s", end_users_command(partition).c_str());
   return 0;
 }
 
@@ -153,7 +137,7 @@ int end_users(const TargetEntry* entry, const char* partition) {
 int wipe_beginning(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
   if (!may_overwrite(entry, partition)) return kRefused;
-  if (System("%s", shell_command("dd if=/dev/zero of=%s bs=1M count=1", partition).c_str()) == 0) return 0;
+  if (System("%s", wipe_beginning_command(partition).c_str()) == 0) return 0;
   LOG(1, "dd %s failed, this device is not able to write.", partition);
   return kNotWritable;
 }
@@ -218,13 +202,13 @@ int Target_format(TargetEntry* entry, const char* partition, ContentMark seen_em
 
 int check_mkfs_process_existing() {
   const LogScope scope;
-  return is_command_running_on("mke2fs", "/dev/sd") ? 0 : 1;
+  return is_command_running_on(kMke2fs, "/dev/sd") ? 0 : 1;
 }
 
 int check_resizing_fs(const char* device) {
   const LogScope scope;
   LOG(2, "checking if device %s is resizing...", device);
-  return is_command_running_on("resize2fs", device) ? 0 : 1;
+  return is_command_running_on(kResize2fs, device) ? 0 : 1;
 }
 
 }  // namespace remvol

@@ -7,10 +7,9 @@
 #include <cstring>
 
 #include "frontend/log.h"
-#include "support/memory.h"
+#include "support/coreutils.h"
 #include "support/result.h"
 #include "support/session_hold.h"
-#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/entry.h"
@@ -20,6 +19,7 @@
 #include "volume/bare_folder.h"
 #include "volume/degrade.h"
 #include "volume/disk_identity.h"
+#include "volume/file_systems.h"
 #include "volume/format.h"
 #include "volume/mount_command.h"
 #include "volume/mount_point.h"
@@ -176,9 +176,10 @@ int create_file_system(Volume* volume) {
 
 int keep_file_system(Volume* volume) {
   LOG(1, "Got FS type = %s, skip creating volume", volume->fs_type);
-  if (strcmp(volume->fs_type, "ext4") == 0 && sys_check_fs_state(volume->node) != 0) {
+  const FileSystem* file_system = find_file_system(volume->fs_type);
+  if (file_system != nullptr && file_system->check != nullptr && sys_check_fs_state(volume->node) != 0) {
     volume->held.release();  // the look takes its time, and another run may kill who holds the node
-    System("%s", command_on_node("e2fsck -n -f", volume->node).c_str());  // changes nothing
+    System("%s", file_system->check(volume->node).c_str());
   }
   const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
   return note_update(result) != 0 ? kTreeFailed : kOk;
@@ -198,7 +199,7 @@ int prepare_file_system(Volume* volume) {
 }
 
 int make_mount_point(const Volume* volume) {
-  const CommandText command = command_on_path("mkdir -p", volume->mount_point);
+  const CommandText command = make_folder_command(volume->mount_point);
   LOG(1, "cmd = %s", command.c_str());
   make_bare_folder(volume->mount_point);
   if (system(command) == 0) return kOk;
@@ -207,8 +208,8 @@ int make_mount_point(const Volume* volume) {
 }
 
 int mount_file_system(const Volume* volume) {
-  if (is_mountable(volume->fs_type)) {
-    run_mount(volume->fs_type, volume->node, volume->mount_point);
+  if (const FileSystem* file_system = find_file_system(volume->fs_type)) {
+    run_mount(*file_system, volume->node, volume->mount_point);
     return kOk;
   }
   LOG(1, "Unsupported filesystem type %s", volume->fs_type);
@@ -224,7 +225,7 @@ int record_read_only(const Volume* volume) {
 
 // Opens the volume to everybody and records whether that could be written.
 int open_to_everybody(const Volume* volume) {
-  if (system(command_on_path("chmod 777", volume->mount_point)) == 0) {
+  if (system(open_folder_command(volume->mount_point)) == 0) {
     record_access_right(volume->entry, VOL_AC_RW);
     return kOk;
   }
@@ -234,9 +235,9 @@ int open_to_everybody(const Volume* volume) {
 
 int record_mount(const Volume* volume) {
   ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
-  if (strcmp(volume->fs_type, "ext4") == 0) {
-    // A file system that is older than its partition's growth fills it in the background.
-    System("%s", shell_command("resize2fs -fp %s &", volume->node.c_str()).c_str());
+  const FileSystem* file_system = find_file_system(volume->fs_type);
+  if (file_system != nullptr && file_system->grow != nullptr) {
+    System("%s", file_system->grow(volume->node).c_str());
   }
   note_update(ktree_update_volume_state(volume->entry, kVolumeNormal));
   return open_to_everybody(volume);
@@ -244,7 +245,7 @@ int record_mount(const Volume* volume) {
 
 void record_failed_mount(const Volume* volume) {
   note_update(ktree_update_volume_state(volume->entry, kVolumeFailed));
-  const CommandText command = command_on_path("rm -rf", volume->mount_point);
+  const CommandText command = remove_folder_command(volume->mount_point);
   if (is_removal_unsafe(volume->mount_point)) return;
   drop_bare_folder(volume->mount_point);
   if (system(command) == 0) return;
@@ -337,20 +338,17 @@ int remount_mnt_path(const char* path, int wait_seconds) {
     LOG(0, "mnt_path not vaild");
     return kFailed;
   }
-  const size_t size = 2 * (strlen(path) + 25);  // room for a path of which every character is escaped
-  const Memory<char> escaped = allocate<char>(size);
-  const Memory<char> command = allocate<char>(size);
-  if (!escaped || !command) {
+  RemountCommand remount(path);
+  if (!remount) {
     LOG(0, "malloc failed");
     return kFailed;
   }
   if (sys_mount_point(path) == 0) return kOk;
   LOG(2, "start remount path %s", path);
-  str_insert_back_slash(escaped.get(), size, path);
-  snprintf(command.get(), size, "mount -o remount \"%s\"", escaped.get());
+  const char* command = remount.text();
   int result = kOk;
-  if (system(command.get()) != 0) {
-    LOG(0, "cmd '%s' failed", command.get());
+  if (system(command) != 0) {
+    LOG(0, "cmd '%s' failed", command);
     result = kFailed;
   }
   if (wait_seconds > 0) {

@@ -6,10 +6,10 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "frontend/log.h"
 #include "support/files.h"
 #include "support/shell_text.h"
-#include "support/text.h"
-#include "volume/mount_point.h"
+#include "sysaux.h"
 
 namespace remvol {
 
@@ -19,34 +19,12 @@ constexpr int kMountRetries = 3;
 constexpr unsigned kMountRetryWait = 500000;  // microseconds
 
 constexpr char kDriverList[] = "/proc/filesystems";
-constexpr char kUfsd[] = "ufsd";
-constexpr char kUfsdMount[] = "mount -t ufsd -o rw,nls=utf8,fmask=0,dmask=0,force,user_xattr";
+constexpr char kRareDriver[] = "ufsd";  // of all that are named, the one that stock kernels lack
+// The text of mount(8) without its operands, which is what a refusal tells of.
+using MountText = Text<128>;
 
-// The partition's node and the quoted mount point follow the texts.
-struct MountCommand {
-  const char* fs_type;
-  const char* text;
-  const char* stock;  // the same with a driver that stock kernels have, for those without "ufsd"
-};
-constexpr MountCommand kMountCommands[] = {
-    {"ext2", "mount -t ext2", nullptr},
-    {"ext3", "mount -t ext3", nullptr},
-    {"ext4", "mount -t ext4", nullptr},
-    {"vfat", "mount -t vfat -o umask=0,iocharset=utf8,shortname=winnt", nullptr},
-    {"ntfs", kUfsdMount, "mount -t ntfs3 -o rw,iocharset=utf8,fmask=0,dmask=0"},
-    {"hfsplus", kUfsdMount, "mount -t hfsplus -o rw,nls=utf8,umask=0"},
-    {"xfs", "mount -t xfs -o rw,attr2", nullptr},
-};
-
-const MountCommand* find_command(const char* fs_type) {
-  for (const MountCommand& command : kMountCommands) {
-    if (strcmp(command.fs_type, fs_type) == 0) return &command;
-  }
-  return nullptr;
-}
-
-CommandText full_command(const char* text, const char* node, const char* mount_point) {
-  return command_on_path(command_on_node(text, node), mount_point);
+CommandText mount_command(const char* words, const char* node, const char* mount_point) {
+  return command_on_path(command_on_node(MountText("mount %s", words), node), mount_point);
 }
 
 // Returns whether the mount took hold within its tries.
@@ -77,17 +55,28 @@ bool lacks_driver(const char* name) {
 
 }  // namespace
 
-bool is_mountable(const char* fs_type) {
-  return find_command(fs_type) != nullptr;
-}
-
-void run_mount(const char* fs_type, const char* node, const char* mount_point) {
-  const MountCommand* mount = find_command(fs_type);
-  if (run_with_retries(full_command(mount->text, node, mount_point))) return;
-  if (mount->stock == nullptr || !lacks_driver(kUfsd)) return;
-  const CommandText command = full_command(mount->stock, node, mount_point);
+void run_mount(const FileSystem& file_system, const char* node, const char* mount_point) {
+  if (run_with_retries(mount_command(file_system.mount, node, mount_point))) return;
+  if (file_system.stock_mount == nullptr || !lacks_driver(kRareDriver)) return;
+  const CommandText command = mount_command(file_system.stock_mount, node, mount_point);
   LOG(1, "cmd = %s", command.c_str());
   if (system(command) != 0) LOG(0, "system() of cmd '%s' failed", command.c_str());
+}
+
+CommandText umount_command(const char* path) {
+  return command_on_path("umount -f", path);
+}
+
+RemountCommand::RemountCommand(const char* path)
+    : path_(path),
+      size_(2 * (strlen(path) + 25)),  // as if every character were escaped
+      escaped_(allocate<char>(size_)),
+      text_(allocate<char>(size_)) {}
+
+const char* RemountCommand::text() {
+  str_insert_back_slash(escaped_.get(), size_, path_);
+  snprintf(text_.get(), size_, "mount -o remount \"%s\"", escaped_.get());
+  return text_.get();
 }
 
 }  // namespace remvol

@@ -9,7 +9,6 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "support/shell_text.h"
 #include "sysaux.h"
 
 namespace remvol {
@@ -89,12 +88,6 @@ bool is_share_inside_root(const char* share) {
     return false;
   }
   return true;
-}
-
-CommandText command_on_path(const char* verb, const char* path) {
-  char escaped[CommandText::size() / 2];
-  if (str_insert_back_slash(escaped, sizeof escaped, path) != 0) return CommandText("%s", kRefusedCommand);
-  return CommandText("%s \"%s\"", verb, escaped);
 }
 
 bool is_mounted_from(const char* node, const char* path, MountLine* mount) {

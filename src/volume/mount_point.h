@@ -1,5 +1,4 @@
-// Mount points of volumes: their paths, commands on them, and what keeps their removal from reaching a
-// volume.
+// Mount points of volumes: their paths, and what keeps their removal from reaching a volume.
 #ifndef REMVOL_VOLUME_MOUNT_POINT_H
 #define REMVOL_VOLUME_MOUNT_POINT_H
 
@@ -32,10 +31,6 @@ MountPointText mount_point_of(const char* share);
 // component "..", or none besides empty ones and ".", or when a component of the path below the root is a
 // symbolic link; that is logged at level 0 in the caller's name.
 bool is_share_inside_root(const char* share);
-
-// Returns the shell command `verb "path"`, the path escaped. A path too long for that (more
-// than 1,023 characters that all need escaping) gives a command that does nothing and fails.
-CommandText command_on_path(const char* verb, const char* path);
 
 // Returns whether the kernel's table shows the block device `node`, by its number and whatever its name, as
 // mounted on `path`, and nothing else covers it there; `mount` is the table's line then.

@@ -18,9 +18,12 @@ struct DirCloser {
   void operator()(DIR* directory) const { closedir(directory); }
 };
 
+CommandText process_list_command(const char* name) {
+  return CommandText("ps -w | grep %s | grep -v 'grep'", name);
+}
+
 bool is_listed(const char* name, const char* device) {
-  const Text<256> command("ps -w | grep %s | grep -v 'grep'", name);
-  FILE* list = popen(command, "r");
+  FILE* list = popen(process_list_command(name), "r");
   if (list == nullptr) return false;
   char line[1024];
   bool found = false;

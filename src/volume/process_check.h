@@ -1,4 +1,5 @@
-// Whether a command works on a disk just now, started by whichever run.
+// Whether a command works on a disk just now, started by whichever run: by ps(1), of which the only text
+// stands here, and by what the kernel tells.
 #ifndef REMVOL_VOLUME_PROCESS_CHECK_H
 #define REMVOL_VOLUME_PROCESS_CHECK_H
 

@@ -4,9 +4,21 @@
 
 namespace remvol {
 
+namespace {
+
+// A further service is a further command.
+constexpr char kReloadAll[] = "winshare_reload ; macshare_reload";
+constexpr char kReloadSmb[] = "winshare_reload";
+
+}  // namespace
+
 int reload_share_services() {
-  (void)!system("winshare_reload ; macshare_reload");
+  (void)!system(kReloadAll);
   return 0;
+}
+
+void reload_smb_shares() {
+  (void)!system(kReloadSmb);
 }
 
 }  // namespace remvol

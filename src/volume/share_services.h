@@ -1,4 +1,4 @@
-// The file-sharing services of the appliance.
+// The file-sharing services of the appliance: every command to them stands here.
 #ifndef REMVOL_VOLUME_SHARE_SERVICES_H
 #define REMVOL_VOLUME_SHARE_SERVICES_H
 
@@ -6,6 +6,9 @@ namespace remvol {
 
 // Has the SMB and AFP services reload their shares. Returns 0, whatever they report.
 int reload_share_services();
+
+// Has the SMB service alone reload its shares.
+void reload_smb_shares();
 
 }  // namespace remvol
 

@@ -9,10 +9,11 @@
 
 #include "frontend/log.h"
 #include "support/command.h"
+#include "support/coreutils.h"
 #include "support/files.h"
+#include "support/psmisc.h"
 #include "support/result.h"
 #include "support/session_hold.h"
-#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/entry.h"
@@ -22,6 +23,7 @@
 #include "volume/disk_identity.h"
 #include "volume/disk_use.h"
 #include "volume/mount.h"
+#include "volume/mount_command.h"
 #include "volume/mount_point.h"
 #include "volume/share_services.h"
 
@@ -46,19 +48,19 @@ void kill_node_users(const TargetEntry* entry) {
   LoginsHeldOff logins;
   if (!has_disk(entry->mnt_dev)) logins.begin();
   if (is_foreign_disk(entry, entry->mnt_dev)) return;
-  System("%s", command_on_node("fuser -mk", entry->mnt_dev).c_str());
+  System("%s", end_node_users_command(entry->mnt_dev).c_str());
 }
 
 void kill_users(const char* mount_point) {
   LOG(2, "start fuser");
-  const CommandText command = command_on_path("fuser -mk", mount_point);
+  const CommandText command = end_users_command(mount_point);
   const int status = process_system_cmd_mt(command, kKillTries, kKillMaxWait);
   if (status != 0) LOG(1, "cmd '%s' return code = %d", command.c_str(), status);
 }
 
 bool force_umount(const char* mount_point) {
   LOG(2, "start umount");
-  const CommandText command = command_on_path("umount -f", mount_point);
+  const CommandText command = umount_command(mount_point);
   if (system(command) == 0) return true;
   LOG(0, "cmd '%s' failed", command.c_str());
   return false;
@@ -83,7 +85,7 @@ void umount_with_rounds(const char* mount_point) {
 int remove_mount_point(const char* mount_point) {
   if (is_removal_unsafe(mount_point)) return kFailed;
   drop_bare_folder(mount_point);
-  const CommandText command = command_on_path("rm -rf", mount_point);
+  const CommandText command = remove_folder_command(mount_point);
   if (system(command) == 0) return kOk;
   LOG(0, "cmd '%s' failed", command.c_str());
   return kFailed;
@@ -192,10 +194,10 @@ int get_ftp_share_path(const TargetEntry* entry, char* path) {
 int Target_umount_ftp(const TargetEntry*, const char* path) {
   const LogScope scope;
   LOG(1, "start umount ftp");
-  const CommandText kill = command_on_path("fuser -mk", path);
+  const CommandText kill = end_users_command(path);
   const int status = system(kill);
   if (status != 0) LOG(1, "system() of cmd '%s' return code = %d", kill.c_str(), status);
-  const CommandText umount = command_on_path("umount -f", path);
+  const CommandText umount = umount_command(path);
   if (system(umount) != 0) {
     LOG(0, "system() of cmd '%s' failed", umount.c_str());
     return kFailed;

@@ -14,6 +14,9 @@
 #include "fakes.h"
 #include "frontend/log.h"
 #include "iscsi/iscsiadm.h"
+#include "support/coreutils.h"
+#include "support/psmisc.h"
+#include "volume/e2fsprogs.h"
 
 using namespace remvol;
 
@@ -150,9 +153,10 @@ const Place kPlaces[] = {
     {"logout", of_entry(logout_command, &TargetEntry::target_name), any},
     {"new iface", [](const char* v) { return std::string(new_iface_command(v)); }, plain},
     {"bind iface", [](const char* v) { return std::string(bind_iface_command("iface0", v)); }, any},
-    {"node", [](const char* v) { return std::string(command_on_node("fuser -mk", v)); }, plain},
-    {"within a word", [](const char* v) { return std::string(shell_command("dd of=%s bs=%d", v, 5)); },
-     plain},
+    {"users of a node", [](const char* v) { return std::string(end_node_users_command(v)); }, plain},
+    {"users of a path", [](const char* v) { return std::string(end_users_command(v)); }, any},
+    {"within a word", [](const char* v) { return std::string(wipe_beginning_command(v)); }, plain},
+    {"format", [](const char* v) { return std::string(make_ext4_command(v)); }, plain},
     {"single quotes", [](const char* v) { return std::string(shell_command("echo 'Name=%s'", v)); },
      [](const std::string& value) {
        for (const char c : value) {
@@ -201,6 +205,19 @@ TEST_F(ShellText, ACommandThatWouldBeCutIsRefused) {
   EXPECT_EQ(std::string(shell_command("x \"%s\"", fits.c_str())), "x \"" + fits + "\"");
   EXPECT_STREQ(shell_command("x \"%s\"", (fits + "a").c_str()), kRefusedCommand);
   EXPECT_STREQ(shell_command("x \"%s\"", std::string(fits.size() / 2 + 1, '$').c_str()), kRefusedCommand);
+}
+
+TEST_F(ShellText, ACommandQuotesAPath) {
+  EXPECT_STREQ(command_on_path("rm -rf", "/mnt/VV/a b"), "rm -rf \"/mnt/VV/a b\"");
+  EXPECT_STREQ(command_on_path("rm -rf", "/mnt/VV/\"$`\\"), "rm -rf \"/mnt/VV/\\\"\\$\\`\\\\\"");
+}
+
+TEST_F(ShellText, ACommandOnAPathIsNeverCut) {
+  const std::string longest(1023, '$');
+  std::string escaped;
+  for (size_t i = 0; i < longest.size(); i++) escaped += "\\$";
+  EXPECT_EQ(std::string(command_on_path("umount -f", longest.c_str())), "umount -f \"" + escaped + "\"");
+  EXPECT_STREQ(command_on_path("umount -f", std::string(3000, 'a').c_str()), "false");
 }
 
 TEST_F(ShellText, ARefusalIsToldWithoutTheValue) {

@@ -16,6 +16,7 @@
 #include "support/files.h"
 #include "support/lun_list.h"
 #include "support/net.h"
+#include "support/ping.h"
 #include "support/text.h"
 
 namespace {

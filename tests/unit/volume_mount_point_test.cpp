@@ -78,19 +78,6 @@ TEST_F(MountPoint, ThePathIsTheRootAndTheShare) {
   EXPECT_EQ(std::string(mount_point_of(longest.c_str())), "/mnt/VV/" + longest);
 }
 
-TEST_F(MountPoint, ACommandQuotesThePath) {
-  EXPECT_STREQ(command_on_path("rm -rf", "/mnt/VV/a b"), "rm -rf \"/mnt/VV/a b\"");
-  EXPECT_STREQ(command_on_path("rm -rf", "/mnt/VV/\"$`\\"), "rm -rf \"/mnt/VV/\\\"\\$\\`\\\\\"");
-}
-
-TEST_F(MountPoint, ACommandIsNeverCut) {
-  const std::string longest(1023, '$');
-  std::string escaped;
-  for (size_t i = 0; i < longest.size(); i++) escaped += "\\$";
-  EXPECT_EQ(std::string(command_on_path("umount -f", longest.c_str())), "umount -f \"" + escaped + "\"");
-  EXPECT_STREQ(command_on_path("umount -f", std::string(3000, 'a').c_str()), "false");
-}
-
 TEST_F(MountedPath, AFolderThatIsNotMountedMayBeRemoved) {
   EXPECT_FALSE(is_removal_unsafe(path.c_str()));
   EXPECT_FALSE(is_removal_unsafe("/mnt/VV/never made"));

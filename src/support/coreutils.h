@@ -1,0 +1,24 @@
+// The commands that drive chmod(1), dd(1), mkdir(1) and rm(1): every text of them stands here. Values reach
+// them only as text; see shell_text.h.
+#ifndef REMVOL_SUPPORT_COREUTILS_H
+#define REMVOL_SUPPORT_COREUTILS_H
+
+#include "support/text.h"
+
+namespace remvol {
+
+// Makes the folder, and those that are missing above it.
+CommandText make_folder_command(const char* path);
+
+// Removes the folder with all that is in it.
+CommandText remove_folder_command(const char* path);
+
+// Gives everybody every right to the folder.
+CommandText open_folder_command(const char* path);
+
+// Overwrites the first mebibyte of the device.
+CommandText wipe_beginning_command(const char* node);
+
+}  // namespace remvol
+
+#endif
