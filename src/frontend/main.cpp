@@ -35,7 +35,7 @@ KeyText result_key() {
 
 // Those who started the command poll this key: empty while it runs, then its result.
 void record_result(const char* value) {
-  ktreec_set(main_socket, 0, result_key(), value);
+  ktreec_set(kVolumesSocket, 0, result_key(), value);
 }
 
 int fail(bool show_usage) {
@@ -67,7 +67,7 @@ void copy_to_flash() {
 bool dump_settings(const Command& command) {
   // A tree that was told to end may be gone already, which is nothing to tell of.
   if (command.ends_tree)
-    return !dump_would_bury_settings() && ktreec_dump(main_socket, 0, kSettingsFile) == 0;
+    return !dump_would_bury_settings() && ktreec_dump(kVolumesSocket, 0, kSettingsFile) == 0;
   RunLock lock;
   lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one
   return store_settings();

@@ -108,7 +108,7 @@ void write_daemon_configuration() {
 int load_tree(const char* file) {
   const SlotsHeld held(SlotsHeld::kChange);
   slots_move();
-  return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", main_socket, file)));
+  return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", kVolumesSocket, file)));
 }
 
 // A daemon that a busy machine has not started in its second is waited for: without its settings the tree
@@ -133,7 +133,7 @@ void load_settings() {
 // A killed daemon leaves its pid file behind. The result key was set a moment ago.
 void start_settings_daemon() {
   if (check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult))) return;
-  start_tree_daemon(main_socket);
+  start_tree_daemon(kVolumesSocket);
   load_settings();
 }
 

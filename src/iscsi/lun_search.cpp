@@ -20,12 +20,6 @@ namespace {
 
 constexpr int kWaitSeconds = 3;
 
-// What the err_code key tells.
-enum SearchCode : int {
-  kSearchDone = 0,
-  kSearchLoginFailed = 100,
-};
-
 // Logs in for the time of the search. The node record that this makes is left in place.
 bool log_in() {
   TargetEntry* target = &request_target;
@@ -44,7 +38,7 @@ int open_session(const char* socket, int connected, bool* logged_in) {
   *logged_in = log_in();
   if (*logged_in) return kOk;
   LOG(0, "Target_Connect %s failed", request_target.target_name);
-  ktree_update_search_lun_err_code(socket, kSearchLoginFailed);
+  ktree_update_search_lun_err_code(socket, kLunSearchLoginFailed);
   return kFailed;
 }
 
@@ -57,7 +51,7 @@ int publish_luns(const char* socket) {
     LOG(1, "Can not find any available LUN on target %s", name);
     print_lun_list(nullptr, name);
     ktree_update_search_lun_result(socket, nullptr, name);
-    ktree_update_search_lun_err_code(socket, kSearchDone);
+    ktree_update_search_lun_err_code(socket, kLunSearchDone);
     return kOk;
   }
   LunNode* luns = nullptr;
@@ -70,7 +64,7 @@ int publish_luns(const char* socket) {
     ktree_update_search_lun_result(socket, luns, name);
     lun_node_free_list(luns);
   }
-  ktree_update_search_lun_err_code(socket, kSearchDone);
+  ktree_update_search_lun_err_code(socket, kLunSearchDone);
   return kOk;
 }
 

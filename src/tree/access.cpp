@@ -23,8 +23,8 @@ constexpr int kWriteTries = 3;
 bool tree_takes_connections() {
   sockaddr_un address = {};
   address.sun_family = AF_UNIX;
-  static_assert(sizeof main_socket <= sizeof address.sun_path);
-  memcpy(address.sun_path, main_socket, sizeof main_socket);
+  static_assert(sizeof kVolumesSocket <= sizeof address.sun_path);
+  memcpy(address.sun_path, kVolumesSocket, sizeof kVolumesSocket);
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
   if (fd < 0) return true;
   const bool refused = connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 &&
@@ -37,7 +37,7 @@ bool tree_takes_connections() {
 
 bool tree_answers(const char* key) {
   char value[128];
-  return ktreec_get_wb(main_socket, 0, key, value, sizeof value) >= 0 || tree_takes_connections();
+  return ktreec_get_wb(kVolumesSocket, 0, key, value, sizeof value) >= 0 || tree_takes_connections();
 }
 
 bool TreeInstance::operator==(const TreeInstance& other) const {
@@ -46,14 +46,14 @@ bool TreeInstance::operator==(const TreeInstance& other) const {
 
 TreeInstance tree_instance() {
   struct stat info;
-  if (stat(main_socket, &info) != 0) return {};
+  if (stat(kVolumesSocket, &info) != 0) return {};
   return {info.st_ino, info.st_mtim};
 }
 
 int tree_get(const char* key, char* buffer, size_t size) {
   memset(buffer, 0, size);
   errno = 0;
-  return ktreec_get_wb(main_socket, 0, key, buffer, size);
+  return ktreec_get_wb(kVolumesSocket, 0, key, buffer, size);
 }
 
 bool tree_read(const char* key, char* buffer, size_t size) {
@@ -94,7 +94,7 @@ bool tree_slot_is_free(const char* key) {
 }
 
 int tree_write(const char* key, const char* value) {
-  return tree_write_to(main_socket, key, value);
+  return tree_write_to(kVolumesSocket, key, value);
 }
 
 int tree_write_to(const char* socket, const char* key, const char* value) {
@@ -102,7 +102,7 @@ int tree_write_to(const char* socket, const char* key, const char* value) {
 }
 
 int tree_write_with_tries(const char* key, const char* value) {
-  return tree_write_with_tries_to(main_socket, key, value);
+  return tree_write_with_tries_to(kVolumesSocket, key, value);
 }
 
 int tree_write_with_tries_to(const char* socket, const char* key, const char* value) {
@@ -114,7 +114,7 @@ int tree_write_with_tries_to(const char* socket, const char* key, const char* va
 }
 
 int tree_delete(const char* key) {
-  return ktreec_del(main_socket, 0, key) == 0 ? kOk : kTreeFailed;
+  return ktreec_del(kVolumesSocket, 0, key) == 0 ? kOk : kTreeFailed;
 }
 
 }  // namespace remvol

@@ -10,14 +10,9 @@
 #include <ctime>
 
 #include "frontend/log.h"
+#include "tree_layout.h"
 
 namespace remvol {
-
-// The tree instance that holds the settings and the status.
-inline constexpr char main_socket[] = "/var/run/ktree_sock_vv";
-
-// What it is dumped to after a command, and loaded from at start-up.
-inline constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
 
 // Returns whether a daemon serves the tree: it has `key`, also with an empty value, or takes a connection.
 [[nodiscard]] bool tree_answers(const char* key);

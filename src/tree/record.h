@@ -4,12 +4,9 @@
 
 #include <cstdint>
 
-namespace remvol {
+#include "tree_layout.h"
 
-constexpr int kMaxTargets = 8;         // target slots, dbidx 1 to 8
-constexpr int kMaxLunsPerTarget = 8;   // LUN slots of a target, dbidx 1 to 8
-constexpr int kMaxLuns = 8;            // LUNs in the whole system
-constexpr int kMaxRecoverQueue = 100;  // names in the recover queue
+namespace remvol {
 
 // Called a target entry when only its target fields are filled, a LUN entry when the fields of exactly one
 // LUN are filled too. The caller owns it; every operation that fills one clears it first.

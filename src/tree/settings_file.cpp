@@ -115,7 +115,7 @@ bool store_settings() {
     LOG(0, "%s is kept as it is: the tree was never loaded from it", kSettingsFile);
     return false;
   }
-  if (ktreec_dump(main_socket, 0, kSettingsFile) == 0) return true;
+  if (ktreec_dump(kVolumesSocket, 0, kSettingsFile) == 0) return true;
   tell_failed_dump();
   return !settings_file_is_torn(kSettingsFile);
 }

@@ -1,37 +1,12 @@
-// State numbers of targets and LUNs and their writers. Writers of single values try up to 3 times where not
+// Writers of the state numbers of targets and LUNs. Writers of single values try up to 3 times where not
 // said otherwise, and return -103 after the third failure.
 #ifndef REMVOL_TREE_STATE_H
 #define REMVOL_TREE_STATE_H
 
 #include "tree/record.h"
+#include "tree_layout.h"
 
 namespace remvol {
-
-enum ConnectState : int {
-  kDisconnected = 0,
-  kConnected = 1,
-  kConnecting = 2,
-  kRecovering = 3,  // connection lost, being reopened
-  kConnectError = 4,
-};
-
-enum FormatState : int {
-  kFormatIdle = 0,
-  kFormatting = 1,
-  kFormatFailed = 3,
-  kFormatWaiting = 4,  // for the format semaphore
-};
-
-enum VolumeState : int {
-  kVolumeNormal = 0,
-  kVolumeCreating = 1,
-  kVolumeOffline = 2,
-  kVolumeFailed = 3,
-  kVolumeLost = 4,  // at start-up the session showed no usable disk
-  kVolumeUnsupported = 5,
-};
-
-enum AccessRight : int { VOL_AC_RO = 0, VOL_AC_RW = 1 };
 
 // Writes the target's connect state in one try. Returns 0 or -103.
 int ktree_set_connect_state(int dbidx, int state);

@@ -5,11 +5,10 @@
 #include "frontend/log.h"
 #include "support/run_lock.h"
 #include "support/text.h"
+#include "tree_layout.h"
 #include "volume/mount_table.h"
 
 namespace remvol {
-
-inline constexpr char kMountRoot[] = "/mnt/VV/";
 
 // The mount root and a share name.
 using MountPointText = Text<sizeof kMountRoot + 128>;

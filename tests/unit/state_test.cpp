@@ -12,7 +12,7 @@ namespace {
 constexpr char kTarget[] = "/iscsi/initiator/id:2";
 constexpr char kLun[] = "/iscsi/initiator/id:2/lun/id:3";
 
-std::string key(const char* base, const char* name) {
+std::string key_of(const char* base, const char* name) {
   return std::string(base) + "/" + name;
 }
 
@@ -31,13 +31,13 @@ class State : public fakes::Test {
 }  // namespace
 
 TEST_F(State, ConnectStateIsWrittenInOneTry) {
-  fakes::on("ktreec_set", key(kTarget, "conn_state")).returns(-1).times(1);
+  fakes::on("ktreec_set", key_of(kTarget, "conn_state")).returns(-1).times(1);
   std::string log;
   log = fakes::output_of([] { EXPECT_EQ(ktree_set_connect_state(2, 3), -103); });
   EXPECT_NE(log.find("ktreec_set(/iscsi/initiator/id:2/conn_state) failed"), std::string::npos);
   EXPECT_EQ(fakes::writes().size(), 1u);
   EXPECT_EQ(ktree_set_connect_state(2, 3), 0);
-  EXPECT_EQ(fakes::tree_get(key(kTarget, "conn_state")), "3");
+  EXPECT_EQ(fakes::tree_get(key_of(kTarget, "conn_state")), "3");
 }
 
 TEST_F(State, AccessRightOtherThanZeroOrOneIsRefused) {
@@ -69,7 +69,7 @@ TEST_F(State, OnlyAStoredZeroIsReadOnly) {
   EXPECT_EQ(ktree_get_lun_vol_access_right(&right, 2, 3), 0);
   EXPECT_EQ(right, VOL_AC_RW);
   for (const auto& [stored, expected] : fakes::Values{{"0", "0"}, {"1", "1"}, {"5", "1"}, {"", "1"}}) {
-    fakes::tree_set({{key(kLun, "vol_access_right"), stored}});
+    fakes::tree_set({{key_of(kLun, "vol_access_right"), stored}});
     EXPECT_EQ(ktree_get_lun_vol_access_right(&right, 2, 3), 0);
     EXPECT_EQ(std::to_string(right), expected) << stored;
   }
@@ -77,10 +77,10 @@ TEST_F(State, OnlyAStoredZeroIsReadOnly) {
 
 TEST_F(State, SingleValuesAreTriedThreeTimes) {
   const TargetEntry entry = lun_entry();
-  fakes::on("ktreec_set", key(kLun, "format_state")).returns(-1).times(2);
-  fakes::on("ktreec_set", key(kLun, "volume_state")).returns(-1);
+  fakes::on("ktreec_set", key_of(kLun, "format_state")).returns(-1).times(2);
+  fakes::on("ktreec_set", key_of(kLun, "volume_state")).returns(-1);
   std::string log = fakes::output_of([&entry] { EXPECT_EQ(ktree_update_formatting_state(&entry, 4), 0); });
-  EXPECT_EQ(fakes::tree_get(key(kLun, "format_state")), "4");
+  EXPECT_EQ(fakes::tree_get(key_of(kLun, "format_state")), "4");
   EXPECT_EQ(fakes::writes().size(), 3u);
   log = fakes::output_of([&entry] { EXPECT_EQ(ktree_update_volume_state(&entry, 5), -103); });
   EXPECT_EQ(fakes::writes().size(), 6u);
@@ -102,7 +102,7 @@ TEST_F(State, FormatProgressNeedsSlots) {
   debug_level = 2;
   const std::string detail = fakes::output_of([] { EXPECT_EQ(ktree_update_format_progress(2, 3, 52), 0); });
   EXPECT_NE(detail.find("set /iscsi/initiator/id:2/lun/id:3/format_progress = 52"), std::string::npos);
-  EXPECT_EQ(fakes::tree_get(key(kLun, "format_progress")), "52");
+  EXPECT_EQ(fakes::tree_get(key_of(kLun, "format_progress")), "52");
 }
 
 TEST_F(State, VolumeStateOfEveryLunUpToAGap) {
@@ -134,23 +134,23 @@ TEST_F(State, VolumeStateOfEveryLunStopsAtAFailure) {
 
 TEST_F(State, MountInfoIgnoresRefusedWrites) {
   TargetEntry entry = lun_entry();
-  fakes::on("ktreec_set", key(kLun, "mnt_dev")).returns(-1);
+  fakes::on("ktreec_set", key_of(kLun, "mnt_dev")).returns(-1);
   EXPECT_EQ(ktree_update_mount_info(&entry, "/dev/sdb1", "/mnt/VV/a", "ext4"), 0);
   EXPECT_STREQ(entry.mnt_dev, "/dev/sdb1");
   EXPECT_STREQ(entry.mnt, "/mnt/VV/a");
-  EXPECT_EQ(fakes::writes(), (std::vector<std::string>{"set " + key(kLun, "mnt_dev") + "=/dev/sdb1",
-                                                       "set " + key(kLun, "mnt") + "=/mnt/VV/a",
-                                                       "set " + key(kLun, "fs_type") + "=ext4"}));
+  EXPECT_EQ(fakes::writes(), (std::vector<std::string>{"set " + key_of(kLun, "mnt_dev") + "=/dev/sdb1",
+                                                       "set " + key_of(kLun, "mnt") + "=/mnt/VV/a",
+                                                       "set " + key_of(kLun, "fs_type") + "=ext4"}));
 }
 
 TEST_F(State, ConnectionWishIsWrittenInOneTry) {
   TargetEntry entry = lun_entry();
   entry.conn_set = 1;
-  fakes::on("ktreec_set", key(kTarget, "conn_set")).returns(-1).times(1);
+  fakes::on("ktreec_set", key_of(kTarget, "conn_set")).returns(-1).times(1);
   const std::string log = fakes::output_of([&entry] { EXPECT_EQ(ktree_record_connect_set(&entry), -103); });
   EXPECT_NE(log.find("): ktreec_set() failed\n"), std::string::npos);
   EXPECT_EQ(ktree_record_connect_set(&entry), 0);
-  EXPECT_EQ(fakes::tree_get(key(kTarget, "conn_set")), "1");
+  EXPECT_EQ(fakes::tree_get(key_of(kTarget, "conn_set")), "1");
 }
 
 TEST_F(State, InitiatorName) {
