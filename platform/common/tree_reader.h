@@ -7,18 +7,15 @@
 #include <string>
 #include <string_view>
 
+#include "tree_layout.h"
+
 namespace platform {
-
-inline constexpr int kTargets = 8, kLuns = 8;  // slots; those in use are the first ones
-
-// The tree of the volumes, and the machine's general one.
-inline constexpr char kVolumesTree[] = "/var/run/ktree_sock_vv", kGeneralTree[] = "/var/run/ktree_sock";
 
 // Everything of a tree below one path at one moment, had with one request.
 class TreeReader {
  public:
   // Asks the daemon for the targets and volumes; it has five seconds to answer.
-  TreeReader() : TreeReader(kVolumesTree, "/iscsi/initiator") {}
+  TreeReader() : TreeReader(remvol::kVolumesSocket, remvol::key::kInitiator) {}
 
   // Asks the daemon on `socket` for what is below `root`.
   TreeReader(const char* socket, const char* root);

@@ -17,6 +17,7 @@
 
 #include "common/start.h"
 #include "common/tree_reader.h"
+#include "tree_layout.h"
 
 namespace keeper {
 namespace {
@@ -73,12 +74,12 @@ struct Stored {
 
 bool read_stored(const std::string& target, Stored& stored) {
   platform::TreeReader tree;
-  for (int n = 1; n <= platform::kTargets; n++) {
-    if (tree.value("/iscsi/initiator/id:%d/target", n) != target) continue;
-    stored.address = tree.value("/iscsi/initiator/id:%d/ip", n);
-    stored.port = tree.value("/iscsi/initiator/id:%d/port", n);
-    for (int m = 1; m <= platform::kLuns; m++) {
-      stored.shares.push_back(tree.value("/iscsi/initiator/id:%d/lun/id:%d/share", n, m));
+  for (int n = 1; n <= remvol::kMaxTargets; n++) {
+    if (tree.value(remvol::key::kTargetName, n) != target) continue;
+    stored.address = tree.value(remvol::key::kTargetIp, n);
+    stored.port = tree.value(remvol::key::kTargetPort, n);
+    for (int m = 1; m <= remvol::kMaxLunsPerTarget; m++) {
+      stored.shares.push_back(tree.value(remvol::key::kLunShare, n, m));
     }
     return true;
   }
@@ -91,7 +92,7 @@ bool has_mounted(const Stored& stored) {
   bool found = false;
   while (const mntent* entry = found ? nullptr : getmntent(table)) {
     for (const std::string& share : stored.shares) {
-      found = found || (!share.empty() && "/mnt/VV/" + share == entry->mnt_dir);
+      found = found || (!share.empty() && remvol::kMountRoot + share == entry->mnt_dir);
     }
   }
   endmntent(table);

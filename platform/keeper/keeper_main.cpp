@@ -25,6 +25,7 @@
 #include "keeper/attempt.h"
 #include "keeper/processes.h"
 #include "keeper/schedule.h"
+#include "tree_layout.h"
 
 namespace keeper {
 namespace {
@@ -32,7 +33,6 @@ namespace {
 constexpr char kInitiator[] = "iscsid";
 constexpr int kLooksWithoutInitiator = 2;
 constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
-constexpr int kDisconnected = 0;         // connect state of the tree
 
 struct Daemon {
   Schedule schedule;
@@ -84,16 +84,16 @@ std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
   const bool at_work = is_brought_up();
   platform::TreeReader tree;
   std::vector<Wanted> wanted;
-  for (int n = 1; n <= platform::kTargets; n++) {
-    const std::string name = tree.value("/iscsi/initiator/id:%d/target", n);
+  for (int n = 1; n <= remvol::kMaxTargets; n++) {
+    const std::string name = tree.value(remvol::key::kTargetName, n);
     if (name.empty()) break;
-    if (tree.number(0, "/iscsi/initiator/id:%d/conn_set", n) == 0) continue;
+    if (tree.number(0, remvol::key::kTargetConnSet, n) == 0) continue;
     const bool connected =
         std::any_of(sessions.begin(), sessions.end(),
                     [&name](const platform::Session& session) { return session.target == name; });
     const bool is_taken =
-        taken_down ||
-        (first && tree.number(kDisconnected, "/iscsi/initiator/id:%d/conn_state", n) == kDisconnected);
+        taken_down || (first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) ==
+                                    remvol::kDisconnected);
     wanted.push_back({name, connected, is_taken, at_work});
   }
   answered = tree.answered();

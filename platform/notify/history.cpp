@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "common/utf8.h"
+#include "tree_layout.h"
 
 namespace notify {
 namespace {
@@ -42,7 +43,7 @@ unsigned bit_of(Ailment ailment) {
 }
 
 bool is_formatting(const Row& row) {
-  return row.volume != nullptr && row.volume->format_state == vvstat::kFormatRunning;
+  return row.volume != nullptr && row.volume->format_state == remvol::kFormatting;
 }
 
 bool is_new(const Row& row, const Past& past) {

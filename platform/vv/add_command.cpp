@@ -1,5 +1,6 @@
 #include "common/utf8.h"
 #include "shares/share_name.h"
+#include "tree_layout.h"
 #include "vv/job.h"
 #include "vv/search_commands.h"
 #include "vv/volume_commands.h"
@@ -10,7 +11,6 @@ namespace {
 using vvstat::Row;
 using vvstat::Target;
 
-constexpr size_t kMostVolumes = 8;
 constexpr size_t kLongestShare = 127;  // bytes
 
 // What is wrong with the name as a new share's; empty when nothing is.
@@ -73,11 +73,11 @@ bool fits_what_is_stored(Job& job, const Portal& portal, const std::string& targ
     return job.refuse(kUsage, "LUN " + std::to_string(job.options.lun) + " of this target is the share " +
                                   platform::printable(row->volume->share) + " already");
   }
-  if (volumes_in(job.before) >= kMostVolumes) {
+  if (volumes_in(job.before) >= remvol::kMaxLuns) {
     return job.refuse(kUsage, "8 volumes are configured, which is the most");
   }
   const Target* stored = job.before.target(target);
-  if (stored == nullptr && job.before.targets().size() >= platform::kTargets) {
+  if (stored == nullptr && job.before.targets().size() >= remvol::kMaxTargets) {
     return job.refuse(kUsage, "8 targets are configured, which is the most");
   }
   if (stored == nullptr) return true;

@@ -3,6 +3,7 @@
 #include <algorithm>
 
 #include "common/utf8.h"
+#include "tree_layout.h"
 
 namespace vv {
 namespace {
@@ -78,8 +79,8 @@ const std::string* line_with(const std::vector<std::string>& lines, std::string_
 }
 
 const char* step_of(const Row& row) {
-  if (row.target->connect_state != vvstat::kConnected || row.session != "LOGGED_IN") return kLoginStep;
-  if (row.volume->format_state == vvstat::kFormatFailed) return kFormatStep;
+  if (row.target->connect_state != remvol::kConnected || row.session != "LOGGED_IN") return kLoginStep;
+  if (row.volume->format_state == remvol::kFormatFailed) return kFormatStep;
   return row.volume->device.empty() ? kDiskStep : kMountStep;
 }
 

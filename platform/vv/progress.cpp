@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "common/utf8.h"
+#include "tree_layout.h"
 
 namespace vv {
 namespace {
@@ -17,7 +18,6 @@ using vvstat::Volume;
 
 constexpr size_t kBar = 40;  // cells of a whole bar
 constexpr size_t kDefaultWidth = 80;
-constexpr int kReady = 0;
 
 const Volume* same_lun(const Target& target, int lun) {
   for (const Volume& volume : target.volumes) {
@@ -29,26 +29,26 @@ const Volume* same_lun(const Target& target, int lun) {
 void add_target_steps(const Target& before, const Target& now, std::vector<std::string>& steps) {
   if (before.connect_state == now.connect_state) return;
   const std::string name = platform::printable(now.name);
-  if (now.connect_state == vvstat::kConnecting) {
+  if (now.connect_state == remvol::kConnecting) {
     steps.push_back("logging in to " + name + " at " + now.address + ":" + std::to_string(now.port));
   }
-  if (now.connect_state == vvstat::kConnected) steps.push_back("logged in to " + name);
+  if (now.connect_state == remvol::kConnected) steps.push_back("logged in to " + name);
 }
 
 // What the change of a state means, if anything.
 const char* step_of_format(int before, int now) {
   if (before == now) return nullptr;
-  if (now == vvstat::kFormatWaiting) return "waiting until another volume is formatted";
-  if (now == vvstat::kFormatRunning) return "formatting";
-  return before == vvstat::kFormatRunning && now != vvstat::kFormatFailed ? "formatted" : nullptr;
+  if (now == remvol::kFormatWaiting) return "waiting until another volume is formatted";
+  if (now == remvol::kFormatting) return "formatting";
+  return before == remvol::kFormatting && now != remvol::kFormatFailed ? "formatted" : nullptr;
 }
 
 const char* first_step(int before, int now) {
-  return before != now && now == vvstat::kBeingCreated ? "looking at its disk" : nullptr;
+  return before != now && now == remvol::kVolumeCreating ? "looking at its disk" : nullptr;
 }
 
 const char* last_step(int before, int now) {
-  return before == vvstat::kBeingCreated && now == kReady ? "mounted" : nullptr;
+  return before == remvol::kVolumeCreating && now == remvol::kVolumeNormal ? "mounted" : nullptr;
 }
 
 void add_volume_steps(const Volume& before, const Volume& now, std::vector<std::string>& steps) {
@@ -88,7 +88,7 @@ std::vector<std::string> steps_between(const Target& before, const Target& now) 
 
 const Volume* formatting(const Target& target) {
   for (const Volume& volume : target.volumes) {
-    if (volume.format_state == vvstat::kFormatRunning) return &volume;
+    if (volume.format_state == remvol::kFormatting) return &volume;
   }
   return nullptr;
 }

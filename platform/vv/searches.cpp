@@ -8,22 +8,19 @@
 
 #include "ktree/client/calls.h"
 #include "shares/lock_file.h"
-
-#define TARGETS "/temp/vv_search"
-#define LUNS "/temp/vv_search_lun"
+#include "tree_layout.h"
 
 namespace vv {
 namespace {
 
 using ktree::client::CallResult;
 using platform::TreeReader;
+namespace key = remvol::key;
 
-constexpr char kRoot[] = "/temp";
 constexpr char kUnknown[] = "unknown";  // the tool's word for a file system that is not recognised
-constexpr int kLoginFailed = 100;
 
 bool forget(const char* path) {
-  return ktree::client::del(platform::kGeneralTree, path) != CallResult::kUnreachable;
+  return ktree::client::del(remvol::kGeneralSocket, path) != CallResult::kUnreachable;
 }
 
 }  // namespace
@@ -31,7 +28,7 @@ bool forget(const char* path) {
 SearchTurn::SearchTurn() : lock_(open_lock_file("vv-search.lock")) {
   if (lock_ >= 0) take_lock(lock_, LOCK_EX);
   // A search that fails or finds nothing leaves what an earlier one has found.
-  reachable_ = forget(TARGETS) && forget(LUNS);
+  reachable_ = forget(key::kSearch) && forget(key::kLunSearch);
 }
 
 SearchTurn::~SearchTurn() {
@@ -40,9 +37,9 @@ SearchTurn::~SearchTurn() {
 
 FoundTargets found_targets(const TreeReader& tree) {
   FoundTargets found;
-  found.done = tree.number(0, TARGETS "/search_done") == 1;
+  found.done = tree.number(0, key::kSearchDone) == 1;
   for (int n = 1;; n++) {
-    const std::string name = tree.value(TARGETS "/id:%d/name", n);
+    const std::string name = tree.value(key::kSearchName, n);
     if (name.empty()) break;
     found.names.push_back(name);
   }
@@ -53,17 +50,17 @@ FoundTargets found_targets(const TreeReader& tree) {
 
 FoundLuns found_luns(const TreeReader& tree, const std::string& target) {
   FoundLuns found;
-  const int code = tree.number(-1, LUNS "/err_code");
-  found.done = code == 0;
-  found.login_failed = code == kLoginFailed;
-  if (!found.done || tree.value(LUNS "/target_name") != target) return found;
-  const int count = tree.number(0, LUNS "/lun/count");
-  for (int n = 1; n <= count && !tree.value(LUNS "/lun/id:%d/lun", n).empty(); n++) {
+  const int code = tree.number(-1, key::kLunSearchError);
+  found.done = code == remvol::kLunSearchDone;
+  found.login_failed = code == remvol::kLunSearchLoginFailed;
+  if (!found.done || tree.value(key::kLunSearchTarget) != target) return found;
+  const int count = tree.number(0, key::kLunSearchCount);
+  for (int n = 1; n <= count && !tree.value(key::kLunSearchLun, n).empty(); n++) {
     FoundLun lun;
-    lun.number = tree.number(-1, LUNS "/lun/id:%d/lun", n);
-    lun.size = strtoull(tree.value(LUNS "/lun/id:%d/size", n).c_str(), nullptr, 10);
-    lun.available = tree.number(0, LUNS "/lun/id:%d/avaliable", n) != 0;
-    lun.file_system = tree.value(LUNS "/lun/id:%d/fstype", n);
+    lun.number = tree.number(-1, key::kLunSearchLun, n);
+    lun.size = strtoull(tree.value(key::kLunSearchSize, n).c_str(), nullptr, 10);
+    lun.available = tree.number(0, key::kLunSearchAvailable, n) != 0;
+    lun.file_system = tree.value(key::kLunSearchFsType, n);
     if (lun.file_system == kUnknown) lun.file_system.clear();
     found.luns.push_back(lun);
   }
@@ -71,11 +68,11 @@ FoundLuns found_luns(const TreeReader& tree, const std::string& target) {
 }
 
 FoundTargets read_found_targets() {
-  return found_targets(TreeReader(platform::kGeneralTree, kRoot));
+  return found_targets(TreeReader(remvol::kGeneralSocket, key::kTemporary));
 }
 
 FoundLuns read_found_luns(const std::string& target) {
-  return found_luns(TreeReader(platform::kGeneralTree, kRoot), target);
+  return found_luns(TreeReader(remvol::kGeneralSocket, key::kTemporary), target);
 }
 
 }  // namespace vv

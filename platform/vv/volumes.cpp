@@ -6,6 +6,7 @@
 
 #include "common/sessions.h"
 #include "common/tree_reader.h"
+#include "tree_layout.h"
 #include "vv/list.h"
 
 namespace vv {
@@ -70,11 +71,11 @@ std::string Look::share_names() const {
 Credentials stored_credentials(const std::string& target) {
   const platform::TreeReader tree;
   Credentials credentials;
-  for (int n = 1; n <= platform::kTargets; n++) {
-    if (tree.value("/iscsi/initiator/id:%d/target", n) != target) continue;
-    if (tree.number(0, "/iscsi/initiator/id:%d/chap", n) == 0) break;
-    credentials.user = tree.value("/iscsi/initiator/id:%d/chap_name", n);
-    credentials.secret = tree.value("/iscsi/initiator/id:%d/chap_pwd", n);
+  for (int n = 1; n <= remvol::kMaxTargets; n++) {
+    if (tree.value(remvol::key::kTargetName, n) != target) continue;
+    if (tree.number(0, remvol::key::kTargetChap, n) == 0) break;
+    credentials.user = tree.value(remvol::key::kTargetChapName, n);
+    credentials.secret = tree.value(remvol::key::kTargetChapPwd, n);
     break;
   }
   return credentials;

@@ -11,6 +11,7 @@
 
 #include "common/scols.h"
 #include "common/utf8.h"
+#include "tree_layout.h"
 #include "vvstat/moment.h"
 
 namespace vvstat {
@@ -117,7 +118,7 @@ constexpr Column kColumns[] = {
      }},
     {"PROGRESS", "percent of a format that is under way", 0, kNumber, true,
      [](const Row& row, const Layout&) {
-       const bool runs = row.volume != nullptr && row.volume->format_state == kFormatRunning;
+       const bool runs = row.volume != nullptr && row.volume->format_state == remvol::kFormatting;
        return word(runs, runs ? std::to_string(row.volume->progress) : "");
      }},
     {"SESSION", "the kernel's word for the session's state", 0, kText, false,

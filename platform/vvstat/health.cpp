@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "tree_layout.h"
+
 namespace vvstat {
 namespace {
 
@@ -19,8 +21,8 @@ std::string mount_anew(const Target& target) {
 // The tool stores that a target is not to be connected when somebody disconnects it, but also when a login
 // fails that somebody asked for.
 bool is_wanted(const Target& target) {
-  return target.wanted || target.connect_state == kConnected || target.connect_state == kConnecting ||
-         target.connect_state == kConnectError;
+  return target.wanted || target.connect_state == remvol::kConnected ||
+         target.connect_state == remvol::kConnecting || target.connect_state == remvol::kConnectError;
 }
 
 // The tool's texts.
@@ -37,13 +39,13 @@ Problem given_up(const Target& target) {
 // Nothing of a target's volumes can be had while it has a problem.
 Problem problem_of(const Target& target, const TargetFacts& facts) {
   switch (target.connect_state) {
-    case kConnected:
+    case remvol::kConnected:
       break;
-    case kConnecting:
+    case remvol::kConnecting:
       return {Ailment::kBusy, "Connecting", "is being connected", "wait a minute", ""};
-    case kRecovering:
+    case remvol::kRecovering:
       return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
-    case kConnectError:
+    case remvol::kConnectError:
       return {Ailment::kFailed, "Connect Error", "the login failed",
               "check the address, the password and the cable", connect_command_of(target)};
     default:
@@ -62,15 +64,15 @@ Problem problem_of(const Target& target, const TargetFacts& facts) {
 Problem problem_of_unmounted(const Target& target, const Volume& volume) {
   const std::string format =
       "remvol --format -n " + quoted(target.name) + " -l " + std::to_string(volume.lun);
-  if (volume.format_state == kFormatFailed) {
+  if (volume.format_state == remvol::kFormatFailed) {
     return {Ailment::kFailed, "Format Failed", "its format failed",
             "look at the storage server and the kernel's log", format};
   }
-  if (volume.volume_state == kUnsupported) {
+  if (volume.volume_state == remvol::kVolumeUnsupported) {
     return {Ailment::kFailed, "Unsupported", "what is on its disk cannot be mounted here",
             "the data is left as it is; this destroys it", format};
   }
-  if (volume.volume_state == kVolumeFailed) {
+  if (volume.volume_state == remvol::kVolumeFailed) {
     return {Ailment::kFailed, "Failed", "its partition, format or mount failed",
             "look at the kernel's log for errors of the disk", connect_command_of(target)};
   }
@@ -82,14 +84,14 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume) {
 }
 
 Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {
-  if (volume.format_state == kFormatRunning) {
+  if (volume.format_state == remvol::kFormatting) {
     return {Ailment::kBusy, "Formatting", "is being formatted, " + std::to_string(volume.progress) + "%",
             "wait", ""};
   }
-  if (volume.format_state == kFormatWaiting) {
+  if (volume.format_state == remvol::kFormatWaiting) {
     return {Ailment::kBusy, "Wait to Format", "waits until another volume is formatted", "wait", ""};
   }
-  if (volume.volume_state == kBeingCreated) {
+  if (volume.volume_state == remvol::kVolumeCreating) {
     return {Ailment::kBusy, "Creating", "is being created", "wait", ""};
   }
   if (!facts.mounted) return problem_of_unmounted(target, volume);
@@ -145,7 +147,7 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
   row.size = facts.size;
   row.made = facts.made;
   row.options = facts.options;
-  if (!row.wanted && volume.volume_state == kGivenUp) {
+  if (!row.wanted && volume.volume_state == remvol::kVolumeLost) {
     row.wanted = true;
     row.problem = given_up(target);
   }

@@ -5,6 +5,7 @@
 #include <string_view>
 
 #include "common/utf8.h"
+#include "tree_layout.h"
 
 namespace vvstat {
 namespace {
@@ -43,8 +44,8 @@ constexpr Metric kOfVolumes[] = {
      [](const Row& row, time_t) { return when_mounted(row, row.size); }},
     {"remvol_volume_format_progress_percent", "How far a format is that is under way.",
      [](const Row& row, time_t) {
-       return row.volume->format_state == kFormatRunning ? std::to_string(row.volume->progress)
-                                                         : std::string();
+       return row.volume->format_state == remvol::kFormatting ? std::to_string(row.volume->progress)
+                                                              : std::string();
      }},
     {"remvol_volume_seconds_since_change", "Seconds since it became healthy, or unhealthy.",
      [](const Row& row, time_t now) { return seconds_since(row.since, now); }},
@@ -55,7 +56,7 @@ constexpr Metric kOfTargets[] = {
      [](const Row& row, time_t) { return flag(row.target->wanted); }},
     {"remvol_target_connected", "It has a session that is logged in.",
      [](const Row& row, time_t) {
-       return flag(row.target->connect_state == kConnected && row.session == "LOGGED_IN");
+       return flag(row.target->connect_state == remvol::kConnected && row.session == "LOGGED_IN");
      }},
 };
 

@@ -15,9 +15,9 @@ struct Volume {
   std::string status;  // the text of the tool
   bool enabled;
   bool read_only;
-  int format_state;  // -1: unknown, 0: none, 1: running, 3: failed, 4: waiting
+  int format_state;  // a remvol::FormatState; -1: unknown
   int progress;      // percent of the format
-  int volume_state;  // -1: unknown, 0: ready, 1: being created, 2: offline, 3: failed, 5: unsupported
+  int volume_state;  // a remvol::VolumeState; -1: unknown
   std::string file_system;
   std::string device;
   std::string mount_point;
@@ -28,7 +28,7 @@ struct Target {
   std::string address;
   int port;
   bool wanted;        // it is to be connected at start-up
-  int connect_state;  // -1: unknown, 0: disconnected, 1: connected, 2: connecting, 3: lost, 4: login failed
+  int connect_state;  // a remvol::ConnectState; -1: unknown
   std::string status;
   std::vector<Volume> volumes;
 };
@@ -37,11 +37,6 @@ struct Status {
   bool reachable;  // false: the tree does not answer, and the list is empty
   std::vector<Target> targets;
 };
-
-// Values of connect_state, format_state and volume_state.
-inline constexpr int kConnected = 1, kConnecting = 2, kRecovering = 3, kConnectError = 4;
-inline constexpr int kFormatRunning = 1, kFormatFailed = 3, kFormatWaiting = 4;
-inline constexpr int kBeingCreated = 1, kVolumeFailed = 3, kGivenUp = 4, kUnsupported = 5;
 
 Status read_status(const platform::TreeReader& tree);
 

@@ -350,7 +350,8 @@ def test_eight_volumes_of_which_one_is_broken(shares):
     assert shares.file() == HEAD + "".join(section(name) for name in names if name != "bro]ken")
 
 
-@pytest.mark.parametrize("state, why", [("3", "it could not be made or mounted"), ("5", "its file system is not supported")])
+@pytest.mark.parametrize("state, why", [("3", "it could not be made or mounted"), ("4", "its target showed no disk of it"),
+                                        ("5", "its file system is not supported")])
 def test_a_volume_that_failed_is_said_and_the_others_are_served(shares, state, why):
     names = [f"V{number}" for number in range(1, 9)]
     for name in names:

@@ -164,6 +164,10 @@ UNMOUNTED_PROBLEMS = [
      "its LUN has no disk here", CONNECT),
     ({"lun/id:1/volume_state": "3", "lun/id:1/status": "Create Volume Failed"}, "Create Volume Failed",
      "its partition, format or mount failed", CONNECT),
+    # Given up at start-up and connected since: what it lacks now counts.
+    ({"lun/id:1/volume_state": "4", "lun/id:1/status": "Offline", "lun/id:1/dev": ""}, "Offline",
+     "its LUN has no disk here", CONNECT),
+    ({"lun/id:1/volume_state": "4", "lun/id:1/status": "Offline"}, "Offline", "is not mounted", CONNECT),
     ({"lun/id:1/volume_state": "5", "lun/id:1/status": "Unsupported File System"}, "Unsupported File System",
      "what is on its disk cannot be mounted here", FORMAT),
     ({"lun/id:1/format_state": "3", "lun/id:1/status": "Create Volume Failed"}, "Create Volume Failed",

@@ -110,7 +110,7 @@ TEST_F(Told, WorkThatEndsWellIsNoNews) {
 }
 
 TEST_F(Told, TheEndOfAFormat) {
-  volume_.format_state = vvstat::kFormatRunning;
+  volume_.format_state = remvol::kFormatting;
   EXPECT_EQ(at(0, Ailment::kBusy), Names{});
   volume_.format_state = 0;
   EXPECT_EQ(at(5, Ailment::kBusy), Names{});  // it is being mounted
@@ -130,7 +130,7 @@ TEST_F(Told, TheEndOfAFormatThatNobodySaw) {
 
 TEST_F(Told, AFormatThatWasSeenIsToldOnce) {
   at(0, Ailment::kNone);
-  volume_.format_state = vvstat::kFormatRunning;
+  volume_.format_state = remvol::kFormatting;
   at(10, Ailment::kBusy);
   volume_.format_state = 0;
   row_.made = kStart + 12;
@@ -197,9 +197,9 @@ TEST_F(Told, AFormatOfAVolumeThatIsIllIsToldWhenItIsWell) {
 }
 
 TEST_F(Told, AFormatThatFailedIsNotDone) {
-  volume_.format_state = vvstat::kFormatRunning;
+  volume_.format_state = remvol::kFormatting;
   at(0, Ailment::kBusy);
-  volume_.format_state = vvstat::kFormatFailed;
+  volume_.format_state = remvol::kFormatFailed;
   EXPECT_EQ(at(10, Ailment::kFailed), Names{"volume-failed"});
 }
 
