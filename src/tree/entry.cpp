@@ -322,8 +322,8 @@ int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
   const HeldSlot slot(dbidx, lun_dbidx);
   if (!slot) return kTreeFailed;
   char value[128] = "";
-  const int length =
-      ktreec_get_wb(kVolumesSocket, 0, KeyText(key::kLunEnable, slot.target(), slot.lun()), value, sizeof value);
+  const int length = ktreec_get_wb(kVolumesSocket, 0, KeyText(key::kLunEnable, slot.target(), slot.lun()),
+                                   value, sizeof value);
   if (length > 0 && value[0] != '\0') {
     *enable = atoi(value) != 0 ? 1 : 0;
     return kOk;
