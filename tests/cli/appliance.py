@@ -1,8 +1,6 @@
-"""A box with targets: an initiator that keeps state behind `iscsiadm`, disks that can be mounted, stored targets.
+"""A box with targets: a made-up initiator (harness/initiator.py), disks that can be mounted, stored targets.
 
-    site = Site(box)
-    site.offer("iqn.t1", {0: "sdb", 1: "sdc"})   the target shows these disks when somebody logs in
-    site.log_in("iqn.t1")                        it is logged in already
+    site = Site(box)                             an Initiator: offer(), log_in() and so on are its own
     site.disk("sdb", fs="ext4")                  what the platform says of a disk
     site.store("iqn.t1", luns=[("a", 0)])        a target in the tree, its LUNs as (share, number)
 
@@ -10,44 +8,12 @@ A mount is a real one (of a tmpfs with the partition's node as its source), so m
 disk usage are the kernel's own.
 """
 
-import re
 import shlex
 
-INITIATOR = "/iscsi/initiator"
+from harness.initiator import INITIATOR, Initiator, store
 
 # What a run does, with the slots locked, that stores or deletes one: nobody believes any more what was read before.
 SLOTS_MOVE = "truncate -s +1 /run/remvol/slots.lock"
-PORTAL = "10.9.0.2"
-SHARES = "winshare_reload ; macshare_reload"
-SESSIONS = "iscsiadm -m session >/tmp/remvol_session.tmp 2>&1"
-DETAILS = "iscsiadm -m session -P3 >/tmp/remvol.tmp 2>&1"
-
-_STATE = "/fake/initiator"
-
-# The initiator: a file in on/ is a session, a folder in offer/ a target with the listings of its session.
-_ISCSIADM = r"""
-sessions() {
-    cd on
-    for name in *; do
-        [ -e "$name" ] || { echo 'iscsiadm: No active sessions.' >&2; exit 21; }
-        cat "../offer/$name/$1"
-    done
-}
-named() {
-    while [ "$1" != -T ]; do shift; done
-    printf %s "$2"
-}
-cd /fake/initiator
-case "$*" in
-"-m session") sessions plain ;;
-"-m session -P3" | "-m session -P 3") sessions details ;;
-"-m node -u") rm on/* 2>/dev/null || exit 21 ;;
-*--login) [ -e "offer/$(named "$@")" ] && : >"on/$(named "$@")" ;;
-*--logout) rm "on/$(named "$@")" 2>/dev/null || exit 21 ;;
-*"-o delete" | *"-o new" | *"-o update "*) ;;
-*) echo "iscsiadm $*: not known here" >&2; exit 7 ;;
-esac
-"""
 
 _MOUNT = """
 case "$*" in *remount*) exit 0 ;; esac
@@ -56,43 +22,16 @@ mount -t tmpfs "$1" "$2"
 """
 
 
-class Site:
+class Site(Initiator):
     def __init__(self, box):
-        self.box = box
+        super().__init__(box)
         self.tree = box.tree
-        for folder in ("on", "offer"):
-            box.path(_STATE).joinpath(folder).mkdir(parents=True)
-        box.write(f"{_STATE}/iscsiadm", _ISCSIADM)
-        box.default("iscsiadm", effect=f'sh {_STATE}/iscsiadm "$@"')
         box.default("fuser")
         box.default("mount", effect=_MOUNT)
         box.default("umount", real=True)
         box.default("resize2fs")
         box.default("e2fsck")
         box.default("ps")
-
-    # --- the initiator ---
-
-    def offer(self, name, disks):
-        """`disks`: LUN number to kernel name."""
-        folder = self.box.path(f"{_STATE}/offer/{name}")
-        folder.mkdir(parents=True, exist_ok=True)
-        folder.joinpath("plain").write_text(f"tcp: [1] {PORTAL}:3260,1 {name} (non-flash)\n")
-        lines = [f"Target: {name} (non-flash)", f"\tCurrent Portal: {PORTAL}:3260,1",
-                 "\t\tiSCSI Session State: LOGGED_IN", "\t\tHost Number: 2\tState: running"]
-        for number, dev in disks.items():
-            lines += [f"\t\tscsi2 Channel 00 Id 0 Lun: {number}",
-                      f"\t\t\tAttached scsi disk {dev}\t\tState: running"]
-        folder.joinpath("details").write_text("\n".join(lines) + "\n")
-
-    def log_in(self, name):
-        self.box.path(f"{_STATE}/on").joinpath(name).touch()
-
-    def logged_in(self, name):
-        return self.box.path(f"{_STATE}/on").joinpath(name).exists()
-
-    def fail_login(self, name):
-        self.box.fake("iscsiadm", re.compile(f"^-m node -T {re.escape(name)} .*--login$"), stderr="iscsiadm: Could not login\n", status=24)
 
     # --- disks ---
 
@@ -127,16 +66,8 @@ class Site:
 
     # --- stored targets ---
 
-    def store(self, name="iqn.t1", *, slot=1, luns=(), ip=PORTAL, port=3260, chap=0, **settings):
-        values = {"target": name, "chap": chap, "chap_name": "", "chap_pwd": "", "ip": ip, "port": port, **settings}
-        self.tree.set({f"{INITIATOR}/id:{slot}/{key}": value for key, value in values.items()})
-        for number, lun in enumerate(luns, start=1):
-            share, lun_number, *more = lun
-            fields = {"lun": lun_number, "share": share, "enable": 1, "vol_access_right": 1, **(more[0] if more else {})}
-            self.tree.set({f"{INITIATOR}/id:{slot}/lun/id:{number}/{key}": value for key, value in fields.items()})
-        if luns:
-            self.tree.set(f"{INITIATOR}/id:{slot}/lun/count", len(luns))
-        self.tree.set(f"{INITIATOR}/count", slot)
+    def store(self, name="iqn.t1", **settings):
+        store(self.box, name, **settings)
 
     def debug(self, level):
         self.tree.set(f"{INITIATOR}/dbg", level)
@@ -158,11 +89,6 @@ def assert_order(trace, *expected):
     rest = iter(enumerate(trace))
     for wanted in expected:
         assert any(line == wanted for _, line in rest), f"'{wanted}' is missing or too early in\n" + "\n".join(trace)
-
-
-def messages(result):
-    """The log lines of a run, without their prefix."""
-    return [line.split("): ", 1)[1] for line in result.lines if line.startswith("(") and "): " in line]
 
 
 def settings(box):

@@ -6,7 +6,7 @@ import subprocess
 
 import pytest
 
-from harness import messages, said
+from harness import log_lines, messages
 from harness.ktree_daemon import BUILD
 
 USAGE = (
@@ -98,7 +98,7 @@ class TestFailurePath:
     def test_a_second_command_is_refused(self, box):
         box.debug(1)
         done = box.remvol("--init", "--status")
-        assert "Command parameter check failed, 0 & 6" in said(done.stdout)
+        assert "Command parameter check failed, 0 & 6" in messages(done)
         assert "use:" not in done.stdout
         assert done.status == 255
         assert box.tree.get("/result/init") == "-1"
@@ -107,7 +107,7 @@ class TestFailurePath:
     def test_the_same_command_twice_is_refused(self, box):
         box.debug(1)
         done = box.remvol("--modify_address", "--modify_address")
-        assert "Command parameter check failed, 17 & 17" in said(done.stdout)
+        assert "Command parameter check failed, 17 & 17" in messages(done)
 
 
 class TestNoCommand:
@@ -127,7 +127,7 @@ class TestRequiredOptions:
         box.debug(1)
         given = NEEDS[command] & ~missing
         done = box.remvol(f"--{command}", *options_for(given))
-        assert messages(done.stdout)[-1] == ("src.cpp", "main", f"OPT_FLAG: {given:08x}")
+        assert log_lines(done.stdout)[-1] == ("src.cpp", "main", f"OPT_FLAG: {given:08x}")
         assert done.stdout.endswith("execute failed.\n") and "use:" not in done.stdout
         assert done.status == 255
         assert box.trace("set", "dump", "system") == [
@@ -136,13 +136,13 @@ class TestRequiredOptions:
     def test_add_without_a_lun_shows_the_whole_flag(self, box):
         box.debug(1)
         done = box.remvol("--add", "-n", "iqn.t", "-i", "10.0.0.1", "-p", "3260", "-s", "share")
-        assert said(done.stdout)[-1] == "OPT_FLAG: 0000002d"
+        assert messages(done)[-1] == "OPT_FLAG: 0000002d"
         assert box.tree.get("/result/add") == "-1"
 
     def test_options_that_are_not_asked_for_do_not_stand_in(self, box):
         box.debug(1)
         done = box.remvol("--del", "-c", "1", "-U", "u", "-P", "p", "-o", "/tmp/o", "-w", "1", "-s", "x")
-        assert said(done.stdout)[-1] == "OPT_FLAG: 00000022"
+        assert messages(done)[-1] == "OPT_FLAG: 00000022"
 
 
 class TestOptions:
@@ -151,7 +151,7 @@ class TestOptions:
         args = ["--del_lun", "-l", "7", "-s", "my share", "-p", "3260", "-i", "10.1.2.3", "-c", "1", "-U", "user",
                 "-P", "secret", "-o", "/tmp/out", "-w", "5", "--bad"]
         done = box.remvol(*args)
-        logged = messages(done.stdout)
+        logged = log_lines(done.stdout)
         assert {entry[:2] for entry in logged} == {("src.cpp", "main")}
         texts = [entry[2] for entry in logged]
         assert texts[:len(args) + 1] == [
@@ -169,18 +169,18 @@ class TestOptions:
     def test_a_name_sets_its_bit(self, box):
         box.debug(1)
         done = box.remvol("--search", "-n", "iqn.t")
-        assert said(done.stdout)[-3:] == ["opt('n') with arg 'iqn.t'", "OPT_FLAG: 00000001", "OPT_FLAG: 00000001"]
+        assert messages(done)[-3:] == ["opt('n') with arg 'iqn.t'", "OPT_FLAG: 00000001", "OPT_FLAG: 00000001"]
 
     @pytest.mark.parametrize("before", [[], ["-c", "0"], ["-c", "2"], ["-c", "x"], ["-c", "1", "-c", "0"]])
     def test_user_and_secret_count_only_behind_chap_1(self, box, before):
         box.debug(1)
         done = box.remvol("--search", *before, "-U", "user", "-P", "secret", "-c", "1")
-        assert not [text for text in said(done.stdout) if text.startswith(("opt('U')", "opt('P')"))]
+        assert not [text for text in messages(done) if text.startswith(("opt('U')", "opt('P')"))]
 
     def test_a_number_may_follow_blanks_and_precede_text(self, box):
         box.debug(1)
         done = box.remvol("--search", "-c", " 1x", "-U", "user")
-        assert "opt('U') with arg 'user'" in said(done.stdout)
+        assert "opt('U') with arg 'user'" in messages(done)
 
     def test_every_command_prints_one_line_break(self, box):
         done = box.remvol("-p", "1", "--search")
@@ -267,13 +267,13 @@ class TestAddress:
     def test_a_number_is_normalised(self, box, given, ip, family):
         box.debug(1)
         done = box.remvol("--search", "-i", given)
-        assert f"get ip address {given} = {ip}, inet_type = {family}" in said(done.stdout)
+        assert f"get ip address {given} = {ip}, inet_type = {family}" in messages(done)
 
     def test_a_name_is_resolved_by_the_system(self, box):
         box.debug(1)
         box.write("/etc/hosts", "10.9.8.7 portal\n")
         done = box.remvol("--search", "-i", "portal")
-        assert "get ip address portal = 10.9.8.7, inet_type = AF_INET" in said(done.stdout)
+        assert "get ip address portal = 10.9.8.7, inet_type = AF_INET" in messages(done)
 
     @pytest.mark.parametrize("answer,ip,family", [("10.0.0.2 fe80::1", "10.0.0.2", "AF_INET"),
                                                   ("fe80::2 10.0.0.1", "[fe80::2]", "AF_INET6")])
@@ -281,7 +281,7 @@ class TestAddress:
         box.debug(1)
         box.hook("getaddrinfo", "portal", out=answer)
         done = box.remvol("--search", "-i", "portal")
-        assert f"get ip address portal = {ip}, inet_type = {family}" in said(done.stdout)
+        assert f"get ip address portal = {ip}, inet_type = {family}" in messages(done)
         assert box.calls[-1].kind != "getaddrinfo"
         [asked] = [call.fields for call in box.calls if call.kind == "getaddrinfo"]
         assert asked == ["portal", "flags=0 family=0 type=1 protocol=0 service=none"]
@@ -289,13 +289,13 @@ class TestAddress:
     def test_the_last_of_several_addresses_counts(self, box):
         box.debug(1)
         done = box.remvol("--search", "-i", "10.0.0.1", "-i", "::1")
-        assert said(done.stdout)[-2] == "get ip address ::1 = [::1], inet_type = AF_INET6"
+        assert messages(done)[-2] == "get ip address ::1 = [::1], inet_type = AF_INET6"
 
     def test_one_that_does_not_resolve_fails(self, box):
         box.debug(1)
         box.hook("getaddrinfo", "nobody", ret=-2)
         done = box.remvol("--search", "-i", "nobody", "-p", "1")
-        assert messages(done.stdout)[-2:] == [
+        assert log_lines(done.stdout)[-2:] == [
             ("src.cpp", "_resovle_net_address_to_ip", "getaddrinfo return Name or service not known"),
             ("src.cpp", "main", "ip address nobody -> error")]
         assert "known\n\n(src.cpp:main" in done.stdout
@@ -303,14 +303,14 @@ class TestAddress:
 
     def test_an_empty_one_is_not_asked_for(self, box):
         done = box.remvol("--search", "-i", "")
-        assert said(done.stdout) == ["ip address  -> error"]
+        assert messages(done) == ["ip address  -> error"]
         assert box.trace("getaddrinfo") == []
 
     def test_one_of_another_family_fails(self, box):
         box.debug(1)
         box.hook("getaddrinfo", "odd", out="unix")
         done = box.remvol("--search", "-i", "odd")
-        assert messages(done.stdout)[-2] == ("src.cpp", "_resovle_net_address_to_ip", "get ip address failed")
+        assert log_lines(done.stdout)[-2] == ("src.cpp", "_resovle_net_address_to_ip", "get ip address failed")
         assert "get ip address failed\n\n" in done.stdout
         assert done.status == 255
 
@@ -318,15 +318,15 @@ class TestAddress:
         box.debug(1)
         box.hook("inet_ntop", "AF_INET", ret=0, errno=28)
         done = box.remvol("--search", "-i", "10.0.0.1")
-        assert messages(done.stdout)[-3] == ("src.cpp", "_resovle_net_address_to_ip", "inet_ntop failed")
-        assert said(done.stdout)[-2:] == ["get ip address 10.0.0.1 = , inet_type = AF_INET", "OPT_FLAG: 00000004"]
+        assert log_lines(done.stdout)[-3] == ("src.cpp", "_resovle_net_address_to_ip", "inet_ntop failed")
+        assert messages(done)[-2:] == ["get ip address 10.0.0.1 = , inet_type = AF_INET", "OPT_FLAG: 00000004"]
 
     def test_ipv6_that_cannot_be_written_fails(self, box):
         box.debug(1)
         box.hook("inet_ntop", "AF_INET6", ret=0, errno=28)
         done = box.remvol("--search", "-i", "::1")
         assert "OPT_FLAG: 00000004\nget address failed\n(src.cpp:_resovle_net_address_to_ip:" in done.stdout
-        assert said(done.stdout)[-2:] == ["inet_ntop failed", "ip address ::1 -> error"]
+        assert messages(done)[-2:] == ["inet_ntop failed", "ip address ::1 -> error"]
         assert done.status == 255
 
 
@@ -334,7 +334,7 @@ class TestDebugLevelOption:
     @pytest.mark.parametrize("given,stored", [("2", "2"), ("-1", "-1"), ("x", "0"), ("3x", "3"), ("", "0")])
     def test_it_is_stored_and_the_run_ends(self, box, given, stored):
         done = box.remvol("-d", given, "--status")
-        assert messages(done.stdout) == [("src.cpp", "main", f"ktreec_set /iscsi/initiator/dbg={stored}")]
+        assert log_lines(done.stdout) == [("src.cpp", "main", f"ktreec_set /iscsi/initiator/dbg={stored}")]
         assert done.stdout.count("\n") == 1
         assert done.status == 0
         assert box.tree.dump() == {"/iscsi/initiator/dbg": stored}
@@ -348,7 +348,7 @@ class TestDebugLevelOption:
     def test_a_refused_write_is_told_and_ends_well(self, box):
         box.hook("ktreec_set", "/iscsi/initiator/dbg", ret=-1)
         done = box.remvol("-d", "1")
-        assert messages(done.stdout) == [("src.cpp", "main", "ktreec_set /iscsi/initiator/dbg=1"),
+        assert log_lines(done.stdout) == [("src.cpp", "main", "ktreec_set /iscsi/initiator/dbg=1"),
                                          ("src.cpp", "main", "ktreec_set(/iscsi/initiator/dbg) failed ")]
         assert done.status == 0
 
@@ -381,7 +381,7 @@ class TestSuccessPath:
     def test_a_failed_handler_says_so_at_level_1(self, box):
         box.tree.set({"/iscsi/initiator/ver": "2", "/iscsi/initiator/dbg": "1"})
         done = box.remvol("--verupgrade")
-        assert messages(done.stdout)[-1] == ("src.cpp", "main", "task_version_upgrade() failed")
+        assert log_lines(done.stdout)[-1] == ("src.cpp", "main", "task_version_upgrade() failed")
         assert (done.status, box.tree.get("/result/verupgrade")) == (255, "-1")
         assert box.trace("dump", "system") == ["system winshare_reload"]
 
@@ -454,14 +454,14 @@ class TestSuccessOfChangingCommands:
         assert box.trace("dump") == []
         assert FLASH not in box.trace("system")
         text = {"modify_address": "task_modify() failed"}.get(command, f"task_{command}() failed")
-        assert messages(done.stdout)[-1] == ("src.cpp", "main", text)
+        assert log_lines(done.stdout)[-1] == ("src.cpp", "main", text)
         assert box.trace("set", "system")[-2:] == ["system winshare_reload", f"set /result/{command}=-1"]
 
     def test_a_failed_logout_of_everything_has_its_own_message(self, box):
         box.debug(1)
         box.fake("iscsiadm", status=21, first=True)
         done = box.remvol("--disconnect")
-        assert messages(done.stdout)[-1] == ("src.cpp", "main", "task_disconnect(all) failed")
+        assert log_lines(done.stdout)[-1] == ("src.cpp", "main", "task_disconnect(all) failed")
         assert done.status == 255
 
 
@@ -481,7 +481,7 @@ class TestFailureOfOtherCommands:
         for tool in ("iscsiadm", "killall", "rmmod"):
             box.fake(tool, status=1)
         done = box.remvol(f"--{command}", *args)
-        assert messages(done.stdout)[-1] == ("src.cpp", "main", text)
+        assert log_lines(done.stdout)[-1] == ("src.cpp", "main", text)
         assert (done.status, done.lines[-1]) == (255, "execute failed.")
         assert box.trace("dump") == []
         assert box.trace("set", "system")[-2:] == ["system winshare_reload", f"set /result/{command}=-1"]
@@ -526,7 +526,7 @@ class TestFieldSizes:
         box.unscripted_ok()
         done = box.remvol("--add", "-c", "1", f"-{option}", "v" * (most + 1))
         assert done.status == 255
-        assert said(done.stdout)[-1] == f"Command parameter check failed, -{option} takes at most {most} bytes"
+        assert messages(done)[-1] == f"Command parameter check failed, -{option} takes at most {most} bytes"
         assert box.tree.dump() == {"/result/add": "-1"}
 
     @pytest.mark.parametrize("option", ["U", "P"])

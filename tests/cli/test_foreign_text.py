@@ -1,7 +1,8 @@
 """Text from outside (options, a settings file, remote machines) reaches a shell only as text."""
 
 import pytest
-from appliance import Site, messages
+from appliance import Site
+from harness import messages
 from harness.world import COMMANDS
 
 TARGET = "iqn.t1"
@@ -24,6 +25,7 @@ def site(box):
     site = Site(box)
     for command in ("killall", "rmmod", "insmod", "iscsid", "ping", "dd", "mke2fs", "resize2fs", "umount"):
         box.default(command)
+    box.default("iscsiadm", "-m discovery", status=7)
     site.offer(TARGET, {0: "sdb"})
     site.disk("sdb")
     for name in ("sys_get_disk_space", "sys_get_partition_list", "sys_check_dev", "sys_get_fs_type",

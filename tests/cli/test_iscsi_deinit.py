@@ -3,7 +3,8 @@
 import signal
 
 import pytest
-from harness.initiator import RELOAD, T1, Initiator, store
+from harness import messages
+from harness.initiator import SHARES, T1, Initiator, store
 
 MODULES = ["iscsi_tcp.ko", "libiscsi_tcp.ko", "libiscsi.ko", "scsi_transport_iscsi.ko"]
 LOGOUT_ALL = "system iscsiadm -m node -u"
@@ -14,7 +15,7 @@ ROAD = {
     "--deinit": [
         LOGOUT_ALL,
         STOP_ISCSID,
-        f"system {RELOAD}",
+        f"system {SHARES}",
         *(f"system rmmod {module}" for module in MODULES),
         STOP_TREE,
     ],
@@ -24,9 +25,13 @@ ROAD = {
 
 @pytest.fixture
 def initiator(box):
+    """With a session: without one the logout of all fails."""
     box.default("killall")
     box.default("rmmod")
-    return Initiator(box)
+    initiator = Initiator(box)
+    initiator.offer(T1, {1: "sdb"})
+    initiator.log_in(T1)
+    return initiator
 
 
 def take_down(box, command, *args):
@@ -48,7 +53,7 @@ def test_the_steps_in_their_order(box, initiator, command):
 
 @pytest.mark.parametrize("command", ROAD)
 def test_every_volume_is_taken_away_before_the_logout(box, initiator, command):
-    store(box, 1, T1, luns=[{"lun": 1, "mnt": "/mnt/VV/share1", "mnt_dev": "/dev/sdb1"}])
+    store(box, T1, conn_set=1, luns=[("share1", 1, {"mnt": "/mnt/VV/share1", "mnt_dev": "/dev/sdb1"})])
     box.path("/mnt/VV/share1").mkdir(parents=True)
     box.default("fuser")
     assert take_down(box, command).status == 0
@@ -59,8 +64,6 @@ def test_every_volume_is_taken_away_before_the_logout(box, initiator, command):
 
 @pytest.mark.parametrize("command", ROAD)
 def test_all_sessions_are_closed(box, initiator, command):
-    initiator.target(T1, {1: "sdb"})
-    initiator.log_in(T1)
     assert take_down(box, command).status == 0
     assert initiator.sessions() == []
 
@@ -100,14 +103,14 @@ def test_the_log_tells_the_steps(box, initiator):
     done = take_down(box, "--deinit")
     steps = ["deinit start", "killall -SIGTERM iscsid ", "deinit end", "update share folder status",
              "finish share folder status"]
-    assert [line.split("): ", 1)[1] for line in done.lines if ":task_deinit:" in line] == steps
+    assert messages(done, "task_deinit") == steps
 
 
 def test_the_log_of_a_system_off(box, initiator):
     box.tree.set("/iscsi/initiator/dbg", "2")
     done = take_down(box, "--system_off")
     steps = ["system off", "killall -SIGTERM iscsid ", "deinit end"]
-    assert [line.split("): ", 1)[1] for line in done.lines if ":task_deinit:" in line] == steps
+    assert messages(done, "task_deinit") == steps
 
 
 @pytest.mark.parametrize("shell", ["dash", "bash"])

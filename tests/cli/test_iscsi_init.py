@@ -3,11 +3,12 @@
 import re
 
 import pytest
+from harness import messages
 from harness.initiator import (
     BASE,
-    CHECK,
-    DEVICES,
-    RELOAD,
+    SESSIONS,
+    DETAILS,
+    SHARES,
     T1,
     T2,
     T3,
@@ -31,6 +32,7 @@ node.session.err_timeo.abort_timeout = 15
 node.session.err_timeo.lu_reset_timeout = 20
 """
 ECHO_SETTINGS = 'echo -e "' + SETTINGS.replace("\n", r"\n") + '" > /etc/iscsi/iscsid.conf'
+LUN1 = [("share1", 1)]
 START_ISCSID = "iscsid -f >/dev/null 2>&1 &"
 NAME = "iqn.2013-03.org.example:nas-box:initiator-1b2c3d"
 START_TREE = [
@@ -175,7 +177,8 @@ def test_records_that_a_power_cut_left_empty_are_removed(box, initiator):
 
 
 def test_missing_modules_and_a_missing_iscsiadm_leave_a_clear_state(box, initiator):
-    store(box, 1, T1, luns=[{"lun": 1}])
+    box.tree.set("/iscsi/initiator/ver", "1")
+    store(box, T1, conn_set=1, luns=LUN1)
     box.fake("insmod", status=1, stderr="insmod: ERROR: could not load module\n")
     box.path("/fake/bin/iscsiadm").unlink()
     box.run(["rm", "-f", "/usr/bin/iscsiadm", "/sbin/iscsiadm", "/usr/sbin/iscsiadm"])
@@ -244,7 +247,7 @@ def test_the_steps_of_the_name_are_logged(box, initiator):
         ("Target_load_all", "end"),
         ("task_init", "end"),
     ]:
-        assert re.search(rf"^\(src\.cpp:{function}:\d+\): {re.escape(text)}$", done.stdout, re.M), text
+        assert text in messages(done, function)
 
 
 def test_a_port_without_hardware_address_gets_no_record(box, initiator):
@@ -304,14 +307,11 @@ def test_each_daemon_has_a_process_group_of_its_own_even_when_the_tool_leads_a_s
 
 # --- the stored targets ---
 
-LUN1 = [{"lun": 1}]
-
-
 def load(box, targets):
     """Stores the targets, a name and its values a slot, and runs --init."""
     box.tree.set("/iscsi/initiator/ver", "1")
     for slot, (name, values) in targets.items():
-        store(box, slot, name, **values)
+        store(box, name, slot=slot, **{"conn_set": 1, **values})
     return init(box)
 
 
@@ -328,9 +328,9 @@ def after_ifaces(box, *kinds):
 
 
 def test_a_good_an_off_and_a_refusing_target(box, initiator):
-    initiator.target(T1, {1: "sdb"})
-    initiator.target(T2, {1: "sdc"})
-    initiator.target(T3, {1: "sdd"}, refuse=24)
+    initiator.offer(T1, {1: "sdb"})
+    initiator.offer(T2, {1: "sdc"})
+    initiator.offer(T3, {1: "sdd"}, refuse=24)
     box.hook("sys_check_dev", ret=1)
     load(box, {1: (T1, {"luns": LUN1}), 2: (T2, {"conn_set": 0, "luns": LUN1}), 3: (T3, {"luns": LUN1})})
     assert state(box, 1) == ["1", "Connected", "1"]
@@ -340,23 +340,23 @@ def test_a_good_an_off_and_a_refusing_target(box, initiator):
     assert box.tree.get("/iscsi/initiator/id:1/lun/id:1/dev") == "sdb"
     assert box.tree.get("/iscsi/initiator/count") == "3"
     calls = after_ifaces(box)
-    first = [*system(*record_commands(T1)), f"popen {login_command(T1)}", *system(CHECK, CHECK, DEVICES), "sleep 1"]
+    first = [*system(*record_commands(T1)), f"popen {login_command(T1)}", *system(SESSIONS, SESSIONS, DETAILS), "sleep 1"]
     assert calls[: len(first)] == first
-    reload = calls.index(f"system {RELOAD}")
-    second = [*system(*record_commands(T2), CHECK)]
-    third = [*system(*record_commands(T3)), f"popen {login_command(T3)}", *system(CHECK, CHECK)]
-    assert calls[reload - len(second + third) : reload + 1] == second + third + [f"system {RELOAD}"]
-    assert calls.count(f"system {RELOAD}") == 1
+    reload = calls.index(f"system {SHARES}")
+    second = [*system(*record_commands(T2), SESSIONS)]
+    third = [*system(*record_commands(T3)), f"popen {login_command(T3)}", *system(SESSIONS, SESSIONS)]
+    assert calls[reload - len(second + third) : reload + 1] == second + third + [f"system {SHARES}"]
+    assert calls.count(f"system {SHARES}") == 1
 
 
 def test_nothing_mounted_reloads_no_share(box, initiator):
-    initiator.target(T1, refuse=24)
+    initiator.offer(T1, refuse=24)
     load(box, {1: (T1, {})})
-    assert RELOAD not in box.shell()
+    assert SHARES not in box.shell()
 
 
 def test_a_filled_slot_behind_an_empty_one_is_loaded(box, initiator):
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     box.hook("sys_check_dev", ret=1)
     load(box, {4: (T1, {"luns": LUN1})})
     assert state(box, 4) == ["1", "Connected", "1"]
@@ -365,14 +365,14 @@ def test_a_filled_slot_behind_an_empty_one_is_loaded(box, initiator):
 
 
 def test_the_same_name_in_two_slots_is_loaded_by_slot(box, initiator):
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     box.hook("sys_check_dev", ret=1)
     load(box, {1: (T1, {"conn_set": 0, "luns": LUN1}), 3: (T1, {"luns": LUN1})})
     assert box.tree.get("/iscsi/initiator/id:3/lun/id:1/dev") == "sdb"
 
 
 def test_the_connect_state_goes_over_connecting(box, initiator):
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     box.hook("sys_check_dev", ret=1)
     load(box, {1: (T1, {"luns": LUN1})})
     calls = after_ifaces(box, "set", "popen", "system")
@@ -381,26 +381,26 @@ def test_the_connect_state_goes_over_connecting(box, initiator):
 
 
 def test_a_session_without_disk_is_given_up(box, initiator):
-    initiator.target(T1, {0: None, 1: ("sdb", "blocked")})
-    load(box, {1: (T1, {"luns": [{"lun": 1}, {"lun": 2}]})})
+    initiator.offer(T1, {0: None, 1: ("sdb", "blocked")})
+    load(box, {1: (T1, {"luns": [*LUN1, ("share2", 2)]})})
     assert state(box, 1) == ["0", "Disconnected", "0"]
     assert [box.tree.get(f"/iscsi/initiator/id:1/lun/id:{m}/volume_state") for m in (1, 2)] == ["4", "4"]
     assert initiator.sessions() == []
     assert after_ifaces(box) == [
         *system(*record_commands(T1)),
         f"popen {login_command(T1)}",
-        *system(CHECK, CHECK, DEVICES, logout_command(T1), CHECK),
+        *system(SESSIONS, SESSIONS, DETAILS, logout_command(T1), SESSIONS),
     ]
 
 
 def test_why_a_session_was_given_up_is_logged(box, initiator):
     box.tree.set("/iscsi/initiator/dbg", "1")
-    initiator.target(T1, {1: None})
+    initiator.offer(T1, {1: None})
     done = load(box, {1: (T1, {"luns": LUN1})})
     assert f"): Can not find Device for Target: {T1} on iscsiadm -m session\n" in done.stdout
     # Written although, and only when, the logout worked.
     assert f"): Logout Fail on Target: {T1} \n" in done.stdout
-    initiator.target(T1, {1: None})
+    initiator.offer(T1, {1: None})
     box.fake("iscsiadm", "-m session -P3", stdout="Target: iqn.other\n")
     box.fake("iscsiadm", re.compile("--logout"), status=10)
     box.tree.set("/iscsi/initiator/id:1/conn_set", "1")
@@ -411,7 +411,7 @@ def test_why_a_session_was_given_up_is_logged(box, initiator):
 
 
 def test_a_device_name_that_cannot_be_stored_gives_the_session_up(box, initiator):
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     box.hook("ktreec_set", "/iscsi/initiator/id:1/lun/id:1/dev", value="sdb", ret=-1)
     done = load(box, {1: (T1, {"luns": LUN1})})
     assert "): ktree failed\n" in done.stdout
@@ -419,18 +419,18 @@ def test_a_device_name_that_cannot_be_stored_gives_the_session_up(box, initiator
 
 
 def test_a_failing_listing_gives_the_session_up_without_a_reason(box, initiator):
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     box.tree.set("/iscsi/initiator/dbg", "1")
     box.fake("iscsiadm", "-m session -P3", status=4)
     done = load(box, {1: (T1, {"luns": LUN1})})
-    assert f"system() of cmd '{DEVICES}' failed" in done.stdout
+    assert f"system() of cmd '{DETAILS}' failed" in done.stdout
     assert "Can not find Device" not in done.stdout and "ktree failed" not in done.stdout
     assert state(box, 1) == ["0", "Disconnected", "0"]
 
 
 def test_all_eight_slots_are_visited(box, initiator):
     for slot in range(1, 9):
-        initiator.target(f"{BASE}n{slot}", {1: f"sd{'abcdefgh'[slot - 1]}"})
+        initiator.offer(f"{BASE}n{slot}", {1: f"sd{'abcdefgh'[slot - 1]}"})
     box.hook("sys_check_dev", ret=1)
     load(box, {slot: (f"{BASE}n{slot}", {"luns": LUN1}) for slot in range(1, 9)})
     assert [state(box, slot)[1] for slot in range(1, 9)] == ["Connected"] * 8
@@ -438,17 +438,17 @@ def test_all_eight_slots_are_visited(box, initiator):
 
 
 def test_init_again_on_a_running_appliance(box, initiator):
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     box.hook("sys_check_dev", ret=1)
     load(box, {1: (T1, {"luns": LUN1})})
-    initiator.target(T1, {1: "sdb"}, refuse=15)  # 2.1.8 refuses a second login; the session is there
+    initiator.offer(T1, {1: "sdb"}, refuse=15)  # 2.1.8 refuses a second login; the session is there
     init(box)
     assert state(box, 1) == ["1", "Connected", "1"]
     assert logout_command(T1) not in box.shell()
 
 
 def test_sessions_that_the_new_daemon_takes_over_are_waited_for(box, initiator):
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     box.hook("sys_check_dev", ret=1)
     box.hook("sys_mount_point", "/mnt/VV/share1", ret=1)
     lost = block(T1, {1: ("sdb", "blocked")}, state="FAILED")
@@ -462,7 +462,7 @@ def test_sessions_that_the_new_daemon_takes_over_are_waited_for(box, initiator):
 
 
 def test_sessions_that_do_not_come_back_are_given_up_after_thirty_seconds(box, initiator):
-    initiator.target(T1, {1: ("sdb", "blocked")}, state="FAILED")
+    initiator.offer(T1, {1: ("sdb", "blocked")}, state="FAILED")
     box.hook("sys_mount_point", "/mnt/VV/share1", ret=1)
     load(box, {1: (T1, {"luns": LUN1})})
     assert state(box, 1) == ["0", "Disconnected", "0"]

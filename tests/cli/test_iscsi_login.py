@@ -3,10 +3,11 @@
 import re
 
 import pytest
+from harness import log_lines, messages
 from harness.initiator import (
-    CHECK,
-    DEVICES,
-    RELOAD,
+    SESSIONS,
+    DETAILS,
+    SHARES,
     T1,
     Initiator,
     login_command,
@@ -17,6 +18,7 @@ from harness.initiator import (
 )
 
 ROOT = "/iscsi/initiator/id:1"
+LUN1 = [("share1", 1)]
 EXISTS = "iscsiadm: initiator reported error (15 - already exists)\n"
 LOGOUT_AT_PORTAL = f'iscsiadm -m node -T "{T1}" -p 10.9.0.2:3260 --logout'
 LOGIN_AGAIN = f'iscsiadm -m node -T "{T1}" -p 10.9.0.2:3260 -I default --login'
@@ -25,13 +27,13 @@ LOGIN_AGAIN = f'iscsiadm -m node -T "{T1}" -p 10.9.0.2:3260 -I default --login'
 @pytest.fixture
 def initiator(box):
     initiator = Initiator(box)
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     return initiator
 
 
 def connect(box, status=0, **values):
     """Connects the stored target; its disk cannot be used, so nothing is mounted."""
-    store(box, 1, T1, luns=[{"lun": 1}], **values)
+    store(box, T1, conn_set=1, luns=LUN1, **values)
     box.hook("sys_check_dev", ret=1)
     box.forget()
     done = box.remvol("--connect", "-n", T1)
@@ -78,8 +80,8 @@ def test_the_whole_road_of_a_connect(box, initiator):
     calls = box.trace("system", "popen", "sleep", "set")
     login = calls.index(f"popen {login_command(T1)}")
     assert calls[login - 1] == f"set {ROOT}/conn_state=2"
-    assert calls[login + 1 : login + 3] == [f"system {CHECK}"] * 2
-    assert f"system {DEVICES}" in calls[login:]
+    assert calls[login + 1 : login + 3] == [f"system {SESSIONS}"] * 2
+    assert f"system {DETAILS}" in calls[login:]
 
 
 # A login is judged by the listing: no exit status counts.
@@ -103,8 +105,9 @@ def test_a_login_that_reports_success_without_a_session_failed(box, initiator):
 
 
 def test_at_start_up_the_message_of_a_failed_login_names_no_target(box, initiator):
-    initiator.target(T1, refuse=24)
-    store(box, 1, T1)
+    initiator.offer(T1, refuse=24)
+    box.tree.set("/iscsi/initiator/ver", "1")
+    store(box, T1, conn_set=1)
     for command in ("killall", "rmmod", "insmod", "iscsid"):
         box.default(command)
     done = box.remvol("--init")
@@ -116,7 +119,7 @@ def test_a_session_that_goes_before_the_second_look_is_no_connection(box, initia
     box.fake("iscsiadm", "-m session", exact=True, stdout=session(T1), skip=1, times=1)
     box.fake("iscsiadm", "-m session", exact=True, status=21)
     done = connect(box, status=255)
-    assert re.search(r"\(src\.cpp:Target_Connect:\d+\): Can not find target", done.stdout)
+    assert any(text.startswith("Can not find target") for text in messages(done, "Target_Connect"))
 
 
 def test_a_stale_session_of_the_older_system_is_replaced(box, initiator):
@@ -128,7 +131,7 @@ def test_a_stale_session_of_the_older_system_is_replaced(box, initiator):
 
 
 def test_the_end_of_the_first_login_is_waited_for(box, initiator):
-    late = f"echo '{EXISTS.strip()}'; sleep 0.3; cp /fake/targets/* /fake/sessions/"
+    late = f"echo '{EXISTS.strip()}'; sleep 0.3; touch /fake/initiator/on/{T1}"
     box.fake("iscsiadm", re.compile("--login$"), effect=late, times=1)
     box.fake("iscsiadm", re.compile("--log(in|out)$"))
     connect(box)
@@ -176,7 +179,7 @@ def test_a_login_that_cannot_be_started_failed(box, initiator):
 
 
 def test_an_unreachable_portal_is_a_connect_error(box, initiator):
-    initiator.target(T1, refuse=8)
+    initiator.offer(T1, refuse=8)
     connect(box, status=255)
     assert box.tree.get("/result/connect") == "-1"
     assert box.tree.get(f"{ROOT}/conn_state") == "4"
@@ -186,7 +189,7 @@ def test_a_missing_iscsiadm_is_a_connect_error(box, initiator):
     box.path("/fake/bin/iscsiadm").unlink()
     box.run(["rm", "-f", "/usr/bin/iscsiadm", "/usr/sbin/iscsiadm"])
     done = connect(box, status=255)
-    assert f"system() of cmd '{CHECK}' failed" in done.stdout
+    assert f"system() of cmd '{SESSIONS}' failed" in done.stdout
     assert box.tree.get(f"{ROOT}/conn_state") == "4"
 
 
@@ -199,8 +202,8 @@ def test_a_name_of_255_characters_fits_every_command(box):
     name = "iqn.2026-01.org.example:" + "n" * 231
     assert len(name) == 255
     initiator = Initiator(box)
-    initiator.target(name, {1: "sdb"})
-    store(box, 1, name, luns=[{"lun": 1}])
+    initiator.offer(name, {1: "sdb"})
+    store(box, name, conn_set=1, luns=LUN1)
     box.hook("sys_check_dev", ret=1)
     done = box.remvol("--connect", "-n", name)
     assert done.status == 0
@@ -214,7 +217,7 @@ def test_a_name_of_255_characters_fits_every_command(box):
 def choose(box, address, *, bonding=None, links=(), answering=()):
     """Connects to a portal; gives the interface of its node record and the pings."""
     initiator = Initiator(box)
-    initiator.target(T1, {1: "sdb"})
+    initiator.offer(T1, {1: "sdb"})
     if bonding is not None:
         box.tree.set("/network_mgr/bonding/enable", bonding)
     for port in (0, 1):
@@ -272,7 +275,7 @@ def test_the_choice_is_made_once_a_run_and_logged(box):
     box.tree.set("/iscsi/initiator/dbg", "2")
     _, pings, done = choose(box, "[fe80::1]", bonding="0", links=(0,), answering=["egiga0"])
     assert pings == [ping("egiga0")]
-    texts = [line.split("): ", 1)[1] for line in done.lines if "get_iface_name:" in line]
+    texts = [text for _, function, text in log_lines(done.stdout) if function.endswith("get_iface_name")]
     assert texts[:6] == [
         "_get_iface_name get iface name , 32 ,[fe80::1]",
         "ping_ip [fe80::1] from egiga0",
@@ -287,7 +290,7 @@ def test_the_choice_is_made_once_a_run_and_logged(box):
 
 
 def disconnect(box, **values):
-    store(box, 1, T1, luns=[{"lun": 1, "dev": "sdb"}], **values)
+    store(box, T1, conn_set=1, luns=[("share1", 1, {"dev": "sdb"})], **values)
     box.forget()
     return box.remvol("--disconnect", "-n", T1)
 
@@ -296,20 +299,20 @@ def test_the_steps_of_a_disconnect(box, initiator):
     initiator.log_in(T1)
     box.default("fuser")
     other = "iqn.other"
-    initiator.target(other, {1: "sdz"})
+    initiator.offer(other, {1: "sdz"})
     initiator.log_in(other)
     done = disconnect(box)
     assert done.status == 0
     calls = box.trace("system", "set")
-    reload = calls.index(f"system {RELOAD}")
+    reload = calls.index(f"system {SHARES}")
     assert calls[reload : reload + 7] == [
-        f"system {RELOAD}",
+        f"system {SHARES}",
         f"system {logout_command(T1)}",
         f"set {ROOT}/conn_state=0",
         f"set {ROOT}/conn_set=0",
-        f"system {DEVICES}",
+        f"system {DETAILS}",
         f"set {ROOT}/lun/id:1/dev=",
-        f"system {CHECK}",
+        f"system {SESSIONS}",
     ]
     assert box.tree.get(f"{ROOT}/conn_set") == "0"
     assert box.tree.get(f"{ROOT}/status") == "Disconnected"
@@ -335,13 +338,13 @@ def test_the_steps_of_a_disconnect_are_logged(box, initiator):
     initiator.log_in(T1)
     box.default("fuser")
     done = disconnect(box)
-    texts = [line.split("): ", 1)[1] for line in done.lines if ":Target_Disconnect:" in line]
+    texts = messages(done, "Target_Disconnect")
     assert texts == ["start", "update share folder status", "finish share folder status", "logout start",
                      "logout end ", "end"]
 
 
 def test_a_connect_without_a_disk_logs_out_and_stays_so(box, initiator):
-    initiator.target(T1, {0: None})
+    initiator.offer(T1, {0: None})
     connect(box, status=255)
     assert logout_command(T1) in box.shell()
     assert box.tree.get(f"{ROOT}/conn_set") == "0"

@@ -3,9 +3,10 @@
 import re
 
 import pytest
+from harness import messages
 from harness.initiator import (
     BASE,
-    CHECK,
+    SESSIONS,
     T1,
     Initiator,
     login_command,
@@ -93,8 +94,7 @@ def test_lines_without_a_name_are_counted_alone(box, results):
     box.tree.set("/iscsi/initiator/dbg", "3")
     box.fake("iscsiadm", "-m discovery", stdout="10.9.0.2:3260,1\n" + lines("iqn.x:a") + "10.9.0.2:3260,1\n")
     done = search(box)
-    steps = re.findall(r"\(src\.cpp:task_search:\d+\): (.*)", done.stdout)
-    assert steps == [
+    assert messages(done, "task_search") == [
         "start",
         "ip: 10.9.0.2, port: 3260",
         "line 1: ",
@@ -109,7 +109,7 @@ def test_lines_without_a_name_are_counted_alone(box, results):
 def test_what_a_search_says_without_asking(box, results):
     box.fake("iscsiadm", "-m discovery", stdout=lines("iqn.x:a"))
     done = search(box)
-    assert re.findall(r"\): (.*)", done.stdout) == [
+    assert messages(done) == [
         "ip: 10.9.0.2, port: 3260",
         "vector size: 1",
         "ktreec_del() failed, path: '/temp/vv_search'",
@@ -273,7 +273,7 @@ def test_an_unreadable_output_still_ends_the_private_tree(box):
 @pytest.fixture
 def initiator(box):
     initiator = Initiator(box)
-    initiator.target(T1, {0: None, 1: "sdb", 2: "sdc"})
+    initiator.offer(T1, {0: None, 1: "sdb", 2: "sdc"})
     for device in ("sdb", "sdc"):
         box.hook("sys_get_disk_space", f"/dev/{device}", ret=SIZE)
     return initiator
@@ -312,11 +312,11 @@ def test_the_whole_road_of_a_search(box, initiator, results):
     wait, get = (f"iscsiadm -m session -P 3 >/tmp/remvol_session_{user}_lun_N.tmp 2>&1" for user in ("wait", "get"))
     calls = [re.sub(r"_lun_\d+", "_lun_N", call) for call in box.trace()]
     assert calls == [
-        f"system {CHECK}",
+        f"system {SESSIONS}",
         *(f"system {command}" for command in record_commands(T1)),
         f"popen {login_command(T1)}",
-        f"system {CHECK}",
-        f"system {CHECK}",
+        f"system {SESSIONS}",
+        f"system {SESSIONS}",
         "usleep 100000",
         f"system {wait}",
         f"system {get}",
@@ -326,7 +326,7 @@ def test_the_whole_road_of_a_search(box, initiator, results):
 
 def test_a_target_that_is_logged_in_stays_so(box, initiator, results):
     initiator.log_in(T1)
-    store(box, 1, T1, luns=[{"lun": 2}])
+    store(box, T1, conn_set=1, luns=[("share2", 2)])
     search_lun(box)
     assert node_commands(box) == []
     assert initiator.sessions() == [T1]
@@ -340,7 +340,7 @@ def test_the_requests_secret_goes_into_the_record(box, initiator, results):
 
 @pytest.mark.parametrize("refuse", [8, 24])
 def test_a_refused_login_is_error_100(box, initiator, results, refuse):
-    initiator.target(T1, {1: "sdb"}, refuse=refuse)
+    initiator.offer(T1, {1: "sdb"}, refuse=refuse)
     done = search_lun(box, status=255)
     assert f"): Target_Connect {T1} failed\n" in done.stdout
     assert f"): Can not find target {T1} in session\n, connect failed.\n" in done.stdout
@@ -365,7 +365,7 @@ def test_a_failing_check_ends_the_search_without_a_code(box, initiator, results)
 
 
 def test_no_usable_lun_is_an_empty_result_and_logs_out(box, initiator, results):
-    initiator.target(T1, {0: None})
+    initiator.offer(T1, {0: None})
     search_lun(box)
     assert luns(results) == {"target_name": T1, "lun/count": "0", "err_code": "0"}
     assert initiator.sessions() == []
@@ -374,7 +374,7 @@ def test_no_usable_lun_is_an_empty_result_and_logs_out(box, initiator, results):
 @pytest.mark.parametrize("good_listings", [0, 1])
 def test_a_failing_listing_still_logs_out(box, initiator, results, good_listings):
     if good_listings:
-        box.fake("iscsiadm", "-m session -P 3", effect="cat /fake/targets/*", times=1)
+        box.fake("iscsiadm", "-m session -P 3", effect="cat /fake/initiator/details/*", times=1)
     box.fake("iscsiadm", "-m session -P 3", status=4)
     done = search_lun(box, status=255)
     assert "): get session lun list failed\n" in done.stdout
@@ -402,7 +402,7 @@ def test_with_an_output_file_a_private_tree_holds_the_luns(box, initiator):
 
 def test_a_failed_search_is_dumped_as_well(box, initiator):
     private_tree(box, "search_lun")
-    initiator.target(T1, {}, refuse=24)
+    initiator.offer(T1, {}, refuse=24)
     search_lun(box, "-o", "/tmp/out.xml", status=255)
     load(box, "/tmp/out.xml")
     assert box.tree.dump() == {"/temp/vv_search_lun/err_code": "100"}
@@ -411,13 +411,13 @@ def test_a_failed_search_is_dumped_as_well(box, initiator):
 def test_the_end_of_a_search_is_logged(box, initiator, results):
     box.tree.set("/iscsi/initiator/dbg", "2")
     done = search_lun(box)
-    texts = re.findall(r"\(src\.cpp:task_search_lun:\d+\): (.*)", done.stdout)
+    texts = messages(done, "task_search_lun")
     assert texts == ["start", "end, ret = 0"]
 
 
 def test_a_name_of_255_characters(box, initiator, results):
     name = BASE + "n" * (255 - len(BASE))
-    initiator.target(name, {1: "sdb"})
+    initiator.offer(name, {1: "sdb"})
     search_lun(box, name=name)
     assert luns(results)["target_name"] == name
     assert luns(results)["lun/count"] == "1"

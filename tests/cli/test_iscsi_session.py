@@ -5,8 +5,8 @@ import re
 import pytest
 from harness.initiator import (
     BASE,
-    CHECK,
-    DEVICES,
+    SESSIONS,
+    DETAILS,
     HEADER,
     T1,
     T2,
@@ -27,10 +27,9 @@ def show(box, plain=None, detailed=None, status=0):
         box.fake("iscsiadm", words, stdout=detailed or "", status=status)
 
 
-def status(box, luns=({"lun": 1}, {"lun": 2}), name=T1, level=None, **values):
+def status(box, luns=(("share1", 1), ("share2", 2)), name=T1, level=None, **values):
     """Runs --status over one stored target."""
-    store(box, 1, name, luns=luns, **values)
-    box.tree.set("/iscsi/initiator/count", "1")
+    store(box, name, conn_set=1, luns=luns, **values)
     if level is not None:
         box.tree.set("/iscsi/initiator/dbg", level)
     box.hook("sys_get_fs_type", ret=-1)
@@ -79,7 +78,7 @@ def test_no_session_at_all_is_no_failure(box):
 def test_the_listing_of_the_check_is_removed_once_it_is_read(box):
     show(box, plain=session(T1), detailed=HEADER)
     status(box)
-    assert CHECK in box.shell()
+    assert SESSIONS in box.shell()
     assert not box.path(CHECK_FILE).exists()
     assert box.path(DEVICE_FILE).read_text() == HEADER
 
@@ -93,12 +92,11 @@ def test_a_listing_that_disappears_means_not_connected(box):
 
 def test_temporary_files_are_named_after_the_program(box):
     show(box, plain=session(T1), detailed=HEADER)
-    store(box, 1, T1)
-    box.tree.set("/iscsi/initiator/count", "1")
+    store(box, T1, conn_set=1)
     box.run(["ln", "-s", str(box.build / "bin/remvol"), "/tmp/other-name"])
     assert box.run(["/tmp/other-name", "--status"]).status == 0
-    assert CHECK.replace("remvol_", "other-name_") in box.shell()
-    assert DEVICES.replace("remvol", "other-name") in box.shell()
+    assert SESSIONS.replace("remvol_", "other-name_") in box.shell()
+    assert DETAILS.replace("remvol", "other-name") in box.shell()
 
 
 @pytest.mark.parametrize("name", [CHECK_FILE, DEVICE_FILE])
@@ -124,9 +122,9 @@ def test_a_planted_file_of_another_user_does_not_stop_the_tool(box):
 def test_a_failing_listing_is_logged_with_its_status(box, code):
     show(box, status=code)
     box.tree.set({f"{ROOT}/conn_state": "1", f"{ROOT}/status": "Connected"})
-    done = status(box, luns=[{"lun": 1, "dev": "sdb"}], level="2")
+    done = status(box, luns=[("share1", 1, {"dev": "sdb"})], level="2")
     assert done.status == 0
-    assert re.search(rf"\(src\.cpp:ktree_update_dev:\d+\): system\(\) of cmd '{DEVICES}' failed", done.stdout)
+    assert re.search(rf"\(src\.cpp:ktree_update_dev:\d+\): system\(\) of cmd '{DETAILS}' failed", done.stdout)
     text = f"): !!!ret={code << 8}, WIFEXITED=1, WEXITSTATUS={code}\n"
     assert re.search(r"\(src\.cpp:ktree_update_dev:\d+" + re.escape(text), done.stdout)
     assert "iscsiadm -m session failed. Skip this target." in done.stdout
@@ -134,7 +132,7 @@ def test_a_failing_listing_is_logged_with_its_status(box, code):
 
 
 def test_a_killed_listing_did_not_exit(box):
-    box.hook("system", DEVICES, ret=9)
+    box.hook("system", DETAILS, ret=9)
     done = status(box, level="2")
     assert "!!!ret=9, WIFEXITED=0, WEXITSTATUS=0" in done.stdout
 
@@ -143,8 +141,8 @@ def test_a_missing_iscsiadm_leaves_everything_as_it_was(box):
     box.path("/fake/bin/iscsiadm").unlink()
     box.run(["rm", "-f", "/usr/bin/iscsiadm", "/usr/sbin/iscsiadm"])
     box.tree.set({f"{ROOT}/conn_state": "1", f"{ROOT}/status": "Connected"})
-    done = status(box, luns=[{"lun": 1, "dev": "sdb"}])
-    assert f"system() of cmd '{DEVICES}' failed" in done.stdout
+    done = status(box, luns=[("share1", 1, {"dev": "sdb"})])
+    assert f"system() of cmd '{DETAILS}' failed" in done.stdout
     assert devices(box)[0] == "sdb"
     assert box.tree.get(f"{ROOT}/status") == "Connected"
 
@@ -180,7 +178,7 @@ def test_a_controller_without_disk_hides_no_lun_and_borrows_no_disk(box):
 
 def test_old_device_names_are_cleared_first(box):
     show(box, plain=session(T1), detailed=HEADER + block(T1, {2: "sdc"}))
-    status(box, luns=[{"lun": 1, "dev": "sdq"}, {"lun": 2, "dev": "sdr"}])
+    status(box, luns=[("share1", 1, {"dev": "sdq"}), ("share2", 2, {"dev": "sdr"})])
     assert devices(box) == ["", "sdc"]
     writes = [call for call in box.trace("set") if call.startswith(f"set {ROOT}/lun/id") and "/dev=" in call]
     assert writes == [f"set {ROOT}/lun/id:1/dev=", f"set {ROOT}/lun/id:2/dev=", f"set {ROOT}/lun/id:2/dev=sdc"]
@@ -189,20 +187,20 @@ def test_old_device_names_are_cleared_first(box):
 def test_clearing_stops_at_the_first_empty_slot(box):
     show(box, plain=session(T1), detailed=HEADER + block(T1, {}))
     box.tree.set({f"{ROOT}/lun/id:3/lun": "7", f"{ROOT}/lun/id:3/share": "c", f"{ROOT}/lun/id:3/dev": "sdq"})
-    status(box, luns=[{"lun": 1, "dev": "sdb"}])
+    status(box, luns=[("share1", 1, {"dev": "sdb"})])
     assert devices(box)[0] == ""
     assert box.tree.get(f"{ROOT}/lun/id:3/dev") == "sdq"
 
 
 def test_without_any_session_no_device_name_is_cleared(box):
     show(box, status=21)
-    status(box, luns=[{"lun": 1, "dev": "sdb"}])
+    status(box, luns=[("share1", 1, {"dev": "sdb"})])
     assert devices(box)[0] == "sdb"
 
 
 def test_with_another_targets_session_alone_the_names_are_cleared(box):
     show(box, plain=session(T2), detailed=HEADER + block(T2, {1: "sdc"}))
-    status(box, luns=[{"lun": 1, "dev": "sdb"}])
+    status(box, luns=[("share1", 1, {"dev": "sdb"})])
     assert devices(box)[0] == ""
 
 

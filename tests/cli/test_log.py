@@ -5,11 +5,11 @@ import signal
 
 import pytest
 
-from harness import messages, said
+from harness import log_lines, messages
 
 
 def texts_of_an_upgrade(box):
-    return said(box.remvol("--verupgrade").stdout)
+    return messages(box.remvol("--verupgrade"))
 
 
 LEVEL_1 = "Start remvol settings upgrade"
@@ -32,7 +32,7 @@ class TestLevel:
     def test_without_a_key_errors_alone_show(self, box):
         box.hook("getaddrinfo", "nobody", ret=-2)
         done = box.remvol("--search", "-i", "nobody")
-        assert said(done.stdout) == ["ip address nobody -> error"]
+        assert messages(done) == ["ip address nobody -> error"]
 
     def test_a_negative_level_silences_errors(self, box):
         box.debug(-1)
@@ -59,7 +59,7 @@ class TestLine:
     def test_it_names_file_function_and_line(self, box):
         box.debug(1)
         done = box.remvol("--verupgrade")
-        logged = messages(done.stdout)
+        logged = log_lines(done.stdout)
         assert ("src.cpp", "main", "arg[1]: '--verupgrade'") in logged
         assert ("remvol_ver_upgrade.cpp", "version_upgrade", LEVEL_1) in logged
         assert re.search(r"^\(src\.cpp:main:[1-9][0-9]*\): arg\[0\]: 'remvol'$", done.stdout, re.M)
@@ -69,7 +69,7 @@ class TestLine:
         box.fake("winshare_reload", stdout="reloading\n")
         done = box.remvol("--search")
         assert done.lines[-3:] == [done.lines[-3], "reloading", "execute failed."]
-        assert said(done.lines[-3]) == ["OPT_FLAG: 00000000"]
+        assert messages(done.lines[-3]) == ["OPT_FLAG: 00000000"]
 
     def test_output_survives_a_crash_behind_a_hidden_message(self, box):
         box.hook("getaddrinfo", "10.0.0.1", kill=signal.SIGKILL)

@@ -5,7 +5,9 @@ import time
 
 import pytest
 
-from appliance import INITIATOR, SLOTS_MOVE, messages
+from appliance import SLOTS_MOVE
+from harness import messages
+from harness.initiator import INITIATOR
 
 LOGIN = re.compile("^iscsiadm -m node -T iqn.t1 .*--login$")
 MOUNT = re.compile("^mount -t ext4 ")
@@ -118,7 +120,7 @@ class TestStandingBehindAState:
     def test_a_connection_that_failed_is_put_right_behind_the_counted_targets(self, site, box):
         site.store("iqn.t0", luns=[("a", 0)])
         assert box.remvol(*TestAdding.ADD).status == 255  # the share is in use: the target stays, uncounted
-        site.fail_login("iqn.t1")
+        site.refuse("iqn.t1")
         assert box.remvol("--connect", "-n", "iqn.t1").status == 255
         assert site.target("status", 2) == "Connecting"
         status(box)

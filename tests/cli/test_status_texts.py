@@ -2,41 +2,26 @@
 
 import pytest
 
-TARGET = "iqn.2026-01.org.example:t1"
+from harness import log_lines
+from harness.initiator import T1, T2, Initiator
+from harness.initiator import store as store_target
+
 ROOT = "/iscsi/initiator/id:1"
 LUN = ROOT + "/lun/id:1"
 
-HEADER = """iSCSI Transport Class version 2.0-870
-version 2.1.8
-Target: {name} (non-flash)
-\tCurrent Portal: 10.9.0.2:3260,1
-\tPersistent Portal: 10.9.0.2:3260,1
-\t\tiSCSI Connection State: LOGGED IN
-\t\tiSCSI Session State: LOGGED_IN
-\t\tHost Number: 2\tState: running
-\t\tscsi2 Channel 00 Id 0 Lun: 0
-"""
-DISK = "\t\t\tAttached scsi disk sdb\t\tState: running\n"
 
-
-def store(box, **values):
-    """Stores one target with one LUN; values override the LUN's and the target's keys."""
-    target = {"target": TARGET, "ip": "10.9.0.2", "port": "3260", "chap": "0", "conn_set": "1"}
-    lun = {"lun": "0", "share": "data", "enable": "1", "vol_access_right": "1", "mnt_dev": "/dev/sdb1"}
-    for key, value in values.items():
-        (target if key in ("conn_set", "conn_state") else lun)[key] = value
-    tree = {f"{ROOT}/{key}": value for key, value in target.items()}
-    tree.update({f"{LUN}/{key}": value for key, value in lun.items() if value is not None})
-    tree["/iscsi/initiator/count"] = "1"
-    box.tree.set(tree)
+def store(box, *, conn_set="1", conn_state=None, **lun):
+    """Stores one target with one LUN that has a device; a LUN's key that is None is left out."""
+    lun = {"mnt_dev": "/dev/sdb1", **lun}
+    store_target(box, T1, conn_set=conn_set, conn_state=conn_state, luns=[("data", 0, lun)])
 
 
 def sessions(box, connected=True, disk=True):
     """What iscsiadm shows: the target with or without a disk, or another one's session."""
-    name = TARGET if connected else "iqn.2026-01.org.example:other"
-    listing = HEADER.format(name=name) + (DISK if disk else "")
-    box.fake("iscsiadm", "-m session -P3", stdout=listing)
-    box.fake("iscsiadm", "-m session", exact=True, stdout=f"tcp: [1] 10.9.0.2:3260,1 {name} (non-flash)\n")
+    initiator = Initiator(box)
+    name = T1 if connected else T2
+    initiator.offer(name, {0: "sdb" if disk else None})
+    initiator.log_in(name)
 
 
 def mount_volume(box):
@@ -163,7 +148,7 @@ TARGETS = [
 
 @pytest.mark.parametrize("conn_set,state,connected,text,after", TARGETS)
 def test_the_text_of_a_target(box, conn_set, state, connected, text, after):
-    store(box, conn_set=conn_set, **({"conn_state": state} if state else {}))
+    store(box, conn_set=conn_set, conn_state=state)
     sessions(box, connected=connected)
     status(box)
     assert box.tree.get(f"{ROOT}/status") == text
@@ -209,6 +194,4 @@ def test_the_log_of_a_status_run(box):
         ("ktree_update_lun_status", f"ktreec_set {LUN}/size=0/0"),
         ("ktree_update_lun_status", "update status end"),
     ]:
-        assert any(
-            line.startswith(f"(src.cpp:{function}:") and line.endswith(f"): {text}") for line in done.lines
-        ), text
+        assert ("src.cpp", function, text) in log_lines(done.stdout)

@@ -2,7 +2,9 @@
 
 import pytest
 
-from appliance import DETAILS, SESSIONS, SHARES, assert_order, messages, settings
+from appliance import assert_order, settings
+from harness import messages
+from harness.initiator import DETAILS, SESSIONS, SHARES
 
 OPTIONS = {"-n": "iqn.t1", "-l": "0", "-i": "10.9.0.2", "-p": "3260", "-s": "data"}
 RECORD = 'iscsiadm -m node -I default -T iqn.t1 -p 10.9.0.2:3260 -o'

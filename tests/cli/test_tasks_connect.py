@@ -2,7 +2,9 @@
 
 import pytest
 
-from appliance import DETAILS, SHARES, assert_order, messages, settings
+from appliance import assert_order, settings
+from harness import messages
+from harness.initiator import DETAILS, SHARES
 
 RECORD = "iscsiadm -m node -I default -T iqn.t1 -p 10.9.0.2:3260 -o"
 LOGIN = "iscsiadm -m node -T iqn.t1 -p 10.9.0.2:3260 -I default --login"
@@ -154,7 +156,7 @@ class TestConnect:
         assert box.shell() == ["winshare_reload"]
 
     def test_a_failed_login(self, stored, box):
-        stored.fail_login("iqn.t1")
+        stored.refuse("iqn.t1")
         done = connect(box)
         assert done.status == 255
         assert "Target_Connect failed , target name = iqn.t1" in messages(done)

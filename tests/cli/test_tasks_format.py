@@ -2,7 +2,9 @@
 
 import pytest
 
-from appliance import DETAILS, SHARES, SLOTS_MOVE, assert_order, messages, settings
+from appliance import SLOTS_MOVE, assert_order, settings
+from harness import messages
+from harness.initiator import DETAILS, SHARES
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
 LOGIN = "iscsiadm -m node -T iqn.t1 -p 10.9.0.2:3260 -I default --login"
@@ -230,7 +232,7 @@ class TestModify:
         assert [disconnected.target(key) for key in ("chap", "chap_name", "chap_pwd")] == ["1", "old", "old secret"]
 
     def test_a_reconnection_that_fails_is_not_a_failure(self, volume, box):
-        volume.fail_login("iqn.t1")
+        volume.refuse("iqn.t1")
         done = self.modify(box, "-c", "1", "-U", "user", "-P", "wrong")
         assert (done.status, box.tree.get("/result/modify")) == (0, "0")
         assert "Reconnect failed , target name = iqn.t1" in messages(done)

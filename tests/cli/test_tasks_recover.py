@@ -2,8 +2,9 @@
 
 import pytest
 
-import harness
-from appliance import INITIATOR, SESSIONS, SLOTS_MOVE, assert_order, messages, settings
+from appliance import SLOTS_MOVE, assert_order, settings
+from harness import messages
+from harness.initiator import INITIATOR, SESSIONS
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
 LOGIN = "iscsiadm -m node -T iqn.t1 -p 10.9.0.2:3260 -I default --login"
@@ -50,13 +51,11 @@ def lost(site, box):
     return site
 
 
-
 @pytest.mark.parametrize("handle, function", [(reopen, "task_oiscsi_evt_reopen"), (recover, "task_oiscsi_evt_recover")])
 @pytest.mark.parametrize("name", ["iqn.t1", "iqn.nobody"])
 def test_the_log_tells_of_begin_and_end(lost, box, handle, function, name):
     lost.debug(2)
-    told = harness.messages(handle(box, name=name).stdout)
-    own = [text for file, said_by, text in told if said_by == function]
+    own = messages(handle(box, name=name), function)
     assert (own[0], own[-1]) == ("start", "end")
 
 
@@ -246,7 +245,7 @@ class TestDegradedVolumes:
 
     def test_a_failed_reconnection_is_the_result(self, lost, box):
         degrade(box, "a")
-        lost.fail_login("iqn.t1")
+        lost.refuse("iqn.t1")
         done = recover(box)
         assert done.status == 255
         assert "Target_Connect failed , target name = iqn.t1" in messages(done)

@@ -2,7 +2,9 @@
 
 import pytest
 
-from appliance import SHARES, SLOTS_MOVE, assert_order, messages, settings
+from appliance import SLOTS_MOVE, assert_order, settings
+from harness import messages
+from harness.initiator import SHARES
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
 RECORD_DELETE = "iscsiadm -m node -I default -T iqn.t1 -p 10.9.0.2:3260 -o delete"

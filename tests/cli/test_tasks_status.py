@@ -2,7 +2,9 @@
 
 import pytest
 
-from appliance import DETAILS, INITIATOR, assert_order, messages, settings
+from appliance import assert_order, settings
+from harness import messages
+from harness.initiator import DETAILS, INITIATOR
 
 
 def status(box):

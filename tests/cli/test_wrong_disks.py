@@ -3,7 +3,9 @@
 import re
 
 import pytest
-from appliance import INITIATOR, messages, settings
+from appliance import settings
+from harness import messages
+from harness.initiator import INITIATOR
 from harness.volumes import drive, luns
 
 __all__ = ["luns"]

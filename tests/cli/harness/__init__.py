@@ -74,16 +74,16 @@ The log, in order:
     box.runs(name)         argument lists of the fake command, with .shell (text of the calling shell), .lc_all
     box.forget()           starts a new log
 
-The tool's own log: messages(done.stdout) gives (file, function, text) of every line of the diagnostic log,
-said(done.stdout) the texts alone; box.debug(2) sets the debug level first.
+The tool's own log: messages(done) gives the texts of the diagnostic log, messages(done, "task_add") those of one
+function, log_lines(done.stdout) every line as (file, function, text); box.debug(2) sets the debug level first.
 
 At its end a test fails for calls without an answer and for reports of the sanitizers (box.leaks_unchecked() when it
 takes /proc away, which the leak check needs; a test marked `unsanitized` is left out of sanitized builds). A program that outlives
 its time limit (20 s) is killed and raises.
 """
 
-from .log_lines import messages, said
+from .log_lines import log_lines, messages
 from .result import Call, Result, startswith
 from .world import Box, build_folder
 
-__all__ = ["Box", "Call", "Result", "build_folder", "messages", "said", "startswith"]
+__all__ = ["Box", "Call", "Result", "build_folder", "log_lines", "messages", "startswith"]

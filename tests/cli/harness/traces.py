@@ -26,7 +26,7 @@ CHANGING = [(re.compile(pattern), text) for pattern, text in (
     (r"--target=\d+", "--target=#"),
     (r"\bloop\d+", "loop#"),
     (r"(sysaux_call loop#) '7 \d+'", r"\1 '7 #'"),
-    (r"( \d+) 7:\d+$", r"\1 7:#"),
+    (r"(^ *|[ /])7:\d+\b", r"\g<1>7:#"),
     (r"^  usleep \d+", "  usleep #"),
     (r"(retry cmd : cycle = \d+, time =) \d+", r"\1 #"),
     (r"\d\d:\d\d:\d\d", "#:#:#"),
