@@ -1,5 +1,5 @@
 // Measures reads of values beside each other: bench_get ROUNDS CALLS SOCKET PATH [SOCKET PATH]... In a round
-// each value is read CALLS times. Prints a line a round, the microseconds of one read of each value.
+// each value is read CALLS times. Prints one line for each round, the microseconds of one read of each value.
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>

@@ -8,7 +8,7 @@
 // Both servers get the same full tree first. Then every round makes the same few calls of every kind, one
 // kind after the other. A round is shorter than the time slices of the scheduler, so whatever else the
 // machine does disturbs a few rounds wholly instead of all of them a little. Prints the names of the kinds in
-// a line, and then a line a round, the microseconds of one call of each.
+// a line, and then one line for each round, the microseconds of one call of each.
 
 #include <sched.h>
 #include <sys/prctl.h>

@@ -6,8 +6,8 @@
 
 namespace platform {
 
-// All of a file that can be read at any place, as far as it can be read; where the descriptor stands does not
-// matter, and stays.
+// All of a file that has positions, as far as it can be read. The position of the descriptor does not matter,
+// and stays.
 std::string content_of(int file);
 
 }  // namespace platform

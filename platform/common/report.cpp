@@ -20,7 +20,7 @@ bool is_journal(int fd) {
   return connected && peer.sun_family == AF_UNIX && strcmp(peer.sun_path, "/run/systemd/journal/stdout") == 0;
 }
 
-// In one write, as lines of several processes go there.
+// In one write, because several processes write lines there.
 void report(int priority, const char* format, ...) {
   char line[8192];
   const int mark = is_journal(STDERR_FILENO) ? snprintf(line, sizeof line, "<%d>", priority) : 0;

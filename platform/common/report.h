@@ -1,4 +1,4 @@
-// What a program has to say of itself: lines on standard error, which begin with their priority as "<N>"
+// What a program has to say about itself: lines on standard error, which begin with their priority as "<N>"
 // (sd-daemon(3)) where that is a stream to systemd's journal.
 #ifndef PLATFORM_COMMON_REPORT_H
 #define PLATFORM_COMMON_REPORT_H

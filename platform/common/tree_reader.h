@@ -11,7 +11,7 @@
 
 namespace platform {
 
-// Everything of a tree below one path at one moment, had with one request.
+// Everything of a tree below one path at one moment, fetched with one request.
 class TreeReader {
  public:
   // Asks the daemon for the targets and volumes; it has five seconds to answer.

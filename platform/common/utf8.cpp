@@ -15,8 +15,8 @@ locale_t utf8_locale() {
   return locale;
 }
 
-// How a character begins that takes N bytes, from 2 on: its first byte, the bits of it that tell so, the
-// smallest character that needs N bytes.
+// How a character of N bytes begins, from 2 on: its first byte, the bits of it that say so, the smallest
+// character that needs N bytes.
 constexpr struct {
   unsigned char first, mask;
   wchar_t smallest;

@@ -17,9 +17,9 @@ bool is_control(wchar_t character);
 // alone look the same, or one looks like another.
 bool is_invisible(wchar_t character);
 
-// The same for the character at `at`, but for what belongs to the writing there: words of some scripts hold a
-// joiner or its opposite, and emoji a joiner or what chooses their form. Not one of them stands behind ASCII
-// but in a key cap, which has the mark of one behind it.
+// The same for the character at `at`, except for what belongs to the script there: words of some scripts hold
+// a joiner or its opposite, and emoji a joiner or what chooses their form. None of them stands behind ASCII
+// except in a key cap, which its own mark follows.
 bool is_hidden(std::wstring_view characters, size_t at);
 
 // The character in lower case.

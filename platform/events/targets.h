@@ -25,7 +25,7 @@ struct Order {
 
 // What the end of a process means.
 struct OrderEnd {
-  bool ordered = false;  // it did an order
+  bool ordered = false;  // it carried out an order
   std::string given_up;  // the target whose recovery failed for the last time; empty for none
 };
 
@@ -44,8 +44,8 @@ class Targets {
   // that is not waiting for it changes nothing.
   void look_after_a_gap(const std::vector<Session>& sessions);
 
-  // Takes the next order that may be run now: one at a time a target, in the order of the events. Returns
-  // false when there is none. The caller says with started() which process does it.
+  // Takes the next order that may be run now: one at a time for each target, in the order of the events.
+  // Returns false when there is none. The caller says with started() which process does it.
   bool next(Order& order);
   void started(const std::string& target, pid_t process);
 

@@ -5,9 +5,9 @@
  * name; N above 4096 is refused. A value is any bytes but NUL, at most 65,535 of them; a path is at most
  * 1,023 bytes.
  *
- * In every call, `socket` NULL means "/var/run/ktree_sock" and `flags` is 0. The library keeps one connection
- * a socket for the life of the process, connects again when the daemon was restarted, and gives up on a
- * daemon that does not answer within 5 seconds. Calls may come from several threads. */
+ * In every call, `socket` NULL means "/var/run/ktree_sock" and `flags` is 0. The library keeps one
+ * connection per socket for the life of the process, connects again when the daemon has been restarted,
+ * and gives up on a daemon that does not answer within 5 seconds. Calls may come from several threads. */
 #ifndef KTREEC_H
 #define KTREEC_H
 
@@ -25,7 +25,7 @@ int ktreec_set(const char* socket, unsigned flags, const char* path, const char*
 /* Reads the value at `path` into `buffer` of `size` bytes, always NUL-terminated when size > 0. Returns the
  * bytes put there without the NUL (at most size - 1), 0 for an empty value, -1 when the node is missing, has
  * no value, or on any error (the buffer then holds the empty text). errno is ENODATA when the daemon has
- * answered that there is no such node or value, and nothing else makes it that. */
+ * answered that there is no such node or value, and in no other case. */
 int ktreec_get_wb(const char* socket, unsigned flags, const char* path, char* buffer, size_t size);
 
 /* Deletes the node at `path` and all below it; the later children of the same name move down by one. Returns

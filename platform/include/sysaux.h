@@ -47,10 +47,10 @@ long long sys_get_disk_space(const char* format, ...) __attribute__((format(prin
 int sys_get_partition_list(char* out, const char* device);
 
 /* Writes a new partition table (GPT) with one aligned partition of the type "Linux filesystem" that covers
- * the disk. Returns when the partition's node is in /dev, or after 5 seconds. Refused are a disk in use, one
- * with partitions, one that carries a file system, LVM, RAID, encryption or another signature of its own, one
- * on which only copies of a file system's lost first sectors are left, and one that cannot be read. What lies
- * in the new partition's place stays as it is. Returns 0, or non-zero. */
+ * the disk. Returns when the partition's node is in /dev, or after 5 seconds. It refuses a disk in use,
+ * one with partitions, one that carries a file system, LVM, RAID, encryption or another signature of its
+ * own, one on which only copies of a file system's lost first sectors are left, and one that cannot be
+ * read. What lies in the new partition's place stays as it is. Returns 0, or non-zero. */
 int sys_create_1_partition(const char* device);
 
 /* Grows the only partition of `device` (in a GPT, or a primary one in a DOS table, which ends at 2 TiB) to

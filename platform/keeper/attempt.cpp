@@ -50,7 +50,8 @@ bool accepts_at_a_port(const addrinfo& address) {
   return false;
 }
 
-// Runs the tool silently: that a target is missing was told, and why is told by whoever connects it by hand.
+// Runs the tool silently: that a target is missing has been told, and whoever connects it by hand is told
+// why.
 int run_silently(std::vector<const char*> arguments) {
   arguments.insert(arguments.begin(), platform::kTool);
   arguments.push_back(nullptr);

@@ -39,7 +39,7 @@ struct Daemon {
   int signals = -1, devices = -1;
   pid_t process = -1;    // tries a target at this moment
   int no_initiator = 0;  // looks in a row
-  bool first = true;     // no look yet: who is away now was taken when the settings say so
+  bool first = true;     // no look yet: what is away now was taken down when the settings say so
 };
 
 long now() {
@@ -48,7 +48,7 @@ long now() {
   return time.tv_sec;
 }
 
-// Sessions go because somebody wants it.
+// Sessions go because somebody wants them to.
 bool is_taken_down() {
   return runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"});
 }
@@ -66,8 +66,8 @@ pid_t start_program(std::initializer_list<const char*> words, const char* progra
   return process;
 }
 
-// Without the daemon no lost session is healed and none is made. Who stops it on purpose stops the tree as
-// well, or is still at work.
+// Without the daemon no lost session is healed and none is made. Whoever stops it on purpose stops the tree
+// as well, or is still at work.
 void keep_initiator(Daemon& daemon, bool tree_answers, bool taken_down) {
   if (!tree_answers || taken_down || runs(kInitiator) || runs(platform::kTool, {"--init"})) {
     daemon.no_initiator = 0;
@@ -140,8 +140,8 @@ bool take_signals(Daemon& daemon) {
   return !ended;
 }
 
-// Waits for the next look: it is due at once when a session comes or goes, so that who takes it away is still
-// there.
+// Waits for the next look: it is due at once when a session comes or goes, so that whoever takes it away is
+// still there.
 bool wait_for_look(Daemon& daemon) {
   static unsigned char buffer[1 << 14];
   const bool hurry = daemon.schedule.anything_missing() || daemon.no_initiator > 0;

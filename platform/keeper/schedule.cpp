@@ -5,10 +5,10 @@
 namespace keeper {
 namespace {
 
-// A recovery logs out and in again: a session is missing only when it stays away for some looks.
+// A recovery logs out and in again: a session is missing only when it stays away for several looks.
 constexpr int kLooks = 3;
 
-// While somebody brings a target up, who needs all the longer where the machine is slow.
+// While somebody brings a target up, which takes all the longer where the machine is slow.
 constexpr int kLooksAtWork = 60;
 
 }  // namespace
@@ -29,7 +29,7 @@ void Schedule::settle(Target& target, const Wanted& wanted, long now) {
     target.absent = 0;
     return;
   }
-  // Only who loses its session while somebody is at it is meant.
+  // Only a target that loses its session while somebody is at it is meant.
   if (target.absent == 0 && wanted.is_taken) target.taken = true;
   if (target.taken || target.missing) return;
   if (++target.absent < (wanted.at_work ? kLooksAtWork : kLooks)) return;

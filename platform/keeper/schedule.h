@@ -17,7 +17,7 @@ struct Wanted {
 
 struct Try {
   std::string target;
-  bool first;  // since it is missing
+  bool first;  // since it went missing
 };
 
 enum class Change { kNone, kMissing, kBack };

@@ -1,5 +1,5 @@
-// The frames between the daemon and its clients on a unix stream socket; docs/wire-protocol.md tells the
-// whole.
+// The frames between the daemon and its clients on a unix stream socket; docs/wire-protocol.md tells all of
+// it.
 //
 // Numbers are in the byte order of the machine. A client sends one request and waits for its reply before it
 // sends the next one.

@@ -23,7 +23,7 @@ class Server {
  public:
   // Serves `listener` (a listening, non-blocking socket) until `signals` (a signalfd) has something to read.
   // All of them, and what answers the requests, stay the caller's. At most `max_clients` are kept; when one
-  // more comes, or descriptors run out, the one that is stuck or idle for the longest goes.
+  // more comes, or descriptors run out, the one that has been stuck or idle the longest goes.
   Server(int listener, int signals, size_t max_clients, Service& service);
   Server(const Server&) = delete;
   Server& operator=(const Server&) = delete;
@@ -67,7 +67,7 @@ class Server {
   bool running_ = false;
   int64_t accept_again_ = 0;  // when to accept again after descriptors ran out; 0: accepting
   size_t clients_ = 0;
-  ConnectionList idle_;   // between requests, the one that is so for the longest first
+  ConnectionList idle_;   // between requests, the one that has been so the longest first
   ConnectionList stuck_;  // in the middle of a request or a reply, likewise
   Service& service_;
   std::array<char, kMaxRequestBytes> request_;

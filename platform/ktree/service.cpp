@@ -22,7 +22,7 @@ bool is_memory_file(int fd) {
   return fd >= 0 && fstat(fd, &info) == 0 && S_ISREG(info.st_mode) && fcntl(fd, F_GET_SEALS) >= 0;
 }
 
-// The same, emptied: a client whose reply was lost passes a file again that was filled already.
+// The same, emptied: a client whose reply was lost passes again a file that was filled already.
 bool is_new_document(int fd) {
   return is_memory_file(fd) && ftruncate(fd, 0) == 0 && lseek(fd, 0, SEEK_SET) == 0;
 }

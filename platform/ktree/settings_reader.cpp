@@ -114,7 +114,7 @@ bool SettingsReader::feed(size_t size) {
 }
 
 // Carries out what the parser calls for, unless the document is refused already. The parser is C: an
-// exception must not pass through it, and is thrown again behind it.
+// exception must not pass through it, and is thrown again after it.
 template <typename Act>
 void SettingsReader::call(void* self, Act act) {
   auto* reader = static_cast<SettingsReader*>(self);

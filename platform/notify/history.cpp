@@ -12,7 +12,7 @@ namespace {
 using vvstat::Row;
 
 constexpr time_t kSettled = 60;  // seconds
-// A volume is nearly full from the first on, and not any more below the second.
+// A volume is nearly full from the first on, and no longer so below the second.
 constexpr double kNearlyFull = 0.95, kNotSoFull = 0.90;
 
 std::string share_of(const Row& row) {
@@ -61,7 +61,7 @@ void remember_error(const Row& row, time_t now, Past& past) {
 
 void compare_health(const Row& row, time_t now, Past& past, std::vector<Event>& events) {
   const Ailment ailment = row.problem.ailment;
-  // Of what nobody wants it does not matter since when it is well.
+  // Since when something has been well that nobody wants does not matter.
   if (ailment != past.now || !row.wanted) past.since = now;
   past.now = ailment;
   remember_error(row, now, past);

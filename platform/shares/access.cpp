@@ -14,7 +14,7 @@ namespace shares {
 namespace {
 
 constexpr std::string_view kOption = "\tvalid users = ";
-// netatalk reads no line that is longer than 1023 bytes, nor anything else of its file then.
+// netatalk does not read a line of more than 1023 bytes, nor anything else of a file that has one.
 constexpr size_t kMaxOption = 900;
 // What begins a substitution, a text, a comment or a list of its own in one of the servers' files.
 constexpr wchar_t kForbidden[] = L"%\"'#;,=<>*?|/[]:";
@@ -102,7 +102,7 @@ Access parse_access(std::string_view text) {
 }
 
 Access read_access(const char* file) {
-  // A link that leads nowhere is no missing file.
+  // A link that leads nowhere is not a missing file.
   struct stat info {};
   if (lstat(file, &info) != 0 && errno == ENOENT) return {};
   const std::string text = read_file(file);

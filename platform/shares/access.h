@@ -12,7 +12,7 @@ namespace shares {
 struct AccessRule {
   std::string share;               // its name as printable text
   std::wstring folded;             // that name, folded
-  std::vector<std::string> names;  // of users, and of groups with an "@" before them; never none
+  std::vector<std::string> names;  // of users, and of groups with an "@" before them; never empty
 };
 
 struct Access {

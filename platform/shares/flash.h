@@ -24,9 +24,9 @@ bool make_writable(const char* folder, Opened& opened);
 // EBUSY when somebody still has a file open for writing.
 bool make_read_only(const char* folder, Opened opened);
 
-// Makes the flash writable for several programs at once. The last one to leave makes it read-only again. Who
-// holds a UserLock and dies lets go of it; the mount then stays writable until the next one leaves. A forked
-// child holds the lock as well.
+// Makes the flash writable for several programs at once. The last one to leave makes it read-only again.
+// Whoever holds a UserLock and dies lets go of it; the mount then stays writable until the next one leaves. A
+// forked child holds the lock as well.
 class UserLock {
  public:
   UserLock() = default;

@@ -26,8 +26,8 @@ using flash::kFlashFolder;
 constexpr char kFlashSettings[] = "/usr/local/config/vv.xml";
 constexpr int kTorn = 1, kUsage = 2, kCannotRun = 126, kNotFound = 127, kKilled = 128;
 
-// The settings hold secrets. A copy that is there already keeps its mode when cp writes into it, so it is
-// taken from everybody but its owner before it gets new ones.
+// The settings hold secrets. A copy that is there already keeps its mode when cp writes into it, so everybody
+// but its owner is shut out before it gets new ones.
 void protect_settings() {
   struct stat info = {};
   const int fd = open(kFlashSettings, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);

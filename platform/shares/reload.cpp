@@ -59,7 +59,7 @@ std::vector<Section> missing_from(const std::vector<Section>& now, std::vector<S
   return before;
 }
 
-// Shares whose users are others than before: who is in one and may not any more is to be put out.
+// Shares whose users have changed: whoever is in one and may no longer be is to be put out.
 std::vector<Section> barred_in(const std::vector<Section>& now, const std::vector<Section>& before) {
   std::vector<Section> barred;
   for (const Section& share : now) {

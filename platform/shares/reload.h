@@ -32,15 +32,15 @@ struct Reload {
   bool changed;                 // the generated file was replaced
   std::vector<Section> shares;  // what it holds now
   std::vector<Section> gone;    // what it held before
-  std::vector<Section> barred;  // shares that other people may use now than before
+  std::vector<Section> barred;  // shares whose users have changed
 };
 
 inline constexpr char kAccessFile[] = "/etc/remvol/shares.conf";
 
-// Brings the generated file up to date. While the file of who may use a share is wrong, which a line in the
-// log says, shares stay as they are as long as they are mounted, and none comes. A volume that failed or
-// whose name the server cannot use is left out with a line in the log, and so is a change that cannot be
-// written.
+// Brings the generated file up to date. While the file that says who may use a share is wrong, of which a
+// line in the log tells, shares stay as they are as long as they are mounted, and no new one comes. A volume
+// that failed or whose name the server cannot use is left out with a line in the log, and so is a change that
+// cannot be written.
 Reload reload_shares(const ShareServer& server);
 
 }  // namespace shares

@@ -73,7 +73,7 @@ bool is_whole(int fd) {
   return length >= ssize_t{kEndLength} && memcmp(end + length - kEndLength, kEnd, kEndLength) == 0;
 }
 
-// Gives `name` the name of the settings, and has that on the disk.
+// Gives `name` the name of the settings, and syncs that to the disk.
 bool take_the_name(int folder, const char* name) {
   return renameat(folder, name, folder, kSettingsName) == 0 && fsync(folder) == 0;
 }

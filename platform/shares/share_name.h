@@ -20,8 +20,8 @@ extern const NameRules kSambaNames, kNetatalkNames;
 // Why `name` cannot be the name of a share, as a person reads it; null when it can.
 const char* name_refusal(std::string_view name, const NameRules& rules);
 
-// `name` in lower case and without what is not seen: file servers take names for one that differ in case
-// alone, and so do people for the rest. Empty when it is not UTF-8.
+// `name` in lower case and without what is not seen: file servers take names that differ in case alone for
+// one, and people do so for the rest. Empty when it is not UTF-8.
 std::wstring folded_name(std::string_view name);
 
 }  // namespace shares

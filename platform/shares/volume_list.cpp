@@ -15,7 +15,7 @@ bool keeps_user_attributes(const std::string& file_system) {
   return file_system != "vfat";
 }
 
-// Why a volume that is not mounted should be; null when nothing is wrong with that.
+// Why a volume is not mounted that should be; null when nothing is wrong.
 const char* failure_of(const platform::TreeReader& tree, int target, int lun) {
   if (tree.number(0, key::kTargetConnState, target) != remvol::kConnected) return nullptr;
   if (tree.number(0, key::kLunEnable, target, lun) == 0) return nullptr;

@@ -3,7 +3,7 @@
 //
 // The shares stand in a file of their own that smb.conf includes. A running server is told only when that
 // file changed, and clients of a share that is gone are cut off, since the folder below it is no volume any
-// more, and so are those of a share that other people may use now.
+// more, and so are those of a share whose users have changed.
 #include <glob.h>
 
 #include <algorithm>

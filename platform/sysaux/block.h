@@ -1,5 +1,5 @@
 // What the kernel tells about a block device: its directory in sysfs, without opening the device itself, so
-// that a disk whose connection is lost stops nobody.
+// that a disk whose connection is lost holds nobody up.
 //
 // Source: https://docs.kernel.org/admin-guide/sysfs-rules.html; sizes and starts are in units of 512 bytes
 // whatever the sector size of the disk is.

@@ -56,7 +56,7 @@ bool is_block_device(const char* node) {
 
 extern "C" {
 
-// That there is no disk to look at is told without the module and its libraries.
+// That there is no disk to look at is found out without the module and its libraries.
 int sys_get_fs_type(char* out, const char* node) {
   out[0] = '\0';
   if (!is_block_device(node)) return -1;

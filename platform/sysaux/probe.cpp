@@ -65,8 +65,9 @@ int list_unread_table(const char* device, int block_dir, NameList* names) {
   return count;
 }
 
-// Has the disk read at once what the recognition then takes in some forty pieces, a round trip each. Where it
-// looks is what libblkid 2.38 does (strace); a piece that is missing here is read when it is asked for.
+// Has the disk read in one go what the recognition then takes in some forty pieces, one round trip each.
+// Where it looks is what libblkid 2.38 does (strace); a piece that is missing here is read when it is asked
+// for.
 void read_ahead(int device) {
   constexpr off_t kHead = 68 << 10;
   constexpr off_t kTail = 136 << 10;

@@ -18,7 +18,7 @@ using vvstat::Target;
 
 constexpr char kLoggedIn[] = "LOGGED_IN";
 
-// A volume that is up but may not be written from the beginning is as it should be.
+// A volume that is up, and that could not be written from the beginning, is as it should be.
 std::string up_message(const Row& row) {
   const std::string share = platform::printable(row.volume->share);
   return share + " is mounted on " + platform::printable(row.volume->mount_point) +

@@ -29,12 +29,12 @@ bool choose_columns(std::string_view names, Layout& layout, std::string& unknown
 // The columns' names with what each shows, a line each, for a help text.
 std::string describe_columns();
 
-// The report. Text of users is shown with \xHH for bytes that are no UTF-8, and for characters that move a
+// The report. Text of users is shown with \xHH for bytes that are not UTF-8, and for characters that move a
 // cursor or cannot be seen. Secrets are not in it. The process must have a UTF-8 locale (use_utf8()) for all
 // else that is not ASCII. Empty when there is no memory for it.
 std::string volume_report(const std::vector<Row>& rows, const Layout& layout);
 
-// Everything of one row, a column a line; what is empty is left out. Text of users is shown as above.
+// Everything of one row, one column a line; what is empty is left out. Text of users is shown as above.
 std::string block(const Row& row, bool bytes);
 
 // Sets the character set of the process to UTF-8, whatever its environment says; where the system lacks the

@@ -29,7 +29,7 @@ bool is_wanted(const Target& target) {
 constexpr char kRunning[] = "Running", kRunningReadOnly[] = "Running ( Read Only )";
 constexpr char kHealsItself[] = "look at the network and the storage server; it heals by itself";
 
-// It stores so as well when a session shows no disk at start-up; the volumes' state alone tells that from a
+// It stores the same when a session shows no disk at start-up; only the volumes' state tells that from a
 // disconnection.
 Problem given_up(const Target& target) {
   return {Ailment::kFailed, "Given Up", "was given up at start-up: its target showed no disk",

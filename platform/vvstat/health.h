@@ -11,8 +11,8 @@
 
 namespace vvstat {
 
-// What is wrong with a volume or its target. Texts are ASCII without ends of lines, but for the target's name
-// in the command.
+// What is wrong with a volume or its target. Texts are ASCII without ends of lines, except for the target's
+// name in the command.
 enum class Ailment {
   kNone,
   kBusy,      // it will be well by itself: it is being connected, created or formatted

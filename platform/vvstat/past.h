@@ -33,7 +33,7 @@ inline constexpr char kHistoryFile[] = "/run/remvol/history";
 // The name of a row in the history, printable text; no two volumes share it.
 std::string key_of(const Row& row);
 
-// The history as text, a line a volume, and back; a line that is none is left out.
+// The history as text, one line for each volume, and back; a line that is none is left out.
 std::string text_of(const History& history);
 History history_of(std::string_view text);
 
