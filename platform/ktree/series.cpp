@@ -11,18 +11,17 @@ constexpr int kMostNeeded = 1024;
 
 }  // namespace
 
-bool Series::starts() {
-  if (running() || ++replies_ < needed_) return false;
-  trust_ = kMostTrust;
-  return true;
+void Series::count_reply() {
+  if (running()) return;
+  replies_++;
+  if (replies_ >= needed_) trust_ = kMostTrust;
 }
 
-bool Series::ends(bool came) {
+void Series::count_wake_up(bool came) {
   trust_ = came ? std::min(trust_ + 1, kMostTrust) : std::max(trust_ - kInVain, 0);
-  if (running()) return false;
+  if (running()) return;
   replies_ = 0;
   needed_ = std::min(needed_ * 2, kMostNeeded);
-  return true;
 }
 
 }  // namespace ktree

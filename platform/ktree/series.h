@@ -11,14 +11,15 @@ namespace ktree {
 
 class Series {
  public:
+  // What the daemon is to be woken by changes with it.
   [[nodiscard]] bool running() const { return trust_ > 0; }
 
-  // Counts a reply that has gone. Returns true when a series starts to run by it.
-  [[nodiscard]] bool starts();
+  // Counts a reply that has gone. A series may start to run by it.
+  void count_reply();
 
-  // Counts a wake-up of a running series, `came` with the next request or in vain. Returns true when the
-  // series ends by it; the next one takes twice as many replies to start.
-  [[nodiscard]] bool ends(bool came);
+  // Counts a wake-up of a running series, `came` with the next request or in vain. The series may end by it;
+  // the next one takes twice as many replies to start.
+  void count_wake_up(bool came);
 
  private:
   int trust_ = 0;

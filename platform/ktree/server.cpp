@@ -181,10 +181,12 @@ void Server::serve(Connection& connection, uint32_t events) {
     continue_reply(connection);
     return;
   }
-  if (connection.series.running() && connection.series.ends(events != EPOLLOUT) &&
-      !await_request(connection)) {
-    drop(connection);
-    return;
+  if (connection.series.running()) {
+    connection.series.count_wake_up(events != EPOLLOUT);
+    if (!connection.series.running() && !await_request(connection)) {
+      drop(connection);
+      return;
+    }
   }
   connection.last = (events & EPOLLRDHUP) != 0;
   while (receive_part(connection)) {
@@ -305,7 +307,10 @@ void Server::continue_reply(Connection& connection) {
 // The reply has gone: the client is idle, and the last one to be dropped for others, unless it has said that
 // it sends no more.
 void Server::settle(Connection& connection) {
-  if (connection.last || ((connection.series.starts() || connection.sending) && !await_request(connection))) {
+  const bool was_running = connection.series.running();
+  connection.series.count_reply();
+  const bool watch_changes = connection.sending || connection.series.running() != was_running;
+  if (connection.last || (watch_changes && !await_request(connection))) {
     drop(connection);
     return;
   }
