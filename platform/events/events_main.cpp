@@ -199,7 +199,7 @@ constexpr char kHelp[] =
     "Runs \"remvol --oiscsi_evt_reopen -n TARGET\" when the connection of an iSCSI session is lost and\n"
     "\"remvol --oiscsi_evt_recover -n TARGET\" when the session is back, and remvol-notify after each.\n"
     "Stays in the foreground.\n"
-    "  --test         has remvol-notify tell of an event that is none, and ends\n"
+    "  --test         has remvol-notify tell of a made-up event, and ends\n"
     "  -h, --help     this text\n"
     "  -V, --version  the version\n";
 

@@ -107,7 +107,7 @@ constexpr char kHelp[] =
     "usage: remvol-notify [--test | --recovery-failed TARGET]\n"
     "Looks at the volumes of remote targets and tells what has changed since its last look: in the\n"
     "journal, by mail and by programs, as remvol.conf(5) says.\n"
-    "  --test                    tells of an event that is none\n"
+    "  --test                    tells of a made-up event\n"
     "  --recovery-failed TARGET  tells that a recovery is not tried again\n"
     "  -h, --help                this text\n"
     "  -V, --version             the version\n"
