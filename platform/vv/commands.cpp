@@ -1,5 +1,7 @@
 #include "vv/commands.h"
 
+#include <cstring>
+
 #include "vv/search_commands.h"
 #include "vv/target_commands.h"
 #include "vv/volume_commands.h"
@@ -25,6 +27,13 @@ constexpr Command kCommands[] = {
 
 std::span<const Command> commands() {
   return kCommands;
+}
+
+const Command* find_command(const char* name) {
+  for (const Command& command : commands()) {
+    if (strcmp(command.name, name) == 0) return &command;
+  }
+  return nullptr;
 }
 
 }  // namespace vv

@@ -1,7 +1,8 @@
-// The command line.
+// The options, and what a command takes of them.
 #ifndef PLATFORM_VV_OPTIONS_H
 #define PLATFORM_VV_OPTIONS_H
 
+#include <span>
 #include <string>
 #include <vector>
 
@@ -44,17 +45,40 @@ struct Command {
   const char* help;
 };
 
-// The command of that name; null when there is none.
-const Command* find_command(const char* name);
+// What stands for an option that has no letter.
+enum : int {
+  kPortalOption = 256,
+  kTargetOption,
+  kLunOption,
+  kUserOption,
+  kPasswordFileOption,
+  kPasswordOption,
+  kNoPasswordOption,
+  kDestroyDataOption,
+  kYesOption,
+  kJsonOption
+};
+
+// One option of the command line.
+struct OptionRow {
+  int letter;
+  unsigned bit;  // of the commands that take it; 0: all do
+  const char* name;
+  const char* argument;  // null: it takes none
+  const char* help;      // null: it is not told of
+};
+
+// All of them, in the order of the help text.
+std::span<const OptionRow> option_rows();
+
+// True when the command takes that option.
+bool takes(const Command& command, const OptionRow& row);
 
 // The options that the command takes, as "--lun".
 std::vector<std::string> options_of(const Command& command);
 
 // True for an option that a value follows.
 bool takes_value(const std::string& option);
-
-// Reads the command line. Returns -1 to go on, or the exit status to end with.
-int read_options(int argc, char** argv, Options& options);
 
 }  // namespace vv
 

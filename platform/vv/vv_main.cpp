@@ -2,7 +2,7 @@
 // and explains what went wrong.
 #include <sys/prctl.h>
 
-#include "vv/options.h"
+#include "vv/command_line.h"
 #include "vvstat/columns.h"
 
 int main(int argc, char** argv) {
