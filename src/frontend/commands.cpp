@@ -3,13 +3,13 @@
 #include "frontend/request.h"
 #include "iscsi/address.h"
 #include "iscsi/discovery.h"
-#include "iscsi/initiator.h"
-#include "iscsi/lun_search.h"
 #include "tasks/add.h"
 #include "tasks/connect.h"
 #include "tasks/format.h"
 #include "tasks/recover.h"
 #include "tasks/remove.h"
+#include "tasks/search_lun.h"
+#include "tasks/start_stop.h"
 #include "tasks/status.h"
 #include "upgrade/remvol_ver_upgrade.h"
 
@@ -22,25 +22,42 @@ constexpr unsigned kPortal = kOptAddress | kOptPort;
 constexpr unsigned kOneLun = kOptName | kOptLun;
 
 template <int (*kTask)()>
-int run(const Options&) {
+int run() {
   return kTask();
 }
 
-int share(const Options&) {
+template <int (*kTask)(const TargetEntry& request)>
+int run() {
+  return kTask(request_target);
+}
+
+int search() {
+  return task_search(request_target, output_file);
+}
+
+int search_lun() {
+  return task_search_lun(request_target, output_file);
+}
+
+int share() {
   return task_share(request_target.share);
 }
 
-int disconnect(const Options&) {
-  return task_disconnect((OPT_FLAG & kOptName) == 0 ? 1 : 0);
+int disconnect() {
+  return task_disconnect((OPT_FLAG & kOptName) == 0 ? nullptr : request_target.target_name);
 }
 
 template <int kSystemOff>
-int deinit(const Options&) {
+int deinit() {
   return task_deinit(kSystemOff);
 }
 
-int recover(const Options& options) {
-  return task_oiscsi_evt_recover(options.wait_seconds);
+int recover() {
+  return task_oiscsi_evt_recover(request_target.target_name, wait_seconds);
+}
+
+int reopen() {
+  return task_oiscsi_evt_reopen(request_target.target_name);
 }
 
 }  // namespace
@@ -49,7 +66,7 @@ int recover(const Options& options) {
 // them.
 const Command kCommands[kCommandCount] = {
     {"init", run<task_init>, kNone, "task_init() failed", false, false, nullptr},
-    {"search", run<task_search>, kPortal, "task_search() failed", false, false, nullptr},
+    {"search", search, kPortal, "task_search() failed", false, false, nullptr},
     {"add", run<task_add>, kOneLun | kPortal | kOptShare, "task_add() failed", true, false, nullptr},
     {"del", run<task_del>, kOptName, "task_del() failed", true, false, nullptr},
     {"format", run<task_format>, kOneLun, "task_format() failed", true, false, nullptr},
@@ -60,11 +77,10 @@ const Command kCommands[kCommandCount] = {
     {"connect", run<task_connect>, kOptName, "task_connect() failed", true, false, nullptr},
     {"system_off", deinit<1>, kNone, "system_off failed", false, false, nullptr, true},
     {"deinit", deinit<0>, kNone, "task_deinit failed", false, false, nullptr, true},
-    {"oiscsi_evt_reopen", run<task_oiscsi_evt_reopen>, kNone, "task_oiscsi_evt_reopen failed", false, false,
-     nullptr},
+    {"oiscsi_evt_reopen", reopen, kNone, "task_oiscsi_evt_reopen failed", false, false, nullptr},
     {"oiscsi_evt_recover", recover, kNone, "task_oiscsi_evt_reopen failed", false, false, nullptr},
-    {"search_lun", run<task_search_lun>, kOptName | kOptChap | kPortal, "task_search_lun() failed", false,
-     false, nullptr},
+    {"search_lun", search_lun, kOptName | kOptChap | kPortal, "task_search_lun() failed", false, false,
+     nullptr},
     {"del_lun", run<task_del_lun>, kOneLun, "task_del_lun() failed", true, false, nullptr},
     {"verupgrade", run<version_upgrade>, kNone, "task_version_upgrade() failed", false, false, nullptr},
     {"modify_address", run<task_modify_target_address>, kOptName | kPortal, "task_modify() failed", false,

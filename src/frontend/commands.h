@@ -2,12 +2,10 @@
 #ifndef REMVOL_FRONTEND_COMMANDS_H
 #define REMVOL_FRONTEND_COMMANDS_H
 
-#include "frontend/options.h"
-
 namespace remvol {
 
-// Runs a command's handler. Returns the handler's result, 0 for success.
-using Handler = int (*)(const Options& options);
+// Runs a command's handler with what it needs of the request. Returns the handler's result, 0 for success.
+using Handler = int (*)();
 
 struct Command {
   const char* name;         // long option

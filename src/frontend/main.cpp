@@ -14,6 +14,7 @@
 #include "frontend/request.h"
 #include "ktreec.h"
 #include "support/memory.h"
+#include "support/program.h"
 #include "support/run_lock.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -97,7 +98,7 @@ const char* failure_message(const Command& command) {
   return for_all ? command.failure_all : command.failure;
 }
 
-int run(const Command& command, const Options& options) {
+int run(const Command& command) {
   record_result("");
   if ((OPT_FLAG & command.required) != command.required) {
     LOG(1, "OPT_FLAG: %08x", OPT_FLAG);
@@ -105,7 +106,7 @@ int run(const Command& command, const Options& options) {
   }
   if (command.run == nullptr) return fail(false);
   const TreeInstance tree = tree_instance();
-  const int result = command.run(options);
+  const int result = command.run();
   if (result != 0 && !command.reports_value) {
     LOG(1, "%s", failure_message(command));
     return fail(false);
@@ -140,8 +141,7 @@ int main(int argc, char** argv) {
   keep_program_path(argc, argv);
   log_arguments(argc, argv, shown.get());
   request_target = TargetEntry();
-  Options options;
-  switch (parse_options(argc, argv, &options)) {
+  switch (parse_options(argc, argv)) {
     case ParseEnd::kExit:
       return 0;
     case ParseEnd::kFail:
@@ -157,5 +157,5 @@ int main(int argc, char** argv) {
             __func__);
     abort();
   }
-  return run(kCommands[options.command], options);
+  return run(kCommands[command_row]);
 }

@@ -12,6 +12,7 @@
 #include "frontend/commands.h"
 #include "frontend/log.h"
 #include "frontend/request.h"
+#include "support/program.h"
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
@@ -37,15 +38,15 @@ const option* long_options() {
   return options;
 }
 
-ParseEnd choose_command(int index, Options* options) {
-  if (options->command >= 0) {
-    LOG(1, "Command parameter check failed, %d & %d", options->command, index);
+ParseEnd choose_command(int index) {
+  if (command_row >= 0) {
+    LOG(1, "Command parameter check failed, %d & %d", command_row, index);
     return ParseEnd::kFail;
   }
   gs_str_command = kCommands[index].name;
   if (optarg != nullptr) printf(" with arg %s", optarg);
   putchar('\n');
-  options->command = index;
+  command_row = index;
   return ParseEnd::kReady;
 }
 
@@ -132,10 +133,10 @@ ParseEnd print_version() {
   return ParseEnd::kExit;
 }
 
-ParseEnd take_option(int option, int index, Options* options) {
+ParseEnd take_option(int option, int index) {
   switch (option) {
     case 0:
-      return choose_command(index, options);
+      return choose_command(index);
     case 'n':
       return take_name(option, kOptName, request_target.target_name);
     case 's':
@@ -156,7 +157,7 @@ ParseEnd take_option(int option, int index, Options* options) {
       output_file = optarg;
       return ParseEnd::kReady;
     case 'w':
-      options->wait_seconds = atoi(optarg);
+      wait_seconds = atoi(optarg);
       return ParseEnd::kReady;
     case 'd':
       return store_debug_level();
@@ -201,12 +202,12 @@ void hide_secrets(int argc, char** argv, int* shown) {
   optind = 0;  // the reading begins anew
 }
 
-ParseEnd parse_options(int argc, char** argv, Options* options) {
+ParseEnd parse_options(int argc, char** argv) {
   const option* const commands = long_options();
   int index = 0;
   int option = 0;
   while ((option = getopt_long(argc, argv, kShortOptions, commands, &index)) != -1) {
-    const ParseEnd end = take_option(option, index, options);
+    const ParseEnd end = take_option(option, index);
     if (end != ParseEnd::kReady) return end;
   }
   return ParseEnd::kReady;

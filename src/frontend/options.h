@@ -1,4 +1,4 @@
-// The command line: from arguments into the request record.
+// The command line: from arguments into the request.
 #ifndef REMVOL_FRONTEND_OPTIONS_H
 #define REMVOL_FRONTEND_OPTIONS_H
 
@@ -12,20 +12,14 @@ enum class ParseEnd {
   kExit,   // nothing more to do, exit status 0
 };
 
-// What main needs beside the request record.
-struct Options {
-  int command = -1;      // row of the command table; -1 when none was given
-  int wait_seconds = 0;  // argument of -w
-};
-
 // The process list shows a process's arguments to everybody: moves every argument with a secret (-P) into
 // memory of the tool's own, overwrites the secret where it stood and points `argv` to the copy. Puts into
 // `shown` (`argc` numbers) how many characters of each argument may be shown, -1 for all.
 void hide_secrets(int argc, char** argv, int* shown);
 
-// Reads the arguments into the request record and `options`. -d and -v do their work at once and end the
-// reading. A value that is longer than its field fails; cut, two long names would become one.
-ParseEnd parse_options(int argc, char** argv, Options* options);
+// Reads the arguments into the request. -d and -v do their work at once and end the reading. A value that is
+// longer than its field fails; cut, two long names would become one.
+ParseEnd parse_options(int argc, char** argv);
 
 // The one place where rules for target and share names would stand. Returns 0 to accept `name`, which it
 // always does, or a negative number.

@@ -1,6 +1,5 @@
 #define LOG_SOURCE "remvol_debug.cpp"
 #include "frontend/remvol_debug.h"
-
 #include "frontend/log.h"
 #include "tree/access.h"
 #include "tree/keys.h"

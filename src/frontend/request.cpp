@@ -1,18 +1,12 @@
 #include "frontend/request.h"
 
-#include <cstring>
-
 namespace remvol {
 
 TargetEntry request_target;
 unsigned OPT_FLAG = 0;
 const char* gs_str_command = nullptr;
-char program_path[4096];
+int command_row = -1;
 const char* output_file = nullptr;
-
-const char* program_name() {
-  const char* slash = strrchr(program_path, '/');
-  return slash != nullptr ? slash + 1 : program_path;
-}
+int wait_seconds = 0;
 
 }  // namespace remvol

@@ -1,4 +1,5 @@
-// The request record: the parsed command line, process-wide, filled by the front end before a handler runs.
+// The request: the parsed command line, process-wide. The front end alone writes and reads it; the handlers
+// get what they need of it from the command table, as arguments.
 #ifndef REMVOL_FRONTEND_REQUEST_H
 #define REMVOL_FRONTEND_REQUEST_H
 
@@ -19,12 +20,9 @@ enum OptionBit : unsigned {
 extern TargetEntry request_target;  // the fields that the options set; the others are zero
 extern unsigned OPT_FLAG;
 extern const char* gs_str_command;  // name of the long option that chose the command; null until one is given
-extern char program_path[4096];     // argv[0]
+extern int command_row;             // its row in the command table; -1 until one is given
 extern const char* output_file;     // argument of -o; null when absent
-
-// Returns the last component of `program_path`: the text after its last slash, or all of it. The tool's
-// temporary files are named after it.
-const char* program_name();
+extern int wait_seconds;            // argument of -w
 
 }  // namespace remvol
 

@@ -1,7 +1,6 @@
 #include "iscsi/address.h"
 
 #include "frontend/log.h"
-#include "frontend/request.h"
 #include "iscsi/discovery.h"
 #include "iscsi/session_check.h"
 #include "support/result.h"
@@ -69,10 +68,10 @@ int modify_address(const TargetEntry& request) {
 
 }  // namespace
 
-int task_modify_target_address() {
+int task_modify_target_address(const TargetEntry& request) {
   const LogScope scope;
   LOG(1, "task_modify_target_ip start");
-  const int result = modify_address(request_target);
+  const int result = modify_address(request);
   LOG(1, "task_modify_target_ip end, ret = %d", result);
   return result;
 }

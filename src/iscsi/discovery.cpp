@@ -4,7 +4,6 @@
 #include <cstring>
 
 #include "frontend/log.h"
-#include "frontend/request.h"
 #include "iscsi/discovered_names.h"
 #include "iscsi/iface.h"
 #include "iscsi/iscsiadm.h"
@@ -14,6 +13,7 @@
 #include "ktreec.h"
 #include "support/command.h"
 #include "support/files.h"
+#include "support/program.h"
 #include "support/result.h"
 #include "support/temp_file.h"
 #include "support/text.h"
@@ -38,14 +38,14 @@ bool discover(const char* address, int port, const char* iface, const char* path
 
 // Reads the names that lines of the requested address show, in ascending order. The same name stays as often
 // as it is offered. Returns false when memory is too short for them.
-bool read_names(FILE* file, DiscoveredNames* names) {
+bool read_names(FILE* file, const char* address, DiscoveredNames* names) {
   DiscoveredName last = {};
   char line[kListingLineSize];
   for (int lines = 0; fgets(line, sizeof line, file) != nullptr;) {
-    if (!is_discovery_line_of(line, request_target.ip)) continue;
+    if (!is_discovery_line_of(line, address)) continue;
     lines++;
     if (read_discovered_name(line, last.text) && !names->add(last)) {
-      LOG(0, "out of memory for the names that %s offers", request_target.ip);
+      LOG(0, "out of memory for the names that %s offers", address);
       return false;
     }
     LOG(3, "line %d: %s", lines, last.text);
@@ -71,15 +71,14 @@ void publish_names(const char* socket, const DiscoveredNames& names) {
 }
 
 // The search itself. Returns the result of task_search.
-int search_portal(const char* socket) {
-  const TargetEntry& request = request_target;
+int search_portal(const TargetEntry& request, const char* socket) {
   const TempFile path(discovery_path());
   LOG(kNote, "ip: %s, port: %d", request.ip, request.port);
   int result = discover(request.ip, request.port, request.iface, path) ? 0 : 1;
   File file(fopen(path, "re"));
   if (file == nullptr) return 2;
   DiscoveredNames names;
-  if (!read_names(file.get(), &names)) return 1;
+  if (!read_names(file.get(), request.ip, &names)) return 1;
   publish_names(socket, names);
   file.reset();
   if (tree_write_to(socket, key::kSearchDone, "1") != kOk) {
@@ -103,10 +102,8 @@ bool check_arguments(const char* name, const char* address, int port) {
   return false;
 }
 
-// Names the requested target and portal, not the arguments of the question.
-int not_offered() {
-  const TargetEntry& request = request_target;
-  LOG(2, "Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
+int not_offered(const char* name, const char* address, int port) {
+  LOG(2, "Can not find %s at IP: %s Port: %d", name, address, port);
   return 0;
 }
 
@@ -122,18 +119,19 @@ bool find_offer(FILE* file, const char* name, const char* address, int port) {
 
 }  // namespace
 
-int task_search() {
+int task_search(const TargetEntry& request, const char* output_file) {
   const LogScope scope;
   LOG(2, "start");
   // Without an interface no private daemon is started, and what is dumped at the end is the default tree.
   const char* socket = nullptr;
   int result = 1;
-  if (get_iface_name(&request_target) == 0) {
-    socket = open_results(kTargetResults);
-    result = search_portal(socket);
+  TargetEntry portal = request;
+  if (get_iface_name(&portal) == 0) {
+    socket = open_results(kTargetResults, output_file);
+    result = search_portal(portal, socket);
   }
   LOG(2, "end, ret = %d", result);
-  close_results(kTargetResults, socket);
+  close_results(kTargetResults, socket, output_file);
   return result;
 }
 
@@ -148,7 +146,7 @@ int Portal_search_target(const char* name, const char* address, int port) {
   if (_get_iface_name(iface, sizeof iface, address) != 0) return kFailed;
   LOG(2, "ip: %s, port: %d", address, port);
   const TempFile path(discovery_path());
-  if (!discover(address, port, iface, path)) return not_offered();
+  if (!discover(address, port, iface, path)) return not_offered(name, address, port);
   File file(fopen(path, "re"));
   if (file == nullptr) {
     LOG(1, "discovery target failed at IP: %s Port: %d", address, port);
@@ -157,7 +155,7 @@ int Portal_search_target(const char* name, const char* address, int port) {
   const bool offered = find_offer(file.get(), name, address, port);
   file.reset();
   _remove_file(path);
-  return offered ? 1 : not_offered();
+  return offered ? 1 : not_offered(name, address, port);
 }
 
 }  // namespace remvol

@@ -1,46 +1,24 @@
 #include "iscsi/initiator.h"
 
-#include <unistd.h>
-
 #include <cstdio>
 #include <cstring>
 
 #include "frontend/log.h"
 #include "iscsi/daemon.h"
-#include "iscsi/iface.h"
-#include "iscsi/initiator_name.h"
-#include "iscsi/iscsiadm.h"
-#include "iscsi/node.h"
 #include "iscsi/records.h"
 #include "support/command.h"
 #include "support/files.h"
 #include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
-#include "tree/access.h"
-#include "tree/keys.h"
-#include "tree/settings_file.h"
-#include "tree/slots.h"
-#include "tree/state.h"
-#include "upgrade/remvol_ver_upgrade.h"
-#include "volume/session_volumes.h"
-#include "volume/share_services.h"
-#include "volume/unmount.h"
 
 namespace remvol {
 
 namespace {
 
-constexpr char kSettingsPidFile[] = "/var/run/ktree_sock_vv_config.pid";
-constexpr char kFlashCopy[] = "/usr/local/config/vv.xml";
 constexpr char kModuleFolder[] = "/usr/local/modules/driver";
 constexpr char kIscsidConf[] = "/etc/iscsi/iscsid.conf";
 constexpr char kNameFile[] = "/etc/iscsi/initiatorname.iscsi";
-
-// Exit statuses of ktreec.
-constexpr int kSettingsRefused = 1;
-constexpr int kTreeUnreachable = 3;
-constexpr int kLoadTries = 10;  // one a second
 
 // Top of the stack first: the order of unloading.
 constexpr const char* kModules[] = {"iscsi_tcp.ko", "libiscsi_tcp.ko", "libiscsi.ko",
@@ -103,40 +81,6 @@ void write_daemon_configuration() {
   LOG(0, "write %s failed", kIscsidConf);
 }
 
-// Returns the exit status of the command that loads `file` into the tree, which moves all slots at once: a
-// run that has found them empty a moment ago must not take them for garbage.
-int load_tree(const char* file) {
-  const SlotsHeld held(SlotsHeld::kChange);
-  slots_move();
-  return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", kVolumesSocket, file)));
-}
-
-// A daemon that a busy machine has not started in its second is waited for: without its settings the tree
-// would count as fresh, and be dumped over them.
-int load_saved_settings() {
-  int ended = load_tree(kSettingsFile);
-  for (int i = 0; i < kLoadTries && ended == kTreeUnreachable && access(kSettingsFile, F_OK) == 0; i++) {
-    sleep(1);
-    ended = load_tree(kSettingsFile);
-  }
-  return ended;
-}
-
-// Settings that are missing or damaged are replaced by their copy on the configuration flash.
-void load_settings() {
-  if (load_saved_settings() != kSettingsRefused) return;
-  keep_damaged_settings();
-  if (access(kFlashCopy, F_OK) != 0 || load_tree(kFlashCopy) != 0) return;
-  LOG(0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
-}
-
-// A killed daemon leaves its pid file behind. The result key was set a moment ago.
-void start_settings_daemon() {
-  if (check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult))) return;
-  start_tree_daemon(kVolumesSocket);
-  load_settings();
-}
-
 // A module that is not loaded is no failure here.
 void reload_modules() {
   for (const char* module : kModules) System("rmmod %s 1>/dev/null 2>/dev/null", module);
@@ -151,21 +95,9 @@ InitiatorName write_initiator_name() {
   return name;
 }
 
-// Returns whether the last module was unloaded.
-bool unload_modules() {
-  bool unloaded = false;
-  for (const char* module : kModules) unloaded = run_command(CommandText("rmmod %s", module)) == 0;
-  return unloaded;
-}
-
 }  // namespace
 
-int task_init() {
-  const LogScope scope;
-  LOG(2, "start");
-  start_settings_daemon();
-  if (is_remvol_ver_changed() != 0) version_upgrade();
-  set_remvol_ver_to_db(kSettingsVersion);
+InitiatorName start_initiator() {
   run_command("killall -q -SIGTERM iscsid", kNote);
   reload_modules();
   run_command("mkdir -p /etc/iscsi");
@@ -173,29 +105,18 @@ int task_init() {
   const InitiatorName name = write_initiator_name();
   drop_empty_records();
   start_daemon("iscsid -f >/dev/null 2>&1 &");
-  Iface_Config_Gen();
-  ktree_update_initiator_iqn(name);
-  Target_load_all();
-  LOG(2, "end");
-  return 0;
+  return name;
 }
 
-int task_deinit(int system_off) {
-  const LogScope scope;
-  LOG(2, system_off != 0 ? "system off" : "deinit start");
-  Target_umount_all();
-  close_sessions(nullptr, kLogoutAllCommand);
+bool stop_initiator() {
   LOG(1, "killall -SIGTERM iscsid ");
-  bool succeeded = run_command("killall -SIGTERM iscsid") == 0;
-  LOG(2, "deinit end");
-  if (system_off == 0) {
-    LOG(1, "update share folder status");
-    reload_share_services();
-    LOG(1, "finish share folder status");
-    succeeded = unload_modules();
-  }
-  stop_tree_daemon(kSettingsPidFile);
-  return succeeded ? 0 : 1;
+  return run_command("killall -SIGTERM iscsid") == 0;
+}
+
+bool unload_modules() {
+  bool unloaded = false;
+  for (const char* module : kModules) unloaded = run_command(CommandText("rmmod %s", module)) == 0;
+  return unloaded;
 }
 
 }  // namespace remvol

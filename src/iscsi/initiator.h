@@ -1,15 +1,20 @@
-// Bringing the initiator up and down: the handlers of init, deinit and system_off.
+// The initiator of the system: its kernel modules, its daemon and the files that it reads. A step that fails
+// is logged in the caller's name, and the next one runs.
 #ifndef REMVOL_ISCSI_INITIATOR_H
 #define REMVOL_ISCSI_INITIATOR_H
 
+#include "iscsi/initiator_name.h"
+
 namespace remvol {
 
-// Brings the whole initiator up. Always returns 0: a failed step is logged and the next one runs.
-int task_init();
+// Starts it anew, with modules and files of this appliance. Returns the name that it has now.
+InitiatorName start_initiator();
 
-// Takes it down; `system_off` non-zero leaves modules and shares as they are, since the machine is about to
-// stop. Returns 0, or 1 when the last command of the teardown failed.
-int task_deinit(int system_off);
+// Has its daemon end. Returns whether there was one to tell so.
+bool stop_initiator();
+
+// Unloads its modules. Returns whether the last one was unloaded.
+bool unload_modules();
 
 }  // namespace remvol
 

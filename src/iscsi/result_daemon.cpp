@@ -2,7 +2,6 @@
 
 #include <unistd.h>
 
-#include "frontend/request.h"
 #include "iscsi/daemon.h"
 #include "ktreec.h"
 #include "support/files.h"
@@ -18,7 +17,7 @@ void stop(const ResultDaemon& daemon) {
 
 }  // namespace
 
-const char* open_results(const ResultDaemon& daemon) {
+const char* open_results(const ResultDaemon& daemon, const char* output_file) {
   if (output_file == nullptr) return nullptr;
   if (check_path_exist(daemon.socket) == 0) {
     stop(daemon);
@@ -30,7 +29,7 @@ const char* open_results(const ResultDaemon& daemon) {
   return daemon.socket;
 }
 
-void close_results(const ResultDaemon& daemon, const char* socket) {
+void close_results(const ResultDaemon& daemon, const char* socket, const char* output_file) {
   if (output_file == nullptr) return;
   ktreec_dump(socket, 0, output_file);
   stop(daemon);

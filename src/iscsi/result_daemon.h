@@ -18,12 +18,12 @@ inline constexpr ResultDaemon kTargetResults = {"/var/run/ktree_sock_vv_search",
 inline constexpr ResultDaemon kLunResults = {"/var/run/ktree_sock_vv_search_lun",
                                              "/var/run/ktree_sock_vv_search_lun_config.pid"};
 
-// With an output file: starts the daemon, after stopping one that an earlier search left behind, and returns
-// its socket. Without one: returns null, the client library's default tree.
-const char* open_results(const ResultDaemon& daemon);
+// With an output file (not null): starts the daemon, after stopping one that an earlier search left behind,
+// and returns its socket. Without one: returns null, the client library's default tree.
+const char* open_results(const ResultDaemon& daemon, const char* output_file);
 
 // With an output file: dumps the tree behind `socket` into it and stops the daemon.
-void close_results(const ResultDaemon& daemon, const char* socket);
+void close_results(const ResultDaemon& daemon, const char* socket, const char* output_file);
 
 }  // namespace remvol
 

@@ -6,11 +6,11 @@
 #include <ctime>
 
 #include "frontend/log.h"
-#include "frontend/request.h"
 #include "iscsi/iscsiadm.h"
 #include "iscsi/session_check.h"
 #include "iscsi/session_listing.h"
 #include "support/files.h"
+#include "support/program.h"
 #include "support/result.h"
 #include "support/run_lock.h"
 #include "support/temp_file.h"
@@ -20,7 +20,6 @@
 #include "tree/entry.h"
 #include "tree/keys.h"
 #include "tree/slots.h"
-#include "volume/device.h"
 
 namespace remvol {
 
@@ -136,11 +135,11 @@ int store_listed_devices(TargetEntry* entry, const char* path) {
 }
 
 // Makes a node for one usable LUN. Returns null when it is too small, or out of memory.
-LunNode* make_lun_node(const DetailedListing& listing) {
+LunNode* make_lun_node(const DetailedListing& listing, DeviceNodeMaker make_node) {
   const Text<64> device = device_name(listing);
   log_disk(listing);
   LOG(2, "get dev_node = %s", device.c_str());
-  _create_device_node(device);
+  make_node(device);
   const long long size = sys_get_disk_space("/dev/%s", device.c_str());
   LOG(2, "get size = %lld", size);
   if (size < kMinLunSize) return nullptr;
@@ -225,7 +224,7 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
   return ready ? 0 : 1;
 }
 
-int _get_sess_lun_list(LunNode** head, const char* name) {
+int _get_sess_lun_list(LunNode** head, const char* name, DeviceNodeMaker make_node) {
   const LogScope scope;
   if (check_name(head != nullptr ? name : nullptr) != kOk) return kFailed;
   const TempFile path(draw_temp_path("get"));
@@ -238,7 +237,7 @@ int _get_sess_lun_list(LunNode** head, const char* name) {
   DetailedListing listing = kLunListing;
   char line[kListingLineSize];
   while (next_usable_lun(file.get(), &listing, line, name)) {
-    LunNode* node = make_lun_node(listing);
+    LunNode* node = make_lun_node(listing, make_node);
     if (node == nullptr) continue;
     read_fs_type(node);
     if (*head == nullptr)

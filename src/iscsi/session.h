@@ -31,10 +31,14 @@ int ktree_update_dev(TargetEntry* entry);
 // failed.
 int _wait_sess_lun_ready(const char* name, int wait_seconds);
 
-// Stores the usable LUNs of the target's session in `head`, to be freed with lun_node_free_list. Returns 0
+// Makes the device node of a disk by its kernel name, such as sdb. Returns 0 or -1.
+using DeviceNodeMaker = int (*)(const char* name);
+
+// Stores the usable LUNs of the target's session in `head`, to be freed with lun_node_free_list. A disk gets
+// its node by `make_node` before its size is asked for. Returns 0
 // (`head` is left unchanged when there is no session at all); -1 bad arguments; -106 the listing command
 // failed.
-int _get_sess_lun_list(LunNode** head, const char* name);
+int _get_sess_lun_list(LunNode** head, const char* name, DeviceNodeMaker make_node);
 
 // Prints the list for a person; nothing for a null name.
 void print_lun_list(const LunNode* head, const char* name);

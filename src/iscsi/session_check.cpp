@@ -2,11 +2,11 @@
 
 #include <cstdlib>
 
-#include "frontend/request.h"
 #include "iscsi/iscsiadm.h"
 #include "iscsi/session_listing.h"
 #include "support/command.h"
 #include "support/files.h"
+#include "support/program.h"
 #include "support/result.h"
 #include "support/temp_file.h"
 #include "support/text.h"

@@ -1,10 +1,10 @@
 #include "tasks/add.h"
 
 #include "frontend/log.h"
-#include "frontend/request.h"
 #include "iscsi/node.h"
 #include "iscsi/session.h"
 #include "iscsi/session_check.h"
+#include "iscsi/target_status.h"
 #include "support/result.h"
 #include "support/target_hold.h"
 #include "tree/entry.h"
@@ -12,8 +12,8 @@
 #include "tree/search_results.h"
 #include "tree/slots.h"
 #include "tree/state.h"
-#include "tree/status_text.h"
 #include "volume/disk_identity.h"
+#include "volume/lun_status.h"
 #include "volume/mount.h"
 #include "volume/mount_point.h"
 #include "volume/unmount.h"
@@ -63,9 +63,8 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
   return &outcome != &kMountBroken;
 }
 
-// Stores the requested target and LUN, in one step for other runs. Returns 0 with both slots, or -1.
-int _store_requested_lun(int* dbidx, int* lun_dbidx) {
-  TargetEntry* const entry = &request_target;
+// Stores the target and LUN in `entry`, in one step for other runs. Returns 0 with both slots, or -1.
+int _store_lun(TargetEntry* entry, int* dbidx, int* lun_dbidx) {
   mark_target(entry->target_name);
   const SlotsHeld held(SlotsHeld::kChange);
   drop_half_made_luns();
@@ -91,20 +90,21 @@ int _store_requested_lun(int* dbidx, int* lun_dbidx) {
 
 }  // namespace
 
-int task_add() {
+int task_add(const TargetEntry& request) {
   const LogScope scope;
   LOG(2, "start");
+  TargetEntry entry = request;
   int dbidx = 0;
   int lun_dbidx = 0;
-  if (_store_requested_lun(&dbidx, &lun_dbidx) != kOk) return kFailed;
-  ktree_update_lun_status(&request_target, 0);
-  ktree_update_status(&request_target);
+  if (_store_lun(&entry, &dbidx, &lun_dbidx) != kOk) return kFailed;
+  ktree_update_lun_status(&entry, 0);
+  ktree_update_status(&entry);
 
-  const TargetHold hold(request_target.target_name, request_target.lun);
+  const TargetHold hold(entry.target_name, entry.lun);
   int result = kOk;
-  if (check_target_connected(request_target.target_name) == 0) {
-    Target_Config_Gen(&request_target);  // no login: the volume is mounted when the target is next connected
-  } else if (!_mount_added_lun(&request_target, dbidx, lun_dbidx, &result)) {
+  if (check_target_connected(entry.target_name) == 0) {
+    Target_Config_Gen(&entry);  // no login: the volume is mounted when the target is next connected
+  } else if (!_mount_added_lun(&entry, dbidx, lun_dbidx, &result)) {
     return result;
   }
   ktree_update_current_targetcnt();

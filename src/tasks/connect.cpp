@@ -3,16 +3,17 @@
 #include <unistd.h>
 
 #include "frontend/log.h"
-#include "frontend/request.h"
 #include "iscsi/iscsiadm.h"
 #include "iscsi/node.h"
 #include "iscsi/session.h"
+#include "iscsi/target_status.h"
 #include "support/result.h"
 #include "support/target_hold.h"
+#include "tasks/whole_target.h"
 #include "tree/entry.h"
 #include "tree/slots.h"
 #include "tree/state.h"
-#include "tree/status_text.h"
+#include "volume/lun_status.h"
 #include "volume/mount.h"
 #include "volume/session_volumes.h"
 #include "volume/share_services.h"
@@ -87,9 +88,9 @@ int _disconnect_all() {
   return close_sessions(nullptr, kLogoutAllCommand);
 }
 
-int _disconnect_requested() {
+int _disconnect_target(const char* target_name) {
   TargetEntry entry;
-  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) != kOk) return kFailed;
+  if (ktree_get_entry_by_targetname(target_name, &entry) != kOk) return kFailed;
   const BriefTargetHold hold(entry.target_name, is_no_lun_formatting);
   Target_Disconnect(&entry);
   ktree_update_status(&entry);
@@ -98,19 +99,19 @@ int _disconnect_requested() {
 
 }  // namespace
 
-int task_connect() {
+int task_connect(const TargetEntry& request) {
   const LogScope scope;
   LOG(2, "start");
-  const TargetHold hold(request_target.target_name);
+  const TargetHold hold(request.target_name);
   TargetEntry entry;
-  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) != kOk) {
-    LOG(1, "Can not find: %s", request_target.target_name);
+  if (ktree_get_entry_by_targetname(request.target_name, &entry) != kOk) {
+    LOG(1, "Can not find: %s", request.target_name);
     return kTreeFailed;
   }
   ktree_set_connect_state(entry.db_idx, kConnecting);
   ktree_update_status(&entry);
   Target_Config_Gen(&entry);
-  const int login = Target_Connect(&entry);
+  const int login = Target_Connect(&entry, request.target_name);
   if (login != kOk) {
     LOG(0, "Target_Connect failed , target name = %s", entry.target_name);
     ktree_set_connect_state(entry.db_idx, kConnectError);
@@ -125,10 +126,10 @@ int task_connect() {
   return result;
 }
 
-int task_disconnect(int all) {
+int task_disconnect(const char* target_name) {
   const LogScope scope;
   LOG(2, "start");
-  const int result = all != 0 ? _disconnect_all() : _disconnect_requested();
+  const int result = target_name == nullptr ? _disconnect_all() : _disconnect_target(target_name);
   LOG(2, "end");
   return result;
 }

@@ -3,19 +3,20 @@
 #include <unistd.h>
 
 #include "frontend/log.h"
-#include "frontend/request.h"
 #include "iscsi/node.h"
 #include "iscsi/session.h"
+#include "iscsi/target_status.h"
 #include "support/result.h"
 #include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/ftp_share.h"
 #include "tasks/requested_lun.h"
+#include "tasks/whole_target.h"
 #include "tree/entry.h"
 #include "tree/slots.h"
 #include "tree/state.h"
-#include "tree/status_text.h"
 #include "volume/disk_identity.h"
+#include "volume/lun_status.h"
 #include "volume/mount.h"
 #include "volume/unmount.h"
 
@@ -25,13 +26,13 @@ namespace {
 
 // Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry, no device or
 // another disk's; 1 unknown target or LUN.
-int _read_lun_to_format(TargetEntry* entry) {
-  if (request_target.target_name[0] == '\0' || request_target.lun < 0) return kFailed;
+int _read_lun_to_format(const TargetEntry& request, TargetEntry* entry) {
+  if (request.target_name[0] == '\0' || request.lun < 0) return kFailed;
   int dbidx = 0;
   int lun_dbidx = 0;
-  const int found = find_requested_lun(&dbidx, &lun_dbidx);
+  const int found = find_requested_lun(request, &dbidx, &lun_dbidx);
   if (found != kOk) return found;
-  if (read_requested_lun(entry, dbidx, lun_dbidx) != kOk) return kFailed;
+  if (read_requested_lun(request, entry, dbidx, lun_dbidx) != kOk) return kFailed;
   if (entry->dev[0] == '\0') {
     LOG(2, "Can not get device");
     return kFailed;
@@ -74,10 +75,10 @@ void _update_stored_target(TargetEntry* entry) {
 }
 
 // Puts the requested CHAP settings into the target's entry, its slot and its node record.
-void _store_chap(TargetEntry* entry) {
-  entry->chap = request_target.chap;
-  copy_text(entry->chap_name, request_target.chap_name);
-  copy_text(entry->chap_pwd, request_target.chap_pwd);
+void _store_chap(const TargetEntry& request, TargetEntry* entry) {
+  entry->chap = request.chap;
+  copy_text(entry->chap_name, request.chap_name);
+  copy_text(entry->chap_pwd, request.chap_pwd);
   _update_stored_target(entry);
   Target_Config_Gen(entry);
 }
@@ -85,7 +86,7 @@ void _store_chap(TargetEntry* entry) {
 // Logs the target in with its new settings and mounts its volumes. A failure is stored, not returned: the
 // settings are to be kept either way.
 void _reconnect(TargetEntry* entry, int conn_set) {
-  if (Target_Connect(entry) != kOk) {
+  if (Target_Connect(entry, entry->target_name) != kOk) {
     LOG(0, "Reconnect failed , target name = %s", entry->target_name);
     entry->conn_set = 0;
     ktree_record_connect_set(entry);
@@ -101,27 +102,27 @@ void _reconnect(TargetEntry* entry, int conn_set) {
 
 }  // namespace
 
-int task_format() {
+int task_format(const TargetEntry& request) {
   const LogScope scope;
   TargetEntry entry = {};
   LOG(2, "start");
-  const TargetHold hold(request_target.target_name, request_target.lun);
-  int result = _read_lun_to_format(&entry);
+  const TargetHold hold(request.target_name, request.lun);
+  int result = _read_lun_to_format(request, &entry);
   if (result == kOk) result = _remake_volume(&entry);
   LOG(2, "end");
   return result;
 }
 
-int task_modify() {
+int task_modify(const TargetEntry& request) {
   const LogScope scope;
   LOG(2, "start");
-  const TargetHold hold(request_target.target_name);
+  const TargetHold hold(request.target_name);
   int result = kFailed;
   TargetEntry entry;
-  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {
+  if (ktree_get_entry_by_targetname(request.target_name, &entry) == kOk) {
     const int conn_set = entry.conn_set;
     Target_Disconnect(&entry);
-    _store_chap(&entry);
+    _store_chap(request, &entry);
     if (conn_set != 0) _reconnect(&entry, conn_set);
     ktree_update_status(&entry);
     result = kOk;

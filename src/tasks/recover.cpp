@@ -3,10 +3,10 @@
 #include <unistd.h>
 
 #include "frontend/log.h"
-#include "frontend/request.h"
-#include "iscsi/node.h"
+#include "iscsi/target_status.h"
 #include "support/command.h"
 #include "support/locks.h"
+#include "support/program.h"
 #include "support/result.h"
 #include "support/shell_text.h"
 #include "support/target_hold.h"
@@ -14,11 +14,11 @@
 #include "tasks/connect.h"
 #include "tasks/ftp_share.h"
 #include "tasks/requested_lun.h"
+#include "tasks/whole_target.h"
 #include "tree/entry.h"
 #include "tree/recover_queue.h"
 #include "tree/slots.h"
 #include "tree/state.h"
-#include "tree/status_text.h"
 #include "volume/degrade.h"
 #include "volume/format.h"
 #include "volume/unmount.h"
@@ -152,8 +152,7 @@ int _rebuild(TargetEntry* entry) {
   Target_Logout(entry);
   entry->conn_set = 1;
   ktree_set_connect_state(entry->db_idx, kConnecting);
-  request_target = *entry;
-  const int result = task_connect();
+  const int result = task_connect(*entry);
   int state = kDisconnected;
   if (result == kTreeFailed && ktree_get_connect_state(entry->db_idx, &state) == kOk && state != kConnected) {
     ktree_set_connect_state(entry->db_idx, kDisconnected);
@@ -161,9 +160,8 @@ int _rebuild(TargetEntry* entry) {
   return result;
 }
 
-// Recovers the target named in the request record. Returns its result.
-int _recover_requested_target() {
-  const char* name = request_target.target_name;
+// Recovers the target called `name`. Returns its result.
+int _recover_target(const char* name) {
   LOG(1, "==> Processing - %s", name);
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
@@ -179,20 +177,19 @@ int _recover_requested_target() {
   return kOk;
 }
 
-// Recovers the requested target and then whatever is queued. Returns the result of the last one.
-int _drain_queue() {
-  int result = kOk;
-  do {
-    result = _recover_requested_target();
-    request_target = TargetEntry{};
-  } while (ktree_pop_recover_queue(request_target.target_name) == kOk &&
-           request_target.target_name[0] != '\0');
+// Recovers the target called `name` and then whatever is queued. Returns the result of the last one.
+int _drain_queue(const char* name) {
+  int result = _recover_target(name);
+  TargetEntry queued = {};
+  while (ktree_pop_recover_queue(queued.target_name) == kOk && queued.target_name[0] != '\0') {
+    result = _recover_target(queued.target_name);
+    queued = {};
+  }
   return result;
 }
 
-// Leaves the requested target to the run that is recovering. Returns 0, -1 or -103.
-int _queue_requested_target() {
-  const char* name = request_target.target_name;
+// Leaves the target to the run that is recovering. Returns 0, -1 or -103.
+int _queue_target(const char* name) {
   LOG(1, "==> insert queue - %s", name);
   const int lock = wait_flock(kRecoverQueueLock, kQueueLockRetries, kQueueLockWaitUs);
   if (lock < 0) {
@@ -204,9 +201,8 @@ int _queue_requested_target() {
   return result;
 }
 
-// Marks the requested target as being recovered. Returns 0 or kNotStored.
-int _mark_requested_target() {
-  const char* name = request_target.target_name;
+// Marks the target as being recovered. Returns 0 or kNotStored.
+int _mark_target(const char* name) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
     LOG(1, "Can not find: %s", name);
@@ -220,10 +216,10 @@ int _mark_requested_target() {
   return kOk;
 }
 
-// Recovers the requested target and all that are queued, or queues it where another run does.
-int _recover_or_queue(int wait_seconds) {
+// Recovers the target and all that are queued, or queues it where another run does.
+int _recover_or_queue(const char* name, int wait_seconds) {
   if (wait_seconds > 0) {
-    LOG(1, "Sleep %d seconds before add %s to recover queue...", wait_seconds, request_target.target_name);
+    LOG(1, "Sleep %d seconds before add %s to recover queue...", wait_seconds, name);
     sleep(static_cast<unsigned>(wait_seconds));
   }
   if (make_lock_dir() != kOk) {
@@ -231,26 +227,26 @@ int _recover_or_queue(int wait_seconds) {
     return kFailed;
   }
   const int lock = get_recover_cri_flock();
-  if (lock < 0) return _queue_requested_target();
-  const int result = _drain_queue();
+  if (lock < 0) return _queue_target(name);
+  const int result = _drain_queue(name);
   unlock_recover_cri_flock(lock);
   return result;
 }
 
 }  // namespace
 
-int task_oiscsi_evt_reopen() {
+int task_oiscsi_evt_reopen(const char* target_name) {
   const LogScope scope;
   LOG(2, "start");
-  const int result = _mark_requested_target();
+  const int result = _mark_target(target_name);
   LOG(2, "end");
   return result;
 }
 
-int task_oiscsi_evt_recover(int wait_seconds) {
+int task_oiscsi_evt_recover(const char* target_name, int wait_seconds) {
   const LogScope scope;
   LOG(2, "start");
-  const int result = _recover_or_queue(wait_seconds);
+  const int result = _recover_or_queue(target_name, wait_seconds);
   LOG(2, "end");
   return result;
 }

@@ -1,12 +1,12 @@
 #include "tasks/remove.h"
 
 #include "frontend/log.h"
-#include "frontend/request.h"
 #include "iscsi/node.h"
 #include "support/result.h"
 #include "support/target_hold.h"
 #include "support/text.h"
 #include "tasks/requested_lun.h"
+#include "tasks/whole_target.h"
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
@@ -77,22 +77,22 @@ int _remove_target(TargetEntry* entry, int last_lun) {
 }
 
 // Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
-int _remove_lun(int dbidx, int lun_dbidx) {
+int _remove_lun(const TargetEntry& request, int dbidx, int lun_dbidx) {
   TargetEntry lun;
-  if (read_requested_lun(&lun, dbidx, lun_dbidx) != kOk) return kFailed;
+  if (read_requested_lun(request, &lun, dbidx, lun_dbidx) != kOk) return kFailed;
   reload_lun_share(&lun);
   Target_LUN_umount(&lun);
   return _delete_slot(dbidx, lun_dbidx);
 }
 
-int _remove_requested_target(int last_lun) {
+int _remove_named_target(const char* name, int last_lun) {
   LOG(2, "start");
   int result = kNotStored;
   TargetEntry entry;
-  if (ktree_get_entry_by_targetname(request_target.target_name, &entry) == kOk) {
+  if (ktree_get_entry_by_targetname(name, &entry) == kOk) {
     result = _remove_target(&entry, last_lun);
   } else {
-    LOG(1, "Can not find: %s", request_target.target_name);
+    LOG(1, "Can not find: %s", name);
   }
   ktree_update_current_targetcnt();
   LOG(2, "end");
@@ -100,40 +100,40 @@ int _remove_requested_target(int last_lun) {
 }
 
 // Told as the removal of a target is.
-int _remove_target_with_last_lun() {
+int _remove_target_with_last_lun(const TargetEntry& request) {
   const LogScope scope("task_del");
-  return _remove_requested_target(request_target.lun);
+  return _remove_named_target(request.target_name, request.lun);
 }
 
 }  // namespace
 
-int task_del() {
+int task_del(const TargetEntry& request) {
   const LogScope scope;
-  return _remove_requested_target(kEveryLun);
+  return _remove_named_target(request.target_name, kEveryLun);
 }
 
-int task_del_lun() {
+int task_del_lun(const TargetEntry& request) {
   const LogScope scope;
   LOG(2, "start");
-  const BriefTargetHold hold(request_target.target_name, is_no_lun_formatting);
+  const BriefTargetHold hold(request.target_name, is_no_lun_formatting);
   int dbidx = 0;
   int lun_dbidx = 0;
   int result = kFailed;
   bool target_gone = false;
-  if (request_target.lun < 0) {
+  if (request.lun < 0) {
     LOG(0, "lun is not given");
   } else {
-    result = find_requested_lun(&dbidx, &lun_dbidx);
+    result = find_requested_lun(request, &dbidx, &lun_dbidx);
   }
   if (result == kOk && _has_at_most(1, dbidx)) {
-    LOG(2, "removing target %s", request_target.target_name);
+    LOG(2, "removing target %s", request.target_name);
     target_gone = true;
-    result = _remove_target_with_last_lun();
+    result = _remove_target_with_last_lun(request);
   } else if (result == kOk) {
-    result = _remove_lun(dbidx, lun_dbidx);
+    result = _remove_lun(request, dbidx, lun_dbidx);
     target_gone = result == kOk && _has_at_most(0, dbidx);
     // Another run has removed the others meanwhile.
-    if (target_gone) result = _remove_target_with_last_lun();
+    if (target_gone) result = _remove_target_with_last_lun(request);
   }
   if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);
   LOG(2, "end, ret = %d", result);

@@ -3,7 +3,7 @@
 #define REMVOL_TASKS_REPAIR_H
 
 #include "tree/record.h"
-#include "tree/status_text.h"
+#include "tree/state.h"
 
 namespace remvol {
 

@@ -12,10 +12,11 @@ inline constexpr int kNotStored = 1;
 
 // Looks the requested target and LUN up. Returns 0 with both slots; kNotStored, logged in the caller's name,
 // when one of them is unknown: `dbidx` is below 1 when that is the target.
-[[nodiscard]] int find_requested_lun(int* dbidx, int* lun_dbidx);
+[[nodiscard]] int find_requested_lun(const TargetEntry& request, int* dbidx, int* lun_dbidx);
 
 // Fills `entry` with the requested LUN, found in these slots. Returns 0, or -1, logged in the caller's name.
-[[nodiscard]] int read_requested_lun(TargetEntry* entry, int dbidx, int lun_dbidx);
+[[nodiscard]] int read_requested_lun(const TargetEntry& request, TargetEntry* entry, int dbidx,
+                                     int lun_dbidx);
 
 }  // namespace remvol
 

@@ -5,6 +5,7 @@
 
 #include "frontend/log.h"
 #include "iscsi/session.h"
+#include "iscsi/target_status.h"
 #include "support/result.h"
 #include "support/text.h"
 #include "tasks/repair.h"
@@ -14,7 +15,7 @@
 #include "tree/keys.h"
 #include "tree/slots.h"
 #include "tree/state.h"
-#include "tree/status_text.h"
+#include "volume/lun_status.h"
 
 namespace remvol {
 

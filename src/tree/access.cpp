@@ -113,6 +113,11 @@ int tree_write_with_tries_to(const char* socket, const char* key, const char* va
   return kTreeFailed;
 }
 
+int tree_write_logged(const char* key, const char* value) {
+  LOG(1, "ktreec_set %s=%s", key, value);
+  return tree_write_with_tries(key, value);
+}
+
 int tree_delete(const char* key) {
   return ktreec_del(kVolumesSocket, 0, key) == 0 ? kOk : kTreeFailed;
 }

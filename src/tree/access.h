@@ -75,6 +75,9 @@ int tree_read_number(const char* key, int missing);
 int tree_write_with_tries(const char* key, const char* value);
 int tree_write_with_tries_to(const char* socket, const char* key, const char* value);
 
+// The same, and says first what it sets, at level 1.
+int tree_write_logged(const char* key, const char* value);
+
 // Deletes `key` and all below it. Returns 0, or -103 (not logged).
 [[nodiscard]] int tree_delete(const char* key);
 

@@ -10,7 +10,6 @@
 #include "tree/access.h"
 #include "tree/keys.h"
 #include "tree/slots.h"
-#include "tree/state.h"
 
 namespace remvol {
 
@@ -100,13 +99,6 @@ bool may_take_lun_slot(int n, int m, int lun) {
       return false;
   }
   return true;
-}
-
-int read_state(const char* key, bool stored, int* value, int missing) {
-  char text[128];
-  const bool present = stored && tree_read(key, text);
-  *value = present ? atoi(text) : missing;
-  return present ? kOk : kTreeFailed;
 }
 
 // Writes one value of a new entry. Returns whether the tree took it.
@@ -289,30 +281,6 @@ void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx) {
   if (tree_is_missing(right, number)) set_value(right, VOL_AC_RW);
   if (tree_read_number(KeyText(key::kTargetLunCount, n), 0) != count_all_luns_at(n))
     ktree_update_current_luncnt(n);
-}
-
-int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value) {
-  const LogScope scope;
-  const HeldSlot slot(dbidx, lun_dbidx);
-  return read_state(KeyText(key::kLunFormatState, slot.target(), slot.lun()), bool(slot), value, -1);
-}
-
-int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value) {
-  const LogScope scope;
-  const HeldSlot slot(dbidx, lun_dbidx);
-  return read_state(KeyText(key::kLunFormatProgress, slot.target(), slot.lun()), bool(slot), value, 0);
-}
-
-int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value) {
-  const LogScope scope;
-  const HeldSlot slot(dbidx, lun_dbidx);
-  return read_state(KeyText(key::kLunVolumeState, slot.target(), slot.lun()), bool(slot), value, -1);
-}
-
-int ktree_get_connect_state(int dbidx, int* value) {
-  const LogScope scope;
-  const HeldSlot slot(dbidx);
-  return read_state(KeyText(key::kTargetConnState, slot.target()), bool(slot), value, -1);
 }
 
 int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {

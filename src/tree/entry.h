@@ -58,13 +58,6 @@ int ktree_refresh_total_luncnt();
 // Rewrites the target's count of LUNs (every filled slot, gaps or not), then the total. Returns 0 or -103.
 int ktree_update_current_luncnt(int dbidx);
 
-// Read one state number into `value`. Return 0; -103 when the key is missing, `value` is then -1 (format,
-// volume and connect state) or 0 (progress).
-int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value);
-int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value);
-int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value);
-int ktree_get_connect_state(int dbidx, int* value);
-
 // Reads whether the LUN is enabled: `enable` becomes 1 for any non-zero value, else 0. Returns 0; -103 with
 // `enable` 0 when the value is missing or empty (-1 when the read reported failure yet left text in the
 // buffer); -1 for a null `enable` or a dbidx below 1.

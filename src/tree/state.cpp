@@ -1,5 +1,7 @@
 #include "tree/state.h"
 
+#include <cstdlib>
+
 #include "frontend/log.h"
 #include "support/result.h"
 #include "support/text.h"
@@ -9,6 +11,41 @@
 #include "tree/slots.h"
 
 namespace remvol {
+
+namespace {
+
+int read_state(const char* key, bool stored, int* value, int missing) {
+  char text[128];
+  const bool present = stored && tree_read(key, text);
+  *value = present ? atoi(text) : missing;
+  return present ? kOk : kTreeFailed;
+}
+
+}  // namespace
+
+int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value) {
+  const LogScope scope;
+  const HeldSlot slot(dbidx, lun_dbidx);
+  return read_state(KeyText(key::kLunFormatState, slot.target(), slot.lun()), bool(slot), value, -1);
+}
+
+int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value) {
+  const LogScope scope;
+  const HeldSlot slot(dbidx, lun_dbidx);
+  return read_state(KeyText(key::kLunFormatProgress, slot.target(), slot.lun()), bool(slot), value, 0);
+}
+
+int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value) {
+  const LogScope scope;
+  const HeldSlot slot(dbidx, lun_dbidx);
+  return read_state(KeyText(key::kLunVolumeState, slot.target(), slot.lun()), bool(slot), value, -1);
+}
+
+int ktree_get_connect_state(int dbidx, int* value) {
+  const LogScope scope;
+  const HeldSlot slot(dbidx);
+  return read_state(KeyText(key::kTargetConnState, slot.target()), bool(slot), value, -1);
+}
 
 int ktree_set_connect_state(int dbidx, int state) {
   const LogScope scope;
@@ -145,6 +182,16 @@ int ktree_record_connect_set(const TargetEntry* entry) {
   if (tree_write(key, value) == kOk) return kOk;
   LOG(0, "ktreec_set() failed");
   return kTreeFailed;
+}
+
+int read_lun_state(int dbidx, int lun_dbidx, LunState* state) {
+  const SlotsHeld held;
+  int enabled = 0;
+  if (ktree_get_lun_vol_access_right(&state->right, dbidx, lun_dbidx) != kOk) return kFailed;
+  state->enabled = ktree_get_lun_enable(&enabled, dbidx, lun_dbidx) == kOk && enabled != 0;
+  ktree_get_lun_format_state(dbidx, lun_dbidx, &state->format);
+  ktree_get_lun_volume_state(dbidx, lun_dbidx, &state->volume);
+  return kOk;
 }
 
 }  // namespace remvol

@@ -1,5 +1,5 @@
-// Writers of the state numbers of targets and LUNs. Writers of single values try up to 3 times where not
-// said otherwise, and return -103 after the third failure.
+// The states of targets and LUNs: their readers and writers. Writers of single values try up to 3 times where
+// not said otherwise, and return -103 after the third failure.
 #ifndef REMVOL_TREE_STATE_H
 #define REMVOL_TREE_STATE_H
 
@@ -10,6 +10,13 @@ namespace remvol {
 
 // Writes the target's connect state in one try. Returns 0 or -103.
 int ktree_set_connect_state(int dbidx, int state);
+
+// Read one state number into `value`. Return 0; -103 when the key is missing, `value` is then -1 (format,
+// volume and connect state) or 0 (progress).
+int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value);
+int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value);
+int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value);
+int ktree_get_connect_state(int dbidx, int* value);
 
 // Writes the LUN's access right. Returns 0; -1 for a right that is neither VOL_AC_RW nor VOL_AC_RO or a dbidx
 // below 1; -103.
@@ -45,6 +52,17 @@ int ktree_update_initiator_iqn(const char* name);
 
 // Stores the entry's conn_set, in one try. Returns 0 or -103.
 int ktree_record_connect_set(const TargetEntry* entry);
+
+// What is stored of a LUN that its status text is made of.
+struct LunState {
+  int right = VOL_AC_RW;  // AccessRight
+  bool enabled = false;
+  int format = -1;  // FormatState, -1 when missing
+  int volume = -1;  // VolumeState, -1 when missing
+};
+
+// Reads it. Returns 0, or -1 for a dbidx below 1.
+int read_lun_state(int dbidx, int lun_dbidx, LunState* state);
 
 }  // namespace remvol
 

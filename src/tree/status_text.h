@@ -1,38 +1,41 @@
-// The two composers that turn state numbers into the status texts which the user interface shows.
+// The status texts which the user interface shows, composed from state numbers and from what was found out:
+// facts in, text out.
 #ifndef REMVOL_TREE_STATUS_TEXT_H
 #define REMVOL_TREE_STATUS_TEXT_H
 
-#include "tree/record.h"
+#include "support/text.h"
 #include "tree/state.h"
 
 namespace remvol {
 
-// Writes the target's status text and the connect state that goes with it. Returns 0 or -103; the result of
-// the connect-state write, when one was made, hides an earlier failed status write.
-int ktree_update_status(const TargetEntry* entry);
+using StatusText = Text<64>;
 
-// The same for a target whose connect state was just read.
-int ktree_update_status(const TargetEntry* entry, int state);
-
-// Writes the LUN's status text, its file-system type and its size. `formatting` non-zero: the text shows the
-// stored progress. Returns 0, -1 when a dbidx is below 1, or -103 when a write failed (the following writes
-// still run).
-int ktree_update_lun_status(const TargetEntry* entry, int formatting);
-
-// What is stored of a LUN that its status text is made of.
-struct LunState {
-  int right = VOL_AC_RW;  // AccessRight
-  bool enabled = false;
-  int format = -1;  // FormatState, -1 when missing
-  int volume = -1;  // VolumeState, -1 when missing
+// A target's status: its text, and the connect state that goes with it; -1 when that stays as it is.
+struct TargetStatus {
+  const char* text;
+  int state;
 };
 
-// Reads it. Returns 0, or -1 for a dbidx below 1.
-int read_lun_state(int dbidx, int lun_dbidx, LunState* state);
+// The status of a target that is logged in or not and whose connect state is `state`.
+TargetStatus target_status(bool connected, int state);
 
-// Writes the status of a LUN whose state was just read, as formatting when the state says so. Returns 0 or
-// -103.
-int ktree_update_lun_status(const TargetEntry* entry, const LunState& state);
+// The status of a target that is being recovered.
+inline constexpr char kReconnecting[] = "Reconnecting";
+
+// The text of a LUN that is not enabled, and of one without a disk.
+inline constexpr char kLunDisabled[] = "Disable";
+inline constexpr char kLunOffline[] = "Offline";
+
+// The text of a LUN that is being formatted, `progress` in percent.
+StatusText formatting_text(int progress);
+
+// The text of a mounted LUN.
+StatusText running_text(const LunState& state);
+
+// The text of a LUN on which a file system is that is not mounted, and of one on which none was recognised.
+// `progress` in percent counts while the state is kFormatting.
+StatusText unmounted_text(const LunState& state, int progress);
+StatusText unformatted_text(const LunState& state, int progress);
 
 }  // namespace remvol
 

@@ -14,11 +14,11 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/state.h"
-#include "tree/status_text.h"
 #include "volume/disk_identity.h"
 #include "volume/e2fsprogs.h"
 #include "volume/file_systems.h"
 #include "volume/format_progress.h"
+#include "volume/lun_status.h"
 #include "volume/process_check.h"
 
 namespace remvol {

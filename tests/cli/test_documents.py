@@ -61,7 +61,8 @@ def test_the_tree_of_the_example_can_be_set_up(daemon):
 
 
 def test_the_operators_guide_explains_every_status_text():
-    texts = set(re.findall(r'"([A-Z][A-Za-z ]+)"', (TOP / "src/tree/status_text.cpp").read_text()))
+    texts = set(re.findall(r'"([A-Z][A-Za-z ]+)"', "".join(
+        (TOP / "src/tree" / f"status_text.{end}").read_text() for end in ("h", "cpp"))))
     guide = (DOCS / "operators-guide.md").read_text()
     explained = re.findall(r"^\| ([^|]+?) \| [^|]+ \| [^|]*\|$", guide, re.M)
     assert {"Connected", "Running", "Offline"} <= texts

@@ -89,14 +89,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   OPT_FLAG = 0;
   gs_str_command = nullptr;
   output_file = nullptr;
+  command_row = -1;
+  wait_seconds = 0;
   optind = 0;
   opterr = 0;
-  Options options;
-  const ParseEnd end = parse_options(static_cast<int>(words.size()), argv.data(), &options);
-  require(options.command >= -1 && options.command < kCommandCount);
+  const ParseEnd end = parse_options(static_cast<int>(words.size()), argv.data());
+  require(command_row >= -1 && command_row < kCommandCount);
   check_record();
   if (end != ParseEnd::kReady) return 0;
-  if (options.command >= 0) require(strcmp(gs_str_command, kCommands[options.command].name) == 0);
+  if (command_row >= 0) require(strcmp(gs_str_command, kCommands[command_row].name) == 0);
   check_secret(before, words);
   return 0;
 }

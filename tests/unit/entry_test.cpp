@@ -1,5 +1,6 @@
 // Target and LUN entries: filling the record, slots, lookups, counts.
 #include "tree/entry.h"
+#include "tree/state.h"
 
 #include <cstring>
 #include <string>

@@ -2,13 +2,14 @@
 #include <fstream>
 
 #include "fakes.h"
-#include "frontend/request.h"
 #include "iscsi/discovery.h"
 #include "iscsi/iface.h"
 #include "iscsi/node.h"
 #include "iscsi/session.h"
 #include "iscsi/session_check.h"
+#include "support/program.h"
 #include "support/text.h"
+#include "tasks/whole_target.h"
 
 namespace remvol {
 namespace {
@@ -17,12 +18,13 @@ using Texts = std::vector<std::string>;
 
 constexpr char kTarget[] = "iqn.t1";
 
+int make_no_node(const char*) {
+  return 0;
+}
+
 class Iscsi : public fakes::Test {
  protected:
-  Iscsi() {
-    snprintf(program_path, sizeof program_path, "/usr/bin/unit%d", getpid());
-    request_target = TargetEntry();
-  }
+  Iscsi() { snprintf(program_path, sizeof program_path, "/usr/bin/unit%d", getpid()); }
 
   // The messages of the log, without their prefixes.
   static std::string logged(const std::function<void()>& function) {
@@ -79,16 +81,19 @@ TEST_F(Iscsi, WaitOfLessThanNothingDoesNotPoll) {
 
 TEST_F(Iscsi, ListOfNothing) {
   LunNode* head = nullptr;
-  EXPECT_EQ(logged([] { EXPECT_EQ(_get_sess_lun_list(nullptr, kTarget), -1); }), "parameter error\n");
-  EXPECT_EQ(logged([&] { EXPECT_EQ(_get_sess_lun_list(&head, nullptr), -1); }), "parameter error\n");
-  EXPECT_EQ(logged([&] { EXPECT_EQ(_get_sess_lun_list(&head, ""), -1); }), "target name error\n");
+  EXPECT_EQ(logged([] { EXPECT_EQ(_get_sess_lun_list(nullptr, kTarget, make_no_node), -1); }),
+            "parameter error\n");
+  EXPECT_EQ(logged([&] { EXPECT_EQ(_get_sess_lun_list(&head, nullptr, make_no_node), -1); }),
+            "parameter error\n");
+  EXPECT_EQ(logged([&] { EXPECT_EQ(_get_sess_lun_list(&head, "", make_no_node), -1); }),
+            "target name error\n");
 }
 
 TEST_F(Iscsi, ListWithoutAnySessionLeavesTheHead) {
   LunNode node = {};
   LunNode* head = &node;
   fakes::on("system").returns(21 << 8);
-  EXPECT_EQ(_get_sess_lun_list(&head, kTarget), 0);
+  EXPECT_EQ(_get_sess_lun_list(&head, kTarget, make_no_node), 0);
   EXPECT_EQ(head, &node);
 }
 
@@ -96,7 +101,7 @@ TEST_F(Iscsi, ListThatIsEmptyReplacesTheHead) {
   LunNode node = {};
   LunNode* head = &node;
   listing("Target: iqn.other\n");
-  EXPECT_EQ(_get_sess_lun_list(&head, kTarget), 0);
+  EXPECT_EQ(_get_sess_lun_list(&head, kTarget, make_no_node), 0);
   EXPECT_EQ(head, nullptr);
 }
 
@@ -211,11 +216,11 @@ TEST_F(Iscsi, RecordIsDeletedOnItsOwn) {
 TEST_F(Iscsi, LoginOutsideThePorts) {
   for (const int port : {0, 65536, -1}) {
     TargetEntry target = entry("10.0.0.1", port);
-    EXPECT_EQ(_target_login(&target), -1) << port;
+    EXPECT_EQ(_target_login(&target, kTarget), -1) << port;
   }
   TargetEntry nowhere = entry("");
-  EXPECT_EQ(_target_login(&nowhere), -1);
-  EXPECT_EQ(_target_login(nullptr), -1);
+  EXPECT_EQ(_target_login(&nowhere, kTarget), -1);
+  EXPECT_EQ(_target_login(nullptr, kTarget), -1);
   EXPECT_EQ(fakes::calls(), Texts{});
 }
 
