@@ -10,7 +10,7 @@
 #include <cerrno>
 #include <ctime>
 
-#include "shares/lock_file.h"
+#include "common/lock_file.h"
 
 namespace flash {
 namespace {
@@ -84,8 +84,8 @@ UserLock::~UserLock() {
 }
 
 bool UserLock::open_files() {
-  door_ = open_lock_file(kDoor);
-  users_ = open_lock_file(kUsers);
+  door_ = platform::open_lock_file(kDoor);
+  users_ = platform::open_lock_file(kUsers);
   return door_ >= 0 && users_ >= 0;
 }
 
@@ -106,23 +106,23 @@ void UserLock::record(Opened opened) const {
 }
 
 bool UserLock::enter(const char* folder) {
-  if (!open_files() || !take_lock(door_, LOCK_EX)) return false;
-  const bool entered = take_lock(users_, LOCK_SH);
+  if (!open_files() || !platform::take_lock(door_, LOCK_EX)) return false;
+  const bool entered = platform::take_lock(users_, LOCK_SH);
   Opened opened = Opened::kNot;
   const bool writable = make_writable(folder, opened);
   const int error = errno;
   // A record that is there already says how it was opened by somebody who is still inside, or who died.
   if (opened != Opened::kNot) record(opened);
-  take_lock(door_, LOCK_UN);
+  platform::take_lock(door_, LOCK_UN);
   errno = error;
   return entered && writable;
 }
 
 bool UserLock::leave(const char* folder) {
-  if (users_ < 0 || !take_lock(door_, LOCK_EX)) return false;
+  if (users_ < 0 || !platform::take_lock(door_, LOCK_EX)) return false;
   bool closed = true;
   Opened opened = Opened::kNot;
-  if (take_lock(users_, LOCK_EX | LOCK_NB) && recall(opened)) {
+  if (platform::take_lock(users_, LOCK_EX | LOCK_NB) && recall(opened)) {
     const timespec wait{0, kBusyWait};
     for (int tries = 0; !(closed = make_read_only(folder, opened)) && errno == EBUSY && tries < kBusyTries;
          tries++) {
@@ -131,10 +131,10 @@ bool UserLock::leave(const char* folder) {
     if (closed) record(Opened::kNot);
   }
   const int error = errno;
-  take_lock(users_, LOCK_UN);  // for the forked copies as well
+  platform::take_lock(users_, LOCK_UN);  // for the forked copies as well
   close(users_);
   users_ = -1;
-  take_lock(door_, LOCK_UN);
+  platform::take_lock(door_, LOCK_UN);
   errno = error;
   return closed;
 }

@@ -15,8 +15,8 @@
 #include <cstdlib>
 #include <string_view>
 
+#include "common/lock_file.h"
 #include "common/report.h"
-#include "shares/lock_file.h"
 
 namespace shares {
 namespace {
@@ -72,8 +72,8 @@ void log_line(int priority, const char* format, ...) {
 }
 
 bool take_turn(const char* lock_file) {
-  const int fd = open_lock_file(lock_file);
-  return fd >= 0 && take_lock(fd, LOCK_EX);
+  const int fd = platform::open_lock_file(lock_file);
+  return fd >= 0 && platform::take_lock(fd, LOCK_EX);
 }
 
 int run(const std::vector<std::string>& words, std::string* output) {

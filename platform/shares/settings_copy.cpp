@@ -11,8 +11,8 @@
 #include <cstring>
 
 #include "common/fd.h"
+#include "common/lock_file.h"
 #include "common/report.h"
-#include "shares/lock_file.h"
 
 namespace flash {
 namespace {
@@ -28,7 +28,9 @@ constexpr int kMaking = O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
 // made also when the lock cannot be had: the names are each process's own.
 class Turn {
  public:
-  Turn() : file_(open_lock_file(kTurn)) { held_ = file_.ok() && take_lock(file_.get(), LOCK_EX); }
+  Turn() : file_(platform::open_lock_file(kTurn)) {
+    held_ = file_.ok() && platform::take_lock(file_.get(), LOCK_EX);
+  }
   bool held() const { return held_; }
 
  private:

@@ -6,8 +6,8 @@
 #include <algorithm>
 #include <cstdlib>
 
+#include "common/lock_file.h"
 #include "ktree/client/calls.h"
-#include "shares/lock_file.h"
 #include "tree_layout.h"
 
 namespace vv {
@@ -25,8 +25,8 @@ bool forget(const char* path) {
 
 }  // namespace
 
-SearchTurn::SearchTurn() : lock_(open_lock_file("vv-search.lock")) {
-  if (lock_ >= 0) take_lock(lock_, LOCK_EX);
+SearchTurn::SearchTurn() : lock_(platform::open_lock_file("vv-search.lock")) {
+  if (lock_ >= 0) platform::take_lock(lock_, LOCK_EX);
   // A search that fails or finds nothing leaves what an earlier one has found.
   reachable_ = forget(key::kSearch) && forget(key::kLunSearch);
 }

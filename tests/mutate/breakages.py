@@ -11,7 +11,7 @@ SCOPE = [
     for name in ("unmount", "mount_point", "bare_folder", "cover", "format", "partition", "disk_identity", "disk_use",
                  "degrade", "mount", "mount_table", "mount_command")
 ] + ["platform/ktree/client/document.cpp", "src/tree/settings_file.cpp", "platform/shares/flash.cpp",
-     "platform/shares/flashrun.cpp", "platform/shares/lock_file.cpp", "platform/ktree/settings_writer.cpp"] + [
+     "platform/shares/flashrun.cpp", "platform/common/lock_file.cpp", "platform/ktree/settings_writer.cpp"] + [
     f"src/support/{name}.cpp"
     for name in ("run_lock", "target_hold", "locks", "format_semaphore", "temp_file", "files", "shell_text")
 ] + [f"platform/sysaux/{name}.cpp" for name in ("content", "probe", "partitions")] + [

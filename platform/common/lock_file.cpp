@@ -1,4 +1,4 @@
-#include "shares/lock_file.h"
+#include "common/lock_file.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstdio>
 
+namespace platform {
 namespace {
 
 constexpr char kFolder[] = "/run/remvol";
@@ -67,3 +68,5 @@ bool take_lock(int fd, int how) {
   }
   return done == 0;
 }
+
+}  // namespace platform
