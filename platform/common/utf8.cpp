@@ -2,6 +2,7 @@
 
 #include <locale.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cwchar>
 #include <cwctype>
@@ -45,6 +46,14 @@ size_t first_character(std::string_view text, wchar_t& character) {
     return character >= form.smallest && is_character(character) ? size : 0;
   }
   return 0;
+}
+
+// Asked of the locale that is known here, which is not the process's.
+size_t cells_of(wchar_t character) {
+  const locale_t before = uselocale(utf8_locale());
+  const int width = wcwidth(character);
+  uselocale(before);
+  return width > 0 ? static_cast<size_t>(width) : 0;
 }
 
 void append_escaped(std::string& text, std::string_view bytes) {
@@ -119,14 +128,23 @@ size_t cells(std::string_view text) {
   std::wstring characters;
   if (!decode(text, characters)) return text.size();
   if (utf8_locale() == nullptr) return characters.size();
-  const locale_t before = uselocale(utf8_locale());
   size_t sum = 0;
-  for (const wchar_t character : characters) {
-    const int width = wcwidth(character);
-    sum += width > 0 ? static_cast<size_t>(width) : 0;
-  }
-  uselocale(before);
+  for (const wchar_t character : characters) sum += cells_of(character);
   return sum;
+}
+
+size_t first_cells(std::string_view text, size_t most) {
+  std::wstring characters;
+  if (!decode(text, characters)) return std::min(text.size(), most);
+  size_t bytes = 0, sum = 0;
+  while (bytes < text.size()) {
+    wchar_t character = 0;
+    const size_t size = first_character(text.substr(bytes), character);
+    sum += utf8_locale() != nullptr ? cells_of(character) : 1;
+    if (sum > most) break;
+    bytes += size;
+  }
+  return bytes;
 }
 
 std::string printable(std::string_view text) {

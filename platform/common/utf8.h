@@ -28,6 +28,10 @@ wchar_t lower_case(wchar_t character);
 // The terminal cells that the text takes.
 size_t cells(std::string_view text);
 
+// The bytes of the first whole characters of the text that take at most `most` cells, with the marks that
+// belong to them.
+size_t first_cells(std::string_view text, size_t most);
+
 // `text` as it may stand on a line: control and invisible characters as \xHH, and all that is not ASCII as
 // well when it is not UTF-8.
 std::string printable(std::string_view text);

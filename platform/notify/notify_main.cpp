@@ -86,19 +86,21 @@ int look_and_tell() {
 // Of each volume of the target; of the target itself where it has none, or the tree does not answer.
 int tell_of_failed_recovery(const char* target) {
   const std::string name = platform::printable(target);
-  const std::string end =
-      " failed and is not tried again; run: " + platform::printable(vvstat::connect_command(target));
+  const std::string end = " failed and is not tried again; run: ";
   std::vector<Event> events;
   for (const vvstat::Target& each : vvstat::read_status(platform::TreeReader()).targets) {
     if (each.name != target) continue;
     for (const vvstat::Volume& volume : each.volumes) {
       const std::string share = platform::printable(volume.share);
+      const std::string command = platform::printable(vvstat::vv_command("connect", volume.share));
       events.push_back({EventKind::kRecoveryFailed, name, share,
-                        "Volume " + share + ": the recovery of its target" + end});
+                        "Volume " + share + ": the recovery of its target" + end + command});
     }
   }
   if (events.empty()) {
-    events.push_back({EventKind::kRecoveryFailed, name, "", "Target " + name + ": its recovery" + end});
+    const std::string command = platform::printable(vvstat::connect_command(target));
+    events.push_back(
+        {EventKind::kRecoveryFailed, name, "", "Target " + name + ": its recovery" + end + command});
   }
   return tell(events);
 }

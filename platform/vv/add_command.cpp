@@ -98,7 +98,7 @@ int tell_added(Job& job, const std::string& target, const ToolRun& run) {
   if (!run.succeeded()) return job.failed(name + " was not added", explain_run(run, kStoreStep));
   return job.done(name + " is added: LUN " + std::to_string(row->volume->lun) + " of " +
                   platform::printable(target) +
-                  "\nconnect it: " + platform::printable(vv_command("connect", share)));
+                  "\nconnect it: " + platform::printable(vvstat::vv_command("connect", share)));
 }
 
 }  // namespace

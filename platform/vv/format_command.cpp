@@ -45,7 +45,7 @@ DiskContent read_content(const std::string& disk) {
 // none.
 bool find_disk(Job& job, std::string& disk) {
   const Row& row = *job.row;
-  const std::string connect = platform::printable(vv_command("connect", row.volume->share));
+  const std::string connect = platform::printable(vvstat::vv_command("connect", row.volume->share));
   disk = disk_of(row.target->name, row.volume->lun);
   if (disk.empty()) {
     return job.refuse(kFailed, platform::printable(row.volume->share) + " has no disk",

@@ -31,10 +31,6 @@ bool is_up(const Row& row) {
 
 }  // namespace
 
-std::string vv_command(const char* command, const std::string& name) {
-  return std::string("vv ") + command + " " + vvstat::quoted(name);
-}
-
 std::string why_unreachable(const char* tree, const char* unit) {
   if (geteuid() != 0) return "only root may do this";
   return std::string("the ") + tree + " tree cannot be reached; see systemctl status " + unit;

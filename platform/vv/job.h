@@ -59,9 +59,6 @@ class Job {
   KernelLog kernel_;
 };
 
-// "vv connect Photos": the command for a shell.
-std::string vv_command(const char* command, const std::string& name);
-
 // Why the tree cannot be read, for a message.
 std::string why_unreachable(const char* tree, const char* unit);
 

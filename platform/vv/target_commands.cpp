@@ -44,7 +44,7 @@ int password(const Options& options) {
   }
   if (target.wanted) return job.tell_brought_up(target.name, job.row != nullptr ? options.name : "", run);
   return job.done("the password is stored\nconnect it: " +
-                  platform::printable(vv_command("connect", options.name)));
+                  platform::printable(vvstat::vv_command("connect", options.name)));
 }
 
 int rename_portal(const Options& options) {
@@ -62,7 +62,7 @@ int rename_portal(const Options& options) {
     return job.failed(name + " is connected, and its portal is not changed",
                       {kStoreStep,
                        "a portal is changed while the target is not connected",
-                       platform::printable(vv_command("disconnect", options.name)),
+                       platform::printable(vvstat::vv_command("disconnect", options.name)),
                        {}});
   }
   const ToolRun run = job.run(modify_address_arguments(target, portal), target);
@@ -72,8 +72,8 @@ int rename_portal(const Options& options) {
   if (!run.succeeded() || now == nullptr || stored_portal(now->address, now->port).text() != portal.text()) {
     return job.failed("the portal of " + name + " is not changed", explain_run(run, kDiscoveryStep));
   }
-  return job.done(name + " is reached at " + portal.text() +
-                  " from now on\nconnect it: " + platform::printable(vv_command("connect", options.name)));
+  return job.done(name + " is reached at " + portal.text() + " from now on\nconnect it: " +
+                  platform::printable(vvstat::vv_command("connect", options.name)));
 }
 
 }  // namespace vv

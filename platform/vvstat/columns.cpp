@@ -4,6 +4,7 @@
 #include <strings.h>
 
 #include <algorithm>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <iterator>
@@ -12,7 +13,9 @@
 #include "common/scols.h"
 #include "common/utf8.h"
 #include "tree_layout.h"
+#include "vvstat/folding.h"
 #include "vvstat/moment.h"
+#include "vvstat/widths.h"
 
 namespace vvstat {
 namespace {
@@ -46,8 +49,7 @@ std::string percent(const Row& row) {
 struct Column {
   const char* name;
   const char* what;
-  double width;  // of a text when the line is full: below 1 a part of the line, and cut first; else cells; 0:
-                 // never cut
+  size_t least;  // cells, which a text that is cut keeps; 0: it is never cut
   int type;      // in JSON
   bool right;
   std::string (*text)(const Row& row, const Layout& layout);
@@ -59,7 +61,8 @@ constexpr size_t kNameWidth = 13;  // more than the longest name has
 
 // The first ones are the usual ones of a table.
 constexpr size_t kUsual = 7;
-constexpr size_t kTarget = 7;
+constexpr size_t kShare = 0, kStatus = 1, kTarget = 7;
+constexpr size_t kFirst = 2;  // of these, share and status, nothing else is as important
 
 constexpr Column kColumns[] = {
     {"SHARE", "the volume's share name", 12, kText, false,
@@ -75,26 +78,26 @@ constexpr Column kColumns[] = {
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? std::to_string(row.volume->lun) : std::string();
      }},
-    {"PORTAL", "address and port of the target's portal, as it is stored", 0.2, kText, false,
+    {"PORTAL", "address and port of the target's portal, as it is stored", 13, kText, false,
      [](const Row& row, const Layout&) {
        return word(!row.target->address.empty(),
                    row.target->address + ":" + std::to_string(row.target->port));
      }},
-    {"TARGET", "the target's name", 0.3, kText, false,
+    {"TARGET", "the target's name", 20, kText, false,
      [](const Row& row, const Layout&) { return row.target->name; }},
     {"HEALTHY", "nothing is wrong, or it is not wanted", 0, kFlag, true,
      [](const Row& row, const Layout&) { return flag(row.healthy()); }},
     {"WANTED", "it should be connected, and is not switched off", 0, kFlag, true,
      [](const Row& row, const Layout&) { return flag(row.wanted); }},
-    {"PROBLEM", "what is wrong", 0.3, kText, false,
+    {"PROBLEM", "what is wrong", 24, kText, false,
      [](const Row& row, const Layout&) { return row.problem.what; }},
-    {"ADVICE", "what to do about it", 0.3, kText, false,
+    {"ADVICE", "what to do about it", 24, kText, false,
      [](const Row& row, const Layout&) { return row.problem.advice; }},
-    {"COMMAND", "the command that does it", 0.3, kText, false,
+    {"COMMAND", "the command that does it", 24, kText, false,
      [](const Row& row, const Layout&) { return row.problem.command; }},
     {"SINCE", "since when it is healthy, or not", 0, kText, false,
      [](const Row& row, const Layout& layout) { return moment_text(row.since, layout); }},
-    {"LAST-ERROR", "what was wrong with it last", 0.3, kText, false,
+    {"LAST-ERROR", "what was wrong with it last", 24, kText, false,
      [](const Row& row, const Layout&) { return row.error; }},
     {"ERROR-TIME", "when that began", 0, kText, false,
      [](const Row& row, const Layout& layout) { return moment_text(row.error_time, layout); }},
@@ -102,11 +105,11 @@ constexpr Column kColumns[] = {
      [](const Row& row, const Layout&) { return flag(row.mounted); }},
     {"RO", "it cannot be written", 0, kFlag, true,
      [](const Row& row, const Layout&) { return flag(row.read_only); }},
-    {"MOUNTPOINT", "where it is mounted", 0.2, kText, false,
+    {"MOUNTPOINT", "where it is mounted", 12, kText, false,
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->mount_point : std::string();
      }},
-    {"OPTIONS", "the options that it is mounted with", 0.2, kText, false,
+    {"OPTIONS", "the options that it is mounted with", 12, kText, false,
      [](const Row& row, const Layout&) { return row.options; }},
     {"DEVICE", "name of its disk", 0, kText, false,
      [](const Row& row, const Layout&) {
@@ -123,15 +126,15 @@ constexpr Column kColumns[] = {
      }},
     {"SESSION", "the kernel's word for the session's state", 0, kText, false,
      [](const Row& row, const Layout&) { return row.session; }},
-    {"ADDRESS", "the address that the session is connected with", 0.2, kText, false,
+    {"ADDRESS", "the address that the session is connected with", 12, kText, false,
      [](const Row& row, const Layout&) { return row.address; }},
-    {"TREE-STATUS", "the volume's status as the configuration tree has it", 0.2, kText, false,
+    {"TREE-STATUS", "the volume's status as the configuration tree has it", 14, kText, false,
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->status : std::string();
      }},
-    {"TREE-TARGET", "the target's status as the configuration tree has it", 0.2, kText, false,
+    {"TREE-TARGET", "the target's status as the configuration tree has it", 14, kText, false,
      [](const Row& row, const Layout&) { return row.target->status; }},
-    {"OTHERWISE", "how the configuration tree has it, where that is not how it is", 0.2, kText, false,
+    {"OTHERWISE", "how the configuration tree has it, where that is not how it is", 24, kText, false,
      [](const Row& row, const Layout&) { return row.otherwise; }},
 };
 
@@ -161,16 +164,20 @@ std::vector<size_t> first_columns(size_t count) {
   return columns;
 }
 
-// The cells that the columns take when nothing is cut; one with a width is never narrower.
+// The cells that a column takes as it is. Share and status have theirs in any case: they are there again and
+// again.
+Wish wish_of(const std::vector<Row>& rows, size_t number, const Layout& layout) {
+  const Column& column = kColumns[number];
+  size_t natural = std::string_view(column.name).size();
+  for (const Row& row : rows) natural = std::max(natural, platform::cells(cell(column, row, layout)));
+  if (number == kShare || number == kStatus) natural = std::max(natural, column.least);
+  return {column.least != 0 ? std::min(natural, column.least) : natural, natural};
+}
+
 size_t natural_width(const std::vector<Row>& rows, const std::vector<size_t>& columns, const Layout& layout) {
   size_t sum = 0;
-  for (const size_t column : columns) {
-    size_t width =
-        std::max(std::string_view(kColumns[column].name).size(), static_cast<size_t>(kColumns[column].width));
-    for (const Row& row : rows) width = std::max(width, platform::cells(cell(kColumns[column], row, layout)));
-    sum += width + 1;
-  }
-  return sum;
+  for (const size_t column : columns) sum += wish_of(rows, column, layout).natural + 1;
+  return sum == 0 ? 0 : sum - 1;
 }
 
 std::vector<size_t> columns_of(const std::vector<Row>& rows, const Layout& layout) {
@@ -183,22 +190,87 @@ std::vector<size_t> columns_of(const std::vector<Row>& rows, const Layout& layou
   return columns;
 }
 
-bool add_column(libscols_table* table, const Column& column) {
-  const int flags = (column.right ? SCOLS_FL_RIGHT : 0) | (column.width > 0 ? SCOLS_FL_TRUNC : 0);
-  libscols_column* added = scols_table_new_column(table, column.name, column.width, flags);
+// A column in a table. Of the library's own ways to cut a text none is the same in all its versions, so it
+// gets texts that fit.
+struct Place {
+  size_t column;
+  size_t width;  // cells; what is longer is cut
+};
+
+constexpr size_t kUncut = SIZE_MAX;
+
+// The order of importance: that of the line, but what was asked for beside the usual ones follows the status.
+std::vector<size_t> by_importance(std::vector<size_t> columns, const Layout& layout) {
+  if (layout.added) {
+    std::rotate(columns.begin() + kFirst, columns.begin() + static_cast<long>(kUsual), columns.end());
+  }
+  return columns;
+}
+
+// What was asked for is not cut, unless it were left out for that.
+std::vector<size_t> widths_of(const std::vector<Wish>& wishes, size_t asked_for, const Layout& layout) {
+  if (!layout.added) return fitting_widths(wishes, layout.width);
+  std::vector<Wish> uncut = wishes;
+  for (size_t at = kFirst; at < kFirst + asked_for; at++) uncut[at].least = uncut[at].natural;
+  const std::vector<size_t> widths = fitting_widths(uncut, layout.width);
+  return widths[kFirst + asked_for - 1] != 0 ? widths : fitting_widths(wishes, layout.width);
+}
+
+std::vector<Place> places_of(const std::vector<Row>& rows, const Layout& layout) {
+  const std::vector<size_t> columns = columns_of(rows, layout);
+  std::vector<Place> places;
+  if (layout.form != Form::kTable) {
+    for (const size_t column : columns) places.push_back({column, kUncut});
+    return places;
+  }
+  const std::vector<size_t> order = by_importance(columns, layout);
+  std::vector<Wish> wishes;
+  for (const size_t column : order) wishes.push_back(wish_of(rows, column, layout));
+  const std::vector<size_t> widths = widths_of(wishes, columns.size() - kUsual, layout);
+  for (const size_t column : columns) {
+    const size_t at = static_cast<size_t>(std::find(order.begin(), order.end(), column) - order.begin());
+    if (widths[at] != 0) places.push_back({column, widths[at]});
+  }
+  return places;
+}
+
+// "NAME  value", folded beside the name, or below it where there is no room beside.
+std::string line_of_block(const Column& column, const std::string& value, size_t width) {
+  const bool is_beside = width >= 2 * kNameWidth;
+  std::string name = column.name;
+  is_beside ? name.append(kNameWidth - name.size(), ' ') : name.append("\n");
+  const size_t indent = is_beside ? kNameWidth : 0;
+  if (platform::cells(value) + indent <= width) return name + value + "\n";
+  const Indents indents{indent, indent};
+  const std::string lines = std::string_view(column.name) == "COMMAND" ? folded_command(value, indents, width)
+                                                                       : folded(value, indents, width);
+  return name + lines.substr(indent);
+}
+
+// A text that is cut says so.
+std::string cut(const std::string& text, size_t width) {
+  if (width == kUncut || platform::cells(text) <= width) return text;
+  return text.substr(0, platform::first_cells(text, width - 1)) + "~";
+}
+
+bool add_column(libscols_table* table, const Place& place) {
+  const Column& column = kColumns[place.column];
+  const std::string name = std::string(column.name).substr(0, place.width);
+  const bool is_steady = place.width != kUncut && (place.column == kShare || place.column == kStatus);
+  libscols_column* added =
+      scols_table_new_column(table, name.c_str(), is_steady ? static_cast<double>(place.width) : 0,
+                             (column.right ? SCOLS_FL_RIGHT : 0) | (column.least != 0 ? SCOLS_FL_TRUNC : 0));
   return added != nullptr && scols_column_set_json_type(added, column.type) == 0;
 }
 
-bool add_row(libscols_table* table, const Row& row, const std::vector<size_t>& columns,
-             const Layout& layout) {
+bool add_row(libscols_table* table, const Row& row, const std::vector<Place>& places, const Layout& layout) {
   libscols_line* line = scols_table_new_line(table, nullptr);
   if (line == nullptr) return false;
-  for (size_t at = 0; at < columns.size(); at++) {
-    const Column& column = kColumns[columns[at]];
-    const std::string text = cell(column, row, layout);
+  for (size_t at = 0; at < places.size(); at++) {
+    const std::string text = cut(cell(kColumns[places[at].column], row, layout), places[at].width);
     if (text.empty()) continue;
     if (scols_line_set_data(line, at, text.c_str()) != 0) return false;
-    if (columns[at] == find_column("STATUS") && row.wanted) {
+    if (places[at].column == kStatus && row.wanted) {
       scols_cell_set_color(scols_line_get_cell(line, at), row.healthy() ? kGood : kBad);
     }
   }
@@ -207,10 +279,10 @@ bool add_row(libscols_table* table, const Row& row, const std::vector<size_t>& c
 
 platform::ScolsTable table_of(const std::vector<Row>& rows, const Layout& layout) {
   platform::ScolsTable table(scols_new_table());
-  const std::vector<size_t> columns = columns_of(rows, layout);
+  const std::vector<Place> places = places_of(rows, layout);
   bool good = table != nullptr && scols_table_set_name(table.get(), "volumes") == 0;
-  for (const size_t column : columns) good = good && add_column(table.get(), kColumns[column]);
-  for (const Row& row : rows) good = good && add_row(table.get(), row, columns, layout);
+  for (const Place& place : places) good = good && add_column(table.get(), place);
+  for (const Row& row : rows) good = good && add_row(table.get(), row, places, layout);
   return good ? std::move(table) : nullptr;
 }
 
@@ -228,7 +300,8 @@ std::string readable_size(unsigned long long bytes) {
 
 bool choose_columns(std::string_view names, Layout& layout, std::string& unknown) {
   layout.columns.clear();
-  if (names.starts_with('+')) {
+  layout.added = names.starts_with('+');
+  if (layout.added) {
     layout.columns = first_columns(kUsual);
     names.remove_prefix(1);
   }
@@ -276,16 +349,17 @@ std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {
   return std::string(text).append("\n");
 }
 
-std::string block(const Row& row, bool bytes) {
-  Layout layout;
-  layout.bytes = bytes;
+std::string block(const Row& row, const Layout& layout) {
+  const std::vector<size_t> columns =
+      layout.columns.empty() ? first_columns(std::size(kColumns)) : layout.columns;
   std::string text;
-  for (const Column& column : kColumns) {
-    const std::string value = cell(column, row, layout);
-    if (value.empty()) continue;
-    text += column.name;
-    text.append(kNameWidth - std::string_view(column.name).size(), ' ');
-    text += value + "\n";
+  for (const size_t number : columns) {
+    const std::string value = cell(kColumns[number], row, layout);
+    if (!layout.headings) {
+      text += value + "\n";
+    } else if (!value.empty()) {
+      text += line_of_block(kColumns[number], value, layout.width);
+    }
   }
   return text;
 }

@@ -9,13 +9,14 @@ namespace {
 
 const Problem kNone;
 
-std::string connect_command_of(const Target& target) {
-  return connect_command(target.name);
+// By the name of a volume's share, which is shorter than its target's.
+std::string connect_command_of(const Target& target, const Volume* volume) {
+  return volume != nullptr ? vv_command("connect", volume->share) : connect_command(target.name);
 }
 
 // A connection alone leaves what is mounted as it is.
-std::string mount_anew(const Target& target) {
-  return "remvol --disconnect -n " + quoted(target.name) + " && " + connect_command_of(target);
+std::string mount_anew(const Volume& volume) {
+  return vv_command("disconnect", volume.share) + " && " + vv_command("connect", volume.share);
 }
 
 // The tool stores that a target is not to be connected when somebody disconnects it, but also when a login
@@ -31,13 +32,14 @@ constexpr char kHealsItself[] = "look at the network and the storage server; it 
 
 // It stores the same when a session shows no disk at start-up; only the volumes' state tells that from a
 // disconnection.
-Problem given_up(const Target& target) {
+Problem given_up(const Target& target, const Volume& volume) {
   return {Ailment::kFailed, "Given Up", "was given up at start-up: its target showed no disk",
-          "see whether the storage server still offers its LUNs", connect_command_of(target)};
+          "see whether the storage server still offers its LUNs", connect_command_of(target, &volume)};
 }
 
-// Nothing of a target's volumes can be had while it has a problem.
-Problem problem_of(const Target& target, const TargetFacts& facts) {
+// Nothing of a target's volumes can be had while it has a problem. `volume` is the one whose problem it is;
+// null: the target has none.
+Problem problem_of_target(const Target& target, const Volume* volume, const TargetFacts& facts) {
   switch (target.connect_state) {
     case remvol::kConnected:
       break;
@@ -47,13 +49,14 @@ Problem problem_of(const Target& target, const TargetFacts& facts) {
       return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
     case remvol::kConnectError:
       return {Ailment::kFailed, "Connect Error", "the login failed",
-              "check the address, the password and the cable", connect_command_of(target)};
+              "check the address, the password and the cable", connect_command_of(target, volume)};
     default:
-      return {Ailment::kFailed, "Disconnected", "is not connected", "connect it", connect_command_of(target)};
+      return {Ailment::kFailed, "Disconnected", "is not connected", "connect it",
+              connect_command_of(target, volume)};
   }
   if (facts.session.empty()) {
     return {Ailment::kLost, "No Session", "the target's session is gone, although nobody disconnected it",
-            "connect it again", connect_command_of(target)};
+            "connect it again", connect_command_of(target, volume)};
   }
   if (facts.session != "LOGGED_IN") {
     return {Ailment::kLost, "Reconnecting", "the connection was lost", kHealsItself, ""};
@@ -62,8 +65,7 @@ Problem problem_of(const Target& target, const TargetFacts& facts) {
 }
 
 Problem problem_of_unmounted(const Target& target, const Volume& volume) {
-  const std::string format =
-      "remvol --format -n " + quoted(target.name) + " -l " + std::to_string(volume.lun);
+  const std::string format = vv_command("format --destroy-data", volume.share);
   if (volume.format_state == remvol::kFormatFailed) {
     return {Ailment::kFailed, "Format Failed", "its format failed",
             "look at the storage server and the kernel's log", format};
@@ -74,13 +76,14 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume) {
   }
   if (volume.volume_state == remvol::kVolumeFailed) {
     return {Ailment::kFailed, "Failed", "its partition, format or mount failed",
-            "look at the kernel's log for errors of the disk", connect_command_of(target)};
+            "look at the kernel's log for errors of the disk", connect_command_of(target, &volume)};
   }
   if (volume.device.empty()) {
     return {Ailment::kFailed, "No Disk", "its LUN has no disk here",
-            "see whether the storage server still offers it", connect_command_of(target)};
+            "see whether the storage server still offers it", connect_command_of(target, &volume)};
   }
-  return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again", connect_command_of(target)};
+  return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again",
+          connect_command_of(target, &volume)};
 }
 
 Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {
@@ -97,19 +100,19 @@ Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts
   if (!facts.mounted) return problem_of_unmounted(target, volume);
   if (facts.disk_lost) {
     return {Ailment::kFailed, "No Disk", "its disk is gone, though its target is connected",
-            "have it mounted anew", mount_anew(target)};
+            "have it mounted anew", mount_anew(volume)};
   }
   if (facts.shut_down) {
     return {Ailment::kFailed, "Shut Down", "its file system has shut itself down after an error",
             "have it mounted anew; if it shuts itself down again, check its file system with xfs_repair",
-            mount_anew(target)};
+            mount_anew(volume)};
   }
   // A write-protected LUN is read-only from the beginning, and the tree says so.
   if (facts.read_only && !(facts.disk_read_only && volume.read_only)) {
     return {Ailment::kReadOnly, "Read Only",
             "became read-only: its file system has errors, or the LUN was write-protected",
             "have it mounted anew; if it becomes so again, check its file system with e2fsck",
-            mount_anew(target)};
+            mount_anew(volume)};
   }
   return kNone;
 }
@@ -120,10 +123,10 @@ std::string otherwise(const Row& row, const std::string& text) {
   return "the configuration tree says \"" + text + "\"";
 }
 
-Row row_of(const Target& target, const TargetFacts& facts) {
-  Row row{&target,           nullptr, target.status, facts.session, facts.address, false, false, 0, 0,
+Row row_of(const Target& target, const TargetFacts& facts, const Volume* volume) {
+  Row row{&target,           volume, target.status, facts.session, facts.address, false, false, 0, 0,
           is_wanted(target), {}};
-  if (row.wanted) row.problem = problem_of(target, facts);
+  if (row.wanted) row.problem = problem_of_target(target, volume, facts);
   if (!row.healthy()) row.status = row.problem.status;
   row.otherwise = otherwise(row, target.status);
   return row;
@@ -136,11 +139,10 @@ std::string status_of(const Volume& volume, const Row& row) {
   return tells_so && !volume.status.empty() ? volume.status : row.problem.status;
 }
 
-Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
+Row row_of_volume(const Target& target, const TargetFacts& target_facts, size_t at) {
   const Volume& volume = target.volumes[at];
   const VolumeFacts& facts = target_facts.volumes[at];
-  Row row = row_of(target, target_facts);
-  row.volume = &volume;
+  Row row = row_of(target, target_facts, &volume);
   row.mounted = facts.mounted;
   row.read_only = facts.mounted ? facts.read_only : volume.read_only;
   row.used = facts.used;
@@ -149,7 +151,7 @@ Row row_of(const Target& target, const TargetFacts& target_facts, size_t at) {
   row.options = facts.options;
   if (!row.wanted && volume.volume_state == remvol::kVolumeLost) {
     row.wanted = true;
-    row.problem = given_up(target);
+    row.problem = given_up(target, volume);
   }
   row.wanted = row.wanted && volume.enabled;
   if (!row.wanted) row.problem = kNone;
@@ -166,8 +168,8 @@ std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& fa
   std::vector<Row> rows;
   for (size_t at = 0; at < status.targets.size(); at++) {
     const Target& target = status.targets[at];
-    if (target.volumes.empty()) rows.push_back(row_of(target, facts[at]));
-    for (size_t n = 0; n < target.volumes.size(); n++) rows.push_back(row_of(target, facts[at], n));
+    if (target.volumes.empty()) rows.push_back(row_of(target, facts[at], nullptr));
+    for (size_t n = 0; n < target.volumes.size(); n++) rows.push_back(row_of_volume(target, facts[at], n));
   }
   return rows;
 }
@@ -178,6 +180,10 @@ std::string quoted(const std::string& name) {
   std::string word = "'";
   for (const char byte : name) byte == '\'' ? word += "'\\''" : word += byte;
   return word += "'";
+}
+
+std::string vv_command(const std::string& command, const std::string& name) {
+  return "vv " + command + (name.starts_with('-') ? " -- " : " ") + quoted(name);
 }
 
 std::string connect_command(const std::string& target_name) {

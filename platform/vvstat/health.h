@@ -60,8 +60,11 @@ std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& fa
 // A name as a word of the shell, since people copy commands.
 std::string quoted(const std::string& name);
 
-// The command that connects the target, to be given to a shell: the name is one word of it, whatever it
-// holds.
+// The command of vv(8), such as "connect", for a share or a target, to be given to a shell: the name is one
+// word of it, whatever it holds.
+std::string vv_command(const std::string& command, const std::string& name);
+
+// The command that connects a target without volumes, of which vv has no share to show.
 std::string connect_command(const std::string& target_name);
 
 // True when nothing that is wanted has a problem.

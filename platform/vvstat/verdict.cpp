@@ -3,6 +3,7 @@
 #include <string_view>
 
 #include "common/utf8.h"
+#include "vvstat/folding.h"
 #include "vvstat/moment.h"
 
 namespace vvstat {
@@ -19,29 +20,6 @@ Counts count(const std::vector<Row>& rows) {
     counts.ailing += row.healthy() ? 0 : 1;
   }
   return counts;
-}
-
-// Folds `text` between words; further lines begin with `indent` blanks.
-std::string folded(std::string_view text, size_t indent, size_t width) {
-  std::string out;
-  size_t column = 0;
-  bool first = true;  // of its line
-  for (size_t at = 0; at < text.size();) {
-    const std::string_view word = text.substr(at, text.find(' ', at) - at);
-    const size_t cells = platform::cells(word);
-    if (!first && column + 1 + cells > width) {
-      out += '\n';
-      out.append(indent, ' ');
-      column = indent;
-      first = true;
-    }
-    if (!first) out += ' ';
-    column += cells + (first ? 0 : 1);
-    out += word;
-    first = false;
-    at += word.size() + 1;
-  }
-  return out += '\n';
 }
 
 std::string summary(const std::vector<Row>& rows, time_t now) {
@@ -74,11 +52,12 @@ std::string complaint(const Row& row, time_t now) {
 }  // namespace
 
 std::string verdict(const std::vector<Row>& rows, time_t now, size_t width) {
-  std::string text = folded(summary(rows, now), 0, width);
+  std::string text = folded(summary(rows, now), {}, width);
   for (const Row& row : rows) {
     if (row.healthy()) continue;
-    text += "  " + folded(complaint(row, now), 4, width - 2);
-    if (!row.problem.command.empty()) text += "    " + platform::printable(row.problem.command) + "\n";
+    text += folded(complaint(row, now), {2, 4}, width);
+    const std::string command = platform::printable(row.problem.command);
+    if (!command.empty()) text += folded_command(command, {4, 6}, width);
   }
   return text;
 }

@@ -11,9 +11,8 @@
 namespace vvstat {
 
 // The first line is such as "all 8 healthy, as of 12:34:56" or "2 of 8 need attention, as of 12:34:56"; below
-// it stand, for each of these, what is wrong, since when, and what to do. Lines are folded between words to
-// `width` cells; a word that is longer, such as a target's name, is left whole. Every line is ended by a
-// newline.
+// it stand, for each of these, what is wrong, since when, and what to do. No line is longer than `width`
+// cells; a command that is folded is still one for a shell. Every line is ended by a newline.
 std::string verdict(const std::vector<Row>& rows, time_t now, size_t width);
 
 }  // namespace vvstat

@@ -130,12 +130,13 @@ int show_one(const Options& options) {
     fprintf(stderr, "vvstat: there is no share and no target of this name\n");
     return kFailed;
   }
+  const std::vector<Row> shown = chosen(rows, options.ailing_only);
   if (options.layout.form != Form::kTable) {
-    put(volume_report(rows, options.layout));
+    put(volume_report(shown, options.layout));
   } else {
-    for (const Row& row : rows) {
-      if (&row != rows.data()) put("\n");
-      put(block(row, options.layout.bytes));
+    for (const Row& row : shown) {
+      if (&row != shown.data() && options.layout.headings) put("\n");
+      put(block(row, options.layout));
     }
   }
   return finish(all_healthy(rows) ? 0 : kAiling);

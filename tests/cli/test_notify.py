@@ -166,7 +166,7 @@ def test_a_recovery_that_is_given_up_is_told_of_each_volume(example, journal):  
     assert [(e["EVENT"], e["PRIORITY"], e["TARGET"], e["SHARE"]) for e in entries] == [
         ("recovery-failed", "3", T1_NAME, "Backup"), ("recovery-failed", "3", T1_NAME, "Fotos 日本")]
     assert entries[0]["MESSAGE"] == ("Volume Backup: the recovery of its target failed and is not tried again; "
-                                     f"run: remvol --connect -n {T1_NAME}")
+                                     "run: vv connect Backup")
 
 
 def test_the_command_of_a_message_can_be_copied_whatever_the_name_is(example, journal):  # noqa: F811

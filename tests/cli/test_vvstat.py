@@ -6,6 +6,7 @@ import os
 import pathlib
 import re
 import signal
+import subprocess
 import time
 import unicodedata
 
@@ -130,10 +131,10 @@ def test_somebody_who_may_not_read_the_tree_is_told(example):
 
 # --- what is wrong ---
 
-CONNECT = f"remvol --connect -n {T1_NAME}"
-MOUNT_ANEW = f"remvol --disconnect -n {T1_NAME} && {CONNECT}"
+CONNECT = "vv connect Backup"
+MOUNT_ANEW = f"vv disconnect Backup && {CONNECT}"
 BECAME_READ_ONLY = "became read-only: its file system has errors, or the LUN was write-protected"
-FORMAT = f"remvol --format -n {T1_NAME} -l 0"
+FORMAT = "vv format --destroy-data Backup"
 HEALS = "look at the network and the storage server; it heals by itself"
 
 # Values of the tree, what it is to show of the first volume: status, problem, command.
@@ -350,8 +351,32 @@ def test_only_what_needs_attention(example):
 @pytest.mark.parametrize("name, word", [("iqn.x;reboot", "'iqn.x;reboot'"), ("iqn.$(id)", "'iqn.$(id)'"),
                                         ("iqn.'q'", "'iqn.'\\''q'\\'" + "''"), ("iqn.2-a:b_c", "iqn.2-a:b_c")])
 def test_a_command_can_be_copied_whatever_the_name_is(example, name, word):
-    change(example, {"target": name, "conn_state": "0"})
+    change(example, {"conn_state": "0", "lun/id:1/share": name})
+    assert f"    vv connect {word}\n" in vvstat(example).stdout
+    example.tree.set({f"{T2}/target": name, f"{T2}/conn_set": "1"})
     assert f"    remvol --connect -n {word}\n" in vvstat(example).stdout
+
+
+def test_the_command_of_a_name_that_looks_like_an_option(example):
+    change(example, {"conn_state": "0", "lun/id:1/share": "--json"})
+    assert "    vv connect -- --json\n" in vvstat(example).stdout
+
+
+def commands_in(text):
+    """The words of the commands of a verdict, as a shell takes them."""
+    lines = "".join(re.findall(r"^ *(?:vv|remvol) .*\n(?:(?<=\\\n).*\n)*", text, re.M))
+    shell = 'say() { printf "<%s>" "$@"; echo; }; vv() { say vv "$@"; }; remvol() { say remvol "$@"; }\n'
+    return subprocess.run(["bash", "-c", shell + lines], stdout=subprocess.PIPE, text=True, check=True).stdout
+
+
+@pytest.mark.parametrize("columns", [12, 20, 40, 80])
+@pytest.mark.parametrize("name", ["Backup", "s" * 100, "two words and 'marks'" * 5, "Grüße aus Köln 日本" * 6, "'" * 30])
+def test_a_command_that_is_folded_is_still_one(example, columns, name):
+    change(example, {"conn_state": "0", "lun/id:1/share": name, "lun/id:2/enable": "0"})
+    example.tree.set({f"{T2}/target": LONG_NAME, f"{T2}/conn_set": "1"})
+    text = vvstat(example, env={"COLUMNS": str(columns)}).stdout
+    assert commands_in(text) == f"<vv><connect><{name}>\n<remvol><--connect><-n><{LONG_NAME}>\n"
+    assert max(width(line) for line in text.splitlines()) <= columns
 
 
 # --- since when ---
@@ -538,6 +563,29 @@ def test_everything_of_one_share(example):
     assert done.status == 1 and told["PROBLEM"] == "is not connected" and told["COMMAND"] == CONNECT
 
 
+def test_of_one_share_what_was_asked_for(example):
+    assert vvstat(example, "-o", "STATUS,LUN", "Backup").stdout == "STATUS       Running\nLUN          0\n"
+    assert vvstat(example, "-no", "STATUS,PROBLEM,LUN", "Backup").stdout == "Running\n\n0\n"
+    assert vvstat(example, "-no", "SHARE", T1_NAME).stdout == "Backup\nFotos 日本\n"
+    assert vvstat(example, "-rno", "STATUS", "Backup").stdout == "Running\n"
+
+
+def test_of_one_share_only_what_needs_attention(example):
+    assert (vvstat(example, "-x", "Backup").status, vvstat(example, "-x", "Backup").stdout) == (0, "")
+    change(example, {"lun/id:2/format_state": "4"})
+    done = vvstat(example, "-x", T1_NAME)
+    assert done.status == 1 and re.findall("^SHARE .*", done.stdout, re.M) == ["SHARE        Fotos 日本"]
+    assert [volume["share"] for volume in volumes(example, "-x", T1_NAME)] == ["Fotos 日本"]
+
+
+@pytest.mark.parametrize("columns", [80, 40, 20, 14])
+def test_of_one_share_too_no_line_is_wider_than_the_screen(example, columns):
+    example.tree.set({**LONG_VALUES, f"{T1}/conn_state": "4"})
+    text = vvstat(example, LONG_NAME, env={"COLUMNS": str(columns)}).stdout
+    assert max(width(line) for line in text.splitlines()) <= columns
+    assert LONG_NAME in re.sub(r"\n *", "", text)
+
+
 def test_everything_of_one_target(example):
     done = vvstat(example, T1_NAME)
     assert [block.split("\n")[0].split(None, 1)[1] for block in done.stdout.split("\n\n")] == ["Backup", "Fotos 日本"]
@@ -555,14 +603,45 @@ def test_a_name_that_is_not_there(example):
     assert (done.status, done.stdout, done.stderr) == (2, "", "vvstat: there is no share and no target of this name\n")
 
 
-@pytest.mark.parametrize("columns", [80, 60, None])
-def test_no_row_is_wider_than_the_screen(example, columns):
-    example.tree.set({f"{T1}/target": LONG_NAME, f"{T1}/lun/id:1/share": "s" * 80, f"{T1}/ip": "[fe80::1234:5678:9abc:def0]",
-                      f"{T1}/lun/id:1/status": "Unsupported File System ( Read Only )"})
-    done = vvstat(example, env={"COLUMNS": str(columns) if columns else None})
-    rows = done.stdout.split("\n\n")[0].splitlines()
-    assert all(width(row) <= (columns or 80) for row in rows)
-    assert rows[0].split() == ["SHARE", "STATUS", "USED", "SIZE", "USE%", "LUN", "PORTAL"]
+LONG_VALUES = {f"{T1}/target": LONG_NAME, f"{T1}/lun/id:1/share": "s" * 80, f"{T1}/ip": "[fe80::1234:5678:9abc:def0]",
+               f"{T1}/lun/id:1/status": "Unsupported File System ( Read Only )"}
+USUAL = ["SHARE", "STATUS", "USED", "SIZE", "USE%", "LUN", "PORTAL"]
+
+
+@pytest.mark.parametrize("options", [[], ["-n"], ["-o", "+TARGET,ADVICE,COMMAND"], ["-o", "TARGET,COMMAND,SHARE"], ["-x"]])
+@pytest.mark.parametrize("columns", [200, 80, 60, 40, 30, 20, 12, None])
+def test_no_line_is_wider_than_the_screen(example, columns, options):
+    example.tree.set({**LONG_VALUES, f"{T1}/conn_state": "4"})
+    done = vvstat(example, *options, env={"COLUMNS": str(columns) if columns else None})
+    assert done.status == 1
+    assert max(width(line) for line in done.lines) <= (columns or 80)
+    assert done.stdout.count("the login failed") == 2 or "-n" in options or (columns or 80) < 40
+
+
+@pytest.mark.parametrize("columns, shown", [(80, 7), (60, 7), (54, 6), (46, 6), (45, 5), (42, 5), (41, 4), (37, 4), (36, 3),
+                                            (32, 3), (31, 2), (27, 2), (26, 1), (12, 1), (5, 1), (1, 1)])
+def test_what_matters_least_is_left_out_first(example, columns, shown):
+    example.tree.set(LONG_VALUES)
+    heading, row = vvstat(example, env={"COLUMNS": str(columns)}).lines[:2]
+    assert heading.split() == ([*USUAL][:shown] if columns >= 5 else ["S"])
+    assert row.split()[0] == ("s" * 80)[:len(row.split()[0]) - 1] + "~" and max(width(heading), width(row)) <= columns
+
+
+def test_a_text_that_is_cut_says_so(example):
+    example.tree.set(LONG_VALUES)
+    row = vvstat(example, env={"COLUMNS": "80"}).lines[1]
+    assert re.fullmatch(r"s{11,}~ No Session +1\.5M  20M    8   0 \[fe80::1234:~", row), row
+    row = vvstat(example, env={"COLUMNS": "150"}).lines[1]
+    assert "~" not in row and row.endswith(" [fe80::1234:5678:9abc:def0]:3260")
+
+
+def test_what_was_asked_for_beside_the_usual_is_kept_for_them(example):
+    """What was asked for matters more than what is always there, but for the share and its status."""
+    change(example, {"target": LONG_NAME})
+    heading, row = vvstat(example, "-o", "+TARGET", env={"COLUMNS": "110"}).lines[:2]
+    assert heading.split() == [*USUAL[:5], "TARGET"] and row.endswith(" " + LONG_NAME)
+    heading, row = vvstat(example, "-o", "+TARGET", env={"COLUMNS": "80"}).lines[:2]
+    assert heading.split() == [*USUAL[:6], "TARGET"] and row.endswith("~") and width(row) == 80
 
 
 def test_the_target_is_shown_where_there_is_room(example):
@@ -584,8 +663,8 @@ def test_the_target_takes_the_room_of_nothing_else(example):
 
 def test_sentences_are_folded_to_the_screen(example):
     change(example, {"conn_state": "0"})
-    for line in vvstat(example, env={"COLUMNS": "40"}).stdout.split("\n\n")[1].splitlines():
-        assert width(line) <= 40 or line == f"    {CONNECT}"
+    lines = vvstat(example, env={"COLUMNS": "40"}).stdout.split("\n\n")[1].splitlines()
+    assert all(width(line) <= 40 for line in lines) and f"    {CONNECT}" in lines
 
 
 def test_secrets_are_not_shown(example):

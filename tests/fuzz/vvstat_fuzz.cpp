@@ -70,8 +70,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (size < 3) return 0;
   static const bool ready = (use_utf8(), true);
   require(ready);
-  // Below this width the numbers alone fill the line.
-  constexpr size_t kLeast = 60;
+  // Below this width the names of columns and the marks of a folded command alone fill the line.
+  constexpr size_t kLeast = 12;
   Layout layout;
   layout.width = kLeast + data[0];
   layout.colour = false;
@@ -99,8 +99,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
       check_text(metrics(true, rows, 0), 0);
       break;
     default:
-      check_text(verdict(rows, 0, layout.width), 0);
-      for (const Row& row : first) check_text(block(row, false), 0);
+      check_text(verdict(rows, 0, layout.width), layout.width);
+      for (const Row& row : first) check_text(block(row, layout), layout.width);
   }
   return 0;
 }
