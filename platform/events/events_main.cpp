@@ -27,7 +27,7 @@ using platform::read_sessions;
 constexpr char kNotifier[] = "remvol-notify";
 constexpr int kMuchHurry = 50, kSomeHurry = 1000;  // milliseconds between looks
 
-struct Daemon {
+struct Listener {
   int signals = -1;
   int devices = -1;
   int iscsi = -1;
@@ -76,14 +76,14 @@ void notify(const OrderEnd& end) {
   }
 }
 
-void give_orders(Daemon& daemon) {
+void give_orders(Listener& daemon) {
   Order order;
   while (daemon.targets.next(order)) daemon.targets.started(order.target, start_tool(order));
 }
 
 // The socket is open only while there is a session, so that the kernel module can be unloaded after the last
 // one.
-void follow_sessions(Daemon& daemon, bool any) {
+void follow_sessions(Listener& daemon, bool any) {
   if (!any && daemon.iscsi >= 0) close(daemon.iscsi);
   if (!any) daemon.iscsi = -1;
   if (any && daemon.iscsi < 0) daemon.iscsi = open_iscsi_events();
@@ -92,19 +92,19 @@ void follow_sessions(Daemon& daemon, bool any) {
   daemon.deaf = deaf;
 }
 
-void look(Daemon& daemon) {
+void look(Listener& daemon) {
   follow_sessions(daemon, platform::is_any_session());
   // Read again: a connection may have been lost before the socket was open.
   daemon.targets.look(read_sessions());
 }
 
-void look_after_a_gap(Daemon& daemon) {
+void look_after_a_gap(Listener& daemon) {
   daemon.gap = false;
   follow_sessions(daemon, platform::is_any_session());
   daemon.targets.look_after_a_gap(read_sessions());
 }
 
-void take_signals(Daemon& daemon) {
+void take_signals(Listener& daemon) {
   signalfd_siginfo info;
   while (read(daemon.signals, &info, sizeof info) == sizeof info) {
     if (info.ssi_signo != SIGCHLD) daemon.ended = true;
@@ -118,7 +118,7 @@ void take_signals(Daemon& daemon) {
 
 // Takes all that waits on a socket; `take(message, size)` gets each message.
 template <typename Take>
-void take_messages(Daemon& daemon, int socket, Take take) {
+void take_messages(Listener& daemon, int socket, Take take) {
   static unsigned char buffer[1 << 16];
   size_t size = 0;
   for (;;) {
@@ -141,7 +141,7 @@ void take_messages(Daemon& daemon, int socket, Take take) {
   }
 }
 
-void take_device_events(Daemon& daemon) {
+void take_device_events(Listener& daemon) {
   bool changed = false;
   take_messages(daemon, daemon.devices, [&changed](const unsigned char* message, size_t size) {
     changed = changed || is_session_event(message, size);
@@ -149,7 +149,7 @@ void take_device_events(Daemon& daemon) {
   if (changed) look(daemon);
 }
 
-void take_iscsi_events(Daemon& daemon) {
+void take_iscsi_events(Listener& daemon) {
   take_messages(daemon, daemon.iscsi, [&daemon](const unsigned char* message, size_t size) {
     KernelEvent event{};
     while (take_kernel_event(message, size, event)) {
@@ -158,7 +158,7 @@ void take_iscsi_events(Daemon& daemon) {
   });
 }
 
-int patience(const Daemon& daemon) {
+int patience(const Listener& daemon) {
   switch (daemon.targets.hurry()) {
     case Hurry::kMuch:
       return kMuchHurry;
@@ -169,7 +169,7 @@ int patience(const Daemon& daemon) {
   }
 }
 
-void run(Daemon& daemon) {
+void run(Listener& daemon) {
   look_after_a_gap(daemon);
   while (!daemon.ended) {
     give_orders(daemon);
@@ -183,7 +183,7 @@ void run(Daemon& daemon) {
 }
 
 int serve() {
-  Daemon daemon;
+  Listener daemon;
   daemon.signals = open_signals();
   daemon.devices = open_device_events();
   if (daemon.signals < 0 || daemon.devices < 0) {

@@ -30,11 +30,11 @@
 namespace keeper {
 namespace {
 
-constexpr char kInitiator[] = "iscsid";
+constexpr char kInitiatorDaemon[] = "iscsid";
 constexpr int kLooksWithoutInitiator = 2;
 constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 
-struct Daemon {
+struct Keeper {
   Schedule schedule;
   int signals = -1, devices = -1;
   pid_t process = -1;    // tries a target at this moment
@@ -68,15 +68,15 @@ pid_t start_program(std::initializer_list<const char*> words, const char* progra
 
 // Without the daemon no lost session is healed and none is made. Whoever stops it on purpose stops the tree
 // as well, or is still at work.
-void keep_initiator(Daemon& daemon, bool tree_answers, bool taken_down) {
-  if (!tree_answers || taken_down || runs(kInitiator) || runs(platform::kTool, {"--init"})) {
+void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
+  if (!tree_answers || taken_down || runs(kInitiatorDaemon) || runs(platform::kTool, {"--init"})) {
     daemon.no_initiator = 0;
     return;
   }
   if (++daemon.no_initiator < kLooksWithoutInitiator) return;
   daemon.no_initiator = 0;
-  platform::report(LOG_WARNING, "remvol-keeper: %s is gone, starting another one", kInitiator);
-  start_program({kInitiator, "-f"}, kInitiator);
+  platform::report(LOG_WARNING, "remvol-keeper: %s is gone, starting another one", kInitiatorDaemon);
+  start_program({kInitiatorDaemon, "-f"}, kInitiatorDaemon);
 }
 
 std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
@@ -100,12 +100,12 @@ std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
   return wanted;
 }
 
-void try_again(Daemon& daemon, const Try& next) {
+void try_again(Keeper& daemon, const Try& next) {
   daemon.process = start_program({"remvol-keeper", next.first ? "--try-first" : "--try", next.target.c_str()},
                                  "/proc/self/exe");
 }
 
-void tell(Daemon& daemon) {
+void tell(Keeper& daemon) {
   std::string target;
   for (Change change; (change = daemon.schedule.next_change(target)) != Change::kNone;) {
     if (change == Change::kMissing) {
@@ -118,7 +118,7 @@ void tell(Daemon& daemon) {
   }
 }
 
-void look(Daemon& daemon) {
+void look(Keeper& daemon) {
   const bool taken_down = is_taken_down();
   bool answered = false;
   const std::vector<Wanted> wanted = read_wanted(daemon.first, taken_down, answered);
@@ -130,7 +130,7 @@ void look(Daemon& daemon) {
 }
 
 // Returns false when the daemon is to end.
-bool take_signals(Daemon& daemon) {
+bool take_signals(Keeper& daemon) {
   bool ended = false;
   signalfd_siginfo info;
   while (read(daemon.signals, &info, sizeof info) == sizeof info) ended = ended || info.ssi_signo != SIGCHLD;
@@ -142,7 +142,7 @@ bool take_signals(Daemon& daemon) {
 
 // Waits for the next look: it is due at once when a session comes or goes, so that whoever takes it away is
 // still there.
-bool wait_for_look(Daemon& daemon) {
+bool wait_for_look(Keeper& daemon) {
   static unsigned char buffer[1 << 14];
   const bool hurry = daemon.schedule.anything_missing() || daemon.no_initiator > 0;
   const long due = now() + (hurry ? kHurry : kRest);
@@ -160,7 +160,7 @@ bool wait_for_look(Daemon& daemon) {
   return true;
 }
 
-bool open_inputs(Daemon& daemon) {
+bool open_inputs(Keeper& daemon) {
   sigset_t set;
   sigemptyset(&set);
   for (int number : {SIGTERM, SIGINT, SIGCHLD}) sigaddset(&set, number);
@@ -171,7 +171,7 @@ bool open_inputs(Daemon& daemon) {
 }
 
 int serve() {
-  Daemon daemon;
+  Keeper daemon;
   if (!open_inputs(daemon)) {
     platform::report(LOG_ERR, "remvol-keeper: device events: %s", strerror(errno));
     return 1;

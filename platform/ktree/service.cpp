@@ -59,8 +59,9 @@ Service::Reply Service::carry_out(const Request& request) {
 Service::Reply Service::get(const Request& request) const {
   uint32_t wanted = 0;
   Path path;
-  if (request.value.size() != sizeof wanted || !parse_path(request.path, path))
+  if (request.value.size() != sizeof wanted || !parse_path(request.path, path)) {
     return {ReplyStatus::kRefused, {}};
+  }
   memcpy(&wanted, request.value.data(), sizeof wanted);
   const Node* node = tree_.find(path);
   if (node == nullptr || !node->has_value()) return {ReplyStatus::kMissing, {}};

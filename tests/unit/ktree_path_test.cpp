@@ -58,9 +58,7 @@ TEST(Path, MayBe1023BytesLong) {
 
 TEST(Path, MayHaveAsManyElementsAsFit) {
   std::string text;
-  for (int i = 0; i < 511; i++) {
-    text += "/a";
-  }
+  for (int i = 0; i < 511; i++) text += "/a";
   Path path;
   ASSERT_TRUE(parse_path(text, path));
   EXPECT_EQ(path.depth, 511U);

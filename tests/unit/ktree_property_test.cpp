@@ -27,26 +27,18 @@ struct Model {
 
   Child find(const std::string& wanted, unsigned number) {
     for (Child child = children.begin(); child != children.end(); ++child) {
-      if (child->name == wanted && --number == 0) {
-        return child;
-      }
+      if (child->name == wanted && --number == 0) return child;
     }
     return children.end();
   }
 
   void list(const std::string& path, std::string& out) const {
-    if (value) {
-      out += path + "=" + *value + "\n";
-    }
+    if (value) out += path + "=" + *value + "\n";
     for (auto child = children.begin(); child != children.end(); ++child) {
       unsigned number = 1;
-      for (auto before = children.begin(); before != child; ++before) {
-        number += before->name == child->name;
-      }
+      for (auto before = children.begin(); before != child; ++before) number += before->name == child->name;
       std::string element = "/" + child->name;
-      if (number > 1 || child->name == "id") {
-        element += ":" + std::to_string(number);
-      }
+      if (number > 1 || child->name == "id") element += ":" + std::to_string(number);
       child->list(path + element, out);
     }
   }
@@ -110,9 +102,7 @@ std::string spell(const std::vector<Step>& steps, Random& random) {
   std::string text;
   for (const Step& step : steps) {
     text += "/" + step.name;
-    if (step.number > 1 || random.below(2) == 0) {
-      text += ":" + std::to_string(step.number);
-    }
+    if (step.number > 1 || random.below(2) == 0) text += ":" + std::to_string(step.number);
   }
   return text;
 }
@@ -132,9 +122,7 @@ Model* model_find(Model& root, const std::vector<Step>& steps) {
   Model* node = &root;
   for (const Step& step : steps) {
     auto child = node->find(step.name, step.number);
-    if (child == node->children.end()) {
-      return nullptr;
-    }
+    if (child == node->children.end()) return nullptr;
     node = &*child;
   }
   return node;
@@ -144,9 +132,7 @@ bool model_remove(Model& root, std::vector<Step> steps) {
   const Step last = steps.back();
   steps.pop_back();
   Model* parent = model_find(root, steps);
-  if (parent == nullptr || parent->find(last.name, last.number) == parent->children.end()) {
-    return false;
-  }
+  if (parent == nullptr || parent->find(last.name, last.number) == parent->children.end()) return false;
   parent->children.erase(parent->find(last.name, last.number));
   return true;
 }
@@ -187,12 +173,8 @@ INSTANTIATE_TEST_SUITE_P(Seeds, AgainstModel, testing::Range(0U, 100U));
 
 // A tree of random shape and values.
 void fill(Tree& tree, Random& random) {
-  for (int i = 0; i < 60; i++) {
-    ASSERT_TRUE(set(tree, spell(random.path(), random), random.value()));
-  }
-  for (int i = 0; i < 10; i++) {
-    static_cast<void>(remove(tree, spell(random.path(), random)));
-  }
+  for (int i = 0; i < 60; i++) ASSERT_TRUE(set(tree, spell(random.path(), random), random.value()));
+  for (int i = 0; i < 10; i++) static_cast<void>(remove(tree, spell(random.path(), random)));
 }
 
 class RandomTree : public testing::TestWithParam<unsigned> {};

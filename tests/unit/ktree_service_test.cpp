@@ -59,9 +59,7 @@ TEST(Frame, SizeIsKnownFromFourBytes) {
   const std::string bytes = request(Operation::kGet, "/a", limit(1));
   EXPECT_EQ(request_size(bytes), bytes.size());
   EXPECT_EQ(request_size(bytes.substr(0, 4)), bytes.size());
-  for (size_t size = 0; size < 4; size++) {
-    EXPECT_EQ(request_size(bytes.substr(0, size)), kMoreNeeded);
-  }
+  for (size_t size = 0; size < 4; size++) EXPECT_EQ(request_size(bytes.substr(0, size)), kMoreNeeded);
 }
 
 TEST(Frame, OfAnImpossibleSizeIsNone) {
@@ -142,9 +140,7 @@ TEST_F(ServiceTest, DocumentsNeedAMemoryFile) {
     EXPECT_EQ(call(request(Operation::kList, "/"), document), ReplyStatus::kFailed);
   }
   EXPECT_EQ(call(request(Operation::kDump, ""), sealed), ReplyStatus::kFailed);
-  for (int fd : {null, pipes[0], pipes[1], sealed}) {
-    close(fd);
-  }
+  for (int fd : {null, pipes[0], pipes[1], sealed}) close(fd);
 }
 
 TEST_F(ServiceTest, LoadsWhatItDumped) {

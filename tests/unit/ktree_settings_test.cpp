@@ -22,9 +22,7 @@ std::string round_trip(std::string_view value, bool has_children) {
   Tree tree;
   Tree copy;
   std::string error;
-  if (!set(tree, "/a", value) || (has_children && !set(tree, "/a/b", "child"))) {
-    return "not set";
-  }
+  if (!set(tree, "/a", value) || (has_children && !set(tree, "/a/b", "child"))) return "not set";
   return read_settings(dump(tree), copy, error) ? get(copy, "/a").value_or("no value") : error;
 }
 
@@ -135,9 +133,7 @@ TEST(Dump, GivesAwkwardValuesBack) {
 TEST(Dump, GoesAsDeepAsAPath) {
   Tree tree;
   std::string path;
-  for (int i = 0; i < 511; i++) {
-    path += "/a";
-  }
+  for (int i = 0; i < 511; i++) path += "/a";
   ASSERT_TRUE(set(tree, path, "deep"));
   EXPECT_EQ(loaded(dump(tree)), path + "=deep\n");
 }
@@ -230,9 +226,7 @@ INSTANTIATE_TEST_SUITE_P(
 
 TEST(Load, RefusesMoreThan4096ElementsOfOneName) {
   std::string document = "<config>\n";
-  for (int i = 0; i < 4096; i++) {
-    document += "<id/>\n";
-  }
+  for (int i = 0; i < 4096; i++) document += "<id/>\n";
   Tree tree;
   std::string error;
   EXPECT_TRUE(read_settings(document + "</config>", tree, error)) << error;
@@ -264,9 +258,7 @@ TEST(Load, RefusesAPathThatIsTooLong) {
 
 TEST(Load, RefusesAbsurdDepth) {
   std::string document = "<config>";
-  for (int i = 0; i < 1000000; i++) {
-    document += "<a>";
-  }
+  for (int i = 0; i < 1000000; i++) document += "<a>";
   EXPECT_EQ(loaded(document), "line 1: a path of more than 1023 bytes");
 }
 
@@ -274,9 +266,7 @@ TEST(Load, RefusesATreeThatIsTooLarge) {
   std::string nodes = "<config>";
   for (int i = 0; i < 70; i++) {
     nodes += "<a>";
-    for (int k = 0; k < 4096; k++) {
-      nodes += "<b/>";
-    }
+    for (int k = 0; k < 4096; k++) nodes += "<b/>";
     nodes += "</a>";
   }
   EXPECT_NE(loaded(nodes + "</config>").find("too large"), std::string::npos);

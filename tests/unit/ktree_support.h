@@ -1,5 +1,6 @@
 // Short ways to use a tree in tests.
-#pragma once
+#ifndef TESTS_KTREE_SUPPORT_H
+#define TESTS_KTREE_SUPPORT_H
 
 #include <sys/mman.h>
 #include <unistd.h>
@@ -29,9 +30,7 @@ inline bool remove(Tree& tree, std::string_view text) {
 inline std::optional<std::string> get(const Tree& tree, std::string_view text) {
   Path path;
   const Node* node = parse_path(text, path) ? tree.find(path) : nullptr;
-  if (node == nullptr || !node->has_value()) {
-    return std::nullopt;
-  }
+  if (node == nullptr || !node->has_value()) return std::nullopt;
   return std::string(node->value());
 }
 
@@ -47,9 +46,7 @@ std::string written_by(Write write) {
   std::string text;
   if (write(fd)) {
     text.resize(static_cast<size_t>(lseek(fd, 0, SEEK_END)));
-    if (pread(fd, text.data(), text.size(), 0) != static_cast<ssize_t>(text.size())) {
-      text = "unreadable";
-    }
+    if (pread(fd, text.data(), text.size(), 0) != static_cast<ssize_t>(text.size())) text = "unreadable";
   }
   close(fd);
   return text;
@@ -61,10 +58,10 @@ inline std::string dump(const Tree& tree) {
 
 inline std::string list(const Tree& tree, std::string_view text = "") {
   Path path = {};
-  if (!text.empty() && (!parse_path(text, path) || tree.find(path) == nullptr)) {
-    return "missing";
-  }
+  if (!text.empty() && (!parse_path(text, path) || tree.find(path) == nullptr)) return "missing";
   return written_by([&](int fd) { return write_listing(*tree.find(path), path, fd); });
 }
 
 }  // namespace ktree
+
+#endif

@@ -59,9 +59,7 @@ TEST(Tree, SettingANumberMakesTheOnesBeforeItEmpty) {
 
 TEST(Tree, DeletingTheSecondOfThreeMovesTheThirdDown) {
   Tree tree;
-  for (const char* n : {"1", "2", "3"}) {
-    ASSERT_TRUE(set(tree, std::string("/id:") + n + "/target", n));
-  }
+  for (const char* n : {"1", "2", "3"}) ASSERT_TRUE(set(tree, std::string("/id:") + n + "/target", n));
   ASSERT_TRUE(remove(tree, "/id:2"));
   EXPECT_EQ(get(tree, "/id:1/target"), "1");
   EXPECT_EQ(get(tree, "/id:2/target"), "3");
@@ -111,9 +109,7 @@ TEST(Tree, ASetThatGoesBeyondTheNodesOfATreeChangesNothing) {
   Tree tree;
   ASSERT_TRUE(set(tree, "/a", "kept"));
   std::string path;
-  for (int i = 0; i < 100; i++) {
-    path += "/b:4096";
-  }
+  for (int i = 0; i < 100; i++) path += "/b:4096";
   EXPECT_FALSE(set(tree, path, "x"));
   EXPECT_EQ(tree.node_count(), 1U);
   EXPECT_EQ(list(tree), "/a=kept\n");
@@ -123,9 +119,7 @@ TEST(Tree, ASetThatGoesBeyondTheBytesOfATreeChangesNothing) {
   Tree tree;
   const std::string value(kMaxValueBytes, 'x');
   size_t stored = 0;
-  while (set(tree, "/v:" + std::to_string(stored + 1), value)) {
-    stored++;
-  }
+  while (set(tree, "/v:" + std::to_string(stored + 1), value)) stored++;
   EXPECT_EQ(stored, kMaxTreeBytes / (kMaxValueBytes + 1));
   EXPECT_EQ(tree.node_count(), stored);
   // What was deleted makes room again.

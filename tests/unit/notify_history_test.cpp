@@ -308,14 +308,16 @@ TEST(History, ALineOfAnEarlierVersionHasNoError) {
 }
 
 TEST(History, AnErrorWithoutItsTimeIsLeftOut) {
-  for (const char* text : {"0 7 0 0 0 a\t", "0 7 0 0 0 a\tx", "0 7 0 0 0 a\t-"})
+  for (const char* text : {"0 7 0 0 0 a\t", "0 7 0 0 0 a\tx", "0 7 0 0 0 a\t-"}) {
     EXPECT_EQ(history_of(text)["a"].error, "") << text;
+  }
 }
 
 TEST(History, ALineThatIsNoneIsLeftOut) {
   for (const char* text :
-       {"", "\n", "x", "1 2 3", "9 1 0 0 0 k\n", "0 1 32 0 0 k", "-1 0 0 0 0 k", "0 0 0 0 0 "})
+       {"", "\n", "x", "1 2 3", "9 1 0 0 0 k\n", "0 1 32 0 0 k", "-1 0 0 0 0 k", "0 0 0 0 0 "}) {
     EXPECT_TRUE(history_of(text).empty()) << text;
+  }
   EXPECT_EQ(history_of("rubbish\n1 7 0 0 0 a b\n2 8").size(), 1U);
 }
 

@@ -79,8 +79,9 @@ std::vector<std::string> sample_texts() {
   std::mt19937 random(4711);
   for (int i = 0; i < 2000; ++i) {
     std::string text(random() % 120, ' ');
-    for (char& each : text)
+    for (char& each : text) {
       each = random() % 4 == 0 ? "\"\\$`!\n"[random() % 6] : static_cast<char>(1 + random() % 255);
+    }
     texts.push_back(text);
   }
   return texts;

@@ -139,8 +139,9 @@ TEST(Progress, ABarFitsIntoItsLine) {
   EXPECT_EQ(bar(volume_with(1, 1, 1, 0), 80).find('#'), std::string::npos);
   EXPECT_EQ(bar(volume_with(1, 1, 1, 100), 80).find("# "), std::string::npos);
   for (size_t width = 5; width < 100; width++) {
-    for (const int progress : {0, 1, 99, 100})
+    for (const int progress : {0, 1, 99, 100}) {
       EXPECT_LT(bar(volume_with(1, 1, 1, progress), width).size(), width);
+    }
   }
 }
 
