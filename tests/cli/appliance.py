@@ -84,6 +84,26 @@ class Site(Initiator):
         return [line.replace(f" {INITIATOR}/", " ") for line in lines]
 
 
+# Rows of a table of cases carry their set-up as a list of these: each is done with the site.
+
+
+def fake(*arguments, **options):
+    return lambda site: site.box.fake(*arguments, **options)
+
+
+def hook(*arguments, **options):
+    return lambda site: site.box.hook(*arguments, **options)
+
+
+def offer(*arguments, **options):
+    return lambda site: site.offer(*arguments, **options)
+
+
+def set_up(site, steps):
+    for step in steps:
+        step(site)
+
+
 def assert_order(trace, *expected):
     """Each of `expected` is in the trace, behind the one before it."""
     rest = iter(enumerate(trace))

@@ -69,3 +69,18 @@ def box(bare_box):
 def site(box):
     """A box with targets: see the text of the module appliance."""
     return Site(box)
+
+
+@pytest.fixture
+def volume(site, box):
+    """A site with a connected target and its mounted volume; a format does nothing."""
+    site.store("iqn.t1", conn_set=1, conn_state=1,
+               luns=[("data", 0, {"dev": "sdb", "mnt_dev": "/dev/sdb1", "mnt": "/mnt/VV/data"})])
+    site.offer("iqn.t1", {0: "sdb"})
+    site.log_in("iqn.t1")
+    site.disk("sdb")
+    site.mount("sdb", "/mnt/VV/data")
+    box.fake("dd")
+    box.fake("mke2fs")
+    box.forget()
+    return site

@@ -406,16 +406,17 @@ def test_an_extended_partition_is_no_place_for_a_file_system(loop):
     assert call("check_dev", f"/dev/{names[2]}") == 0
 
 
-@pytest.mark.parametrize("what", ["protective MBR", "primary", "all of the start", "MBR by an empty one"])
-def test_a_table_in_the_backup_alone_counts(loop, what):
+# What of a disk is lost, as the offset and the length of its parts.
+LOST = {"protective MBR": [(0, 512)], "primary": [(512, 512)], "all of the start": [(0, 34 * 512)],
+        "MBR by an empty one": [(446, 64), (512, 512)]}
+
+
+@pytest.mark.parametrize("lost", LOST.values(), ids=LOST)
+def test_a_table_in_the_backup_alone_counts(loop, lost):
     disk = loop()
     disk.sfdisk(ONE_LINUX.format("gpt"))
-    start, length = {"protective MBR": (0, 512), "primary": (512, 512), "all of the start": (0, 34 * 512)}.get(
-        what, (446, 64)
-    )
-    disk.write(start, bytes(length))
-    if what == "MBR by an empty one":
-        disk.write(512, bytes(512))
+    for start, length in lost:
+        disk.write(start, bytes(length))
     assert call("partition_list", disk.node) == (1, f"{disk.name}p1")
     assert disk.partitions() == {1: (2048, 40960)}
 

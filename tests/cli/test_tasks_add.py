@@ -2,7 +2,7 @@
 
 import pytest
 
-from appliance import assert_order, settings
+from appliance import assert_order, fake, hook, set_up, settings
 from harness import messages
 from harness.initiator import DETAILS, SESSIONS, SHARES
 
@@ -21,6 +21,23 @@ def connected(site):
     site.offer("iqn.t1", {0: "sdb"})
     site.log_in("iqn.t1")
     return site
+
+
+# What becomes of a volume that is added: what the platform says of its disk, what goes wrong, and state, text, exit
+# status and result.
+MOUNTS = {
+    "unsupported": ({"fs": "reiserfs"}, [], "5", "Unsupported File System", 255, "-1"),
+    "read-only": ({}, [fake("chmod", status=1)], "0", "Running ( Read Only )", 255, "-1"),
+    "too small": ({"size": 1 << 20}, [], "2", "Offline", 0, "0"),
+    "never took hold": ({}, [fake("mount", status=32)], "0", "No Format", 0, "0"),
+}
+FAILURES = {
+    "no partition": ({"parts": 0}, hook("sys_create_1_partition", "/dev/sdb", ret=1)),
+    "no usable node": ({}, hook("sys_check_dev", "/dev/sdb1", ret=-1, first=True)),
+    "format": ({"fs": ""}, fake("dd", status=1)),
+    "mount point": ({}, fake("mkdir", status=1)),
+    "tree": ({}, hook("ktreec_set", "/iscsi/initiator/id:1/lun/id:1/format_state", ret=-1)),
+}
 
 
 class TestUnconnectedTarget:
@@ -134,22 +151,10 @@ class TestConnectedTarget:
         add(box)
         assert box.shell().count(SHARES) == 1 and box.shell()[-1] == SHARES
 
-    @pytest.mark.parametrize(
-        "name, state, text, status, result",
-        [
-            ("unsupported", "5", "Unsupported File System", 255, "-1"),
-            ("read-only", "0", "Running ( Read Only )", 255, "-1"),
-            ("too small", "2", "Offline", 0, "0"),
-            ("never took hold", "0", "No Format", 0, "0"),
-        ],
-    )
-    def test_what_a_mount_result_means(self, connected, box, name, state, text, status, result):
-        connected.disk("sdb", fs="reiserfs" if name == "unsupported" else "ext4",
-                       size=1 << 20 if name == "too small" else 256 << 20)
-        if name == "read-only":
-            box.fake("chmod", status=1)
-        if name == "never took hold":
-            box.fake("mount", status=32)
+    @pytest.mark.parametrize("disk, wrong, state, text, status, result", MOUNTS.values(), ids=MOUNTS)
+    def test_what_a_mount_result_means(self, connected, box, disk, wrong, state, text, status, result):
+        connected.disk("sdb", **disk)
+        set_up(connected, wrong)
         done = add(box)
         assert (done.status, box.tree.get("/result/add")) == (status, result)
         assert (connected.lun("volume_state"), connected.lun("status")) == (state, text)
@@ -158,19 +163,10 @@ class TestConnectedTarget:
         dumped = "dump /etc/NAS_CFG/vv.xml" in connected.trace()
         assert dumped == (status == 0)
 
-    @pytest.mark.parametrize("broken", ["no partition", "no usable node", "format", "mount point", "tree"])
-    def test_any_other_failure_ends_the_command_before_the_count(self, connected, box, broken):
-        connected.disk("sdb", parts=0 if broken == "no partition" else 1, fs="" if broken == "format" else "ext4")
-        if broken == "no partition":
-            box.hook("sys_create_1_partition", "/dev/sdb", ret=1)
-        if broken == "no usable node":
-            box.hook("sys_check_dev", "/dev/sdb1", ret=-1, first=True)
-        if broken == "format":
-            box.fake("dd", status=1)
-        if broken == "mount point":
-            box.fake("mkdir", status=1)
-        if broken == "tree":
-            box.hook("ktreec_set", "/iscsi/initiator/id:1/lun/id:1/format_state", ret=-1)
+    @pytest.mark.parametrize("disk, broken", FAILURES.values(), ids=FAILURES)
+    def test_any_other_failure_ends_the_command_before_the_count(self, connected, box, disk, broken):
+        connected.disk("sdb", **disk)
+        broken(connected)
         assert add(box).status == 255
         assert connected.lun("volume_state") == "3"
         assert connected.lun("share") == "data"

@@ -2,7 +2,7 @@
 
 import pytest
 
-from appliance import assert_order, settings
+from appliance import assert_order, fake, hook, offer, set_up, settings
 from harness import messages
 from harness.initiator import DETAILS, SHARES
 
@@ -21,6 +21,21 @@ def stored(site):
     site.store("iqn.t1", conn_set=0, luns=[("a", 0), ("b", 1)])
     site.offer("iqn.t1", {0: "sdb", 1: "sdc"})
     return site
+
+
+# What becomes of the first of two volumes: what the platform says of its disk, what goes wrong, state and text.
+MOUNTS = {
+    "fine": ({}, [], "0", "Running"),
+    "unsupported": ({"fs": "reiserfs"}, [], "5", "Unsupported File System"),
+    "read-only": ({}, [fake("chmod", "777 /mnt/VV/a", status=1), fake("chmod", real=True)], "0", "Running ( Read Only )"),
+    "too small": ({"size": 1000}, [], "2", "Offline"),
+    "no file system after formatting": ({"fs": ""}, [fake("dd"), fake("mke2fs")], "0", "No Format"),
+    "no partition": ({"fs": "", "parts": 0}, [hook("sys_create_1_partition", "/dev/sdb", ret=1)], "3", "Create Volume Failed"),
+    "cannot be formatted": ({"fs": ""}, [fake("dd", status=1)], "3", "Formatting 0%"),
+    "no mount point": ({}, [fake("mkdir", "-p /mnt/VV/a", status=1), fake("mkdir", real=True)], "3", "Create Volume Failed"),
+    "no disk": ({}, [offer("iqn.t1", {1: "sdc"})], "2", "Offline"),
+    "never took hold": ({}, [fake("mount", "-t ext4 /dev/sdb1", status=32)], "0", "No Format"),
+}
 
 
 class TestConnect:
@@ -67,44 +82,11 @@ class TestConnect:
         assert (stored.target("conn_set"), stored.target("conn_state"), stored.target("status")) == (
             "1", "1", "Connected")
 
-    @pytest.mark.parametrize(
-        "name, state, text",
-        [
-            ("fine", "0", "Running"),
-            ("unsupported", "5", "Unsupported File System"),
-            ("read-only", "0", "Running ( Read Only )"),
-            ("too small", "2", "Offline"),
-            ("no file system after formatting", "0", "No Format"),
-            ("no partition", "3", "Create Volume Failed"),
-            ("cannot be formatted", "3", "Formatting 0%"),
-            ("no mount point", "3", "Create Volume Failed"),
-            ("no disk", "2", "Offline"),
-            ("never took hold", "0", "No Format"),
-        ],
-    )
-    def test_a_mount_failure_shows_in_its_volume_alone(self, stored, box, name, state, text):
-        unformatted = name in ("no file system after formatting", "no partition", "cannot be formatted")
-        fs = "" if unformatted else "reiserfs" if name == "unsupported" else "ext4"
-        stored.disk("sdb", fs=fs, size=1000 if name == "too small" else 256 << 20,
-                    parts=0 if name == "no partition" else 1)
+    @pytest.mark.parametrize("disk, wrong, state, text", MOUNTS.values(), ids=MOUNTS)
+    def test_a_mount_failure_shows_in_its_volume_alone(self, stored, box, disk, wrong, state, text):
+        stored.disk("sdb", **disk)
         stored.disk("sdc")
-        if name == "no file system after formatting":
-            box.fake("dd")
-            box.fake("mke2fs")
-        if name == "no partition":
-            box.hook("sys_create_1_partition", "/dev/sdb", ret=1)
-        if name == "cannot be formatted":
-            box.fake("dd", status=1)
-        if name == "read-only":
-            box.fake("chmod", "777 /mnt/VV/a", status=1)
-            box.fake("chmod", real=True)
-        if name == "no mount point":
-            box.fake("mkdir", "-p /mnt/VV/a", status=1)
-            box.fake("mkdir", real=True)
-        if name == "no disk":
-            stored.offer("iqn.t1", {1: "sdc"})
-        if name == "never took hold":
-            box.fake("mount", "-t ext4 /dev/sdb1", status=32)
+        set_up(stored, wrong)
         assert connect(box).status == 0
         assert (stored.lun("volume_state"), stored.lun("status")) == (state, text)
         assert (stored.lun("volume_state", 2), stored.lun("status", 2)) == ("0", "Running")

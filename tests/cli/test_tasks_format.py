@@ -2,7 +2,7 @@
 
 import pytest
 
-from appliance import SLOTS_MOVE, assert_order, settings
+from appliance import SLOTS_MOVE, assert_order, fake, hook, set_up, settings
 from harness import messages
 from harness.initiator import DETAILS, SHARES
 
@@ -15,19 +15,17 @@ def format_lun(box, name="iqn.t1", number="0"):
     return box.remvol("--format", "-n", name, "-l", number)
 
 
-@pytest.fixture
-def volume(site, box):
-    """A connected target with one mounted volume."""
-    site.store("iqn.t1", conn_set=1, conn_state=1,
-               luns=[("data", 0, {"dev": "sdb", "mnt_dev": "/dev/sdb1", "mnt": "/mnt/VV/data"})])
-    site.offer("iqn.t1", {0: "sdb"})
-    site.log_in("iqn.t1")
-    site.disk("sdb")
-    site.mount("sdb", "/mnt/VV/data")
-    box.fake("dd")
-    box.fake("mke2fs")
-    box.forget()
-    return site
+# What goes wrong behind a format, and exit status and state.
+MOUNTS = {
+    "fine": ([], 0, "0"),
+    # Something else than was asked for is there afterwards.
+    "unsupported": ([hook("sys_get_fs_type", "/dev/sdb1", out="reiserfs", first=True)], 255, "5"),
+    "read-only": ([fake("chmod", status=1)], 255, "0"),
+    "too small": ([hook("sys_get_disk_space", "/dev/sdb", ret=4096, first=True)], 255, "3"),
+    "no node": ([hook("sys_check_dev", "/dev/sdb1", ret=-1, first=True)], 255, "3"),
+    "not writable": ([fake("dd", status=1, first=True)], 255, "3"),
+    "nothing there afterwards": ([hook("sys_get_fs_type", "/dev/sdb1", ret=1, first=True)], 255, "3"),
+}
 
 
 class TestFormat:
@@ -98,31 +96,9 @@ class TestFormat:
         assert last == "set id:1/lun/id:1/volume_state=0"
         assert not any("umount" in line or "mke2fs" in line for line in box.shell())
 
-    @pytest.mark.parametrize(
-        "name, status, state",
-        [
-            ("fine", 0, "0"),
-            ("unsupported", 255, "5"),
-            ("read-only", 255, "0"),
-            ("too small", 255, "3"),
-            ("no node", 255, "3"),
-            ("not writable", 255, "3"),
-            ("nothing there afterwards", 255, "3"),
-        ],
-    )
-    def test_what_the_mount_gives_is_the_result(self, volume, box, name, status, state):
-        if name == "unsupported":  # something else than was asked for is there afterwards
-            box.hook("sys_get_fs_type", "/dev/sdb1", out="reiserfs", first=True)
-        if name == "read-only":
-            box.fake("chmod", status=1)
-        if name == "too small":
-            box.hook("sys_get_disk_space", "/dev/sdb", ret=4096, first=True)
-        if name == "no node":
-            box.hook("sys_check_dev", "/dev/sdb1", ret=-1, first=True)
-        if name == "not writable":
-            box.fake("dd", status=1, first=True)
-        if name == "nothing there afterwards":
-            box.hook("sys_get_fs_type", "/dev/sdb1", ret=1, first=True)
+    @pytest.mark.parametrize("wrong, status, state", MOUNTS.values(), ids=MOUNTS)
+    def test_what_the_mount_gives_is_the_result(self, volume, box, wrong, status, state):
+        set_up(volume, wrong)
         assert format_lun(box).status == status
         assert volume.lun("volume_state") == state
         assert box.tree.get("/result/format") == ("0" if status == 0 else "-1")

@@ -242,17 +242,19 @@ def test_a_partition_that_may_be_two_things_is_unsupported(luns):
     assert lun.disk.digest() == before
 
 
-@pytest.mark.parametrize("name", ["lvm2", "luks2", "ext4", "xfs", "raid"])
-def test_a_disk_without_a_table_that_carries_something_is_kept(luns, name):
+CONTENTS = {
+    "lvm2": lambda disk: disk.write(0, image("lvm2")),
+    "luks2": lambda disk: disk.write(0, image("luks2")),
+    "ext4": make_ext,
+    "xfs": lambda disk: run("mkfs.xfs", "-q", disk.node),
+    "raid": lambda disk: disk.write(*md_member(400 * MIB, "1.2")),
+}
+
+
+@pytest.mark.parametrize("fill", CONTENTS.values(), ids=CONTENTS)
+def test_a_disk_without_a_table_that_carries_something_is_kept(luns, fill):
     lun = luns(400 * MIB)
-    if name == "ext4":
-        make_ext(lun.disk)
-    elif name == "xfs":
-        run("mkfs.xfs", "-q", lun.disk.node)
-    elif name == "raid":
-        lun.disk.write(*md_member(400 * MIB, "1.2"))
-    else:
-        lun.disk.write(0, image(name))
+    fill(lun.disk)
     before = lun.disk.digest()
     assert lun.mount().result == -2
     assert lun.key("volume_state") == "3"

@@ -12,18 +12,17 @@ __all__ = ["luns"]
 
 MIB = 1 << 20
 LEFT_ALONE = "is not the disk of LUN 0 of iqn.t1, it is left alone"
-OTHERS = ["another target", "another LUN", "a disk of the machine"]
 
-
-def turn_into(box, whose, disk="sdb"):
-    if whose == "another target":
-        box.session_disk(disk, "iqn.t2")
-    if whose == "another LUN":
-        box.session_disk(disk, "iqn.t1", lun=1)
-    if whose == "a disk of the machine":
-        box.local_disk(disk)
-    if whose == "the LUN's own":
-        box.session_disk(disk, "iqn.t1", lun=0)
+# Whose disk the name sdb may be, and how the box is told so.
+OTHERS = {
+    "another target": lambda box: box.session_disk("sdb", "iqn.t2"),
+    "another LUN": lambda box: box.session_disk("sdb", "iqn.t1", lun=1),
+    "a disk of the machine": lambda box: box.local_disk("sdb"),
+}
+THE_LUNS = {
+    "the LUN's own": lambda box: box.session_disk("sdb", "iqn.t1", lun=0),
+    "nobody's, as far as known": lambda box: None,
+}
 
 
 def turns_into_another(disk="sdb"):
@@ -32,21 +31,12 @@ def turns_into_another(disk="sdb"):
 
 
 @pytest.fixture
-def volume(site, box):
-    """A connected target with one mounted volume."""
-    site.store("iqn.t1", conn_set=1, conn_state=1,
-               luns=[("data", 0, {"dev": "sdb", "mnt_dev": "/dev/sdb1", "mnt": "/mnt/VV/data"})])
-    site.offer("iqn.t1", {0: "sdb"})
-    site.log_in("iqn.t1")
-    site.disk("sdb")
-    site.mount("sdb", "/mnt/VV/data")
-    box.fake("dd")
-    box.fake("mke2fs")
+def volume(volume, box):
+    """That of conftest.py; and another target's disk to turn into."""
     other = "/fake/other/host9/session9"
     box.write(f"{other}/iscsi_session/session9/targetname", "iqn.t2\n")
     box.path(f"{other}/target9:0:0/9:0:0:0").mkdir(parents=True)
-    box.forget()
-    return site
+    return volume
 
 
 GOES = "rm /sys/block/sdb/device"  # shell text: the disk is gone, and its name another one's any moment
@@ -57,9 +47,9 @@ def ran(box, *words):
 
 
 class TestNamesThatMoved:
-    @pytest.mark.parametrize("whose", OTHERS)
-    def test_a_format_fails_and_touches_nothing(self, volume, box, whose):
-        turn_into(box, whose)
+    @pytest.mark.parametrize("turn", OTHERS.values(), ids=OTHERS)
+    def test_a_format_fails_and_touches_nothing(self, volume, box, turn):
+        turn(box)
         before = settings(box)
         done = box.remvol("--format", "-n", "iqn.t1", "-l", "0")
         assert (done.status, messages(done)) == (255, [f"sdb {LEFT_ALONE}"])
@@ -67,15 +57,15 @@ class TestNamesThatMoved:
         assert box.shell() == ["winshare_reload"]
         assert volume.mounted("data")
 
-    @pytest.mark.parametrize("whose", ["the LUN's own", "nobody's, as far as known"])
-    def test_its_own_disk_is_formatted(self, volume, box, whose):
-        turn_into(box, whose)
+    @pytest.mark.parametrize("turn", THE_LUNS.values(), ids=THE_LUNS)
+    def test_its_own_disk_is_formatted(self, volume, box, turn):
+        turn(box)
         assert box.remvol("--format", "-n", "iqn.t1", "-l", "0").status == 0
         assert [words[-1] for words in box.runs("mke2fs")] == ["/dev/sdb1"]
 
-    @pytest.mark.parametrize("whose", OTHERS)
-    def test_a_disconnect_does_not_end_the_others_users(self, volume, box, whose):
-        turn_into(box, whose)
+    @pytest.mark.parametrize("turn", OTHERS.values(), ids=OTHERS)
+    def test_a_disconnect_does_not_end_the_others_users(self, volume, box, turn):
+        turn(box)
         box.tree.set(f"{INITIATOR}/id:1/lun/id:1/mnt_dev", "/dev/sdb2")
         volume.mount_anew("sdc", "/mnt/VV/data")
         done = box.remvol("--disconnect", "-n", "iqn.t1")
@@ -85,23 +75,23 @@ class TestNamesThatMoved:
         assert not volume.mounted("data")
 
     def test_a_disconnect_ends_its_own_users(self, volume, box):
-        turn_into(box, "the LUN's own")
+        THE_LUNS["the LUN's own"](box)
         assert box.remvol("--disconnect", "-n", "iqn.t1").status == 0
         assert ran(box, "fuser") == ["fuser -mk /dev/sdb1", 'fuser -mk "/mnt/VV/data"']
 
-    @pytest.mark.parametrize("whose", OTHERS)
-    def test_another_volumes_ftp_mount_stays(self, volume, box, whose):
+    @pytest.mark.parametrize("turn", OTHERS.values(), ids=OTHERS)
+    def test_another_volumes_ftp_mount_stays(self, volume, box, turn):
         volume.mount("sdb", "/home/Public/other")
         assert drive(box, "ftp_path", 1, 1).result == 0
-        turn_into(box, whose)
+        turn(box)
         assert drive(box, "ftp_path", 1, 1).result == -104
 
-    @pytest.mark.parametrize("whose", OTHERS)
-    def test_a_wrong_disk_is_not_mounted_but_counts_as_offline(self, site, box, whose):
+    @pytest.mark.parametrize("turn", OTHERS.values(), ids=OTHERS)
+    def test_a_wrong_disk_is_not_mounted_but_counts_as_offline(self, site, box, turn):
         site.store("iqn.t1", luns=[("data", 0)])
         site.offer("iqn.t1", {0: "sdb"})
         site.disk("sdb", parts=0)
-        turn_into(box, whose)
+        turn(box)
         done = box.remvol("--connect", "-n", "iqn.t1")
         assert done.status == 0
         assert f"/dev/sdb {LEFT_ALONE}" in messages(done)
@@ -157,9 +147,9 @@ class TestMountPointsOfOthers:
     """Another disk is mounted where the share's volume belongs: one that was mounted for an add whose tree was
     started anew, so that the share name was given again."""
 
-    @pytest.mark.parametrize("whose", OTHERS)
-    def test_it_is_not_unmounted(self, volume, box, whose):
-        turn_into(box, whose)
+    @pytest.mark.parametrize("turn", OTHERS.values(), ids=OTHERS)
+    def test_it_is_not_unmounted(self, volume, box, turn):
+        turn(box)
         box.tree.set(f"{INITIATOR}/id:1/lun/id:1/mnt_dev", "/dev/sdb2")
         done = drive(box, "unmount", 1, 1)
         assert done.result == -1
@@ -173,9 +163,9 @@ class TestMountPointsOfOthers:
         assert box.remvol("--disconnect", "-n", "iqn.t1").status == 0
         assert not volume.mounted("data")
 
-    @pytest.mark.parametrize("whose", OTHERS)
-    def test_nothing_is_mounted_over_it(self, volume, box, whose):
-        turn_into(box, whose)
+    @pytest.mark.parametrize("turn", OTHERS.values(), ids=OTHERS)
+    def test_nothing_is_mounted_over_it(self, volume, box, turn):
+        turn(box)
         volume.offer("iqn.t1", {0: "sdc"})
         volume.disk("sdc")
         box.session_disk("sdc", "iqn.t1", session=2)
@@ -184,17 +174,17 @@ class TestMountPointsOfOthers:
         assert (done.status, volume.lun("volume_state")) == (0, "3")
         assert not ran(box, "mkdir", "mount -t", "chmod", "rm -rf")
 
-    @pytest.mark.parametrize("whose", ["another target", "another LUN"])
-    def test_its_share_name_is_not_given_again(self, site, box, whose):
+    @pytest.mark.parametrize("turn", [OTHERS["another target"], OTHERS["another LUN"]], ids=["another target", "another LUN"])
+    def test_its_share_name_is_not_given_again(self, site, box, turn):
         site.mount("sdb", "/mnt/VV/data")
-        turn_into(box, whose)
+        turn(box)
         done = box.remvol("--add", "-n", "iqn.t1", "-l", "0", "-i", "10.9.0.2", "-p", "3260", "-s", "data")
         assert (done.status, site.lun("share")) == (255, None)
         assert messages(done) == [f"/dev/sdb1 {LEFT_ALONE}", "share name data has benn used"]
 
     def test_its_own_lun_gets_it_back(self, site, box):
         site.mount("sdb", "/mnt/VV/data")
-        turn_into(box, "the LUN's own")
+        THE_LUNS["the LUN's own"](box)
         done = box.remvol("--add", "-n", "iqn.t1", "-l", "0", "-i", "10.9.0.2", "-p", "3260", "-s", "data")
         assert (done.status, site.lun("share")) == (0, "data")
 

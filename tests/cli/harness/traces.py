@@ -30,6 +30,7 @@ CHANGING = [(re.compile(pattern), text) for pattern, text in (
     (r"^  usleep \d+", "  usleep #"),
     (r"(retry cmd : cycle = \d+, time =) \d+", r"\1 #"),
     (r"\d\d:\d\d:\d\d", "#:#:#"),
+    (r"\bpid = \d+", "pid = #"),
     (r"took = \d+ microseconds", "took = # microseconds"),
     (r"copied, [^,]+ s, .*/s$", "copied"),
     (r"^    \d+ \d+ \d+:\d+ ", "    # # #:# "),
