@@ -139,7 +139,7 @@ LunNode* make_lun_node(const DetailedListing& listing, DeviceNodeMaker make_node
   const Text<64> device = device_name(listing);
   log_disk(listing);
   LOG(2, "get dev_node = %s", device.c_str());
-  make_node(device);
+  (void)make_node(device);
   const long long size = sys_get_disk_space("/dev/%s", device.c_str());
   LOG(2, "get size = %lld", size);
   if (size < kMinLunSize) return nullptr;

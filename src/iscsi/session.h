@@ -3,6 +3,7 @@
 #define REMVOL_ISCSI_SESSION_H
 
 #include "support/lun_list.h"
+#include "support/result.h"
 #include "tree/record.h"
 
 namespace remvol {
@@ -32,7 +33,7 @@ int ktree_update_dev(TargetEntry* entry);
 int _wait_sess_lun_ready(const char* name, int wait_seconds);
 
 // Makes the device node of a disk by its kernel name, such as sdb. Returns 0 or -1.
-using DeviceNodeMaker = int (*)(const char* name);
+using DeviceNodeMaker = Result (*)(const char* name);
 
 // Stores the usable LUNs of the target's session in `head`, to be freed with lun_node_free_list. A disk gets
 // its node by `make_node` before its size is asked for. Returns 0

@@ -8,16 +8,16 @@
 namespace remvol {
 
 // Makes the folder, and those that are missing above it.
-CommandText make_folder_command(const char* path);
+[[nodiscard]] CommandText make_folder_command(const char* path);
 
 // Removes the folder with all that is in it.
-CommandText remove_folder_command(const char* path);
+[[nodiscard]] CommandText remove_folder_command(const char* path);
 
 // Gives everybody every right to the folder.
-CommandText open_folder_command(const char* path);
+[[nodiscard]] CommandText open_folder_command(const char* path);
 
 // Overwrites the first mebibyte of the device.
-CommandText wipe_beginning_command(const char* node);
+[[nodiscard]] CommandText wipe_beginning_command(const char* node);
 
 }  // namespace remvol
 

@@ -6,7 +6,7 @@ namespace remvol {
 
 // Pings `address` (IPv6 may stand in square brackets) twice, from `interface` unless that is null or empty.
 // Returns 1 when it answers, else 0 (also for a null or empty address).
-int ping_ip(const char* address, const char* interface);
+[[nodiscard]] int ping_ip(const char* address, const char* interface);
 
 }  // namespace remvol
 

@@ -11,10 +11,10 @@
 namespace remvol {
 
 // For a mount point, or for a device that is about to be formatted.
-CommandText end_users_command(const char* path);
+[[nodiscard]] CommandText end_users_command(const char* path);
 
 // For the device that was mounted.
-CommandText end_node_users_command(const char* node);
+[[nodiscard]] CommandText end_node_users_command(const char* node);
 
 }  // namespace remvol
 

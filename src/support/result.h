@@ -5,14 +5,16 @@
 
 namespace remvol {
 
-enum Result : int {
-  kOk = 0,
-  kFailed = -1,                  // bad argument or generic failure
-  kTreeFailed = -103,            // the tree refused a write, or an entry or a free slot was not found
-  kNoFtpShare = -104,            // the volume has no mount in the public FTP area
-  kMountTableUnreadable = -105,  // /proc/mounts cannot be opened
-  kListingFailed = -106,         // a session listing command failed
-  kLockFileFailed = -108,        // the lock directory or a lock file cannot be made or opened
+enum [[nodiscard]] Result : int{
+    kOk = 0,
+    kNotStored = 1,                // the requested target or LUN
+    kNotDeleted = 2,               // its slot
+    kFailed = -1,                  // bad argument or generic failure
+    kTreeFailed = -103,            // the tree refused a write, or an entry or a free slot was not found
+    kNoFtpShare = -104,            // the volume has no mount in the public FTP area
+    kMountTableUnreadable = -105,  // /proc/mounts cannot be opened
+    kListingFailed = -106,         // a session listing command failed
+    kLockFileFailed = -108,        // the lock directory or a lock file cannot be made or opened
 };
 
 }  // namespace remvol

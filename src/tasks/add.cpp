@@ -25,20 +25,20 @@ namespace {
 // What a result of Target_mount means for a LUN that was just added. A result that is not listed means
 // kMountBroken.
 struct MountOutcome {
-  int mounted;
+  MountResult mounted;
   VolumeState state;
   int result;
 };
 
 constexpr MountOutcome kMountOutcomes[] = {
-    {kOk, kVolumeNormal, kOk},
+    {kMounted, kVolumeNormal, kOk},
     {kMountUnsupported, kVolumeUnsupported, kMountUnsupported},
     {kMountReadOnly, kVolumeNormal, kMountReadOnly},
     {kMountTooSmall, kVolumeOffline, kOk},  // the LUN stays added: its disk may come to life later
 };
-constexpr MountOutcome kMountBroken = {kFailed, kVolumeFailed, kFailed};
+constexpr MountOutcome kMountBroken = {kMountFailed, kVolumeFailed, kFailed};
 
-const MountOutcome& _mount_outcome(int mounted) {
+const MountOutcome& _mount_outcome(MountResult mounted) {
   for (const MountOutcome& outcome : kMountOutcomes) {
     if (outcome.mounted == mounted) return outcome;
   }
@@ -64,7 +64,7 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
 }
 
 // Stores the target and LUN in `entry`, in one step for other runs. Returns 0 with both slots, or -1.
-int _store_lun(TargetEntry* entry, int* dbidx, int* lun_dbidx) {
+Result _store_lun(TargetEntry* entry, int* dbidx, int* lun_dbidx) {
   mark_target(entry->target_name);
   const SlotsHeld held(SlotsHeld::kChange);
   drop_half_made_luns();

@@ -8,10 +8,10 @@ namespace remvol {
 
 // Stores the requested LUN as a new volume and mounts it when its target is connected. Returns 0, -1, or the
 // result of the mount (-6, -7); what was stored stays.
-int task_add(const TargetEntry& request);
+[[nodiscard]] int task_add(const TargetEntry& request);
 
 // Returns 1 when a LUN uses the share name, else 0.
-int task_share(const char* share);
+[[nodiscard]] int task_share(const char* share);
 
 }  // namespace remvol
 

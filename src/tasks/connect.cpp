@@ -24,10 +24,10 @@ namespace remvol {
 namespace {
 
 // A mount that was refused for its entry (-1) or that found the volume read-only leaves the state "normal".
-VolumeState _state_after_mount(int mounted) {
+VolumeState _state_after_mount(MountResult mounted) {
   switch (mounted) {
-    case kOk:
-    case kFailed:
+    case kMounted:
+    case kMountFailed:
     case kMountReadOnly:
       return kVolumeNormal;
     case kMountUnsupported:

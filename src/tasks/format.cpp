@@ -26,11 +26,11 @@ namespace {
 
 // Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry, no device or
 // another disk's; 1 unknown target or LUN.
-int _read_lun_to_format(const TargetEntry& request, TargetEntry* entry) {
+Result _read_lun_to_format(const TargetEntry& request, TargetEntry* entry) {
   if (request.target_name[0] == '\0' || request.lun < 0) return kFailed;
   int dbidx = 0;
   int lun_dbidx = 0;
-  const int found = find_requested_lun(request, &dbidx, &lun_dbidx);
+  const Result found = find_requested_lun(request, &dbidx, &lun_dbidx);
   if (found != kOk) return found;
   if (read_requested_lun(request, entry, dbidx, lun_dbidx) != kOk) return kFailed;
   if (entry->dev[0] == '\0') {
@@ -53,14 +53,14 @@ int _remake_volume(TargetEntry* entry) {
     ktree_update_volume_state(entry, kVolumeNormal);
     return kFailed;
   }
-  Target_LUN_umount(entry);
-  const int mounted = Target_mount(entry, 1, 0);
-  if (mounted != kOk && mounted != kMountUnsupported && mounted != kMountReadOnly) {
+  (void)Target_LUN_umount(entry);
+  const MountResult mounted = Target_mount(entry, 1, 0);
+  if (mounted != kMounted && mounted != kMountUnsupported && mounted != kMountReadOnly) {
     ktree_update_volume_state(entry, kVolumeFailed);
   }
   if (ftp_path[0] != '\0') {
     LOG(1, "mount_ftp : FTP SHARE PATH = %s", ftp_path);
-    Target_remount_ftp(entry, ftp_path);
+    (void)Target_remount_ftp(entry, ftp_path);
   }
   ktree_update_lun_status(entry, 0);
   unmount_if_deleted(entry);
@@ -97,7 +97,7 @@ void _reconnect(TargetEntry* entry, int conn_set) {
   ktree_record_connect_set(entry);
   ktree_update_dev(entry);
   sleep(kSettleSeconds);
-  Target_mount_all_lun(entry, 0, 1);
+  (void)Target_mount_all_lun(entry, 0, 1);
 }
 
 }  // namespace

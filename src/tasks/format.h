@@ -8,11 +8,11 @@ namespace remvol {
 
 // Makes a fresh file system on the requested LUN and mounts it again. Returns 0, -1, 1 unknown target or LUN,
 // or the result of the mount.
-int task_format(const TargetEntry& request);
+[[nodiscard]] int task_format(const TargetEntry& request);
 
 // Changes the target's CHAP settings and reconnects it when it was set to connect. Returns 0, also when the
 // reconnection failed (connect state 4 tells), or -1 for an unknown target.
-int task_modify(const TargetEntry& request);
+[[nodiscard]] int task_modify(const TargetEntry& request);
 
 }  // namespace remvol
 

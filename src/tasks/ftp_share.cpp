@@ -7,7 +7,7 @@
 
 namespace remvol {
 
-int take_ftp_share_down(const TargetEntry* entry, FtpPath& path) {
+Result take_ftp_share_down(const TargetEntry* entry, FtpPath& path) {
   memset(path, 0, sizeof path);
   switch (get_ftp_share_path(entry, path)) {
     case kMountTableUnreadable:
@@ -18,7 +18,7 @@ int take_ftp_share_down(const TargetEntry* entry, FtpPath& path) {
       return kOk;
     default:
       LOG(1, "umount_ftp : FTP SHARE PATH = %s", path);
-      Target_umount_ftp(entry, path);
+      (void)Target_umount_ftp(entry, path);
       return kOk;
   }
 }

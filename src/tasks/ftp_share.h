@@ -3,6 +3,7 @@
 #define REMVOL_TASKS_FTP_SHARE_H
 
 #include "frontend/log.h"
+#include "support/result.h"
 #include "tree/record.h"
 
 namespace remvol {
@@ -11,7 +12,7 @@ using FtpPath = char[512];
 
 // Unmounts the FTP mount of the entry's volume and leaves its path in `path`, empty when there is none. Logs
 // in the caller's name. Returns 0, or -105 when the mount table cannot be read.
-int take_ftp_share_down(const TargetEntry* entry, FtpPath& path);
+Result take_ftp_share_down(const TargetEntry* entry, FtpPath& path);
 
 }  // namespace remvol
 

@@ -37,12 +37,12 @@ struct TargetHealth {
 };
 
 // Asks twice, a second apart: between two steps of the work looked for the process list is empty for a
-// moment. `probe` returns 0 when it is running.
+// moment.
 template <typename Probe>
 bool _is_running(Probe probe) {
-  if (probe() == 0) return true;
+  if (probe() == kRunning) return true;
   sleep(1);
-  return probe() == 0;
+  return probe() == kRunning;
 }
 
 bool _is_formatting(const TargetEntry* lun) {
@@ -59,8 +59,8 @@ void _log_busy(const TargetEntry* lun, const char* work) {
 
 void _check_lun(const TargetEntry* lun, TargetHealth* health) {
   const char* device = lun->dev[0] != '\0' ? lun->dev : lun->mnt_dev;
-  const int degraded = check_mnt_dev_degrade_to_ro(device, lun->mnt);
-  if (degraded == 1 || degraded == -1) {
+  const Degradation degraded = check_mnt_dev_degrade_to_ro(device, lun->mnt);
+  if (degraded == kDegraded || degraded == kDegradeUnlisted) {
     LOG(1, "dev %s access right is degraded to ro", device);
     health->degraded = true;
   }
@@ -132,8 +132,8 @@ void _unmount_luns(int dbidx) {
     TargetEntry lun;
     if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) continue;
     FtpPath ftp_path;
-    take_ftp_share_down(&lun, ftp_path);
-    Target_LUN_umount(&lun);
+    (void)take_ftp_share_down(&lun, ftp_path);
+    (void)Target_LUN_umount(&lun);
   }
 }
 
@@ -202,7 +202,7 @@ int _queue_target(const char* name) {
 }
 
 // Marks the target as being recovered. Returns 0 or kNotStored.
-int _mark_target(const char* name) {
+Result _mark_target(const char* name) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
     LOG(1, "Can not find: %s", name);

@@ -20,18 +20,17 @@ namespace remvol {
 namespace {
 
 constexpr int kDeleteTries = 4;
-constexpr int kNotDeleted = 2;
 constexpr int kEveryLun = -1;
 
 // Has the share services look at their shares again before the volume of `entry` goes away. They reload
 // everything at once, so the entry is not needed.
-int reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
-  return reload_share_services();
+void reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
+  reload_share_services();
 }
 
 // Deletes a slot, or the whole target's when `lun_dbidx` is 0; the tree moves the slots behind it down. What
 // another run has deleted meanwhile is deleted. Returns 0 or kNotDeleted.
-int _delete_slot(int dbidx, int lun_dbidx) {
+Result _delete_slot(int dbidx, int lun_dbidx) {
   const SlotsHeld held(SlotsHeld::kChange);
   const HeldSlot slot(dbidx, lun_dbidx);
   if (!slot) return kOk;
@@ -51,19 +50,19 @@ bool _has_at_most(int luns, int dbidx) {
 
 // Deletes the slot of the target at `dbidx`, of which LUN `lun` was the last one. When another run has stored
 // a further one since, that stays, and so does the target. Returns 0 or kNotDeleted.
-int _delete_slot_of_last_lun(int dbidx, int lun) {
+Result _delete_slot_of_last_lun(int dbidx, int lun) {
   const SlotsHeld held(SlotsHeld::kChange);
   int lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);
   if (lun_dbidx <= 0) lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);  // the read may have failed
   if (_has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return _delete_slot(dbidx, 0);
-  const int result = lun_dbidx > 0 ? _delete_slot(dbidx, lun_dbidx) : kOk;
+  const Result result = lun_dbidx > 0 ? _delete_slot(dbidx, lun_dbidx) : kOk;
   ktree_update_current_luncnt(dbidx);
   return result;
 }
 
 // Removes the target in `entry`, volumes, session and node record first; `last_lun` is the LUN with which it
 // goes, or kEveryLun. Returns 0 or kNotDeleted.
-int _remove_target(TargetEntry* entry, int last_lun) {
+Result _remove_target(TargetEntry* entry, int last_lun) {
   const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   TargetEntry lun;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
@@ -77,17 +76,17 @@ int _remove_target(TargetEntry* entry, int last_lun) {
 }
 
 // Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
-int _remove_lun(const TargetEntry& request, int dbidx, int lun_dbidx) {
+Result _remove_lun(const TargetEntry& request, int dbidx, int lun_dbidx) {
   TargetEntry lun;
   if (read_requested_lun(request, &lun, dbidx, lun_dbidx) != kOk) return kFailed;
   reload_lun_share(&lun);
-  Target_LUN_umount(&lun);
+  (void)Target_LUN_umount(&lun);
   return _delete_slot(dbidx, lun_dbidx);
 }
 
-int _remove_named_target(const char* name, int last_lun) {
+Result _remove_named_target(const char* name, int last_lun) {
   LOG(2, "start");
-  int result = kNotStored;
+  Result result = kNotStored;
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) == kOk) {
     result = _remove_target(&entry, last_lun);
@@ -100,7 +99,7 @@ int _remove_named_target(const char* name, int last_lun) {
 }
 
 // Told as the removal of a target is.
-int _remove_target_with_last_lun(const TargetEntry& request) {
+Result _remove_target_with_last_lun(const TargetEntry& request) {
   const LogScope scope("task_del");
   return _remove_named_target(request.target_name, request.lun);
 }
@@ -118,7 +117,7 @@ int task_del_lun(const TargetEntry& request) {
   const BriefTargetHold hold(request.target_name, is_no_lun_formatting);
   int dbidx = 0;
   int lun_dbidx = 0;
-  int result = kFailed;
+  Result result = kFailed;
   bool target_gone = false;
   if (request.lun < 0) {
     LOG(0, "lun is not given");

@@ -7,11 +7,11 @@
 namespace remvol {
 
 // Disconnects and deletes the requested target. Returns 0, 1 unknown target, 2 its slot could not be deleted.
-int task_del(const TargetEntry& request);
+[[nodiscard]] int task_del(const TargetEntry& request);
 
 // Deletes one LUN, and with the last one its target. Returns 0, -1, 1 unknown target or LUN, 2 its slot could
 // not be deleted.
-int task_del_lun(const TargetEntry& request);
+[[nodiscard]] int task_del_lun(const TargetEntry& request);
 
 }  // namespace remvol
 

@@ -9,7 +9,7 @@ namespace remvol {
 
 // Ends a "connecting" that no run stands behind: one has held the target, and none does now. Returns the
 // connect state that is stored then, -1 when there is none.
-int repair_target_state(const TargetEntry* target);
+[[nodiscard]] int repair_target_state(const TargetEntry* target);
 
 // The same for the formatting, the waiting for it and the creating of the LUN in `lun`, of which `state` was
 // just read; a mke2fs that outlived its run is work too.

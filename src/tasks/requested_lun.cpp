@@ -6,7 +6,7 @@
 
 namespace remvol {
 
-int find_requested_lun(const TargetEntry& request, int* dbidx, int* lun_dbidx) {
+Result find_requested_lun(const TargetEntry& request, int* dbidx, int* lun_dbidx) {
   *dbidx = ktree_get_dbidx_by_targetname(request.target_name);
   if (*dbidx < 1) {
     LOG(0, "Can not find: %s", request.target_name);
@@ -20,7 +20,7 @@ int find_requested_lun(const TargetEntry& request, int* dbidx, int* lun_dbidx) {
   return kOk;
 }
 
-int read_requested_lun(const TargetEntry& request, TargetEntry* entry, int dbidx, int lun_dbidx) {
+Result read_requested_lun(const TargetEntry& request, TargetEntry* entry, int dbidx, int lun_dbidx) {
   if (ktree_get_found_lun_entry(entry, dbidx, lun_dbidx, request.lun) == kOk) return kOk;
   LOG(0, "Can not get lun entry %d under target %s", request.lun, request.target_name);
   return kFailed;

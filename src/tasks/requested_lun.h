@@ -3,20 +3,17 @@
 #define REMVOL_TASKS_REQUESTED_LUN_H
 
 #include "frontend/log.h"
+#include "support/result.h"
 #include "tree/record.h"
 
 namespace remvol {
 
-// What a handler returns when the requested target or LUN is not stored.
-inline constexpr int kNotStored = 1;
-
 // Looks the requested target and LUN up. Returns 0 with both slots; kNotStored, logged in the caller's name,
 // when one of them is unknown: `dbidx` is below 1 when that is the target.
-[[nodiscard]] int find_requested_lun(const TargetEntry& request, int* dbidx, int* lun_dbidx);
+Result find_requested_lun(const TargetEntry& request, int* dbidx, int* lun_dbidx);
 
 // Fills `entry` with the requested LUN, found in these slots. Returns 0, or -1, logged in the caller's name.
-[[nodiscard]] int read_requested_lun(const TargetEntry& request, TargetEntry* entry, int dbidx,
-                                     int lun_dbidx);
+Result read_requested_lun(const TargetEntry& request, TargetEntry* entry, int dbidx, int lun_dbidx);
 
 }  // namespace remvol
 

@@ -8,7 +8,7 @@ namespace remvol {
 
 // Publishes the LUNs of the requested target, in a tree of its own that is dumped into `output_file` when
 // that is not null. Logs in for the time of the search when the target is not connected. Returns 0, or -1.
-int task_search_lun(const TargetEntry& request, const char* output_file);
+[[nodiscard]] int task_search_lun(const TargetEntry& request, const char* output_file);
 
 }  // namespace remvol
 

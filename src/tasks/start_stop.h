@@ -6,11 +6,11 @@ namespace remvol {
 
 // Brings everything up, from the settings to the volumes. Always returns 0: a failed step is logged and the
 // next one runs.
-int task_init();
+[[nodiscard]] int task_init();
 
 // Takes it down; `system_off` non-zero leaves modules and shares as they are, since the machine is about to
 // stop. Returns 0, or 1 when the last command of the teardown failed.
-int task_deinit(int system_off);
+[[nodiscard]] int task_deinit(int system_off);
 
 }  // namespace remvol
 

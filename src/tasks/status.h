@@ -6,7 +6,7 @@ namespace remvol {
 
 // Refreshes device names and status texts of every target and removes broken slots. Returns 0, -1 when the
 // target count cannot be read, -103 when a tree write failed.
-int task_status();
+[[nodiscard]] int task_status();
 
 }  // namespace remvol
 

@@ -70,7 +70,7 @@ bool load_connected_target(TargetEntry* entry, int* result) {
     return false;
   }
   sleep(kSettleSeconds);
-  Target_mount_all_lun(entry, 0, 0);
+  (void)Target_mount_all_lun(entry, 0, 0);
   return true;
 }
 
@@ -133,7 +133,7 @@ int Target_Disconnect(TargetEntry* entry) {
     LOG(0, "target : %s  does not exist in ktree", entry->target_name);
     return kFailed;
   }
-  Target_umount_all_lun(entry->db_idx);
+  (void)Target_umount_all_lun(entry->db_idx);
   LOG(1, "update share folder status");
   reload_share_services();
   LOG(1, "finish share folder status");

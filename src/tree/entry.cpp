@@ -24,20 +24,25 @@ void read_field(const char* key, char (&field)[N]) {
   if (tree_read(key, value)) copy_text(field, value);
 }
 
+int read_number(const char* key) {
+  char value[kValueSize];
+  return tree_read(key, value) ? atoi(value) : 0;
+}
+
 // Every stored target has a port, which is stored again with what was changed: one that could not be read is
 // read once more.
 int read_port(const char* key) {
-  const int port = tree_read_number(key, 0);
-  return port != 0 ? port : tree_read_number(key, 0);
+  const int port = read_number(key);
+  return port != 0 ? port : read_number(key);
 }
 
 void read_target_fields(TargetEntry* entry, int dbidx) {
-  entry->chap = tree_read_number(KeyText(key::kTargetChap, dbidx), 0);
+  entry->chap = read_number(KeyText(key::kTargetChap, dbidx));
   read_field(KeyText(key::kTargetChapName, dbidx), entry->chap_name);
   read_field(KeyText(key::kTargetChapPwd, dbidx), entry->chap_pwd);
   read_field(KeyText(key::kTargetIp, dbidx), entry->ip);
   entry->port = read_port(KeyText(key::kTargetPort, dbidx));
-  entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
+  entry->conn_set = read_number(KeyText(key::kTargetConnSet, dbidx));
 }
 
 // Reads what the LUN slot `m` of the target in `slot` holds, which this run knows by the number `dbidx`, into

@@ -10,7 +10,7 @@ namespace remvol {
 // Runs `work(what)` in that process while the folder `path` is covered. Returns what it returns; false, and
 // `work` has not run, when there can be no cover. The cover goes with a folder that is removed, comes along
 // with one that is renamed (lift_cover takes it off), and is taken off when the work failed.
-bool run_covered(const char* path, bool (*work)(const void* what), const void* what);
+[[nodiscard]] bool run_covered(const char* path, bool (*work)(const void* what), const void* what);
 
 // Takes the cover off the folder.
 void lift_cover(const char* path);

@@ -47,7 +47,7 @@ bool has_option(const char* field, const char* option) {
 
 // Returns what one field of a table line says of the access right. Only the first occurrence of each text
 // counts, and an "rw" inside a word hides an "ro" that follows in the same field.
-int field_right(const char* field) {
+MountRight field_right(const char* field) {
   // Kernels from 6.14 on keep "rw" on a file system that refuses every write and add one of these.
   if (has_option(field, "emergency_ro") || has_option(field, "shutdown")) return kMountedRo;
   const char* found = strstr(field, "rw");
@@ -69,15 +69,15 @@ bool is_source_of(const char* source, const char* device) {
 
 // Return the right that one line of a table gives `device`; kNotMounted when it is of another one. They cut
 // the line up.
-using LineReader = int (*)(char* line, const char* device);
+using LineReader = MountRight (*)(char* line, const char* device);
 
-int read_mount_line(char* line, const char* device) {
+MountRight read_mount_line(char* line, const char* device) {
   char* rest = nullptr;
   const char* source = strtok_r(line, kSeparators, &rest);
   if (source == nullptr || !is_source_of(source, device)) return kNotMounted;
   while (const char* field = strtok_r(nullptr, kSeparators, &rest)) {
     if (field[0] == '/') continue;
-    const int right = field_right(field);
+    const MountRight right = field_right(field);
     if (right != kMountedUnclear) return right;
   }
   return kMountedUnclear;
@@ -85,7 +85,7 @@ int read_mount_line(char* line, const char* device) {
 
 // A line of /proc/self/mountinfo, see proc_pid_mountinfo(5): the mount's own options are its sixth field, the
 // source is the second one after the separator.
-int read_mountinfo_line(char* line, const char* device) {
+MountRight read_mountinfo_line(char* line, const char* device) {
   char* separator = strstr(line, " - ");
   if (separator == nullptr) return kNotMounted;
   *separator = '\0';
@@ -100,16 +100,16 @@ int read_mountinfo_line(char* line, const char* device) {
 }
 
 // Reads a table up to the first line that decides, in reads of at most `limit` characters.
-int read_table(const char* device, const char* table, LineReader read_line, int limit) {
+MountRight read_table(const char* device, const char* table, LineReader read_line, int limit) {
   const File file(fopen(table, "re"));
   if (!file) {
     LOG(0, "failed to open mtab file at %s", table);
     return kTableUnreadable;
   }
-  int right = kNotMounted;
+  MountRight right = kNotMounted;
   char line[kMountInfoLine + 1];
   while (right != kMountedRw && right != kMountedRo && fgets(line, limit + 1, file.get()) != nullptr) {
-    const int found = read_line(line, device);
+    const MountRight found = read_line(line, device);
     if (found != kNotMounted) right = found;
   }
   LOG(2, "get mnt file access right = %d for dev %s", right, device);
@@ -130,72 +130,73 @@ bool is_mtab_live() {
 
 }  // namespace
 
-int get_mnt_ac_right_from_mnt_file(const char* device, const char* table) {
+MountRight get_mnt_ac_right_from_mnt_file(const char* device, const char* table) {
   const LogScope scope;
   if (!is_valid(device)) return kTableUnreadable;
   return read_table(device, table, read_mount_line, kMountLine);
 }
 
-int get_mtab_access_right(const char* device) {
+MountRight get_mtab_access_right(const char* device) {
   const LogScope scope;
   if (!is_valid(device)) {
     LOG(0, "dev is not valid value");
     return kTableUnreadable;
   }
-  const int right = is_mtab_live() ? read_table(device, kMountInfo, read_mountinfo_line, kMountInfoLine)
-                                   : get_mnt_ac_right_from_mnt_file(device, kMtab);
+  const MountRight right = is_mtab_live()
+                               ? read_table(device, kMountInfo, read_mountinfo_line, kMountInfoLine)
+                               : get_mnt_ac_right_from_mnt_file(device, kMtab);
   LOG(2, "get mtab access right = %d for dev %s", right, device);
   return right;
 }
 
-int get_proc_mount_access_right(const char* device) {
+MountRight get_proc_mount_access_right(const char* device) {
   const LogScope scope;
   if (!is_valid(device)) {
     LOG(0, "dev is not valid value");
     return kTableUnreadable;
   }
-  const int right = get_mnt_ac_right_from_mnt_file(device, kProcMounts);
+  const MountRight right = get_mnt_ac_right_from_mnt_file(device, kProcMounts);
   LOG(2, "get proc mounts access right = %d for dev %s", right, device);
   return right;
 }
 
-int check_mnt_dev_degrade_to_ro(const char* device, const char* mount_path) {
+Degradation check_mnt_dev_degrade_to_ro(const char* device, const char* mount_path) {
   const LogScope scope;
   if (!is_valid(device)) {
     LOG(0, "dev is not valid!");
-    return -2;
+    return kDegradeUnknown;
   }
-  const int mounted = get_mtab_access_right(device);
+  const MountRight mounted = get_mtab_access_right(device);
   if (mounted == kNotMounted) {
     LOG(0, "can not find %s in mtab", device);
-    return -1;
+    return kDegradeUnlisted;
   }
   if (mounted < 0) {
     LOG(0, "failed to get mtab access right");
-    return -2;
+    return kDegradeUnknown;
   }
   if (mounted == kMountedRo) {
     LOG(1, "%s has been mounted as ro, skip to check degrade", device);
-    return 0;
+    return kNotDegraded;
   }
   const bool has_path = mount_path != nullptr && mount_path[0] != '\0';
-  if (has_path) remount_mnt_path(mount_path, kRemountWait);
-  const int now = get_proc_mount_access_right(device);
+  if (has_path) (void)remount_mnt_path(mount_path, kRemountWait);
+  const MountRight now = get_proc_mount_access_right(device);
   if (now == kNotMounted) {
     LOG(1, "can not find %s in /proc/mounts", device);
-    return -1;
+    return kDegradeUnlisted;
   }
   if (now < 0) {
     LOG(0, "failed to get proc mounts access right for %s", device);
-    return -2;
+    return kDegradeUnknown;
   }
   if (now == kMountedRo || (has_path && sys_mount_point(mount_path) != 0 &&
                             (has_lost_disk(mount_path) || refuses_writes(mount_path)))) {
     LOG(2, "the access right is degrade to ro for dev %s", device);
-    return 1;
+    return kDegraded;
   }
   LOG(2, "access right in mtab and proc are both rw for dev %s", device);
-  return 0;
+  return kNotDegraded;
 }
 
 // Kernels 6.1.192, 6.12 and 6.13 show nothing of an ext4 that refuses every write: only a write tells. The

@@ -74,7 +74,7 @@ void make_partition_nodes(const char* disk, const char* directory_path) {
     lstat(name, &status);
     if (!S_ISDIR(status.st_mode)) continue;
     LOG(2, "create sub node : %s", name);
-    if (_create_device_node(name) != 0) LOG(2, "fail to make device node : %s", name);
+    if (_create_device_node(name) != kOk) LOG(2, "fail to make device node : %s", name);
   }
 }
 
@@ -96,47 +96,47 @@ Text<256> disk_of_node(const char* node) {
   return Text<256>("%s", get_parent_disk(parent, name) ? parent : name);
 }
 
-int _get_dev_id(DeviceId* id, const char* name) {
+Result _get_dev_id(DeviceId* id, const char* name) {
   const LogScope scope;
-  if (name == nullptr || name[0] == '\0') return -1;
+  if (name == nullptr || name[0] == '\0') return kFailed;
   const PathText path("%s/dev", sysfs_dir(name).c_str());
-  if (check_path_exist(path) != 0) return -1;
+  if (check_path_exist(path) != 0) return kFailed;
   const File file(fopen(path, "re"));
   char line[128];
-  if (!file || fgets(line, sizeof line, file.get()) == nullptr) return -1;
+  if (!file || fgets(line, sizeof line, file.get()) == nullptr) return kFailed;
   char* colon = strchr(line, ':');
-  if (colon == nullptr) return -1;
+  if (colon == nullptr) return kFailed;
   *colon = '\0';
-  if (!parse_number(line, &id->major) || !parse_number(colon + 1, &id->minor)) return -1;
+  if (!parse_number(line, &id->major) || !parse_number(colon + 1, &id->minor)) return kFailed;
   copy_text(id->name, name);
-  return 0;
+  return kOk;
 }
 
-int _create_device_node(const char* name) {
+Result _create_device_node(const char* name) {
   const LogScope scope;
   if (name == nullptr) {
     LOG(0, "dev_ostel_n is null");
-    return -1;
+    return kFailed;
   }
   if (name[0] == '\0') {
     LOG(0, "dev_ostel_n is empty");
-    return -1;
+    return kFailed;
   }
   LOG(2, "creating dev node : %s", name);
   const PathText directory = sysfs_dir(name);
   if (check_path_exist(directory) != 0) {
     LOG(0, "path %s is not existing", directory.c_str());
-    return -1;
+    return kFailed;
   }
   DeviceId id{};
-  if (_get_dev_id(&id, name) != 0) {
+  if (_get_dev_id(&id, name) != kOk) {
     LOG(0, "fail to get device id for %s", name);
-    return -1;
+    return kFailed;
   }
   make_node(name, id);
   char parent[256];
   if (!get_parent_disk(parent, name)) make_partition_nodes(name, directory);
-  return 0;
+  return kOk;
 }
 
 }  // namespace remvol

@@ -16,20 +16,20 @@ enum DiskOwner : int {
 };
 
 // Asks sysfs for the disk of `node`, a disk or partition with or without "/dev/" in front.
-DiskOwner disk_owner(const TargetEntry* entry, const char* node);
+[[nodiscard]] DiskOwner disk_owner(const TargetEntry* entry, const char* node);
 
 // Returns whether the disk of `node` is one of a session to the target called `target_name`, or to any when
 // that is null.
-bool is_session_disk(const char* node, const char* target_name);
+[[nodiscard]] bool is_session_disk(const char* node, const char* target_name);
 
 // Returns whether sysfs has a disk of `node`, whosever it is.
-bool has_disk(const char* node);
+[[nodiscard]] bool has_disk(const char* node);
 
 // Returns whether the disk of `node` is known to be another one than the entry's; then nothing that changes
 // it or ends its users may be done. That is logged at level 0 in the caller's name. A disk that this run has
 // seen to be the entry's and that sysfs knows nothing of any more counts as another one: its session was
 // closed meanwhile, and the name may be given anew at any moment.
-bool is_foreign_disk(const TargetEntry* entry, const char* node);
+[[nodiscard]] bool is_foreign_disk(const TargetEntry* entry, const char* node);
 
 // Returns whether a disk that is known to be another one than the entry's is mounted on `path`: what is
 // mounted there is left alone then, and nothing mounted over it. That is logged at level 0.

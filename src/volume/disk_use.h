@@ -26,17 +26,17 @@ class DiskHeld {
 };
 
 // Returns the mark of the first 4 KiB, where every file system that the tool makes has its signature.
-ContentMark content_mark(const char* node);
+[[nodiscard]] ContentMark content_mark(const char* node);
 
 // Returns whether the mount table has the block device `node`; not when that cannot be told.
-bool is_node_mounted(const char* node);
+[[nodiscard]] bool is_node_mounted(const char* node);
 
 // Returns whether the kernel has the block device `node` claimed: mounted anywhere, also where this process
 // cannot see it, or part of an array. A mount that goes away just now is waited for, a second at most.
-bool is_node_claimed(const char* node);
+[[nodiscard]] bool is_node_claimed(const char* node);
 
 // Returns whether the kernel knows a partition of the disk `name`, such as sdb.
-bool has_partition(const char* name);
+[[nodiscard]] bool has_partition(const char* name);
 
 // Waits while udev has events pending or holds the lock on the disk of `node`, 5 seconds at most; not where
 // there is no udev. Whoever kills the users of a node that udev looks at leaves /dev/disk without its links.

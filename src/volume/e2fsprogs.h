@@ -16,10 +16,10 @@ CommandText make_ext3_command(const char* node);
 CommandText make_ext4_command(const char* node);
 
 // Looks at the file system on the node and changes nothing.
-CommandText check_ext_command(const char* node);
+[[nodiscard]] CommandText check_ext_command(const char* node);
 
 // Has the file system on the node fill it, in the background.
-CommandText grow_ext_command(const char* node);
+[[nodiscard]] CommandText grow_ext_command(const char* node);
 
 }  // namespace remvol
 

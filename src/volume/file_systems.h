@@ -22,7 +22,7 @@ struct FileSystem {
 inline constexpr char kDefaultFileSystem[] = "ext4";
 
 // Returns the row of the file system; null when a volume cannot carry it.
-const FileSystem* find_file_system(const char* type);
+[[nodiscard]] const FileSystem* find_file_system(const char* type);
 
 }  // namespace remvol
 

@@ -27,10 +27,9 @@ namespace {
 
 constexpr int kStartTries = 3;
 constexpr int kFirstWordMs = 5000;  // of mke2fs, at most
-constexpr int kRefused = -1;
-constexpr int kNotWritable = -2;
-constexpr int kNotStarted = -3;
 using FsName = char[16];
+
+constexpr FormatResult kGoOn = kFormatted;  // of a step
 
 bool check_arguments(const TargetEntry* entry, const char* partition) {
   if (entry->dev[0] == '\0') {
@@ -102,16 +101,17 @@ void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition
   note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100));
 }
 
-// Whether the partition, chosen a while ago, may still be formatted. Returns 0, kRefused or kFormatLeftAlone.
-int look_again(const TargetEntry* entry, const char* partition, ContentMark seen_empty) {
-  if (is_foreign_disk(entry, partition)) return kRefused;
+// Whether the partition, chosen a while ago, may still be formatted. Returns kGoOn, kFormatRefused or
+// kFormatLeftAlone.
+FormatResult look_again(const TargetEntry* entry, const char* partition, ContentMark seen_empty) {
+  if (is_foreign_disk(entry, partition)) return kFormatRefused;
   if (is_node_mounted(partition)) {
     LOG(0, "%s is mounted by now, it is not formatted", partition);
     return kFormatLeftAlone;
   }
-  if (seen_empty == kNoMark || content_mark(partition) == seen_empty) return 0;
+  if (seen_empty == kNoMark || content_mark(partition) == seen_empty) return kGoOn;
   char found[64] = "";
-  if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') return 0;
+  if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') return kGoOn;
   LOG(0, "%s carries %s by now, it is not formatted", partition, found);
   return kFormatLeftAlone;
 }
@@ -124,91 +124,91 @@ bool may_overwrite(const TargetEntry* entry, const char* partition) {
   return false;
 }
 
-// Ends everybody else on the partition. Returns 0 or kRefused.
-int end_users(const TargetEntry* entry, const char* partition) {
+// Ends everybody else on the partition. Returns kGoOn or kFormatRefused.
+FormatResult end_users(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
   wait_for_udev(partition);
-  if (is_foreign_disk(entry, partition)) return kRefused;
+  if (is_foreign_disk(entry, partition)) return kFormatRefused;
   System("%s", end_users_command(partition).c_str());
-  return 0;
+  return kGoOn;
 }
 
-// Returns 0, kRefused or kNotWritable.
-int wipe_beginning(const TargetEntry* entry, const char* partition) {
+// Returns kGoOn, kFormatRefused or kFormatNotWritable.
+FormatResult wipe_beginning(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
-  if (!may_overwrite(entry, partition)) return kRefused;
-  if (System("%s", wipe_beginning_command(partition).c_str()) == 0) return 0;
+  if (!may_overwrite(entry, partition)) return kFormatRefused;
+  if (System("%s", wipe_beginning_command(partition).c_str()) == 0) return kGoOn;
   LOG(1, "dd %s failed, this device is not able to write.", partition);
-  return kNotWritable;
+  return kFormatNotWritable;
 }
 
 // Starts mke2fs and waits until it has opened the disk: before that it says nothing. From then on the disk's
-// name can go to no other. Returns 0, kRefused or kNotStarted.
-int begin_making(const TargetEntry* entry, FsName& fs_type, const char* partition, FILE** output) {
+// name can go to no other. Returns kGoOn, kFormatRefused or kFormatNotStarted.
+FormatResult begin_making(const TargetEntry* entry, FsName& fs_type, const char* partition, FILE** output) {
   const SessionKept kept(entry->target_name);
-  if (!may_overwrite(entry, partition)) return kRefused;
+  if (!may_overwrite(entry, partition)) return kFormatRefused;
   *output = start_mke2fs(fs_type, partition);
-  if (*output == nullptr) return kNotStarted;
+  if (*output == nullptr) return kFormatNotStarted;
   pollfd said = {fileno(*output), POLLIN, 0};
   if (said.fd >= 0) poll(&said, 1, kFirstWordMs);
-  return 0;
+  return kGoOn;
 }
 
-// Makes the file system, everybody else on the partition ended and its beginning wiped before. Returns 0,
-// kRefused, kNotWritable, or kNotStarted.
-int make_file_system(TargetEntry* entry, const char* partition) {
+// Makes the file system, everybody else on the partition ended and its beginning wiped before. Returns
+// kGoOn, kFormatRefused, kFormatNotWritable, or kFormatNotStarted.
+FormatResult make_file_system(TargetEntry* entry, const char* partition) {
   note_update(ktree_update_formatting_state(entry, kFormatting));
   note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0));
   note_update(ktree_update_lun_status(entry, 1));
   LOG(2, "format partition %s", partition);
   const DiskHeld disk(partition);
-  int result = end_users(entry, partition);
-  if (result != 0) return result;
+  FormatResult result = end_users(entry, partition);
+  if (result != kGoOn) return result;
   FsName fs_type;
   choose_fs(fs_type, partition);
   result = wipe_beginning(entry, partition);
-  if (result != 0) return result;
+  if (result != kGoOn) return result;
   sleep(1);
   FILE* output = nullptr;
   result = begin_making(entry, fs_type, partition, &output);
-  if (result != 0) return result;
+  if (result != kGoOn) return result;
   follow_mke2fs(output, entry, partition);
-  return 0;
+  return kGoOn;
 }
 
 }  // namespace
 
-int Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty) {
+FormatResult Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty) {
   const LogScope scope;
-  if (!check_arguments(entry, partition)) return -1;
+  if (!check_arguments(entry, partition)) return kFormatRefused;
   int sem_id = -1;
   note_update(ktree_update_formatting_state(entry, kFormatWaiting));
   if (format_sem_P(&sem_id, 1) != 0) {
     note_update(ktree_update_formatting_state(entry, kFormatFailed));
     LOG(0, "wait fmt_sem failed, exit");
-    return -1;
+    return kFormatRefused;
   }
-  int result = look_again(entry, partition, seen_empty);
-  if (result == 0) result = make_file_system(entry, partition);
+  FormatResult result = look_again(entry, partition, seen_empty);
+  if (result == kGoOn) result = make_file_system(entry, partition);
   // The semaphore stays taken and the format state stays "formatting" until this run ends; the kernel then
   // undoes the semaphore's change.
-  if (result == kNotWritable) return result;
-  const FormatState state = result == 0 || result == kFormatLeftAlone ? kFormatIdle : kFormatFailed;
+  if (result == kFormatNotWritable) return result;
+  const FormatState state = result == kGoOn || result == kFormatLeftAlone ? kFormatIdle : kFormatFailed;
   note_update(ktree_update_formatting_state(entry, state));
   const int left = format_sem_V(&sem_id);
   if (left != 0) LOG(0, "release fmt_sem failed, exit");
-  return result == kRefused || result == kFormatLeftAlone ? result : left;
+  return result == kFormatRefused || result == kFormatLeftAlone ? result : static_cast<FormatResult>(left);
 }
 
-int check_mkfs_process_existing() {
+ProcessState check_mkfs_process_existing() {
   const LogScope scope;
-  return is_command_running_on(kMke2fs, "/dev/sd") ? 0 : 1;
+  return is_command_running_on(kMke2fs, "/dev/sd") ? kRunning : kNotRunning;
 }
 
-int check_resizing_fs(const char* device) {
+ProcessState check_resizing_fs(const char* device) {
   const LogScope scope;
   LOG(2, "checking if device %s is resizing...", device);
-  return is_command_running_on(kResize2fs, device) ? 0 : 1;
+  return is_command_running_on(kResize2fs, device) ? kRunning : kNotRunning;
 }
 
 }  // namespace remvol

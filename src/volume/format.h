@@ -7,23 +7,27 @@
 
 namespace remvol {
 
-// Result of a format for a partition that was put to use while the run waited for its turn.
-inline constexpr int kFormatLeftAlone = 1;
+enum [[nodiscard]] FormatResult : int{
+    kFormatted = 0,        // also when mke2fs could not be started, failed, or a state could not be stored
+    kFormatLeftAlone = 1,  // the partition is mounted, or no longer as it was seen and recognised
+    kFormatRefused = -1,   // bad arguments, no semaphore, another disk than the entry's or one that is in use
+    kFormatNotWritable = -2,  // the partition; this run keeps the semaphore until it ends
+    kFormatNotStarted = -3,   // mke2fs could not be started: of a step alone, not told
+};
 
 // Formats the partition node `partition` for the entry's LUN, with the ext2, ext3 or ext4 found on it, else
 // with ext4. `seen_empty` is the partition's mark from when nothing was recognised on it; kNoMark when the
-// user asked for a format, whatever is on it. Returns -1 for bad arguments, when the wait for the semaphore
-// failed, for another disk than the entry's or one that is in use; -2 when the partition cannot be written
-// (this run then keeps the semaphore until it ends); kFormatLeftAlone when it is mounted, or no longer as it
-// was seen and recognised; else the result of leaving the semaphore, whatever happened before: 0 also when
-// mke2fs could not be started, failed, or a state could not be stored.
-int Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty = kNoMark);
+// user asked for a format, whatever is on it. The result is that of leaving the semaphore, whatever happened
+// before (0, or -2 as if the partition could not be written), unless it is told above.
+FormatResult Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty = kNoMark);
 
-// Returns 0 when a mke2fs on a SCSI disk is running, else 1.
-int check_mkfs_process_existing();
+enum [[nodiscard]] ProcessState : int{kRunning = 0, kNotRunning = 1};
 
-// Returns 0 when a resize2fs whose command line contains `device` is running, else 1.
-int check_resizing_fs(const char* device);
+// Asks for a mke2fs on a SCSI disk.
+ProcessState check_mkfs_process_existing();
+
+// Asks for a resize2fs whose command line contains `device`.
+ProcessState check_resizing_fs(const char* device);
 
 }  // namespace remvol
 

@@ -20,7 +20,7 @@ struct FormatProgress {
 // Takes the text of one read (at most kFormatReadSize - 1 characters) into `progress`. Returns whether it
 // carried a counter; the percentage is published then. The counter used is the one before the last redraw of
 // the read. A counter of "n/0" counts as none.
-bool update_format_progress(FormatProgress* progress, const char* text);
+[[nodiscard]] bool update_format_progress(FormatProgress* progress, const char* text);
 
 }  // namespace remvol
 

@@ -71,36 +71,36 @@ struct Volume {
   MountPointText mount_point;
 };
 
-int check_entry(const TargetEntry* entry) {
+MountResult check_entry(const TargetEntry* entry) {
   if (entry == nullptr || entry->dev[0] == '\0') {
     LOG(0, "Error entry");
-    return kFailed;
+    return kMountFailed;
   }
   if (entry->db_idx <= 0 || entry->lun_db_idx <= 0) {
     LOG(0, "Error entry - db_idx or lun_db_idx is not given");
-    return kFailed;
+    return kMountFailed;
   }
   if (entry->share[0] == '\0') {
     LOG(0, "Error entry - share name is empty");
-    return kFailed;
+    return kMountFailed;
   }
   if (!is_share_inside_root(entry->share)) return kMountNoMountPoint;
-  return kOk;
+  return kMounted;
 }
 
-// Updates a state of the LUN; a failure is logged.
-int note_update(int result) {
-  if (result != 0) LOG(0, "Update ktree FAILED");
-  return result;
+// Takes the result of an update of the LUN's states; a failure is logged. Returns whether it was stored.
+bool note_update(int result) {
+  if (result != kOk) LOG(0, "Update ktree FAILED");
+  return result == kOk;
 }
 
-int record_access_right(const TargetEntry* entry, int right) {
+// Returns whether the tree took it.
+bool record_access_right(const TargetEntry* entry, int right) {
   const int result = ktree_update_lun_vol_access_right(right, entry->db_idx, entry->lun_db_idx);
-  if (result != 0) {
-    LOG(0, "ktree_update_lun_vol_access_right to %s, FAILED, ret = %d", right == VOL_AC_RW ? "RW" : "RO",
-        result);
-  }
-  return result;
+  if (result == kOk) return true;
+  LOG(0, "ktree_update_lun_vol_access_right to %s, FAILED, ret = %d", right == VOL_AC_RW ? "RW" : "RO",
+      result);
+  return false;
 }
 
 bool detect_fs(Volume* volume) {
@@ -145,12 +145,12 @@ bool find_partition(Volume* volume, bool (*passes)(Volume*)) {
   return false;
 }
 
-int pick_partition(Volume* volume) {
-  if (find_partition(volume, is_recognised)) return kOk;
+MountResult pick_partition(Volume* volume) {
+  if (find_partition(volume, is_recognised)) return kMounted;
   volume->looks_empty = volume->force_format == 0;
   volume->force_format = 1;
   if (!find_partition(volume, is_usable)) return kMountNoPartition;
-  return kOk;
+  return kMounted;
 }
 
 // Data that nobody asked to overwrite is never formatted: what is recognised on a second look is mounted, and
@@ -164,76 +164,74 @@ bool protect_data(Volume* volume) {
   return false;
 }
 
-int create_file_system(Volume* volume) {
+MountResult create_file_system(Volume* volume) {
   LOG(kNote, "Got FS type = %s, creating volume", volume->fs_type);
   volume->held.release();
-  const int result = Target_format(volume->entry, volume->node, volume->seen_empty);
-  if (result == 0 || (result == kFormatLeftAlone && !volume->asked)) return kOk;
-  if (result == -2 && record_access_right(volume->entry, VOL_AC_RO) != 0) return kTreeFailed;
+  const FormatResult result = Target_format(volume->entry, volume->node, volume->seen_empty);
+  if (result == kFormatted || (result == kFormatLeftAlone && !volume->asked)) return kMounted;
+  if (result == kFormatNotWritable && !record_access_right(volume->entry, VOL_AC_RO)) return kMountUnrecorded;
   LOG(0, "Create Format FAILED");
   return kMountFormatFailed;
 }
 
-int keep_file_system(Volume* volume) {
+MountResult keep_file_system(Volume* volume) {
   LOG(1, "Got FS type = %s, skip creating volume", volume->fs_type);
   const FileSystem* file_system = find_file_system(volume->fs_type);
   if (file_system != nullptr && file_system->check != nullptr && sys_check_fs_state(volume->node) != 0) {
     volume->held.release();  // the look takes its time, and another run may kill who holds the node
     System("%s", file_system->check(volume->node).c_str());
   }
-  const int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
-  return note_update(result) != 0 ? kTreeFailed : kOk;
+  return note_update(ktree_update_formatting_state(volume->entry, kFormatIdle)) ? kMounted : kMountUnrecorded;
 }
 
 // Leaves the chosen partition with a known file system.
-int prepare_file_system(Volume* volume) {
+MountResult prepare_file_system(Volume* volume) {
   LOG(2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
   if (!volume->asked) volume->seen_empty = content_mark(volume->node);
   detect_fs(volume);
   if (!protect_data(volume)) return kMountNoPartition;
-  const int result = volume->force_format != 0 ? create_file_system(volume) : keep_file_system(volume);
-  if (result != kOk) return result;
+  const MountResult result =
+      volume->force_format != 0 ? create_file_system(volume) : keep_file_system(volume);
+  if (result != kMounted) return result;
   const bool found = detect_fs(volume) && !(volume->force_format != 0 && is_remains(volume->fs_type));
   volume->held.release();
-  return found ? kOk : kFailed;
+  return found ? kMounted : kMountFailed;
 }
 
-int make_mount_point(const Volume* volume) {
+MountResult make_mount_point(const Volume* volume) {
   const CommandText command = make_folder_command(volume->mount_point);
   LOG(1, "cmd = %s", command.c_str());
   make_bare_folder(volume->mount_point);
-  if (system(command) == 0) return kOk;
+  if (system(command) == 0) return kMounted;
   LOG(0, "system() of cmd '%s' failed", command.c_str());
   return kMountNoMountPoint;
 }
 
-int mount_file_system(const Volume* volume) {
+MountResult mount_file_system(const Volume* volume) {
   if (const FileSystem* file_system = find_file_system(volume->fs_type)) {
     run_mount(*file_system, volume->node, volume->mount_point);
-    return kOk;
+    return kMounted;
   }
   LOG(1, "Unsupported filesystem type %s", volume->fs_type);
-  const int result = ktree_update_volume_state(volume->entry, kVolumeUnsupported);
-  if (note_update(result) != 0) return kTreeFailed;
-  return kMountUnsupported;
+  const bool noted = note_update(ktree_update_volume_state(volume->entry, kVolumeUnsupported));
+  return noted ? kMountUnsupported : kMountUnrecorded;
 }
 
-int record_read_only(const Volume* volume) {
-  if (record_access_right(volume->entry, VOL_AC_RO) != 0) return kTreeFailed;
-  return kMountReadOnly;
+MountResult record_read_only(const Volume* volume) {
+  return record_access_right(volume->entry, VOL_AC_RO) ? kMountReadOnly : kMountUnrecorded;
 }
 
 // Opens the volume to everybody and records whether that could be written.
-int open_to_everybody(const Volume* volume) {
+MountResult open_to_everybody(const Volume* volume) {
   if (system(open_folder_command(volume->mount_point)) == 0) {
     record_access_right(volume->entry, VOL_AC_RW);
-    return kOk;
+    return kMounted;
   }
   LOG(1, "change mode 777 to %s failed, this might be a read only filesystem", volume->entry->share);
   return record_read_only(volume);
 }
 
-int record_mount(const Volume* volume) {
+MountResult record_mount(const Volume* volume) {
   ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
   const FileSystem* file_system = find_file_system(volume->fs_type);
   if (file_system != nullptr && file_system->grow != nullptr) {
@@ -252,72 +250,70 @@ void record_failed_mount(const Volume* volume) {
   LOG(0, "system() of cmd '%s' failed", command.c_str());
 }
 
-int record_outcome(const Volume* volume) {
+MountResult record_outcome(const Volume* volume) {
   if (sys_mount_point(volume->mount_point) != 0) return record_mount(volume);
   record_failed_mount(volume);
-  return kOk;
+  return kMounted;
 }
 
 // A volume that is in use where it belongs is neither checked, formatted nor mounted over: its state is
 // recorded as after a mount, with all that follows one (its partition may have grown). One that has turned
 // read-only since may take the chmod in memory alone.
-int keep_standing(const Volume* volume) {
+MountResult keep_standing(const Volume* volume) {
   LOG(1, "%s is mounted on %s already", volume->node.c_str(), volume->mount_point.c_str());
-  int result = ktree_update_formatting_state(volume->entry, kFormatIdle);
-  if (note_update(result) != 0) return kTreeFailed;
-  result = record_mount(volume);
-  if (result != kOk || !refuses_writes(volume->mount_point)) return result;
+  if (!note_update(ktree_update_formatting_state(volume->entry, kFormatIdle))) return kMountUnrecorded;
+  const MountResult result = record_mount(volume);
+  if (result != kMounted || !refuses_writes(volume->mount_point)) return result;
   LOG(1, "%s takes no writes any more", volume->mount_point.c_str());
   return record_read_only(volume);
 }
 
 // Mounts the file system and records what became of that. No other run closes the session meanwhile, or
 // removes the mount point.
-int put_in_place(const Volume* volume) {
+MountResult put_in_place(const Volume* volume) {
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
   if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
   if (is_foreign_mount(volume->entry, volume->mount_point)) return kMountNoMountPoint;
-  int result = make_mount_point(volume);
-  if (result == kOk) result = mount_file_system(volume);
-  if (result == kOk) result = record_outcome(volume);
+  MountResult result = make_mount_point(volume);
+  if (result == kMounted) result = mount_file_system(volume);
+  if (result == kMounted) result = record_outcome(volume);
   return result;
 }
 
-// Returns 0 when the volume was mounted, or should have been: what became of it is in its volume state.
-int bring_up(Volume* volume) {
-  int result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format);
-  if (result == kOk && !volume->asked && find_partition(volume, is_standing)) {
+MountResult bring_up(Volume* volume) {
+  MountResult result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format);
+  if (result == kMounted && !volume->asked && find_partition(volume, is_standing)) {
     return keep_standing(volume);
   }
-  if (result == kOk) result = pick_partition(volume);
-  if (result == kOk) result = prepare_file_system(volume);
-  if (result == kOk && is_standing(volume)) return keep_standing(volume);  // another run was quicker
-  if (result == kOk) result = put_in_place(volume);
+  if (result == kMounted) result = pick_partition(volume);
+  if (result == kMounted) result = prepare_file_system(volume);
+  if (result == kMounted && is_standing(volume)) return keep_standing(volume);  // another run was quicker
+  if (result == kMounted) result = put_in_place(volume);
   return result;
 }
 
 }  // namespace
 
-int Target_mount(TargetEntry* entry, int force_format, int update_share) {
+MountResult Target_mount(TargetEntry* entry, int force_format, int update_share) {
   const LogScope scope;
   LOG(2, "start");
-  int result = check_entry(entry);
-  if (result != kOk) return result;
+  MountResult result = check_entry(entry);
+  if (result != kMounted) return result;
   Volume volume{};
   volume.entry = entry;
   volume.asked = force_format != 0;
   volume.force_format = force_format;
   volume.mount_point = mount_point_of(entry->share);
   result = bring_up(&volume);
-  if (result != kOk) return result;
+  if (result != kMounted) return result;
   LOG(1, "Update_sharefolder_status = %d", update_share);
   if (update_share != 0) reload_share_services();
   LOG(2, "end");
-  return kOk;
+  return kMounted;
 }
 
-int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share) {
+Result Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share) {
   const LogScope scope;
   if (entry == nullptr || entry->db_idx < 1) return kFailed;
   LOG(2, "start");
@@ -325,14 +321,14 @@ int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share)
     if (!is_lun_stored(entry->db_idx, lun)) break;
     TargetEntry lun_entry;
     if (ktree_get_lun_entry_by_dbidx(&lun_entry, entry->db_idx, lun) != 0) continue;
-    Target_mount(&lun_entry, force_format, update_share);
+    (void)Target_mount(&lun_entry, force_format, update_share);
     ktree_update_lun_status(&lun_entry, 0);
   }
   LOG(2, "end");
   return kOk;
 }
 
-int remount_mnt_path(const char* path, int wait_seconds) {
+Result remount_mnt_path(const char* path, int wait_seconds) {
   const LogScope scope;
   if (path == nullptr) {
     LOG(0, "mnt_path not vaild");
@@ -346,7 +342,7 @@ int remount_mnt_path(const char* path, int wait_seconds) {
   if (sys_mount_point(path) == 0) return kOk;
   LOG(2, "start remount path %s", path);
   const char* command = remount.text();
-  int result = kOk;
+  Result result = kOk;
   if (system(command) != 0) {
     LOG(0, "cmd '%s' failed", command);
     result = kFailed;

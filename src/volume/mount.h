@@ -2,24 +2,24 @@
 #ifndef REMVOL_VOLUME_MOUNT_H
 #define REMVOL_VOLUME_MOUNT_H
 
+#include "support/result.h"
 #include "tree/record.h"
 #include "volume/mount_result.h"
 
 namespace remvol {
 
 // Partitions, formats (when `force_format` is non-zero or there is no file system), mounts and records the
-// entry's LUN; reloads the share services when `update_share` is non-zero. Returns 0 (also when the mount
-// never took hold: volume state 3 tells), -1 bad entry, no file system after formatting or no device node, a
-// MountResult, or -103.
-int Target_mount(TargetEntry* entry, int force_format, int update_share);
+// entry's LUN; reloads the share services when `update_share` is non-zero. Where the mount never took hold,
+// the result is kMounted and the volume state 3.
+MountResult Target_mount(TargetEntry* entry, int force_format, int update_share);
 
 // Mounts every LUN of the target up to the first empty slot and refreshes its status. Returns 0, or -1 for a
 // null entry or a db_idx below 1.
-int Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share);
+Result Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share);
 
 // Remounts a mount point in place and waits. `wait_seconds` 0: no wait; below 4: 3 seconds. Returns 0, also
 // when `path` is no mount point; -1 for a null path or a failed remount.
-int remount_mnt_path(const char* path, int wait_seconds);
+Result remount_mnt_path(const char* path, int wait_seconds);
 
 }  // namespace remvol
 

@@ -14,7 +14,7 @@ namespace remvol {
 void run_mount(const FileSystem& file_system, const char* node, const char* mount_point);
 
 // Unmounts the path, by force.
-CommandText umount_command(const char* path);
+[[nodiscard]] CommandText umount_command(const char* path);
 
 // The command that mounts what is mounted on a path anew in place, for a path of any length.
 class RemountCommand {

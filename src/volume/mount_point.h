@@ -24,16 +24,16 @@ class MountPointHold {
 };
 
 // Returns the mount point of the share.
-MountPointText mount_point_of(const char* share);
+[[nodiscard]] MountPointText mount_point_of(const char* share);
 
 // Returns whether the share's mount point lies below the mount root. It does not when the name has a
 // component "..", or none besides empty ones and ".", or when a component of the path below the root is a
 // symbolic link; that is logged at level 0 in the caller's name.
-bool is_share_inside_root(const char* share);
+[[nodiscard]] bool is_share_inside_root(const char* share);
 
 // Returns whether the kernel's table shows the block device `node`, by its number and whatever its name, as
 // mounted on `path`, and nothing else covers it there; `mount` is the table's line then.
-bool is_mounted_from(const char* node, const char* path, MountLine* mount);
+[[nodiscard]] bool is_mounted_from(const char* node, const char* path, MountLine* mount);
 
 // Detaches what is mounted on `path`, layer by layer, each synced before; see umount2(2), MNT_DETACH.
 // Processes that use a layer keep it until they end. Stops at the first layer that cannot be detached.
@@ -42,7 +42,7 @@ void detach_mounts(const char* path);
 // Returns whether "rm -rf" of `path` would run into a mounted file system: one is mounted on the path or
 // below it, or the path lies inside another volume. Where the kernel's table cannot be read, the path itself
 // is asked. Logged at level 0 in the caller's name.
-bool is_removal_unsafe(const char* path);
+[[nodiscard]] bool is_removal_unsafe(const char* path);
 
 }  // namespace remvol
 

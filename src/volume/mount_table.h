@@ -21,19 +21,19 @@ enum class Mounted { no, yes, unknown };  // unknown: the table cannot be read
 
 // Looks for a mount on `path`, which is absolute and without links, or below it, and puts the first into
 // `mount`.
-Mounted find_mount_below(const char* path, MountLine* mount);
+[[nodiscard]] Mounted find_mount_below(const char* path, MountLine* mount);
 
 // Looks for the first mount that `fits(mount, what)`.
-Mounted find_mount(bool (*fits)(const MountLine& mount, const void* what), const void* what,
-                   MountLine* mount);
+[[nodiscard]] Mounted find_mount(bool (*fits)(const MountLine& mount, const void* what), const void* what,
+                                 MountLine* mount);
 
 // Looks for a mount of the file system on `device` at `path`, which is absolute and without links; anywhere
 // when it is null.
-Mounted find_mount_of(dev_t device, const char* path, MountLine* mount);
+[[nodiscard]] Mounted find_mount_of(dev_t device, const char* path, MountLine* mount);
 
 // Returns whether what is mounted on `path` has lost its disk: its session was closed, and no other brings
 // the disk back. Where sysfs does not tell there is none lost.
-bool has_lost_disk(const char* path);
+[[nodiscard]] bool has_lost_disk(const char* path);
 
 }  // namespace remvol
 

@@ -5,6 +5,7 @@
 
 #include "frontend/log.h"
 #include "support/files.h"
+#include "support/result.h"
 #include "support/session_hold.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -12,7 +13,6 @@
 #include "volume/device.h"
 #include "volume/disk_identity.h"
 #include "volume/disk_use.h"
-#include "volume/mount_result.h"
 
 namespace remvol {
 
@@ -37,7 +37,7 @@ bool create_partition(const TargetEntry* entry, const char* device) {
     return false;
   }
   ktree_update_volume_state(entry, kVolumeNormal);
-  _create_device_node(entry->dev);
+  (void)_create_device_node(entry->dev);
   return true;
 }
 
@@ -53,7 +53,7 @@ void expand_partition(const TargetEntry* entry, const char* device) {
     return;
   }
   ktree_update_volume_state(entry, kVolumeNormal);
-  _create_device_node(entry->dev);
+  (void)_create_device_node(entry->dev);
 }
 
 // Gives an empty disk its partition, which is to be formatted then. A partition that the kernel did not have
@@ -76,7 +76,7 @@ bool adjust_partitions(const TargetEntry* entry, const char* device, PartitionLi
     list_partitions(device, partitions);
   } else if (count == 1) {
     LOG(2, "one partition found on %s", device);
-    if (check_1part_disk_need_to_expand(device) == 1) {
+    if (check_1part_disk_need_to_expand(device) == kPartitionShort) {
       expand_partition(entry, device);
       list_partitions(device, partitions);
     }
@@ -86,25 +86,25 @@ bool adjust_partitions(const TargetEntry* entry, const char* device, PartitionLi
 
 }  // namespace
 
-int check_1part_disk_need_to_expand(const char* device) {
+PartitionFit check_1part_disk_need_to_expand(const char* device) {
   const LogScope scope;
   if (device == nullptr || device[0] == '\0') {
     LOG(0, "dev string error!");
-    return -1;
+    return kPartitionError;
   }
   PartitionList partitions;
   if (list_partitions(device, partitions) != 1) {
     LOG(2, "more than 1 partition or no part, skip!");
-    return 0;
+    return kPartitionFits;
   }
   partitions[strcspn(partitions, ",")] = '\0';
   const long long disk_size = sys_get_disk_space("%s", device);
   const long long part_size = sys_get_partition_size(partitions);
   LOG(2, "disk_size = %lld, part_size = %lld", disk_size, part_size);
-  return part_size + kExpandMargin < disk_size ? 1 : 0;
+  return part_size + kExpandMargin < disk_size ? kPartitionShort : kPartitionFits;
 }
 
-int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format) {
+MountResult prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int* force_format) {
   const Text<64> device("/dev/%s", entry->dev);
   if (is_foreign_disk(entry, device)) return kMountTooSmall;  // the LUN itself has no disk here
   const long long disk_size = sys_get_disk_space("%s", device.c_str());
@@ -119,14 +119,11 @@ int prepare_partitions(const TargetEntry* entry, PartitionList& partitions, int*
     ktree_update_volume_state(entry, kVolumeFailed);
     return kMountNoPartition;
   }
-  if (check_path_exist(device) != 0) {
-    const int result = _create_device_node(entry->dev);
-    if (result != 0) {
-      LOG(0, "create device node failed");
-      return result;
-    }
+  if (check_path_exist(device) != 0 && _create_device_node(entry->dev) != kOk) {
+    LOG(0, "create device node failed");
+    return kMountFailed;
   }
-  return 0;
+  return kMounted;
 }
 
 }  // namespace remvol

@@ -9,11 +9,11 @@ namespace remvol {
 
 // Returns whether a process whose line in the process list matches `name` (for grep) has `device` in it.
 // Every line looked at is logged at level 2 in the caller's name.
-bool is_command_running_on(const char* name, const char* device);
+[[nodiscard]] bool is_command_running_on(const char* name, const char* device);
 
 // Returns whether a process called `name` has `device` in its arguments, by its own files; see
 // proc_pid_comm(5) and proc_pid_cmdline(5).
-bool has_process(const char* name, const char* device);
+[[nodiscard]] bool has_process(const char* name, const char* device);
 
 }  // namespace remvol
 

@@ -3,6 +3,7 @@
 #include <cstring>
 
 #include "support/command.h"
+#include "support/result.h"
 #include "support/session_hold.h"
 #include "support/text.h"
 #include "tree/record.h"
@@ -33,7 +34,7 @@ bool unmount_session_volumes(const char* target_name) {
     TargetEntry entry = {};
     copy_text(entry.share, mount.path + strlen(kMountRoot));
     copy_text(entry.mnt_dev, mount.source);
-    if (volumes < kMaxVolumes && Target_LUN_umount(&entry) == 0) continue;
+    if (volumes < kMaxVolumes && Target_LUN_umount(&entry) == kOk) continue;
     LOG(0, "the session of %s stays, it is mounted on %s", mount.source, mount.path);
     return false;
   }

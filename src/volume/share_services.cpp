@@ -12,9 +12,8 @@ constexpr char kReloadSmb[] = "winshare_reload";
 
 }  // namespace
 
-int reload_share_services() {
+void reload_share_services() {
   (void)!system(kReloadAll);
-  return 0;
 }
 
 void reload_smb_shares() {

@@ -4,8 +4,8 @@
 
 namespace remvol {
 
-// Has the SMB and AFP services reload their shares. Returns 0, whatever they report.
-int reload_share_services();
+// Has the SMB and AFP services reload their shares, whatever they report.
+void reload_share_services();
 
 // Has the SMB service alone reload its shares.
 void reload_smb_shares();

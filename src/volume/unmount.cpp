@@ -82,7 +82,7 @@ void umount_with_rounds(const char* mount_point) {
 
 // Removes the mount point, whether or not the unmount worked. What is still mounted is detached first, so
 // that the removal never deletes a volume's files; when that cannot be had, nothing is removed.
-int remove_mount_point(const char* mount_point) {
+Result remove_mount_point(const char* mount_point) {
   if (is_removal_unsafe(mount_point)) return kFailed;
   drop_bare_folder(mount_point);
   const CommandText command = remove_folder_command(mount_point);
@@ -112,14 +112,14 @@ void umount_luns(int dbidx) {
     if (!is_lun_stored(dbidx, lun)) return;
     TargetEntry entry;
     if (ktree_get_lun_entry_by_dbidx(&entry, dbidx, lun) != 0) continue;
-    Target_LUN_umount(&entry);
+    (void)Target_LUN_umount(&entry);
     ktree_update_lun_status(&entry, 0);
   }
 }
 
 }  // namespace
 
-int Target_LUN_umount(const TargetEntry* entry) {
+Result Target_LUN_umount(const TargetEntry* entry) {
   const LogScope scope;
   LOG(2, "start");
   if (entry == nullptr || entry->share[0] == '\0' || !is_share_inside_root(entry->share)) {
@@ -134,27 +134,27 @@ int Target_LUN_umount(const TargetEntry* entry) {
   if (check_path_exist(mount_point) != 0) return kOk;
   if (is_foreign_mount(entry, mount_point)) return kFailed;
   if (sys_mount_point(mount_point) != 0) {
-    remount_mnt_path(mount_point, 0);
+    (void)remount_mnt_path(mount_point, 0);
     umount_with_rounds(mount_point);
     detach_mounts(mount_point);
   }
-  const int result = remove_mount_point(mount_point);
+  const Result result = remove_mount_point(mount_point);
   LOG(2, "end");
   return result;
 }
 
 void unmount_if_deleted(const TargetEntry* entry) {
   const LogScope scope;
-  if (is_deleted(entry)) Target_LUN_umount(entry);
+  if (is_deleted(entry)) (void)Target_LUN_umount(entry);
 }
 
-int Target_umount_all_lun(int dbidx) {
+Result Target_umount_all_lun(int dbidx) {
   if (!is_target_stored(dbidx)) return kFailed;
   umount_luns(dbidx);
   return kOk;
 }
 
-int Target_umount_all() {
+void Target_umount_all() {
   const LogScope scope;
   LOG(2, "start");
   remember_all_targets();
@@ -162,10 +162,9 @@ int Target_umount_all() {
     if (Target_umount_all_lun(dbidx) != kOk) break;
   }
   LOG(2, "end");
-  return kOk;
 }
 
-int get_ftp_share_path(const TargetEntry* entry, char* path) {
+Result get_ftp_share_path(const TargetEntry* entry, char* path) {
   const LogScope scope;
   if (is_foreign_disk(entry, entry->mnt_dev)) {  // a mount of that node is another volume's
     path[0] = '\0';
@@ -191,7 +190,7 @@ int get_ftp_share_path(const TargetEntry* entry, char* path) {
   return path[0] != '\0' ? kOk : kNoFtpShare;
 }
 
-int Target_umount_ftp(const TargetEntry*, const char* path) {
+Result Target_umount_ftp(const TargetEntry*, const char* path) {
   const LogScope scope;
   LOG(1, "start umount ftp");
   const CommandText kill = end_users_command(path);
@@ -206,7 +205,7 @@ int Target_umount_ftp(const TargetEntry*, const char* path) {
   return kOk;
 }
 
-int Target_remount_ftp(const TargetEntry*, const char* path) {
+Result Target_remount_ftp(const TargetEntry*, const char* path) {
   const LogScope scope;
   LOG(1, "start mount ftp");
   if (path[0] == '\0') return kFailed;

@@ -2,33 +2,34 @@
 #ifndef REMVOL_VOLUME_UNMOUNT_H
 #define REMVOL_VOLUME_UNMOUNT_H
 
+#include "support/result.h"
 #include "tree/record.h"
 
 namespace remvol {
 
 // Kills the volume's users, unmounts it and removes its mount point. Returns 0, also when there is no mount
 // point; -1 for a bad entry or when the mount point could not be removed.
-int Target_LUN_umount(const TargetEntry* entry);
+Result Target_LUN_umount(const TargetEntry* entry);
 
 // Unmounts a volume whose LUN was deleted from the tree while this run mounted it, or is unknown to a tree
 // that was started anew meanwhile.
 void unmount_if_deleted(const TargetEntry* entry);
 
 // Unmounts every LUN of the target up to the first empty slot. Returns 0, or -1 when the slot is empty.
-int Target_umount_all_lun(int dbidx);
+Result Target_umount_all_lun(int dbidx);
 
-// Unmounts every LUN of every target; both walks stop at the first empty slot. Returns 0.
-int Target_umount_all();
+// Unmounts every LUN of every target; both walks stop at the first empty slot.
+void Target_umount_all();
 
 // Finds the entry's second mount, below "/home/Public", and puts its path into `path` (512 bytes). Returns 0,
 // -104 when there is none, -105 when /proc/mounts cannot be opened.
-int get_ftp_share_path(const TargetEntry* entry, char* path);
+Result get_ftp_share_path(const TargetEntry* entry, char* path);
 
 // Unmounts the FTP mount. Returns 0 or -1.
-int Target_umount_ftp(const TargetEntry* entry, const char* path);
+Result Target_umount_ftp(const TargetEntry* entry, const char* path);
 
 // Has the share services bring the FTP view back. Returns 0, or -1 for an empty path.
-int Target_remount_ftp(const TargetEntry* entry, const char* path);
+Result Target_remount_ftp(const TargetEntry* entry, const char* path);
 
 }  // namespace remvol
 

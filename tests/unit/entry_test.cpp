@@ -60,6 +60,19 @@ TargetEntry new_lun(const char* target, int lun) {
 
 class TargetLookup : public fakes::Test {};
 
+// Every value of an entry is read whole up to 255 characters.
+TEST_F(TargetLookup, ANumberOfManyDigitsIsReadWhole) {
+  const std::string zeros(250, '0');
+  for (const char* key : {"chap", "port", "conn_set"}) {
+    put_target(1);
+    put(target_key(1, key), zeros + "7");
+    TargetEntry entry = dirty();
+    ASSERT_EQ(ktree_get_entry_by_targetname("iqn.t1", &entry), 0);
+    EXPECT_EQ(entry.chap + entry.port + entry.conn_set, 7) << key;
+    put(target_key(1, key), "0");
+  }
+}
+
 TEST_F(TargetLookup, FindsTheExactName) {
   for (int n = 1; n <= 8; n++) put_target(n);
   EXPECT_EQ(ktree_get_dbidx_by_targetname("iqn.t1"), 1);

@@ -8,6 +8,7 @@
 #include "iscsi/session.h"
 #include "iscsi/session_check.h"
 #include "support/program.h"
+#include "support/result.h"
 #include "support/text.h"
 #include "tasks/whole_target.h"
 
@@ -18,8 +19,8 @@ using Texts = std::vector<std::string>;
 
 constexpr char kTarget[] = "iqn.t1";
 
-int make_no_node(const char*) {
-  return 0;
+Result make_no_node(const char*) {
+  return kOk;
 }
 
 class Iscsi : public fakes::Test {

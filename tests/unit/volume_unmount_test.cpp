@@ -291,7 +291,7 @@ class Walk : public Unmount {
 }  // namespace
 
 TEST_F(Walk, StopsAtTheFirstGap) {
-  EXPECT_EQ(Target_umount_all(), 0);
+  Target_umount_all();
   EXPECT_EQ(fakes::commands(), (Texts{"fuser -mk /dev/1-1", "fuser -mk /dev/2-1"}));
   EXPECT_EQ(fakes::tree_get("/iscsi/initiator/id:1/lun/id:1/status"), "Disable");
   EXPECT_EQ(fakes::tree_get("/iscsi/initiator/id:2/lun/id:1/status"), "Disable");
@@ -300,7 +300,7 @@ TEST_F(Walk, StopsAtTheFirstGap) {
 
 TEST_F(Walk, StopsAtTheFirstMissingTarget) {
   fakes::tree_set({{"/iscsi/initiator/id:1/target", ""}});
-  EXPECT_EQ(Target_umount_all(), 0);
+  Target_umount_all();
   EXPECT_TRUE(fakes::commands().empty());
 }
 

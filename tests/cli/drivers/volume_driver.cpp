@@ -67,7 +67,8 @@ int do_unmount(char** arguments) {
   return load(arguments) ? Target_LUN_umount(&entry) : -999;
 }
 int do_unmount_all(char**) {
-  return Target_umount_all();
+  Target_umount_all();
+  return 0;
 }
 int do_ftp_path(char** arguments) {
   char path[512] = "";
