@@ -31,4 +31,10 @@ void report(int priority, const char* format, ...) {
   fprintf(stderr, "%s\n", line);
 }
 
+int print_asked_for(const char* text) {
+  if (fputs(text, stdout) >= 0 && fflush(stdout) == 0) return 0;
+  report(LOG_ERR, "%s: write error: %s", program_invocation_short_name, strerror(errno));
+  return 1;
+}
+
 }  // namespace platform

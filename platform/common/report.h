@@ -14,6 +14,10 @@ bool is_journal(int fd);
 // LOG_WARNING for what goes on with less, LOG_NOTICE for what is well again.
 [[gnu::format(printf, 2, 3)]] void report(int priority, const char* format, ...);
 
+// Prints what was asked for, such as a help text, on standard output. Returns the exit status: 0, or 1 when
+// it cannot be written, which is said.
+int print_asked_for(const char* text);
+
 }  // namespace platform
 
 #endif

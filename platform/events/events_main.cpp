@@ -207,20 +207,16 @@ constexpr char kHelp[] =
 }  // namespace events
 
 int main(int argc, char** argv) {
-  const std::string_view option = argc > 1 ? argv[1] : "";
-  if (option.empty()) return events::serve();
+  if (argc == 1) return events::serve();
+  const std::string_view option = argc == 2 ? argv[1] : "";
   if (option == "--test") {
     execlp("remvol-notify", "remvol-notify", "--test", nullptr);
     perror("remvol-events: remvol-notify");
     return 1;
   }
-  if (option == "-h" || option == "--help") {
-    fputs(events::kHelp, stdout);
-    return 0;
-  }
+  if (option == "-h" || option == "--help") return platform::print_asked_for(events::kHelp);
   if (option == "-V" || option == "--version") {
-    puts("remvol-events " REMVOL_VERSION);
-    return 0;
+    return platform::print_asked_for("remvol-events " REMVOL_VERSION "\n");
   }
   fputs(events::kHelp, stderr);
   return 2;

@@ -196,17 +196,13 @@ constexpr char kHelp[] =
 }  // namespace keeper
 
 int main(int argc, char** argv) {
-  const std::string_view option = argc > 1 ? argv[1] : "";
-  if (option.empty()) return keeper::serve();
+  if (argc == 1) return keeper::serve();
+  const std::string_view option = argv[1];
   if (option == "--try-first" && argc == 3) return keeper::try_target(argv[2], true);
   if (option == "--try" && argc == 3) return keeper::try_target(argv[2], false);
-  if (option == "-h" || option == "--help") {
-    fputs(keeper::kHelp, stdout);
-    return 0;
-  }
-  if (option == "-V" || option == "--version") {
-    puts("remvol-keeper " REMVOL_VERSION);
-    return 0;
+  if (argc == 2 && (option == "-h" || option == "--help")) return platform::print_asked_for(keeper::kHelp);
+  if (argc == 2 && (option == "-V" || option == "--version")) {
+    return platform::print_asked_for("remvol-keeper " REMVOL_VERSION "\n");
   }
   fputs(keeper::kHelp, stderr);
   return 2;

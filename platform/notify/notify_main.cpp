@@ -30,12 +30,20 @@ bool complain(const char* subject) {
   return false;
 }
 
-Config read_config() {
+// Without the file nobody is told but the journal. Returns false, after saying so, when it is there and
+// cannot be read: who should be told is not known then.
+bool read_config(Config& config) {
   const int file = open(kConfig, O_RDONLY | O_CLOEXEC);
-  if (file < 0) return {};
-  const Config config = parse_config(platform::content_of(file));
-  close(file);
-  return config;
+  if (file < 0 && errno == ENOENT) return true;
+  char byte = '\0';
+  const bool is_readable = file >= 0 && pread(file, &byte, 1, 0) >= 0;
+  if (is_readable) {
+    config = parse_config(platform::content_of(file));
+  } else {
+    platform::report(LOG_ERR, "remvol-notify: %s: %s", kConfig, strerror(errno));
+  }
+  if (file >= 0) close(file);
+  return is_readable;
 }
 
 // When the history was made; 0 when it is none, because the file is new or damaged.
@@ -68,7 +76,9 @@ bool look(const vvstat::Status& status, std::vector<Event>& events) {
 }
 
 int tell(const std::vector<Event>& events) {
-  return deliver(events, read_config()) ? 0 : kFailed;
+  Config config;
+  const bool is_known = read_config(config);
+  return deliver(events, config) && is_known ? 0 : kFailed;
 }
 
 int look_and_tell() {
@@ -135,11 +145,9 @@ int run(int argc, char** argv) {
       case 'r':
         return tell_of_failed_recovery(target);
       case 'h':
-        fputs(kHelp, stdout);
-        return 0;
+        return platform::print_asked_for(kHelp);
       case 'V':
-        puts("remvol-notify " REMVOL_VERSION);
-        return 0;
+        return platform::print_asked_for("remvol-notify " REMVOL_VERSION "\n");
       default:
         break;
     }

@@ -2,10 +2,12 @@
 
 #include <getopt.h>
 
+#include <algorithm>
 #include <charconv>
 #include <cstdio>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "common/utf8.h"
@@ -41,9 +43,23 @@ std::vector<option> long_options() {
   return options;
 }
 
-int wrong_usage() {
+// `before`, and the text in quotation marks behind it.
+std::string with_quoted(std::string before, std::string_view text) {
+  return before.append(" \"").append(platform::printable(text)).append("\"");
+}
+
+// Tells what is wrong with the words, in the form that they ask for.
+int wrong_usage(const std::string& command, const std::string& why, bool json) {
+  if (json) return tell({command, "", "", kUsage, why, {}}, true);
+  if (!why.empty()) fprintf(stderr, "vv: %s\n", why.c_str());
   fputs("Try 'vv --help'.\n", stderr);
   return kUsage;
+}
+
+// Known before the words are read: what is wrong with them is told in that form.
+bool asks_for_json(int argc, char** argv) {
+  const std::vector<std::string_view> words(argv + 1, argv + argc);
+  return std::find(words.begin(), std::find(words.begin(), words.end(), "--"), "--json") != words.end();
 }
 
 // The options that a command takes; all of them without one.
@@ -64,6 +80,7 @@ int print_help() {
     const std::string words = std::string(command.name) + " " + argument;
     printf("  %-28s %s\n", words.c_str(), command.help);
   }
+  printf("  %-28s %s\n", "help [COMMAND]", "this text, or that of a command");
   print_options(nullptr);
   fputs(kHelpEnd, stdout);
   return finish(kDone);
@@ -86,44 +103,45 @@ int print_completions(const std::vector<std::string>& words) {
   return kDone;
 }
 
-// Says so and returns false when the command takes no such option.
-bool may_take(const Command& command, int letter, unsigned& given) {
+// The functions below return false after saying `why`.
+
+bool may_take(const Command& command, int letter, unsigned& given, std::string& why) {
   for (const OptionRow& row : option_rows()) {
     if (row.letter != letter) continue;
     given |= row.bit;
     if (takes(command, row)) return true;
-    fprintf(stderr, "vv: %s takes no --%s\n", command.name, row.name);
+    why = std::string(command.name) + " takes no --" + row.name;
   }
   return false;
 }
 
-bool read_lun(std::string_view text, int& lun) {
+bool read_lun(std::string_view text, int& lun, std::string& why) {
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), lun);
   if (error == std::errc() && end == text.data() + text.size() && lun >= 0 && lun <= kLastLun) return true;
-  fprintf(stderr, "vv: \"%s\" is no number of a LUN\n", platform::printable(text).c_str());
+  why = with_quoted("no number of a LUN:", text);
   return false;
 }
 
-bool take_text(const char* argument, std::string& field) {
-  if (argument[0] == '\0') fputs("vv: the value of an option is empty\n", stderr);
+bool take_text(const char* argument, std::string& field, std::string& why) {
+  if (argument[0] == '\0') why = "the value of an option is empty";
   field = argument;
   return argument[0] != '\0';
 }
 
-bool take_option(int letter, Options& options) {
+bool take_option(int letter, Options& options, std::string& why) {
   switch (letter) {
     case kPortalOption:
-      return take_text(optarg, options.portal);
+      return take_text(optarg, options.portal, why);
     case kTargetOption:
-      return take_text(optarg, options.target);
+      return take_text(optarg, options.target, why);
     case kLunOption:
-      return read_lun(optarg, options.lun);
+      return read_lun(optarg, options.lun, why);
     case kUserOption:
-      return take_text(optarg, options.user);
+      return take_text(optarg, options.user, why);
     case kPasswordFileOption:
-      return take_text(optarg, options.password_file);
+      return take_text(optarg, options.password_file, why);
     case kPasswordOption:
-      fputs("vv: a password is never an argument, others could see it: --password-file FILE\n", stderr);
+      why = "a password is never an argument, others could see it: --password-file FILE";
       return false;
     case kNoPasswordOption:
       return options.no_password = true;
@@ -139,57 +157,72 @@ bool take_option(int letter, Options& options) {
 }
 
 // What is there must go together.
-bool fits(const Options& options, unsigned given) {
+bool fits(const Options& options, unsigned given, std::string& why) {
   const Command& command = *options.command;
-  for (const OptionRow& row : option_rows()) {
-    if ((command.needs & row.bit & ~given) == 0) continue;
-    fprintf(stderr, "vv: %s needs --%s\n", command.name, row.name);
-    return false;
-  }
-  const char* wrong = nullptr;
-  if (options.user.empty() && !options.password_file.empty()) wrong = "--password-file needs --user";
-  if (options.no_password && !options.user.empty()) wrong = "either --user or --no-password";
+  if (options.user.empty() && !options.password_file.empty()) why = "--password-file needs --user";
+  if (options.no_password && !options.user.empty()) why = "either --user or --no-password";
   if ((command.takes & kNoPassword) != 0 && !options.no_password && options.user.empty()) {
-    wrong = "password needs --user, or --no-password";
+    why = "password needs --user, or --no-password";
   }
-  if (wrong != nullptr) fprintf(stderr, "vv: %s\n", wrong);
-  return wrong == nullptr;
+  for (const OptionRow& row : option_rows()) {
+    if ((command.needs & row.bit & ~given) != 0) why = std::string(command.name) + " needs --" + row.name;
+  }
+  return why.empty();
+}
+
+// What getopt_long(3) has found wrong with the word before the next one: `letter` is its answer.
+std::string why_not(int letter, std::string_view word) {
+  const std::string_view name = word.substr(0, word.find('='));
+  if (letter == ':') return with_quoted("an argument is missing behind the option", name);
+  if (optopt >= kPortalOption) return with_quoted("no value belongs to the option", name);
+  return with_quoted("unrecognized option", name);
 }
 
 // The words behind the command.
-int read_words(int argc, char** argv, Options& options) {
+int read_words(int argc, char** argv, Options& options, std::string& why) {
   const std::vector<option> known = long_options();
   unsigned given = 0;
-  for (int letter; (letter = getopt_long(argc, argv, "hV", known.data(), nullptr)) != -1;) {
+  opterr = 0;
+  for (int letter; (letter = getopt_long(argc, argv, ":hV", known.data(), nullptr)) != -1;) {
     if (letter == 'h') return print_help_of(*options.command);
     if (letter == 'V') return print_version();
-    if (letter == '?') return wrong_usage();
-    if (!may_take(*options.command, letter, given) || !take_option(letter, options)) return wrong_usage();
+    if (letter == '?' || letter == ':') {
+      why = why_not(letter, argv[optind - 1]);
+      return kUsage;
+    }
+    if (!may_take(*options.command, letter, given, why) || !take_option(letter, options, why)) return kUsage;
   }
   if (optind + 1 != argc || argv[optind][0] == '\0') {
-    fprintf(stderr, "vv: %s takes one %s\n", options.command->name, options.command->argument);
-    return wrong_usage();
+    why = std::string(options.command->name) + " takes one " + options.command->argument;
+    return kUsage;
   }
   options.name = argv[optind];
-  return fits(options, given) ? kGoOn : wrong_usage();
+  return fits(options, given, why) ? kGoOn : kUsage;
 }
 
 }  // namespace
 
 int read_options(int argc, char** argv, Options& options) {
-  const std::string_view first = argc > 1 ? argv[1] : "";
-  if (first == "-h" || first == "--help") return print_help();
+  const std::string first = argc > 1 ? argv[1] : "";
+  if (first == "-h" || first == "--help" || (first == "help" && argc == 2)) return print_help();
   if (first == "-V" || first == "--version") return print_version();
   if (first == "--complete") return print_completions({argv + 2, argv + argc});
+  static char help_option[] = "--help";
+  if (first == "help" && argc == 3) {
+    std::swap(argv[1], argv[2]);
+    argv[2] = help_option;
+  }
+  const bool json = asks_for_json(argc, argv);
   options.command = argc > 1 ? find_command(argv[1]) : nullptr;
+  std::string why;
   if (options.command == nullptr) {
-    if (argc > 1) fprintf(stderr, "vv: there is no command \"%s\"\n", platform::printable(argv[1]).c_str());
-    return wrong_usage();
+    if (argc > 1) why = with_quoted("there is no command", argv[1]);
+    return wrong_usage(platform::printable(argc > 1 ? argv[1] : ""), why, json);
   }
   options.rest = argv + 2;
-  // The messages of getopt_long(3) begin with the first word.
-  argv[1] = argv[0];
-  return options.command->argument == nullptr ? kGoOn : read_words(argc - 1, argv + 1, options);
+  if (options.command->argument == nullptr) return kGoOn;
+  const int status = read_words(argc - 1, argv + 1, options, why);
+  return status == kUsage ? wrong_usage(options.command->name, why, json) : status;
 }
 
 }  // namespace vv

@@ -11,7 +11,7 @@ namespace {
 
 constexpr Command kCommands[] = {
     {"discover", "PORTAL", 0, 0, discover, "lists the targets that a portal offers"},
-    {"luns", "TARGET", kPortal | kUser, 0, luns, "lists a target's LUNs"},
+    {"luns", "TARGET|SHARE", kPortal | kUser, 0, luns, "lists a target's LUNs"},
     {"add", "NAME", kPortal | kTarget | kLun | kUser, kLun, add, "makes a LUN a share of that name"},
     {"connect", "SHARE|TARGET", 0, 0, connect, "logs in, and mounts the target's volumes"},
     {"disconnect", "SHARE|TARGET", kYes, 0, disconnect, "unmounts the target's volumes, and logs out"},

@@ -54,14 +54,14 @@ void add_luns(const Words& words, Words& offered) {
 void add_names(std::string_view argument, Words& offered) {
   if (argument.find("SHARE") != std::string_view::npos) add_shares(offered);
   if (argument.find("TARGET") != std::string_view::npos) add_targets(offered);
-  if (argument == "TARGET") add_found_targets(offered);
+  if (argument.starts_with("TARGET")) add_found_targets(offered);
   if (argument == "PORTAL") add_portals(offered);
 }
 
 Words first_words() {
   Words offered;
   for (const Command& command : commands()) offered.push_back(command.name);
-  offered.insert(offered.end(), {"--help", "--version"});
+  offered.insert(offered.end(), {"help", "--help", "--version"});
   return offered;
 }
 
@@ -104,6 +104,9 @@ Words completions(const Words& words) {
   const Command* command = words.size() < 2 ? nullptr : find_command(words.front().c_str());
   Words offered;
   if (words.size() < 2) offered = first_words();
+  if (words.size() == 2 && words.front() == "help") {
+    for (const Command& each : commands()) offered.push_back(each.name);
+  }
   if (command != nullptr) offered = further_words(*command, words);
   std::erase_if(offered, [](const std::string& word) { return platform::printable(word) != word; });
   Words once;

@@ -51,7 +51,8 @@ bool find_portal(Job& job, const std::string& target_name, Portal& portal) {
     return read_portal(job.options.portal, portal, why) || job.refuse(kUsage, platform::printable(why));
   }
   const vvstat::Target* target = job.before.target(target_name);
-  if (target == nullptr) return job.refuse(kUsage, "this target is not configured here; it needs --portal");
+  if (target == nullptr)
+    return job.refuse(kUsage, "no share or target of this name is configured here; a target needs --portal");
   portal = stored_portal(target->address, target->port);
   return true;
 }
@@ -98,18 +99,20 @@ int discover(const Options& options) {
 
 int luns(const Options& options) {
   Job job(options);
+  const Row* share = job.before.share(options.name);
+  const std::string name = share != nullptr ? share->target->name : options.name;
   Portal portal;
   Credentials credentials;
-  if (!find_portal(job, options.name, portal)) return job.end();
+  if (!find_portal(job, name, portal)) return job.end();
   if (!job.read_credentials(credentials)) return job.end();
-  if (credentials.user.empty()) credentials = stored_credentials(options.name);
+  if (credentials.user.empty()) credentials = stored_credentials(name);
   const SearchTurn turn;
   if (!general_tree_answers(job, turn)) return job.end();
-  const ToolRun run = job.run(search_lun_arguments(options.name, portal, credentials), "");
-  const FoundLuns found = read_found_luns(options.name);
+  const ToolRun run = job.run(search_lun_arguments(name, portal, credentials), "");
+  const FoundLuns found = read_found_luns(name);
   if (!run.succeeded() || !found.done) return tell_luns_failed(job, found, run);
   if (found.luns.empty() && !options.json) return job.done("the target offers no LUN to this machine");
-  put(shown(table_of(job.before, options.name, found, options.json), options.json));
+  put(shown(table_of(job.before, name, found, options.json), options.json));
   return finish(kDone);
 }
 

@@ -11,6 +11,7 @@ import pytest
 
 from harness.documents import blocks_of
 from harness.ktree_daemon import BUILD, Daemon
+from test_vvstat import promtool
 
 TOP = pathlib.Path(__file__).resolve().parents[2]
 DOCS = TOP / "docs"
@@ -110,6 +111,63 @@ def test_the_monitoring_guide_has_every_metric(box):
     assert told == set(re.findall(r"remvol_\w+", guide))
 
 
+# When each rule of the guide says something, and what: minutes and alerts.
+ALERTS = r"""
+rule_files: [rules.yml]
+evaluation_interval: 1m
+tests:
+  - interval: 1m
+    input_series:
+      - {series: 'remvol_volume_healthy{share="Photos", instance="nas"}', values: "1 1 0x10 1x10"}
+      - {series: 'remvol_volume_used_bytes{share="Photos", instance="nas"}', values: "10x10 96x30"}
+      - {series: 'remvol_volume_size_bytes{share="Photos", instance="nas"}', values: "100x40"}
+      - {series: 'remvol_tree_reachable{instance="nas"}', values: "1x5 0x10 1x20"}
+    alert_rule_test:
+      - {eval_time: 6m, alertname: VolumeNeedsAttention, exp_alerts: []}
+      - eval_time: 8m
+        alertname: VolumeNeedsAttention
+        exp_alerts:
+          - exp_labels: {share: Photos, instance: nas}
+            exp_annotations: {summary: "Volume Photos on nas needs attention: vvstat -x"}
+      - {eval_time: 14m, alertname: VolumeNeedsAttention, exp_alerts: []}
+      - {eval_time: 20m, alertname: VolumeNearlyFull, exp_alerts: []}
+      - eval_time: 30m
+        alertname: VolumeNearlyFull
+        exp_alerts:
+          - exp_labels: {share: Photos, instance: nas}
+            exp_annotations: {summary: "Volume Photos on nas is nearly full"}
+      - {eval_time: 9m, alertname: VolumesUnknown, exp_alerts: []}
+      - eval_time: 12m
+        alertname: VolumesUnknown
+        exp_alerts:
+          - exp_labels: {instance: nas}
+            exp_annotations: {summary: "Nobody knows how the volumes of nas are: systemctl status remvol-tree"}
+      - {eval_time: 30m, alertname: VolumesUnknown, exp_alerts: []}
+  - interval: 1m
+    input_series:
+      - {series: 'remvol_tree_reachable{instance="nas"}', values: "1x40"}
+      - {series: 'node_textfile_mtime_seconds{file="/var/lib/prometheus/node-exporter/remvol.prom", instance="nas"}', values: "0x40"}
+    alert_rule_test:
+      - {eval_time: 9m, alertname: VolumesUnknown, exp_alerts: []}
+      - eval_time: 12m
+        alertname: VolumesUnknown
+        exp_alerts:
+          - exp_labels: {instance: nas, file: /var/lib/prometheus/node-exporter/remvol.prom}
+            exp_annotations: {summary: "Nobody knows how the volumes of nas are: systemctl status remvol-tree"}
+"""
+
+
+def test_promtool_accepts_the_rules_of_the_monitoring_guide(tmp_path):
+    """And they say what they are for, when it is so."""
+    rules, = re.findall(r"^```yaml\n(.*?)^```", (DOCS / "monitoring.md").read_text(), re.M | re.S)
+    (tmp_path / "rules.yml").write_text(rules)
+    (tmp_path / "tests.yml").write_text(ALERTS)
+    checked = promtool("check", "rules", tmp_path / "rules.yml")
+    assert checked.returncode == 0 and "SUCCESS: 3 rules found" in checked.stdout, checked.stdout
+    tested = promtool("test", "rules", tmp_path / "tests.yml")
+    assert tested.returncode == 0, tested.stdout
+
+
 @pytest.mark.parametrize("wanted, status, line", [
     ("0", 0, "VOLUMES OK - nothing is wanted, as of "), ("1", 2, "VOLUMES CRITICAL - 1 of 1 needs attention, as of "),
     (None, 3, "VOLUMES UNKNOWN - vvstat: the configuration tree cannot be reached")])
@@ -131,6 +189,54 @@ def recorded():
     times = [moment for moment, kind, _ in events]
     assert times[0] == 0 and times == sorted(times) and {kind for _, kind, _ in events} == {"o"}
     return re.sub(r"\x1b\[[0-9;]*m", "", "".join(text for _, _, text in events)).replace("\r\n", "\n")
+
+
+def test_one_version_everywhere():
+    """That of CMakeLists.txt."""
+    version = re.search(r"^project\(remvol VERSION (\S+) ", (TOP / "CMakeLists.txt").read_text(), re.M)[1]
+    assert re.search(r"^## (\S+), ", (TOP / "CHANGELOG.md").read_text(), re.M)[1] == version
+    assert (TOP / "debian/changelog").read_text().startswith(f"remvol ({version}) ")
+    for page in (DOCS / "man").iterdir():
+        assert set(re.findall(r'"remvol (\d[^"]*)"', page.read_text())) <= {version}, page
+    for program in ("vv", "vvstat", "ktree", "ktreec", "remvol-events", "remvol-keeper", "remvol-notify"):
+        told = subprocess.run([BUILD / "bin" / program, "--version"], stdout=subprocess.PIPE, text=True, check=True).stdout
+        assert told == f"{program} {version}\n"
+
+
+def test_the_demonstration_was_recorded_within_its_promise():
+    """From the end of the build to the last line: 90 seconds."""
+    events = (DOCS / "demo.cast").read_text().splitlines()[1:]
+    assert json.loads(events[-1])[0] < 90
+    assert float(re.search(r"that ran ([\d.]+) s", recorded())[1]) < 90
+    assert "scripts/fair-time 90 lab/run" in (TOP / "scripts/demo").read_text()
+
+
+def fair_time(tmp_path, limit, command, *, others=None):
+    """Runs it; `others`: seconds that the processors work meanwhile, as the command notes them."""
+    stat = tmp_path / "stat"
+    stat.write_text("cpu  100 0 100 5000 0 0 0 0 0 0\n")
+    if others is not None:
+        command = f'{command}; printf "cpu  {100 + others * 100} 0 100 9000 0 0 0 0 0 0\\n" >{stat}'
+    return subprocess.run([TOP / "scripts/fair-time", str(limit), "sh", "-c", command], stdout=subprocess.PIPE,
+                          stderr=subprocess.STDOUT, text=True, env={**os.environ, "FAIR_TIME_STAT": str(stat)})
+
+
+def test_a_demonstration_that_takes_too_long_by_its_own_fault_fails(tmp_path):
+    done = fair_time(tmp_path, 1, "sleep 1.5")
+    assert done.returncode == 1 and done.stdout.startswith("It took ")
+    assert "that is more than the 1 s that are promised" in done.stdout
+    assert fair_time(tmp_path, 1, "sleep 1.5", others=0).returncode == 1
+
+
+def test_a_demonstration_on_a_busy_machine_does_not(tmp_path):
+    done = fair_time(tmp_path, 1, "sleep 1.5", others=60)
+    assert done.returncode == 0 and ", while the processors worked 60 s for others.\n" in done.stdout.replace("59", "60")
+
+
+def test_a_demonstration_that_fails_does(tmp_path):
+    assert fair_time(tmp_path, 60, "exit 3").returncode == 3
+    done = fair_time(tmp_path, 60, "true")
+    assert done.returncode == 0 and re.fullmatch(r"It took \d+\.\d s\.\n", done.stdout)
 
 
 def test_the_recording_tells_the_whole_story():

@@ -279,6 +279,19 @@ def test_a_line_of_the_configuration_that_is_none_is_named(example, line, said):
     assert f"remvol-notify: remvol.conf: {said}\n" in notify(example, "--test").stderr
 
 
+@pytest.mark.parametrize("make, why", [(lambda path: path.mkdir(), "Is a directory"),
+                                       (lambda path: path.symlink_to(path.name), "Too many levels of symbolic links")])
+def test_a_configuration_that_cannot_be_read_is_an_error(example, make, why):  # noqa: F811
+    """Nobody knows who is to be told; those in the folder are all the same."""
+    example.path("/etc/remvol").mkdir(exist_ok=True)
+    make(example.path(CONFIG))
+    program(example, f"{PROGRAMS}/1", TELL)
+    for options in (["--test"], []):
+        done = notify(example, *options)
+        assert done.status == 1 and f"remvol-notify: {CONFIG}: {why}\n" in done.stderr
+    assert told(example)[0][0] == "test"
+
+
 def test_words_of_the_configuration_may_be_in_small_letters(example):  # noqa: F811
     example.write(CONFIG, "program /opt/tell\n")
     program(example, "/opt/tell", TELL)

@@ -108,7 +108,7 @@ HELP_COMMANDS = ["discover", "luns", "add", "connect", "disconnect", "format", "
 def test_help_names_every_command(box):
     done = box.run(["vv", "--help"])
     assert done.status == 0
-    assert re.findall(r"^  (\w[\w-]*) ", done.stdout.partition("\n\nOptions")[0], re.M) == HELP_COMMANDS
+    assert re.findall(r"^  (\w[\w-]*) ", done.stdout.partition("\n\nOptions")[0], re.M) == [*HELP_COMMANDS, "help"]
     told = set(re.findall(r"^  (--[\w-]+)", done.stdout, re.M))
     found = set()
     for command in HELP_COMMANDS[:-1]:
@@ -127,8 +127,9 @@ def test_version(box):
     ([], ""), (["bla"], 'there is no command "bla"'), (["connect"], "connect takes one SHARE|TARGET"),
     (["connect", ""], "connect takes one"), (["connect", "a", "b"], "connect takes one"),
     (["connect", "a", "--lun", "1"], "connect takes no --lun"), (["connect", "a", "--yes"], "connect takes no --yes"),
-    (["add", "a", "--portal", "10.9.0.2"], "add needs --lun"), (["add", "a", "--bad"], "unrecognized option"),
-    (["add", "a", "--lun"], "requires an argument"), (["add", "a", "--lun", "1x"], '"1x" is no number of a LUN'),
+    (["add", "a", "--portal", "10.9.0.2"], "add needs --lun"), (["add", "a", "--bad"], 'unrecognized option "--bad"'),
+    (["add", "a", "--lun"], 'an argument is missing behind the option "--lun"'),
+    (["add", "a", "--lun", "1x"], 'no number of a LUN: "1x"'),
     (["add", "a", "--lun", "-1"], "no number of a LUN"), (["add", "a", "--lun", "99999"], "no number of a LUN"),
     (["add", "a", "--lun", ""], "no number of a LUN"), (["luns", "a", "--portal", ""], "the value of an option is empty"),
     (["luns", "a", "--password-file", "f"], "--password-file needs --user"),
@@ -140,6 +141,32 @@ def test_wrong_usage(box, words, said):
     assert (done.status, done.stdout) == (2, "")
     assert said in done.stderr and done.stderr.endswith("Try 'vv --help'.\n")
     assert not box.trace("run", "set")
+    done = box.run(["vv", *words[:1], "--json", *words[1:]])
+    told = json.loads(done.stdout)
+    jsonschema.validate(told, SCHEMA)
+    [outcome] = told["outcomes"]
+    assert (done.status, outcome["status"], outcome["outcome"], done.stderr) == (2, 2, "failed", "")
+    assert said in outcome["message"] and outcome["command"] == (words[0] if words else "--json")
+
+
+def test_what_is_no_command_at_all_as_json(box):
+    done = box.run(["vv", "", "--json"])
+    jsonschema.validate(json.loads(done.stdout), SCHEMA)
+    assert done.status == 2 and json.loads(done.stdout)["outcomes"][0]["command"] is None
+
+
+def test_an_option_that_takes_no_value(box):
+    done = box.run(["vv", "delete", "a", "--yes=no"])
+    assert (done.status, done.stderr) == (2, "vv: no value belongs to the option \"--yes\"\nTry 'vv --help'.\n")
+
+
+def test_help_as_a_command(box):
+    assert box.run(["vv", "help"]).stdout == box.run(["vv", "--help"]).stdout != ""
+    for command in HELP_COMMANDS[:-1]:
+        assert box.run(["vv", "help", command]).stdout == box.run(["vv", command, "--help"]).stdout != ""
+    assert box.run(["vv", "help", "status"]).stdout.startswith("usage: vvstat ")
+    done = box.run(["vv", "help", "bla"])
+    assert done.status == 2 and 'there is no command "bla"' in done.stderr
 
 
 @pytest.mark.parametrize("portal", ["10.9.0.2:", ":3260", "10.9.0.2:0", "10.9.0.2:65536", "10.9.0.2:port", "[fd00::2",
@@ -274,11 +301,12 @@ def test_luns_are_listed_with_what_is_on_them(machine):
         {"lun": 1, "size": 2 << 30, "fstype": "ext4", "share": "Photos"},
         {"lun": 2, "size": 2 << 30, "fstype": None, "share": None}]})
     assert not machine.site.logged_in(T1)
+    assert machine.says("luns", "Photos") == (status, told)  # the target of the share
 
 
 def test_luns_of_a_target_that_is_not_configured_need_a_portal(machine, words):
     done = machine.vv("luns", T1)
-    assert (done.status, done.stderr) == (2, "vv: this target is not configured here; it needs --portal\n")
+    assert (done.status, done.stderr) == (2, "vv: no share or target of this name is configured here; a target needs --portal\n")
     assert words() == []
 
 

@@ -499,6 +499,35 @@ def test_metrics(example):
     assert vvstat(example, "-P").status == 1
 
 
+PROMTOOL = pathlib.Path(__file__).resolve().parents[2] / "build/tools/promtool"
+
+
+def promtool(*words, **more):
+    if not PROMTOOL.exists():
+        pytest.skip("scripts/get-promtool has not been run")
+    return subprocess.run([PROMTOOL, *words], stdout=subprocess.PIPE, stderr=subprocess.STDOUT, text=True, **more)
+
+
+@pytest.mark.parametrize("name", ["Photos", 'quo"te', "back\\slash", "new\nline", "bad\udcff", "a\u202eb"])
+def test_promtool_accepts_the_metrics(example, name):
+    change(example, {"lun/id:1/share": name, "lun/id:2/format_state": "1", "lun/id:2/format_progress": "37"})
+    assert example.run(["remvol-notify"], env={"LD_PRELOAD": None}).status == 0
+    text = vvstat(example, "-P").stdout
+    assert text.count("# HELP") == text.count("# TYPE") == 11
+    done = promtool("check", "metrics", input=text)
+    assert (done.returncode, done.stdout) == (0, "")
+
+
+def test_promtool_finds_what_is_wrong():
+    assert promtool("check", "metrics", input="remvol_volume_healthy{share=\"a\nb\"} 1\n").returncode != 0
+
+
+def test_promtool_accepts_the_metrics_without_the_tree(box):
+    box.tree.stop()
+    done = promtool("check", "metrics", input=vvstat(box, "-P").stdout)
+    assert (done.returncode, done.stdout) == (0, "")
+
+
 def test_metrics_without_the_tree_say_so(box):
     box.tree.stop()
     assert metrics(box) == {"remvol_tree_reachable": {(): 0}}
