@@ -64,9 +64,7 @@ void publish_names(const char* socket, const DiscoveredNames& names) {
   for (const DiscoveredName& name : names) {
     LOG(3, "vector(%d): %s", i, name.text);
     i++;
-    if (tree_write_to(socket, KeyText(key::kSearchName, i), name.text) != kOk) {
-      LOG(0, "ktreec_set() failed");
-    }
+    (void)tree_write_once_to(socket, KeyText(key::kSearchName, i), name.text);
   }
 }
 
@@ -81,10 +79,7 @@ int search_portal(const TargetEntry& request, const char* socket) {
   if (!read_names(file.get(), request.ip, &names)) return 1;
   publish_names(socket, names);
   file.reset();
-  if (tree_write_to(socket, key::kSearchDone, "1") != kOk) {
-    LOG(0, "ktreec_set() failed");
-    result = 1;
-  }
+  if (tree_write_once_to(socket, key::kSearchDone, "1") != kOk) result = 1;
   return result;
 }
 

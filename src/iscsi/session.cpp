@@ -178,9 +178,7 @@ int ktree_clean_target_dev(TargetEntry* entry) {
   const int n = slot.target();
   int result = kOk;
   for (int m = 1; m <= kMaxLunsPerTarget && is_lun_stored_at(n, m); m++) {
-    if (tree_write(KeyText(key::kLunDev, n, m), "") == kOk) continue;
-    LOG(0, "ktreec_set() failed");
-    result = kTreeFailed;
+    if (tree_write_once(KeyText(key::kLunDev, n, m), "") != kOk) result = kTreeFailed;
   }
   return result;
 }

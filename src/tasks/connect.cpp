@@ -11,6 +11,7 @@
 #include "support/target_hold.h"
 #include "tasks/whole_target.h"
 #include "tree/entry.h"
+#include "tree/lun_walk.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/lun_status.h"
@@ -53,10 +54,10 @@ void _mount_connected_lun(TargetEntry* entry) {
 // the last LUN visited could not be asked whether it is enabled.
 int _mount_enabled_luns(TargetEntry* entry, int dbidx) {
   int result = kOk;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
-    if (ktree_get_lun_entry_by_dbidx(entry, dbidx, slot) != kOk) break;
+  LunWalk luns(dbidx, LunWalk::kAtUnreadable);
+  while (luns.next(entry)) {
     int enable = 0;
-    result = ktree_get_lun_enable(&enable, dbidx, slot);
+    result = ktree_get_lun_enable(&enable, dbidx, entry->lun_db_idx);
     if (result == kOk && enable == 1) _mount_connected_lun(entry);
   }
   return result;

@@ -16,6 +16,7 @@
 #include "tasks/requested_lun.h"
 #include "tasks/whole_target.h"
 #include "tree/entry.h"
+#include "tree/lun_walk.h"
 #include "tree/recover_queue.h"
 #include "tree/slots.h"
 #include "tree/state.h"
@@ -77,10 +78,8 @@ void _check_lun(const TargetEntry* lun, TargetHealth* health) {
 TargetHealth _check_luns(int dbidx) {
   TargetHealth health;
   TargetEntry lun;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
-    if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) break;
-    _check_lun(&lun, &health);
-  }
+  LunWalk luns(dbidx, LunWalk::kAtUnreadable);
+  while (luns.next(&lun)) _check_lun(&lun, &health);
   return health;
 }
 
@@ -127,10 +126,9 @@ void _postpone(const TargetEntry* entry) {
 // Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one
 // ends the walk.
 void _unmount_luns(int dbidx) {
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(dbidx, slot)) {
-    if (!is_lun_stored(dbidx, slot)) break;
-    TargetEntry lun;
-    if (ktree_get_lun_entry_by_dbidx(&lun, dbidx, slot) != kOk) continue;
+  TargetEntry lun;
+  LunWalk luns(dbidx, LunWalk::kAtEmpty);
+  while (luns.next(&lun)) {
     FtpPath ftp_path;
     (void)take_ftp_share_down(&lun, ftp_path);
     (void)Target_LUN_umount(&lun);

@@ -10,6 +10,7 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/keys.h"
+#include "tree/lun_walk.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/share_services.h"
@@ -65,10 +66,8 @@ Result _delete_slot_of_last_lun(int dbidx, int lun) {
 Result _remove_target(TargetEntry* entry, int last_lun) {
   const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   TargetEntry lun;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
-    if (ktree_get_lun_entry_by_dbidx(&lun, entry->db_idx, slot) != kOk) break;
-    reload_lun_share(&lun);
-  }
+  LunWalk luns(entry->db_idx, LunWalk::kAtUnreadable);
+  while (luns.next(&lun)) reload_lun_share(&lun);
   Target_Disconnect(entry);
   _target_record_delete(entry);
   if (last_lun == kEveryLun) return _delete_slot(entry->db_idx, 0);

@@ -11,6 +11,7 @@
 #include "support/target_hold.h"
 #include "sysaux.h"
 #include "tree/entry.h"
+#include "tree/lun_walk.h"
 #include "tree/slots.h"
 #include "volume/mount.h"
 #include "volume/mount_point.h"
@@ -35,9 +36,9 @@ int log_out(const TargetEntry* entry) {
 // Returns whether one of the target's volumes is mounted: the appliance is running, and the session was there
 // before.
 bool has_mounted_volume(int db_idx) {
-  for (int lun = 1; lun <= kMaxLunsPerTarget; lun++) {
-    TargetEntry volume;
-    if (ktree_get_lun_entry_by_dbidx(&volume, db_idx, lun) != kOk) return false;
+  TargetEntry volume;
+  LunWalk luns(db_idx, LunWalk::kAtUnreadable);
+  while (luns.next(&volume)) {
     if (sys_mount_point(mount_point_of(volume.share)) != 0) return true;
   }
   return false;

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "frontend/log.h"
 #include "ktreec.h"
 #include "support/result.h"
 #include "tree/keys.h"
@@ -36,7 +37,7 @@ bool tree_takes_connections() {
 }  // namespace
 
 bool tree_answers(const char* key) {
-  char value[128];
+  TreeValue value;
   return ktreec_get_wb(kVolumesSocket, 0, key, value, sizeof value) >= 0 || tree_takes_connections();
 }
 
@@ -61,7 +62,7 @@ bool tree_read(const char* key, char* buffer, size_t size) {
 }
 
 bool tree_present(const char* key) {
-  char value[256];
+  TreeValue value;
   return tree_read(key, value);
 }
 
@@ -70,7 +71,7 @@ bool tree_read_surely(const char* key, char* buffer, size_t size) {
 }
 
 bool tree_present_surely(const char* key) {
-  char value[256];
+  TreeValue value;
   return tree_read_surely(key, value, sizeof value);
 }
 
@@ -84,12 +85,12 @@ bool tree_is_loaded() {
 }
 
 int tree_read_number(const char* key, int missing) {
-  char value[128];
+  TreeValue value;
   return tree_read(key, value) ? atoi(value) : missing;
 }
 
 bool tree_slot_is_free(const char* key) {
-  char value[256];
+  TreeValue value;
   return tree_get(key, value, sizeof value) == -1 || value[0] == '\0';
 }
 
@@ -99,6 +100,16 @@ int tree_write(const char* key, const char* value) {
 
 int tree_write_to(const char* socket, const char* key, const char* value) {
   return ktreec_set(socket, 0, key, value) == 0 ? kOk : kTreeFailed;
+}
+
+int tree_write_once(const char* key, const char* value) {
+  return tree_write_once_to(kVolumesSocket, key, value);
+}
+
+int tree_write_once_to(const char* socket, const char* key, const char* value) {
+  const int result = tree_write_to(socket, key, value);
+  if (result != kOk) LOG(0, "ktreec_set() failed");
+  return result;
 }
 
 int tree_write_with_tries(const char* key, const char* value) {

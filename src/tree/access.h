@@ -9,10 +9,12 @@
 #include <cstddef>
 #include <ctime>
 
-#include "frontend/log.h"
 #include "tree_layout.h"
 
 namespace remvol {
+
+// Holds any value of the tree that the tool reads, and the NUL behind it.
+using TreeValue = char[256];
 
 // Returns whether a daemon serves the tree: it has `key`, also with an empty value, or takes a connection.
 [[nodiscard]] bool tree_answers(const char* key);
@@ -69,6 +71,10 @@ int tree_read_number(const char* key, int missing);
 
 // The same on the tree behind `socket`; null means the client library's default.
 [[nodiscard]] int tree_write_to(const char* socket, const char* key, const char* value);
+
+// The same two, and log "ktreec_set() failed" at level 0 in the caller's name.
+[[nodiscard]] int tree_write_once(const char* key, const char* value);
+[[nodiscard]] int tree_write_once_to(const char* socket, const char* key, const char* value);
 
 // Sets `key` in up to 3 tries and logs "ktreec_set(%s) failed" in the caller's name after each failed one.
 // Returns 0, or -103 after the third.

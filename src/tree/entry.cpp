@@ -15,34 +15,27 @@ namespace remvol {
 
 namespace {
 
-constexpr size_t kValueSize = 256;
-
 // Copies the text at `key` into `field`, which stays as it is when the key is not present.
 template <size_t N>
 void read_field(const char* key, char (&field)[N]) {
-  char value[kValueSize];
+  TreeValue value;
   if (tree_read(key, value)) copy_text(field, value);
-}
-
-int read_number(const char* key) {
-  char value[kValueSize];
-  return tree_read(key, value) ? atoi(value) : 0;
 }
 
 // Every stored target has a port, which is stored again with what was changed: one that could not be read is
 // read once more.
 int read_port(const char* key) {
-  const int port = read_number(key);
-  return port != 0 ? port : read_number(key);
+  const int port = tree_read_number(key, 0);
+  return port != 0 ? port : tree_read_number(key, 0);
 }
 
 void read_target_fields(TargetEntry* entry, int dbidx) {
-  entry->chap = read_number(KeyText(key::kTargetChap, dbidx));
+  entry->chap = tree_read_number(KeyText(key::kTargetChap, dbidx), 0);
   read_field(KeyText(key::kTargetChapName, dbidx), entry->chap_name);
   read_field(KeyText(key::kTargetChapPwd, dbidx), entry->chap_pwd);
   read_field(KeyText(key::kTargetIp, dbidx), entry->ip);
   entry->port = read_port(KeyText(key::kTargetPort, dbidx));
-  entry->conn_set = read_number(KeyText(key::kTargetConnSet, dbidx));
+  entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
 }
 
 // Reads what the LUN slot `m` of the target in `slot` holds, which this run knows by the number `dbidx`, into
@@ -68,7 +61,7 @@ bool read_lun_at(TargetEntry* entry, int dbidx, const HeldSlot& slot, int m) {
   return true;
 }
 
-// Counts the LUNs of the slot `n` as it is now, up to the first empty one.
+// Counts the LUNs of the slot `n` as it is now, up to the first that is free by the looser rule.
 int count_luns_at(int n) {
   int count = 0;
   while (count < kMaxLunsPerTarget && !is_lun_slot_free(n, count + 1)) count++;
@@ -88,7 +81,7 @@ int count_all_luns_at(int n) {
 int slot_to_take(int free, const char* target_name) {
   bool taken = false;
   for (int n = 1; n <= kMaxTargets; n++) {
-    char name[kValueSize];
+    TreeValue name;
     if (!tree_read(KeyText(key::kTargetName, n), name)) continue;
     if (strcmp(name, target_name) == 0) return n;
     taken = taken || n == free;
@@ -99,7 +92,7 @@ int slot_to_take(int free, const char* target_name) {
 // Returns whether a LUN may be stored at `m`, by a second look: nothing is there, and it is nowhere else.
 bool may_take_lun_slot(int n, int m, int lun) {
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
-    char number[kValueSize];
+    TreeValue number;
     if (tree_read(KeyText(key::kLunNumber, n, slot), number) && (slot == m || atoi(number) == lun))
       return false;
   }
@@ -108,9 +101,7 @@ bool may_take_lun_slot(int n, int m, int lun) {
 
 // Writes one value of a new entry. Returns whether the tree took it.
 bool set_value(const char* key, const char* value) {
-  if (tree_write(key, value) == kOk) return true;
-  LOG(0, "ktreec_set() failed");
-  return false;
+  return tree_write_once(key, value) == kOk;
 }
 
 bool set_value(const char* key, int value) {
@@ -125,7 +116,7 @@ int ktree_get_dbidx_by_targetname(const char* target_name) {
   const SlotsHeld held;
   int dbidx = kFailed;
   for (int n = 1; n <= kMaxTargets && dbidx == kFailed; n++) {
-    char name[kValueSize];
+    TreeValue name;
     if (!read_target_name(n, name)) {
       LOG(1, "ktreec_get(%s) failed", KeyText(key::kTargetName, n).c_str());
       break;
@@ -277,7 +268,7 @@ void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx) {
   const LogScope scope;
   const SlotsHeld held(SlotsHeld::kChange);
   const int n = entry->db_idx;
-  char share[kValueSize];
+  TreeValue share;
   if (!tree_read(KeyText(key::kLunShare, n, lun_dbidx), share) || strcmp(share, entry->share) != 0) return;
   const KeyText number(key::kLunNumber, n, lun_dbidx);
   const KeyText enable(key::kLunEnable, n, lun_dbidx);
@@ -294,7 +285,7 @@ int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
   *enable = 0;
   const HeldSlot slot(dbidx, lun_dbidx);
   if (!slot) return kTreeFailed;
-  char value[128] = "";
+  TreeValue value = "";
   const int length = ktreec_get_wb(kVolumesSocket, 0, KeyText(key::kLunEnable, slot.target(), slot.lun()),
                                    value, sizeof value);
   if (length > 0 && value[0] != '\0') {

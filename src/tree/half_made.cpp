@@ -51,7 +51,7 @@ void drop_half_made_luns_of(int n) {
 // A LUN is counted right after it was stored; a run that was killed in between has not counted it. A count
 // that no run is known to have left so stays.
 void count_luns_of(int n) {
-  char name[256];
+  TreeValue name;
   if (read_target_name(n, name) && tree_read_number(KeyText(key::kTargetLunCount, n), 0) < last_lun_at(n) &&
       IdleTarget(name))
     ktree_update_current_luncnt(n);
@@ -59,7 +59,7 @@ void count_luns_of(int n) {
 
 // A target whose mount failed is not counted, as those who read the tree know it.
 bool is_uncounted(int n) {
-  char name[256];
+  TreeValue name;
   return read_target_name(n, name) && tree_present(KeyText(key::kLunShare, n, 1)) &&
          tree_read_number(KeyText(key::kLunVolumeState, n, 1), kVolumeNormal) != kVolumeFailed &&
          IdleTarget(name);

@@ -28,14 +28,12 @@ int ktree_insert_recover_queue(const char* target_name) {
     LOG(0, "db failed or exceed max queue length");
     return kFailed;
   }
-  if (tree_write(KeyText(key::kRecoverName, q), target_name) == kOk) return kOk;
-  LOG(0, "ktreec_set() failed");
-  return kTreeFailed;
+  return tree_write_once(KeyText(key::kRecoverName, q), target_name);
 }
 
 int ktree_pop_recover_queue(char* target_name) {
   const LogScope scope;
-  char name[256];
+  TreeValue name;
   if (!tree_read(KeyText(key::kRecoverName, 1), name)) return kFailed;
   memcpy(target_name, name, sizeof name);
   LOG(2, "pop %s", target_name);

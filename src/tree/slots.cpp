@@ -20,8 +20,7 @@ constexpr char kSlotsLock[] = "slots.lock";
 constexpr int kNoLun = -1;
 constexpr int kGone = 0;
 
-using TargetName = char[256];
-using Value = char[256];
+using TargetName = TreeValue;
 
 // What this run knows of one target slot.
 struct KnownSlot {
@@ -93,7 +92,7 @@ enum class Belief { kSinceCommand, kAny };
 // Reads the value at `key`, which defines a slot, or takes it from `seen` while the slots are held; null:
 // nothing is kept of it. Returns what tree_get() does.
 template <size_t N>
-int get_slot_value(const char* key, Seen<N>* seen, Value& value, Belief belief) {
+int get_slot_value(const char* key, Seen<N>* seen, TreeValue& value, Belief belief) {
   if (!are_locked) seen = nullptr;
   if (seen != nullptr && seen->what != seen->kNothing &&
       (belief == Belief::kAny || seen->commands == commands_noticed)) {
@@ -128,7 +127,7 @@ int get_target_name(int n, TargetName& name, Belief belief) {
   return get_slot_value(KeyText(key::kTargetName, n), seen, name, belief);
 }
 
-int get_lun_number(int n, int m, Value& number, Belief belief) {
+int get_lun_number(int n, int m, TreeValue& number, Belief belief) {
   auto* const seen = is_lun_slot(n, m) ? &seen_slots[n].luns[m] : nullptr;
   return get_slot_value(KeyText(key::kLunNumber, n, m), seen, number, belief);
 }
@@ -204,7 +203,7 @@ bool read_target_name(int n, TargetName& name) {
 }
 
 bool read_lun_number(int n, int m, int* lun) {
-  Value number;
+  TreeValue number;
   if (get_lun_number(n, m, number, Belief::kSinceCommand) <= 0 || number[0] == '\0') return false;
   *lun = atoi(number);
   return true;
@@ -226,7 +225,7 @@ bool is_target_slot_free(int n) {
 }
 
 bool is_lun_slot_free(int n, int m) {
-  Value number;
+  TreeValue number;
   return get_lun_number(n, m, number, Belief::kAny) == -1 || number[0] == '\0';
 }
 

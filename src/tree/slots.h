@@ -8,7 +8,7 @@
 #ifndef REMVOL_TREE_SLOTS_H
 #define REMVOL_TREE_SLOTS_H
 
-#include "frontend/log.h"
+#include "tree/access.h"
 
 namespace remvol {
 
@@ -56,7 +56,7 @@ class HeldSlot {
 
 // What defines a slot: the name of the target in it, the number of the LUN. Read from the tree, but only once
 // as long as no run moves slots and no command runs. Return whether it is there.
-[[nodiscard]] bool read_target_name(int n, char (&name)[256]);
+[[nodiscard]] bool read_target_name(int n, TreeValue& name);
 [[nodiscard]] bool read_lun_number(int n, int m, int* lun);
 
 // Return whether it is there.

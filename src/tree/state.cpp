@@ -15,7 +15,7 @@ namespace remvol {
 namespace {
 
 int read_state(const char* key, bool stored, int* value, int missing) {
-  char text[128];
+  TreeValue text;
   const bool present = stored && tree_read(key, text);
   *value = present ? atoi(text) : missing;
   return present ? kOk : kTreeFailed;
@@ -179,9 +179,7 @@ int ktree_record_connect_set(const TargetEntry* entry) {
   const KeyText key(key::kTargetConnSet, slot.target());
   const NumberText value("%d", entry->conn_set);
   LOG(1, "ktreec_set %s=%s", key.c_str(), value.c_str());
-  if (tree_write(key, value) == kOk) return kOk;
-  LOG(0, "ktreec_set() failed");
-  return kTreeFailed;
+  return tree_write_once(key, value);
 }
 
 int read_lun_state(int dbidx, int lun_dbidx, LunState* state) {

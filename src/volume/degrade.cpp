@@ -14,8 +14,8 @@
 #include "support/files.h"
 #include "support/text.h"
 #include "sysaux.h"
-#include "volume/mount.h"
 #include "volume/mount_table.h"
+#include "volume/remount.h"
 
 namespace remvol {
 

@@ -13,6 +13,7 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/entry.h"
+#include "tree/lun_walk.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/bare_folder.h"
@@ -30,8 +31,6 @@
 namespace remvol {
 
 namespace {
-
-constexpr int kShortestRemountWait = 3;  // seconds
 
 // A device node held open.
 class HeldNode {
@@ -317,42 +316,14 @@ Result Target_mount_all_lun(TargetEntry* entry, int force_format, int update_sha
   const LogScope scope;
   if (entry == nullptr || entry->db_idx < 1) return kFailed;
   LOG(2, "start");
-  for (int lun = 1; lun <= kMaxLunsPerTarget; lun = lun_slot_after(entry->db_idx, lun)) {
-    if (!is_lun_stored(entry->db_idx, lun)) break;
-    TargetEntry lun_entry;
-    if (ktree_get_lun_entry_by_dbidx(&lun_entry, entry->db_idx, lun) != 0) continue;
-    (void)Target_mount(&lun_entry, force_format, update_share);
-    ktree_update_lun_status(&lun_entry, 0);
+  TargetEntry lun;
+  LunWalk luns(entry->db_idx, LunWalk::kAtEmpty);
+  while (luns.next(&lun)) {
+    (void)Target_mount(&lun, force_format, update_share);
+    ktree_update_lun_status(&lun, 0);
   }
   LOG(2, "end");
   return kOk;
-}
-
-Result remount_mnt_path(const char* path, int wait_seconds) {
-  const LogScope scope;
-  if (path == nullptr) {
-    LOG(0, "mnt_path not vaild");
-    return kFailed;
-  }
-  RemountCommand remount(path);
-  if (!remount) {
-    LOG(0, "malloc failed");
-    return kFailed;
-  }
-  if (sys_mount_point(path) == 0) return kOk;
-  LOG(2, "start remount path %s", path);
-  const char* command = remount.text();
-  Result result = kOk;
-  if (system(command) != 0) {
-    LOG(0, "cmd '%s' failed", command);
-    result = kFailed;
-  }
-  if (wait_seconds > 0) {
-    if (wait_seconds <= kShortestRemountWait) wait_seconds = kShortestRemountWait;
-    LOG(2, "sleep %d seconds to wait remount done...", wait_seconds);
-    sleep(static_cast<unsigned>(wait_seconds));
-  }
-  return result;
 }
 
 }  // namespace remvol

@@ -17,10 +17,6 @@ MountResult Target_mount(TargetEntry* entry, int force_format, int update_share)
 // null entry or a db_idx below 1.
 Result Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share);
 
-// Remounts a mount point in place and waits. `wait_seconds` 0: no wait; below 4: 3 seconds. Returns 0, also
-// when `path` is no mount point; -1 for a null path or a failed remount.
-Result remount_mnt_path(const char* path, int wait_seconds);
-
 }  // namespace remvol
 
 #endif

@@ -17,14 +17,15 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/entry.h"
+#include "tree/lun_walk.h"
 #include "tree/slots.h"
 #include "volume/bare_folder.h"
 #include "volume/disk_identity.h"
 #include "volume/disk_use.h"
 #include "volume/lun_status.h"
-#include "volume/mount.h"
 #include "volume/mount_command.h"
 #include "volume/mount_point.h"
+#include "volume/remount.h"
 #include "volume/share_services.h"
 
 namespace remvol {
@@ -108,12 +109,11 @@ bool is_deleted(const TargetEntry* entry) {
 
 // Unmounts every LUN of the target up to the first empty slot.
 void umount_luns(int dbidx) {
-  for (int lun = 1; lun <= kMaxLunsPerTarget; lun = lun_slot_after(dbidx, lun)) {
-    if (!is_lun_stored(dbidx, lun)) return;
-    TargetEntry entry;
-    if (ktree_get_lun_entry_by_dbidx(&entry, dbidx, lun) != 0) continue;
-    (void)Target_LUN_umount(&entry);
-    ktree_update_lun_status(&entry, 0);
+  TargetEntry lun;
+  LunWalk luns(dbidx, LunWalk::kAtEmpty);
+  while (luns.next(&lun)) {
+    (void)Target_LUN_umount(&lun);
+    ktree_update_lun_status(&lun, 0);
   }
 }
 

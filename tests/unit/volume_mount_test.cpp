@@ -1,5 +1,6 @@
 // Mounting a LUN: the steps, and what each failure leaves.
 #include "volume/mount.h"
+#include "volume/remount.h"
 
 #include <filesystem>
 #include <fstream>
