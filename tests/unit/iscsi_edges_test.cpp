@@ -27,12 +27,6 @@ class Iscsi : public fakes::Test {
  protected:
   Iscsi() { snprintf(program_path, sizeof program_path, "/usr/bin/unit%d", getpid()); }
 
-  // The messages of the log, without their prefixes.
-  static std::string logged(const std::function<void()>& function) {
-    const std::string output = fakes::output_of(function);
-    return std::regex_replace(output, std::regex("\\(src\\.cpp:\\w+:\\d+\\): "), "");
-  }
-
   static TargetEntry entry(const char* ip = "10.0.0.1", int port = 3260) {
     TargetEntry made = {};
     copy_text(made.target_name, kTarget);
@@ -58,8 +52,8 @@ TEST_F(Iscsi, CheckOfNoName) {
 }
 
 TEST_F(Iscsi, WaitOfNoName) {
-  EXPECT_EQ(logged([] { EXPECT_EQ(_wait_sess_lun_ready(nullptr, 3), -1); }), "parameter error\n");
-  EXPECT_EQ(logged([] { EXPECT_EQ(_wait_sess_lun_ready("", 3), -1); }), "target name error\n");
+  EXPECT_EQ(messages([] { EXPECT_EQ(_wait_sess_lun_ready(nullptr, 3), -1); }), "parameter error\n");
+  EXPECT_EQ(messages([] { EXPECT_EQ(_wait_sess_lun_ready("", 3), -1); }), "target name error\n");
 }
 
 TEST_F(Iscsi, WaitOfNoSecondsPollsOnce) {
@@ -82,11 +76,11 @@ TEST_F(Iscsi, WaitOfLessThanNothingDoesNotPoll) {
 
 TEST_F(Iscsi, ListOfNothing) {
   LunNode* head = nullptr;
-  EXPECT_EQ(logged([] { EXPECT_EQ(_get_sess_lun_list(nullptr, kTarget, make_no_node), -1); }),
+  EXPECT_EQ(messages([] { EXPECT_EQ(_get_sess_lun_list(nullptr, kTarget, make_no_node), -1); }),
             "parameter error\n");
-  EXPECT_EQ(logged([&] { EXPECT_EQ(_get_sess_lun_list(&head, nullptr, make_no_node), -1); }),
+  EXPECT_EQ(messages([&] { EXPECT_EQ(_get_sess_lun_list(&head, nullptr, make_no_node), -1); }),
             "parameter error\n");
-  EXPECT_EQ(logged([&] { EXPECT_EQ(_get_sess_lun_list(&head, "", make_no_node), -1); }),
+  EXPECT_EQ(messages([&] { EXPECT_EQ(_get_sess_lun_list(&head, "", make_no_node), -1); }),
             "target name error\n");
 }
 
@@ -136,7 +130,7 @@ TEST_F(Iscsi, CleaningGoesOnAfterAFailedWrite) {
   fakes::on("ktreec_set", "/iscsi/initiator/id:1/lun/id:1/dev").returns(-1);
   TargetEntry first = entry();
   first.db_idx = 1;
-  EXPECT_EQ(logged([&] { EXPECT_EQ(ktree_clean_target_dev(&first), -103); }), "ktreec_set() failed\n");
+  EXPECT_EQ(messages([&] { EXPECT_EQ(ktree_clean_target_dev(&first), -103); }), "ktreec_set() failed\n");
   EXPECT_EQ(fakes::tree_get("/iscsi/initiator/id:1/lun/id:2/dev"), "");
 }
 
@@ -163,7 +157,8 @@ TEST_F(Iscsi, DisksOfLunsThatAreNotStoredAreNone) {
 
 TEST_F(Iscsi, UpdateOfNoEntry) {
   listing("");
-  EXPECT_EQ(logged([] { EXPECT_EQ(ktree_update_dev(nullptr), -1); }), "ktree_clean_target_dev for  failed\n");
+  EXPECT_EQ(messages([] { EXPECT_EQ(ktree_update_dev(nullptr), -1); }),
+            "ktree_clean_target_dev for  failed\n");
 }
 
 TEST_F(Iscsi, InterfaceOfNothing) {
@@ -209,7 +204,7 @@ TEST_F(Iscsi, RecordIsDeletedOnItsOwn) {
   TargetEntry known = entry();
   const std::string command = "iscsiadm -m node -I default -T iqn.t1 -p 10.0.0.1:3260 -o delete";
   fakes::on("system", command).returns(21 << 8);
-  EXPECT_EQ(logged([&] { EXPECT_EQ(_target_record_delete(&known), 0); }),
+  EXPECT_EQ(messages([&] { EXPECT_EQ(_target_record_delete(&known), 0); }),
             "system() of cmd '" + command + "' failed\n");
   EXPECT_EQ(fakes::commands(), Texts{command});
 }
@@ -227,7 +222,7 @@ TEST_F(Iscsi, LoginOutsideThePorts) {
 
 TEST_F(Iscsi, PlainLogoutNeedsAName) {
   TargetEntry nameless = {};
-  EXPECT_EQ(logged([&] { EXPECT_EQ(_target_disconnect(&nameless), -1); }), "parameter error\n");
+  EXPECT_EQ(messages([&] { EXPECT_EQ(_target_disconnect(&nameless), -1); }), "parameter error\n");
   EXPECT_EQ(fakes::calls(), Texts{});
 }
 
@@ -252,7 +247,7 @@ TEST_F(Iscsi, LogoutOfNoNameIsTried) {
 
 TEST_F(Iscsi, DisconnectOfAnUnknownTarget) {
   TargetEntry unknown = entry();
-  EXPECT_EQ(logged([&] { EXPECT_EQ(Target_Disconnect(&unknown), -1); }),
+  EXPECT_EQ(messages([&] { EXPECT_EQ(Target_Disconnect(&unknown), -1); }),
             "target : iqn.t1  does not exist in ktree\n");
   EXPECT_EQ(fakes::commands(), Texts{});
 }
@@ -268,7 +263,7 @@ TEST_F(Iscsi, DisconnectFindsTheSlotByName) {
 
 TEST_F(Iscsi, OfferOfNothing) {
   const auto asks = [](const char* name, const char* address, int port, const char* text) {
-    EXPECT_EQ(logged([=] { EXPECT_EQ(Portal_search_target(name, address, port), -1); }), text);
+    EXPECT_EQ(messages([=] { EXPECT_EQ(Portal_search_target(name, address, port), -1); }), text);
   };
   asks(nullptr, "10.0.0.1", 3260, "target name or ip is not given\n");
   asks(kTarget, nullptr, 3260, "target name or ip is not given\n");

@@ -37,7 +37,7 @@ TEST_F(RecoverQueue, TheHundredAndFirstIsRefused) {
     ASSERT_EQ(ktree_insert_recover_queue(("t" + std::to_string(q)).c_str()), 0);
   }
   const std::string log = fakes::output_of([] { EXPECT_EQ(ktree_insert_recover_queue("late"), -1); });
-  EXPECT_NE(log.find("db failed or exceed max queue length"), std::string::npos);
+  EXPECT_TRUE(has(log, "db failed or exceed max queue length"));
   EXPECT_EQ(ktree_get_free_recover_queue_db_idx(), -1);
   EXPECT_EQ(fakes::tree_get(entry(101) + "/target_name"), std::nullopt);
 }
@@ -45,7 +45,7 @@ TEST_F(RecoverQueue, TheHundredAndFirstIsRefused) {
 TEST_F(RecoverQueue, ARefusedInsert) {
   fakes::on("ktreec_set", entry(1) + "/target_name").returns(-1);
   const std::string log = fakes::output_of([] { EXPECT_EQ(ktree_insert_recover_queue("a"), -103); });
-  EXPECT_NE(log.find("ktreec_set() failed"), std::string::npos);
+  EXPECT_TRUE(has(log, "ktreec_set() failed"));
   EXPECT_EQ(fakes::writes().size(), 1u);
 }
 
@@ -54,7 +54,7 @@ TEST_F(RecoverQueue, ARefusedDeleteStillGivesTheName) {
   fakes::on("ktreec_del", entry(1)).returns(-1);
   const std::string log = fakes::output_of([this] { EXPECT_EQ(ktree_pop_recover_queue(name_), -103); });
   EXPECT_STREQ(name_, "a");
-  EXPECT_NE(log.find("ktreec_del() of path '/temp/remvol/recover/queue/id:1' failed"), std::string::npos);
+  EXPECT_TRUE(has(log, "ktreec_del() of path '/temp/remvol/recover/queue/id:1' failed"));
 }
 
 TEST_F(RecoverQueue, AnEmptyQueueIsNotLogged) {

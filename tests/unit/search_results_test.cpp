@@ -69,7 +69,7 @@ TEST_F(SearchResults, TheFirstRefusedWriteEndsIt) {
     const size_t before = fakes::writes().size();
     const std::string log =
         fakes::output_of([this] { EXPECT_EQ(ktree_update_search_lun_result(kSocket, &first_, "t"), -103); });
-    EXPECT_NE(log.find("ktreec_set(" + key + ") failed"), std::string::npos);
+    EXPECT_TRUE(has(log, "ktreec_set(" + key + ") failed"));
     EXPECT_EQ(fakes::writes().back().rfind("set " + key, 0), 0u) << fakes::writes().back();
     EXPECT_GT(fakes::writes().size(), before);
   }

@@ -71,12 +71,6 @@ class VolumeTest : public fakes::Test {
     return values;
   }
 
-  // Whether the log has the message, behind any prefix.
-  static testing::AssertionResult has(const std::string& log, const std::string& message) {
-    if (log.find("): " + message + "\n") != std::string::npos) return testing::AssertionSuccess();
-    return testing::AssertionFailure() << "no message '" << message << "' in\n" << log;
-  }
-
   remvol::TargetEntry entry{};
 };
 

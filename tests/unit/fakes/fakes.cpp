@@ -212,4 +212,13 @@ void Test::TearDown() {
   for (const std::string& call : calls({"unanswered"})) ADD_FAILURE() << call;
 }
 
+testing::AssertionResult Test::has(const std::string& log, const std::string& message) {
+  if (log.find("): " + message + "\n") != std::string::npos) return testing::AssertionSuccess();
+  return testing::AssertionFailure() << "no message '" << message << "' in\n" << log;
+}
+
+std::string Test::messages(const std::function<void()>& function) {
+  return std::regex_replace(output_of(function), std::regex("\\([^:()]+:[^:()]+:\\d+\\): "), "");
+}
+
 }  // namespace fakes

@@ -123,6 +123,12 @@ class Test : public testing::Test {
   Test();
   ~Test() override;
   void TearDown() override;
+
+  // Whether the log, as output_of() gives it, has the message, a whole line behind any prefix.
+  static testing::AssertionResult has(const std::string& log, const std::string& message);
+
+  // What the function logs, without the prefixes.
+  static std::string messages(const std::function<void()>& function);
 };
 
 // --- for the fakes themselves ---
