@@ -20,8 +20,8 @@ set(CMAKE_CXX_VISIBILITY_PRESET hidden)
 set(CMAKE_C_VISIBILITY_PRESET hidden)
 set(CMAKE_VISIBILITY_INLINES_HIDDEN ON)
 # Installed programs find the private libraries beside them, wherever the prefix is.
-file(RELATIVE_PATH _bin_to_lib "/${CMAKE_INSTALL_BINDIR}" "/${CMAKE_INSTALL_LIBDIR}")
-set(CMAKE_INSTALL_RPATH "$ORIGIN/${_bin_to_lib}")
+file(RELATIVE_PATH bin_to_lib "/${CMAKE_INSTALL_BINDIR}" "/${CMAKE_INSTALL_LIBDIR}")
+set(CMAKE_INSTALL_RPATH "$ORIGIN/${bin_to_lib}")
 
 # Libraries need no other of this project. A search path of theirs would only be walked in vain for every one of the
 # system's that they load.
