@@ -1,4 +1,4 @@
-// The command table: one row a long option, in the order of its index.
+// The command table: one row for each long option, in the order of its index.
 #ifndef REMVOL_FRONTEND_COMMANDS_H
 #define REMVOL_FRONTEND_COMMANDS_H
 

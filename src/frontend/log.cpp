@@ -25,7 +25,7 @@ bool is_journal(int fd) {
   return connected && peer.sun_family == AF_UNIX && strcmp(peer.sun_path, kJournal) == 0;
 }
 
-// The journal takes a priority at the begin of each line, of a message of several lines as well.
+// The journal takes a priority at the beginning of each line, of a message of several lines as well.
 void print_lines(Weight weight, const char* text, size_t size) {
   while (const void* end = memchr(text, '\n', size)) {
     const size_t line = static_cast<size_t>(static_cast<const char*>(end) - text) + 1;

@@ -14,7 +14,7 @@ namespace remvol {
 // What stands in messages in place of a CHAP secret.
 inline constexpr char kMaskedSecret[] = "***";
 
-// What a message matters: its level, and its priority in the journal (syslog(3)).
+// How much a message matters: its level, and its priority in the journal (syslog(3)).
 struct Weight {
   int level, priority;
 
@@ -28,7 +28,7 @@ struct Weight {
       : level(message_level), priority(journal_priority) {}
 };
 
-// Shown as an error is, and none: what is told at level 0 although it is as it should be.
+// Shown as an error is, but none: what is told at level 0 although it is as it should be.
 inline constexpr Weight kNote(0, 6);
 
 // The command has failed.
@@ -37,7 +37,7 @@ inline constexpr Weight kCommandFailed(0, 3);
 // The process-wide debug level. Negative silences everything. Set once by main.
 extern int debug_level;
 
-// The function in whose name messages are told: it has an object of this at its beginning. What it calls and
+// The function in whose name messages are told: it has an object of this at its beginning. What it calls that
 // has none of its own logs in its name, so that a reader of the log finds the step, and not the helper of
 // many steps.
 class LogScope {

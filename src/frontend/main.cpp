@@ -1,5 +1,5 @@
-// remvol: one command of the appliance a run. main reads the command line, runs the command's handler and
-// records the outcome.
+// remvol: one command of the appliance for each run. main reads the command line, runs the command's handler
+// and records the outcome.
 #include <sys/prctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -50,7 +50,7 @@ int fail(bool show_usage) {
   return kFailureStatus;
 }
 
-// Anybody can make a file in /tmp. The mark of another user than root is none.
+// Anybody can make a file in /tmp. A mark that is not root's is none.
 bool is_strangers_file(const char* path) {
   struct stat info;
   if (lstat(path, &info) != 0) return false;

@@ -7,7 +7,7 @@
 
 namespace remvol {
 
-// Bits of OPT_FLAG, one a parameter option. 0x10 is never set.
+// Bits of OPT_FLAG, one for each parameter option. 0x10 is never set.
 enum OptionBit : unsigned {
   kOptName = 0x01,
   kOptChap = 0x02,

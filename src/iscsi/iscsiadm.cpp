@@ -20,7 +20,7 @@ bool leaves_records(const char* text) {
   }
 }
 
-// A record holds a setting a line: behind a line break would stand another setting.
+// A record holds one setting on each line: what follows a line break would be another one.
 bool breaks_line(const char* value) {
   return strchr(value, '\n') != nullptr;
 }

@@ -3,7 +3,7 @@
 // Some put the target name between double quotes and some do not. What watches this tool's commands knows
 // them so.
 //
-// Values reach iscsiadm only as text; see shell_command. Refused besides, at level 0, is what would leave the
+// Values reach iscsiadm only as text; see shell_command. Also refused, at level 0, is what would leave the
 // initiator's records: a target name or address with a component "..", and a user or secret with a line
 // break, behind which would stand another setting of the record. A refused command is one that fails.
 #ifndef REMVOL_ISCSI_ISCSIADM_H

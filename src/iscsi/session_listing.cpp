@@ -124,8 +124,8 @@ struct NameWriter {
   }
 };
 
-// Appends what printf would print for the directive at the begin of `text`, behind its "%", with `whole` as
-// the argument. Returns the length of the directive.
+// Appends what printf would print for the directive at the beginning of `text`, behind its "%", with `whole`
+// as the argument. Returns the length of the directive.
 size_t append_directive(NameWriter* out, string_view text, string_view whole, bool* has_argument) {
   if (text.starts_with('%')) {
     out->append("%");

@@ -17,8 +17,8 @@ inline constexpr int kNoSessionExit = 21;
 // is followed by neither a letter nor a digit. So "t1" is found in a line that shows only "t1-x".
 bool session_line_shows(const char* line, const char* name);
 
-// Reader of "iscsiadm -m session -P 3", which lists a block a target: its "Target" line, the state of its
-// session, its SCSI host and its LUNs. The two readers below differ in their start values alone.
+// Reader of "iscsiadm -m session -P 3", which lists one block for each target: its "Target" line, the state
+// of its session, its SCSI host and its LUNs. The two readers below differ in their start values alone.
 struct DetailedListing {
   int match;         // targets_seen at the wanted target's own line
   int targets_seen;  // "Target" lines so far

@@ -32,7 +32,7 @@ bool enter(const char* target_name) {
   return true;
 }
 
-// Takes the lock. Returns whether it had to be waited for. Who holds it may itself wait for the format
+// Takes the lock. Returns whether it had to be waited for. Whoever holds it may itself wait for the format
 // semaphore, of which this run may have kept hold.
 bool take_waiting(RunLock* lock, const char* name, LockMode mode) {
   if (lock->try_take(name, mode) != LockTry::kBusy) return false;

@@ -7,8 +7,8 @@
 namespace remvol {
 
 // Publishes the LUNs found on `target_name` in the tree behind `socket` (null: the client library's default).
-// `luns` may be null: none found. Prints a line a LUN. Returns 0, -1 for a null name, or -103 at the first
-// write that fails.
+// `luns` may be null: none found. Prints one line for each LUN. Returns 0, -1 for a null name, or -103 at the
+// first write that fails.
 int ktree_update_search_lun_result(const char* socket, const LunNode* luns, const char* target_name);
 
 // Writes the result code of a LUN search to the tree behind `socket`, in up to 3 tries. Returns 0 or -103.

@@ -1,4 +1,5 @@
-// Brings stored settings of layout version 0 (one volume a target) up to version 1 (LUNs below a target).
+// Brings stored settings of layout version 0 (one volume for each target) up to version 1 (LUNs below a
+// target).
 #ifndef REMVOL_UPGRADE_REMVOL_VER_UPGRADE_H
 #define REMVOL_UPGRADE_REMVOL_VER_UPGRADE_H
 

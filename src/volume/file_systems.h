@@ -1,4 +1,4 @@
-// The file systems that a volume may carry: a row each of one table. A further one needs its row and, when it
+// The file systems that a volume may carry, each a row of one table. A further one needs its row and, when it
 // is made, checked or grown by programs of its own, a file of their commands as e2fsprogs is one.
 #ifndef REMVOL_VOLUME_FILE_SYSTEMS_H
 #define REMVOL_VOLUME_FILE_SYSTEMS_H

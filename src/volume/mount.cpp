@@ -177,7 +177,7 @@ MountResult keep_file_system(Volume* volume) {
   LOG(1, "Got FS type = %s, skip creating volume", volume->fs_type);
   const FileSystem* file_system = find_file_system(volume->fs_type);
   if (file_system != nullptr && file_system->check != nullptr && sys_check_fs_state(volume->node) != 0) {
-    volume->held.release();  // the look takes its time, and another run may kill who holds the node
+    volume->held.release();  // the look takes its time, and another run may kill whoever holds the node
     System("%s", file_system->check(volume->node).c_str());
   }
   return note_update(ktree_update_formatting_state(volume->entry, kFormatIdle)) ? kMounted : kMountUnrecorded;
