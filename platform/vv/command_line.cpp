@@ -51,7 +51,7 @@ std::string with_quoted(std::string before, std::string_view text) {
 // Tells what is wrong with the words, in the form that they ask for.
 int wrong_usage(const std::string& command, const std::string& why, bool json) {
   if (json) return tell({command, "", "", kUsage, why, {}}, true);
-  if (!why.empty()) fprintf(stderr, "vv: %s\n", why.c_str());
+  fprintf(stderr, "vv: %s\n", why.c_str());
   fputs("Try 'vv --help'.\n", stderr);
   return kUsage;
 }
@@ -214,11 +214,12 @@ int read_options(int argc, char** argv, Options& options) {
   }
   const bool json = asks_for_json(argc, argv);
   options.command = argc > 1 ? find_command(argv[1]) : nullptr;
-  std::string why;
+  std::string why = "a command is missing";
   if (options.command == nullptr) {
-    if (argc > 1) why = with_quoted("there is no command", argv[1]);
+    if (argc > 1 && argv[1][0] != '-') why = with_quoted("there is no command", argv[1]);
     return wrong_usage(platform::printable(argc > 1 ? argv[1] : ""), why, json);
   }
+  why.clear();
   options.rest = argv + 2;
   if (options.command->argument == nullptr) return kGoOn;
   const int status = read_words(argc - 1, argv + 1, options, why);

@@ -47,8 +47,9 @@ const char* first_step(int before, int now) {
   return before != now && now == remvol::kVolumeCreating ? "looking at its disk" : nullptr;
 }
 
+// It may still be formatted: that it is mounted is said at the end, when it is so.
 const char* last_step(int before, int now) {
-  return before == remvol::kVolumeCreating && now == remvol::kVolumeNormal ? "mounted" : nullptr;
+  return before == remvol::kVolumeCreating && now == remvol::kVolumeNormal ? "its disk is ready" : nullptr;
 }
 
 void add_volume_steps(const Volume& before, const Volume& now, std::vector<std::string>& steps) {

@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
@@ -57,6 +58,15 @@ bool find_portal(Job& job, const std::string& target_name, Portal& portal) {
   return true;
 }
 
+// Whether the target's session is there and has lost its connection: it shows no LUN, or those of before.
+bool is_lost(const Look& look, const std::string& name) {
+  const vvstat::Target* target = look.target(name);
+  if (target == nullptr) return false;
+  const std::vector<const Row*> rows = look.volumes_of(*target);
+  return std::any_of(rows.begin(), rows.end(),
+                     [](const Row* row) { return !row->session.empty() && row->session != "LOGGED_IN"; });
+}
+
 int tell_luns_failed(Job& job, const FoundLuns& found, const ToolRun& run) {
   Failure failure = explain_run(run, found.login_failed ? kLoginStep : kLunsStep);
   if (run.output.find("authorization") != std::string::npos) {
@@ -104,6 +114,11 @@ int luns(const Options& options) {
   Portal portal;
   Credentials credentials;
   if (!find_portal(job, name, portal)) return job.end();
+  if (is_lost(job.before, name)) {
+    return job.failed(
+        "the target's LUNs cannot be listed",
+        {kLoginStep, "the connection was lost", "look at the network and the storage server", {}});
+  }
   if (!job.read_credentials(credentials)) return job.end();
   if (credentials.user.empty()) credentials = stored_credentials(name);
   const SearchTurn turn;

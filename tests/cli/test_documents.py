@@ -88,6 +88,40 @@ def test_the_manual_page_has_every_command_and_option_of_the_tool():
         assert re.search(rf"^\.[BI]\w* .*(?<![\w-]){word}(?![\w-])", page, re.M), word
 
 
+# The form of what all commands print, and one that does not end by itself (test_vvstat.py).
+NO_COMMANDS = ("vv --json", "vvstat --watch")
+
+
+def inline_commands():
+    """(document, command) of what a sentence or a table tells a person to type, for the programs of this project."""
+    for path in (TOP / "README.md", TOP / "CONTRIBUTING.md", TOP / "SECURITY.md", *sorted(DOCS.glob("*.md"))):
+        text = re.sub(r"^```.*?^```", "", path.read_text(), flags=re.M | re.S)
+        for command in re.findall(r"`((?:vv|vvstat|remvol|remvol-events) [^`]+)`", text):
+            yield path.name, command.replace("\\|", "|")
+
+
+@pytest.mark.parametrize("document, command", [each for each in sorted(set(inline_commands())) if each[1].startswith("vv") and each[1] not in NO_COMMANDS])
+def test_a_command_in_a_sentence_is_understood(box, document, command):
+    """One that is no more than the name of a command says what it lacks; all others come to the tree that is not there."""
+    box.tree.stop()
+    box.write("/bin/alert", "#!/bin/sh\n", mode=0o755)
+    words = command.split()
+    done = box.run(["sh", "-c", command.replace("|| alert", "")], env={"LD_PRELOAD": None})
+    lacks = words[0] == "vv" and len(words) == 2 and words[1] != "status"
+    assert done.status == (2 if lacks else 0 if "--version" in words else 3), (document, done.stderr)
+    assert not lacks or re.search(r" (takes one|needs) ", done.stderr), (document, done.stderr)
+
+
+@pytest.mark.parametrize("document, command", [each for each in sorted(set(inline_commands())) if each[1].startswith("remvol ")])
+def test_a_command_of_the_tool_in_a_sentence_is_one(document, command):
+    words = command.split()[1:]
+    for word in words:
+        if word.startswith("--"):
+            assert word[2:] in COMMANDS, document
+        elif word.startswith("-"):
+            assert re.fullmatch(r"-[ipnsvcUPdlhow]", word), document
+
+
 @pytest.mark.parametrize("program, page", [("vv", "vv.8"), ("vvstat", "vvstat.1"), ("ktree", "ktree.8"), ("ktreec", "ktreec.1"),
                                            ("remvol-events", "remvol-events.8"), ("remvol-keeper", "remvol-keeper.8"),
                                            ("remvol-notify", "remvol-notify.8")])

@@ -124,7 +124,7 @@ def test_version(box):
 
 
 @pytest.mark.parametrize("words, said", [
-    ([], ""), (["bla"], 'there is no command "bla"'), (["connect"], "connect takes one SHARE|TARGET"),
+    ([], "a command is missing"), (["bla"], 'there is no command "bla"'), (["connect"], "connect takes one SHARE|TARGET"),
     (["connect", ""], "connect takes one"), (["connect", "a", "b"], "connect takes one"),
     (["connect", "a", "--lun", "1"], "connect takes no --lun"), (["connect", "a", "--yes"], "connect takes no --yes"),
     (["add", "a", "--portal", "10.9.0.2"], "add needs --lun"), (["add", "a", "--bad"], 'unrecognized option "--bad"'),
@@ -318,6 +318,18 @@ def test_stale_luns_are_not_shown(machine):
     assert machine.vv("luns", T1, "--portal", "10.9.0.2").stdout == "the target offers no LUN to this machine\n"
 
 
+def test_luns_of_a_target_whose_connection_is_lost(photos):
+    """Its session shows no LUN, or those of before: that is not what it offers."""
+    assert photos.vv("connect", "Photos").status == 0
+    photos.box.write("/sys/class/iscsi_session/session1/state", "FAILED\n")
+    done = photos.vv("luns", "Photos")
+    assert (done.status, done.stdout) == (1, "")
+    assert done.stderr.startswith("vv: the target's LUNs cannot be listed\n  step: login\n  why:  the connection was lost\n")
+    assert photos.says("luns", T1)[1]["outcomes"][0]["why"] == "the connection was lost"
+    photos.box.write("/sys/class/iscsi_session/session1/state", "LOGGED_IN\n")
+    assert photos.vv("luns", "Photos").status == 0
+
+
 def test_luns_of_a_target_that_refuses_the_login(machine):
     machine.box.fake("iscsiadm", re.compile("--login$"), stderr=sample("login-no-secret.err"), status=24, first=True)
     done = machine.vv("luns", T1, "--portal", "10.9.0.2")
@@ -480,7 +492,7 @@ def test_the_steps_are_shown(photos):
     photos.box.hook("sys_check_dev", "/dev/sdb1", delay=0.5, first=True)
     done = photos.vv("connect", "Photos")
     assert done.stderr.splitlines() == [f"logging in to {T1} at 10.9.0.2:3260", f"logged in to {T1}",
-                                        "Photos: looking at its disk", "Photos: mounted"]
+                                        "Photos: looking at its disk", "Photos: its disk is ready"]
 
 
 def test_connect_by_the_targets_name_brings_all_its_shares(photos):

@@ -1,6 +1,6 @@
 // The report for people and programs, for any listing of the tree and any facts of the kernel: nothing that
-// moves a cursor reaches a terminal, no row is wider than the screen, and the JSON is balanced, well-formed
-// text.
+// moves a cursor reaches a terminal, no line is wider than the screen, and the JSON is balanced, well-formed
+// text. The table of mounts too may be any text.
 #include <algorithm>
 #include <cstdint>
 #include <string>
@@ -9,6 +9,7 @@
 #include "require.h"
 #include "vvstat/columns.h"
 #include "vvstat/metrics.h"
+#include "vvstat/mounts.h"
 #include "vvstat/verdict.h"
 
 using namespace vvstat;
@@ -76,6 +77,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   layout.width = kLeast + data[0];
   layout.colour = false;
   const std::string_view listing(reinterpret_cast<const char*>(data + 2), size - 2);
+  for (const Mount& mount : mounts_of(listing)) {
+    require(!mount.point.empty() && (mount.options.starts_with("rw") || mount.options.starts_with("ro")));
+  }
   const Status status = read_status(platform::TreeReader(listing));
   require(status.reachable && status.targets.size() <= 8);
   const std::vector<Row> rows = assess(status, facts_of(status, data[1]));

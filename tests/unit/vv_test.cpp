@@ -115,7 +115,7 @@ TEST(Progress, AChangeOfTheTreeIsAStep) {
                       {4, 1, 1, 1, {"Photos: formatting"}},
                       {1, 0, 1, 1, {"Photos: formatted"}},
                       {1, 3, 1, 3, {}},
-                      {1, 0, 1, 0, {"Photos: formatted", "Photos: mounted"}},
+                      {1, 0, 1, 0, {"Photos: formatted", "Photos: its disk is ready"}},
                       {0, 0, 1, 5, {}},
                       {0, 0, 2, 0, {}}};
   for (const auto& one : kCases) {
@@ -128,7 +128,8 @@ TEST(Progress, AChangeOfTheTreeIsAStep) {
 
 TEST(Progress, AVolumeIsKnownByItsLunNotByItsSlot) {
   const Target before = target_with(1, {volume_with(1, 0, 0), volume_with(2, 0, 1)});
-  EXPECT_EQ(steps_between(before, target_with(1, {volume_with(2, 0, 0)})), Steps{"Photos: mounted"});
+  EXPECT_EQ(steps_between(before, target_with(1, {volume_with(2, 0, 0)})),
+            Steps{"Photos: its disk is ready"});
   EXPECT_EQ(steps_between(target_with(1, {}), target_with(1, {volume_with(3, 1, 1)})),
             (Steps{"Photos: looking at its disk", "Photos: formatting"}));
 }
