@@ -13,6 +13,7 @@
 #include "frontend/remvol_debug.h"
 #include "frontend/request.h"
 #include "ktreec.h"
+#include "support/flashrun.h"
 #include "support/memory.h"
 #include "support/program.h"
 #include "support/run_lock.h"
@@ -60,8 +61,8 @@ bool is_strangers_file(const char* path) {
 void copy_to_flash() {
   if (access(kResetMark, F_OK) == 0 && !is_strangers_file(kResetMark)) return;
   RunLock lock;
-  lock.take("flash.lock", LockMode::kExclusive);  // the last to copy copies the newest settings
-  System("flashrun \"cp -f %s /usr/local/config/\"", kSettingsFile);  // tells of a failure itself
+  lock.take("flash.lock", LockMode::kExclusive);               // the last to copy copies the newest settings
+  System("%s", copy_to_flash_command(kSettingsFile).c_str());  // tells of a failure itself
 }
 
 // Dumps the tree. Returns whether the settings file may go to the flash.

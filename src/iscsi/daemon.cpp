@@ -29,6 +29,10 @@ bool find_tree_daemon(const char* pid_file, pid_t* pid) {
   return file != nullptr && fgets(text, sizeof text, file.get()) != nullptr && strcmp(text, "ktree\n") == 0;
 }
 
+CommandText start_tree_command(const char* socket) {
+  return CommandText("ktree -n config -s %s 1>/dev/null 2>/dev/null &", socket);
+}
+
 }  // namespace
 
 // When iscsid (2.1.8) ends on a SIGTERM it sends the signal on to its whole process group. Started in the
@@ -51,15 +55,23 @@ int start_daemon(const char* command) {
 }
 
 void start_tree_daemon(const char* socket) {
-  start_daemon(CommandText("ktree -n config -s %s 1>/dev/null 2>/dev/null &", socket));
+  start_daemon(start_tree_command(socket));
   sleep(1);
 }
 
 bool stop_tree_daemon(const char* pid_file) {
   // dash, and bash as sh, know the signal only as TERM, and say so.
-  if (const ErrorsHidden hidden; System("kill -SIGTERM `cat %s`", pid_file) == 0) return true;
+  if (const ErrorsHidden hidden; System("%s", stop_tree_command(pid_file).c_str()) == 0) return true;
   pid_t pid = 0;
   return find_tree_daemon(pid_file, &pid) && kill(pid, SIGTERM) == 0;
+}
+
+CommandText stop_tree_command(const char* pid_file) {
+  return CommandText("kill -SIGTERM `cat %s`", pid_file);
+}
+
+CommandText load_tree_command(const char* socket, const char* file) {
+  return CommandText("ktreec -S %s -l %s", socket, file);
 }
 
 }  // namespace remvol

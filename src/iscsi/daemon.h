@@ -1,8 +1,8 @@
-// The daemons that the tool starts and stops.
+// The daemons that the tool starts and stops. All that it has ktree, ktreec and kill(1) do stands here.
 #ifndef REMVOL_ISCSI_DAEMON_H
 #define REMVOL_ISCSI_DAEMON_H
 
-#include "frontend/log.h"
+#include "support/text.h"
 
 namespace remvol {
 
@@ -16,6 +16,12 @@ void start_tree_daemon(const char* socket);
 // Stops the ktree whose process number stands in `pid_file`; any other process is left alone. Returns whether
 // a process was told to stop.
 bool stop_tree_daemon(const char* pid_file);
+
+// The command that this takes.
+[[nodiscard]] CommandText stop_tree_command(const char* pid_file);
+
+// The command that loads the file into the tree behind `socket`.
+[[nodiscard]] CommandText load_tree_command(const char* socket, const char* file);
 
 }  // namespace remvol
 

@@ -5,20 +5,18 @@
 
 #include "frontend/log.h"
 #include "iscsi/daemon.h"
+#include "iscsi/iscsid.h"
+#include "iscsi/kmod.h"
 #include "iscsi/records.h"
 #include "support/command.h"
+#include "support/coreutils.h"
 #include "support/files.h"
-#include "support/shell_text.h"
 #include "support/text.h"
 #include "sysaux.h"
 
 namespace remvol {
 
 namespace {
-
-constexpr char kModuleFolder[] = "/usr/local/modules/driver";
-constexpr char kIscsidConf[] = "/etc/iscsi/iscsid.conf";
-constexpr char kNameFile[] = "/etc/iscsi/initiatorname.iscsi";
 
 // Top of the stack first: the order of unloading.
 constexpr const char* kModules[] = {"iscsi_tcp.ko", "libiscsi_tcp.ko", "libiscsi.ko",
@@ -74,7 +72,7 @@ bool write_iscsid_conf(const char* settings) {
 }
 
 void write_daemon_configuration() {
-  run_command(CommandText("echo -e \"%s\" > %s", iscsid_settings("\\n").c_str(), kIscsidConf));
+  run_command(configure_iscsid_command(iscsid_settings("\\n")));
   // The echo of dash knows no -e: it writes it into the file.
   const ConfText settings = iscsid_settings("\n");
   if (iscsid_conf_holds(settings) || write_iscsid_conf(settings)) return;
@@ -83,39 +81,39 @@ void write_daemon_configuration() {
 
 // A module that is not loaded is no failure here.
 void reload_modules() {
-  for (const char* module : kModules) System("rmmod %s 1>/dev/null 2>/dev/null", module);
+  for (const char* module : kModules) System("%s", unload_module_quietly_command(module).c_str());
   for (int i = kModuleCount - 1; i >= 0; i--) {
-    run_command(CommandText("insmod %s/%s", kModuleFolder, kModules[i]));
+    run_command(load_module_command(kModules[i]));
   }
 }
 
 InitiatorName write_initiator_name() {
   const InitiatorName name = make_initiator_name();
-  run_command(shell_command("echo 'InitiatorName=%s' > %s", name.c_str(), kNameFile));
+  run_command(name_initiator_command(name));
   return name;
 }
 
 }  // namespace
 
 InitiatorName start_initiator() {
-  run_command("killall -q -SIGTERM iscsid", kNote);
+  run_command(kEndIscsidQuietlyCommand, kNote);
   reload_modules();
-  run_command("mkdir -p /etc/iscsi");
+  run_command(make_system_folder_command(kIscsidFolder));
   write_daemon_configuration();
   const InitiatorName name = write_initiator_name();
   drop_empty_records();
-  start_daemon("iscsid -f >/dev/null 2>&1 &");
+  start_daemon(kStartIscsidCommand);
   return name;
 }
 
 bool stop_initiator() {
   LOG(1, "killall -SIGTERM iscsid ");
-  return run_command("killall -SIGTERM iscsid") == 0;
+  return run_command(kEndIscsidCommand) == 0;
 }
 
 bool unload_modules() {
   bool unloaded = false;
-  for (const char* module : kModules) unloaded = run_command(CommandText("rmmod %s", module)) == 0;
+  for (const char* module : kModules) unloaded = run_command(unload_module_command(module)) == 0;
   return unloaded;
 }
 

@@ -18,35 +18,36 @@ namespace remvol {
 inline constexpr char kLogoutAllCommand[] = "iscsiadm -m node -u";
 
 // Makes an interface record, and binds it to the network port `netif`.
-CommandText new_iface_command(const char* iface);
-CommandText bind_iface_command(const char* iface, const char* netif);
+[[nodiscard]] CommandText new_iface_command(const char* iface);
+[[nodiscard]] CommandText bind_iface_command(const char* iface, const char* netif);
 
 // Writes the targets that the portal offers into the file `path`.
-CommandText discovery_command(const char* address, int port, const char* iface, const char* path);
+[[nodiscard]] CommandText discovery_command(const char* address, int port, const char* iface,
+                                            const char* path);
 
 // Writes the sessions into the file `path`: a line each; with their disks, for the stored device names; with
 // their disks, for a target's LUNs.
-CommandText sessions_command(const char* path);
-CommandText session_devices_command(const char* path);
-CommandText session_luns_command(const char* path);
+[[nodiscard]] CommandText sessions_command(const char* path);
+[[nodiscard]] CommandText session_devices_command(const char* path);
+[[nodiscard]] CommandText session_luns_command(const char* path);
 
 // Makes or deletes the node record of the entry's target, portal and interface.
-CommandText new_node_command(const TargetEntry& entry);
-CommandText delete_node_command(const TargetEntry& entry);
+[[nodiscard]] CommandText new_node_command(const TargetEntry& entry);
+[[nodiscard]] CommandText delete_node_command(const TargetEntry& entry);
 
 // Set one authentication setting of the node record each.
-CommandText no_auth_command(const TargetEntry& entry);
-CommandText chap_method_command(const TargetEntry& entry);
-CommandText chap_user_command(const TargetEntry& entry);
-CommandText chap_secret_command(const TargetEntry& entry);
+[[nodiscard]] CommandText no_auth_command(const TargetEntry& entry);
+[[nodiscard]] CommandText chap_method_command(const TargetEntry& entry);
+[[nodiscard]] CommandText chap_user_command(const TargetEntry& entry);
+[[nodiscard]] CommandText chap_secret_command(const TargetEntry& entry);
 
 // Logs in to the target; the second form is the one after `portal_logout_command` gave up a stale session.
-CommandText login_command(const TargetEntry& entry);
-CommandText portal_logout_command(const TargetEntry& entry);
-CommandText login_again_command(const TargetEntry& entry);
+[[nodiscard]] CommandText login_command(const TargetEntry& entry);
+[[nodiscard]] CommandText portal_logout_command(const TargetEntry& entry);
+[[nodiscard]] CommandText login_again_command(const TargetEntry& entry);
 
 // Logs out of every session to the target.
-CommandText logout_command(const TargetEntry& entry);
+[[nodiscard]] CommandText logout_command(const TargetEntry& entry);
 
 }  // namespace remvol
 

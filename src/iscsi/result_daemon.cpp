@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include "frontend/log.h"
 #include "iscsi/daemon.h"
 #include "ktreec.h"
 #include "support/files.h"
@@ -12,7 +13,7 @@ namespace {
 
 void stop(const ResultDaemon& daemon) {
   if (stop_tree_daemon(daemon.pid_file)) return;
-  LOG(0, "system() of cmd 'kill -SIGTERM `cat %s`' failed", daemon.pid_file);
+  LOG(0, "system() of cmd '%s' failed", stop_tree_command(daemon.pid_file).c_str());
 }
 
 }  // namespace

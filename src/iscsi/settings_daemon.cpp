@@ -29,7 +29,7 @@ constexpr int kLoadTries = 10;  // one a second
 int load_tree(const char* file) {
   const SlotsHeld held(SlotsHeld::kChange);
   slots_move();
-  return command_exit_code(run_command(CommandText("ktreec -S %s -l %s", kVolumesSocket, file)));
+  return command_exit_code(run_command(load_tree_command(kVolumesSocket, file)));
 }
 
 // A daemon that a busy machine has not started in its second is waited for: without its settings the tree

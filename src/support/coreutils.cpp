@@ -4,8 +4,18 @@
 
 namespace remvol {
 
+namespace {
+
+constexpr char kMakeFolder[] = "mkdir -p";
+
+}  // namespace
+
 CommandText make_folder_command(const char* path) {
-  return command_on_path("mkdir -p", path);
+  return command_on_path(kMakeFolder, path);
+}
+
+CommandText make_system_folder_command(const char* path) {
+  return command_on_node(kMakeFolder, path);
 }
 
 CommandText remove_folder_command(const char* path) {

@@ -10,6 +10,9 @@ namespace remvol {
 // Makes the folder, and those that are missing above it.
 [[nodiscard]] CommandText make_folder_command(const char* path);
 
+// The same for a path of the system's own, without quotes.
+[[nodiscard]] CommandText make_system_folder_command(const char* path);
+
 // Removes the folder with all that is in it.
 [[nodiscard]] CommandText remove_folder_command(const char* path);
 

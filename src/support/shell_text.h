@@ -23,11 +23,11 @@ bool is_plain_word(const char* text);
 [[gnu::format(printf, 1, 2)]] CommandText shell_command(const char* format, ...);
 
 // Returns the command `verb NODE` for a node without quotes, which must be a plain word.
-CommandText command_on_node(const char* verb, const char* node);
+[[nodiscard]] CommandText command_on_node(const char* verb, const char* node);
 
 // Returns the command `verb "path"`, the path escaped. A path too long for that (more than 1,023 characters
 // that all need escaping) gives a command that does nothing and fails.
-CommandText command_on_path(const char* verb, const char* path);
+[[nodiscard]] CommandText command_on_path(const char* verb, const char* path);
 
 }  // namespace remvol
 

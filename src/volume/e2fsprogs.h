@@ -11,9 +11,9 @@ inline constexpr char kMke2fs[] = "mke2fs";
 inline constexpr char kResize2fs[] = "resize2fs";
 
 // Make a file system on the node.
-CommandText make_ext2_command(const char* node);
-CommandText make_ext3_command(const char* node);
-CommandText make_ext4_command(const char* node);
+[[nodiscard]] CommandText make_ext2_command(const char* node);
+[[nodiscard]] CommandText make_ext3_command(const char* node);
+[[nodiscard]] CommandText make_ext4_command(const char* node);
 
 // Looks at the file system on the node and changes nothing.
 [[nodiscard]] CommandText check_ext_command(const char* node);

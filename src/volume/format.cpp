@@ -9,7 +9,7 @@
 #include "frontend/log.h"
 #include "support/coreutils.h"
 #include "support/format_semaphore.h"
-#include "support/psmisc.h"
+#include "support/fuser.h"
 #include "support/session_hold.h"
 #include "support/text.h"
 #include "sysaux.h"

@@ -11,7 +11,7 @@
 #include "support/command.h"
 #include "support/coreutils.h"
 #include "support/files.h"
-#include "support/psmisc.h"
+#include "support/fuser.h"
 #include "support/result.h"
 #include "support/session_hold.h"
 #include "support/text.h"

@@ -15,7 +15,7 @@
 #include "frontend/log.h"
 #include "iscsi/iscsiadm.h"
 #include "support/coreutils.h"
-#include "support/psmisc.h"
+#include "support/fuser.h"
 #include "volume/e2fsprogs.h"
 
 using namespace remvol;

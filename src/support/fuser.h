@@ -3,8 +3,8 @@
 //
 // One puts the device between double quotes and one does not. What watches this tool's commands knows them
 // so.
-#ifndef REMVOL_SUPPORT_PSMISC_H
-#define REMVOL_SUPPORT_PSMISC_H
+#ifndef REMVOL_SUPPORT_FUSER_H
+#define REMVOL_SUPPORT_FUSER_H
 
 #include "support/text.h"
 

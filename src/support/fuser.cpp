@@ -1,4 +1,4 @@
-#include "support/psmisc.h"
+#include "support/fuser.h"
 
 #include "support/shell_text.h"
 
