@@ -95,6 +95,7 @@ READ = [
 # Blocks that tests below run, and a drawing.
 HERE = [
     ("docs/architecture.md", "  administration pages"),
+    ("docs/architecture.md", "   frontend/    main"),
     ("docs/monitoring.md", "groups:"),
     ("docs/operators-guide.md", "# /etc/systemd/network/10-egiga0.link"),
     ("docs/operators-guide.md", "MAILADDR"),
