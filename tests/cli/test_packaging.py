@@ -382,7 +382,7 @@ COMMANDS = ["discover", "luns", "add", "connect", "disconnect", "format", "delet
 
 # What the shells offer behind a line; bash and zsh keep this order.
 COMPLETIONS = [
-    ("vv ", [*COMMANDS, "--help", "--version"]),
+    ("vv ", [*COMMANDS, "help", "--help", "--version"]),
     ("vv di", ["discover", "disconnect"]),
     ("vv connect ", ["Two words", "q'uote", "iqn.t1", "iqn.t2"]),
     ("vv connect Tw", ["Two words"]),
