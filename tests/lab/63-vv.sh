@@ -40,6 +40,15 @@ expect "it is mounted" mounted Photos
 echo "a photo" >/mnt/VV/Photos/photo
 vv_works "all 1 healthy" status
 vv_works "  1 128M ext4   Photos" luns ${T}1
+vv_works "  1 128M ext4   Photos" luns Photos
+remvol-notify
+mount -o remount,ro /mnt/VV/Photos
+vv_fails_status() { vv status >/tmp/vv.out 2>&1; }
+expect_status 1 vv_fails_status
+expect_has "what is to be done" "    vv disconnect Photos && vv connect Photos" "$(cat /tmp/vv.out)"
+sed -n 's/^    vv /vv /p' /tmp/vv.out >/tmp/command
+expect "what is to be done helps" sh -e /tmp/command
+expect "it is healthy again" vvstat -x
 
 # A second LUN is there at once.
 vv_works "Grüße aus Köln is mounted on /mnt/VV/Grüße aus Köln" add "Grüße aus Köln" --portal 10.9.0.2 --lun 2
