@@ -19,6 +19,7 @@ BUILD = pathlib.Path(REPOSITORY, os.environ.get("REMVOL_BUILD", "build/release")
 # Replaced in every line, in this order.
 CHANGING = [(re.compile(pattern), text) for pattern, text in (
     (r"\(([\w.]+\.(?:cpp|h):[^:()\s]+):\d+\)", r"(\1)"),
+    (r"(: src\.cpp:)\d+(: \w+: Assertion)", r"\1#\2"),
     (r"/tmp/pytest-of-\w+/pytest-\d+(/popen-gw\d+)?/\w+", "TMP"),
     (r"/tmp/(ktree\.|tmp)\w+", r"/tmp/\1#"),
     (r"(remvol_session_(?:wait|get)_lun)_\d+", r"\1_#"),
@@ -34,7 +35,7 @@ CHANGING = [(re.compile(pattern), text) for pattern, text in (
     (r"took = \d+ microseconds", "took = # microseconds"),
     (r"copied, [^,]+ s, .*/s$", "copied"),
     (r"^    \d+ \d+ \d+:\d+ ", "    # # #:# "),
-    (r"0x[0-9a-f]{9,}", "0x#"),
+    (r"0x[0-9a-f]+", "0x#"),
     (r"^(    ) *\d+( +\d+)*(\(src\.cpp:)", r"\1\3"),
 )]
 
