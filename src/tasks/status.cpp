@@ -129,7 +129,7 @@ int task_status() {
   LOG(2, "start");
   drop_half_made_slots();
   if (has_uncounted_target()) ktree_update_current_targetcnt();
-  TreeValue text;
+  StateValue text;
   if (!tree_read(key::kTargetCount, text)) return kFailed;
   const int count = std::min(atoi(text), kMaxTargets);
   if (_refresh_targets(count) != kOk || _refresh_ended_work_behind(count) != kOk) return kTreeFailed;

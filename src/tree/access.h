@@ -13,8 +13,10 @@
 
 namespace remvol {
 
-// Holds any value of the tree that the tool reads, and the NUL behind it.
+// Hold a value that is read, and the NUL behind it: a name, a path or a setting, and the number of a state. A
+// longer one reads as missing.
 using TreeValue = char[256];
+using StateValue = char[128];
 
 // Returns whether a daemon serves the tree: it has `key`, also with an empty value, or takes a connection.
 [[nodiscard]] bool tree_answers(const char* key);

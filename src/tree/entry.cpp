@@ -285,7 +285,7 @@ int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
   *enable = 0;
   const HeldSlot slot(dbidx, lun_dbidx);
   if (!slot) return kTreeFailed;
-  TreeValue value = "";
+  StateValue value = "";
   const int length = ktreec_get_wb(kVolumesSocket, 0, KeyText(key::kLunEnable, slot.target(), slot.lun()),
                                    value, sizeof value);
   if (length > 0 && value[0] != '\0') {

@@ -15,7 +15,7 @@ namespace remvol {
 namespace {
 
 int read_state(const char* key, bool stored, int* value, int missing) {
-  TreeValue text;
+  StateValue text;
   const bool present = stored && tree_read(key, text);
   *value = present ? atoi(text) : missing;
   return present ? kOk : kTreeFailed;
