@@ -20,7 +20,7 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 #include "tree/settings_file.h"
 #include "volume/share_services.h"
 

@@ -2,7 +2,7 @@
 #include "frontend/remvol_debug.h"
 #include "frontend/log.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

@@ -18,7 +18,7 @@
 #include "support/temp_file.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

@@ -13,7 +13,7 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

@@ -3,11 +3,12 @@
 #include <cctype>
 #include <cstring>
 
+#include "frontend/log.h"
 #include "support/lan.h"
 #include "support/result.h"
 #include "sysaux.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

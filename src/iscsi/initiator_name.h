@@ -3,7 +3,6 @@
 #ifndef REMVOL_ISCSI_INITIATOR_NAME_H
 #define REMVOL_ISCSI_INITIATOR_NAME_H
 
-#include "frontend/log.h"
 #include "support/text.h"
 
 namespace remvol {

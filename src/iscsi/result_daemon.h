@@ -4,8 +4,6 @@
 #ifndef REMVOL_ISCSI_RESULT_DAEMON_H
 #define REMVOL_ISCSI_RESULT_DAEMON_H
 
-#include "frontend/log.h"
-
 namespace remvol {
 
 struct ResultDaemon {

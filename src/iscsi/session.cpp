@@ -18,7 +18,7 @@
 #include "sysaux.h"
 #include "tree/access.h"
 #include "tree/entry.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 #include "tree/slots.h"
 
 namespace remvol {

@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 
+#include "frontend/log.h"
 #include "iscsi/iscsiadm.h"
 #include "iscsi/session_listing.h"
 #include "support/command.h"

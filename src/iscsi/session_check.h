@@ -2,8 +2,6 @@
 #ifndef REMVOL_ISCSI_SESSION_CHECK_H
 #define REMVOL_ISCSI_SESSION_CHECK_H
 
-#include "frontend/log.h"
-
 namespace remvol {
 
 // Returns 1 when a session to the target called `name` exists; 0 when not (also when there is no session at

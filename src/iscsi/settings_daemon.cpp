@@ -8,7 +8,7 @@
 #include "support/files.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 #include "tree/settings_file.h"
 #include "tree/slots.h"
 

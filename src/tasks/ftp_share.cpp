@@ -2,6 +2,7 @@
 
 #include <cstring>
 
+#include "frontend/log.h"
 #include "support/result.h"
 #include "volume/unmount.h"
 

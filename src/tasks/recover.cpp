@@ -13,7 +13,6 @@
 #include "support/text.h"
 #include "tasks/connect.h"
 #include "tasks/ftp_share.h"
-#include "tasks/requested_lun.h"
 #include "tasks/whole_target.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"

@@ -4,11 +4,12 @@
 #include <cstring>
 #include <iterator>
 
+#include "frontend/log.h"
 #include "support/target_hold.h"
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/e2fsprogs.h"

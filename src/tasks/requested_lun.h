@@ -2,7 +2,6 @@
 #ifndef REMVOL_TASKS_REQUESTED_LUN_H
 #define REMVOL_TASKS_REQUESTED_LUN_H
 
-#include "frontend/log.h"
 #include "support/result.h"
 #include "tree/record.h"
 

@@ -12,7 +12,7 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/half_made.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/lun_status.h"

@@ -13,6 +13,7 @@
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
 #include "tree/slots.h"
+#include "tree/state.h"
 #include "volume/mount.h"
 #include "volume/mount_point.h"
 #include "volume/session_volumes.h"

@@ -3,7 +3,7 @@
 #define REMVOL_TASKS_WHOLE_TARGET_H
 
 #include "tree/record.h"
-#include "tree/state.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

@@ -12,7 +12,7 @@
 #include "frontend/log.h"
 #include "ktreec.h"
 #include "support/result.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

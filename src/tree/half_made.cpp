@@ -6,10 +6,8 @@
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
-#include "tree/keys.h"
-#include "tree/record.h"
+#include "tree_layout.h"
 #include "tree/slots.h"
-#include "tree/state.h"
 
 namespace remvol {
 

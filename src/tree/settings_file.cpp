@@ -6,10 +6,11 @@
 #include <cstdio>
 #include <cstring>
 
+#include "frontend/log.h"
 #include "ktreec.h"
 #include "support/files.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

@@ -2,8 +2,6 @@
 #ifndef REMVOL_TREE_SETTINGS_FILE_H
 #define REMVOL_TREE_SETTINGS_FILE_H
 
-#include "frontend/log.h"
-
 namespace remvol {
 
 // Returns whether the settings file at `path` holds a settings version. A look at the first mebibytes of its

@@ -5,12 +5,12 @@
 #include <cstring>
 #include <ctime>
 
+#include "frontend/log.h"
 #include "support/command.h"
 #include "support/run_lock.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree/keys.h"
-#include "tree/record.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

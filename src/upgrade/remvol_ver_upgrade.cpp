@@ -9,8 +9,7 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree/keys.h"
-#include "tree/record.h"
+#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 

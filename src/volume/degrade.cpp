@@ -12,7 +12,6 @@
 
 #include "frontend/log.h"
 #include "support/files.h"
-#include "support/text.h"
 #include "sysaux.h"
 #include "volume/mount_table.h"
 #include "volume/remount.h"

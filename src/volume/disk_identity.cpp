@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "frontend/log.h"
 #include "support/files.h"
 #include "support/text.h"
 #include "volume/device.h"

@@ -4,7 +4,6 @@
 #ifndef REMVOL_VOLUME_DISK_IDENTITY_H
 #define REMVOL_VOLUME_DISK_IDENTITY_H
 
-#include "frontend/log.h"
 #include "tree/record.h"
 
 namespace remvol {

@@ -5,7 +5,7 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
-#include "tree/keys.h"
+#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/status_text.h"
 #include "volume/mount_point.h"

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "frontend/log.h"
 #include "sysaux.h"
 
 namespace remvol {

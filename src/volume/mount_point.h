@@ -2,7 +2,6 @@
 #ifndef REMVOL_VOLUME_MOUNT_POINT_H
 #define REMVOL_VOLUME_MOUNT_POINT_H
 
-#include "frontend/log.h"
 #include "support/run_lock.h"
 #include "support/text.h"
 #include "tree_layout.h"

@@ -2,7 +2,6 @@
 #ifndef REMVOL_VOLUME_PARTITION_H
 #define REMVOL_VOLUME_PARTITION_H
 
-#include "frontend/log.h"
 #include "tree/record.h"
 #include "volume/mount_result.h"
 

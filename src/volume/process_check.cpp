@@ -7,6 +7,7 @@
 #include <cstring>
 #include <memory>
 
+#include "frontend/log.h"
 #include "support/files.h"
 #include "support/text.h"
 

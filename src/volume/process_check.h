@@ -3,8 +3,6 @@
 #ifndef REMVOL_VOLUME_PROCESS_CHECK_H
 #define REMVOL_VOLUME_PROCESS_CHECK_H
 
-#include "frontend/log.h"
-
 namespace remvol {
 
 // Returns whether a process whose line in the process list matches `name` (for grep) has `device` in it.

@@ -2,6 +2,7 @@
 
 #include <cstring>
 
+#include "frontend/log.h"
 #include "support/command.h"
 #include "support/result.h"
 #include "support/session_hold.h"

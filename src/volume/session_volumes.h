@@ -3,8 +3,6 @@
 #ifndef REMVOL_VOLUME_SESSION_VOLUMES_H
 #define REMVOL_VOLUME_SESSION_VOLUMES_H
 
-#include "frontend/log.h"
-
 namespace remvol {
 
 // Returns whether a volume is mounted below "/mnt/VV/" from a disk of a session to the target, or to any
