@@ -24,8 +24,6 @@ namespace remvol {
 
 namespace {
 
-using PathText = Text<512>;
-
 // The name is also that of the listing which ktree_update_dev reads: each use writes it anew.
 PathText discovery_path() {
   return PathText("/tmp/%s.tmp", program_name());
@@ -84,7 +82,7 @@ int search_portal(const TargetEntry& request, const char* socket) {
 }
 
 // Returns whether the arguments name a target and a portal; logs what is wrong.
-bool check_arguments(const char* name, const char* address, int port) {
+bool check_portal_arguments(const char* name, const char* address, int port) {
   if (name == nullptr || address == nullptr) {
     LOG(0, "target name or ip is not given");
   } else if (name[0] == '\0' || address[0] == '\0') {
@@ -132,7 +130,7 @@ int task_search(const TargetEntry& request, const char* output_file) {
 
 int Portal_search_target(const char* name, const char* address, int port) {
   const LogScope scope;
-  if (!check_arguments(name, address, port)) return kFailed;
+  if (!check_portal_arguments(name, address, port)) return kFailed;
   if (check_target_connected(name) != 0) {
     LOG(1, "%s is connecting.", name);
     return 2;

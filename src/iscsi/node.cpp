@@ -56,7 +56,7 @@ bool login_found_session(FILE* output) {
 }
 
 // Starts the login and reads its output. Returns whether a session was there already.
-bool log_in(const char* command, FILE** output) {
+bool run_login(const char* command, FILE** output) {
   const LoginUnderWay under_way;
   *output = popen(command, "r");
   return *output != nullptr && login_found_session(*output);
@@ -86,7 +86,7 @@ int _target_connect_run(const TargetEntry& entry, const char* requested) {
   const CommandText login = login_command(entry);
   LOG(1, "try to login - cmd: %s \n", login.c_str());
   FILE* output = nullptr;
-  if (log_in(login, &output)) log_in_again(entry);
+  if (run_login(login, &output)) log_in_again(entry);
   if (output == nullptr) return 1;
   pclose(output);
   return confirm_login(entry.target_name, requested) ? 0 : 1;

@@ -32,8 +32,6 @@ constexpr int kDrawnNumbers = 100;          // in the names of temporary files
 constexpr char kDevicesLock[] = "devices.lock";
 constexpr int kMaxDraws = 100 * kDrawnNumbers;
 
-using PathText = Text<512>;
-
 // What ktree_update_dev found in the listing.
 struct DeviceUpdate {
   int result = kOk;
@@ -83,7 +81,7 @@ int list_in_detail(const char* path) {
 }
 
 // Returns 0, or -1 after logging what is wrong with the name.
-int check_name(const char* name) {
+int check_target_name(const char* name) {
   if (name == nullptr) {
     LOG(0, "parameter error");
     return kFailed;
@@ -199,7 +197,7 @@ int ktree_update_dev(TargetEntry* entry) {
 
 int _wait_sess_lun_ready(const char* name, int wait_seconds) {
   const LogScope scope;
-  if (check_name(name) != kOk) return kFailed;
+  if (check_target_name(name) != kOk) return kFailed;
   const PathText drawn = draw_temp_path("wait");
   DetailedListing listing = kLunListing;
   bool ready = false;
@@ -224,7 +222,7 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
 
 int _get_sess_lun_list(LunNode** head, const char* name, DeviceNodeMaker make_node) {
   const LogScope scope;
-  if (check_name(head != nullptr ? name : nullptr) != kOk) return kFailed;
+  if (check_target_name(head != nullptr ? name : nullptr) != kOk) return kFailed;
   const TempFile path(draw_temp_path("get"));
   const int listed = list_in_detail(path);
   if (listed != 0) return listed < 0 ? listed : kOk;

@@ -26,7 +26,7 @@ int list_sessions(const char* command) {
 int check_target_connected(const char* name) {
   const LogScope scope;
   if (name == nullptr || name[0] == '\0') return kFailed;
-  const TempFile path(Text<512>("/tmp/%s_session.tmp", program_name()));
+  const TempFile path(PathText("/tmp/%s_session.tmp", program_name()));
   const int listed = list_sessions(sessions_command(path));
   if (listed != 0) return listed < 0 ? listed : kOk;
   File file(fopen(path, "re"));

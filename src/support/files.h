@@ -2,6 +2,7 @@
 #ifndef REMVOL_SUPPORT_FILES_H
 #define REMVOL_SUPPORT_FILES_H
 
+#include <dirent.h>
 #include <sys/types.h>
 
 #include <cstdio>
@@ -15,6 +16,13 @@ struct FileCloser {
 
 // A stdio file that closes itself.
 using File = std::unique_ptr<FILE, FileCloser>;
+
+struct DirectoryCloser {
+  void operator()(DIR* directory) const { closedir(directory); }
+};
+
+// A folder held open to list it, which closes itself.
+using Directory = std::unique_ptr<DIR, DirectoryCloser>;
 
 // Returns 0 when `path` exists, -1 when it is null, empty or absent.
 int check_path_exist(const char* path);

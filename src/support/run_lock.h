@@ -12,6 +12,9 @@ namespace remvol {
 
 inline constexpr char kRunDir[] = "/run/remvol";
 
+// Seconds. For longer no run waits for one that keeps a session open, closes it, or works on a mount point.
+inline constexpr int kLongestHold = 60;
+
 enum class LockMode { kShared, kExclusive };
 
 enum class LockTry {

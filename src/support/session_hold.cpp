@@ -6,8 +6,7 @@ namespace {
 
 constexpr char kAllSessions[] = "sessions.lock";
 constexpr char kLogins[] = "logins.lock";
-constexpr int kLongestHold = 60;  // seconds
-constexpr int kLoginWait = 5;
+constexpr int kLoginWait = 5;  // seconds
 
 int holders = 0;  // of this run
 

@@ -39,8 +39,8 @@ TempFile::TempFile(const char* path) : path_("%s", path) {
   const bool free = lock_.try_take(lock_name(path), LockMode::kExclusive) != LockTry::kBusy;
   if (free && make_anew(path_)) return;
   own_name_ = true;
-  path_ = Text<512>("%s.%d", path, static_cast<int>(getpid()));
-  if (!make_anew(path_)) path_ = Text<512>("%s", kNoFile);
+  path_ = PathText("%s.%d", path, static_cast<int>(getpid()));
+  if (!make_anew(path_)) path_ = PathText("%s", kNoFile);
 }
 
 TempFile::~TempFile() {

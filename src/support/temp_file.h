@@ -24,7 +24,7 @@ class TempFile {
 
  private:
   RunLock lock_;
-  Text<512> path_;
+  PathText path_;
   bool own_name_ = false;
 };
 

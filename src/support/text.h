@@ -33,6 +33,7 @@ class Text {
 
 using KeyText = Text<256>;       // a path in the configuration tree
 using NumberText = Text<32>;     // a number in decimal
+using PathText = Text<512>;      // a path in the file system
 using CommandText = Text<4096>;  // a shell command
 
 // Copies `source` into the array `target`, cut to its size, and clears the rest of it.

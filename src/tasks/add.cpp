@@ -38,7 +38,7 @@ constexpr MountOutcome kMountOutcomes[] = {
 };
 constexpr MountOutcome kMountBroken = {kMountFailed, kVolumeFailed, kFailed};
 
-const MountOutcome& _mount_outcome(MountResult mounted) {
+const MountOutcome& mount_outcome(MountResult mounted) {
   for (const MountOutcome& outcome : kMountOutcomes) {
     if (outcome.mounted == mounted) return outcome;
   }
@@ -47,7 +47,7 @@ const MountOutcome& _mount_outcome(MountResult mounted) {
 
 // Mounts the LUN in a slot of the connected target in `entry`, when it is enabled, and puts the result of the
 // last step into `result`. Returns false when the mount broke: nothing more is to be done then.
-bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result) {
+bool mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result) {
   ktree_update_dev(entry);
   if (ktree_get_found_lun_entry(entry, dbidx, lun_dbidx, entry->lun) < 0) return true;
   int enable = 0;
@@ -55,7 +55,7 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
   if (*result != kOk || enable != 1) return true;
 
   ktree_update_volume_state(entry, kVolumeCreating);
-  const MountOutcome& outcome = _mount_outcome(Target_mount(entry, 0, 0));
+  const MountOutcome& outcome = mount_outcome(Target_mount(entry, 0, 0));
   ktree_update_volume_state(entry, outcome.state);
   ktree_update_lun_status(entry, 0);
   unmount_if_deleted(entry);
@@ -64,7 +64,7 @@ bool _mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result)
 }
 
 // Stores the target and LUN in `entry`, in one step for other runs. Returns 0 with both slots, or -1.
-Result _store_lun(TargetEntry* entry, int* dbidx, int* lun_dbidx) {
+Result store_lun(TargetEntry* entry, int* dbidx, int* lun_dbidx) {
   mark_target(entry->target_name);
   const SlotsHeld held(SlotsHeld::kChange);
   drop_half_made_luns();
@@ -96,7 +96,7 @@ int task_add(const TargetEntry& request) {
   TargetEntry entry = request;
   int dbidx = 0;
   int lun_dbidx = 0;
-  if (_store_lun(&entry, &dbidx, &lun_dbidx) != kOk) return kFailed;
+  if (store_lun(&entry, &dbidx, &lun_dbidx) != kOk) return kFailed;
   ktree_update_lun_status(&entry, 0);
   ktree_update_status(&entry);
 
@@ -104,7 +104,7 @@ int task_add(const TargetEntry& request) {
   int result = kOk;
   if (check_target_connected(entry.target_name) == 0) {
     Target_Config_Gen(&entry);  // no login: the volume is mounted when the target is next connected
-  } else if (!_mount_added_lun(&entry, dbidx, lun_dbidx, &result)) {
+  } else if (!mount_added_lun(&entry, dbidx, lun_dbidx, &result)) {
     return result;
   }
   ktree_update_current_targetcnt();

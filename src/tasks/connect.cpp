@@ -25,7 +25,7 @@ namespace remvol {
 namespace {
 
 // A mount that was refused for its entry (-1) or that found the volume read-only leaves the state "normal".
-VolumeState _state_after_mount(MountResult mounted) {
+VolumeState state_after_mount(MountResult mounted) {
   switch (mounted) {
     case kMounted:
     case kMountFailed:
@@ -41,10 +41,10 @@ VolumeState _state_after_mount(MountResult mounted) {
 }
 
 // Mounts the LUN in `entry` and stores what became of it; a failure shows in the volume state alone.
-void _mount_connected_lun(TargetEntry* entry) {
+void mount_connected_lun(TargetEntry* entry) {
   ktree_update_volume_state(entry, kVolumeCreating);
   VolumeState state = kVolumeOffline;
-  if (entry->dev[0] != '\0') state = _state_after_mount(Target_mount(entry, 0, 0));
+  if (entry->dev[0] != '\0') state = state_after_mount(Target_mount(entry, 0, 0));
   ktree_update_volume_state(entry, state);
   ktree_update_lun_status(entry, 0);
   unmount_if_deleted(entry);
@@ -52,19 +52,19 @@ void _mount_connected_lun(TargetEntry* entry) {
 
 // Mounts the enabled LUNs of the target at `dbidx`, with `entry` as the record for each. Returns 0, or why
 // the last LUN visited could not be asked whether it is enabled.
-int _mount_enabled_luns(TargetEntry* entry, int dbidx) {
+int mount_enabled_luns(TargetEntry* entry, int dbidx) {
   int result = kOk;
   LunWalk luns(dbidx, LunWalk::kAtUnreadable);
   while (luns.next(entry)) {
     int enable = 0;
     result = ktree_get_lun_enable(&enable, dbidx, entry->lun_db_idx);
-    if (result == kOk && enable == 1) _mount_connected_lun(entry);
+    if (result == kOk && enable == 1) mount_connected_lun(entry);
   }
   return result;
 }
 
 // Finds the disks of a target that was just logged in, and mounts them. Returns the command's result.
-int _present_volumes(TargetEntry* entry) {
+int present_volumes(TargetEntry* entry) {
   const int found = ktree_update_dev(entry);
   if (found == kTreeFailed) {
     LOG(0, "ktree failed, exit...");
@@ -75,13 +75,13 @@ int _present_volumes(TargetEntry* entry) {
     return kFailed;
   }
   sleep(kSettleSeconds);
-  const int result = _mount_enabled_luns(entry, entry->db_idx);
+  const int result = mount_enabled_luns(entry, entry->db_idx);
   ktree_update_status(entry);
   reload_share_services();
   return result;
 }
 
-int _disconnect_all() {
+int disconnect_all() {
   Target_umount_all();
   LOG(1, "update share folder status");
   reload_share_services();
@@ -89,7 +89,7 @@ int _disconnect_all() {
   return close_sessions(nullptr, kLogoutAllCommand);
 }
 
-int _disconnect_target(const char* target_name) {
+int disconnect_target(const char* target_name) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(target_name, &entry) != kOk) return kFailed;
   const BriefTargetHold hold(entry.target_name, is_no_lun_formatting);
@@ -121,7 +121,7 @@ int task_connect(const TargetEntry& request) {
   entry.conn_set = 1;
   ktree_record_connect_set(&entry);
   ktree_set_connect_state(entry.db_idx, kConnected);
-  const int result = _present_volumes(&entry);
+  const int result = present_volumes(&entry);
   if (!HeldSlot(entry.db_idx)) Target_Logout(&entry);  // deleted meanwhile
   LOG(2, "end, ret = %d", result);
   return result;
@@ -130,7 +130,7 @@ int task_connect(const TargetEntry& request) {
 int task_disconnect(const char* target_name) {
   const LogScope scope;
   LOG(2, "start");
-  const int result = target_name == nullptr ? _disconnect_all() : _disconnect_target(target_name);
+  const int result = target_name == nullptr ? disconnect_all() : disconnect_target(target_name);
   LOG(2, "end");
   return result;
 }

@@ -26,7 +26,7 @@ namespace {
 
 // Fills `entry` with the requested LUN. Returns 0; -1 missing arguments, unreadable entry, no device or
 // another disk's; 1 unknown target or LUN.
-Result _read_lun_to_format(const TargetEntry& request, TargetEntry* entry) {
+Result read_lun_to_format(const TargetEntry& request, TargetEntry* entry) {
   if (request.target_name[0] == '\0' || request.lun < 0) return kFailed;
   int dbidx = 0;
   int lun_dbidx = 0;
@@ -43,7 +43,7 @@ Result _read_lun_to_format(const TargetEntry& request, TargetEntry* entry) {
 
 // Formats and mounts the LUN anew, with its FTP share taken down meanwhile. Returns -1 when the mount table
 // cannot be read, else the result of the mount.
-int _remake_volume(TargetEntry* entry) {
+int remake_volume(TargetEntry* entry) {
   ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0);
   ktree_update_lun_status(entry, 1);
   ktree_update_volume_state(entry, kVolumeCreating);
@@ -75,7 +75,7 @@ void _update_stored_target(TargetEntry* entry) {
 }
 
 // Puts the requested CHAP settings into the target's entry, its slot and its node record.
-void _store_chap(const TargetEntry& request, TargetEntry* entry) {
+void store_chap(const TargetEntry& request, TargetEntry* entry) {
   entry->chap = request.chap;
   copy_text(entry->chap_name, request.chap_name);
   copy_text(entry->chap_pwd, request.chap_pwd);
@@ -85,7 +85,7 @@ void _store_chap(const TargetEntry& request, TargetEntry* entry) {
 
 // Logs the target in with its new settings and mounts its volumes. A failure is stored, not returned: the
 // settings are to be kept either way.
-void _reconnect(TargetEntry* entry, int conn_set) {
+void reconnect(TargetEntry* entry, int conn_set) {
   if (Target_Connect(entry, entry->target_name) != kOk) {
     LOG(0, "Reconnect failed , target name = %s", entry->target_name);
     entry->conn_set = 0;
@@ -107,8 +107,8 @@ int task_format(const TargetEntry& request) {
   TargetEntry entry = {};
   LOG(2, "start");
   const TargetHold hold(request.target_name, request.lun);
-  int result = _read_lun_to_format(request, &entry);
-  if (result == kOk) result = _remake_volume(&entry);
+  int result = read_lun_to_format(request, &entry);
+  if (result == kOk) result = remake_volume(&entry);
   LOG(2, "end");
   return result;
 }
@@ -122,8 +122,8 @@ int task_modify(const TargetEntry& request) {
   if (ktree_get_entry_by_targetname(request.target_name, &entry) == kOk) {
     const int conn_set = entry.conn_set;
     Target_Disconnect(&entry);
-    _store_chap(request, &entry);
-    if (conn_set != 0) _reconnect(&entry, conn_set);
+    store_chap(request, &entry);
+    if (conn_set != 0) reconnect(&entry, conn_set);
     ktree_update_status(&entry);
     result = kOk;
   }

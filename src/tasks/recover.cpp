@@ -39,51 +39,51 @@ struct TargetHealth {
 // Asks twice, a second apart: between two steps of the work looked for the process list is empty for a
 // moment.
 template <typename Probe>
-bool _is_running(Probe probe) {
+bool is_running(Probe probe) {
   if (probe() == kRunning) return true;
   sleep(1);
   return probe() == kRunning;
 }
 
-bool _is_formatting(const TargetEntry* lun) {
+bool is_formatting(const TargetEntry* lun) {
   int state = kFormatIdle;
   const int read = ktree_get_lun_format_state(lun->db_idx, lun->lun_db_idx, &state);
   if (read != kOk || (state != kFormatting && state != kFormatWaiting)) return false;
-  return _is_running(check_mkfs_process_existing);
+  return is_running(check_mkfs_process_existing);
 }
 
-void _log_busy(const TargetEntry* lun, const char* work) {
+void log_busy(const TargetEntry* lun, const char* work) {
   LOG(1, "One of target:%s 's LUN is %s", lun->target_name, work);
   LOG(1, "Skip it now, and kick it back to recover queue");
 }
 
-void _check_lun(const TargetEntry* lun, TargetHealth* health) {
+void check_lun(const TargetEntry* lun, TargetHealth* health) {
   const char* device = lun->dev[0] != '\0' ? lun->dev : lun->mnt_dev;
   const Degradation degraded = check_mnt_dev_degrade_to_ro(device, lun->mnt);
   if (degraded == kDegraded || degraded == kDegradeUnlisted) {
     LOG(1, "dev %s access right is degraded to ro", device);
     health->degraded = true;
   }
-  if (_is_formatting(lun)) {
-    _log_busy(lun, "formatting or waitting for format");
+  if (is_formatting(lun)) {
+    log_busy(lun, "formatting or waitting for format");
     health->busy = true;
   }
-  if (_is_running([device] { return check_resizing_fs(device); })) {
-    _log_busy(lun, "resizing");
+  if (is_running([device] { return check_resizing_fs(device); })) {
+    log_busy(lun, "resizing");
     health->busy = true;
   }
 }
 
-TargetHealth _check_luns(int dbidx) {
+TargetHealth check_luns(int dbidx) {
   TargetHealth health;
   TargetEntry lun;
   LunWalk luns(dbidx, LunWalk::kAtUnreadable);
-  while (luns.next(&lun)) _check_lun(&lun, &health);
+  while (luns.next(&lun)) check_lun(&lun, &health);
   return health;
 }
 
 // Returns whether the target is to be connected and was lost, by what is stored now.
-bool _is_lost(int dbidx) {
+bool is_lost(int dbidx) {
   const SlotsHeld held;
   TargetEntry target;
   int state = kDisconnected;
@@ -92,23 +92,23 @@ bool _is_lost(int dbidx) {
   return target.conn_set != 0 && state == kRecovering;
 }
 
-int _leave_target(const TargetEntry* entry) {
+int leave_target(const TargetEntry* entry) {
   LOG(1, "This target %s has not been set to connect", entry->target_name);
   return kOk;
 }
 
 // Returns whether the target was still lost.
-bool _store_recovered(TargetEntry* entry) {
+bool store_recovered(TargetEntry* entry) {
   const SlotsHeld held(SlotsHeld::kChange);
-  if (!_is_lost(entry->db_idx)) return false;
+  if (!is_lost(entry->db_idx)) return false;
   entry->conn_set = 1;
   ktree_record_connect_set(entry);
   ktree_set_connect_state(entry->db_idx, kConnected);
   return true;
 }
 
-int _keep_volumes(TargetEntry* entry) {
-  if (!_store_recovered(entry)) return _leave_target(entry);
+int keep_volumes(TargetEntry* entry) {
+  if (!store_recovered(entry)) return leave_target(entry);
   ktree_update_status(entry);
   return kOk;
 }
@@ -118,13 +118,13 @@ CommandText later_recovery_command(const char* target_name) {
   return shell_command("%s -w %d --oiscsi_evt_recover -n %s &", program_path, kBusyRetrySeconds, target_name);
 }
 
-void _postpone(const TargetEntry* entry) {
+void postpone(const TargetEntry* entry) {
   run_command(later_recovery_command(entry->target_name));
 }
 
 // Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one
 // ends the walk.
-void _unmount_luns(int dbidx) {
+void unmount_luns(int dbidx) {
   TargetEntry lun;
   LunWalk luns(dbidx, LunWalk::kAtEmpty);
   while (luns.next(&lun)) {
@@ -137,15 +137,15 @@ void _unmount_luns(int dbidx) {
 // Unmounts everything, logs out and connects the target again. Returns the result of the connection. A target
 // that another run is at for long is put off: to wait for its format would hold up the recovery of all
 // others.
-int _rebuild(TargetEntry* entry) {
+int rebuild(TargetEntry* entry) {
   const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   if (hold.given_up()) {
     LOG(1, "another run is at target %s, its recovery is put off", entry->target_name);
-    _postpone(entry);
+    postpone(entry);
     return kOk;
   }
-  if (!_is_lost(entry->db_idx)) return _leave_target(entry);
-  _unmount_luns(entry->db_idx);
+  if (!is_lost(entry->db_idx)) return leave_target(entry);
+  unmount_luns(entry->db_idx);
   Target_Logout(entry);
   entry->conn_set = 1;
   ktree_set_connect_state(entry->db_idx, kConnecting);
@@ -158,35 +158,35 @@ int _rebuild(TargetEntry* entry) {
 }
 
 // Recovers the target called `name`. Returns its result.
-int _recover_target(const char* name) {
+int recover_target(const char* name) {
   LOG(1, "==> Processing - %s", name);
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
     LOG(1, "Can not find: %s", name);
     return kNotStored;
   }
-  if (!_is_lost(entry.db_idx)) return _leave_target(&entry);
+  if (!is_lost(entry.db_idx)) return leave_target(&entry);
   // The looks take seconds: what is done then is for a target that nobody has taken away or brought up since.
-  const TargetHealth health = _check_luns(entry.db_idx);
-  if (!health.degraded) return _keep_volumes(&entry);
-  if (!health.busy) return _rebuild(&entry);
-  _postpone(&entry);
+  const TargetHealth health = check_luns(entry.db_idx);
+  if (!health.degraded) return keep_volumes(&entry);
+  if (!health.busy) return rebuild(&entry);
+  postpone(&entry);
   return kOk;
 }
 
 // Recovers the target called `name` and then whatever is queued. Returns the result of the last one.
-int _drain_queue(const char* name) {
-  int result = _recover_target(name);
+int drain_queue(const char* name) {
+  int result = recover_target(name);
   TargetEntry queued = {};
   while (ktree_pop_recover_queue(queued.target_name) == kOk && queued.target_name[0] != '\0') {
-    result = _recover_target(queued.target_name);
+    result = recover_target(queued.target_name);
     queued = {};
   }
   return result;
 }
 
 // Leaves the target to the run that is recovering. Returns 0, -1 or -103.
-int _queue_target(const char* name) {
+int queue_target(const char* name) {
   LOG(1, "==> insert queue - %s", name);
   const int lock = wait_flock(kRecoverQueueLock, kQueueLockRetries, kQueueLockWaitUs);
   if (lock < 0) {
@@ -199,7 +199,7 @@ int _queue_target(const char* name) {
 }
 
 // Marks the target as being recovered. Returns 0 or kNotStored.
-Result _mark_target(const char* name) {
+Result mark_as_lost(const char* name) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) != kOk) {
     LOG(1, "Can not find: %s", name);
@@ -214,7 +214,7 @@ Result _mark_target(const char* name) {
 }
 
 // Recovers the target and all that are queued, or queues it where another run does.
-int _recover_or_queue(const char* name, int wait_seconds) {
+int recover_or_queue(const char* name, int wait_seconds) {
   if (wait_seconds > 0) {
     LOG(1, "Sleep %d seconds before add %s to recover queue...", wait_seconds, name);
     sleep(static_cast<unsigned>(wait_seconds));
@@ -224,8 +224,8 @@ int _recover_or_queue(const char* name, int wait_seconds) {
     return kFailed;
   }
   const int lock = get_recover_cri_flock();
-  if (lock < 0) return _queue_target(name);
-  const int result = _drain_queue(name);
+  if (lock < 0) return queue_target(name);
+  const int result = drain_queue(name);
   unlock_recover_cri_flock(lock);
   return result;
 }
@@ -235,7 +235,7 @@ int _recover_or_queue(const char* name, int wait_seconds) {
 int task_oiscsi_evt_reopen(const char* target_name) {
   const LogScope scope;
   LOG(2, "start");
-  const int result = _mark_target(target_name);
+  const int result = mark_as_lost(target_name);
   LOG(2, "end");
   return result;
 }
@@ -243,7 +243,7 @@ int task_oiscsi_evt_reopen(const char* target_name) {
 int task_oiscsi_evt_recover(const char* target_name, int wait_seconds) {
   const LogScope scope;
   LOG(2, "start");
-  const int result = _recover_or_queue(target_name, wait_seconds);
+  const int result = recover_or_queue(target_name, wait_seconds);
   LOG(2, "end");
   return result;
 }

@@ -30,7 +30,7 @@ void reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
 
 // Deletes a slot, or the whole target's when `lun_dbidx` is 0; the tree moves the slots behind it down. What
 // another run has deleted meanwhile is deleted. Returns 0 or kNotDeleted.
-Result _delete_slot(int dbidx, int lun_dbidx) {
+Result delete_stored_slot(int dbidx, int lun_dbidx) {
   const SlotsHeld held(SlotsHeld::kChange);
   const HeldSlot slot(dbidx, lun_dbidx);
   if (!slot) return kOk;
@@ -44,50 +44,50 @@ Result _delete_slot(int dbidx, int lun_dbidx) {
 }
 
 // The slot behind the last one is looked at once more: with the target go all of its LUNs.
-bool _has_at_most(int luns, int dbidx) {
+bool has_at_most(int luns, int dbidx) {
   return ktree_count_target_luns(dbidx) <= luns && has_no_further_lun(dbidx, luns);
 }
 
 // Deletes the slot of the target at `dbidx`, of which LUN `lun` was the last one. When another run has stored
 // a further one since, that stays, and so does the target. Returns 0 or kNotDeleted.
-Result _delete_slot_of_last_lun(int dbidx, int lun) {
+Result delete_slot_of_last_lun(int dbidx, int lun) {
   const SlotsHeld held(SlotsHeld::kChange);
   int lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);
   if (lun_dbidx <= 0) lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);  // the read may have failed
-  if (_has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return _delete_slot(dbidx, 0);
-  const Result result = lun_dbidx > 0 ? _delete_slot(dbidx, lun_dbidx) : kOk;
+  if (has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return delete_stored_slot(dbidx, 0);
+  const Result result = lun_dbidx > 0 ? delete_stored_slot(dbidx, lun_dbidx) : kOk;
   ktree_update_current_luncnt(dbidx);
   return result;
 }
 
 // Removes the target in `entry`, volumes, session and node record first; `last_lun` is the LUN with which it
 // goes, or kEveryLun. Returns 0 or kNotDeleted.
-Result _remove_target(TargetEntry* entry, int last_lun) {
+Result remove_target(TargetEntry* entry, int last_lun) {
   const BriefTargetHold hold(entry->target_name, is_no_lun_formatting);
   TargetEntry lun;
   LunWalk luns(entry->db_idx, LunWalk::kAtUnreadable);
   while (luns.next(&lun)) reload_lun_share(&lun);
   Target_Disconnect(entry);
   _target_record_delete(entry);
-  if (last_lun == kEveryLun) return _delete_slot(entry->db_idx, 0);
-  return _delete_slot_of_last_lun(entry->db_idx, last_lun);
+  if (last_lun == kEveryLun) return delete_stored_slot(entry->db_idx, 0);
+  return delete_slot_of_last_lun(entry->db_idx, last_lun);
 }
 
 // Removes one of several LUNs. Returns 0, kNotDeleted, or -1 when its entry cannot be read.
-Result _remove_lun(const TargetEntry& request, int dbidx, int lun_dbidx) {
+Result remove_lun(const TargetEntry& request, int dbidx, int lun_dbidx) {
   TargetEntry lun;
   if (read_requested_lun(request, &lun, dbidx, lun_dbidx) != kOk) return kFailed;
   reload_lun_share(&lun);
   (void)Target_LUN_umount(&lun);
-  return _delete_slot(dbidx, lun_dbidx);
+  return delete_stored_slot(dbidx, lun_dbidx);
 }
 
-Result _remove_named_target(const char* name, int last_lun) {
+Result remove_named_target(const char* name, int last_lun) {
   LOG(2, "start");
   Result result = kNotStored;
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(name, &entry) == kOk) {
-    result = _remove_target(&entry, last_lun);
+    result = remove_target(&entry, last_lun);
   } else {
     LOG(1, "Can not find: %s", name);
   }
@@ -97,16 +97,16 @@ Result _remove_named_target(const char* name, int last_lun) {
 }
 
 // Told as the removal of a target is.
-Result _remove_target_with_last_lun(const TargetEntry& request) {
+Result remove_target_with_last_lun(const TargetEntry& request) {
   const LogScope scope("task_del");
-  return _remove_named_target(request.target_name, request.lun);
+  return remove_named_target(request.target_name, request.lun);
 }
 
 }  // namespace
 
 int task_del(const TargetEntry& request) {
   const LogScope scope;
-  return _remove_named_target(request.target_name, kEveryLun);
+  return remove_named_target(request.target_name, kEveryLun);
 }
 
 int task_del_lun(const TargetEntry& request) {
@@ -122,15 +122,15 @@ int task_del_lun(const TargetEntry& request) {
   } else {
     result = find_requested_lun(request, &dbidx, &lun_dbidx);
   }
-  if (result == kOk && _has_at_most(1, dbidx)) {
+  if (result == kOk && has_at_most(1, dbidx)) {
     LOG(2, "removing target %s", request.target_name);
     target_gone = true;
-    result = _remove_target_with_last_lun(request);
+    result = remove_target_with_last_lun(request);
   } else if (result == kOk) {
-    result = _remove_lun(request, dbidx, lun_dbidx);
-    target_gone = result == kOk && _has_at_most(0, dbidx);
+    result = remove_lun(request, dbidx, lun_dbidx);
+    target_gone = result == kOk && has_at_most(0, dbidx);
     // Another run has removed the others meanwhile.
-    if (target_gone) result = _remove_target_with_last_lun(request);
+    if (target_gone) result = remove_target_with_last_lun(request);
   }
   if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);
   LOG(2, "end, ret = %d", result);

@@ -22,16 +22,16 @@ namespace remvol {
 namespace {
 
 // Reads the LUN in the target's slot and its state. Returns whether there is one.
-bool _read_lun(TargetEntry* entry, LunState* state, int slot) {
+bool read_lun(TargetEntry* entry, LunState* state, int slot) {
   return ktree_get_lun_of_target(entry, slot) == kOk && read_lun_state(entry->db_idx, slot, state) == kOk;
 }
 
 // Refreshes the status texts of the LUNs of the target in `entry`, which is the record for each. The slots
 // are let go of while disks are looked at.
-void _refresh_luns(TargetEntry* entry, SlotsHeld* held) {
+void refresh_luns(TargetEntry* entry, SlotsHeld* held) {
   LunState state;
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
-    if (!_read_lun(entry, &state, slot)) break;
+    if (!read_lun(entry, &state, slot)) break;
     held->let_go();
     repair_lun_state(entry, &state);
     ktree_update_lun_status(entry, state);
@@ -42,7 +42,7 @@ void _refresh_luns(TargetEntry* entry, SlotsHeld* held) {
 
 // Refreshes the target in `entry`. The slots are let go of while the sessions are listed. Returns 0, also
 // when it had to be skipped, or -103.
-int _refresh_target(TargetEntry* entry, SlotsHeld* held) {
+int refresh_target(TargetEntry* entry, SlotsHeld* held) {
   held->let_go();
   const int found = ktree_update_dev(entry);
   if (found == kTreeFailed) {
@@ -56,13 +56,13 @@ int _refresh_target(TargetEntry* entry, SlotsHeld* held) {
   }
   ktree_update_status(entry, repair_target_state(entry));
   held->take();
-  _refresh_luns(entry, held);
+  refresh_luns(entry, held);
   return kOk;
 }
 
 // Returns whether the slot was nameless and is gone. The tree is asked for the name anew: what this run has
 // read before is believed although a person at ktreec may have stored a target since.
-bool _delete_nameless_slot(int slot) {
+bool delete_nameless_slot(int slot) {
   const SlotsHeld held(SlotsHeld::kChange);
   if (tree_present(KeyText(key::kTargetName, slot))) return false;
   const KeyText path(key::kTarget, slot);
@@ -74,7 +74,7 @@ bool _delete_nameless_slot(int slot) {
 // Refreshes the targets and deletes slots without a name, garbage of an interrupted add or delete. The slot
 // that moves into a deleted one's place is visited next; no more slots are visited than were counted. Returns
 // 0 or -103.
-int _refresh_targets(int count) {
+int refresh_targets(int count) {
   SlotsHeld held;
   int slot = 1;
   for (int visited = 0; visited < count; visited++) {
@@ -82,13 +82,13 @@ int _refresh_targets(int count) {
     char name[sizeof entry.target_name];
     if (!read_target_name(slot, name)) {
       held.let_go();
-      if (!_delete_nameless_slot(slot)) slot++;
+      if (!delete_nameless_slot(slot)) slot++;
       held.take();
       continue;
     }
     remember_target(slot, name);
     const bool found = ktree_get_entry_by_targetname(name, &entry) == kOk;
-    if (found && _refresh_target(&entry, &held) != kOk) return kTreeFailed;
+    if (found && refresh_target(&entry, &held) != kOk) return kTreeFailed;
     slot = target_slot_after(slot);
   }
   return kOk;
@@ -96,18 +96,18 @@ int _refresh_targets(int count) {
 
 // The targets behind the counted ones, such as one whose add was refused, stay as they are, unless they show
 // work that nobody does any more. Returns 0 or -103.
-int _refresh_ended_work_behind(int count) {
+int refresh_ended_work_behind(int count) {
   SlotsHeld held;
   for (int slot = count + 1; slot <= kMaxTargets && is_target_stored(slot); slot++) {
     TargetEntry entry;
     if (ktree_get_entry_by_dbidx(slot, &entry) != kOk || !shows_ended_work(&entry)) continue;
-    if (_refresh_target(&entry, &held) != kOk) return kTreeFailed;
+    if (refresh_target(&entry, &held) != kOk) return kTreeFailed;
   }
   return kOk;
 }
 
 // Deletes the nameless slots behind the counted ones, up to the first without a status.
-void _prune_slots_behind(int count) {
+void prune_slots_behind(int count) {
   const SlotsHeld held(SlotsHeld::kChange);
   int slot = count + 1;
   for (int visited = count; visited < kMaxTargets; visited++) {
@@ -132,8 +132,8 @@ int task_status() {
   StateValue text;
   if (!tree_read(key::kTargetCount, text)) return kFailed;
   const int count = std::min(atoi(text), kMaxTargets);
-  if (_refresh_targets(count) != kOk || _refresh_ended_work_behind(count) != kOk) return kTreeFailed;
-  _prune_slots_behind(count);
+  if (refresh_targets(count) != kOk || refresh_ended_work_behind(count) != kOk) return kTreeFailed;
+  prune_slots_behind(count);
   LOG(2, "end");
   return kOk;
 }

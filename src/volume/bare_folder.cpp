@@ -20,7 +20,7 @@ namespace remvol {
 namespace {
 
 constexpr int kOpenFolders = 16;  // that a walk may hold open
-using Path = Text<PATH_MAX>;
+using FolderPath = Text<PATH_MAX>;
 
 // The folder held open, so that what is asked and what is done concern the same one.
 class Folder {
@@ -77,7 +77,7 @@ int release_below(const char* path, const struct stat*, int type, struct FTW* pl
 template <typename Act>
 void walk_to(const char* path, Act act) {
   for (const char* end = strchr(path + strlen(kMountRoot), '/'); end != nullptr; end = strchr(end + 1, '/')) {
-    act(Path("%.*s", static_cast<int>(end - path), path).c_str());
+    act(FolderPath("%.*s", static_cast<int>(end - path), path).c_str());
   }
 }
 
@@ -92,15 +92,15 @@ bool rename_folder(const void* what) {
 }
 
 // The name that a folder is made under. A killed run may have left it.
-Path draft_of(const char* path) {
+FolderPath draft_of(const char* path) {
   const char* name = strrchr(path, '/') + 1;
-  return Path("%.*s.new-%s", static_cast<int>(name - path), path, name);
+  return FolderPath("%.*s.new-%s", static_cast<int>(name - path), path, name);
 }
 
 // Makes the folder under another name first, so that it has the flag before anybody can reach it under its
 // own. Does nothing where that cannot be had.
 void make_unseen(const char* path) {
-  const Path draft = draft_of(path);
+  const FolderPath draft = draft_of(path);
   lift_left_cover(draft);
   rmdir(draft);
   if (access(path, F_OK) == 0 || mkdir(draft, 0777) != 0) return;

@@ -19,7 +19,7 @@ namespace {
 constexpr int kLiftTries = 3;               // memory may be short for a moment
 constexpr char kSource[] = "remvol-cover";  // what the mount table shows for a device
 
-enum Outcome : int { kDone, kNotDone };
+enum WorkEnd : int { kDone, kNotDone };
 
 // In the process that works: its mounts are its own from here on. Waits for the word that the cover is there.
 [[noreturn]] void work_aside(int link, bool (*work)(const void*), const void* what) {

@@ -21,8 +21,6 @@ namespace remvol {
 namespace {
 
 constexpr char kMtab[] = "/etc/mtab";
-constexpr char kProcMounts[] = "/proc/mounts";
-constexpr char kMountInfo[] = "/proc/self/mountinfo";
 constexpr char kSeparators[] = " \t";
 constexpr int kMountLine = 999;       // longest read of a mount table
 constexpr int kMountInfoLine = 8191;  // the lines of layered mounts are long

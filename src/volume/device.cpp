@@ -7,7 +7,6 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
-#include <memory>
 
 #include "frontend/log.h"
 #include "support/files.h"
@@ -20,12 +19,6 @@ namespace {
 constexpr char kBlockDir[] = "/sys/block";
 constexpr char kNodeDir[] = "/dev";
 constexpr mode_t kNodeMode = S_IFBLK | 0666;
-
-using PathText = Text<512>;
-
-struct DirCloser {
-  void operator()(DIR* directory) const { closedir(directory); }
-};
 
 // Returns where sysfs describes the device: a partition below its disk. Logs the disk of a partition.
 PathText sysfs_dir(const char* name) {
@@ -62,7 +55,7 @@ void make_node(const char* name, const DeviceId& id) {
 // the working directory seldom has, and an answer that fails leaves the one before in force: in the usual
 // case the partitions' nodes are left to the kernel.
 void make_partition_nodes(const char* disk, const char* directory_path) {
-  const std::unique_ptr<DIR, DirCloser> directory(opendir(directory_path));
+  const Directory directory(opendir(directory_path));
   if (!directory) {
     LOG(0, "can not open directory : %s", directory_path);
     return;

@@ -23,7 +23,7 @@ using SysfsPath = char[PATH_MAX];
 // none.
 bool find_device(const char* node, SysfsPath& path) {
   const Text<256> disk = disk_of_node(node);
-  return !disk.empty() && realpath(Text<512>("/sys/block/%s/device", disk.c_str()), path) != nullptr;
+  return !disk.empty() && realpath(PathText("/sys/block/%s/device", disk.c_str()), path) != nullptr;
 }
 
 // Returns the end of the path's component sessionN, or null when it has none.
@@ -37,7 +37,7 @@ const char* find_session_end(const char* path) {
 }
 
 // Reads the target's name from sessionN/iscsi_session/sessionN/targetname. Returns whether it has one.
-bool read_target_name(const char* path, const char* session_end, char (&name)[256]) {
+bool read_session_target(const char* path, const char* session_end, char (&name)[256]) {
   const Text<PATH_MAX> session("%.*s", static_cast<int>(session_end - path), path);
   const char* session_name = strrchr(session, '/');
   const Text<2 * PATH_MAX> file_path("%s/iscsi_session%s/targetname", session.c_str(), session_name);
@@ -97,7 +97,7 @@ DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
   if (session_end == nullptr) return kDiskForeign;
   char name[256];
   long long lun = 0;
-  if (!read_target_name(path, session_end, name) || !read_lun(path, &lun)) return kDiskUnknown;
+  if (!read_session_target(path, session_end, name) || !read_lun(path, &lun)) return kDiskUnknown;
   return strcmp(name, entry->target_name) == 0 && lun == entry->lun ? kDiskOurs : kDiskForeign;
 }
 
@@ -107,11 +107,11 @@ bool is_session_disk(const char* node, const char* target_name) {
   const char* session_end = find_session_end(path);
   if (session_end == nullptr || target_name == nullptr) return session_end != nullptr;
   char name[256];
-  return read_target_name(path, session_end, name) && strcmp(name, target_name) == 0;
+  return read_session_target(path, session_end, name) && strcmp(name, target_name) == 0;
 }
 
 bool has_disk(const char* node) {
-  return check_path_exist(Text<512>("/sys/block/%s", disk_of_node(node).c_str())) == 0;
+  return check_path_exist(PathText("/sys/block/%s", disk_of_node(node).c_str())) == 0;
 }
 
 bool is_foreign_disk(const TargetEntry* entry, const char* node) {

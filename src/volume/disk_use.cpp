@@ -9,7 +9,6 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
-#include <memory>
 
 #include "support/files.h"
 #include "support/text.h"
@@ -26,10 +25,6 @@ constexpr int kClaimLooks = 10;            // a second
 constexpr int kUdevLooks = 50;             // 5 seconds
 constexpr char kUdev[] = "/run/udev";
 constexpr char kUdevQueue[] = "/run/udev/queue";  // there while events are pending; see udevadm(8), settle
-
-struct DirCloser {
-  void operator()(DIR* directory) const { closedir(directory); }
-};
 
 // A descriptor that closes itself.
 struct Descriptor {
@@ -65,7 +60,7 @@ bool is_udev_at(const char* disk) {
 }  // namespace
 
 DiskHeld::DiskHeld(const char* partition) {
-  const Text<512> disk("/dev/%s", disk_of_node(partition).c_str());
+  const PathText disk("/dev/%s", disk_of_node(partition).c_str());
   if (strcmp(disk, partition) != 0) fd_ = open(disk, O_RDONLY | O_NONBLOCK | O_CLOEXEC);
 }
 
@@ -101,7 +96,7 @@ bool is_node_claimed(const char* node) {
 }
 
 bool has_partition(const char* name) {
-  const std::unique_ptr<DIR, DirCloser> directory(opendir(Text<512>("/sys/block/%s", name)));
+  const Directory directory(opendir(PathText("/sys/block/%s", name)));
   if (!directory) return false;
   while (const dirent* entry = readdir(directory.get())) {
     if (strncmp(entry->d_name, name, strlen(name)) != 0) continue;
@@ -112,7 +107,7 @@ bool has_partition(const char* name) {
 
 void wait_for_udev(const char* node) {
   if (access(kUdev, F_OK) != 0) return;
-  const Text<512> disk("/dev/%s", disk_of_node(node).c_str());
+  const PathText disk("/dev/%s", disk_of_node(node).c_str());
   for (int look = 0; look < kUdevLooks && is_udev_at(disk); look++) usleep(kLookPause);
 }
 

@@ -31,7 +31,7 @@ using FsName = char[16];
 
 constexpr FormatResult kGoOn = kFormatted;  // of a step
 
-bool check_arguments(const TargetEntry* entry, const char* partition) {
+bool check_format_arguments(const TargetEntry* entry, const char* partition) {
   if (entry->dev[0] == '\0') {
     LOG(0, "dev node name is empty");
     return false;
@@ -48,7 +48,7 @@ bool check_arguments(const TargetEntry* entry, const char* partition) {
 }
 
 // A state that could not be stored is logged and forgotten: the format goes on.
-void note_update(int result) {
+void log_failed_update(int result) {
   if (result != 0) LOG(0, "Update ktree FAILED");
 }
 
@@ -95,10 +95,10 @@ void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition
   while (fgets(text, sizeof text, output) != nullptr) {
     if (!update_format_progress(&progress, text)) continue;
     LOG(2, "%s : Percent=%d", partition, progress.percent);
-    note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, progress.percent));
+    log_failed_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, progress.percent));
   }
   pclose(output);
-  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100));
+  log_failed_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100));
 }
 
 // Whether the partition, chosen a while ago, may still be formatted. Returns kGoOn, kFormatRefused or
@@ -157,9 +157,9 @@ FormatResult begin_making(const TargetEntry* entry, FsName& fs_type, const char*
 // Makes the file system, everybody else on the partition ended and its beginning wiped before. Returns
 // kGoOn, kFormatRefused, kFormatNotWritable, or kFormatNotStarted.
 FormatResult make_file_system(TargetEntry* entry, const char* partition) {
-  note_update(ktree_update_formatting_state(entry, kFormatting));
-  note_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0));
-  note_update(ktree_update_lun_status(entry, 1));
+  log_failed_update(ktree_update_formatting_state(entry, kFormatting));
+  log_failed_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0));
+  log_failed_update(ktree_update_lun_status(entry, 1));
   LOG(2, "format partition %s", partition);
   const DiskHeld disk(partition);
   FormatResult result = end_users(entry, partition);
@@ -180,11 +180,11 @@ FormatResult make_file_system(TargetEntry* entry, const char* partition) {
 
 FormatResult Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty) {
   const LogScope scope;
-  if (!check_arguments(entry, partition)) return kFormatRefused;
+  if (!check_format_arguments(entry, partition)) return kFormatRefused;
   int sem_id = -1;
-  note_update(ktree_update_formatting_state(entry, kFormatWaiting));
+  log_failed_update(ktree_update_formatting_state(entry, kFormatWaiting));
   if (format_sem_P(&sem_id, 1) != 0) {
-    note_update(ktree_update_formatting_state(entry, kFormatFailed));
+    log_failed_update(ktree_update_formatting_state(entry, kFormatFailed));
     LOG(0, "wait fmt_sem failed, exit");
     return kFormatRefused;
   }
@@ -194,7 +194,7 @@ FormatResult Target_format(TargetEntry* entry, const char* partition, ContentMar
   // undoes the semaphore's change.
   if (result == kFormatNotWritable) return result;
   const FormatState state = result == kGoOn || result == kFormatLeftAlone ? kFormatIdle : kFormatFailed;
-  note_update(ktree_update_formatting_state(entry, state));
+  log_failed_update(ktree_update_formatting_state(entry, state));
   const int left = format_sem_V(&sem_id);
   if (left != 0) LOG(0, "release fmt_sem failed, exit");
   return result == kFormatRefused || result == kFormatLeftAlone ? result : static_cast<FormatResult>(left);

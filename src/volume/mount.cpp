@@ -52,7 +52,7 @@ class HeldNode {
 };
 
 // What the steps of a mount hand on.
-struct Volume {
+struct Mounting {
   TargetEntry* entry;
   int force_format;
   bool asked;        // for a format, whatever there is
@@ -100,7 +100,7 @@ bool record_access_right(const TargetEntry* entry, int right) {
   return false;
 }
 
-bool detect_fs(Volume* volume) {
+bool detect_fs(Mounting* volume) {
   memset(volume->fs_type, 0, sizeof volume->fs_type);
   if (sys_get_fs_type(volume->fs_type, volume->node) != 0) volume->fs_type[0] = '\0';
   return volume->fs_type[0] != '\0';
@@ -113,17 +113,17 @@ bool is_remains(const char* fs_type) {
   return strncmp(fs_type, kDamaged, strlen(kDamaged)) == 0;
 }
 
-bool is_usable(Volume* volume) {
+bool is_usable(Mounting* volume) {
   volume->held.hold(volume->node);
   return sys_check_dev(volume->node) == 0;
 }
 
-bool is_recognised(Volume* volume) {
+bool is_recognised(Mounting* volume) {
   return is_usable(volume) && detect_fs(volume);
 }
 
 // Returns whether the node is mounted on the volume's own mount point already.
-bool is_standing(Volume* volume) {
+bool is_standing(Mounting* volume) {
   MountLine mount;
   if (!is_mounted_from(volume->node, volume->mount_point, &mount)) return false;
   if (!detect_fs(volume)) copy_text(volume->fs_type, mount.type);
@@ -131,7 +131,7 @@ bool is_standing(Volume* volume) {
 }
 
 // Takes the first partition that passes the test. Returns whether there is one.
-bool find_partition(Volume* volume, bool (*passes)(Volume*)) {
+bool find_partition(Mounting* volume, bool (*passes)(Mounting*)) {
   PartitionList names;
   copy_text(names, volume->partitions);
   char* rest = nullptr;
@@ -142,7 +142,7 @@ bool find_partition(Volume* volume, bool (*passes)(Volume*)) {
   return false;
 }
 
-MountResult pick_partition(Volume* volume) {
+MountResult pick_partition(Mounting* volume) {
   if (find_partition(volume, is_recognised)) return kMounted;
   volume->looks_empty = volume->force_format == 0;
   volume->force_format = 1;
@@ -153,7 +153,7 @@ MountResult pick_partition(Volume* volume) {
 // Data that nobody asked to overwrite is never formatted: what is recognised on a second look is mounted, and
 // what was recognised on the first is not taken for empty on the second, which only a fault can make of it.
 // Returns whether the node can be used.
-bool protect_data(Volume* volume) {
+bool protect_data(Mounting* volume) {
   const bool known = volume->fs_type[0] != '\0';
   if (known && volume->looks_empty) volume->force_format = 0;
   if (known || volume->force_format != 0) return true;
@@ -161,7 +161,7 @@ bool protect_data(Volume* volume) {
   return false;
 }
 
-MountResult create_file_system(Volume* volume) {
+MountResult create_file_system(Mounting* volume) {
   LOG(kNote, "Got FS type = %s, creating volume", volume->fs_type);
   volume->held.release();
   const FormatResult result = Target_format(volume->entry, volume->node, volume->seen_empty);
@@ -171,7 +171,7 @@ MountResult create_file_system(Volume* volume) {
   return kMountFormatFailed;
 }
 
-MountResult keep_file_system(Volume* volume) {
+MountResult keep_file_system(Mounting* volume) {
   LOG(1, "Got FS type = %s, skip creating volume", volume->fs_type);
   const FileSystem* file_system = find_file_system(volume->fs_type);
   if (file_system != nullptr && file_system->check != nullptr && sys_check_fs_state(volume->node) != 0) {
@@ -182,7 +182,7 @@ MountResult keep_file_system(Volume* volume) {
 }
 
 // Leaves the chosen partition with a known file system.
-MountResult prepare_file_system(Volume* volume) {
+MountResult prepare_file_system(Mounting* volume) {
   LOG(2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
   if (!volume->asked) volume->seen_empty = content_mark(volume->node);
   detect_fs(volume);
@@ -195,7 +195,7 @@ MountResult prepare_file_system(Volume* volume) {
   return found ? kMounted : kMountFailed;
 }
 
-MountResult make_mount_point(const Volume* volume) {
+MountResult make_mount_point(const Mounting* volume) {
   const CommandText command = make_folder_command(volume->mount_point);
   LOG(1, "cmd = %s", command.c_str());
   make_bare_folder(volume->mount_point);
@@ -204,7 +204,7 @@ MountResult make_mount_point(const Volume* volume) {
   return kMountNoMountPoint;
 }
 
-MountResult mount_file_system(const Volume* volume) {
+MountResult mount_file_system(const Mounting* volume) {
   if (const FileSystem* file_system = find_file_system(volume->fs_type)) {
     run_mount(*file_system, volume->node, volume->mount_point);
     return kMounted;
@@ -214,12 +214,12 @@ MountResult mount_file_system(const Volume* volume) {
   return noted ? kMountUnsupported : kMountUnrecorded;
 }
 
-MountResult record_read_only(const Volume* volume) {
+MountResult record_read_only(const Mounting* volume) {
   return record_access_right(volume->entry, VOL_AC_RO) ? kMountReadOnly : kMountUnrecorded;
 }
 
 // Opens the volume to everybody and records whether that could be written.
-MountResult open_to_everybody(const Volume* volume) {
+MountResult open_to_everybody(const Mounting* volume) {
   if (system(open_folder_command(volume->mount_point)) == 0) {
     record_access_right(volume->entry, VOL_AC_RW);
     return kMounted;
@@ -228,7 +228,7 @@ MountResult open_to_everybody(const Volume* volume) {
   return record_read_only(volume);
 }
 
-MountResult record_mount(const Volume* volume) {
+MountResult record_mount(const Mounting* volume) {
   ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
   const FileSystem* file_system = find_file_system(volume->fs_type);
   if (file_system != nullptr && file_system->grow != nullptr) {
@@ -238,7 +238,7 @@ MountResult record_mount(const Volume* volume) {
   return open_to_everybody(volume);
 }
 
-void record_failed_mount(const Volume* volume) {
+void record_failed_mount(const Mounting* volume) {
   note_update(ktree_update_volume_state(volume->entry, kVolumeFailed));
   const CommandText command = remove_folder_command(volume->mount_point);
   if (is_removal_unsafe(volume->mount_point)) return;
@@ -247,7 +247,7 @@ void record_failed_mount(const Volume* volume) {
   LOG(0, "system() of cmd '%s' failed", command.c_str());
 }
 
-MountResult record_outcome(const Volume* volume) {
+MountResult record_outcome(const Mounting* volume) {
   if (sys_mount_point(volume->mount_point) != 0) return record_mount(volume);
   record_failed_mount(volume);
   return kMounted;
@@ -256,7 +256,7 @@ MountResult record_outcome(const Volume* volume) {
 // A volume that is in use where it belongs is neither checked, formatted nor mounted over: its state is
 // recorded as after a mount, with all that follows one (its partition may have grown). One that has turned
 // read-only since may take the chmod in memory alone.
-MountResult keep_standing(const Volume* volume) {
+MountResult keep_standing(const Mounting* volume) {
   LOG(1, "%s is mounted on %s already", volume->node.c_str(), volume->mount_point.c_str());
   if (!note_update(ktree_update_formatting_state(volume->entry, kFormatIdle))) return kMountUnrecorded;
   const MountResult result = record_mount(volume);
@@ -267,7 +267,7 @@ MountResult keep_standing(const Volume* volume) {
 
 // Mounts the file system and records what became of that. No other run closes the session meanwhile, or
 // removes the mount point.
-MountResult put_in_place(const Volume* volume) {
+MountResult put_in_place(const Mounting* volume) {
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
   if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
@@ -278,7 +278,7 @@ MountResult put_in_place(const Volume* volume) {
   return result;
 }
 
-MountResult bring_up(Volume* volume) {
+MountResult bring_up(Mounting* volume) {
   MountResult result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format);
   if (result == kMounted && !volume->asked && find_partition(volume, is_standing)) {
     return keep_standing(volume);
@@ -297,7 +297,7 @@ MountResult Target_mount(TargetEntry* entry, int force_format, int update_share)
   LOG(2, "start");
   MountResult result = check_entry(entry);
   if (result != kMounted) return result;
-  Volume volume{};
+  Mounting volume{};
   volume.entry = entry;
   volume.asked = force_format != 0;
   volume.force_format = force_format;

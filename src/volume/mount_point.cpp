@@ -17,7 +17,6 @@ namespace remvol {
 namespace {
 
 constexpr int kMaxLayers = 32;
-constexpr int kLongestHold = 60;  // seconds
 
 // Writes out what the file system mounted on `path` holds. A path that cannot be opened is left to the
 // kernel, which syncs a detached file system when its last user ends.

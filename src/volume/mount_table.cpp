@@ -15,7 +15,6 @@ namespace remvol {
 
 namespace {
 
-constexpr char kMountInfo[] = "/proc/self/mountinfo";
 constexpr int kFieldsUpToPath = 5;
 
 bool is_octal(char c) {

@@ -9,6 +9,9 @@
 
 namespace remvol {
 
+inline constexpr char kMountInfo[] = "/proc/self/mountinfo";
+inline constexpr char kProcMounts[] = "/proc/mounts";
+
 // One mount, its texts with the table's escapes undone and cut to their fields.
 struct MountLine {
   dev_t device;         // of the file system

@@ -5,7 +5,6 @@
 #include <cctype>
 #include <cstdio>
 #include <cstring>
-#include <memory>
 
 #include "frontend/log.h"
 #include "support/files.h"
@@ -14,10 +13,6 @@
 namespace remvol {
 
 namespace {
-
-struct DirCloser {
-  void operator()(DIR* directory) const { closedir(directory); }
-};
 
 CommandText process_list_command(const char* name) {
   return CommandText("ps -w | grep %s | grep -v 'grep'", name);
@@ -38,7 +33,7 @@ bool is_listed(const char* name, const char* device) {
 
 // Reads the file `field` of the process; parts that end in NUL are joined by blanks.
 bool read_process(const char* pid, const char* field, char (&text)[4096]) {
-  const File file(fopen(Text<512>("/proc/%s/%s", pid, field), "re"));
+  const File file(fopen(PathText("/proc/%s/%s", pid, field), "re"));
   if (!file) return false;
   const size_t length = fread(text, 1, sizeof text - 1, file.get());
   text[length] = '\0';
@@ -52,7 +47,7 @@ bool read_process(const char* pid, const char* field, char (&text)[4096]) {
 }  // namespace
 
 bool has_process(const char* name, const char* device) {
-  const std::unique_ptr<DIR, DirCloser> processes(opendir("/proc"));
+  const Directory processes(opendir("/proc"));
   if (!processes) return false;
   while (const dirent* process = readdir(processes.get())) {
     char text[4096];

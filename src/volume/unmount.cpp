@@ -25,6 +25,7 @@
 #include "volume/lun_status.h"
 #include "volume/mount_command.h"
 #include "volume/mount_point.h"
+#include "volume/mount_table.h"
 #include "volume/remount.h"
 #include "volume/share_services.h"
 
@@ -37,7 +38,6 @@ constexpr int kKillTries = 3;
 constexpr int kKillMaxWait = 200000;       // microseconds
 constexpr int kTreeLooks = 50;             // 5 seconds
 constexpr useconds_t kTreePause = 100000;  // microseconds
-constexpr char kProcMounts[] = "/proc/mounts";
 constexpr char kPublicFtp[] = "/home/Public";
 constexpr size_t kFtpPathSize = 512;
 
