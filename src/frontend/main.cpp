@@ -20,8 +20,8 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
-#include "tree_layout.h"
 #include "tree/settings_file.h"
+#include "tree_layout.h"
 #include "volume/share_services.h"
 
 using namespace remvol;
@@ -68,8 +68,9 @@ void copy_to_flash() {
 // Dumps the tree. Returns whether the settings file may go to the flash.
 bool dump_settings(const Command& command) {
   // A tree that was told to end may be gone already, which is nothing to tell of.
-  if (command.ends_tree)
+  if (command.ends_tree) {
     return !dump_would_bury_settings() && ktreec_dump(kVolumesSocket, 0, kSettingsFile) == 0;
+  }
   RunLock lock;
   lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one
   return store_settings();

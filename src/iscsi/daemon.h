@@ -7,7 +7,7 @@
 namespace remvol {
 
 // Runs `command`, which puts a daemon in the background, in a process group of its own. Returns 0, or
-// non-zero when the command failed, which is logged in the caller's name.
+// non-zero when the command failed, which is logged in the innermost scope's name.
 int start_daemon(const char* command);
 
 // Starts a configuration tree daemon that listens on `socket`, and gives it a second to do so.
@@ -15,7 +15,7 @@ void start_tree_daemon(const char* socket);
 
 // Stops the ktree whose process number stands in `pid_file`; any other process is left alone. Returns whether
 // a process was told to stop.
-bool stop_tree_daemon(const char* pid_file);
+[[nodiscard]] bool stop_tree_daemon(const char* pid_file);
 
 // The command that this takes.
 [[nodiscard]] CommandText stop_tree_command(const char* pid_file);

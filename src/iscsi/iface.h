@@ -14,14 +14,14 @@ int Iface_Config_Gen();
 
 // Fills the entry's iface when it is still empty, by its portal address. Returns 0, or -1 for a null entry or
 // an empty address.
-int get_iface_name(TargetEntry* entry);
+[[nodiscard]] int get_iface_name(TargetEntry* entry);
 
 // Puts the name of the interface record for a portal address into `out` of `size` bytes. Returns 0, or -1 for
 // a null argument or size 0.
-int _get_iface_name(char* out, size_t size, const char* address);
+[[nodiscard]] int _get_iface_name(char* out, size_t size, const char* address);
 
 // Returns 1 when network bonding is on, 0 when off, -1 when unknown.
-int _ktree_get_bonding_mode_enable();
+[[nodiscard]] int _ktree_get_bonding_mode_enable();
 
 }  // namespace remvol
 

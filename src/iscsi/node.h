@@ -17,11 +17,11 @@ int _target_record_delete(TargetEntry* entry);
 // Logs in. The message that the session is not there names `requested`, the target that the command is for:
 // none at start-up. Returns 0; 1 when the login was not confirmed or the command did not start; -1 when no
 // interface could be chosen or the port is out of range.
-int _target_login(TargetEntry* entry, const char* requested);
+[[nodiscard]] int _target_login(TargetEntry* entry, const char* requested);
 
 // Sets the connect state "connecting" and logs in, with `requested` as above. Returns 0 or -1. The caller
 // writes the state that follows.
-int Target_Connect(TargetEntry* entry, const char* requested);
+[[nodiscard]] int Target_Connect(TargetEntry* entry, const char* requested);
 
 }  // namespace remvol
 

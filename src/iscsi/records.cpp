@@ -15,8 +15,9 @@ constexpr int kOpenFolders = 4;
 
 int drop_when_empty(const char* path, const struct stat* info, int type, struct FTW* /*place*/) {
   const LogScope scope;
-  if (type == FTW_F && S_ISREG(info->st_mode) && info->st_size == 0 && unlink(path) == 0)
+  if (type == FTW_F && S_ISREG(info->st_mode) && info->st_size == 0 && unlink(path) == 0) {
     LOG(0, "the empty record %s is removed", path);
+  }
   return 0;
 }
 

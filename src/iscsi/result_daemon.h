@@ -18,7 +18,7 @@ inline constexpr ResultDaemon kLunResults = {"/var/run/ktree_sock_vv_search_lun"
 
 // With an output file (not null): starts the daemon, after stopping one that an earlier search left behind,
 // and returns its socket. Without one: returns null, the client library's default tree.
-const char* open_results(const ResultDaemon& daemon, const char* output_file);
+[[nodiscard]] const char* open_results(const ResultDaemon& daemon, const char* output_file);
 
 // With an output file: dumps the tree behind `socket` into it and stops the daemon.
 void close_results(const ResultDaemon& daemon, const char* socket, const char* output_file);

@@ -18,8 +18,8 @@
 #include "sysaux.h"
 #include "tree/access.h"
 #include "tree/entry.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
+#include "tree_layout.h"
 
 namespace remvol {
 
@@ -236,10 +236,11 @@ int _get_sess_lun_list(LunNode** head, const char* name, DeviceNodeMaker make_no
     LunNode* node = make_lun_node(listing, make_node);
     if (node == nullptr) continue;
     read_fs_type(node);
-    if (*head == nullptr)
+    if (*head == nullptr) {
       *head = node;
-    else
+    } else {
       lun_node_append(*head, node);
+    }
   }
   _remove_file(path);
   return 0;

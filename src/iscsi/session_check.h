@@ -6,11 +6,11 @@ namespace remvol {
 
 // Returns 1 when a session to the target called `name` exists; 0 when not (also when there is no session at
 // all, or the listing could not be read); -1 for a null or empty name; -106 when the listing command failed.
-int check_target_connected(const char* name);
+[[nodiscard]] int check_target_connected(const char* name);
 
 // Runs `command`, which lists the sessions. Returns 0; 1 when there is no session at all; -106 when the
-// command failed, which is logged in the caller's name.
-int list_sessions(const char* command);
+// command failed, which is logged in the innermost scope's name.
+[[nodiscard]] int list_sessions(const char* command);
 
 }  // namespace remvol
 

@@ -15,7 +15,7 @@ inline constexpr int kNoSessionExit = 21;
 
 // Returns whether a line of "iscsiadm -m session" shows a session to `name`: the first occurrence of the name
 // is followed by neither a letter nor a digit. So "t1" is found in a line that shows only "t1-x".
-bool session_line_shows(const char* line, const char* name);
+[[nodiscard]] bool session_line_shows(const char* line, const char* name);
 
 // Reader of "iscsiadm -m session -P 3", which lists one block for each target: its "Target" line, the state
 // of its session, its SCSI host and its LUNs. The two readers below differ in their start values alone.
@@ -45,21 +45,21 @@ enum class ListingLine {
 };
 
 // Reads one line of the listing for the target called exactly `name`.
-ListingLine read_listing_line(DetailedListing* listing, const char* line, const char* name);
+[[nodiscard]] ListingLine read_listing_line(DetailedListing* listing, const char* line, const char* name);
 
 // Returns whether a line of a discovery ("ADDRESS:PORT,TAG NAME") begins with `address`. 10.0.0.1 also begins
 // a line of 10.0.0.10.
-bool is_discovery_line_of(const char* line, const char* address);
+[[nodiscard]] bool is_discovery_line_of(const char* line, const char* address);
 
 // Copies the target name of a discovery line, the text after its first blank, into `name`. A "%" in it does
 // not come out as it stands: the name is printed as a printf format with itself as the argument, which the
 // names stored by earlier searches depend on. Since a portal chooses the name, only what is harmless of that
 // is done: "%%" gives "%", a first "%s" gives the whole name, any other directive gives nothing. Returns
 // false, with `name` unchanged, when the line has no blank.
-bool read_discovered_name(const char* line, char (&name)[kListingLineSize]);
+[[nodiscard]] bool read_discovered_name(const char* line, char (&name)[kListingLineSize]);
 
 // Returns whether a discovery line begins with `address`, shows `port` and contains `name` anywhere.
-bool discovery_line_offers(const char* line, const char* name, const char* address, int port);
+[[nodiscard]] bool discovery_line_offers(const char* line, const char* name, const char* address, int port);
 
 }  // namespace remvol
 

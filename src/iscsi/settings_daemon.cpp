@@ -8,9 +8,9 @@
 #include "support/files.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree_layout.h"
 #include "tree/settings_file.h"
 #include "tree/slots.h"
+#include "tree_layout.h"
 
 namespace remvol {
 
@@ -61,7 +61,7 @@ void start_settings_daemon() {
 }
 
 void stop_settings_daemon() {
-  stop_tree_daemon(kSettingsPidFile);
+  (void)stop_tree_daemon(kSettingsPidFile);
 }
 
 }  // namespace remvol

@@ -5,7 +5,7 @@
 namespace remvol {
 
 // Starts it and loads the settings, unless it runs. Settings that are missing or damaged are replaced by
-// their copy on the configuration flash. A failed step is logged in the caller's name.
+// their copy on the configuration flash. A failed step is logged in the innermost scope's name.
 void start_settings_daemon();
 
 // Has it end.

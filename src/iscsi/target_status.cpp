@@ -6,10 +6,10 @@
 #include "iscsi/session_check.h"
 #include "support/result.h"
 #include "tree/access.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

@@ -25,11 +25,11 @@ struct DirectoryCloser {
 using Directory = std::unique_ptr<DIR, DirectoryCloser>;
 
 // Returns 0 when `path` exists, -1 when it is null, empty or absent.
-int check_path_exist(const char* path);
+[[nodiscard]] int check_path_exist(const char* path);
 
 // Makes the directory `path` and its missing parents with `mode` (0 means 0700). Returns 0, also when it
 // exists, or -1.
-int make_dir_include_parent(const char* path, mode_t mode);
+[[nodiscard]] int make_dir_include_parent(const char* path, mode_t mode);
 
 // Removes the file `path`. Returns 0 when it is gone or was absent, else -1.
 int _remove_file(const char* path);
@@ -42,7 +42,7 @@ void drop_foreign_folder(const char* path);
 
 // Makes sure that `path` is a folder of our own user which nobody else may enter: what is there and is not is
 // replaced. Its parent has to exist. Returns whether it is.
-bool claim_folder(const char* path);
+[[nodiscard]] bool claim_folder(const char* path);
 
 }  // namespace remvol
 

@@ -155,7 +155,7 @@ int format_sem_V(int* sem_id) {
 
 void format_sem_release_leftover() {
   int sem_id = held_sem_id;
-  if (sem_id != -1) format_sem_V(&sem_id);
+  if (sem_id != -1) (void)format_sem_V(&sem_id);
 }
 
 }  // namespace remvol

@@ -6,10 +6,10 @@ namespace remvol {
 
 // Makes the format semaphore when missing and waits for it, unless this process has it already. Returns 0; -1
 // when it cannot be had, -2 when the wait failed.
-int format_sem_P(int* sem_id, int initial);
+[[nodiscard]] int format_sem_P(int* sem_id, int initial);
 
 // Leaves the format semaphore, or removes it when nobody waits (`sem_id` is then -1). Returns 0 or -2.
-int format_sem_V(int* sem_id);
+[[nodiscard]] int format_sem_V(int* sem_id);
 
 // Leaves the semaphore that a format which ended early has left to this process, if there is one. To be
 // called before this process waits for a lock that a run waiting for the semaphore may hold.

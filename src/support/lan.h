@@ -9,12 +9,12 @@ inline constexpr char kLan1[] = "egiga1";
 
 // Format the port's hardware address into `text`, which holds at least 32 bytes: 17 characters, the second
 // octet in lower case; port 1 with a trailing newline. Return 0, or -1 when the port has none.
-int get_lan0_mac_text(char* text);
-int get_lan1_mac_text(char* text);
+[[nodiscard]] int get_lan0_mac_text(char* text);
+[[nodiscard]] int get_lan1_mac_text(char* text);
 
 // Return 1 when the port has a link, else 0.
-int is_lan0_linked();
-int is_lan1_linked();
+[[nodiscard]] int is_lan0_linked();
+[[nodiscard]] int is_lan1_linked();
 
 }  // namespace remvol
 

@@ -9,11 +9,11 @@ inline constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.
 inline constexpr char kRecoverQueueLock[] = "/var/lock/virtual_volume/remvol_recover_queue.lock";
 
 // Makes the lock directory when missing. Returns 0, or -108 after printing the system error.
-int make_lock_dir();
+[[nodiscard]] int make_lock_dir();
 
 // Tries the recover lock once. Returns the descriptor; -1 when another process holds it, -10 on another
 // error, -108 when the file cannot be opened.
-int get_recover_cri_flock();
+[[nodiscard]] int get_recover_cri_flock();
 
 // Releases the recover lock and closes `fd` in every case. Returns 0, -1, -2 (bad descriptor) or -10.
 int unlock_recover_cri_flock(int fd);
@@ -21,7 +21,7 @@ int unlock_recover_cri_flock(int fd);
 // Takes a write lock on the file at `path`, with random waits below `max_wait_us` (above 0) microseconds
 // between tries. Returns the descriptor; -1 when the retries ran out, -10 on another error, -108 when the
 // file cannot be opened.
-int wait_flock(const char* path, int max_retries, int max_wait_us);
+[[nodiscard]] int wait_flock(const char* path, int max_retries, int max_wait_us);
 
 // Releases a lock of wait_flock and closes `fd` in every case. Returns 0, -1, -2 or -10.
 int unlock_flock(int fd);

@@ -16,7 +16,7 @@ struct LunNode {
 };
 
 // Returns a node with all fields zero, or null when out of memory.
-LunNode* lun_node_new();
+[[nodiscard]] LunNode* lun_node_new();
 
 // Frees every node of the list. Null is an empty list.
 void lun_node_free_list(LunNode* head);

@@ -9,7 +9,7 @@ extern char program_path[4096];
 
 // Returns the last component of `program_path`: the text after its last slash, or all of it. The tool's
 // temporary files are named after it.
-const char* program_name();
+[[nodiscard]] const char* program_name();
 
 }  // namespace remvol
 

@@ -25,7 +25,7 @@ enum class LockTry {
 
 // A lock's name for something that has a name of any form.
 using LockName = Text<64>;
-LockName hashed_lock_name(const char* kind, const char* name);
+[[nodiscard]] LockName hashed_lock_name(const char* kind, const char* name);
 
 class RunLock {
  public:

@@ -11,7 +11,7 @@ inline constexpr char kRefusedCommand[] = "false";
 
 // Returns whether `text` can stand in a command without quotes: letters, digits and ".:,_@%+=/[]-", no "-" at
 // its beginning, where it would be taken for an option. The empty text can.
-bool is_plain_word(const char* text);
+[[nodiscard]] bool is_plain_word(const char* text);
 
 // Composes a shell command from a template with %s and %d alone. A %s takes what its place in the template
 // allows:
@@ -20,7 +20,7 @@ bool is_plain_word(const char* text);
 //   without quotes          a plain word
 // Another value, or a command that grows too long, is refused: logged at level 0, and the command that comes
 // back is kRefusedCommand.
-[[gnu::format(printf, 1, 2)]] CommandText shell_command(const char* format, ...);
+[[nodiscard, gnu::format(printf, 1, 2)]] CommandText shell_command(const char* format, ...);
 
 // Returns the command `verb NODE` for a node without quotes, which must be a plain word.
 [[nodiscard]] CommandText command_on_node(const char* verb, const char* node);

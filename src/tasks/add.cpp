@@ -48,7 +48,7 @@ const MountOutcome& mount_outcome(MountResult mounted) {
 // Mounts the LUN in a slot of the connected target in `entry`, when it is enabled, and puts the result of the
 // last step into `result`. Returns false when the mount broke: nothing more is to be done then.
 bool mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result) {
-  ktree_update_dev(entry);
+  (void)ktree_update_dev(entry);
   if (ktree_get_found_lun_entry(entry, dbidx, lun_dbidx, entry->lun) < 0) return true;
   int enable = 0;
   *result = ktree_get_lun_enable(&enable, dbidx, lun_dbidx);

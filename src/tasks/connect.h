@@ -10,8 +10,8 @@ namespace remvol {
 // Returns 0; -103 unknown target; the result of a failed login; -1 when its disks cannot be found.
 [[nodiscard]] int task_connect(const TargetEntry& request);
 
-// Takes a target offline, or every target for null. Returns 0; 1 when logging out of
-// all nodes failed; -1 for an unknown target.
+// Takes a target offline, or every target for null. Returns 0; 1 when logging out of all
+// nodes failed; -1 for an unknown target.
 [[nodiscard]] int task_disconnect(const char* target_name);
 
 }  // namespace remvol

@@ -71,7 +71,7 @@ int remake_volume(TargetEntry* entry) {
 void _update_stored_target(TargetEntry* entry) {
   const LogScope scope;
   const SlotsHeld held(SlotsHeld::kChange);
-  if (HeldSlot(entry->db_idx)) ktree_add_entry(entry);
+  if (HeldSlot(entry->db_idx)) (void)ktree_add_entry(entry);
 }
 
 // Puts the requested CHAP settings into the target's entry, its slot and its node record.
@@ -95,7 +95,7 @@ void reconnect(TargetEntry* entry, int conn_set) {
   }
   entry->conn_set = conn_set;
   ktree_record_connect_set(entry);
-  ktree_update_dev(entry);
+  (void)ktree_update_dev(entry);
   sleep(kSettleSeconds);
   (void)Target_mount_all_lun(entry, 0, 1);
 }

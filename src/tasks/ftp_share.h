@@ -10,7 +10,7 @@ namespace remvol {
 using FtpPath = char[512];
 
 // Unmounts the FTP mount of the entry's volume and leaves its path in `path`, empty when there is none. Logs
-// in the caller's name. Returns 0, or -105 when the mount table cannot be read.
+// in the innermost scope's name. Returns 0, or -105 when the mount table cannot be read.
 Result take_ftp_share_down(const TargetEntry* entry, FtpPath& path);
 
 }  // namespace remvol

@@ -8,10 +8,10 @@
 #include "tasks/requested_lun.h"
 #include "tasks/whole_target.h"
 #include "tree/entry.h"
-#include "tree_layout.h"
 #include "tree/lun_walk.h"
 #include "tree/slots.h"
 #include "tree/state.h"
+#include "tree_layout.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 

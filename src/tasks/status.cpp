@@ -12,9 +12,9 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/half_made.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/state.h"
+#include "tree_layout.h"
 #include "volume/lun_status.h"
 
 namespace remvol {

@@ -145,7 +145,7 @@ int Target_Disconnect(TargetEntry* entry) {
   ktree_set_connect_state(entry->db_idx, kDisconnected);
   entry->conn_set = 0;
   ktree_record_connect_set(entry);
-  ktree_update_dev(entry);
+  (void)ktree_update_dev(entry);
   LOG(2, "end");
   return result;
 }

@@ -13,7 +13,7 @@ int Target_Logout(TargetEntry* entry);
 
 // Gives up a login whose session shows no disk that could be mounted: logs out, stores that the target stays
 // disconnected and `state` for all its LUNs. `reason` is the result of ktree_update_dev; it and the outcome
-// are logged in the caller's name.
+// are logged in the innermost scope's name.
 void give_up_session(TargetEntry* entry, int reason, VolumeState state);
 
 // Logs out and changes nothing else. Returns 0, 1 when the command failed, -1 for an empty target name.

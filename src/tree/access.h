@@ -36,7 +36,7 @@ struct TreeInstance {
 // Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns what the read gives: the number
 // of bytes, -1 for a key that is missing; errno is ENODATA when the tree has said so, and it is no read that
 // failed (a tree's library of another platform may not tell).
-int tree_get(const char* key, char* buffer, size_t size);
+[[nodiscard]] int tree_get(const char* key, char* buffer, size_t size);
 
 // The same. Returns whether the key is present.
 [[nodiscard]] bool tree_read(const char* key, char* buffer, size_t size);
@@ -63,7 +63,7 @@ template <size_t N>
 [[nodiscard]] bool tree_is_loaded();
 
 // Returns the decimal number at `key`, 0 when its text is no number, `missing` when the key is not present.
-int tree_read_number(const char* key, int missing);
+[[nodiscard]] int tree_read_number(const char* key, int missing);
 
 // The looser rule of the free-slot searches: free when the read is exactly -1 or the value is empty.
 [[nodiscard]] bool tree_slot_is_free(const char* key);
@@ -74,17 +74,17 @@ int tree_read_number(const char* key, int missing);
 // The same on the tree behind `socket`; null means the client library's default.
 [[nodiscard]] int tree_write_to(const char* socket, const char* key, const char* value);
 
-// The same two, and log "ktreec_set() failed" at level 0 in the caller's name.
+// The same two, and log "ktreec_set() failed" at level 0 in the innermost scope's name.
 [[nodiscard]] int tree_write_once(const char* key, const char* value);
 [[nodiscard]] int tree_write_once_to(const char* socket, const char* key, const char* value);
 
-// Sets `key` in up to 3 tries and logs "ktreec_set(%s) failed" in the caller's name after each failed one.
-// Returns 0, or -103 after the third.
-int tree_write_with_tries(const char* key, const char* value);
-int tree_write_with_tries_to(const char* socket, const char* key, const char* value);
+// Sets `key` in up to 3 tries and logs "ktreec_set(%s) failed" in the innermost scope's name after each
+// failed one. Returns 0, or -103 after the third.
+[[nodiscard]] int tree_write_with_tries(const char* key, const char* value);
+[[nodiscard]] int tree_write_with_tries_to(const char* socket, const char* key, const char* value);
 
 // The same, and says first what it sets, at level 1.
-int tree_write_logged(const char* key, const char* value);
+[[nodiscard]] int tree_write_logged(const char* key, const char* value);
 
 // Deletes `key` and all below it. Returns 0, or -103 (not logged).
 [[nodiscard]] int tree_delete(const char* key);

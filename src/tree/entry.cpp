@@ -8,8 +8,8 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
+#include "tree_layout.h"
 
 namespace remvol {
 
@@ -71,8 +71,9 @@ int count_luns_at(int n) {
 // Counts the LUNs of the slot `n` as it is now, also those behind an empty one.
 int count_all_luns_at(int n) {
   int count = 0;
-  for (int m = 1; m <= kMaxLunsPerTarget; m++)
+  for (int m = 1; m <= kMaxLunsPerTarget; m++) {
     count += tree_present_surely(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
+  }
   return count;
 }
 
@@ -93,8 +94,9 @@ int slot_to_take(int free, const char* target_name) {
 bool may_take_lun_slot(int n, int m, int lun) {
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
     TreeValue number;
-    if (tree_read(KeyText(key::kLunNumber, n, slot), number) && (slot == m || atoi(number) == lun))
+    if (tree_read(KeyText(key::kLunNumber, n, slot), number) && (slot == m || atoi(number) == lun)) {
       return false;
+    }
   }
   return true;
 }
@@ -275,8 +277,9 @@ void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx) {
   const KeyText right(key::kLunAccessRight, n, lun_dbidx);
   if (tree_is_missing(enable, number)) set_value(enable, 1);
   if (tree_is_missing(right, number)) set_value(right, VOL_AC_RW);
-  if (tree_read_number(KeyText(key::kTargetLunCount, n), 0) != count_all_luns_at(n))
+  if (tree_read_number(KeyText(key::kTargetLunCount, n), 0) != count_all_luns_at(n)) {
     ktree_update_current_luncnt(n);
+  }
 }
 
 int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {

@@ -6,8 +6,8 @@
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
+#include "tree_layout.h"
 
 namespace remvol {
 
@@ -51,8 +51,9 @@ void drop_half_made_luns_of(int n) {
 void count_luns_of(int n) {
   TreeValue name;
   if (read_target_name(n, name) && tree_read_number(KeyText(key::kTargetLunCount, n), 0) < last_lun_at(n) &&
-      IdleTarget(name))
+      IdleTarget(name)) {
     ktree_update_current_luncnt(n);
+  }
 }
 
 // A target whose mount failed is not counted, as those who read the tree know it.

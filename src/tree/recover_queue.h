@@ -8,14 +8,14 @@
 namespace remvol {
 
 // Returns the first free entry (1 to 100), or -1 when all are used.
-int ktree_get_free_recover_queue_db_idx();
+[[nodiscard]] int ktree_get_free_recover_queue_db_idx();
 
 // Appends a name. Returns 0, -1 when the queue is full, -103 when the write failed.
-int ktree_insert_recover_queue(const char* target_name);
+[[nodiscard]] int ktree_insert_recover_queue(const char* target_name);
 
 // Takes the oldest name into `target_name`, which holds at least 256 bytes. Returns 0; -1 when the queue is
 // empty; -103 when the entry could not be deleted (the name is copied out all the same).
-int ktree_pop_recover_queue(char* target_name);
+[[nodiscard]] int ktree_pop_recover_queue(char* target_name);
 
 }  // namespace remvol
 

@@ -8,8 +8,8 @@
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

@@ -15,7 +15,7 @@ int ktree_update_search_lun_result(const char* socket, const LunNode* luns, cons
 int ktree_update_search_lun_err_code(const char* socket, int code);
 
 // Returns 1 when a LUN of any target has exactly this share name, else 0.
-int ktree_check_duplicate_share_name(const char* share);
+[[nodiscard]] int ktree_check_duplicate_share_name(const char* share);
 
 }  // namespace remvol
 

@@ -15,9 +15,9 @@ namespace remvol {
 // the tree was started and never loaded.
 [[nodiscard]] bool dump_would_bury_settings();
 
-// Dumps the tree to kSettingsFile. A dump that is withheld or fails is logged at level 0 in the caller's
-// name; one for which there is no folder is told on standard error. Returns whether what kSettingsFile holds
-// then may go to the configuration flash.
+// Dumps the tree to kSettingsFile. A dump that is withheld or fails is logged at level 0 in the innermost
+// scope's name; one for which there is no folder is told on standard error. Returns whether what
+// kSettingsFile holds then may go to the configuration flash.
 [[nodiscard]] bool store_settings();
 
 // Keeps kSettingsFile, which could not be loaded, under the name kDamagedSettingsFile as well.

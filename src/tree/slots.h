@@ -38,7 +38,8 @@ class SlotsHeld {
 // A slot of a target, or of one of its LUNs, by the number that this run knows it by.
 class HeldSlot {
  public:
-  // `m` 0: the target's slot alone. A slot that is stored no more is logged at level 1 in the caller's name.
+  // `m` 0: the target's slot alone. A slot that is stored no more is logged at level 1 in the innermost
+  // scope's name.
   explicit HeldSlot(int n, int m = 0);
 
   // False when what the slot stood for is stored no more. A number that this run has read nothing from, and
@@ -85,11 +86,11 @@ void remember_all_targets();
 
 // Returns the slot to visit after slot `n`: the one behind the target that was read there, or, when that has
 // been deleted meanwhile, the one that has taken its place.
-int target_slot_after(int n);
+[[nodiscard]] int target_slot_after(int n);
 
 // Returns the LUN slot to visit after slot `m` of the target at `n`: the one behind the LUN that was read
 // there, or, when that has been deleted meanwhile, the one that has taken its place.
-int lun_slot_after(int n, int m);
+[[nodiscard]] int lun_slot_after(int n, int m);
 
 }  // namespace remvol
 

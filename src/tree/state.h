@@ -20,17 +20,17 @@ int ktree_get_connect_state(int dbidx, int* value);
 
 // Writes the LUN's access right. Returns 0; -1 for a right that is neither VOL_AC_RW nor VOL_AC_RO or a dbidx
 // below 1; -103.
-int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx);
+[[nodiscard]] int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx);
 
 // Reads the LUN's access right into `right`: VOL_AC_RO only when the key holds 0, else VOL_AC_RW. Returns 0,
 // or -1 for a null `right` or a dbidx below 1.
-int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx);
+[[nodiscard]] int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx);
 
 // Writes the format state of the entry's LUN. Returns 0 or -103.
 int ktree_update_formatting_state(const TargetEntry* entry, int state);
 
 // Returns whether no LUN of the target is being formatted or waits for that, by the stored states.
-bool is_no_lun_formatting(const char* target_name);
+[[nodiscard]] bool is_no_lun_formatting(const char* target_name);
 
 // Writes the format progress in percent. Returns 0, -1 for a dbidx below 1, or -103.
 int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent);
@@ -62,7 +62,7 @@ struct LunState {
 };
 
 // Reads it. Returns 0, or -1 for a dbidx below 1.
-int read_lun_state(int dbidx, int lun_dbidx, LunState* state);
+[[nodiscard]] int read_lun_state(int dbidx, int lun_dbidx, LunState* state);
 
 }  // namespace remvol
 

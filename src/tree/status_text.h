@@ -17,7 +17,7 @@ struct TargetStatus {
 };
 
 // The status of a target that is logged in or not and whose connect state is `state`.
-TargetStatus target_status(bool connected, int state);
+[[nodiscard]] TargetStatus target_status(bool connected, int state);
 
 // The status of a target that is being recovered.
 inline constexpr char kReconnecting[] = "Reconnecting";
@@ -27,15 +27,15 @@ inline constexpr char kLunDisabled[] = "Disable";
 inline constexpr char kLunOffline[] = "Offline";
 
 // The text of a LUN that is being formatted, `progress` in percent.
-StatusText formatting_text(int progress);
+[[nodiscard]] StatusText formatting_text(int progress);
 
 // The text of a mounted LUN.
-StatusText running_text(const LunState& state);
+[[nodiscard]] StatusText running_text(const LunState& state);
 
 // The text of a LUN on which a file system is that is not mounted, and of one on which none was recognised.
 // `progress` in percent counts while the state is kFormatting.
-StatusText unmounted_text(const LunState& state, int progress);
-StatusText unformatted_text(const LunState& state, int progress);
+[[nodiscard]] StatusText unmounted_text(const LunState& state, int progress);
+[[nodiscard]] StatusText unformatted_text(const LunState& state, int progress);
 
 }  // namespace remvol
 

@@ -9,9 +9,9 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/state.h"
+#include "tree_layout.h"
 
 namespace remvol {
 

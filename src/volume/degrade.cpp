@@ -91,8 +91,9 @@ MountRight read_mountinfo_line(char* line, const char* device) {
   const char* source = strtok_r(nullptr, kSeparators, &rest);
   if (source == nullptr || !is_source_of(source, device)) return kNotMounted;
   const char* options = strtok_r(line, kSeparators, &rest);
-  for (int field = 1; field < 6 && options != nullptr; field++)
+  for (int field = 1; field < 6 && options != nullptr; field++) {
     options = strtok_r(nullptr, kSeparators, &rest);
+  }
   return options != nullptr ? field_right(options) : kMountedUnclear;
 }
 

@@ -25,9 +25,9 @@ enum DiskOwner : int {
 [[nodiscard]] bool has_disk(const char* node);
 
 // Returns whether the disk of `node` is known to be another one than the entry's; then nothing that changes
-// it or ends its users may be done. That is logged at level 0 in the caller's name. A disk that this run has
-// seen to be the entry's and that sysfs knows nothing of any more counts as another one: its session was
-// closed meanwhile, and the name may be given anew at any moment.
+// it or ends its users may be done. That is logged at level 0 in the innermost scope's name. A disk that this
+// run has seen to be the entry's and that sysfs knows nothing of any more counts as another one: its session
+// was closed meanwhile, and the name may be given anew at any moment.
 [[nodiscard]] bool is_foreign_disk(const TargetEntry* entry, const char* node);
 
 // Returns whether a disk that is known to be another one than the entry's is mounted on `path`: what is

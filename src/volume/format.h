@@ -7,12 +7,13 @@
 
 namespace remvol {
 
-enum [[nodiscard]] FormatResult : int{
-    kFormatted = 0,        // also when mke2fs could not be started, failed, or a state could not be stored
-    kFormatLeftAlone = 1,  // the partition is mounted, or no longer as it was seen and recognised
-    kFormatRefused = -1,   // bad arguments, no semaphore, another disk than the entry's or one that is in use
-    kFormatNotWritable = -2,  // the partition; this run keeps the semaphore until it ends
-    kFormatNotStarted = -3,   // mke2fs could not be started: of a step alone, not told
+enum [[nodiscard]] FormatResult : int;
+enum FormatResult : int {
+  kFormatted = 0,        // also when mke2fs could not be started, failed, or a state could not be stored
+  kFormatLeftAlone = 1,  // the partition is mounted, or no longer as it was seen and recognised
+  kFormatRefused = -1,   // bad arguments, no semaphore, another disk than the entry's or one that is in use
+  kFormatNotWritable = -2,  // the partition; this run keeps the semaphore until it ends
+  kFormatNotStarted = -3,   // mke2fs could not be started: of a step alone, not told
 };
 
 // Formats the partition node `partition` for the entry's LUN, with the ext2, ext3 or ext4 found on it, else
@@ -21,7 +22,8 @@ enum [[nodiscard]] FormatResult : int{
 // before (0, or -2 as if the partition could not be written), unless it is told above.
 FormatResult Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty = kNoMark);
 
-enum [[nodiscard]] ProcessState : int{kRunning = 0, kNotRunning = 1};
+enum [[nodiscard]] ProcessState : int;
+enum ProcessState : int { kRunning = 0, kNotRunning = 1 };
 
 // Asks for a mke2fs on a SCSI disk.
 ProcessState check_mkfs_process_existing();

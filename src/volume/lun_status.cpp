@@ -5,9 +5,9 @@
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/status_text.h"
+#include "tree_layout.h"
 #include "volume/mount_point.h"
 
 namespace remvol {

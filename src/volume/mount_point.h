@@ -27,7 +27,7 @@ class MountPointHold {
 
 // Returns whether the share's mount point lies below the mount root. It does not when the name has a
 // component "..", or none besides empty ones and ".", or when a component of the path below the root is a
-// symbolic link; that is logged at level 0 in the caller's name.
+// symbolic link; that is logged at level 0 in the innermost scope's name.
 [[nodiscard]] bool is_share_inside_root(const char* share);
 
 // Returns whether the kernel's table shows the block device `node`, by its number and whatever its name, as
@@ -40,7 +40,7 @@ void detach_mounts(const char* path);
 
 // Returns whether "rm -rf" of `path` would run into a mounted file system: one is mounted on the path or
 // below it, or the path lies inside another volume. Where the kernel's table cannot be read, the path itself
-// is asked. Logged at level 0 in the caller's name.
+// is asked. Logged at level 0 in the innermost scope's name.
 [[nodiscard]] bool is_removal_unsafe(const char* path);
 
 }  // namespace remvol

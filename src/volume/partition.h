@@ -10,10 +10,11 @@ namespace remvol {
 // Kernel names of a disk's partitions, separated by commas or blanks.
 using PartitionList = char[1024];
 
-enum [[nodiscard]] PartitionFit : int{
-    kPartitionFits = 0,    // or there is not exactly one
-    kPartitionShort = 1,   // it ends more than 100,000,000 bytes before the disk does
-    kPartitionError = -1,  // a bad argument
+enum [[nodiscard]] PartitionFit : int;
+enum PartitionFit : int {
+  kPartitionFits = 0,    // or there is not exactly one
+  kPartitionShort = 1,   // it ends more than 100,000,000 bytes before the disk does
+  kPartitionError = -1,  // a bad argument
 };
 
 // Returns how the only partition of the disk at path `device` fills it.

@@ -6,7 +6,7 @@
 namespace remvol {
 
 // Returns whether a process whose line in the process list matches `name` (for grep) has `device` in it.
-// Every line looked at is logged at level 2 in the caller's name.
+// Every line looked at is logged at level 2 in the innermost scope's name.
 [[nodiscard]] bool is_command_running_on(const char* name, const char* device);
 
 // Returns whether a process called `name` has `device` in its arguments, by its own files; see

@@ -101,12 +101,12 @@ TEST_F(TargetLookup, KnowsNoNinthSlot) {
 
 TEST_F(TargetLookup, Logs) {
   put_target(1);
-  EXPECT_EQ(logged(1, [] { ktree_get_dbidx_by_targetname("iqn.t1"); }),
+  EXPECT_EQ(logged(1, [] { (void)ktree_get_dbidx_by_targetname("iqn.t1"); }),
             Texts{"src.cpp:ktree_get_dbidx_by_targetname: get iqn.t1 db_idx=1"});
-  EXPECT_EQ(logged(1, [] { ktree_get_dbidx_by_targetname("iqn.x"); }),
+  EXPECT_EQ(logged(1, [] { (void)ktree_get_dbidx_by_targetname("iqn.x"); }),
             (Texts{"src.cpp:ktree_get_dbidx_by_targetname: ktreec_get(/iscsi/initiator/id:2/target) failed",
                    "src.cpp:ktree_get_dbidx_by_targetname: get iqn.x db_idx=-1"}));
-  EXPECT_EQ(logged(0, [] { ktree_get_dbidx_by_targetname("iqn.x"); }), Texts{});
+  EXPECT_EQ(logged(0, [] { (void)ktree_get_dbidx_by_targetname("iqn.x"); }), Texts{});
 }
 
 class FreeTargetSlot : public fakes::Test {};
@@ -132,8 +132,9 @@ TEST_F(FreeTargetSlot, AReadThatFailsOtherwiseIsNotFree) {
 }
 
 TEST_F(FreeTargetSlot, IsLoggedAtLevel3) {
-  EXPECT_EQ(logged(3, [] { ktree_get_free_dbidx(); }), Texts{"src.cpp:ktree_get_free_dbidx: free ent id: 1"});
-  EXPECT_EQ(logged(2, [] { ktree_get_free_dbidx(); }), Texts{});
+  EXPECT_EQ(logged(3, [] { (void)ktree_get_free_dbidx(); }),
+            Texts{"src.cpp:ktree_get_free_dbidx: free ent id: 1"});
+  EXPECT_EQ(logged(2, [] { (void)ktree_get_free_dbidx(); }), Texts{});
 }
 
 class FillTarget : public fakes::Test {};
@@ -196,11 +197,11 @@ TEST_F(FillTarget, RefusesAnUnknownNameAndClearsTheRecord) {
 TEST_F(FillTarget, Logs) {
   TargetEntry entry;
   put_target(1);
-  EXPECT_EQ(logged(0, [] { ktree_get_entry_by_targetname("iqn.x", nullptr); }),
+  EXPECT_EQ(logged(0, [] { (void)ktree_get_entry_by_targetname("iqn.x", nullptr); }),
             Texts{"src.cpp:ktree_get_entry_by_targetname: Entry is NULL"});
-  EXPECT_EQ(logged(0, [&] { ktree_get_entry_by_targetname("iqn.x", &entry); }),
+  EXPECT_EQ(logged(0, [&] { (void)ktree_get_entry_by_targetname("iqn.x", &entry); }),
             Texts{"src.cpp:ktree_get_entry_by_targetname: Can not get entry from iqn.x"});
-  EXPECT_EQ(logged(1, [&] { ktree_get_entry_by_targetname("iqn.t1", &entry); }),
+  EXPECT_EQ(logged(1, [&] { (void)ktree_get_entry_by_targetname("iqn.t1", &entry); }),
             (Texts{"src.cpp:ktree_get_dbidx_by_targetname: get iqn.t1 db_idx=1",
                    "src.cpp:ktree_get_entry_by_targetname: get iqn.t1 db_idx=1"}));
 }
@@ -262,13 +263,13 @@ TEST_F(FillLun, RefusesBadArguments) {
 TEST_F(FillLun, RefusesEmptySlotsAndSaysWhich) {
   TargetEntry entry = dirty();
   EXPECT_EQ(ktree_get_lun_entry_by_dbidx(&entry, 4, 2), -1);
-  EXPECT_EQ(logged(0, [&] { ktree_get_lun_entry_by_dbidx(&entry, 4, 2); }),
+  EXPECT_EQ(logged(0, [&] { (void)ktree_get_lun_entry_by_dbidx(&entry, 4, 2); }),
             Texts{"src.cpp:ktree_get_lun_entry_by_dbidx: Can not get entry from 4"});
   put_target(1);
   EXPECT_EQ(ktree_get_lun_entry_by_dbidx(&entry, 1, 2), -1);
-  EXPECT_EQ(logged(2, [&] { ktree_get_lun_entry_by_dbidx(&entry, 1, 2); }),
+  EXPECT_EQ(logged(2, [&] { (void)ktree_get_lun_entry_by_dbidx(&entry, 1, 2); }),
             Texts{"src.cpp:ktree_get_lun_entry_by_dbidx: Can not get lun from 2"});
-  EXPECT_EQ(logged(1, [&] { ktree_get_lun_entry_by_dbidx(&entry, 1, 2); }), Texts{});
+  EXPECT_EQ(logged(1, [&] { (void)ktree_get_lun_entry_by_dbidx(&entry, 1, 2); }), Texts{});
 }
 
 class Counts : public fakes::Test {};

@@ -222,7 +222,7 @@ TEST_F(ShellText, ACommandOnAPathIsNeverCut) {
 
 TEST_F(ShellText, ARefusalIsToldWithoutTheValue) {
   debug_level = 0;
-  const std::string told = fakes::output_of([] { shell_command("login -T %s", "a;canary"); });
+  const std::string told = fakes::output_of([] { (void)shell_command("login -T %s", "a;canary"); });
   EXPECT_NE(told.find("cmd 'login -T %s' is refused"), std::string::npos) << told;
   EXPECT_EQ(told.find("canary"), std::string::npos) << told;
 }

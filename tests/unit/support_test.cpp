@@ -49,7 +49,7 @@ TEST_F(Retries, GiveUpWithTheLastStatus) {
 
 TEST_F(Retries, AreLogged) {
   fakes::on("system").returns(0x200 | 9);
-  const Texts texts = logged(2, [] { process_system_cmd_mt("cmd", 2, 2); });
+  const Texts texts = logged(2, [] { (void)process_system_cmd_mt("cmd", 2, 2); });
   const std::string wait = fakes::calls({"usleep"}).at(0).substr(7);
   const Texts failure = {"src.cpp:process_system_cmd_mt: system() of cmd 'cmd' failed",
                          "src.cpp:process_system_cmd_mt: !!!ret=521, WIFEXITED=0, WEXITSTATUS=2"};
@@ -60,14 +60,14 @@ TEST_F(Retries, AreLogged) {
 
 TEST_F(Retries, AnExitIsToldFromASignal) {
   fakes::on("system").returns(256);
-  EXPECT_EQ(logged(2, [] { process_system_cmd_mt("cmd", 1, 2); }).back(),
+  EXPECT_EQ(logged(2, [] { (void)process_system_cmd_mt("cmd", 1, 2); }).back(),
             "src.cpp:process_system_cmd_mt: !!!ret=256, WIFEXITED=1, WEXITSTATUS=1");
 }
 
 TEST_F(Retries, WithoutAWaitAboveOneComeAtOnce) {
   fakes::on("system").returns(256);
   for (int wait : {1, 0, -5}) {
-    EXPECT_EQ(logged(0, [&] { process_system_cmd_mt("cmd", 3, wait); }).size(), 3U);
+    EXPECT_EQ(logged(0, [&] { (void)process_system_cmd_mt("cmd", 3, wait); }).size(), 3U);
   }
   EXPECT_EQ(fakes::calls({"usleep"}), Texts{});
 }
