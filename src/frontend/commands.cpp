@@ -1,8 +1,14 @@
 #include "frontend/commands.h"
 
+#include <getopt.h>
+
+#include <cstdio>
+#include <iterator>
+
 #include "frontend/request.h"
 #include "iscsi/address.h"
 #include "iscsi/discovery.h"
+#include "support/program.h"
 #include "tasks/add.h"
 #include "tasks/connect.h"
 #include "tasks/format.h"
@@ -64,7 +70,7 @@ int reopen() {
 
 // The failure texts of oiscsi_evt_recover and modify_address are those of other commands: scripts look for
 // them.
-const Command kCommands[kCommandCount] = {
+const Command kCommands[] = {
     {"init", run<task_init>, kNone, "task_init() failed", false, false, nullptr},
     {"search", search, kPortal, "task_search() failed", false, false, nullptr},
     {"add", run<task_add>, kOneLun | kPortal | kOptShare, "task_add() failed", true, false, nullptr},
@@ -87,5 +93,40 @@ const Command kCommands[kCommandCount] = {
      false, nullptr},
     {"help", nullptr, kNone, "", false, false, nullptr},
 };
+
+const int kCommandCount = static_cast<int>(std::size(kCommands));
+
+const option* long_options() {
+  static option options[std::size(kCommands) + 1] = {};
+  for (size_t i = 0; i < std::size(kCommands); i++) {
+    options[i].name = kCommands[i].name;
+    options[i].val = kCommands[i].run == nullptr ? 'h' : 0;
+  }
+  return options;
+}
+
+// --add works without -c, though the text lists it: user interfaces show this text as it stands.
+void print_usage() {
+  printf(
+      "use: %s [\n"
+      "\t--init\n"
+      "\t--search -i IP -p port\n"
+      "\t--search_lun -n TARGET_NAME -i IP -p port -c CHAP [-U usename -P pwd]\n"
+      "\t--add -n TARGET_NAME -l Lun -i IP -p port -s shared -c CHAP [-U usename -P pwd]\n"
+      "\t--del -n TARGET_NAME\n"
+      "\t--del_lun -n TARGET_NAME -l LUN\n"
+      "\t--format -n TARGET_NAME -l LUN\n"
+      "\t--modify -n TARGET_NAME -c CHAP [-U usename -P pwd]\n"
+      "\t--modify_address -n TARGET_NAME -i IP -p port\n"
+      "\t--status\n"
+      "\t--check_share_name -s shared\n"
+      "\t--disconnect [-n TARGET_NAME]\n"
+      "\t--connect -n TARGET_NAME\n"
+      "\t--system_off (for system shutdown use only)\n"
+      "\t--deinit\n"
+      "\t--verupgrade\n"
+      "\r\n",
+      program_path);
+}
 
 }  // namespace remvol

@@ -1,6 +1,8 @@
-// The command table: one row for each long option, in the order of its index.
+// The command table: one row for each long option, in the order of its index; and the text that lists them.
 #ifndef REMVOL_FRONTEND_COMMANDS_H
 #define REMVOL_FRONTEND_COMMANDS_H
+
+struct option;  // getopt_long(3)
 
 namespace remvol {
 
@@ -18,10 +20,14 @@ struct Command {
   bool ends_tree = false;   // the tree's daemon is gone behind it
 };
 
-constexpr int kCommandCount = 19;
-constexpr int kHelpCommand = 18;
+extern const Command kCommands[];
+extern const int kCommandCount;
 
-extern const Command kCommands[kCommandCount];
+// Returns the rows as getopt_long(3) takes them. Help, which has no handler, stands for the letter h.
+[[nodiscard]] const option* long_options();
+
+// Prints how to call the tool.
+void print_usage();
 
 }  // namespace remvol
 

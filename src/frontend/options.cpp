@@ -12,7 +12,6 @@
 #include "frontend/commands.h"
 #include "frontend/log.h"
 #include "frontend/request.h"
-#include "support/program.h"
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
@@ -27,16 +26,6 @@ constexpr size_t kAddressSize = sizeof(TargetEntry::ip);
 
 constexpr char kSecretOption = 'P';
 constexpr char kShortOptions[] = "i:p:n:s:vc:U:P:d:l:ho:w:";
-
-// The long options are the rows of the command table.
-const option* long_options() {
-  static option options[kCommandCount + 1] = {};
-  for (int i = 0; i < kCommandCount; i++) {
-    options[i].name = kCommands[i].name;
-    options[i].val = i == kHelpCommand ? 'h' : 0;
-  }
-  return options;
-}
 
 ParseEnd choose_command(int index) {
   if (command_row >= 0) {
@@ -236,30 +225,6 @@ int _resovle_net_address_to_ip(char* address, int* family, const char* host) {
   if (*family == AF_INET6) return format_ipv6(address, reinterpret_cast<const sockaddr_in6&>(socket));
   LOG(1, "get ip address failed\n");
   return kFailed;
-}
-
-// --add works without -c, though the text lists it: user interfaces show this text as it stands.
-void print_usage() {
-  printf(
-      "use: %s [\n"
-      "\t--init\n"
-      "\t--search -i IP -p port\n"
-      "\t--search_lun -n TARGET_NAME -i IP -p port -c CHAP [-U usename -P pwd]\n"
-      "\t--add -n TARGET_NAME -l Lun -i IP -p port -s shared -c CHAP [-U usename -P pwd]\n"
-      "\t--del -n TARGET_NAME\n"
-      "\t--del_lun -n TARGET_NAME -l LUN\n"
-      "\t--format -n TARGET_NAME -l LUN\n"
-      "\t--modify -n TARGET_NAME -c CHAP [-U usename -P pwd]\n"
-      "\t--modify_address -n TARGET_NAME -i IP -p port\n"
-      "\t--status\n"
-      "\t--check_share_name -s shared\n"
-      "\t--disconnect [-n TARGET_NAME]\n"
-      "\t--connect -n TARGET_NAME\n"
-      "\t--system_off (for system shutdown use only)\n"
-      "\t--deinit\n"
-      "\t--verupgrade\n"
-      "\r\n",
-      program_path);
 }
 
 }  // namespace remvol

@@ -29,9 +29,6 @@ int check_name(const char* name);
 // `address`, which holds at least 48 bytes, and its family in `family`. Returns 0 or -1.
 int _resovle_net_address_to_ip(char* address, int* family, const char* host);
 
-// Prints how to call the tool.
-void print_usage();
-
 }  // namespace remvol
 
 #endif
