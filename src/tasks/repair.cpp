@@ -1,17 +1,14 @@
 #include "tasks/repair.h"
 
-#include <algorithm>
-#include <cstring>
-#include <iterator>
-
 #include "frontend/log.h"
 #include "support/target_hold.h"
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
-#include "tree_layout.h"
 #include "tree/slots.h"
 #include "tree/state.h"
+#include "tree/status_text.h"
+#include "tree_layout.h"
 #include "volume/e2fsprogs.h"
 #include "volume/process_check.h"
 
@@ -23,22 +20,19 @@ bool is_format_under_way(int state) {
   return state == kFormatting || state == kFormatWaiting;
 }
 
-bool tells_of_work(const char* text_key) {
-  constexpr const char* kWork[] = {"Connecting", "Formatting", "Wait to Format", "Creating Volume"};
-  char text[64];
-  if (!tree_read(text_key, text)) return false;
-  return std::any_of(std::begin(kWork), std::end(kWork),
-                     [&text](const char* work) { return strncmp(text, work, strlen(work)) == 0; });
+bool shows_work(const char* text_key) {
+  StatusText text;
+  return tree_read(text_key, text.data(), StatusText::size()) && tells_of_work(text);
 }
 
-bool any_text_tells_of_work(int dbidx) {
+bool any_text_shows_work(int dbidx) {
   const LogScope scope;
   const HeldSlot slot(dbidx);
   if (!slot) return false;
   const int n = slot.target();
-  if (tells_of_work(KeyText(key::kTargetStatus, n))) return true;
+  if (shows_work(KeyText(key::kTargetStatus, n))) return true;
   for (int m = 1; m <= kMaxLunsPerTarget && is_lun_stored(n, m); m++) {
-    if (tells_of_work(KeyText(key::kLunStatus, n, m))) return true;
+    if (shows_work(KeyText(key::kLunStatus, n, m))) return true;
   }
   return false;
 }
@@ -46,7 +40,7 @@ bool any_text_tells_of_work(int dbidx) {
 }  // namespace
 
 bool shows_ended_work(const TargetEntry* target) {
-  return any_text_tells_of_work(target->db_idx) && IdleTarget(target->target_name);
+  return any_text_shows_work(target->db_idx) && IdleTarget(target->target_name);
 }
 
 int repair_target_state(const TargetEntry* target) {

@@ -37,6 +37,9 @@ inline constexpr char kLunOffline[] = "Offline";
 [[nodiscard]] StatusText unmounted_text(const LunState& state, int progress);
 [[nodiscard]] StatusText unformatted_text(const LunState& state, int progress);
 
+// Returns whether the status text of a target or a LUN tells of work that goes on.
+[[nodiscard]] bool tells_of_work(const char* text);
+
 }  // namespace remvol
 
 #endif
