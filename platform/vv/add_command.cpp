@@ -74,11 +74,13 @@ bool fits_what_is_stored(Job& job, const Portal& portal, const std::string& targ
                                   platform::printable(row->volume->share) + " already");
   }
   if (volumes_in(job.before) >= remvol::kMaxLuns) {
-    return job.refuse(kUsage, "8 volumes are configured, which is the most");
+    return job.refuse(kUsage,
+                      std::to_string(remvol::kMaxLuns) + " volumes are configured, which is the most");
   }
   const Target* stored = job.before.target(target);
   if (stored == nullptr && job.before.targets().size() >= remvol::kMaxTargets) {
-    return job.refuse(kUsage, "8 targets are configured, which is the most");
+    return job.refuse(kUsage,
+                      std::to_string(remvol::kMaxTargets) + " targets are configured, which is the most");
   }
   if (stored == nullptr) return true;
   const Portal there = stored_portal(stored->address, stored->port);

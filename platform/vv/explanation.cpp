@@ -12,6 +12,8 @@ using vvstat::Row;
 
 constexpr size_t kMostLines = 4;
 
+static_assert(remvol::kMaxLuns == 8, "a reason below names the number");
+
 // What is heard of a failure, and what it means. The first that is found counts.
 constexpr struct {
   const char* heard;

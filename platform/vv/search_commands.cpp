@@ -52,8 +52,9 @@ bool find_portal(Job& job, const std::string& target_name, Portal& portal) {
     return read_portal(job.options.portal, portal, why) || job.refuse(kUsage, platform::printable(why));
   }
   const vvstat::Target* target = job.before.target(target_name);
-  if (target == nullptr)
+  if (target == nullptr) {
     return job.refuse(kUsage, "no share or target of this name is configured here; a target needs --portal");
+  }
   portal = stored_portal(target->address, target->port);
   return true;
 }
