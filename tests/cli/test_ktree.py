@@ -253,20 +253,36 @@ def test_the_service_manager_is_told_when_it_answers(place):
         assert place.answers()
 
 
-@pytest.mark.parametrize("others", ["a folder that others lock", "a lock file that others may open", "a link", "a pipe"])
-def test_what_others_lock_does_not_keep_it_from_starting(place, others):
-    lock = place.folder / "sock.lock"
-    held = place.folder
-    if others == "a lock file that others may open":
-        lock.touch(0o644)
-        held = lock
-    elif others == "a link":
-        held = place.folder / "precious"
-        held.touch(0o600)
-        lock.symlink_to(held)
-    elif others == "a pipe":
-        os.mkfifo(lock)
-    holder = os.open(held, os.O_RDONLY)
+def lock_file_for_others(folder):
+    lock = folder / "sock.lock"
+    lock.touch(0o644)
+    return lock
+
+
+def link_in_place_of_the_lock_file(folder):
+    precious = folder / "precious"
+    precious.touch(0o600)
+    (folder / "sock.lock").symlink_to(precious)
+    return precious
+
+
+def pipe_in_place_of_the_lock_file(folder):
+    os.mkfifo(folder / "sock.lock")
+    return folder
+
+
+# Each makes in the socket's folder what others can lock, and returns it.
+OTHERS = {
+    "a folder that others lock": lambda folder: folder,
+    "a lock file that others may open": lock_file_for_others,
+    "a link": link_in_place_of_the_lock_file,
+    "a pipe": pipe_in_place_of_the_lock_file,
+}
+
+
+@pytest.mark.parametrize("make", OTHERS.values(), ids=OTHERS)
+def test_what_others_lock_does_not_keep_it_from_starting(place, make):
+    holder = os.open(make(place.folder), os.O_RDONLY)
     fcntl.flock(holder, fcntl.LOCK_EX)
     begun = time.monotonic()
     place.start()

@@ -732,15 +732,20 @@ def test_an_empty_disk_may_be_formatted(machine):
     assert machine.box.runs("mke2fs")
 
 
-@pytest.mark.parametrize("subject, what", [("/dev/sdb", "LVM2_member on sdb"), ("/dev/sdb1", "ext4 on sdb1, xfs on sdb2")])
-def test_whatever_is_on_the_disk_counts(machine, subject, what):
+# What the platform says of the disk, and what the refusal makes of it.
+DATA = {
+    "on the disk": ([("sys_get_partition_list", "/dev/sdb", {"ret": 0}),
+                     ("sys_get_fs_type", "/dev/sdb", {"ret": 0, "out": "LVM2_member"})], "LVM2_member on sdb"),
+    "in two partitions": ([("sys_get_partition_list", "/dev/sdb", {"ret": 2, "out": "sdb1,sdb2"}),
+                           ("sys_get_fs_type", "/dev/sdb2", {"ret": 0, "out": "xfs"})], "ext4 on sdb1, xfs on sdb2"),
+}
+
+
+@pytest.mark.parametrize("answers, what", DATA.values(), ids=DATA)
+def test_whatever_is_on_the_disk_counts(machine, answers, what):
     connected(machine)
-    if subject == "/dev/sdb":
-        machine.box.hook("sys_get_partition_list", "/dev/sdb", ret=0, first=True)
-        machine.box.hook("sys_get_fs_type", "/dev/sdb", ret=0, out="LVM2_member", first=True)
-    else:
-        machine.box.hook("sys_get_partition_list", "/dev/sdb", ret=2, out="sdb1,sdb2", first=True)
-        machine.box.hook("sys_get_fs_type", "/dev/sdb2", ret=0, out="xfs", first=True)
+    for function, subject, answer in answers:
+        machine.box.hook(function, subject, first=True, **answer)
     done = machine.vv("format", "Photos", "--yes")
     assert done.status == 4 and f"carries data: {what}, " in done.stderr
 
