@@ -67,7 +67,7 @@ void lift_cover(const char* path) {
 void lift_left_cover(const char* path) {
   struct stat top;
   MountLine mount;
-  if (stat(path, &top) != 0 || find_mount_of(top.st_dev, path, &mount) != Mounted::yes) return;
+  if (stat(path, &top) != 0 || find_mount_of(top.st_dev, path, &mount) != Mounted::kYes) return;
   if (strcmp(mount.source, kSource) == 0) lift_cover(path);
 }
 

@@ -126,7 +126,7 @@ bool is_foreign_mount(const TargetEntry* entry, const char* path) {
   char real[PATH_MAX];
   const Place place = {entry, realpath(path, real) != nullptr ? real : path};
   MountLine mount;
-  if (find_mount(is_others_mount, &place, &mount) != Mounted::yes) return false;
+  if (find_mount(is_others_mount, &place, &mount) != Mounted::kYes) return false;
   log_foreign(entry, mount.source);
   return true;
 }

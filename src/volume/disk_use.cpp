@@ -82,7 +82,7 @@ ContentMark content_mark(const char* node) {
 bool is_node_mounted(const char* node) {
   struct stat status;
   MountLine mount;
-  return is_block_device(node, &status) && find_mount_of(status.st_rdev, nullptr, &mount) == Mounted::yes;
+  return is_block_device(node, &status) && find_mount_of(status.st_rdev, nullptr, &mount) == Mounted::kYes;
 }
 
 bool is_node_claimed(const char* node) {

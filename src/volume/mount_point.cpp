@@ -96,7 +96,7 @@ bool is_mounted_from(const char* node, const char* path, MountLine* mount) {
   char real[PATH_MAX];
   if (stat(node, &device) != 0 || !S_ISBLK(device.st_mode)) return false;
   if (stat(path, &folder) != 0 || folder.st_dev != device.st_rdev) return false;
-  return realpath(path, real) != nullptr && find_mount_of(device.st_rdev, real, mount) == Mounted::yes;
+  return realpath(path, real) != nullptr && find_mount_of(device.st_rdev, real, mount) == Mounted::kYes;
 }
 
 void detach_mounts(const char* path) {
@@ -111,11 +111,11 @@ bool is_removal_unsafe(const char* path) {
   const char* name = realpath(path, real) != nullptr ? real : path;
   MountLine mount;
   const Mounted mounted = find_mount_below(name, &mount);
-  if (mounted == Mounted::yes) {
+  if (mounted == Mounted::kYes) {
     LOG(0, "%s is not removed, %s is mounted on %s", path, mount.source, mount.path);
     return true;
   }
-  if (mounted == Mounted::unknown && sys_mount_point(path) != 0) {
+  if (mounted == Mounted::kUnknown && sys_mount_point(path) != 0) {
     LOG(0, "%s is not removed, it is a mount point", path);
     return true;
   }

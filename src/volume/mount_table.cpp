@@ -65,15 +65,15 @@ bool parse_line(char* line, MountLine* mount) {
 template <typename Fits>
 Mounted search_table(Fits fits, MountLine* mount) {
   const File table(fopen(kMountInfo, "re"));
-  if (!table) return Mounted::unknown;
+  if (!table) return Mounted::kUnknown;
   char* buffer = nullptr;
   size_t size = 0;
-  Mounted found = Mounted::no;
-  while (found == Mounted::no && getline(&buffer, &size, table.get()) > 0) {
-    if (parse_line(buffer, mount) && fits(*mount)) found = Mounted::yes;
+  Mounted found = Mounted::kNo;
+  while (found == Mounted::kNo && getline(&buffer, &size, table.get()) > 0) {
+    if (parse_line(buffer, mount) && fits(*mount)) found = Mounted::kYes;
   }
   const Memory<char> owner(buffer);
-  return found == Mounted::no && ferror(table.get()) != 0 ? Mounted::unknown : found;
+  return found == Mounted::kNo && ferror(table.get()) != 0 ? Mounted::kUnknown : found;
 }
 
 // The table may miss lines while another process unmounts (until kernel 5.8): "not mounted" counts only when
@@ -81,7 +81,7 @@ Mounted search_table(Fits fits, MountLine* mount) {
 template <typename Fits>
 Mounted find(Fits fits, MountLine* mount) {
   const Mounted found = search_table(fits, mount);
-  return found == Mounted::no ? search_table(fits, mount) : found;
+  return found == Mounted::kNo ? search_table(fits, mount) : found;
 }
 
 bool is_at_or_below(const char* path, const char* root) {
@@ -105,7 +105,7 @@ bool has_lost_disk(const char* path) {
   const auto is_at = [](const MountLine& line, const void* where) {
     return strcmp(line.path, static_cast<const char*>(where)) == 0;
   };
-  if (find_mount(is_at, path, &mount) != Mounted::yes || major(mount.device) == 0) return false;
+  if (find_mount(is_at, path, &mount) != Mounted::kYes || major(mount.device) == 0) return false;
   const Text<64> disk("/sys/dev/block/%u:%u", major(mount.device), minor(mount.device));
   return access("/sys/dev/block", F_OK) == 0 && access(disk, F_OK) != 0;
 }

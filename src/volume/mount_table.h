@@ -20,7 +20,7 @@ struct MountLine {
   char source[PATH_MAX];
 };
 
-enum class Mounted { no, yes, unknown };  // unknown: the table cannot be read
+enum class Mounted { kNo, kYes, kUnknown };  // kUnknown: the table cannot be read
 
 // Looks for a mount on `path`, which is absolute and without links, or below it, and puts the first into
 // `mount`.

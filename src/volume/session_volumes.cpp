@@ -25,7 +25,7 @@ bool is_session_volume(const MountLine& mount, const void* target_name) {
 }
 
 bool find_session_volume(const char* target_name, MountLine* mount) {
-  return find_mount(is_session_volume, target_name, mount) == Mounted::yes;
+  return find_mount(is_session_volume, target_name, mount) == Mounted::kYes;
 }
 
 // Returns whether none is left.

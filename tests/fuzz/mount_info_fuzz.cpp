@@ -26,13 +26,13 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static MountLine mount;
   const std::string root = "/mnt/VV/a";
   const Mounted below = find_mount_below(root.c_str(), &mount);
-  require((below == Mounted::unknown) == (size == 0));
-  if (below == Mounted::yes) {
+  require((below == Mounted::kUnknown) == (size == 0));
+  if (below == Mounted::kYes) {
     check(mount);
     const std::string path = mount.path;
     require(path == root || path.compare(0, root.size() + 1, root + "/") == 0);
     const dev_t device = mount.device;
-    require(find_mount_of(device, path.c_str(), &mount) == Mounted::yes);
+    require(find_mount_of(device, path.c_str(), &mount) == Mounted::kYes);
     require(mount.device == device && path == mount.path);
   }
   if (size == 0) return 0;

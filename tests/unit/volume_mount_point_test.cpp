@@ -210,15 +210,15 @@ bool fails(const void*) {
 TEST_F(MountedPath, WhileAFolderIsChangedOthersFindACover) {
   EXPECT_TRUE(run_covered(path.c_str(), others_cannot_write, path.c_str()));
   MountLine cover;
-  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::yes) << "the caller's to lift";
+  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::kYes) << "the caller's to lift";
   lift_cover(path.c_str());
-  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::no);
+  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::kNo);
 }
 
 TEST_F(MountedPath, ACoverGoesWhenTheWorkFails) {
   EXPECT_FALSE(run_covered(path.c_str(), fails, nullptr));
   MountLine cover;
-  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::no);
+  EXPECT_EQ(find_mount_below(path.c_str(), &cover), Mounted::kNo);
   EXPECT_FALSE(run_covered("/mnt/VV/none", others_cannot_write, path.c_str())) << "nothing to cover";
 }
 
@@ -229,11 +229,11 @@ TEST_F(MountedPath, NothingIsLeftOfTheMakingAndTheRemoval) {
   EXPECT_TRUE(is_immutable(path));
   EXPECT_FALSE(std::filesystem::exists("/mnt/VV/.new-Data"));
   MountLine cover;
-  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::no);
+  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::kNo);
   std::filesystem::create_directory("/mnt/VV/.new-Data");
   drop_bare_folder(path.c_str());
   EXPECT_TRUE(std::filesystem::is_empty("/mnt/VV"));
-  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::no);
+  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::kNo);
 }
 
 TEST_F(MountedPath, TheFirstFolderOfAMachineIsBareAsWell) {
@@ -254,7 +254,7 @@ TEST_F(MountedPath, ACoverThatAKilledRunLeftIsTakenOff) {
   EXPECT_TRUE(is_immutable("/mnt/VV/Other"));
   EXPECT_FALSE(std::filesystem::exists(draft));
   MountLine cover;
-  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::no);
+  EXPECT_EQ(find_mount_below("/mnt/VV", &cover), Mounted::kNo);
 }
 
 TEST_F(MountedPath, AVolumeIsNoCoverEvenOnTopOfOne) {
