@@ -3,7 +3,11 @@
 # says so, people are told, and the command that vvstat shows heals it.
 T=$IQN:t1
 takes_writes() { mounted a && dd if=/dev/zero of=/mnt/VV/a/probe bs=4k count=1 conv=fsync 2>/dev/null; }
-as_vvstat_says() { eval "$(vvstat | grep '^    remvol ')"; }
+as_vvstat_says() {
+    local command
+    command=$(vvstat | grep '^    vv ') || fail "vvstat says nothing to type"
+    expect "what vvstat says" eval "$command"
+}
 last_event() { remvol-notify 2>&1 | tail -n 1; }
 
 target_start

@@ -9,6 +9,9 @@
 #include <filesystem>
 #include <fstream>
 #include <functional>
+#include <iterator>
+#include <regex>
+#include <string>
 
 #include "support/run_lock.h"
 #include "support/session_hold.h"
@@ -142,6 +145,19 @@ TEST_F(RunLocks, AnIdleLunBesideABusyOne) {
   EXPECT_TRUE(IdleTarget("iqn.t1", 2));
 }
 
+// Returns whether the process comes to wait for a lock: the kernel lists who waits behind "->",
+// proc_locks(5).
+bool comes_to_wait(pid_t process) {
+  const std::regex waits("-> FLOCK +ADVISORY +\\w+ +" + std::to_string(process) + " ");
+  for (int looks = 0; looks < 1000; looks++) {
+    std::ifstream locks("/proc/locks");
+    const std::string listed((std::istreambuf_iterator<char>(locks)), {});
+    if (std::regex_search(listed, waits)) return true;
+    poll(nullptr, 0, 10);
+  }
+  return false;
+}
+
 TEST_F(RunLocks, AWaitingRunGoesOnWhenTheHolderIsKilled) {
   start_run([] {
     const TargetHold hold("iqn.t1");
@@ -152,7 +168,7 @@ TEST_F(RunLocks, AWaitingRunGoesOnWhenTheHolderIsKilled) {
     const TargetHold hold("iqn.t1");
     _exit(hold.waited() ? 0 : 1);
   }
-  poll(nullptr, 0, 100);
+  EXPECT_TRUE(comes_to_wait(waiter));
   int status = -1;
   EXPECT_EQ(waitpid(waiter, &status, WNOHANG), 0);
   end_run();
