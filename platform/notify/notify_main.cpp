@@ -11,7 +11,7 @@
 
 #include "common/file_text.h"
 #include "common/report.h"
-#include "common/tree_reader.h"
+#include "common/tree_listing.h"
 #include "common/utf8.h"
 #include "notify/delivery.h"
 #include "notify/history.h"
@@ -82,7 +82,7 @@ int tell(const std::vector<Event>& events) {
 }
 
 int look_and_tell() {
-  const vvstat::Status status = vvstat::read_status(platform::TreeReader());
+  const vvstat::Status status = vvstat::read_status(platform::TreeListing());
   if (!status.reachable) {
     platform::report(LOG_WARNING, "remvol-notify: the configuration tree cannot be reached");
     return kUnreachable;
@@ -98,7 +98,7 @@ int tell_of_failed_recovery(const char* target) {
   const std::string name = platform::printable(target);
   const std::string end = " failed and is not tried again; run: ";
   std::vector<Event> events;
-  for (const vvstat::Target& each : vvstat::read_status(platform::TreeReader()).targets) {
+  for (const vvstat::Target& each : vvstat::read_status(platform::TreeListing()).targets) {
     if (each.name != target) continue;
     for (const vvstat::Volume& volume : each.volumes) {
       const std::string share = platform::printable(volume.share);

@@ -67,7 +67,7 @@ size_t width_of_terminal() {
 }
 
 Target find(const std::string& name) {
-  for (const Target& target : vvstat::read_status(platform::TreeReader()).targets) {
+  for (const Target& target : vvstat::read_status(platform::TreeListing()).targets) {
     if (target.name == name) return target;
   }
   return {};

@@ -25,9 +25,9 @@ const Row* find_row(const std::vector<Row>& rows, Is is) {
 
 }  // namespace
 
-Look::Look() : Look(platform::TreeReader()) {}
+Look::Look() : Look(platform::TreeListing()) {}
 
-Look::Look(const platform::TreeReader& tree)
+Look::Look(const platform::TreeListing& tree)
     : status_(vvstat::read_status(tree)), rows_(vvstat::assess(status_, vvstat::read_facts(status_))) {}
 
 const Row* Look::share(const std::string& name) const {

@@ -15,7 +15,7 @@ namespace vv {
 class Look {
  public:
   Look();
-  explicit Look(const platform::TreeReader& tree);
+  explicit Look(const platform::TreeListing& tree);
   Look(const Look&) = delete;
   Look& operator=(const Look&) = delete;
 

@@ -1,53 +1,129 @@
 #include "vvstat/status.h"
 
 #include <algorithm>
+#include <charconv>
+#include <cstdlib>
+#include <string_view>
 
 #include "tree_layout.h"
 
 namespace vvstat {
 namespace {
 
-using platform::TreeReader;
 namespace key = remvol::key;
 
-Volume read_volume(const TreeReader& tree, int target, int lun) {
-  Volume volume{};
-  volume.lun = tree.number(-1, key::kLunNumber, target, lun);
-  volume.share = tree.value(key::kLunShare, target, lun);
-  volume.status = tree.value(key::kLunStatus, target, lun);
-  volume.enabled = tree.number(0, key::kLunEnable, target, lun) != 0;
-  volume.read_only = tree.number(remvol::VOL_AC_RW, key::kLunAccessRight, target, lun) == remvol::VOL_AC_RO;
-  volume.format_state = tree.number(-1, key::kLunFormatState, target, lun);
-  volume.progress = std::clamp(tree.number(0, key::kLunFormatProgress, target, lun), 0, 100);
-  volume.volume_state = tree.number(-1, key::kLunVolumeState, target, lun);
-  volume.file_system = tree.value(key::kLunFsType, target, lun);
-  volume.device = tree.value(key::kLunDev, target, lun);
-  volume.mount_point = tree.value(key::kLunMnt, target, lun);
-  return volume;
+int number(std::string_view value, int fallback) {
+  return value.empty() ? fallback : atoi(std::string(value).c_str());
 }
 
-Target read_target(const TreeReader& tree, int index) {
-  Target target{};
-  target.name = tree.value(key::kTargetName, index);
-  target.address = tree.value(key::kTargetIp, index);
-  target.port = tree.number(0, key::kTargetPort, index);
-  target.wanted = tree.number(0, key::kTargetConnSet, index) != 0;
-  target.connect_state = tree.number(-1, key::kTargetConnState, index);
-  target.status = tree.value(key::kTargetStatus, index);
-  for (int lun = 1; lun <= remvol::kMaxLunsPerTarget; lun++) {
-    if (tree.value(key::kLunNumber, index, lun).empty()) break;
-    target.volumes.push_back(read_volume(tree, index, lun));
+constexpr std::string_view last_element(std::string_view key) {
+  return key.substr(key.rfind('/') + 1);
+}
+
+// What stands in a key before the number of a slot.
+constexpr std::string_view before_number(std::string_view key) {
+  return key.substr(0, key.rfind("%d"));
+}
+
+constexpr std::string_view kTargetSlot = before_number(key::kTarget);
+constexpr std::string_view kLunSlot =
+    before_number(std::string_view(key::kLun).substr(std::string_view(key::kTarget).size()));
+
+// Where a value of a slot goes.
+template <typename Record>
+struct Field {
+  std::string_view name;
+  void (*take)(Record& record, std::string_view value);
+};
+
+constexpr Field<Target> kTargetFields[] = {
+    {last_element(key::kTargetName), [](Target& target, std::string_view value) { target.name = value; }},
+    {last_element(key::kTargetIp), [](Target& target, std::string_view value) { target.address = value; }},
+    {last_element(key::kTargetPort),
+     [](Target& target, std::string_view value) { target.port = number(value, 0); }},
+    {last_element(key::kTargetConnSet),
+     [](Target& target, std::string_view value) { target.wanted = number(value, 0) != 0; }},
+    {last_element(key::kTargetConnState),
+     [](Target& target, std::string_view value) { target.connect_state = number(value, -1); }},
+    {last_element(key::kTargetStatus), [](Target& target, std::string_view value) { target.status = value; }},
+};
+
+constexpr Field<Volume> kVolumeFields[] = {
+    {last_element(key::kLunNumber),
+     [](Volume& volume, std::string_view value) { volume.lun = number(value, -1); }},
+    {last_element(key::kLunShare), [](Volume& volume, std::string_view value) { volume.share = value; }},
+    {last_element(key::kLunStatus), [](Volume& volume, std::string_view value) { volume.status = value; }},
+    {last_element(key::kLunEnable),
+     [](Volume& volume, std::string_view value) { volume.enabled = number(value, 0) != 0; }},
+    {last_element(key::kLunAccessRight),
+     [](Volume& volume, std::string_view value) {
+       volume.read_only = number(value, remvol::VOL_AC_RW) == remvol::VOL_AC_RO;
+     }},
+    {last_element(key::kLunFormatState),
+     [](Volume& volume, std::string_view value) { volume.format_state = number(value, -1); }},
+    {last_element(key::kLunFormatProgress),
+     [](Volume& volume, std::string_view value) { volume.progress = std::clamp(number(value, 0), 0, 100); }},
+    {last_element(key::kLunVolumeState),
+     [](Volume& volume, std::string_view value) { volume.volume_state = number(value, -1); }},
+    {last_element(key::kLunFsType),
+     [](Volume& volume, std::string_view value) { volume.file_system = value; }},
+    {last_element(key::kLunDev), [](Volume& volume, std::string_view value) { volume.device = value; }},
+    {last_element(key::kLunMnt), [](Volume& volume, std::string_view value) { volume.mount_point = value; }},
+};
+
+template <typename Record, size_t kCount>
+void take_field(const Field<Record> (&fields)[kCount], Record& record, std::string_view name,
+                std::string_view value) {
+  for (const Field<Record>& field : fields) {
+    if (field.name == name) return field.take(record, value);
   }
-  return target;
+}
+
+// Takes `before` and a number from 1 to `most` off the front of a path, and the slash behind them. Returns 0,
+// and leaves the path as it is, when they are not there.
+size_t take_slot(std::string_view& path, std::string_view before, size_t most) {
+  if (!path.starts_with(before)) return 0;
+  const char* const first = path.data() + before.size();
+  const char* const end = path.data() + path.size();
+  size_t slot = 0;
+  const char* const behind = std::from_chars(first, end, slot).ptr;
+  if (slot == 0 || slot > most || behind == end || *behind != '/') return 0;
+  path.remove_prefix(static_cast<size_t>(behind - path.data()));
+  return slot;
+}
+
+template <typename Record>
+Record& record_of(std::vector<Record>& records, size_t slot, size_t most) {
+  records.reserve(most);
+  if (records.size() < slot) records.resize(slot);
+  return records[slot - 1];
+}
+
+void take_value(std::vector<Target>& targets, std::string_view path, std::string_view value) {
+  const size_t slot = take_slot(path, kTargetSlot, remvol::kMaxTargets);
+  if (slot == 0) return;
+  Target& target = record_of(targets, slot, remvol::kMaxTargets);
+  const size_t lun = take_slot(path, kLunSlot, remvol::kMaxLunsPerTarget);
+  if (lun == 0) return take_field(kTargetFields, target, path.substr(1), value);
+  Volume& volume = record_of(target.volumes, lun, remvol::kMaxLunsPerTarget);
+  take_field(kVolumeFields, volume, path.substr(1), value);
+}
+
+// Slots are used from the first one on; what stands behind a free one is left over from something.
+template <typename Record, typename IsFree>
+void end_at_free(std::vector<Record>& records, IsFree is_free) {
+  records.erase(std::find_if(records.begin(), records.end(), is_free), records.end());
 }
 
 }  // namespace
 
-Status read_status(const TreeReader& tree) {
+Status read_status(const platform::TreeListing& tree) {
   Status status{tree.answered(), {}};
-  for (int index = 1; index <= remvol::kMaxTargets; index++) {
-    if (tree.value(key::kTargetName, index).empty()) break;
-    status.targets.push_back(read_target(tree, index));
+  tree.for_each(
+      [&status](std::string_view path, std::string_view value) { take_value(status.targets, path, value); });
+  end_at_free(status.targets, [](const Target& target) { return target.name.empty(); });
+  for (Target& target : status.targets) {
+    end_at_free(target.volumes, [](const Volume& volume) { return volume.lun == -1; });
   }
   return status;
 }

@@ -5,19 +5,19 @@
 #include <string>
 #include <vector>
 
-#include "common/tree_reader.h"
+#include "common/tree_listing.h"
 
 namespace vvstat {
 
 struct Volume {
-  int lun;
+  int lun = -1;
   std::string share;
   std::string status;  // the text of the tool
-  bool enabled;
-  bool read_only;
-  int format_state;  // a remvol::FormatState; -1: unknown
-  int progress;      // percent of the format
-  int volume_state;  // a remvol::VolumeState; -1: unknown
+  bool enabled = false;
+  bool read_only = false;
+  int format_state = -1;  // a remvol::FormatState; -1: unknown
+  int progress = 0;       // percent of the format
+  int volume_state = -1;  // a remvol::VolumeState; -1: unknown
   std::string file_system;
   std::string device;
   std::string mount_point;
@@ -26,9 +26,9 @@ struct Volume {
 struct Target {
   std::string name;
   std::string address;
-  int port;
-  bool wanted;        // it is to be connected at start-up
-  int connect_state;  // a remvol::ConnectState; -1: unknown
+  int port = 0;
+  bool wanted = false;     // it is to be connected at start-up
+  int connect_state = -1;  // a remvol::ConnectState; -1: unknown
   std::string status;
   std::vector<Volume> volumes;
 };
@@ -38,7 +38,7 @@ struct Status {
   std::vector<Target> targets;
 };
 
-Status read_status(const platform::TreeReader& tree);
+Status read_status(const platform::TreeListing& tree);
 
 }  // namespace vvstat
 

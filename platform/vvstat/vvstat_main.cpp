@@ -37,7 +37,7 @@ struct Snapshot {
 
 Snapshot look() {
   Snapshot look;
-  look.status = read_status(platform::TreeReader());
+  look.status = read_status(platform::TreeListing());
   look.rows = assess(look.status, read_facts(look.status));
   recall(read_history(), look.rows);
   return look;

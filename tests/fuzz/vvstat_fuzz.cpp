@@ -80,7 +80,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   for (const Mount& mount : mounts_of(listing)) {
     require(!mount.point.empty() && (mount.options.starts_with("rw") || mount.options.starts_with("ro")));
   }
-  const Status status = read_status(platform::TreeReader(listing));
+  const Status status = read_status(platform::TreeListing(listing));
   require(status.reachable && status.targets.size() <= 8);
   const std::vector<Row> rows = assess(status, facts_of(status, data[1]));
   // A table costs as much as all else together, and what is in it goes by the row: one in eight has one, of

@@ -242,9 +242,9 @@ TEST(Searches, LunsAreThoseOfTheTargetThatWasAskedFor) {
 
 TEST(Look, FindsByShareByTargetAndByLun) {
   const Look look(
-      platform::TreeReader("/iscsi/initiator/id:1/target=iqn.t\n/iscsi/initiator/id:1/lun/id:1/lun=1\n"
-                           "/iscsi/initiator/id:1/lun/id:1/share=A\n/iscsi/initiator/id:1/lun/id:2/lun=7\n"
-                           "/iscsi/initiator/id:1/lun/id:2/share=B\n/iscsi/initiator/id:2/target=iqn.u\n"));
+      platform::TreeListing("/iscsi/initiator/id:1/target=iqn.t\n/iscsi/initiator/id:1/lun/id:1/lun=1\n"
+                            "/iscsi/initiator/id:1/lun/id:1/share=A\n/iscsi/initiator/id:1/lun/id:2/lun=7\n"
+                            "/iscsi/initiator/id:1/lun/id:2/share=B\n/iscsi/initiator/id:2/target=iqn.u\n"));
   EXPECT_EQ(look.share("B")->volume->lun, 7);
   EXPECT_EQ(look.share("b"), nullptr);
   EXPECT_EQ(look.target("iqn.u")->name, "iqn.u");

@@ -4,8 +4,6 @@
 #include <cstdio>
 #include <cstring>
 
-#include "ktree/client/document.h"
-
 namespace ktree::client {
 namespace {
 
@@ -64,10 +62,14 @@ CallResult dump_to(const char* socket, int fd, Reason& reason) {
   return result == CallResult::kDone ? file_result(document.write_to(fd), reason) : result;
 }
 
-CallResult list_to(const char* socket, const char* path, int fd, Reason& reason) {
+CallResult list(const char* socket, const char* path, const MemoryFile& document, Reason& reason) {
   reason.text[0] = '\0';
+  return fetch(socket, Operation::kList, path, document, reason);
+}
+
+CallResult list_to(const char* socket, const char* path, int fd, Reason& reason) {
   const MemoryFile document;
-  const CallResult result = fetch(socket, Operation::kList, path, document, reason);
+  const CallResult result = list(socket, path, document, reason);
   return result == CallResult::kDone ? file_result(document.write_to(fd), reason) : result;
 }
 

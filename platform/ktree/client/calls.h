@@ -6,6 +6,7 @@
 #include <cstddef>
 
 #include "ktree/client/channel.h"
+#include "ktree/client/document.h"
 
 namespace ktree::client {
 
@@ -29,7 +30,11 @@ struct Reason {
 // Makes the tree what `file` holds.
 [[nodiscard]] CallResult load(const char* socket, const char* file, Reason& reason);
 
-// Writes the listing of the subtree at `path` ("/" is the whole tree) to `fd`.
+// Has the daemon write the listing of the subtree at `path` ("/" is the whole tree) into `document`.
+[[nodiscard]] CallResult list(const char* socket, const char* path, const MemoryFile& document,
+                              Reason& reason);
+
+// Writes that listing to `fd`.
 [[nodiscard]] CallResult list_to(const char* socket, const char* path, int fd, Reason& reason);
 
 }  // namespace ktree::client
