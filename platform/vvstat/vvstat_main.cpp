@@ -53,17 +53,18 @@ const char* why_unreachable() {
                         : "vvstat: only root may read the configuration tree\n";
 }
 
-std::vector<Row> chosen(const std::vector<Row>& rows, bool ailing_only) {
+std::vector<Row> ailing_among(const std::vector<Row>& rows) {
   std::vector<Row> some;
   for (const Row& row : rows) {
-    if (!ailing_only || !row.healthy()) some.push_back(row);
+    if (!row.healthy()) some.push_back(row);
   }
   return some;
 }
 
 Page page_of(const Snapshot& look, const Options& options) {
   if (!look.status.reachable) return {"", why_unreachable()};
-  const std::vector<Row> rows = chosen(look.rows, options.ailing_only);
+  const std::vector<Row> ailing = options.ailing_only ? ailing_among(look.rows) : std::vector<Row>();
+  const std::vector<Row>& rows = options.ailing_only ? ailing : look.rows;
   Page page;
   const Layout& layout = options.layout;
   if (!rows.empty() || layout.form == Form::kJson) page.table = volume_report(rows, layout);
@@ -74,6 +75,7 @@ Page page_of(const Snapshot& look, const Options& options) {
   return page;
 }
 
+// Each text goes out as a whole: the output has no buffer of its own, see run().
 void put(std::string_view text) {
   fwrite(text.data(), 1, text.size(), stdout);
 }
@@ -100,9 +102,8 @@ int show_once(const Options& options) {
     return kUnreachable;
   }
   const Page page = page_of(seen, options);
-  put(page.table);
-  if (!page.table.empty() && !page.verdict.empty()) put("\n");
-  put(page.verdict);
+  const char* between = page.table.empty() || page.verdict.empty() ? "" : "\n";
+  put(page.table + between + page.verdict);
   return finish(exit_status(seen));
 }
 
@@ -130,7 +131,7 @@ int show_one(const Options& options) {
     fprintf(stderr, "vvstat: there is no share and no target of this name\n");
     return kFailed;
   }
-  const std::vector<Row> shown = chosen(rows, options.ailing_only);
+  const std::vector<Row> shown = options.ailing_only ? ailing_among(rows) : rows;
   if (options.layout.form != Form::kTable) {
     put(volume_report(shown, options.layout));
   } else {
@@ -224,9 +225,7 @@ int take_option(int letter, Options& options) {
       options.metrics = true;
       return kGoOn;
     case 'h':
-      put(kHelp);
-      put(describe_columns());
-      put(kStatusHelp);
+      put(kHelp + describe_columns() + kStatusHelp);
       return finish(0);
     case 'V':
       put("vvstat " REMVOL_VERSION "\n");
@@ -262,6 +261,7 @@ bool wants_colour() {
 }
 
 int run(int argc, char** argv) {
+  setvbuf(stdout, nullptr, _IONBF, 0);
   Options options;
   const int status = take_arguments(argc, argv, options);
   if (status != kGoOn) return status;
