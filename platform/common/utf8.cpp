@@ -56,6 +56,11 @@ size_t cells_of(wchar_t character) {
   return width > 0 ? static_cast<size_t>(width) : 0;
 }
 
+// Most text is: what is to be known of it needs no locale, which has to be read from a file.
+bool is_printable_ascii(std::string_view text) {
+  return std::all_of(text.begin(), text.end(), [](char byte) { return byte >= 0x20 && byte < 0x7f; });
+}
+
 void append_escaped(std::string& text, std::string_view bytes) {
   for (const char byte : bytes) {
     char hex[8];
@@ -125,6 +130,7 @@ wchar_t lower_case(wchar_t character) {
 }
 
 size_t cells(std::string_view text) {
+  if (is_printable_ascii(text)) return text.size();
   std::wstring characters;
   if (!decode(text, characters)) return text.size();
   if (utf8_locale() == nullptr) return characters.size();
@@ -134,6 +140,8 @@ size_t cells(std::string_view text) {
 }
 
 size_t first_cells(std::string_view text, size_t most) {
+  // A mark may stand behind a character that is ASCII, not within such text.
+  if (is_printable_ascii(text.substr(0, most + 1))) return std::min(text.size(), most);
   std::wstring characters;
   if (!decode(text, characters)) return std::min(text.size(), most);
   size_t bytes = 0, sum = 0;
@@ -148,6 +156,7 @@ size_t first_cells(std::string_view text, size_t most) {
 }
 
 std::string printable(std::string_view text) {
+  if (is_printable_ascii(text)) return std::string(text);
   std::wstring characters;
   decode(text, characters);
   std::string shown;
@@ -160,6 +169,10 @@ std::string printable(std::string_view text) {
     text.remove_prefix(size == 0 ? 1 : size);
   }
   return shown;
+}
+
+bool is_ascii(std::string_view text) {
+  return std::none_of(text.begin(), text.end(), [](char byte) { return (byte & 0x80) != 0; });
 }
 
 std::string ascii(std::string_view text) {

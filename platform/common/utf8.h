@@ -36,6 +36,8 @@ size_t first_cells(std::string_view text, size_t most);
 // well when it is not UTF-8.
 std::string printable(std::string_view text);
 
+bool is_ascii(std::string_view text);
+
 // `text` with all that is not ASCII as \xHH.
 std::string ascii(std::string_view text);
 

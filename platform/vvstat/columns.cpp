@@ -138,15 +138,17 @@ constexpr Column kColumns[] = {
      [](const Row& row, const Layout&) { return row.otherwise; }},
 };
 
-// Whether the C library knows more than ASCII: see use_utf8().
+// Whether the C library knows more than ASCII. It is asked where there is more to show: a locale is read from
+// a file.
 bool has_utf8() {
-  return MB_CUR_MAX > 1;
+  static const bool known = (use_utf8(), MB_CUR_MAX > 1);
+  return known;
 }
 
 // The text as it may stand in a cell.
 std::string cell(const Column& column, const Row& row, const Layout& layout) {
   const std::string text = platform::printable(column.text(row, layout));
-  return has_utf8() ? text : platform::ascii(text);
+  return platform::is_ascii(text) || has_utf8() ? text : platform::ascii(text);
 }
 
 size_t find_column(std::string_view name) {
@@ -164,47 +166,74 @@ std::vector<size_t> first_columns(size_t count) {
   return columns;
 }
 
-// The cells that a column takes as it is. Share and status have theirs in any case: they are there again and
-// again.
-Wish wish_of(const std::vector<Row>& rows, size_t number, const Layout& layout) {
+// What a column shows of the rows.
+struct Content {
+  size_t column;
+  std::vector<std::string> cells;  // one of each row
+  size_t width;                    // of the widest one, and of the name
+};
+
+Content content_of(const std::vector<Row>& rows, size_t number, const Layout& layout) {
   const Column& column = kColumns[number];
-  size_t natural = std::string_view(column.name).size();
-  for (const Row& row : rows) natural = std::max(natural, platform::cells(cell(column, row, layout)));
-  if (number == kShare || number == kStatus) natural = std::max(natural, column.least);
-  return {column.least != 0 ? std::min(natural, column.least) : natural, natural};
+  Content content{number, {}, std::string_view(column.name).size()};
+  content.cells.reserve(rows.size());
+  for (const Row& row : rows) {
+    content.cells.push_back(cell(column, row, layout));
+    content.width = std::max(content.width, platform::cells(content.cells.back()));
+  }
+  return content;
 }
 
-size_t natural_width(const std::vector<Row>& rows, const std::vector<size_t>& columns, const Layout& layout) {
+// Share and status have their cells in any case: they are there again and again.
+bool is_steady(size_t column) {
+  return column == kShare || column == kStatus;
+}
+
+// The cells that a column takes as it is.
+Wish wish_of(const Content& content) {
+  const size_t least = kColumns[content.column].least;
+  const size_t natural = is_steady(content.column) ? std::max(content.width, least) : content.width;
+  return {least != 0 ? std::min(natural, least) : natural, natural};
+}
+
+size_t natural_width(const std::vector<Content>& contents) {
   size_t sum = 0;
-  for (const size_t column : columns) sum += wish_of(rows, column, layout).natural + 1;
+  for (const Content& content : contents) sum += wish_of(content).natural + 1;
   return sum == 0 ? 0 : sum - 1;
 }
 
-std::vector<size_t> columns_of(const std::vector<Row>& rows, const Layout& layout) {
+std::vector<size_t> columns_of(const Layout& layout) {
   if (!layout.columns.empty()) return layout.columns;
-  if (layout.form == Form::kJson) return first_columns(std::size(kColumns));
-  std::vector<size_t> columns = first_columns(kUsual);
-  if (layout.form == Form::kRaw) return columns;
-  columns.push_back(kTarget);
-  if (natural_width(rows, columns, layout) > layout.width) columns.pop_back();
-  return columns;
+  return first_columns(layout.form == Form::kJson ? std::size(kColumns) : kUsual);
+}
+
+// What the report is made of. The target is one of the usual columns of a table where there is room for it.
+std::vector<Content> contents_of(const std::vector<Row>& rows, const Layout& layout) {
+  std::vector<Content> contents;
+  for (const size_t column : columns_of(layout)) contents.push_back(content_of(rows, column, layout));
+  if (layout.form != Form::kTable || !layout.columns.empty()) return contents;
+  contents.push_back(content_of(rows, kTarget, layout));
+  if (natural_width(contents) > layout.width) contents.pop_back();
+  return contents;
 }
 
 // A column in a table. Of the library's own ways to cut a text none is the same in all its versions, so it
 // gets texts that fit.
 struct Place {
-  size_t column;
+  const Content* content;
   size_t width;  // cells; what is longer is cut
 };
 
 constexpr size_t kUncut = SIZE_MAX;
 
 // The order of importance: that of the line, but what was asked for beside the usual ones follows the status.
-std::vector<size_t> by_importance(std::vector<size_t> columns, const Layout& layout) {
+std::vector<const Content*> by_importance(const std::vector<Content>& contents, const Layout& layout) {
+  std::vector<const Content*> order;
+  for (const Content& content : contents) order.push_back(&content);
   if (layout.added) {
-    std::rotate(columns.begin() + kFirst, columns.begin() + static_cast<long>(kUsual), columns.end());
+    std::rotate(order.begin() + kFirst, order.begin() + static_cast<long>(kUsual), order.end());
   }
-  return columns;
+  return order;
 }
 
 // What was asked for is not cut, unless it were left out for that.
@@ -216,20 +245,19 @@ std::vector<size_t> widths_of(const std::vector<Wish>& wishes, size_t asked_for,
   return widths[kFirst + asked_for - 1] != 0 ? widths : fitting_widths(wishes, layout.width);
 }
 
-std::vector<Place> places_of(const std::vector<Row>& rows, const Layout& layout) {
-  const std::vector<size_t> columns = columns_of(rows, layout);
+std::vector<Place> places_of(const std::vector<Content>& contents, const Layout& layout) {
   std::vector<Place> places;
   if (layout.form != Form::kTable) {
-    for (const size_t column : columns) places.push_back({column, kUncut});
+    for (const Content& content : contents) places.push_back({&content, kUncut});
     return places;
   }
-  const std::vector<size_t> order = by_importance(columns, layout);
+  const std::vector<const Content*> order = by_importance(contents, layout);
   std::vector<Wish> wishes;
-  for (const size_t column : order) wishes.push_back(wish_of(rows, column, layout));
-  const std::vector<size_t> widths = widths_of(wishes, columns.size() - kUsual, layout);
-  for (const size_t column : columns) {
-    const size_t at = static_cast<size_t>(std::find(order.begin(), order.end(), column) - order.begin());
-    if (widths[at] != 0) places.push_back({column, widths[at]});
+  for (const Content* content : order) wishes.push_back(wish_of(*content));
+  const std::vector<size_t> widths = widths_of(wishes, contents.size() - kUsual, layout);
+  for (const Content& content : contents) {
+    const size_t at = static_cast<size_t>(std::find(order.begin(), order.end(), &content) - order.begin());
+    if (widths[at] != 0) places.push_back({&content, widths[at]});
   }
   return places;
 }
@@ -254,23 +282,26 @@ std::string cut(const std::string& text, size_t width) {
 }
 
 bool add_column(libscols_table* table, const Place& place) {
-  const Column& column = kColumns[place.column];
+  const Column& column = kColumns[place.content->column];
   const std::string name = std::string(column.name).substr(0, place.width);
-  const bool is_steady = place.width != kUncut && (place.column == kShare || place.column == kStatus);
+  const double width =
+      place.width != kUncut && is_steady(place.content->column) ? static_cast<double>(place.width) : 0;
   libscols_column* added =
-      scols_table_new_column(table, name.c_str(), is_steady ? static_cast<double>(place.width) : 0,
+      scols_table_new_column(table, name.c_str(), width,
                              (column.right ? SCOLS_FL_RIGHT : 0) | (column.least != 0 ? SCOLS_FL_TRUNC : 0));
   return added != nullptr && scols_column_set_json_type(added, column.type) == 0;
 }
 
-bool add_row(libscols_table* table, const Row& row, const std::vector<Place>& places, const Layout& layout) {
+// The row that is the `number`th of all.
+bool add_row(libscols_table* table, const Row& row, size_t number, const std::vector<Place>& places,
+             const Layout& layout) {
   libscols_line* line = scols_table_new_line(table, nullptr);
   if (line == nullptr) return false;
   for (size_t at = 0; at < places.size(); at++) {
-    const std::string text = cut(cell(kColumns[places[at].column], row, layout), places[at].width);
+    const std::string text = cut(places[at].content->cells[number], places[at].width);
     if (text.empty()) continue;
     if (scols_line_set_data(line, at, text.c_str()) != 0) return false;
-    if (places[at].column == kStatus && row.wanted) {
+    if (layout.colour && places[at].content->column == kStatus && row.wanted) {
       scols_cell_set_color(scols_line_get_cell(line, at), row.healthy() ? kGood : kBad);
     }
   }
@@ -279,10 +310,12 @@ bool add_row(libscols_table* table, const Row& row, const std::vector<Place>& pl
 
 platform::ScolsTable table_of(const std::vector<Row>& rows, const Layout& layout) {
   platform::ScolsTable table(scols_new_table());
-  const std::vector<Place> places = places_of(rows, layout);
+  const std::vector<Content> contents = contents_of(rows, layout);
+  const std::vector<Place> places = places_of(contents, layout);
   bool good = table != nullptr && scols_table_set_name(table.get(), "volumes") == 0;
   for (const Place& place : places) good = good && add_column(table.get(), place);
-  for (const Row& row : rows) good = good && add_row(table.get(), row, places, layout);
+  for (size_t at = 0; at < rows.size(); at++)
+    good = good && add_row(table.get(), rows[at], at, places, layout);
   return good ? std::move(table) : nullptr;
 }
 

@@ -265,7 +265,6 @@ int run(int argc, char** argv) {
   Options options;
   const int status = take_arguments(argc, argv, options);
   if (status != kGoOn) return status;
-  use_utf8();
   options.layout.colour = wants_colour();
   options.layout.width = width_of_output();
   if (options.metrics) return show_metrics();
