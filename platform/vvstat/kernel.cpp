@@ -8,8 +8,9 @@
 
 #include <cerrno>
 #include <climits>
-#include <cstdio>
+#include <cstdlib>
 
+#include "common/fd.h"
 #include "common/sessions.h"
 #include "vvstat/mounts.h"
 
@@ -48,49 +49,46 @@ std::string disk_name_of(dev_t device) {
   return path.substr(path.rfind('/') + 1);
 }
 
+// The beginning of a file of sysfs, which holds a number; empty when it cannot be read.
+std::string number_in(const std::string& path) {
+  char text[32];
+  const platform::Fd file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  const ssize_t size = file.ok() ? read(file.get(), text, sizeof text) : 0;
+  return {text, size > 0 ? static_cast<size_t>(size) : 0};
+}
+
 bool is_read_only_disk(const std::string& name) {
   if (name.empty() || name.find('/') != std::string::npos) return false;
-  FILE* file = fopen(("/sys/class/block/" + name + "/ro").c_str(), "re");
-  if (file == nullptr) return false;
-  const bool read_only = fgetc(file) == '1';
-  fclose(file);
-  return read_only;
+  return number_in("/sys/class/block/" + name + "/ro").starts_with('1');
 }
 
 // Whether the ext4 on that disk or partition has met an error since it was made or repaired.
 bool has_met_errors(const std::string& name) {
-  FILE* file = fopen(("/sys/fs/ext4/" + name + "/errors_count").c_str(), "re");
-  if (file == nullptr) return false;
-  unsigned count = 0;
-  const bool some = fscanf(file, "%u", &count) == 1 && count != 0;
-  fclose(file);
-  return some;
+  return strtoul(number_in("/sys/fs/ext4/" + name + "/errors_count").c_str(), nullptr, 10) != 0;
 }
 
 // Linux 6.1.192, 6.12 and 6.13 show nothing of an ext4 that refuses every write since it met an error: only a
 // try tells. One that has met none is not tried.
 bool refuses_writes(const std::string& mount_point, const std::string& disk) {
   if (!has_met_errors(disk)) return false;
-  const int file = open(mount_point.c_str(), O_TMPFILE | O_WRONLY | O_CLOEXEC, 0600);
-  const bool refused = file < 0 && (errno == EROFS || errno == EIO);
-  if (file >= 0) close(file);
-  return refused;
+  const platform::Fd file(open(mount_point.c_str(), O_TMPFILE | O_WRONLY | O_CLOEXEC, 0600));
+  return !file.ok() && (errno == EROFS || errno == EIO);
 }
 
 VolumeFacts facts_of(const Volume& volume, bool answering, const std::vector<Mount>& mounts) {
-  VolumeFacts facts, unmounted;
-  facts.disk_read_only = unmounted.disk_read_only = is_read_only_disk(volume.device);
+  VolumeFacts facts;
   dev_t device{};
   struct statvfs space {};
-  if (volume.mount_point.empty() || !find_mount(volume.mount_point, mounts, facts, device) ||
+  if (!may_be_mounted(mounts, volume.mount_point) || !find_mount(volume.mount_point, mounts, facts, device) ||
       statvfs(volume.mount_point.c_str(), &space) != 0) {
-    return unmounted;
+    return {};
   }
   const std::string disk = disk_name_of(device);
   facts.mounted = true;
   facts.disk_lost = major(device) != 0 && disk.empty() && access("/sys/dev/block", F_OK) == 0;
   facts.read_only = (space.f_flag & ST_RDONLY) != 0 || facts.shut_down ||
                     (answering && !disk.empty() && refuses_writes(volume.mount_point, disk));
+  facts.disk_read_only = facts.read_only && is_read_only_disk(volume.device);
   facts.size = static_cast<unsigned long long>(space.f_blocks) * space.f_frsize;
   facts.used = static_cast<unsigned long long>(space.f_blocks - space.f_bfree) * space.f_frsize;
   return facts;

@@ -15,7 +15,7 @@ struct VolumeFacts {
   bool mounted = false;         // something is mounted on its mount point
   bool disk_lost = false;       // its disk is gone, though a disk may be there anew
   bool read_only = false;       // that mount is, or its file system refuses writes
-  bool disk_read_only = false;  // the disk itself is: the LUN is write-protected
+  bool disk_read_only = false;  // and so is the disk itself: the LUN is write-protected
   unsigned long long used = 0;  // bytes, while it is mounted
   unsigned long long size = 0;
   bool shut_down = false;  // its file system refuses everything
@@ -29,11 +29,11 @@ struct TargetFacts {
   std::vector<VolumeFacts> volumes;  // in the order of the tree
 };
 
-// Reads /sys/class/iscsi_session, statx(2), statvfs(3), /proc/self/mountinfo, the disks'
-// /sys/class/block/NAME/ro and the errors that an ext4 has counted; none of it waits for a disk. One with
-// errors, whose target answers, is asked for a file without a name, which leaves nothing behind: only that
-// tells whether it refuses writes. The facts are in the order of status.targets; what cannot be read counts
-// as not there. Of several sessions of one target the one that is logged in counts.
+// Reads /sys/class/iscsi_session and /proc/self/mountinfo, and of what is mounted statx(2), statvfs(3), the
+// disk's /sys/class/block/NAME/ro and the errors that an ext4 has counted; none of it waits for a disk. One
+// with errors, whose target answers, is asked for a file without a name, which leaves nothing behind: only
+// that tells whether it refuses writes. The facts are in the order of status.targets; what cannot be read
+// counts as not there. Of several sessions of one target the one that is logged in counts.
 std::vector<TargetFacts> read_facts(const Status& status);
 
 }  // namespace vvstat

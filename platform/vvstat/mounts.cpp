@@ -90,6 +90,15 @@ std::vector<Mount> read_mounts() {
   return mounts;
 }
 
+bool may_be_mounted(const std::vector<Mount>& mounts, std::string_view path) {
+  if (path.empty()) return false;
+  const std::string_view name = path.substr(std::min(path.rfind('/'), path.size()));
+  // What has no name of its own at its end has to be looked up.
+  if (mounts.empty() || !name.starts_with('/') || name == "/" || name == "/." || name == "/..") return true;
+  return std::any_of(mounts.begin(), mounts.end(),
+                     [name](const Mount& mount) { return mount.point.ends_with(name); });
+}
+
 const Mount* mount_on(const std::vector<Mount>& mounts, std::string_view point) {
   const auto found = std::find_if(mounts.rbegin(), mounts.rend(),
                                   [point](const Mount& mount) { return mount.point == point; });
