@@ -18,6 +18,7 @@
 #include "sysaux.h"
 #include "tree/access.h"
 #include "tree/entry.h"
+#include "tree/lun_slots.h"
 #include "tree/slots.h"
 #include "tree_layout.h"
 
@@ -175,7 +176,7 @@ int ktree_clean_target_dev(TargetEntry* entry) {
   if (!slot) return kFailed;
   const int n = slot.target();
   int result = kOk;
-  for (int m = 1; m <= kMaxLunsPerTarget && is_lun_stored_at(n, m); m++) {
+  for (const int m : stored_luns_at(n)) {
     if (tree_write_once(KeyText(key::kLunDev, n, m), "") != kOk) result = kTreeFailed;
   }
   return result;

@@ -4,7 +4,7 @@
 #include "support/target_hold.h"
 #include "support/text.h"
 #include "tree/access.h"
-#include "tree/entry.h"
+#include "tree/lun_slots.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "tree/status_text.h"
@@ -31,7 +31,7 @@ bool any_text_shows_work(int dbidx) {
   if (!slot) return false;
   const int n = slot.target();
   if (shows_work(KeyText(key::kTargetStatus, n))) return true;
-  for (int m = 1; m <= kMaxLunsPerTarget && is_lun_stored(n, m); m++) {
+  for (const int m : stored_luns_at(n)) {
     if (shows_work(KeyText(key::kLunStatus, n, m))) return true;
   }
   return false;

@@ -12,6 +12,7 @@
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/half_made.h"
+#include "tree/lun_walk.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "tree_layout.h"
@@ -21,17 +22,12 @@ namespace remvol {
 
 namespace {
 
-// Reads the LUN in the target's slot and its state. Returns whether there is one.
-bool read_lun(TargetEntry* entry, LunState* state, int slot) {
-  return ktree_get_lun_of_target(entry, slot) == kOk && read_lun_state(entry->db_idx, slot, state) == kOk;
-}
-
 // Refreshes the status texts of the LUNs of the target in `entry`, which is the record for each. The slots
 // are let go of while disks are looked at.
 void refresh_luns(TargetEntry* entry, SlotsHeld* held) {
   LunState state;
-  for (int slot = 1; slot <= kMaxLunsPerTarget; slot = lun_slot_after(entry->db_idx, slot)) {
-    if (!read_lun(entry, &state, slot)) break;
+  LunWalk luns(entry->db_idx, LunWalk::kAtUnreadable);
+  while (luns.next_of_target(entry) && read_lun_state(entry->db_idx, entry->lun_db_idx, &state) == kOk) {
     held->let_go();
     repair_lun_state(entry, &state);
     ktree_update_lun_status(entry, state);

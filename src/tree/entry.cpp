@@ -8,6 +8,7 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
+#include "tree/lun_slots.h"
 #include "tree/slots.h"
 #include "tree_layout.h"
 
@@ -64,7 +65,7 @@ bool read_lun_at(TargetEntry* entry, int dbidx, const HeldSlot& slot, int m) {
 // Counts the LUNs of the slot `n` as it is now, up to the first that is free by the looser rule.
 int count_luns_at(int n) {
   int count = 0;
-  while (count < kMaxLunsPerTarget && !is_lun_slot_free(n, count + 1)) count++;
+  for (const int m : taken_luns_at(n)) count = m;
   return count;
 }
 
@@ -169,21 +170,6 @@ int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry) {
   entry->db_idx = dbidx;
   read_target_fields(entry, slot.target());
   return kOk;
-}
-
-bool is_target_stored(int dbidx) {
-  const LogScope scope;
-  const HeldSlot slot(dbidx);
-  return slot && is_target_stored_at(slot.target());
-}
-
-bool is_lun_stored(int dbidx, int lun_dbidx) {
-  const LogScope scope;
-  const HeldSlot slot(dbidx);
-  int lun = 0;
-  if (!slot || !read_lun_number(slot.target(), lun_dbidx, &lun)) return false;
-  remember_lun(dbidx, lun_dbidx, lun);
-  return true;
 }
 
 int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx) {
@@ -304,15 +290,14 @@ int ktree_get_free_lun_dbidx(int dbidx) {
     LOG(2, "max number of lun = %d reached", kMaxLuns);
     return kFailed;
   }
-  int m = 1;
-  for (; m <= kMaxLunsPerTarget; m++) {
-    if (!is_lun_slot_free(dbidx, m)) continue;
-    LOG(3, "free ent id: %d", m);
-    return m;
+  const int m = count_luns_at(dbidx) + 1;
+  if (m > kMaxLunsPerTarget) {
+    // The number printed is the one past the last slot, not the target's.
+    LOG(3, "fail to get free lun dbidx at target idx : %d", m);
+    return kTreeFailed;
   }
-  // The number printed is the one past the last slot, not the target's.
-  LOG(3, "fail to get free lun dbidx at target idx : %d", m);
-  return kTreeFailed;
+  LOG(3, "free ent id: %d", m);
+  return m;
 }
 
 int ktree_get_dbidx_by_lun(int dbidx, int lun) {
@@ -321,6 +306,8 @@ int ktree_get_dbidx_by_lun(int dbidx, int lun) {
   const HeldSlot slot(dbidx);
   if (!slot) return kFailed;
   int lun_dbidx = kFailed;
+  // Not stored_luns_at(): the slot that ends the search is logged, and one read gives what it is compared
+  // with.
   for (int m = 1; m <= kMaxLunsPerTarget && lun_dbidx == kFailed; m++) {
     int stored = 0;
     if (!read_lun_number(slot.target(), m, &stored)) {

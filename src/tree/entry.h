@@ -23,10 +23,6 @@ namespace remvol {
 // Returns 0, or -1 for an empty slot.
 [[nodiscard]] int ktree_get_entry_by_dbidx(int dbidx, TargetEntry* entry);
 
-// Return whether the slot holds a target, and whether the target's LUN slot holds a LUN.
-[[nodiscard]] bool is_target_stored(int dbidx);
-[[nodiscard]] bool is_lun_stored(int dbidx, int lun_dbidx);
-
 // Fills `entry` with the target at `dbidx` and its LUN at `lun_dbidx`. Returns 0, or -1 when an argument is
 // bad (null, below 1) or one of the two slots is empty.
 [[nodiscard]] int ktree_get_lun_entry_by_dbidx(TargetEntry* entry, int dbidx, int lun_dbidx);

@@ -6,6 +6,7 @@
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
+#include "tree/lun_slots.h"
 #include "tree/slots.h"
 #include "tree_layout.h"
 
@@ -34,7 +35,7 @@ void drop(const char* path) {
 // Adding takes the first slot without a number, so behind it is none. Returns the last slot with one.
 int last_lun_at(int n) {
   int last = 0;
-  while (last < kMaxLunsPerTarget && is_lun_stored_at(n, last + 1)) last++;
+  for (const int m : stored_luns_at(n)) last = m;
   return last;
 }
 

@@ -37,6 +37,7 @@ int publish_lun(const char* socket, const LunNode* lun, int k, int dbidx) {
   return publish(socket, KeyText(key::kLunSearchFsType, k), lun->fs_type);
 }
 
+// The walk ends at the first slot without a share, not without a LUN number: shares are all that it reads.
 bool share_is_used_in(int dbidx, const char* share) {
   for (int m = 1; m <= kMaxLunsPerTarget; m++) {
     TreeValue stored;

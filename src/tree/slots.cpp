@@ -219,6 +219,21 @@ bool is_lun_stored_at(int n, int m) {
   return read_lun_number(n, m, &lun);
 }
 
+bool is_target_stored(int dbidx) {
+  const LogScope scope;
+  const HeldSlot slot(dbidx);
+  return slot && is_target_stored_at(slot.target());
+}
+
+bool is_lun_stored(int dbidx, int lun_dbidx) {
+  const LogScope scope;
+  const HeldSlot slot(dbidx);
+  int lun = 0;
+  if (!slot || !read_lun_number(slot.target(), lun_dbidx, &lun)) return false;
+  remember_lun(dbidx, lun_dbidx, lun);
+  return true;
+}
+
 bool is_target_slot_free(int n) {
   TargetName name;
   return get_target_name(n, name, Belief::kAny) == -1 || name[0] == '\0';

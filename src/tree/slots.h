@@ -64,6 +64,10 @@ class HeldSlot {
 [[nodiscard]] bool is_target_stored_at(int n);
 [[nodiscard]] bool is_lun_stored_at(int n, int m);
 
+// The same by the numbers that this run knows the slots by. The LUN is remembered.
+[[nodiscard]] bool is_target_stored(int dbidx);
+[[nodiscard]] bool is_lun_stored(int dbidx, int lun_dbidx);
+
 // The same by the looser rule of the free-slot searches (tree_slot_is_free), also by what was read before a
 // command ran.
 [[nodiscard]] bool is_target_slot_free(int n);

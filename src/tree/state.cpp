@@ -7,6 +7,7 @@
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree/entry.h"
+#include "tree/lun_slots.h"
 #include "tree/slots.h"
 #include "tree_layout.h"
 
@@ -106,7 +107,7 @@ int ktree_update_formatting_state(const TargetEntry* entry, int state) {
 bool is_no_lun_formatting(const char* target_name) {
   const SlotsHeld held;
   const int dbidx = ktree_get_dbidx_by_targetname(target_name);
-  for (int m = 1; m <= kMaxLunsPerTarget && is_lun_stored(dbidx, m); m++) {
+  for (const int m : stored_luns(dbidx)) {
     int state = kFormatIdle;
     ktree_get_lun_format_state(dbidx, m, &state);
     if (state == kFormatting || state == kFormatWaiting) return false;
@@ -143,8 +144,7 @@ int ktree_update_all_volume_state(TargetEntry* entry, int state) {
   if (entry->db_idx < 1) entry->db_idx = ktree_get_dbidx_by_targetname(entry->target_name);
   if (entry->db_idx < 1) return kFailed;
   const SlotsHeld held;
-  for (int m = 1; m <= kMaxLunsPerTarget; m++) {
-    if (!is_lun_stored(entry->db_idx, m)) break;
+  for (const int m : stored_luns(entry->db_idx)) {
     entry->lun_db_idx = m;
     const int result = ktree_update_volume_state(entry, state);
     if (result != kOk) return result;

@@ -10,12 +10,16 @@
 #include <regex>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "fakes.h"
 #include "ktreec.h"
+#include "support/target_hold.h"
 #include "support/text.h"
+#include "tasks/repair.h"
 #include "tree/entry.h"
 #include "tree/half_made.h"
+#include "tree/lun_slots.h"
 #include "tree/state.h"
 #include "volume_fixture.h"
 
@@ -109,6 +113,17 @@ TEST_F(HeldSlots, AreReadAnewAfterADeletionOfOurOwn) {
   EXPECT_EQ(HeldSlot(2, 1).target(), 1);
   EXPECT_EQ(delete_slot("/iscsi/initiator/id:1/lun/id:1"), 0);
   EXPECT_FALSE(HeldSlot(2, 1));
+}
+
+TEST_F(HeldSlots, ShowEndedWorkWhereTheTargetIsNow) {
+  { const TargetHold hold("iqn.t2"); }
+  remember_target(1, "iqn.t1");
+  fakes::tree_set({{"/iscsi/initiator/id:2/lun/id:1/status", "Creating Volume"}});
+  delete_first_target();
+  TargetEntry target = {};
+  copy_text(target.target_name, "iqn.t2");
+  target.db_idx = 2;
+  EXPECT_TRUE(shows_ended_work(&target));
 }
 
 TEST_F(HeldSlots, AreBelievedFromHoldToHold) {
@@ -370,6 +385,51 @@ TEST_F(Slots, ATargetThatWasJustAddedIsFoundWhereverItIs) {
   ASSERT_EQ(ktree_add_entry(&entry), 4);
   delete_target(1);
   EXPECT_EQ(HeldSlot(4).target(), 3);
+}
+
+std::vector<int> met(const LunSlots& luns) {
+  std::vector<int> slots;
+  for (const int m : luns) slots.push_back(m);
+  return slots;
+}
+
+TEST_F(Slots, AWalkEndsAtTheFirstSlotWithoutALun) {
+  fakes::tree_set({{lun_key(1, 5, "lun"), "50"}});
+  EXPECT_EQ(met(stored_luns(1)), (std::vector{1, 2, 3}));
+  EXPECT_EQ(met(stored_luns_at(1)), (std::vector{1, 2, 3}));
+  EXPECT_EQ(met(taken_luns_at(1)), (std::vector{1, 2, 3}));
+  EXPECT_EQ(met(stored_luns_at(4)), std::vector<int>());
+}
+
+TEST_F(Slots, AWalkEndsBehindTheLastSlot) {
+  for (int m = 4; m <= kMaxLunsPerTarget + 1; m++) fakes::tree_set({{lun_key(1, m, "lun"), "70"}});
+  EXPECT_EQ(met(stored_luns(1)).size(), size_t{kMaxLunsPerTarget});
+  EXPECT_EQ(met(taken_luns_at(1)).back(), kMaxLunsPerTarget);
+}
+
+TEST_F(Slots, ASlotWhoseReadFailsWithATextEndsAWalkButIsNotFree) {
+  fakes::on("ktreec_get_wb", lun_key(1, 2, "lun")).returns(-2).text("20");
+  EXPECT_EQ(met(stored_luns(1)), std::vector{1});
+  EXPECT_EQ(met(stored_luns_at(1)), std::vector{1});
+  EXPECT_EQ(met(taken_luns_at(1)), (std::vector{1, 2, 3}));
+}
+
+TEST_F(Slots, AWalkByTheKnownNumberRemembersWhatItMeets) {
+  ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t3"), 3);
+  delete_target(1);
+  EXPECT_EQ(met(stored_luns(3)), (std::vector{1, 2, 3}));
+  delete_lun(2, 1);
+  EXPECT_EQ(HeldSlot(3, 2).target(), 2);
+  EXPECT_EQ(HeldSlot(3, 2).lun(), 1);
+}
+
+TEST_F(Slots, AWalkOverTheSlotsAsTheyAreLeavesWhatWasKnown) {
+  TargetEntry lun;
+  ASSERT_EQ(ktree_get_lun_entry_by_dbidx(&lun, 1, 2), 0);
+  delete_lun(1, 1);
+  EXPECT_EQ(met(stored_luns_at(1)), (std::vector{1, 2}));
+  EXPECT_EQ(met(taken_luns_at(1)), (std::vector{1, 2}));
+  EXPECT_EQ(HeldSlot(1, 2).lun(), 1);
 }
 
 TEST_F(Slots, ALunThatIsNotStoredIsNotFormatting) {
