@@ -36,12 +36,10 @@ int refuse_connected(const TargetEntry& request) {
 
 int store_portal(const TargetEntry& request, int dbidx) {
   const HeldSlot slot(dbidx);
-  if (!slot || tree_write(KeyText(key::kTargetIp, slot.target()), request.ip) != kOk ||
-      tree_write(KeyText(key::kTargetPort, slot.target()), NumberText("%d", request.port)) != kOk) {
-    LOG(0, "ktreec_set() failed");
-    return kTreeFailed;
-  }
-  return kOk;
+  if (!slot) return tree_write_failed();
+  const int result = tree_write_once(KeyText(key::kTargetIp, slot.target()), request.ip);
+  if (result != kOk) return result;
+  return tree_write_once(KeyText(key::kTargetPort, slot.target()), NumberText("%d", request.port));
 }
 
 int modify_address(const TargetEntry& request) {

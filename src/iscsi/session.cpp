@@ -101,10 +101,9 @@ void store_device(TargetEntry* entry, const DetailedListing& listing, DeviceUpda
   log_disk(listing);
   copy_text(entry->dev, device_name(listing));
   const HeldSlot slot(entry->db_idx, lun_dbidx);
-  if (!slot || tree_write(KeyText(key::kLunDev, slot.target(), slot.lun()), entry->dev) != kOk) {
-    LOG(0, "ktreec_set() failed");
-    update->result = kTreeFailed;
-  }
+  const int stored = slot ? tree_write_once(KeyText(key::kLunDev, slot.target(), slot.lun()), entry->dev)
+                          : tree_write_failed();
+  if (stored != kOk) update->result = stored;
   update->found = true;
 }
 

@@ -18,8 +18,6 @@ namespace remvol {
 
 namespace {
 
-constexpr int kWriteTries = 3;
-
 // A daemon that is too busy to take the connection at once is one.
 bool tree_takes_connections() {
   sockaddr_un address = {};
@@ -107,17 +105,20 @@ int tree_write_once(const char* key, const char* value) {
 }
 
 int tree_write_once_to(const char* socket, const char* key, const char* value) {
-  const int result = tree_write_to(socket, key, value);
-  if (result != kOk) LOG(0, "ktreec_set() failed");
-  return result;
+  return tree_write_to(socket, key, value) == kOk ? kOk : tree_write_failed();
 }
 
-int tree_write_with_tries(const char* key, const char* value) {
-  return tree_write_with_tries_to(kVolumesSocket, key, value);
+int tree_write_failed() {
+  LOG(0, "ktreec_set() failed");
+  return kTreeFailed;
 }
 
-int tree_write_with_tries_to(const char* socket, const char* key, const char* value) {
-  for (int tries = 0; tries < kWriteTries; tries++) {
+int tree_write_with_tries(const char* key, const char* value, int tries) {
+  return tree_write_with_tries_to(kVolumesSocket, key, value, tries);
+}
+
+int tree_write_with_tries_to(const char* socket, const char* key, const char* value, int tries) {
+  for (int left = tries; left > 0; left--) {
     if (tree_write_to(socket, key, value) == kOk) return kOk;
     LOG(0, "ktreec_set(%s) failed", key);
   }
@@ -125,8 +126,12 @@ int tree_write_with_tries_to(const char* socket, const char* key, const char* va
 }
 
 int tree_write_logged(const char* key, const char* value) {
+  return tree_write_logged_to(kVolumesSocket, key, value, kWriteTries);
+}
+
+int tree_write_logged_to(const char* socket, const char* key, const char* value, int tries) {
   LOG(1, "ktreec_set %s=%s", key, value);
-  return tree_write_with_tries(key, value);
+  return tree_write_with_tries_to(socket, key, value, tries);
 }
 
 int tree_delete(const char* key) {

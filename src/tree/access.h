@@ -78,13 +78,20 @@ template <size_t N>
 [[nodiscard]] int tree_write_once(const char* key, const char* value);
 [[nodiscard]] int tree_write_once_to(const char* socket, const char* key, const char* value);
 
-// Sets `key` in up to 3 tries and logs "ktreec_set(%s) failed" in the innermost scope's name after each
-// failed one. Returns 0, or -103 after the third.
-[[nodiscard]] int tree_write_with_tries(const char* key, const char* value);
-[[nodiscard]] int tree_write_with_tries_to(const char* socket, const char* key, const char* value);
+// Logs what they do, for a value whose slot is gone. Returns -103.
+int tree_write_failed();
 
-// The same, and says first what it sets, at level 1.
+inline constexpr int kWriteTries = 3;
+
+// Sets `key` in up to `tries` tries and logs "ktreec_set(%s) failed" in the innermost scope's name after each
+// failed one. Returns 0, or -103 after the last.
+[[nodiscard]] int tree_write_with_tries(const char* key, const char* value, int tries = kWriteTries);
+[[nodiscard]] int tree_write_with_tries_to(const char* socket, const char* key, const char* value,
+                                           int tries = kWriteTries);
+
+// The same, and say first what they set, at level 1.
 [[nodiscard]] int tree_write_logged(const char* key, const char* value);
+[[nodiscard]] int tree_write_logged_to(const char* socket, const char* key, const char* value, int tries);
 
 // Deletes `key` and all below it. Returns 0, or -103 (not logged).
 [[nodiscard]] int tree_delete(const char* key);

@@ -16,10 +16,7 @@ namespace remvol {
 namespace {
 
 int publish(const char* socket, const char* key, const char* value) {
-  LOG(1, "ktreec_set %s=%s", key, value);
-  if (tree_write_to(socket, key, value) == kOk) return kOk;
-  LOG(0, "ktreec_set(%s) failed", key);
-  return kTreeFailed;
+  return tree_write_logged_to(socket, key, value, 1);
 }
 
 // Publishes the k-th LUN found. `dbidx` is the slot of its target, below 1 when the target is not stored.

@@ -53,10 +53,7 @@ int ktree_set_connect_state(int dbidx, int state) {
   const SlotsHeld held(SlotsHeld::kChange);  // not between the looks of a run that composes the status
   const HeldSlot slot(dbidx);
   if (!slot) return kTreeFailed;
-  const KeyText key(key::kTargetConnState, slot.target());
-  if (tree_write(key, NumberText("%d", state)) == kOk) return kOk;
-  LOG(0, "ktreec_set(%s) failed", key.c_str());
-  return kTreeFailed;
+  return tree_write_with_tries(KeyText(key::kTargetConnState, slot.target()), NumberText("%d", state), 1);
 }
 
 int ktree_update_lun_vol_access_right(int right, int dbidx, int lun_dbidx) {

@@ -31,10 +31,15 @@ constexpr MovedState kMovedStates[] = {
     {key::kOldVolumeState, key::kLunVolumeState},
 };
 
-int set_value(const char* key, const char* value) {
-  if (tree_write(key, value) == kOk) return kOk;
+// Not tree_write_once(), which tells of a failure in the name of another file: those who read the log know
+// the messages of an upgrade by the name of this one.
+int set_failed() {
   LOG(0, "ktreec_set() failed");
   return kFailed;
+}
+
+int set_value(const char* key, const char* value) {
+  return tree_write(key, value) == kOk ? kOk : set_failed();
 }
 
 #pragma GCC diagnostic push
@@ -52,10 +57,7 @@ void move_state(int n, const MovedState& state) {
 // those who read the log know it.
 int move_share(int n) {
   char share[256];
-  if (!tree_read(KeyText(key::kOldShare, n), share)) {
-    LOG(0, "ktreec_set() failed");
-    return kFailed;
-  }
+  if (!tree_read(KeyText(key::kOldShare, n), share)) return set_failed();
   return set_value(KeyText(key::kLunShare, n, kLunSlot), share);
 }
 
