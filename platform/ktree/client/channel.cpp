@@ -13,6 +13,8 @@
 #include <cstring>
 #include <ctime>
 
+#include "tree_layout.h"
+
 namespace ktree::client {
 namespace {
 
@@ -273,7 +275,7 @@ CallResult request_on(Channel& channel, Call& call) {
 
 CallResult request(const char* socket, Call& call) {
   call.size = 0;
-  Channel* channel = find_channel(socket == nullptr ? kDefaultSocket : socket);
+  Channel* channel = find_channel(socket == nullptr ? remvol::kGeneralSocket : socket);
   if (channel == nullptr) return CallResult::kUnreachable;
   if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) return CallResult::kRefused;
   pthread_mutex_lock(&channel->lock);

@@ -13,8 +13,6 @@
 
 namespace ktree::client {
 
-inline constexpr char kDefaultSocket[] = "/var/run/ktree_sock";
-
 // A request with its reply takes at most this long, connecting included.
 constexpr int64_t kRequestMilliseconds = 5000;
 
@@ -37,7 +35,7 @@ struct Call {
   size_t size;   // set to the bytes that came
 };
 
-// Sends the request to the daemon on `socket` (null: the default one) and waits for the reply, on the
+// Sends the request to the daemon on `socket` (null: remvol::kGeneralSocket) and waits for the reply, on the
 // connection of earlier calls when there is one. A connection that turns out to be dead, because the daemon
 // was restarted or made room for others, is opened again and the request sent again when it cannot have been
 // carried out, or when carrying it out twice does no harm. Calls from several threads to one socket follow

@@ -9,6 +9,7 @@
 
 #include "ktree/client/calls.h"
 #include "ktree/standard_descriptors.h"
+#include "tree_layout.h"
 
 namespace {
 
@@ -60,7 +61,7 @@ int conclude(const CommandLine& arguments, CallResult result, const char* subjec
     case CallResult::kUnreachable:
       break;
   }
-  const char* socket = arguments.socket == nullptr ? ktree::client::kDefaultSocket : arguments.socket;
+  const char* socket = arguments.socket == nullptr ? remvol::kGeneralSocket : arguments.socket;
   complain(socket, "the daemon cannot be reached");
   return kUnreachable;
 }
