@@ -29,8 +29,8 @@ Links links_of(const std::string& target, const std::vector<Session>& sessions) 
 
 }  // namespace
 
-Targets::Target& Targets::find(const std::string& name) {
-  for (Target& target : targets_) {
+Targets::FollowedTarget& Targets::find(const std::string& name) {
+  for (FollowedTarget& target : targets_) {
     if (target.name == name) return target;
   }
   targets_.push_back({});
@@ -39,7 +39,7 @@ Targets::Target& Targets::find(const std::string& name) {
 }
 
 // A recovery that has not begun is pointless once the connection is lost again.
-void Targets::order_reopen(Target& target) {
+void Targets::order_reopen(FollowedTarget& target) {
   target.wants_reopen = true;
   target.wants_recover = false;
   target.retries = target.pause = 0;
@@ -49,7 +49,7 @@ void Targets::take(const KernelEvent& event, const std::vector<Session>& session
   const auto session = std::find_if(sessions.begin(), sessions.end(),
                                     [&event](const Session& other) { return other.number == event.session; });
   if (event.kind != KernelEventKind::kOther && session != sessions.end() && session->link != Link::kNew) {
-    Target& target = find(session->target);
+    FollowedTarget& target = find(session->target);
     target.answered = event.kind == KernelEventKind::kLoggedIn && (target.suspect > 0 || target.lost);
     // A logout ends in a connection error as well: the session is then gone a moment later.
     if (event.kind == KernelEventKind::kConnectionLost && !target.lost) target.suspect = kSuspectLooks;
@@ -57,7 +57,7 @@ void Targets::take(const KernelEvent& event, const std::vector<Session>& session
   look(sessions);
 }
 
-void Targets::settle(Target& target, const std::vector<Session>& sessions) {
+void Targets::settle(FollowedTarget& target, const std::vector<Session>& sessions) {
   const Links links = links_of(target.name, sessions);
   target.present = links.any;
   if (target.suspect > 0) --target.suspect;
@@ -81,8 +81,8 @@ void Targets::settle(Target& target, const std::vector<Session>& sessions) {
 
 void Targets::look(const std::vector<Session>& sessions) {
   for (const Session& session : sessions) find(session.target);
-  for (Target& target : targets_) settle(target, sessions);
-  std::erase_if(targets_, [](const Target& target) {
+  for (FollowedTarget& target : targets_) settle(target, sessions);
+  std::erase_if(targets_, [](const FollowedTarget& target) {
     return !target.present && !target.lost && !target.busy && !target.wants_reopen && !target.wants_recover &&
            target.pause == 0;
   });
@@ -90,13 +90,13 @@ void Targets::look(const std::vector<Session>& sessions) {
 
 void Targets::look_after_a_gap(const std::vector<Session>& sessions) {
   look(sessions);
-  for (Target& target : targets_) {
+  for (FollowedTarget& target : targets_) {
     if (target.present && links_of(target.name, sessions).all_up) target.wants_recover = true;
   }
 }
 
 bool Targets::next(Order& order) {
-  for (Target& target : targets_) {
+  for (FollowedTarget& target : targets_) {
     if (target.busy || (!target.wants_reopen && !target.wants_recover)) continue;
     order = {target.name, target.wants_reopen ? Action::kReopen : Action::kRecover};
     (target.wants_reopen ? target.wants_reopen : target.wants_recover) = false;
@@ -108,14 +108,14 @@ bool Targets::next(Order& order) {
 }
 
 void Targets::started(const std::string& target, pid_t process) {
-  Target& chosen = find(target);
+  FollowedTarget& chosen = find(target);
   chosen.process = process;
   chosen.busy = process > 0;
 }
 
 OrderEnd Targets::ended(pid_t process, bool failed) {
   OrderEnd end;
-  for (Target& target : targets_) {
+  for (FollowedTarget& target : targets_) {
     if (!target.busy || target.process != process) continue;
     end.ordered = true;
     target.busy = false;
@@ -134,7 +134,7 @@ OrderEnd Targets::ended(pid_t process, bool failed) {
 
 Hurry Targets::hurry() const {
   Hurry hurry = Hurry::kNone;
-  for (const Target& target : targets_) {
+  for (const FollowedTarget& target : targets_) {
     if (target.present && (target.suspect > 0 || target.answered)) return Hurry::kMuch;
     if ((target.present && target.lost) || target.pause > 0) hurry = Hurry::kSome;
   }

@@ -56,7 +56,7 @@ class Targets {
   Hurry hurry() const;
 
  private:
-  struct Target {
+  struct FollowedTarget {
     std::string name;
     bool present = false;       // it has a session
     int suspect = 0;            // a connection error came, the session still counts as logged in: looks left
@@ -71,11 +71,11 @@ class Targets {
     pid_t process = -1;
   };
 
-  Target& find(const std::string& name);
-  static void order_reopen(Target& target);
-  static void settle(Target& target, const std::vector<Session>& sessions);
+  FollowedTarget& find(const std::string& name);
+  static void order_reopen(FollowedTarget& target);
+  static void settle(FollowedTarget& target, const std::vector<Session>& sessions);
 
-  std::vector<Target> targets_;
+  std::vector<FollowedTarget> targets_;
 };
 
 }  // namespace events

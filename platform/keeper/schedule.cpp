@@ -13,8 +13,8 @@ constexpr int kLooksAtWork = 60;
 
 }  // namespace
 
-Schedule::Target& Schedule::find(const std::string& name) {
-  for (Target& target : targets_) {
+Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
+  for (AwaitedTarget& target : targets_) {
     if (target.name == name) return target;
   }
   targets_.push_back({});
@@ -22,7 +22,7 @@ Schedule::Target& Schedule::find(const std::string& name) {
   return targets_.back();
 }
 
-void Schedule::settle(Target& target, const Wanted& wanted, long now) {
+void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, long now) {
   if (wanted.connected) {
     target.tell = target.missing && !target.tell;
     target.missing = target.taken = false;
@@ -39,17 +39,17 @@ void Schedule::settle(Target& target, const Wanted& wanted, long now) {
 }
 
 void Schedule::look(const std::vector<Wanted>& wanted, long now) {
-  for (Target& target : targets_) target.seen = false;
+  for (AwaitedTarget& target : targets_) target.seen = false;
   for (const Wanted& one : wanted) {
-    Target& target = find(one.name);
+    AwaitedTarget& target = find(one.name);
     target.seen = true;
     settle(target, one, now);
   }
-  std::erase_if(targets_, [](const Target& target) { return !target.seen; });
+  std::erase_if(targets_, [](const AwaitedTarget& target) { return !target.seen; });
 }
 
 Change Schedule::next_change(std::string& name) {
-  for (Target& target : targets_) {
+  for (AwaitedTarget& target : targets_) {
     if (!target.tell) continue;
     target.tell = false;
     name = target.name;
@@ -59,7 +59,7 @@ Change Schedule::next_change(std::string& name) {
 }
 
 bool Schedule::next_try(Try& next, long now) {
-  for (Target& target : targets_) {
+  for (AwaitedTarget& target : targets_) {
     if (!target.missing || now < target.due) continue;
     next = {target.name, target.pause == kFirstPause};
     target.due = now + target.pause;
@@ -71,7 +71,7 @@ bool Schedule::next_try(Try& next, long now) {
 
 bool Schedule::anything_missing() const {
   return std::any_of(targets_.begin(), targets_.end(),
-                     [](const Target& target) { return !target.taken && target.absent > 0; });
+                     [](const AwaitedTarget& target) { return !target.taken && target.absent > 0; });
 }
 
 }  // namespace keeper

@@ -40,7 +40,7 @@ class Schedule {
   static constexpr long kFirstPause = 1, kLongestPause = 60;
 
  private:
-  struct Target {
+  struct AwaitedTarget {
     std::string name;
     bool seen = false;     // it is among those that are wanted
     bool taken = false;    // it was taken away on purpose, and stays away until it has been connected again
@@ -50,10 +50,10 @@ class Schedule {
     long pause = kFirstPause, due = 0;
   };
 
-  Target& find(const std::string& name);
-  static void settle(Target& target, const Wanted& wanted, long now);
+  AwaitedTarget& find(const std::string& name);
+  static void settle(AwaitedTarget& target, const Wanted& wanted, long now);
 
-  std::vector<Target> targets_;
+  std::vector<AwaitedTarget> targets_;
 };
 
 }  // namespace keeper

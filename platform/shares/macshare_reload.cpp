@@ -18,8 +18,8 @@ constexpr char kLock[] = "afp-shares.lock";
 }  // namespace
 
 int main(int argc, char** argv) {
-  const Wish wish = read_wish(argc, argv);
-  if (wish == Wish::kWrong) return 2;
+  const ReloadCommand command = read_command(argc, argv);
+  if (command == ReloadCommand::kWrong) return 2;
   open_log("macshare_reload");
   // Macs use the Samba shares then.
   if (!is_installed("netatalk")) return 0;
@@ -28,8 +28,8 @@ int main(int argc, char** argv) {
     return 0;
   }
   const ServerConfig config = read_server_config(kConfig, kShares);
-  const Reload done = reload_shares(
-      {"macshare_reload", kShares, kNetatalkNames, config.names, false, "", wish == Wish::kWithdraw});
+  const Reload done = reload_shares({"macshare_reload", kShares, kNetatalkNames, config.names, false, "",
+                                     command == ReloadCommand::kWithdraw});
   if (!done.has_tree) {
     log_line(LOG_WARNING, "the configuration tree does not answer; only shares that are gone are taken out");
   } else if (!config.includes_shares && !done.shares.empty()) {

@@ -107,11 +107,11 @@ std::vector<Section> shares_of_tree(const ShareServer& server, const std::vector
 
 }  // namespace
 
-Wish read_wish(int argc, char** argv) {
-  if (argc == 1) return Wish::kReload;
-  if (argc == 2 && strcmp(argv[1], "--withdraw") == 0) return Wish::kWithdraw;
+ReloadCommand read_command(int argc, char** argv) {
+  if (argc == 1) return ReloadCommand::kReload;
+  if (argc == 2 && strcmp(argv[1], "--withdraw") == 0) return ReloadCommand::kWithdraw;
   fprintf(stderr, "usage: %s [--withdraw]\n", argv[0]);
-  return Wish::kWrong;
+  return ReloadCommand::kWrong;
 }
 
 Reload reload_shares(const ShareServer& server) {

@@ -22,10 +22,10 @@ struct ShareServer {
 };
 
 // What the command line of a reload program asks for.
-enum class Wish { kReload, kWithdraw, kWrong };
+enum class ReloadCommand { kReload, kWithdraw, kWrong };
 
 // Reads the command line; prints the usage when it is wrong.
-Wish read_wish(int argc, char** argv);
+ReloadCommand read_command(int argc, char** argv);
 
 struct Reload {
   bool has_tree;                // false: the tree was asked, and the shares are those that are still mounted

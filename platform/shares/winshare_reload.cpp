@@ -88,8 +88,8 @@ void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool h
 }  // namespace
 
 int main(int argc, char** argv) {
-  const Wish wish = read_wish(argc, argv);
-  if (wish == Wish::kWrong) return 2;
+  const ReloadCommand command = read_command(argc, argv);
+  if (command == ReloadCommand::kWrong) return 2;
   open_log("winshare_reload");
   if (!take_turn(kLock)) {
     log_line(LOG_WARNING, "%s: %s", kLock, strerror(errno));
@@ -98,7 +98,7 @@ int main(int argc, char** argv) {
   ServerConfig config = read_server_config(kConfig, kShares);
   if (config.uses_registry) add_registry_shares(config);
   const Reload done = reload_shares({"winshare_reload", kShares, kSambaNames, config.names, true,
-                                     options_for_macs(config), wish == Wish::kWithdraw});
+                                     options_for_macs(config), command == ReloadCommand::kWithdraw});
   const bool has_samba = is_installed("smbcontrol");
   tell_what_is_missing(done, config, has_samba);
   if (done.changed && has_samba) tell_samba(done);

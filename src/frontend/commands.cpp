@@ -70,7 +70,7 @@ int reopen() {
 
 // The failure texts of oiscsi_evt_recover and modify_address are those of other commands: scripts look for
 // them.
-const Command kCommands[] = {
+const CommandRow kCommands[] = {
     {"init", run<task_init>, kNone, "task_init() failed", false, false, nullptr},
     {"search", search, kPortal, "task_search() failed", false, false, nullptr},
     {"add", run<task_add>, kOneLun | kPortal | kOptShare, "task_add() failed", true, false, nullptr},

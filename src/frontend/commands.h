@@ -9,7 +9,7 @@ namespace remvol {
 // Runs a command's handler with what it needs of the request. Returns the handler's result, 0 for success.
 using Handler = int (*)();
 
-struct Command {
+struct CommandRow {
   const char* name;         // long option
   Handler run;              // null: the command takes the failure path
   unsigned required;        // bits of OPT_FLAG that must all be set
@@ -20,7 +20,7 @@ struct Command {
   bool ends_tree = false;   // the tree's daemon is gone behind it
 };
 
-extern const Command kCommands[];
+extern const CommandRow kCommands[];
 extern const int kCommandCount;
 
 // Returns the rows as getopt_long(3) takes them. Help, which has no handler, stands for the letter h.

@@ -66,7 +66,7 @@ void copy_to_flash() {
 }
 
 // Dumps the tree. Returns whether the settings file may go to the flash.
-bool dump_settings(const Command& command) {
+bool dump_settings(const CommandRow& command) {
   // A tree that was told to end may be gone already, which is nothing to tell of.
   if (command.ends_tree) {
     return !dump_would_bury_settings() && ktreec_dump(kVolumesSocket, 0, kSettingsFile) == 0;
@@ -86,7 +86,7 @@ bool was_change_lost(const TreeInstance& tree) {
   return true;
 }
 
-int succeed(const Command& command, int result, const TreeInstance& tree) {
+int succeed(const CommandRow& command, int result, const TreeInstance& tree) {
   record_result(NumberText("%d", result));
   const bool stored = dump_settings(command);
   if (command.persists && was_change_lost(tree)) return fail(false);
@@ -95,12 +95,12 @@ int succeed(const Command& command, int result, const TreeInstance& tree) {
   return result;
 }
 
-const char* failure_message(const Command& command) {
+const char* failure_message(const CommandRow& command) {
   const bool for_all = command.failure_all != nullptr && (OPT_FLAG & kOptName) == 0;
   return for_all ? command.failure_all : command.failure;
 }
 
-int run(const Command& command) {
+int run(const CommandRow& command) {
   record_result("");
   if ((OPT_FLAG & command.required) != command.required) {
     LOG(1, "OPT_FLAG: %08x", OPT_FLAG);

@@ -77,15 +77,15 @@ void log_foreign(const TargetEntry* entry, const char* node) {
   LOG(0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun, entry->target_name);
 }
 
-struct Place {
+struct EntryPath {
   const TargetEntry* entry;
   const char* path;
 };
 
 // A disk keeps its name for as long as it is mounted.
 bool is_others_mount(const MountLine& mount, const void* what) {
-  const auto* place = static_cast<const Place*>(what);
-  return strcmp(mount.path, place->path) == 0 && disk_owner(place->entry, mount.source) == kDiskForeign;
+  const auto* wanted = static_cast<const EntryPath*>(what);
+  return strcmp(mount.path, wanted->path) == 0 && disk_owner(wanted->entry, mount.source) == kDiskForeign;
 }
 
 }  // namespace
@@ -124,9 +124,9 @@ bool is_foreign_disk(const TargetEntry* entry, const char* node) {
 
 bool is_foreign_mount(const TargetEntry* entry, const char* path) {
   char real[PATH_MAX];
-  const Place place = {entry, realpath(path, real) != nullptr ? real : path};
+  const EntryPath wanted = {entry, realpath(path, real) != nullptr ? real : path};
   MountLine mount;
-  if (find_mount(is_others_mount, &place, &mount) != Mounted::kYes) return false;
+  if (find_mount(is_others_mount, &wanted, &mount) != Mounted::kYes) return false;
   log_foreign(entry, mount.source);
   return true;
 }
