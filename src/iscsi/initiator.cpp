@@ -96,19 +96,19 @@ InitiatorName write_initiator_name() {
 }  // namespace
 
 InitiatorName start_initiator() {
-  run_command(kEndIscsidQuietlyCommand, kNote);
+  run_command(end_iscsid_quietly_command(), kNote);
   reload_modules();
   run_command(make_system_folder_command(kIscsidFolder));
   write_daemon_configuration();
   const InitiatorName name = write_initiator_name();
   drop_empty_records();
-  start_daemon(kStartIscsidCommand);
+  start_daemon(start_iscsid_command());
   return name;
 }
 
 bool stop_initiator() {
   LOG(1, "killall -SIGTERM iscsid ");
-  return run_command(kEndIscsidCommand) == 0;
+  return run_command(end_iscsid_command()) == 0;
 }
 
 bool unload_modules() {

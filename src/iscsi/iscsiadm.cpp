@@ -130,4 +130,8 @@ CommandText logout_command(const TargetEntry& entry) {
   return node_command(entry, shell_command("iscsiadm -m node -T \"%s\" --logout", entry.target_name));
 }
 
+CommandText logout_all_command() {
+  return CommandText("iscsiadm -m node -u");
+}
+
 }  // namespace remvol

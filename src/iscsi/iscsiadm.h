@@ -14,9 +14,6 @@
 
 namespace remvol {
 
-// Logs out of every session.
-inline constexpr char kLogoutAllCommand[] = "iscsiadm -m node -u";
-
 // Makes an interface record, and binds it to the network port `netif`.
 [[nodiscard]] CommandText new_iface_command(const char* iface);
 [[nodiscard]] CommandText bind_iface_command(const char* iface, const char* netif);
@@ -46,8 +43,9 @@ inline constexpr char kLogoutAllCommand[] = "iscsiadm -m node -u";
 [[nodiscard]] CommandText portal_logout_command(const TargetEntry& entry);
 [[nodiscard]] CommandText login_again_command(const TargetEntry& entry);
 
-// Logs out of every session to the target.
+// Logs out of every session to the target; of every session.
 [[nodiscard]] CommandText logout_command(const TargetEntry& entry);
+[[nodiscard]] CommandText logout_all_command();
 
 }  // namespace remvol
 

@@ -11,11 +11,11 @@ inline constexpr const char* kIscsidFolder = "/etc/iscsi";
 inline constexpr const char* kIscsidConf = "/etc/iscsi/iscsid.conf";
 
 // Starts it in the background.
-inline constexpr const char* kStartIscsidCommand = "iscsid -f >/dev/null 2>&1 &";
+[[nodiscard]] CommandText start_iscsid_command();
 
 // End it; the second form says nothing when it does not run.
-inline constexpr const char* kEndIscsidCommand = "killall -SIGTERM iscsid";
-inline constexpr const char* kEndIscsidQuietlyCommand = "killall -q -SIGTERM iscsid";
+[[nodiscard]] CommandText end_iscsid_command();
+[[nodiscard]] CommandText end_iscsid_quietly_command();
 
 // Writes the settings, whose lines end in the two characters "\n", into its configuration.
 [[nodiscard]] CommandText configure_iscsid_command(const char* settings);

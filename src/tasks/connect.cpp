@@ -86,7 +86,7 @@ int disconnect_all() {
   LOG(1, "update share folder status");
   reload_share_services();
   LOG(1, "finish share folder status");
-  return close_sessions(nullptr, kLogoutAllCommand);
+  return close_sessions(nullptr, logout_all_command());
 }
 
 int disconnect_target(const char* target_name) {

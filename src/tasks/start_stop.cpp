@@ -32,7 +32,7 @@ int task_deinit(int system_off) {
   const LogScope scope;
   LOG(2, system_off != 0 ? "system off" : "deinit start");
   Target_umount_all();
-  (void)close_sessions(nullptr, kLogoutAllCommand);
+  (void)close_sessions(nullptr, logout_all_command());
   bool succeeded = stop_initiator();
   LOG(2, "deinit end");
   if (system_off == 0) {
