@@ -40,12 +40,6 @@ int _target_chap_apply(TargetEntry* entry) {
   return kOk;
 }
 
-int delete_record(TargetEntry* entry) {
-  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
-  run_command(delete_node_command(*entry));
-  return kOk;
-}
-
 // Reads the output of a login until it says that a session to this node is already open.
 bool login_found_session(FILE* output) {
   char line[512];
@@ -94,16 +88,19 @@ int _target_connect_run(const TargetEntry& entry, const char* requested) {
 
 }  // namespace
 
-int Target_Config_Gen(TargetEntry* entry) {
-  const LogScope scope;
-  if (delete_record(entry) != kOk) return kFailed;
-  run_command(new_node_command(*entry));
-  return _target_chap_apply(entry);
+// A deletion that failed is found in a log by the one name, also that for a target that goes for good.
+int delete_node_record(TargetEntry* entry) {
+  const LogScope scope("Target_Config_Gen");
+  if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
+  run_command(delete_node_command(*entry));
+  return kOk;
 }
 
-int _target_record_delete(TargetEntry* entry) {
+int Target_Config_Gen(TargetEntry* entry) {
   const LogScope scope;
-  return delete_record(entry);
+  if (delete_node_record(entry) != kOk) return kFailed;
+  run_command(new_node_command(*entry));
+  return _target_chap_apply(entry);
 }
 
 int _target_login(TargetEntry* entry, const char* requested) {

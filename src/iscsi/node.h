@@ -10,9 +10,10 @@ namespace remvol {
 // or no interface could be chosen. Failed commands are logged and ignored.
 int Target_Config_Gen(TargetEntry* entry);
 
-// Deletes the target's node record for the entry's portal. Returns 0, also when the command failed (there may
-// be no record); -1 when the entry is null or no interface could be chosen.
-int _target_record_delete(TargetEntry* entry);
+// Deletes the target's node record for the entry's portal, and logs as the step of Target_Config_Gen() that
+// it is. Returns 0, also when the command failed (there may be no record); -1 when the entry is null or no
+// interface could be chosen.
+int delete_node_record(TargetEntry* entry);
 
 // Logs in. The message that the session is not there names `requested`, the target that the command is for:
 // none at start-up. Returns 0; 1 when the login was not confirmed or the command did not start; -1 when no

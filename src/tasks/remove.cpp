@@ -68,7 +68,7 @@ Result remove_target(TargetEntry* entry, int last_lun) {
   LunWalk luns(entry->db_idx, LunWalk::kAtUnreadable);
   while (luns.next(&lun)) reload_lun_share(&lun);
   Target_Disconnect(entry);
-  _target_record_delete(entry);
+  delete_node_record(entry);
   if (last_lun == kEveryLun) return delete_stored_slot(entry->db_idx, 0);
   return delete_slot_of_last_lun(entry->db_idx, last_lun);
 }

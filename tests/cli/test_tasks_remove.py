@@ -73,6 +73,7 @@ class TestTarget:
         done = box.remvol("--del", "-n", "iqn.t1")
         assert done.status == 0
         assert messages(done) == [f"system() of cmd '{line}' failed" for line in (LOGOUT, RECORD_DELETE)]
+        assert messages(done, "Target_Config_Gen") == [f"system() of cmd '{RECORD_DELETE}' failed"]
         assert settings(box) == {"/iscsi/initiator/count": "0"}
 
     def test_a_target_without_a_portal_has_no_record_to_delete(self, site, box):

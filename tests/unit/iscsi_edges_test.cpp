@@ -195,8 +195,8 @@ TEST_F(Iscsi, RecordOfNoEntry) {
   TargetEntry nowhere = entry("");
   EXPECT_EQ(Target_Config_Gen(nullptr), -1);
   EXPECT_EQ(Target_Config_Gen(&nowhere), -1);
-  EXPECT_EQ(_target_record_delete(nullptr), -1);
-  EXPECT_EQ(_target_record_delete(&nowhere), -1);
+  EXPECT_EQ(delete_node_record(nullptr), -1);
+  EXPECT_EQ(delete_node_record(&nowhere), -1);
   EXPECT_EQ(fakes::calls(), Texts{});
 }
 
@@ -204,7 +204,7 @@ TEST_F(Iscsi, RecordIsDeletedOnItsOwn) {
   TargetEntry known = entry();
   const std::string command = "iscsiadm -m node -I default -T iqn.t1 -p 10.0.0.1:3260 -o delete";
   fakes::on("system", command).returns(21 << 8);
-  EXPECT_EQ(messages([&] { EXPECT_EQ(_target_record_delete(&known), 0); }),
+  EXPECT_EQ(messages([&] { EXPECT_EQ(delete_node_record(&known), 0); }),
             "system() of cmd '" + command + "' failed\n");
   EXPECT_EQ(fakes::commands(), Texts{command});
 }
