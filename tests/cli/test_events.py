@@ -264,9 +264,9 @@ def test_a_recovery_that_the_next_loss_overtakes_is_left_out(connected):
     connected.state(1, "FAILED")
     connected.send(message(LOST, 1))
     connected.wait_runs(reopen("iqn.a"))
-    for state in ("LOGGED_IN", "FAILED", "LOGGED_IN", "FAILED"):
+    for state, event in 2 * [("LOGGED_IN", login_response(1)), ("FAILED", message(LOST, 1))]:
         connected.state(1, state)
-        connected.send(login_response(1) if state == "LOGGED_IN" else message(LOST, 1))
+        connected.send(event)
         connected.sync()
     connected.box.write("/go", "")
     connected.wait_runs(reopen("iqn.a"), reopen("iqn.a"))

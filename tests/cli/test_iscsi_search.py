@@ -223,8 +223,11 @@ def load(box, file):
     assert box.run(["ktreec", "-S", "/var/run/ktree_sock_vv", "-l", file], env={"LD_PRELOAD": None}).status == 0
 
 
-@pytest.mark.parametrize("kind", ["search", "search_lun"])
-def test_a_daemon_left_by_an_earlier_search_is_stopped_first(box, kind):
+KINDS = {"search": SEARCH, "search_lun": ("--search_lun", "-n", T1, "-c", "0", *SEARCH[1:])}
+
+
+@pytest.mark.parametrize("kind, words", KINDS.items(), ids=KINDS)
+def test_a_daemon_left_by_an_earlier_search_is_stopped_first(box, kind, words):
     private_tree(box, kind)
     socket = f"/var/run/ktree_sock_vv_{kind}"
     left = Tree(box, socket).start()
@@ -234,8 +237,7 @@ def test_a_daemon_left_by_an_earlier_search_is_stopped_first(box, kind):
     box.fake("iscsiadm", "-m session", exact=True, status=4)
     box.hook("sleep", "1", effect=f"while kill -0 {old}; do sleep 0.01; done", times=1, first=True)
     box.forget()
-    what = SEARCH if kind == "search" else ("--search_lun", "-n", T1, "-c", "0", *SEARCH[1:])
-    box.remvol(*what, "-o", "/tmp/out.xml")
+    box.remvol(*words, "-o", "/tmp/out.xml")
     stop = f"system kill -SIGTERM `cat {socket}_config.pid`"
     calls = [call for call in box.trace() if "winshare" not in call]
     assert calls[:4] == [stop, "sleep 1", *daemon_road(kind)[:2]]

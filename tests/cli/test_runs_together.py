@@ -238,13 +238,14 @@ class TestAdding:
         assert (site.lun("lun"), site.lun("share")) == ("0", "a")
         assert site.lun("lun", 2) is None
 
-    @pytest.mark.parametrize("command", ["^iscsiadm -m node .*-o new$", MOUNT])
-    def test_what_a_killed_run_stored_is_counted(self, site, box, command):
+    @pytest.mark.parametrize("command, sessions", [("^iscsiadm -m node .*-o new$", []), (MOUNT, ["iqn.t1"])],
+                             ids=["before the login", "at the mount"])
+    def test_what_a_killed_run_stored_is_counted(self, site, box, command, sessions):
         site.store("iqn.t0", luns=[("z", 0)])
         site.offer("iqn.t1", {0: "sdb"})
         site.disk("sdb")
-        if command == MOUNT:
-            site.log_in("iqn.t1")
+        for name in sessions:
+            site.log_in(name)
         box.hook("system", re.compile(command), through=True, effect="kill -KILL $PPID", times=1)
         assert box.remvol(*self.ADD).status == -9
         status(box)

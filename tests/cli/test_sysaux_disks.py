@@ -639,15 +639,18 @@ def test_a_change_that_the_kernel_refuses_is_no_success(loop):
     grown.grow(200 * MIB)
     with open(grown.file, "rb") as file:
         head = file.read(MIB)
-    for disk, name in ((grown, "expand"), (fresh, "create")):
+
+    def give_back_the_table():
+        grown.write(0, head)
+        assert call("partition_list", grown.node) == (1, f"{grown.name}p1")
+
+    for disk, name, prepare in ((grown, "expand", give_back_the_table), (fresh, "create", lambda: None)):
         known = disk.partitions()
         ioctls = calls_of(name, disk.node, disk.node, "ioctl")
         (when,) = (number for number, text in enumerate(ioctls, 1) if "BLKPG" in text)
         disk.forget()
         disk.wipe_ends()
-        if name == "expand":
-            disk.write(0, head)
-            assert call("partition_list", disk.node) == (1, f"{disk.name}p1")
+        prepare()
         assert disk.partitions() == known
         assert under_fault(name, disk.node, disk.node, "ioctl", "error=EBUSY", when) == (0, ["-1"])
         assert disk.partitions() == known

@@ -153,11 +153,14 @@ def test_two_luns_of_a_target(luns):
 # --- what is there already ---
 
 
-@pytest.mark.parametrize("kind", ["ext2", "ext3", "ext4", "xfs"])
-def test_a_partition_with_a_file_system_is_mounted_as_it_is(luns, kind):
+MAKE = {**{kind: ["mke2fs", "-q", "-F", "-t", kind] for kind in ("ext2", "ext3", "ext4")}, "xfs": ["mkfs.xfs", "-q"]}
+
+
+@pytest.mark.parametrize("kind, make", MAKE.items(), ids=MAKE)
+def test_a_partition_with_a_file_system_is_mounted_as_it_is(luns, kind, make):
     lun = luns(400 * MIB)
     partition(lun)
-    run("mkfs.xfs", "-q", lun.disk.part) if kind == "xfs" else make_ext(lun.disk, lun.disk.part, kind)
+    run(*make, lun.disk.part)
     fill(lun.disk.part)
     known = lun.disk.partitions()
     assert lun.mount().result == 0

@@ -234,18 +234,23 @@ def test_a_missing_node_is_made(disk):
     assert disk.run(["dd", "if=/dev/sdb", "of=/dev/null", "bs=4096", "count=1"], env={"PATH": "/usr/bin"}).status == 0
 
 
-@pytest.mark.parametrize("kind", ["file", "link to a file"])
-def test_something_else_in_place_of_the_node_is_replaced(disk, kind):
+# What is put at a path, and where the files are that are to stay.
+IN_PLACE_OF_A_NODE = {
+    "file": (lambda path: path.write_text("no node"), []),
+    "link to a file": (lambda path: path.symlink_to("/tmp/kept"), ["/tmp/kept"]),
+}
+
+
+@pytest.mark.parametrize("put, kept", IN_PLACE_OF_A_NODE.values(), ids=IN_PLACE_OF_A_NODE)
+def test_something_else_in_place_of_the_node_is_replaced(disk, put, kept):
     known = numbers(disk, "/dev/sdb")
+    for file in kept:
+        disk.write(file, "a file")
     disk.path("/dev/sdb").unlink()
-    if kind == "file":
-        disk.write("/dev/sdb", "no node")
-    else:
-        disk.write("/tmp/kept", "a file")
-        disk.path("/dev/sdb").symlink_to("/tmp/kept")
+    put(disk.path("/dev/sdb"))
     assert drive(disk, "node", "sdb").result == 0
     assert numbers(disk, "/dev/sdb") == known
-    assert kind == "file" or disk.path("/tmp/kept").read_text() == "a file"
+    assert [disk.path(file).read_text() for file in kept] == ["a file"] * len(kept)
 
 
 def test_a_node_with_other_numbers_is_left(disk):

@@ -41,6 +41,18 @@ def volume(volume, box):
 
 GOES = "rm /sys/block/sdb/device"  # shell text: the disk is gone, and its name another one's any moment
 
+# How the box is told what happens to the disk, and the commands on it that have begun by then.
+DURING_A_FORMAT = {
+    "it moves away before it": (
+        lambda box: box.hook("semop", re.compile("^-1"), through=True, effect=turns_into_another()), []),
+    "it moves away at fuser": (lambda box: box.fake("fuser", effect=turns_into_another(), first=True), ["fuser"]),
+    "it moves away at dd": (lambda box: box.fake("dd", effect=turns_into_another(), first=True), ["fuser", "dd"]),
+    "it goes at fuser": (lambda box: box.fake("fuser", effect=GOES, first=True), ["fuser"]),
+    "it goes at dd": (lambda box: box.fake("dd", effect=GOES, first=True), ["fuser", "dd"]),
+}
+
+PARTITIONS = "mkdir /sys/block/sdb/sdb1; : >/sys/block/sdb/sdb1/partition"  # shell text: another run makes a partition
+
 
 def ran(box, *words):
     return [line for line in box.shell() if any(word in line for word in words)]
@@ -109,15 +121,10 @@ class TestNamesThatMoved:
         drive(box, "mount", 1, 1, 0, 0)
         assert not box.trace(call)
 
-    @pytest.mark.parametrize("step, reached, change", [
-        ("semop", [], turns_into_another()), ("fuser", ["fuser"], turns_into_another()), ("dd", ["fuser", "dd"], turns_into_another()),
-        ("fuser", ["fuser"], GOES), ("dd", ["fuser", "dd"], GOES)])
-    def test_a_disk_that_moves_away_during_a_format(self, volume, box, step, reached, change):
+    @pytest.mark.parametrize("happens, reached", DURING_A_FORMAT.values(), ids=DURING_A_FORMAT)
+    def test_a_disk_that_moves_away_during_a_format(self, volume, box, happens, reached):
         box.session_disk("sdb", "iqn.t1")
-        if step == "semop":
-            box.hook("semop", re.compile("^-1"), through=True, effect=change)
-        else:
-            box.fake(step, effect=change, first=True)
+        happens(box)
         done = drive(box, "format", 1, 1, "/dev/sdb1")
         assert done.result == -1
         assert f"/dev/sdb1 {LEFT_ALONE}" in messages(done)
@@ -280,23 +287,22 @@ class TestOtherRuns:
         assert formatted(lun.box)
         assert lun.mounted()
 
-    def other_partitions(self, volume, box, effect_at):
+    def mount_empty_disk(self, box, while_listed=None, while_created=None):
         box.write("/sys/block/sdb/size", "1\n")
-        box.hook("sys_get_partition_list", "/dev/sdb", ret=0, out="", times=1, first=True,
-                 effect="mkdir /sys/block/sdb/sdb1; : >/sys/block/sdb/sdb1/partition" if effect_at == "list" else None)
-        box.hook("sys_create_1_partition", "/dev/sdb", ret=1,
-                 effect="mkdir /sys/block/sdb/sdb1; : >/sys/block/sdb/sdb1/partition" if effect_at == "create" else None)
+        box.hook("sys_get_partition_list", "/dev/sdb", ret=0, out="", times=1, first=True, effect=while_listed)
+        box.hook("sys_create_1_partition", "/dev/sdb", ret=1, effect=while_created)
         return drive(box, "mount", 1, 1, 0, 0)
 
-    @pytest.mark.parametrize("effect_at, creates", [("list", 0), ("create", 1)])
-    def test_a_disk_that_was_partitioned_meanwhile(self, volume, box, effect_at, creates):
-        assert self.other_partitions(volume, box, effect_at).result == 0
+    @pytest.mark.parametrize("effect, creates", [({"while_listed": PARTITIONS}, 0), ({"while_created": PARTITIONS}, 1)],
+                             ids=["list-0", "create-1"])
+    def test_a_disk_that_was_partitioned_meanwhile(self, volume, box, effect, creates):
+        assert self.mount_empty_disk(box, **effect).result == 0
         assert len(box.trace("sys_create_1_partition")) == creates
         assert not formatted(box), "what the other run's partition carries is kept"
         assert volume.lun("volume_state") == "0"
 
     def test_a_partition_that_nobody_made_stays_a_failure(self, volume, box):
-        assert self.other_partitions(volume, box, "never").result == -2
+        assert self.mount_empty_disk(box).result == -2
 
 
 class TestUdev:

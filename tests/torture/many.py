@@ -34,16 +34,9 @@ def plan(seed, runs=RUNS):
     return Plan(seed, sorted(events, key=lambda event: event[0]))
 
 
-def options(command, t, l, share):
-    if command in ("add",):
-        return {"t": t, "l": l, "share": share}
-    if command in ("del_lun", "format"):
-        return {"t": t, "l": l}
-    if command in ("connect", "del", "modify"):
-        return {"t": t}
-    if command == "check_share_name":
-        return {"share": share}
-    return {}
+# What a command is given; the others take nothing.
+TAKES = {"add": ("t", "l", "share"), "del_lun": ("t", "l"), "format": ("t", "l"), "connect": ("t",), "del": ("t",), "modify": ("t",),
+         "check_share_name": ("share",)}
 
 
 def start_run(world, dice, command, t, l, share):
@@ -54,7 +47,8 @@ def start_run(world, dice, command, t, l, share):
         return world.begin("oiscsi_evt_recover", t=t)
     if command == "disconnect":
         return world.begin(command, **({"t": t} if dice.random() < 0.85 else {}))
-    return world.begin(command, **options(command, t, l, share))
+    given = {"t": t, "l": l, "share": share}
+    return world.begin(command, **{name: given[name] for name in TAKES.get(command, ())})
 
 
 def degrade_one(world, t):
