@@ -30,7 +30,8 @@ def round_trips(short):
             pin(theirs, servers)
             names, *rows = output(program("bench_tree"), SOCKET, REDIS, own, servers, 11 if short else 1001).splitlines()
             costs = dict(zip(names.split("\t"), zip(*([float(value) for value in row.split("\t") if value] for row in rows))))
-            for call, echo, peer in (("ktreec_set", "echo of a set", "redis SET"), ("ktreec_get_wb", "echo of a get", "redis GET")):
+            for call, echo, peer in (("ktreec_set", "echo of a set", "redis SET"), ("ktreec_get_wb", "echo of a get", "redis GET"),
+                                     ("ktreec_get_wb in vain", "echo of a get in vain", "redis GET in vain")):
                 group = f"One client, {where}"
                 yield ratio(group, f"{call} / a bare echo", costs[call], costs[echo], most)
                 yield ratio(group, f"{call} / {peer}", costs[call], costs[peer], 0.95)

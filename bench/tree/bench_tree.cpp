@@ -35,6 +35,8 @@ namespace {
 
 constexpr char kPath[] = "/iscsi/initiator/id:3/status";
 constexpr char kValue[] = "Connected, the volume is mounted and in use";
+constexpr char kNextValue[] = "Connected, the volume is mounted but unused";
+constexpr char kMissingPath[] = "/iscsi/initiator/id:3/missing";
 constexpr int kRounds = 1001;
 constexpr int kCalls = 32;
 
@@ -137,12 +139,18 @@ class Redis {
   void get(const char* key, const char* value) {
     std::array<char, 256> reply;
     snprintf(reply.data(), reply.size(), "$%zu\r\n%s\r\n", strlen(value), value);
-    const int size =
-        snprintf(buffer_.data(), buffer_.size(), "*2\r\n$3\r\nGET\r\n$%zu\r\n%s\r\n", strlen(key), key);
-    call(size, reply.data());
+    ask(key, reply.data());
   }
 
+  void get_in_vain(const char* key) { ask(key, "$-1\r\n"); }
+
  private:
+  void ask(const char* key, const char* reply) {
+    const int size =
+        snprintf(buffer_.data(), buffer_.size(), "*2\r\n$3\r\nGET\r\n$%zu\r\n%s\r\n", strlen(key), key);
+    call(size, reply);
+  }
+
   void call(int size, const char* reply) {
     write_all(fd_, buffer_.data(), static_cast<size_t>(size));
     read_all(fd_, buffer_.data(), strlen(reply));
@@ -176,8 +184,17 @@ void fill(const char* ktree, Redis& redis) {
   });
 }
 
+// Always another value: to set the same again needs no daemon.
 void set_tree(const char* socket) {
-  if (ktreec_set(socket, 0, kPath, kValue) != 0) fail("ktreec_set");
+  static bool next = false;
+  next = !next;
+  if (ktreec_set(socket, 0, kPath, next ? kNextValue : kValue) != 0) fail("ktreec_set");
+}
+
+// The daemon is asked for what is not there.
+void get_in_vain(const char* socket) {
+  char buffer[256];
+  if (ktreec_get_wb(socket, 0, kMissingPath, buffer, sizeof buffer) >= 0) fail("ktreec_get_wb in vain");
 }
 
 void get_tree(const char* socket) {
@@ -206,13 +223,19 @@ int main(int argc, char** argv) {
   Echo get_echo(sizeof(ktree::RequestHeader) + strlen(kPath) + sizeof(uint32_t),
                 sizeof(ktree::ReplyHeader) + strlen(kValue), echo_cpus);
 
-  std::array<Kind, 6> kinds = {{
+  Echo vain_echo(sizeof(ktree::RequestHeader) + strlen(kMissingPath) + sizeof(uint32_t),
+                 sizeof(ktree::ReplyHeader), echo_cpus);
+
+  std::array<Kind, 9> kinds = {{
       {"echo of a set", [&] { set_echo.call(); }, {}},
       {"ktreec_set", [&] { set_tree(ktree); }, {}},
       {"redis SET", [&] { redis.set(kPath, kValue); }, {}},
       {"echo of a get", [&] { get_echo.call(); }, {}},
       {"ktreec_get_wb", [&] { get_tree(ktree); }, {}},
       {"redis GET", [&] { redis.get(kPath, kValue); }, {}},
+      {"echo of a get in vain", [&] { vain_echo.call(); }, {}},
+      {"ktreec_get_wb in vain", [&] { get_in_vain(ktree); }, {}},
+      {"redis GET in vain", [&] { redis.get_in_vain(kMissingPath); }, {}},
   }};
   for (int i = 0; i < rounds; i++) {
     for (Kind& kind : kinds) kind.measure(kCalls);

@@ -7,7 +7,9 @@
  *
  * In every call, `socket` NULL means "/var/run/ktree_sock" and `flags` is 0. The library keeps one
  * connection per socket for the life of the process, connects again when the daemon has been restarted,
- * and gives up on a daemon that does not answer within 5 seconds. Calls may come from several threads. */
+ * and gives up on a daemon that does not answer within 5 seconds. What the daemon shows in memory, short
+ * values, is read there from the second get on, as long as the daemon lives; a set that would change nothing
+ * is not sent. Calls may come from several threads. */
 #ifndef KTREEC_H
 #define KTREEC_H
 

@@ -54,6 +54,10 @@ struct ConnectionList {
 // Sends as much of `bytes` as goes at once. Returns the bytes sent, -1 when the client is gone.
 [[nodiscard]] int64_t send_some(const Connection& connection, std::string_view bytes);
 
+// The same, and passes `descriptor` with the first byte.
+[[nodiscard]] int64_t send_with_descriptor(const Connection& connection, std::string_view bytes,
+                                           int descriptor);
+
 }  // namespace ktree
 
 #endif

@@ -18,7 +18,7 @@ bool parse_request(std::string_view bytes, Request& request) {
   memcpy(&header, bytes.data(), sizeof header);
   bytes.remove_prefix(sizeof header);
   if (header.operation < static_cast<uint8_t>(Operation::kGet) ||
-      header.operation > static_cast<uint8_t>(Operation::kList) || header.zero != 0 ||
+      header.operation > static_cast<uint8_t>(Operation::kMirror) || header.zero != 0 ||
       header.path_length > bytes.size()) {
     return false;
   }

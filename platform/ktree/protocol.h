@@ -21,6 +21,7 @@ enum class Operation : uint8_t {
   kLoad = 5,  // no path, no value; a memory file is passed, which holds the settings file
   kList =
       6,  // no value; a memory file is passed, which the daemon fills with the listing; the path may be "/"
+  kMirror = 7,  // no path, no value; the descriptor of the mirror comes with the reply
 };
 
 enum class ReplyStatus : uint8_t {

@@ -263,12 +263,15 @@ void Server::answer(Connection& connection, std::string_view bytes) {
   header.status = static_cast<uint8_t>(answer.status);
   memcpy(reply_.data(), &header, sizeof header);
   answer.body.copy(reply_.data() + sizeof header, answer.body.size());
-  send_reply(connection, {reply_.data(), sizeof header + answer.body.size()});
+  send_reply(connection, {reply_.data(), sizeof header + answer.body.size()}, answer.descriptor);
 }
 
-void Server::send_reply(Connection& connection, std::string_view reply) {
-  const int64_t n = send_some(connection, reply);
-  if (n < 0) {
+// A descriptor goes with the first byte or not at all; only a client that reads no replies has no room for
+// one.
+void Server::send_reply(Connection& connection, std::string_view reply, int descriptor) {
+  const int64_t n =
+      descriptor < 0 ? send_some(connection, reply) : send_with_descriptor(connection, reply, descriptor);
+  if (n < 0 || (n == 0 && descriptor >= 0)) {
     drop(connection);
     return;
   }

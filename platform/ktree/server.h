@@ -49,7 +49,7 @@ class Server {
   [[nodiscard]] bool take_request(Connection& connection, std::string_view bytes);
   [[nodiscard]] bool keep_part(Connection& connection, std::string_view bytes, size_t size);
   void answer(Connection& connection, std::string_view bytes);
-  void send_reply(Connection& connection, std::string_view reply);
+  void send_reply(Connection& connection, std::string_view reply, int descriptor);
   void keep_reply(Connection& connection, std::string_view rest);
   void continue_reply(Connection& connection);
   void settle(Connection& connection);

@@ -52,6 +52,8 @@ Service::Reply Service::carry_out(const Request& request) {
       return load(request);
     case Operation::kList:
       return list(request);
+    case Operation::kMirror:
+      return mirror(request);
   }
   return {ReplyStatus::kRefused, {}};
 }
@@ -75,13 +77,17 @@ Service::Reply Service::set(const Request& request) {
   if (!carried || !parse_path(request.path, path) || !tree_.set(path, request.value)) {
     return {ReplyStatus::kRefused, {}};
   }
+  mirror_.set(request.path, request.value);
   return {ReplyStatus::kDone, {}};
 }
 
 Service::Reply Service::del(const Request& request) {
   Path path;
   if (!request.value.empty() || !parse_path(request.path, path)) return {ReplyStatus::kRefused, {}};
-  return {tree_.remove(path) ? ReplyStatus::kDone : ReplyStatus::kMissing, {}};
+  mirror_.before_removal(path);
+  const bool removed = tree_.remove(path);
+  mirror_.after_removal(path);
+  return {removed ? ReplyStatus::kDone : ReplyStatus::kMissing, {}};
 }
 
 Service::Reply Service::dump(const Request& request) const {
@@ -100,6 +106,7 @@ Service::Reply Service::load_document(int fd) {
     return {ReplyStatus::kDamaged, std::string_view(error_).substr(0, kMaxErrorBytes)};
   }
   tree_.swap(loaded);
+  mirror_.fill();
   return {ReplyStatus::kDone, {}};
 }
 
@@ -111,6 +118,12 @@ Service::Reply Service::list(const Request& request) const {
   if (node == nullptr) return {ReplyStatus::kMissing, {}};
   const bool written = is_new_document(request.document) && write_listing(*node, path, request.document);
   return {written ? ReplyStatus::kDone : ReplyStatus::kFailed, {}};
+}
+
+Service::Reply Service::mirror(const Request& request) {
+  if (!request.path.empty() || !request.value.empty()) return {ReplyStatus::kRefused, {}};
+  const int descriptor = mirror_.descriptor();
+  return {descriptor < 0 ? ReplyStatus::kFailed : ReplyStatus::kDone, {}, descriptor};
 }
 
 }  // namespace ktree

@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "ktree/mirror_writer.h"
 #include "ktree/protocol.h"
 #include "ktree/tree.h"
 
@@ -15,6 +16,7 @@ class Service {
   struct Reply {
     ReplyStatus status;
     std::string_view body;
+    int descriptor = -1;  // to be passed with the reply; it stays the service's
   };
   // When memory is short the answer is ReplyStatus::kFailed, and the tree is as it was.
   [[nodiscard]] Reply handle(const Request& request);
@@ -31,8 +33,10 @@ class Service {
   Reply dump(const Request& request) const;
   Reply load(const Request& request);
   Reply list(const Request& request) const;
+  Reply mirror(const Request& request);
 
   Tree tree_;
+  MirrorWriter mirror_{tree_};
   std::string error_;
 };
 

@@ -8,16 +8,17 @@
 namespace ktree {
 namespace {
 
-auto group_position(const Node& parent, std::string_view name) {
-  return std::lower_bound(parent.groups.begin(), parent.groups.end(), name,
+auto group_position(Groups& groups, std::string_view name) {
+  return std::lower_bound(groups.begin(), groups.end(), name,
                           [](const std::unique_ptr<Group>& group, std::string_view wanted) {
                             return std::string_view(group->name) < wanted;
                           });
 }
 
 Group* find_group(const Node& parent, std::string_view name) {
-  auto position = group_position(parent, name);
-  return position != parent.groups.end() && (*position)->name == name ? position->get() : nullptr;
+  if (parent.groups == nullptr) return nullptr;
+  auto position = group_position(*parent.groups, name);
+  return position != parent.groups->end() && (*position)->name == name ? position->get() : nullptr;
 }
 
 size_t members_of(const Node& parent, std::string_view name) {
@@ -39,7 +40,7 @@ void unlink_sibling(Node& parent, Node& node) {
 void leave_group(Node& parent, Node& node, unsigned number) {
   Group* group = node.group;
   group->members.erase(group->members.begin() + (number - 1));
-  if (group->members.empty()) parent.groups.erase(group_position(parent, group->name));
+  if (group->members.empty()) parent.groups->erase(group_position(*parent.groups, group->name));
 }
 
 }  // namespace
@@ -154,12 +155,13 @@ void Tree::swap(Tree& other) noexcept {
 // Whatever cannot be had is asked for before anything is changed.
 Node* Tree::make_child(Node& parent, std::string_view name) {
   auto made = std::make_unique<Node>();
-  auto position = group_position(parent, name);
-  if (position == parent.groups.end() || (*position)->name != name) {
+  if (parent.groups == nullptr) parent.groups = std::make_unique<Groups>();
+  auto position = group_position(*parent.groups, name);
+  if (position == parent.groups->end() || (*position)->name != name) {
     auto group = std::make_unique<Group>();
     group->name = name;
     group->members.push_back(made.get());
-    position = parent.groups.insert(position, std::move(group));
+    position = parent.groups->insert(position, std::move(group));
   } else {
     (*position)->members.push_back(made.get());
   }

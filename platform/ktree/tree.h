@@ -25,6 +25,9 @@ struct Group {
   unsigned visited = 0;  // used by for_each_child alone
 };
 
+// Sorted by name.
+using Groups = std::vector<std::unique_ptr<Group>>;
+
 // A node. It may hold a value, children, both, or (when it was made to fill up to a number) nothing.
 struct Node {
   Group* group = nullptr;  // null in the root
@@ -32,8 +35,8 @@ struct Node {
   Node* next = nullptr;
   Node* first_child = nullptr;
   Node* last_child = nullptr;
-  std::vector<std::unique_ptr<Group>> groups;  // sorted by name
-  std::unique_ptr<char[]> text;                // null: no value
+  std::unique_ptr<Groups> groups;  // null in most nodes, which have never had children
+  std::unique_ptr<char[]> text;    // null: no value
   uint32_t size = 0;
 
   [[nodiscard]] bool has_value() const { return text != nullptr; }
@@ -43,7 +46,8 @@ struct Node {
 // Calls visit(child, number) for the children of `node` in the order in which they were made.
 template <typename Visit>
 void for_each_child(const Node& node, Visit visit) {
-  for (const auto& group : node.groups) group->visited = 0;
+  if (node.groups == nullptr) return;
+  for (const auto& group : *node.groups) group->visited = 0;
   for (const Node* child = node.first_child; child != nullptr; child = child->next) {
     visit(*child, ++child->group->visited);
   }

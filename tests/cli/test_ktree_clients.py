@@ -157,7 +157,7 @@ def test_what_is_no_request_ends_the_connection_at_once(daemon, bad):
     struct.pack("=IBBH", 66563, SET, 0, 2),  # longer than the longest request
     struct.pack("=IBBH", 0xFFFFFFFC, SET, 0, 2),  # wraps round with the length's own four bytes
     struct.pack("=IBBH", 4, 0, 0, 0),  # no operation
-    struct.pack("=IBBH", 4, 7, 0, 0),
+    struct.pack("=IBBH", 4, 8, 0, 0),
     struct.pack("=IBBH", 4, GET, 1, 0),  # not zero
     struct.pack("=IBBH", 6, GET, 0, 3) + b"/a",  # the path is longer than the request
     get_frame(b"/a") + get_frame(b"/a"),  # the next request before the reply

@@ -1,4 +1,7 @@
 """The client library: what a program that uses it meets when its daemon is slow, gone, new or hostile."""
+import array
+import fcntl
+import os
 import signal
 import socket
 import struct
@@ -9,7 +12,7 @@ import time
 
 import pytest
 
-from harness.ktree_daemon import BUILD, DEL, GET, KTREEC, Daemon, until
+from harness.ktree_daemon import BUILD, DEL, GET, KTREEC, MIRROR, Daemon, until
 
 
 class Caller:
@@ -215,6 +218,157 @@ def test_no_descriptor_goes_to_a_child_program(daemon, caller):
 
 def test_threads_share_it(daemon, caller):
     assert caller("threads /t 200") == "1600"
+
+
+# Values that are read without asking
+
+
+def read_often(caller, path="/warm"):
+    """From now on the caller reads what the daemon shows in its mirror."""
+    caller(f"set {path} x")
+    for _ in range(8):
+        assert caller(f"get {path} 10") == "1 x"
+
+
+def test_a_program_that_reads_often_needs_no_answer(daemon, caller):
+    caller("set /id:2/share Photos")
+    read_often(caller)
+    daemon.process.send_signal(signal.SIGSTOP)
+    start = time.monotonic()
+    assert caller("get /id:2/share 100") == "6 Photos"
+    assert caller("get /id:2/share 4") == "3 Pho"
+    assert caller("set /id:2/share Photos") == "0"  # changes nothing
+    assert time.monotonic() - start < 4
+    daemon.process.send_signal(signal.SIGCONT)
+    assert caller("set /id:2/share Music") == "0"
+    assert caller("get /id:2/share 100") == "5 Music"
+
+
+def test_what_another_has_written_is_read_at_once(daemon, caller):
+    other = Caller(daemon.socket)
+    read_often(caller)
+    read_often(other)
+    for i in range(300):
+        value = f"{i}" * (i % 50 + 1)  # also too long for its place, and too long for the mirror
+        assert other(f"set /a {value}") == "0"
+        assert caller("get /a 1000") == f"{len(value)} {value}"
+        assert other("get /a 1000") == f"{len(value)} {value}"
+    other.close()
+
+
+def test_a_deletion_and_a_load_are_seen_at_once(daemon, caller):
+    read_often(caller)
+    for i in (1, 2, 3):
+        caller(f"set /id:{i}/share {i}")
+    caller(f"dump {daemon.folder}/vv.xml")
+    daemon.run("-d", "/id:2")
+    assert [caller(f"get /id:{i}/share 10") for i in (1, 2, 3)] == ["1 1", "1 3", "-1 "]
+    daemon.run("-l", daemon.folder / "vv.xml")
+    assert [caller(f"get /id:{i}/share 10") for i in (1, 2, 3)] == ["1 1", "1 2", "1 3"]
+
+
+def test_every_spelling_of_a_path_is_read(daemon, caller):
+    read_often(caller)
+    caller("set /id/b:1/c x")
+    for path in ("/id/b/c", "/id:1/b/c", "/id:1/b:1/c:1"):
+        assert caller(f"get {path} 10") == "1 x"
+    assert caller("get /id:01/b/c 10") == "-1 "
+
+
+@pytest.mark.parametrize("number", [signal.SIGTERM, signal.SIGKILL])
+def test_the_values_of_a_daemon_that_is_gone_are_gone(daemon, caller, number):
+    for value in ("first", "second"):
+        caller(f"set /a {value}")
+        read_often(caller)
+        assert caller("get /a 10") == f"{len(value)} {value}"
+        daemon.stop(number)
+        assert caller("get /a 10") == "-1 "
+        daemon.start()
+        assert caller("get /a 10") == "-1 "
+
+
+def test_a_child_reads_as_its_parent_did(daemon, caller):
+    read_often(caller)
+    caller("set /a x")
+    for i in range(20):
+        caller(f"set /a {i}")
+        caller.send("fork /a")
+        assert caller.answer() == caller.answer() == f"{len(str(i))} {i}"
+
+
+def test_threads_read_together(daemon, caller):
+    read_often(caller)
+    assert caller("threads /t 500") == "4000"
+
+
+def answers_gets(with_mirror):
+    """Serves a daemon whose every value is "value"; with_mirror(connection) answers the request for the mirror."""
+    requests = []
+
+    def serve(connection, _):
+        while request := read_request(connection):
+            requests.append(request[4])
+            if request[4] == MIRROR:
+                if not with_mirror(connection):
+                    connection.shutdown(socket.SHUT_RDWR)
+                    return
+            else:
+                connection.sendall(reply(0, b"value"))
+
+    return serve, requests
+
+
+def passing(make):
+    def answer(connection):
+        descriptor = make()
+        connection.sendmsg([reply(0)], [(socket.SOL_SOCKET, socket.SCM_RIGHTS, array.array("i", [descriptor]))])
+        os.close(descriptor)
+        return True
+    return answer
+
+
+def refused(connection):
+    connection.sendall(reply(4))
+    return True
+
+
+def promised(connection):
+    connection.sendall(reply(0))
+    return True
+
+
+def memory(size, *seals):
+    def make():
+        descriptor = os.memfd_create("mirror", os.MFD_ALLOW_SEALING)
+        os.ftruncate(descriptor, size)
+        for seal in seals:
+            fcntl.fcntl(descriptor, fcntl.F_ADD_SEALS, seal)
+        return descriptor
+    return make
+
+
+OTHER_MIRRORS = {
+    "an older daemon's": lambda _: False,
+    "none": refused,
+    "a promise": promised,
+    "a file": passing(lambda: os.open("/etc/passwd", os.O_RDONLY)),
+    "a socket": passing(lambda: socket.socket(socket.AF_UNIX).detach()),
+    "memory that may shrink": passing(memory(64 << 20)),
+    "memory that is too small": passing(memory(1 << 20, fcntl.F_SEAL_SHRINK)),
+    "memory of nothing": passing(memory(64 << 20, fcntl.F_SEAL_SHRINK)),
+}
+
+
+@pytest.mark.parametrize("answer", OTHER_MIRRORS.values(), ids=OTHER_MIRRORS)
+def test_without_a_mirror_values_are_asked_for(listen, answer):
+    serve, requests = answers_gets(answer)
+    caller = Caller(listen(serve).path)
+    for _ in range(40):
+        assert caller("get /a 100") == "5 value"
+    assert requests.count(GET) == 40
+    assert 1 <= requests.count(MIRROR) <= 3  # an older daemon ends the connection, and may have been interrupted
+    assert "memfd" not in caller("sh ls -l /proc/$PPID/fd")
+    caller.close()
 
 
 # A daemon that was restarted

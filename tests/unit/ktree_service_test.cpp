@@ -75,7 +75,7 @@ TEST(Frame, ThatDoesNotHoldTogetherIsNone) {
   EXPECT_FALSE(parse_request("", request));
   EXPECT_FALSE(parse_request("abcdefgh", request));
   EXPECT_FALSE(parse_request(frame(4, 0, 0, 0, ""), request));
-  EXPECT_FALSE(parse_request(frame(4, 7, 0, 0, ""), request));
+  EXPECT_FALSE(parse_request(frame(4, 8, 0, 0, ""), request));
   EXPECT_FALSE(parse_request(frame(4, 255, 0, 0, ""), request));
   EXPECT_FALSE(parse_request(frame(4, 1, 1, 0, ""), request));
   EXPECT_FALSE(parse_request(frame(6, 1, 0, 3, "/a"), request));

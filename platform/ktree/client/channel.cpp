@@ -12,6 +12,10 @@
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
+#include <utility>
+
+#include "ktree/client/mirror_map.h"
+#include "ktree/descriptors.h"
 
 #include "tree_layout.h"
 
@@ -23,8 +27,10 @@ constexpr int kTries = 3;
 struct Channel {
   Channel* next;
   pthread_mutex_t lock;
-  int fd;       // -1: not connected
-  pid_t owner;  // the process that connected: a forked child must not speak on its parent's connection
+  int fd;                      // -1: not connected
+  const mirror::Word* mirror;  // of the daemon at the other end, or null
+  bool has_read;               // on this connection
+  bool without_mirror;         // this daemon has none
   sockaddr_un address;
 };
 
@@ -55,18 +61,28 @@ enum class TryOutcome {
   kTimedOut,  // or the daemon speaks another language
 };
 
-// A thread of the parent may have held a lock at the fork; in the child nobody would ever release it.
-void unlock_in_child() {
+void disconnect(Channel& channel) {
+  if (channel.fd >= 0) close(channel.fd);
+  channel.fd = -1;
+  unmap_mirror(channel.mirror);
+  channel.mirror = nullptr;
+  channel.has_read = false;
+}
+
+// In a forked child: it must not speak on its parent's connections, and a lock that a thread of the parent
+// held at the fork would never be released there.
+void start_anew_in_child() {
   pthread_mutex_init(&channels_lock, nullptr);
   for (Channel* channel = channels; channel != nullptr; channel = channel->next) {
     pthread_mutex_init(&channel->lock, nullptr);
+    disconnect(*channel);
   }
 }
 
 Channel* make_channel(const char* socket) {
   auto* channel = static_cast<Channel*>(calloc(1, sizeof(Channel)));
   if (channel == nullptr) return nullptr;
-  if (channels == nullptr) pthread_atfork(nullptr, nullptr, unlock_in_child);
+  if (channels == nullptr) pthread_atfork(nullptr, nullptr, start_anew_in_child);
   pthread_mutex_init(&channel->lock, nullptr);
   channel->fd = -1;
   channel->address.sun_family = AF_UNIX;
@@ -86,11 +102,6 @@ Channel* find_channel(const char* socket) {
   if (channel == nullptr) channel = make_channel(socket);
   pthread_mutex_unlock(&channels_lock);
   return channel;
-}
-
-void disconnect(Channel& channel) {
-  if (channel.fd >= 0) close(channel.fd);
-  channel.fd = -1;
 }
 
 // Waits until `fd` is ready for `events`. Returns false when the time is over.
@@ -135,7 +146,6 @@ bool connect_channel(Channel& channel, Deadline& deadline) {
   }
   deadline.tight = true;
   channel.fd = fd;
-  channel.owner = getpid();
   return true;
 }
 
@@ -160,15 +170,6 @@ iovec readable(const void* data, size_t size) {
   return {const_cast<void*>(data), size};
 }
 
-void pass_descriptor(msghdr& message, cmsghdr* control, int fd) {
-  message.msg_control = control;
-  message.msg_controllen = CMSG_SPACE(sizeof fd);
-  control->cmsg_level = SOL_SOCKET;
-  control->cmsg_type = SCM_RIGHTS;
-  control->cmsg_len = CMSG_LEN(sizeof fd);
-  memcpy(CMSG_DATA(control), &fd, sizeof fd);
-}
-
 TryOutcome send_request(int fd, const Call& call, Deadline& deadline) {
   RequestHeader header = {};
   header.length = static_cast<uint32_t>(sizeof header - kLengthBytes + call.path.size() + call.value.size());
@@ -178,11 +179,11 @@ TryOutcome send_request(int fd, const Call& call, Deadline& deadline) {
                          readable(call.value.data(), call.value.size())},
                         3,
                         sizeof header + call.path.size() + call.value.size()};
-  alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int))] = {};
+  DescriptorRoom room = {};
   msghdr message = {};
   message.msg_iov = parts.part;
   message.msg_iovlen = parts.count;
-  if (call.document >= 0) pass_descriptor(message, reinterpret_cast<cmsghdr*>(control), call.document);
+  if (call.document >= 0) pass_descriptor(message, room, call.document);
   while (parts.left > 0) {
     const ssize_t n = sendmsg(fd, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
     if (n > 0) {
@@ -207,6 +208,7 @@ TryOutcome lost_connection(ssize_t received) {
 
 TryOutcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& deadline) {
   MessageParts parts = {{{&header, sizeof header}, {call.body, call.room}, {}}, 2, sizeof header + call.room};
+  DescriptorRoom room;
   msghdr message = {};
   message.msg_iov = parts.part;
   message.msg_iovlen = parts.count;
@@ -214,9 +216,14 @@ TryOutcome receive_reply(int fd, Call& call, ReplyHeader& header, Deadline& dead
   size_t wanted = sizeof header;
   while (have < wanted) {
     if (deadline.tight && !wait_for(fd, POLLIN, deadline)) return TryOutcome::kTimedOut;
-    const ssize_t n = recvmsg(fd, &message, deadline.tight ? MSG_DONTWAIT : 0);
+    if (call.operation == Operation::kMirror) {
+      message.msg_control = room.bytes;
+      message.msg_controllen = sizeof room.bytes;
+    }
+    const ssize_t n = recvmsg(fd, &message, MSG_CMSG_CLOEXEC | (deadline.tight ? MSG_DONTWAIT : 0));
     deadline.tight = true;
     if (n > 0) {
+      take_descriptor(message, call.came);
       parts.advance(static_cast<size_t>(n));
       have += static_cast<size_t>(n);
       if (have >= sizeof header) wanted = kLengthBytes + size_t{header.length};
@@ -259,7 +266,6 @@ CallResult result_of(uint8_t status) {
 
 CallResult request_on(Channel& channel, Call& call) {
   Deadline deadline = {Deadline::now() + kRequestMilliseconds, false};
-  if (channel.fd >= 0 && channel.owner != getpid()) disconnect(channel);
   for (int i = 0; i < kTries; i++) {
     if (channel.fd < 0 && !connect_channel(channel, deadline)) return CallResult::kUnreachable;
     ReplyHeader header = {};
@@ -271,6 +277,45 @@ CallResult request_on(Channel& channel, Call& call) {
   return CallResult::kUnreachable;
 }
 
+// Asks for the mirror at the second read of a connection: the next ones need no request then.
+void open_mirror(Channel& channel) {
+  const bool is_first = !std::exchange(channel.has_read, true);
+  if (channel.fd < 0 || channel.without_mirror || is_first) return;
+  Call call = {Operation::kMirror, {}, {}, -1, nullptr, 0, 0};
+  if (request_on(channel, call) == CallResult::kDone) channel.mirror = map_mirror(call.came);
+  channel.without_mirror = channel.mirror == nullptr;
+  if (call.came >= 0) close(call.came);
+}
+
+// The other end is closed when the daemon is gone. What was read before that was so.
+bool is_alive(const Channel& channel) {
+  char byte = 0;
+  return recv(channel.fd, &byte, 1, MSG_PEEK | MSG_DONTWAIT) < 0 && errno == EAGAIN;
+}
+
+// A value that is in the mirror is read there. Returns false when the daemon is to be asked.
+bool get_from_mirror(Channel& channel, Call& call) {
+  if (channel.mirror == nullptr) open_mirror(channel);
+  if (channel.mirror == nullptr) return false;
+  const int size = mirror::read(channel.mirror, call.path, call.body, call.room);
+  if (size < 0 || !is_alive(channel)) return false;
+  call.size = static_cast<size_t>(size);
+  return true;
+}
+
+// To set the value that is there already changes nothing that anybody could see.
+bool is_in_mirror(const Channel& channel, const Call& call) {
+  char value[mirror::kMaxValueBytes];
+  if (channel.mirror == nullptr || call.value.size() > sizeof value) return false;
+  const int size = mirror::read(channel.mirror, call.path, value, sizeof value);
+  return size >= 0 && call.value == std::string_view(value, static_cast<size_t>(size)) && is_alive(channel);
+}
+
+bool done_by_mirror(Channel& channel, Call& call) {
+  return (call.operation == Operation::kGet && get_from_mirror(channel, call)) ||
+         (call.operation == Operation::kSet && is_in_mirror(channel, call));
+}
+
 }  // namespace
 
 CallResult request(const char* socket, Call& call) {
@@ -279,7 +324,7 @@ CallResult request(const char* socket, Call& call) {
   if (channel == nullptr) return CallResult::kUnreachable;
   if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) return CallResult::kRefused;
   pthread_mutex_lock(&channel->lock);
-  const CallResult result = request_on(*channel, call);
+  const CallResult result = done_by_mirror(*channel, call) ? CallResult::kDone : request_on(*channel, call);
   pthread_mutex_unlock(&channel->lock);
   return result;
 }

@@ -29,10 +29,11 @@ struct Call {
   Operation operation;
   std::string_view path;
   std::string_view value;
-  int document;  // the memory file to pass, or -1
-  char* body;    // where the body of the reply goes
-  size_t room;   // the most bytes of it
-  size_t size;   // set to the bytes that came
+  int document;   // the memory file to pass, or -1
+  char* body;     // where the body of the reply goes
+  size_t room;    // the most bytes of it
+  size_t size;    // set to the bytes that came
+  int came = -1;  // set to the descriptor that came, the caller's then
 };
 
 // Sends the request to the daemon on `socket` (null: remvol::kGeneralSocket) and waits for the reply, on the

@@ -14,7 +14,7 @@ from .under import SLOWER, keep, under
 BUILD = pathlib.Path(os.environ.get("REMVOL_BUILD", pathlib.Path(__file__).parents[3] / "build/release")).resolve()
 KTREE = BUILD / "bin/ktree"
 KTREEC = BUILD / "bin/ktreec"
-GET, SET, DEL, DUMP, LOAD, LIST = range(1, 7)
+GET, SET, DEL, DUMP, LOAD, LIST, MIRROR = range(1, 8)
 
 # strace and the leak checker of the address sanitizer do not go together.
 TRACED = {**os.environ, "ASAN_OPTIONS": "detect_leaks=0"}
