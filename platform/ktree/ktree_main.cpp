@@ -41,14 +41,14 @@ constexpr char kUsage[] =
     "  -h, --help     print this text and exit\n"
     "  -V, --version  print the version and exit\n";
 
-struct Options {
+struct DaemonOptions {
   std::string name;
   std::string socket;
   std::vector<std::string> settings;
 };
 
 // Returns -1 when the daemon is to run, otherwise the exit status.
-int parse_options(int argc, char** argv, Options& options) {
+int parse_options(int argc, char** argv, DaemonOptions& options) {
   const option long_options[] = {
       {"help", no_argument, nullptr, 'h'}, {"version", no_argument, nullptr, 'V'}, {nullptr, 0, nullptr, 0}};
   int letter = 0;
@@ -131,7 +131,7 @@ void tell_ready() {
   if (fd >= 0) close(fd);
 }
 
-int run_daemon(const Options& options) {
+int run_daemon(const DaemonOptions& options) {
   // What the starting process left open is not the daemon's: a lock file would stay locked for as long as it
   // lives. Nor is the folder that it was started in: a volume would stay busy.
   ktree::fill_standard_descriptors();
@@ -164,7 +164,7 @@ int run_daemon(const Options& options) {
 
 int main(int argc, char** argv) {
   try {
-    Options options;
+    DaemonOptions options;
     const int status = parse_options(argc, argv, options);
     return status >= 0 ? status : run_daemon(options);
   } catch (const std::bad_alloc&) {
