@@ -65,26 +65,27 @@ UNFORMATTED = [
 ]
 
 
-@pytest.mark.parametrize("right", ["1", "0"])
-@pytest.mark.parametrize("format_state,volume_state,writable,read_only", UNMOUNTED)
-def test_a_recognised_file_system_that_is_not_mounted(
-    box, format_state, volume_state, writable, read_only, right
-):
+def by_right(rows):
+    """A row of two texts becomes one of each access right."""
+    return [(*states, right, text) for *states, writable, read_only in rows for right, text in (("1", writable), ("0", read_only))]
+
+
+@pytest.mark.parametrize("format_state,volume_state,right,text", by_right(UNMOUNTED))
+def test_a_recognised_file_system_that_is_not_mounted(box, format_state, volume_state, right, text):
     store(box, format_state=format_state, volume_state=volume_state, vol_access_right=right)
     sessions(box)
     box.hook("sys_get_fs_type", "/dev/sdb1", out="ext4", ret=0)
-    assert status(box) == (writable if right == "1" else read_only)
+    assert status(box) == text
     assert box.tree.get(f"{LUN}/size") == "0/0"
     assert box.tree.get(f"{LUN}/fs_type") == "ext4"
 
 
-@pytest.mark.parametrize("right", ["1", "0"])
-@pytest.mark.parametrize("format_state,volume_state,writable,read_only", UNFORMATTED)
-def test_no_file_system_is_recognised(box, format_state, volume_state, writable, read_only, right):
+@pytest.mark.parametrize("format_state,volume_state,right,text", by_right(UNFORMATTED))
+def test_no_file_system_is_recognised(box, format_state, volume_state, right, text):
     store(box, format_state=format_state, volume_state=volume_state, vol_access_right=right)
     sessions(box)
     box.hook("sys_get_fs_type", "/dev/sdb1", ret=1)
-    assert status(box) == (writable if right == "1" else read_only)
+    assert status(box) == text
     assert box.tree.get(f"{LUN}/size") == "0/0"
     assert box.tree.get(f"{LUN}/fs_type") is None
 
