@@ -14,7 +14,8 @@ sys.path.insert(0, str(pathlib.Path(__file__).parent))
 
 import page  # noqa: E402
 import road  # noqa: E402
-from figures import Figure, Growth, number  # noqa: E402
+import waits  # noqa: E402
+from figures import Figure, Growth, Table, number  # noqa: E402
 
 
 def measurements():
@@ -27,6 +28,11 @@ def measurements():
 def show(found):
     if isinstance(found, Growth):
         print(f"  {found.title}: {', '.join(f'{number(size)}: {number(cost)}' for size, cost, *_ in found.points)} {found.cost}")
+        return
+    if isinstance(found, Table):
+        print(f"  {found.title}:")
+        for row in [found.head, *found.rows]:
+            print(f"    {' | '.join(row)}")
         return
     limit = f"  ({found.limit}{'' if found.holds else ': MISSED'})" if found.limit else ""
     print(f"  {found.what}: {number(found.value)} {found.unit}".rstrip() + limit)
@@ -56,7 +62,7 @@ def measure(options):
         subprocess.run(["chrt", "--fifo", "50", "unshare", "--mount", "--pid", "--ipc", "--fork", "--kill-child", "--mount-proc",
                         sys.executable, "-B", pathlib.Path(__file__).parent, *words], check=True)
         found = json.loads(pathlib.Path(results.name).read_text())
-    kinds = {"Figure": Figure, "Growth": Growth}
+    kinds = {kind.__name__: kind for kind in (Figure, Growth, Table)}
     return [kinds[one.pop("kind")](**one) for one in found]
 
 
@@ -68,17 +74,19 @@ def main():
     options = parser.parse_args()
     if options.inside:
         return measure_inside(options)
-    found = measure(options)
-    for measurement in (road.mount, road.road):
+    found = []
+    for measurement in (road.mount, road.road, waits.waits):
         if options.short or options.only not in measurement.__name__:
             continue
         print(measurement.__name__, flush=True)
         for one in measurement():
             show(one)
             found.append(one)
+    found += measure(options)
     figures = [one for one in found if isinstance(one, Figure)]
     if not options.short and not options.only:
-        page.write(figures, [one for one in found if isinstance(one, Growth)], f"{datetime.date.today():%F}")
+        growths, tables = ([one for one in found if isinstance(one, kind)] for kind in (Growth, Table))
+        page.write(figures, growths, tables, f"{datetime.date.today():%F}")
     missed = [one for one in figures if not one.holds]
     if options.short:
         print(f"bench: {len(figures)} passed, 0 failed (a short run measures and judges nothing)")

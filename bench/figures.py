@@ -37,6 +37,15 @@ class Growth:
     peer: str = ""
 
 
+@dataclasses.dataclass
+class Table:
+    """A section of the page: a text, and rows of cells."""
+    title: str
+    head: list
+    rows: list
+    text: str = ""
+
+
 def number(value):
     if value >= 1000:
         return f"{value:,.0f}"

@@ -27,7 +27,7 @@ def machine(date):
     return HEAD.format(processors=os.cpu_count(), model=model, kernel=os.uname().release, redis=redis.split()[0], date=date)
 
 
-def table(figures):
+def figure_tables(figures):
     text = ""
     for group, lines in itertools.groupby(sorted(figures, key=lambda figure: figure.group), key=lambda figure: figure.group):
         text += f"\n## {group}\n\n| what | measured | limit | |\n|---|---|---|---|\n"
@@ -35,6 +35,15 @@ def table(figures):
             held = "" if line.holds else " **missed**"
             text += f"| {line.what} | {number(line.value)} {line.unit}".rstrip() + f"{held} | {line.limit} | {line.detail} |\n"
     return text
+
+
+def row(cells):
+    return f"| {' | '.join(cells)} |\n"
+
+
+def section(table):
+    text = f"\n## {table.title}\n" + (f"\n{table.text}\n" if table.text else "")
+    return text + (f"\n{row(table.head)}{'|---' * len(table.head)}|\n{''.join(map(row, table.rows))}" if table.rows else "")
 
 
 def picture(growth):
@@ -59,10 +68,10 @@ plot {", ".join(curves)}
     subprocess.run(["gnuplot", "-"], input=script, text=True, check=True)
 
 
-def write(figures, growths, date):
+def write(figures, growths, tables, date):
     PICTURES.mkdir(exist_ok=True)
-    text = machine(date) + table(figures) + "\n## How cost grows\n"
+    text = machine(date) + figure_tables(figures) + "\n## How cost grows\n"
     for growth in growths:
         picture(growth)
         text += f"\n![{growth.title}](benchmarks/{growth.name}.svg)\n"
-    PAGE.write_text(text)
+    PAGE.write_text(text + "".join(map(section, tables)))
