@@ -28,7 +28,8 @@ const Row* find_row(const std::vector<Row>& rows, Is is) {
 Look::Look() : Look(platform::TreeListing()) {}
 
 Look::Look(const platform::TreeListing& tree)
-    : status_(vvstat::read_status(tree)), rows_(vvstat::assess(status_, vvstat::read_facts(status_))) {}
+    : status_(vvstat::read_status(tree)),
+      rows_(vvstat::assess(status_, vvstat::read_facts(status_, vvstat::Extent::kHealth))) {}
 
 const Row* Look::share(const std::string& name) const {
   return find_row(rows_, [&name](const Row& row) { return row.volume->share == name; });

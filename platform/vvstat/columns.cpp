@@ -52,6 +52,7 @@ struct Column {
   Kind kind;
   bool right;
   std::string (*text)(const Row& row, const Layout& layout);
+  Extent extent = Extent::kHealth;  // of the facts that tell it
 };
 
 constexpr Kind kText = Kind::kText, kNumber = Kind::kNumber, kFlag = Kind::kFlag;
@@ -109,7 +110,7 @@ constexpr Column kColumns[] = {
        return row.volume != nullptr ? row.volume->mount_point : std::string();
      }},
     {"OPTIONS", "the options that it is mounted with", 12, kText, false,
-     [](const Row& row, const Layout&) { return row.options; }},
+     [](const Row& row, const Layout&) { return row.options; }, Extent::kAll},
     {"DEVICE", "name of its disk", 0, kText, false,
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->device : std::string();
@@ -126,7 +127,7 @@ constexpr Column kColumns[] = {
     {"SESSION", "the kernel's word for the session's state", 0, kText, false,
      [](const Row& row, const Layout&) { return row.session; }},
     {"ADDRESS", "the address that the session is connected with", 12, kText, false,
-     [](const Row& row, const Layout&) { return row.address; }},
+     [](const Row& row, const Layout&) { return row.address; }, Extent::kAll},
     {"TREE-STATUS", "the volume's status as the configuration tree has it", 14, kText, false,
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->status : std::string();
@@ -212,6 +213,15 @@ size_t natural_width(const std::vector<Content>& contents) {
 std::vector<size_t> columns_of(const Layout& layout) {
   if (!layout.columns.empty()) return layout.columns;
   return first_columns(layout.form == Form::kJson ? std::size(kColumns) : kUsual);
+}
+
+std::vector<size_t> columns_of_block(const Layout& layout) {
+  return layout.columns.empty() ? first_columns(std::size(kColumns)) : layout.columns;
+}
+
+Extent extent_of(const std::vector<size_t>& columns) {
+  const auto needs_all = [](size_t column) { return kColumns[column].extent == Extent::kAll; };
+  return std::any_of(columns.begin(), columns.end(), needs_all) ? Extent::kAll : Extent::kHealth;
 }
 
 // What the report is made of. The target is one of the usual columns of a table where there is room for it.
@@ -338,6 +348,14 @@ std::string describe_columns() {
   return text;
 }
 
+Extent extent_of_report(const Layout& layout) {
+  return extent_of(columns_of(layout));
+}
+
+Extent extent_of_block(const Layout& layout) {
+  return extent_of(columns_of_block(layout));
+}
+
 std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {
   Layout layout = asked;
   layout.bytes = layout.bytes || layout.form == Form::kJson;
@@ -354,10 +372,8 @@ std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {
 }
 
 std::string block(const Row& row, const Layout& layout) {
-  const std::vector<size_t> columns =
-      layout.columns.empty() ? first_columns(std::size(kColumns)) : layout.columns;
   std::string text;
-  for (const size_t number : columns) {
+  for (const size_t number : columns_of_block(layout)) {
     const std::string value = cell(kColumns[number], row, layout);
     if (!layout.headings) {
       text += value + "\n";

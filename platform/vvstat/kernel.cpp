@@ -20,22 +20,37 @@ namespace {
 using platform::Link;
 using platform::Session;
 
+// The table of mounts, read when it is first asked for: the kernel writes all of it anew for every reader.
+class MountTable {
+ public:
+  const Mount* on(std::string_view point) {
+    if (!read_) mounts_ = read_mounts();
+    read_ = true;
+    return mount_on(mounts_, point);
+  }
+
+ private:
+  std::vector<Mount> mounts_;
+  bool read_ = false;
+};
+
 // statx(2) tells the root of a mount since Linux 5.8, from the inode at hand, and with it when that was made:
 // the file system's own beginning. An XFS that has shut itself down fails even that; it is mounted all the
 // same.
-bool find_mount(const std::string& path, const std::vector<Mount>& mounts, VolumeFacts& facts,
-                dev_t& device) {
+bool find_mount(const std::string& path, MountTable& mounts, VolumeFacts& facts, dev_t& device) {
   struct statx info {};
   constexpr int kFlags = AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC | AT_SYMLINK_NOFOLLOW;
-  const bool answers = statx(AT_FDCWD, path.c_str(), kFlags, STATX_BTIME, &info) == 0;
-  facts.shut_down = !answers && errno == EIO;
-  const Mount* mount = mount_on(mounts, path);
-  if (mount != nullptr) facts.options = mount->options;
-  if (facts.shut_down && mount != nullptr) device = mount->device;
-  if (!answers) return facts.shut_down && mount != nullptr;
-  device = makedev(info.stx_dev_major, info.stx_dev_minor);
-  if ((info.stx_mask & STATX_BTIME) != 0) facts.made = static_cast<time_t>(info.stx_btime.tv_sec);
-  return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
+  if (statx(AT_FDCWD, path.c_str(), kFlags, STATX_BTIME, &info) == 0) {
+    device = makedev(info.stx_dev_major, info.stx_dev_minor);
+    if ((info.stx_mask & STATX_BTIME) != 0) facts.made = static_cast<time_t>(info.stx_btime.tv_sec);
+    return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
+  }
+  if (errno != EIO) return false;
+  const Mount* mount = mounts.on(path);
+  if (mount == nullptr) return false;
+  facts.shut_down = true;
+  device = mount->device;
+  return true;
 }
 
 // The kernel's name of a disk or partition, such as "sdb1"; empty when there is none, or no more.
@@ -75,11 +90,16 @@ bool refuses_writes(const std::string& mount_point, const std::string& disk) {
   return !file.ok() && (errno == EROFS || errno == EIO);
 }
 
-VolumeFacts facts_of(const Volume& volume, bool answering, const std::vector<Mount>& mounts) {
+std::string options_of(const std::string& mount_point, MountTable& mounts) {
+  const Mount* mount = mounts.on(mount_point);
+  return mount != nullptr ? mount->options : std::string();
+}
+
+VolumeFacts facts_of(const Volume& volume, bool answering, Extent extent, MountTable& mounts) {
   VolumeFacts facts;
   dev_t device{};
   struct statvfs space {};
-  if (!may_be_mounted(mounts, volume.mount_point) || !find_mount(volume.mount_point, mounts, facts, device) ||
+  if (volume.mount_point.empty() || !find_mount(volume.mount_point, mounts, facts, device) ||
       statvfs(volume.mount_point.c_str(), &space) != 0) {
     return {};
   }
@@ -91,6 +111,7 @@ VolumeFacts facts_of(const Volume& volume, bool answering, const std::vector<Mou
   facts.disk_read_only = facts.read_only && is_read_only_disk(volume.device);
   facts.size = static_cast<unsigned long long>(space.f_blocks) * space.f_frsize;
   facts.used = static_cast<unsigned long long>(space.f_blocks - space.f_bfree) * space.f_frsize;
+  if (extent == Extent::kAll) facts.options = options_of(volume.mount_point, mounts);
   return facts;
 }
 
@@ -104,20 +125,22 @@ const Session* session_of(const Target& target, const std::vector<Session>& sess
 
 }  // namespace
 
-std::vector<TargetFacts> read_facts(const Status& status) {
+std::vector<TargetFacts> read_facts(const Status& status, Extent extent) {
   const std::vector<Session> sessions = platform::read_sessions();
-  const std::vector<Mount> mounts = read_mounts();
+  MountTable mounts;
   std::vector<TargetFacts> all;
   for (const Target& target : status.targets) {
     TargetFacts facts;
     const Session* session = session_of(target, sessions);
     if (session != nullptr) {
       facts.session = session->state;
-      facts.address = platform::address_of(*session);
+      if (extent == Extent::kAll) facts.address = platform::address_of(*session);
     }
     const bool answering = session != nullptr && session->link == Link::kUp;
-    for (const Volume& volume : target.volumes) facts.volumes.push_back(facts_of(volume, answering, mounts));
-    all.push_back(facts);
+    for (const Volume& volume : target.volumes) {
+      facts.volumes.push_back(facts_of(volume, answering, extent, mounts));
+    }
+    all.push_back(std::move(facts));
   }
   return all;
 }

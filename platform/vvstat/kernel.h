@@ -11,6 +11,12 @@
 
 namespace vvstat {
 
+// How much is to be known.
+enum class Extent {
+  kHealth,
+  kAll,  // also what only a long report shows
+};
+
 struct VolumeFacts {
   bool mounted = false;         // something is mounted on its mount point
   bool disk_lost = false;       // its disk is gone, though a disk may be there anew
@@ -20,21 +26,22 @@ struct VolumeFacts {
   unsigned long long size = 0;
   bool shut_down = false;  // its file system refuses everything
   time_t made = 0;         // its file system was; 0: it is not mounted, or does not tell
-  std::string options{};   // of the mount
+  std::string options{};   // of the mount; of Extent::kAll
 };
 
 struct TargetFacts {
-  std::string session;               // its state: LOGGED_IN, FAILED, FREE; empty without a session
-  std::string address;               // the portal that it is connected with, without its port
+  std::string session;  // its state: LOGGED_IN, FAILED, FREE; empty without a session
+  std::string address;  // the portal that it is connected with, without its port; of Extent::kAll
   std::vector<VolumeFacts> volumes;  // in the order of the tree
 };
 
-// Reads /sys/class/iscsi_session and /proc/self/mountinfo, and of what is mounted statx(2), statvfs(3), the
-// disk's /sys/class/block/NAME/ro and the errors that an ext4 has counted; none of it waits for a disk. One
-// with errors, whose target answers, is asked for a file without a name, which leaves nothing behind: only
-// that tells whether it refuses writes. The facts are in the order of status.targets; what cannot be read
-// counts as not there. Of several sessions of one target the one that is logged in counts.
-std::vector<TargetFacts> read_facts(const Status& status);
+// Reads /sys/class/iscsi_session, and of what is mounted statx(2), statvfs(3), the disk's
+// /sys/class/block/NAME/ro and the errors that an ext4 has counted; none of it waits for a disk. One with
+// errors, whose target answers, is asked for a file without a name, which leaves nothing behind: only that
+// tells whether it refuses writes. For all there is to know, and where a file system has shut itself down,
+// also /proc/self/mountinfo. The facts are in the order of status.targets; what cannot be read counts as not
+// there. Of several sessions of one target the one that is logged in counts.
+std::vector<TargetFacts> read_facts(const Status& status, Extent extent);
 
 }  // namespace vvstat
 

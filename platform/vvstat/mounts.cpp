@@ -5,7 +5,7 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdio>
+#include <charconv>
 
 #include "common/file_text.h"
 
@@ -25,6 +25,7 @@ bool is_octal(char digit) {
 
 // Blanks, newlines and backslashes are "\040" there.
 std::string unescaped(std::string_view word) {
+  if (word.find('\\') == std::string_view::npos) return std::string(word);
   std::string text;
   while (!word.empty()) {
     const bool escaped =
@@ -55,16 +56,26 @@ std::string joined(std::string_view mount, std::string_view file_system) {
   return all;
 }
 
+// "98:0".
+bool read_device(std::string_view text, dev_t& device) {
+  const std::string_view first = take_word(text, ':');
+  unsigned major = 0, minor = 0;
+  if (std::from_chars(first.begin(), first.end(), major).ec != std::errc() ||
+      std::from_chars(text.begin(), text.end(), minor).ec != std::errc()) {
+    return false;
+  }
+  device = makedev(major, minor);
+  return true;
+}
+
 // "36 35 98:0 /mnt1 /mnt2 rw,noatime master:1 - ext3 /dev/root rw,errors=continue": proc_pid_mountinfo(5).
 bool read_mount(std::string_view line, Mount& mount) {
   const size_t separator = line.find(" - ");
   if (separator == std::string_view::npos) return false;
   std::string_view first = line.substr(0, separator), second = line.substr(separator + 3);
   for (int word = 0; word < 2; word++) take_word(first, ' ');
-  unsigned major = 0, minor = 0;
-  if (sscanf(std::string(take_word(first, ' ')).c_str(), "%u:%u", &major, &minor) != 2) return false;
+  if (!read_device(take_word(first, ' '), mount.device)) return false;
   take_word(first, ' ');
-  mount.device = makedev(major, minor);
   mount.point = unescaped(take_word(first, ' '));
   for (int word = 0; word < 2; word++) take_word(second, ' ');
   mount.options = joined(take_word(first, ' '), second);
@@ -88,15 +99,6 @@ std::vector<Mount> read_mounts() {
   std::vector<Mount> mounts = mounts_of(platform::content_of(file));
   close(file);
   return mounts;
-}
-
-bool may_be_mounted(const std::vector<Mount>& mounts, std::string_view path) {
-  if (path.empty()) return false;
-  const std::string_view name = path.substr(std::min(path.rfind('/'), path.size()));
-  // What has no name of its own at its end has to be looked up.
-  if (mounts.empty() || !name.starts_with('/') || name == "/" || name == "/." || name == "/..") return true;
-  return std::any_of(mounts.begin(), mounts.end(),
-                     [name](const Mount& mount) { return mount.point.ends_with(name); });
 }
 
 const Mount* mount_on(const std::vector<Mount>& mounts, std::string_view point) {

@@ -22,10 +22,6 @@ std::vector<Mount> mounts_of(std::string_view text);
 // Those of this process; none when they cannot be read.
 std::vector<Mount> read_mounts();
 
-// False when nothing is mounted on `path`, as far as the table tells: no mount has its last name. Names
-// before that may be symbolic links.
-bool may_be_mounted(const std::vector<Mount>& mounts, std::string_view path);
-
 // What is mounted on `point`: the last one, which hides the others. Null when nothing is.
 const Mount* mount_on(const std::vector<Mount>& mounts, std::string_view point);
 

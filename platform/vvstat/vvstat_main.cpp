@@ -35,10 +35,10 @@ struct Snapshot {
   std::vector<Row> rows;
 };
 
-Snapshot look() {
+Snapshot look(Extent extent) {
   Snapshot look;
   look.status = read_status(platform::TreeListing());
-  look.rows = assess(look.status, read_facts(look.status));
+  look.rows = assess(look.status, read_facts(look.status, extent));
   recall(read_history(), look.rows);
   return look;
 }
@@ -96,7 +96,7 @@ size_t width_of_output() {
 }
 
 int show_once(const Options& options) {
-  const Snapshot seen = look();
+  const Snapshot seen = look(extent_of_report(options.layout));
   if (!seen.status.reachable) {
     fputs(why_unreachable(), stderr);
     return kUnreachable;
@@ -109,14 +109,15 @@ int show_once(const Options& options) {
 
 // For a collector of metrics the absence of the tree is news as well.
 int show_metrics() {
-  const Snapshot seen = look();
+  const Snapshot seen = look(Extent::kHealth);
   put(metrics(seen.status.reachable, seen.rows, time(nullptr)));
   return finish(exit_status(seen));
 }
 
 // Everything of the volume of that share, or of all volumes of that target.
 int show_one(const Options& options) {
-  const Snapshot seen = look();
+  const bool is_block = options.layout.form == Form::kTable;
+  const Snapshot seen = look(is_block ? extent_of_block(options.layout) : extent_of_report(options.layout));
   if (!seen.status.reachable) {
     fputs(why_unreachable(), stderr);
     return kUnreachable;
@@ -132,7 +133,7 @@ int show_one(const Options& options) {
     return kFailed;
   }
   const std::vector<Row> shown = options.ailing_only ? ailing_among(rows) : rows;
-  if (options.layout.form != Form::kTable) {
+  if (!is_block) {
     put(volume_report(shown, options.layout));
   } else {
     for (const Row& row : shown) {
@@ -147,7 +148,7 @@ int show_again(Options options) {
   Snapshot last;
   watch([&options, &last](size_t width) {
     if (width != 0) options.layout.width = width;
-    last = look();
+    last = look(extent_of_report(options.layout));
     return page_of(last, options);
   });
   return finish(exit_status(last));

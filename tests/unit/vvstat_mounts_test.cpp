@@ -33,23 +33,6 @@ TEST(Mounts, TheLastOneOnAPlaceCounts) {
   EXPECT_EQ(mount_on(mounts, "/mnt/VV"), nullptr);
 }
 
-TEST(Mounts, WhereNothingCanBeMountedIsKnownByTheLastName) {
-  const std::vector<Mount> mounts = mounts_of(kTable);
-  EXPECT_TRUE(may_be_mounted(mounts, "/mnt/VV/Photos"));
-  EXPECT_TRUE(may_be_mounted(mounts, "/a/symbolic/link/Photos"));
-  EXPECT_TRUE(may_be_mounted(mounts, "/mnt/VV/Gr\303\274\303\237e aus K\303\266ln\\"));
-  for (const char* path : {"", "/mnt/VV/Backup", "/mnt/VV/hotos", "/mnt/VV/Photo", "/mnt/VV/Photos2"}) {
-    EXPECT_FALSE(may_be_mounted(mounts, path)) << path;
-  }
-}
-
-TEST(Mounts, WhatTheTableDoesNotTellIsToBeLookedUp) {
-  for (const char* path : {"/", "/mnt/VV/Backup/", "/mnt/VV/.", "/mnt/VV/..", "Backup"}) {
-    EXPECT_TRUE(may_be_mounted(mounts_of(kTable), path)) << path;
-  }
-  EXPECT_TRUE(may_be_mounted({}, "/mnt/VV/Backup"));
-}
-
 TEST(Mounts, ALineThatIsNoneIsLeftOut) {
   for (const char* text : {"", "\n", "a", " - ", "1 2 3 4 5 6 7 8 9", "1 2 x:1 / /a rw - t d rw",
                            "1 2 8:1 / - t d rw", "1 2 8:1"}) {
