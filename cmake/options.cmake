@@ -23,8 +23,7 @@ set(CMAKE_VISIBILITY_INLINES_HIDDEN ON)
 file(RELATIVE_PATH bin_to_lib "/${CMAKE_INSTALL_BINDIR}" "/${CMAKE_INSTALL_LIBDIR}")
 set(CMAKE_INSTALL_RPATH "$ORIGIN/${bin_to_lib}")
 
-# Libraries need no other of this project. A search path of theirs would only be walked in vain for every one of the
-# system's that they load.
+# For what needs no library of this project: a search path would only be walked in vain for every one of the system's.
 function(without_search_path)
   set_target_properties(${ARGV} PROPERTIES SKIP_BUILD_RPATH ON INSTALL_RPATH "")
 endfunction()
