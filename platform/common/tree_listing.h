@@ -35,13 +35,15 @@ class TreeListing {
   // the value's until the next call. A line that is none is left out.
   template <typename Take>
   void for_each(Take take) const {
-    std::string plain;
+    const bool is_plain = text_.find('\\') == std::string_view::npos;
+    std::string room;
     for (std::string_view rest = text_; !rest.empty();) {
       const std::string_view line = rest.substr(0, rest.find('\n'));
       rest.remove_prefix(std::min(line.size() + 1, rest.size()));
       const size_t equals = line.find('=');
-      if (equals != std::string_view::npos)
-        take(line.substr(0, equals), unescaped(line.substr(equals + 1), plain));
+      if (equals == std::string_view::npos) continue;
+      const std::string_view value = line.substr(equals + 1);
+      take(line.substr(0, equals), is_plain ? value : unescaped(value, room));
     }
   }
 

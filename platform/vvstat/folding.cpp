@@ -21,9 +21,12 @@ class Lines {
   size_t room() const { return width_ - std::min(width_, column_); }
   size_t longest() const { return width_ - indents_.further; }
 
-  void put(std::string_view text) {
+  void put(std::string_view text) { put(text, platform::cells(text)); }
+
+  // The same where its cells are known.
+  void put(std::string_view text, size_t cells) {
     text_ += text;
-    column_ += platform::cells(text);
+    column_ += cells;
     empty_ = false;
   }
 
@@ -81,10 +84,12 @@ size_t cells_of_word(std::string_view command) {
   return platform::cells(command.substr(0, at));
 }
 
+constexpr size_t kLongestEnd = 3;  // cells
+
 // What has to stand behind an atom at the end of a line: " \" between words; within a word "\", before which
 // a quotation mark closes the word.
 size_t cells_of_end(std::string_view rest, bool is_quoted) {
-  if (is_quoted) return rest == "'" ? 1 : 3;
+  if (is_quoted) return rest == "'" ? 1 : kLongestEnd;
   return rest.empty() ? 0 : 2;
 }
 
@@ -110,9 +115,9 @@ std::string folded(std::string_view text, Indents indents, size_t width) {
     if (!lines.empty() && cells + blank > lines.room()) {
       lines.next_line();
     } else if (blank != 0) {
-      lines.put(" ");
+      lines.put(" ", 1);
     }
-    cells > lines.room() ? put_broken(word, lines) : lines.put(word);
+    cells > lines.room() ? put_broken(word, lines) : lines.put(word, cells);
     text.remove_prefix(std::min(word.size() + 1, text.size()));
   }
   return lines.ended();
@@ -120,6 +125,12 @@ std::string folded(std::string_view text, Indents indents, size_t width) {
 
 std::string folded_command(std::string_view command, Indents indents, size_t width) {
   Lines lines(indents, width);
+  // Where the longest end of a line has room behind all of it, there is none to be looked for.
+  const size_t cells = platform::cells(command);
+  if (cells + kLongestEnd <= lines.room()) {
+    lines.put(command, cells);
+    return lines.ended();
+  }
   bool is_quoted = false;
   while (!command.empty()) {
     const std::string_view atom = command.substr(0, size_of_atom(command, is_quoted));

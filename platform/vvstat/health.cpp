@@ -128,6 +128,11 @@ Row row_of(const Target& target, const TargetFacts& facts, const Volume* volume)
           is_wanted(target), {}};
   if (row.wanted) row.problem = problem_of_target(target, volume, facts);
   if (!row.healthy()) row.status = row.problem.status;
+  return row;
+}
+
+Row row_without_volume(const Target& target, const TargetFacts& facts) {
+  Row row = row_of(target, facts, nullptr);
   row.otherwise = otherwise(row, target.status);
   return row;
 }
@@ -168,7 +173,7 @@ std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& fa
   std::vector<Row> rows;
   for (size_t at = 0; at < status.targets.size(); at++) {
     const Target& target = status.targets[at];
-    if (target.volumes.empty()) rows.push_back(row_of(target, facts[at], nullptr));
+    if (target.volumes.empty()) rows.push_back(row_without_volume(target, facts[at]));
     for (size_t n = 0; n < target.volumes.size(); n++) rows.push_back(row_of_volume(target, facts[at], n));
   }
   return rows;

@@ -104,6 +104,7 @@ History read_history() {
 }
 
 void recall(const History& history, std::vector<Row>& rows) {
+  if (history.empty()) return;
   for (Row& row : rows) {
     const auto found = history.find(key_of(row));
     if (found == history.end()) continue;

@@ -79,19 +79,19 @@ void take_field(const Field<Record> (&fields)[kCount], Record& record, std::stri
   }
 }
 
-// Takes `before` and a number from 1 to `most` off the front of a path, and the slash behind them. Returns 0,
-// and leaves the path as it is, when they are not there.
+// Takes `before` and a number from 1 to `most` off the front of a path. Returns 0, and leaves the path as it
+// is, when they are not there.
 size_t take_slot(std::string_view& path, std::string_view before, size_t most) {
   if (!path.starts_with(before)) return 0;
-  const char* const first = path.data() + before.size();
   const char* const end = path.data() + path.size();
   size_t slot = 0;
-  const char* const behind = std::from_chars(first, end, slot).ptr;
-  if (slot == 0 || slot > most || behind == end || *behind != '/') return 0;
+  const char* const behind = std::from_chars(path.data() + before.size(), end, slot).ptr;
+  if (slot == 0 || slot > most || (behind != end && *behind != '/')) return 0;
   path.remove_prefix(static_cast<size_t>(behind - path.data()));
   return slot;
 }
 
+// The record of a slot. It stays where it is: there is room for the most.
 template <typename Record>
 Record& record_of(std::vector<Record>& records, size_t slot, size_t most) {
   records.reserve(most);
@@ -99,15 +99,46 @@ Record& record_of(std::vector<Record>& records, size_t slot, size_t most) {
   return records[slot - 1];
 }
 
-void take_value(std::vector<Target>& targets, std::string_view path, std::string_view value) {
-  const size_t slot = take_slot(path, kTargetSlot, remvol::kMaxTargets);
-  if (slot == 0) return;
-  Target& target = record_of(targets, slot, remvol::kMaxTargets);
-  const size_t lun = take_slot(path, kLunSlot, remvol::kMaxLunsPerTarget);
-  if (lun == 0) return take_field(kTargetFields, target, path.substr(1), value);
-  Volume& volume = record_of(target.volumes, lun, remvol::kMaxLunsPerTarget);
-  take_field(kVolumeFields, volume, path.substr(1), value);
-}
+// Puts the values of a listing where they belong. Those of one node follow each other, so its slot is looked
+// for once.
+class Slots {
+ public:
+  void take(std::string_view path, std::string_view value) {
+    const size_t slash = path.rfind('/');
+    if (slash == std::string_view::npos) return;
+    if (path.substr(0, slash) != node_) enter(path.substr(0, slash));
+    path.remove_prefix(slash + 1);
+    if (volume_ != nullptr) {
+      take_field(kVolumeFields, *volume_, path, value);
+    } else if (target_ != nullptr) {
+      take_field(kTargetFields, *target_, path, value);
+    }
+  }
+
+  std::vector<Target> taken() { return std::move(targets_); }
+
+ private:
+  void enter(std::string_view node) {
+    node_ = node;
+    target_ = nullptr;
+    volume_ = nullptr;
+    const size_t slot = take_slot(node, kTargetSlot, remvol::kMaxTargets);
+    if (slot == 0) return;
+    Target& target = record_of(targets_, slot, remvol::kMaxTargets);
+    const size_t lun = take_slot(node, kLunSlot, remvol::kMaxLunsPerTarget);
+    if (!node.empty()) return;
+    if (lun == 0) {
+      target_ = &target;
+    } else {
+      volume_ = &record_of(target.volumes, lun, remvol::kMaxLunsPerTarget);
+    }
+  }
+
+  std::vector<Target> targets_;
+  std::string_view node_;  // whose record one of these is, if it is a slot
+  Target* target_ = nullptr;
+  Volume* volume_ = nullptr;
+};
 
 // Slots are used from the first one on; what stands behind a free one is left over from something.
 template <typename Record, typename IsFree>
@@ -118,9 +149,9 @@ void end_at_free(std::vector<Record>& records, IsFree is_free) {
 }  // namespace
 
 Status read_status(const platform::TreeListing& tree) {
-  Status status{tree.answered(), {}};
-  tree.for_each(
-      [&status](std::string_view path, std::string_view value) { take_value(status.targets, path, value); });
+  Slots slots;
+  tree.for_each([&slots](std::string_view path, std::string_view value) { slots.take(path, value); });
+  Status status{tree.answered(), slots.taken()};
   end_at_free(status.targets, [](const Target& target) { return target.name.empty(); });
   for (Target& target : status.targets) {
     end_at_free(target.volumes, [](const Volume& volume) { return volume.lun == -1; });
