@@ -21,7 +21,7 @@ namespace {
 
 constexpr int kAiling = 1, kFailed = 2, kUnreachable = 3;
 
-struct Options {
+struct PageOptions {
   Layout layout;
   bool watch = false;
   bool ailing_only = false;
@@ -61,7 +61,7 @@ std::vector<Row> ailing_among(const std::vector<Row>& rows) {
   return some;
 }
 
-Page page_of(const Snapshot& look, const Options& options) {
+Page page_of(const Snapshot& look, const PageOptions& options) {
   if (!look.status.reachable) return {"", why_unreachable()};
   const std::vector<Row> ailing = options.ailing_only ? ailing_among(look.rows) : std::vector<Row>();
   const std::vector<Row>& rows = options.ailing_only ? ailing : look.rows;
@@ -95,7 +95,7 @@ size_t width_of_output() {
   return width > 0 ? static_cast<size_t>(width) : Layout().width;
 }
 
-int show_once(const Options& options) {
+int show_once(const PageOptions& options) {
   const Snapshot seen = look(extent_of_report(options.layout));
   if (!seen.status.reachable) {
     fputs(why_unreachable(), stderr);
@@ -115,7 +115,7 @@ int show_metrics() {
 }
 
 // Everything of the volume of that share, or of all volumes of that target.
-int show_one(const Options& options) {
+int show_one(const PageOptions& options) {
   const bool is_block = options.layout.form == Form::kTable;
   const Snapshot seen = look(is_block ? extent_of_block(options.layout) : extent_of_report(options.layout));
   if (!seen.status.reachable) {
@@ -144,7 +144,7 @@ int show_one(const Options& options) {
   return finish(all_healthy(rows) ? 0 : kAiling);
 }
 
-int show_again(Options options) {
+int show_again(PageOptions options) {
   Snapshot last;
   watch([&options, &last](size_t width) {
     if (width != 0) options.layout.width = width;
@@ -200,7 +200,7 @@ int take_columns(const char* names, Layout& layout) {
   return wrong_usage();
 }
 
-int take_option(int letter, Options& options) {
+int take_option(int letter, PageOptions& options) {
   switch (letter) {
     case 'x':
       options.ailing_only = true;
@@ -237,13 +237,13 @@ int take_option(int letter, Options& options) {
 }
 
 // Whether anything is asked of the output that metrics do not have.
-bool asks_for_more(const Options& options) {
+bool asks_for_more(const PageOptions& options) {
   const Layout& layout = options.layout;
   return options.watch || options.ailing_only || options.name != nullptr || layout.form != Form::kTable ||
          layout.bytes || !layout.headings || !layout.columns.empty();
 }
 
-int take_arguments(int argc, char** argv, Options& options) {
+int take_arguments(int argc, char** argv, PageOptions& options) {
   for (int letter; (letter = getopt_long(argc, argv, "xwo:bnrJPhV", kLongOptions, nullptr)) != -1;) {
     const int status = take_option(letter, options);
     if (status != kGoOn) return status;
@@ -263,7 +263,7 @@ bool wants_colour() {
 
 int run(int argc, char** argv) {
   setvbuf(stdout, nullptr, _IONBF, 0);
-  Options options;
+  PageOptions options;
   const int status = take_arguments(argc, argv, options);
   if (status != kGoOn) return status;
   options.layout.colour = wants_colour();
