@@ -6,10 +6,10 @@
 #include <cstring>
 #include <memory>
 
+#include "common/scols.h"
 #include "common/utf8.h"
 #include "vv/list.h"
 #include "vv/options.h"
-#include "vv/scols.h"
 
 namespace vv {
 namespace {
@@ -30,8 +30,8 @@ bool add_row(libscols_table* table, const std::vector<std::string>& row) {
   return true;
 }
 
-ScolsTable filled(const Table& table) {
-  ScolsTable made(scols_new_table());
+platform::ScolsTable filled(const Table& table) {
+  platform::ScolsTable made(scols_new_table());
   bool good = made != nullptr && scols_table_set_name(made.get(), table.name) == 0;
   for (const TableColumn& column : table.columns) good = good && add_column(made.get(), column);
   for (const auto& row : table.rows) good = good && add_row(made.get(), row);
@@ -94,7 +94,7 @@ void tell_failure(const Outcome& outcome) {
 }  // namespace
 
 std::string shown(const Table& table, bool json) {
-  const ScolsTable made = filled(table);
+  const platform::ScolsTable made = filled(table);
   if (made == nullptr) return {};
   scols_table_enable_noencoding(made.get(), 1);  // add_row() has done it
   scols_table_enable_json(made.get(), json);

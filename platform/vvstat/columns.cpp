@@ -8,12 +8,13 @@
 #include <cstdio>
 #include <cstdlib>
 #include <iterator>
+#include <memory>
 
+#include "common/scols.h"
 #include "common/utf8.h"
 #include "tree_layout.h"
 #include "vvstat/folding.h"
 #include "vvstat/moment.h"
-#include "vvstat/table.h"
 #include "vvstat/widths.h"
 
 namespace vvstat {
@@ -49,13 +50,13 @@ struct Column {
   const char* name;
   const char* what;
   size_t least;  // cells, which a text that is cut keeps; 0: it is never cut
-  Kind kind;
+  int type;      // in JSON
   bool right;
   std::string (*text)(const Row& row, const Layout& layout);
   Extent extent = Extent::kHealth;  // of the facts that tell it
 };
 
-constexpr Kind kText = Kind::kText, kNumber = Kind::kNumber, kFlag = Kind::kFlag;
+constexpr int kText = SCOLS_JSON_STRING, kNumber = SCOLS_JSON_NUMBER, kFlag = SCOLS_JSON_BOOLEAN;
 
 constexpr size_t kNameWidth = 13;  // more than the longest name has
 
@@ -166,30 +167,22 @@ std::vector<size_t> first_columns(size_t count) {
   return columns;
 }
 
-// A column with its texts.
+// What a column shows of the rows.
 struct Content {
-  size_t number;
-  size_t width;  // of the widest text, and of the name
-  TableColumn shown;
+  size_t column;
+  std::vector<std::string> cells;  // one of each row
+  size_t width;                    // of the widest one, and of the name
 };
 
 Content content_of(const std::vector<Row>& rows, size_t number, const Layout& layout) {
   const Column& column = kColumns[number];
-  Content content{number, std::string_view(column.name).size(), {column.name, column.kind, column.right}};
-  content.shown.cells.reserve(rows.size());
+  Content content{number, {}, std::string_view(column.name).size()};
+  content.cells.reserve(rows.size());
   for (const Row& row : rows) {
-    std::string text = cell(column, row, layout);
-    const size_t width = platform::cells(text);
-    content.width = std::max(content.width, width);
-    content.shown.cells.push_back({std::move(text), width});
+    content.cells.push_back(cell(column, row, layout));
+    content.width = std::max(content.width, platform::cells(content.cells.back()));
   }
   return content;
-}
-
-std::vector<const char*> colours_of(const std::vector<Row>& rows) {
-  std::vector<const char*> colours;
-  for (const Row& row : rows) colours.push_back(!row.wanted ? nullptr : row.healthy() ? kGood : kBad);
-  return colours;
 }
 
 // Share and status have their cells in any case: they are there again and again.
@@ -199,8 +192,8 @@ bool is_steady(size_t column) {
 
 // The cells that a column takes as it is.
 Wish wish_of(const Content& content) {
-  const size_t least = kColumns[content.number].least;
-  const size_t natural = is_steady(content.number) ? std::max(content.width, least) : content.width;
+  const size_t least = kColumns[content.column].least;
+  const size_t natural = is_steady(content.column) ? std::max(content.width, least) : content.width;
   return {least != 0 ? std::min(natural, least) : natural, natural};
 }
 
@@ -227,15 +220,21 @@ Extent extent_of(const std::vector<size_t>& columns) {
 // What the report is made of. The target is one of the usual columns of a table where there is room for it.
 std::vector<Content> contents_of(const std::vector<Row>& rows, const Layout& layout) {
   std::vector<Content> contents;
-  for (const size_t column : columns_of(layout)) {
-    contents.push_back(content_of(rows, column, layout));
-    if (column == kStatus && layout.colour) contents.back().shown.colours = colours_of(rows);
-  }
+  for (const size_t column : columns_of(layout)) contents.push_back(content_of(rows, column, layout));
   if (layout.form != Form::kTable || !layout.columns.empty()) return contents;
   contents.push_back(content_of(rows, kTarget, layout));
   if (natural_width(contents) > layout.width) contents.pop_back();
   return contents;
 }
+
+// A column in a table. Of the library's own ways to cut a text none is the same in all its versions, so it
+// gets texts that fit.
+struct Place {
+  const Content* content;
+  size_t width;  // cells; what is longer is cut
+};
+
+constexpr size_t kUncut = SIZE_MAX;
 
 // The order of importance: that of the line, but what was asked for beside the usual ones follows the status.
 std::vector<const Content*> by_importance(const std::vector<Content>& contents, const Layout& layout) {
@@ -256,39 +255,21 @@ std::vector<size_t> widths_of(const std::vector<Wish>& wishes, size_t asked_for,
   return widths[kFirst + asked_for - 1] != 0 ? widths : fitting_widths(wishes, layout.width);
 }
 
-// A text that is cut says so.
-void cut(Cell& cell, size_t width) {
-  if (cell.width <= width) return;
-  cell.text = cell.text.substr(0, platform::first_cells(cell.text, width - 1)) + "~";
-  cell.width = platform::cells(cell.text);
-}
-
-TableColumn cut_column(Content& content, size_t width) {
-  TableColumn& column = content.shown;
-  column.name = column.name.substr(0, width);
-  if (is_steady(content.number)) column.width = width;
-  for (Cell& cell : column.cells) cut(cell, width);
-  return std::move(column);
-}
-
-// The columns as they fit the screen; what has no room is left out.
-std::vector<TableColumn> fitting(std::vector<Content> contents, const Layout& layout) {
+std::vector<Place> places_of(const std::vector<Content>& contents, const Layout& layout) {
+  std::vector<Place> places;
+  if (layout.form != Form::kTable) {
+    for (const Content& content : contents) places.push_back({&content, kUncut});
+    return places;
+  }
   const std::vector<const Content*> order = by_importance(contents, layout);
   std::vector<Wish> wishes;
   for (const Content* content : order) wishes.push_back(wish_of(*content));
   const std::vector<size_t> widths = widths_of(wishes, contents.size() - kUsual, layout);
-  std::vector<TableColumn> columns;
-  for (Content& content : contents) {
+  for (const Content& content : contents) {
     const size_t at = static_cast<size_t>(std::find(order.begin(), order.end(), &content) - order.begin());
-    if (widths[at] != 0) columns.push_back(cut_column(content, widths[at]));
+    if (widths[at] != 0) places.push_back({&content, widths[at]});
   }
-  return columns;
-}
-
-std::vector<TableColumn> whole(std::vector<Content> contents) {
-  std::vector<TableColumn> columns;
-  for (Content& content : contents) columns.push_back(std::move(content.shown));
-  return columns;
+  return places;
 }
 
 // "NAME  value", folded beside the name, or below it where there is no room beside.
@@ -302,6 +283,50 @@ std::string line_of_block(const Column& column, const std::string& value, size_t
   const std::string lines = std::string_view(column.name) == "COMMAND" ? folded_command(value, indents, width)
                                                                        : folded(value, indents, width);
   return name + lines.substr(indent);
+}
+
+// A text that is cut says so.
+std::string cut(const std::string& text, size_t width) {
+  if (width == kUncut || platform::cells(text) <= width) return text;
+  return text.substr(0, platform::first_cells(text, width - 1)) + "~";
+}
+
+bool add_column(libscols_table* table, const Place& place) {
+  const Column& column = kColumns[place.content->column];
+  const std::string name = std::string(column.name).substr(0, place.width);
+  const double width =
+      place.width != kUncut && is_steady(place.content->column) ? static_cast<double>(place.width) : 0;
+  libscols_column* added =
+      scols_table_new_column(table, name.c_str(), width,
+                             (column.right ? SCOLS_FL_RIGHT : 0) | (column.least != 0 ? SCOLS_FL_TRUNC : 0));
+  return added != nullptr && scols_column_set_json_type(added, column.type) == 0;
+}
+
+// The row that is the `number`th of all.
+bool add_row(libscols_table* table, const Row& row, size_t number, const std::vector<Place>& places,
+             const Layout& layout) {
+  libscols_line* line = scols_table_new_line(table, nullptr);
+  if (line == nullptr) return false;
+  for (size_t at = 0; at < places.size(); at++) {
+    const std::string text = cut(places[at].content->cells[number], places[at].width);
+    if (text.empty()) continue;
+    if (scols_line_set_data(line, at, text.c_str()) != 0) return false;
+    if (layout.colour && places[at].content->column == kStatus && row.wanted) {
+      scols_cell_set_color(scols_line_get_cell(line, at), row.healthy() ? kGood : kBad);
+    }
+  }
+  return true;
+}
+
+platform::ScolsTable table_of(const std::vector<Row>& rows, const Layout& layout) {
+  platform::ScolsTable table(scols_new_table());
+  const std::vector<Content> contents = contents_of(rows, layout);
+  const std::vector<Place> places = places_of(contents, layout);
+  bool good = table != nullptr && scols_table_set_name(table.get(), "volumes") == 0;
+  for (const Place& place : places) good = good && add_column(table.get(), place);
+  for (size_t at = 0; at < rows.size(); at++)
+    good = good && add_row(table.get(), rows[at], at, places, layout);
+  return good ? std::move(table) : nullptr;
 }
 
 }  // namespace
@@ -359,16 +384,20 @@ Extent extent_of_block(const Layout& layout) {
 std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {
   Layout layout = asked;
   layout.bytes = layout.bytes || layout.form == Form::kJson;
-  std::vector<Content> contents = contents_of(rows, layout);
-  switch (layout.form) {
-    case Form::kJson:
-      return as_json("volumes", whole(std::move(contents)));
-    case Form::kRaw:
-      return as_raw(whole(std::move(contents)), layout.headings);
-    case Form::kTable:
-      break;
-  }
-  return as_table(fitting(std::move(contents), layout), layout.headings);
+  const platform::ScolsTable table = table_of(rows, layout);
+  if (table == nullptr) return {};
+  scols_table_enable_noencoding(table.get(), 1);  // cell() has done it
+  scols_table_enable_json(table.get(), layout.form == Form::kJson);
+  scols_table_enable_raw(table.get(), layout.form == Form::kRaw);
+  scols_table_enable_noheadings(table.get(), !layout.headings);
+  scols_table_enable_colors(table.get(), layout.colour);
+  scols_table_set_termforce(table.get(), SCOLS_TERMFORCE_ALWAYS);
+  scols_table_set_termwidth(table.get(), layout.width);
+  char* text = nullptr;
+  if (scols_print_table_to_string(table.get(), &text) != 0) return {};
+  const std::unique_ptr<char, decltype(&free)> owned(text, free);
+  // The library ends all lines but the last one.
+  return std::string(text).append("\n");
 }
 
 std::string block(const Row& row, const Layout& layout) {

@@ -38,7 +38,7 @@ Extent extent_of_block(const Layout& layout);
 // cut first, then left out, PORTAL before LUN, USE%, SIZE, USED and STATUS; a text that is cut ends with "~".
 // Text of users is shown with \xHH for bytes that are not UTF-8, and for characters that move a cursor or
 // cannot be seen. Secrets are not in it. The process gets a UTF-8 locale (use_utf8()) for all else that is
-// not ASCII.
+// not ASCII. Empty when there is no memory for it.
 std::string volume_report(const std::vector<Row>& rows, const Layout& layout);
 
 // Everything of one row, or the columns chosen, a column a line with its name before it; what is empty is

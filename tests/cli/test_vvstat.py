@@ -597,7 +597,9 @@ def test_raw_rows_are_for_programs(example):
 
 
 def test_without_headings_there_are_the_rows_alone(example):
-    assert vvstat(example, "-n").lines == TABLE.splitlines()[1:4]
+    """libsmartcols 2.41 makes room for a heading only where there is one, 2.38 always."""
+    rows = [line.split() for line in TABLE.splitlines()[1:4]]
+    assert [line.split() for line in vvstat(example, "-n").lines] == rows
 
 
 def test_sizes_in_bytes(example):

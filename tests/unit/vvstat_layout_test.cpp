@@ -3,7 +3,6 @@
 
 #include "common/utf8.h"
 #include "vvstat/folding.h"
-#include "vvstat/table.h"
 #include "vvstat/widths.h"
 
 namespace vvstat {
@@ -79,68 +78,6 @@ TEST(Folding, NoLineOfACommandIsLonger) {
       at = end + 1;
     }
   }
-}
-
-std::vector<Cell> cells_of(std::initializer_list<const char*> texts) {
-  std::vector<Cell> cells;
-  for (const char* text : texts) cells.push_back({text, platform::cells(text)});
-  return cells;
-}
-
-TEST(Table, TextsBeginOrEndBelowEachOther) {
-  const std::vector<TableColumn> columns{{"SHARE", Kind::kText, false, 0, cells_of({"Backup", "日本", ""})},
-                                         {"USED", Kind::kNumber, true, 0, cells_of({"1.5M", "", "12345"})},
-                                         {"PORTAL", Kind::kText, false, 0, cells_of({"a", "b", ""})}};
-  EXPECT_EQ(as_table(columns, true),
-            "SHARE   USED PORTAL\n"
-            "Backup  1.5M a\n"
-            "日本         b\n"
-            "       12345 \n");
-  EXPECT_EQ(as_table(columns, false), "Backup  1.5M a\n日本         b\n       12345 \n");
-  EXPECT_EQ(as_table({}, true), "");
-}
-
-TEST(Table, TheLastColumnOfNumbersIsEmptyWhereThereIsNone) {
-  EXPECT_EQ(as_table({{"LUN", Kind::kNumber, true, 0, cells_of({"1", ""})}}, true), "LUN\n  1\n\n");
-}
-
-TEST(Table, AColumnKeepsItsWidthUnlessAllIsShorterThanItsName) {
-  EXPECT_EQ(as_table({{"SHARE", Kind::kText, false, 9, cells_of({"Photo"})},
-                      {"X", Kind::kText, false, 0, cells_of({"x"})}},
-                     true),
-            "SHARE     X\nPhoto     x\n");
-  EXPECT_EQ(as_table({{"SHARE", Kind::kText, false, 9, cells_of({"abc"})},
-                      {"X", Kind::kText, false, 0, cells_of({"x"})}},
-                     true),
-            "SHARE X\nabc   x\n");
-}
-
-TEST(Table, AColourIsThatOfTheWholeColumnButOfNoEmptyText) {
-  const std::vector<const char*> colours{"<", nullptr, "<"};
-  EXPECT_EQ(as_table({{"A", Kind::kText, false, 0, cells_of({"a", "bb", ""}), colours},
-                      {"B", Kind::kText, false, 0, cells_of({"x", "y", "z"}), colours}},
-                     false),
-            "<a \x1b[0m <x\x1b[0m\nbb y\n   <z\x1b[0m\n");
-}
-
-TEST(Table, RawLinesCanBeTakenApart) {
-  EXPECT_EQ(as_raw({{"A", Kind::kText, false, 0, cells_of({"a b", "", "\\~é"})},
-                    {"B", Kind::kText, true, 9, cells_of({"", "1", "2"})}},
-                   true),
-            "A B\na\\x20b \n 1\n\\x5c~\\xc3\\xa9 2\n");
-  EXPECT_EQ(as_raw({{"A"}}, true), "\n");
-}
-
-TEST(Table, Json) {
-  EXPECT_EQ(as_json("all", {{"USE%", Kind::kNumber, true, 0, cells_of({"7", ""})},
-                            {"RO", Kind::kFlag, true, 0, cells_of({"1", "0"})},
-                            {"LAST-ERROR", Kind::kText, false, 9, cells_of({"\"é\\", ""})}}),
-            "{\n   \"all\": [\n"
-            "      {\n         \"use%\": 7,\n         \"ro\": true,\n         \"last-error\": "
-            "\"\\\"é\\\\\"\n      },{\n"
-            "         \"use%\": null,\n         \"ro\": false,\n         \"last-error\": null\n      }\n"
-            "   ]\n}\n\n");
-  EXPECT_EQ(as_json("all", {{"A"}}), "{\n   \"all\": [\n\n   ]\n}\n\n");
 }
 
 TEST(Utf8, TheFirstCells) {

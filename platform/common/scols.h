@@ -1,12 +1,12 @@
 // Tables of libsmartcols.
-#ifndef PLATFORM_VV_SCOLS_H
-#define PLATFORM_VV_SCOLS_H
+#ifndef PLATFORM_COMMON_SCOLS_H
+#define PLATFORM_COMMON_SCOLS_H
 
 #include <libsmartcols.h>
 
 #include <memory>
 
-namespace vv {
+namespace platform {
 
 struct ScolsEnd {
   void operator()(libscols_table* table) const { scols_unref_table(table); }
@@ -15,6 +15,6 @@ struct ScolsEnd {
 // A table that is freed at the end of its life.
 using ScolsTable = std::unique_ptr<libscols_table, ScolsEnd>;
 
-}  // namespace vv
+}  // namespace platform
 
 #endif
