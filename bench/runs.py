@@ -17,7 +17,7 @@ TRACE = "/mnt/trace"
 
 def share_name(short):
     with one_processor(), ktree():
-        load(document(8, 1))
+        load(document(8, 8))
         (ours, true), (peak, _) = in_turn(11 if short else 401, [program("remvol"), "--check_share_name", "-s", "X"],
                                           ["/bin/true"])
     yield ratio("Whole runs", "remvol --check_share_name / true", ours, true, 1.5)

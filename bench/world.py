@@ -7,7 +7,7 @@ import subprocess
 import time
 
 BUILD = pathlib.Path(os.environ["REMVOL_BUILD"]).resolve()
-PRODUCT = pathlib.Path("/mnt/product")
+PRODUCT = pathlib.Path("/usr")
 SOCKET = "/run/ktree_sock_vv"
 WORK = pathlib.Path("/mnt/disk")  # on the disk that the build is on
 
@@ -18,24 +18,39 @@ def enter():
     disk.mkdir(exist_ok=True)
     keep = os.open(disk, os.O_PATH)
     mount("tmpfs", "/mnt")
-    for folder in (WORK, PRODUCT):
-        folder.mkdir()
+    WORK.mkdir()
     subprocess.run(["mount", "--bind", f"/proc/self/fd/{keep}", WORK], check=True, pass_fds=[keep])
-    subprocess.run(["cmake", "--install", BUILD, "--prefix", PRODUCT], check=True, stdout=subprocess.DEVNULL,
-                   env={**os.environ, "DESTDIR": ""})
-    subprocess.run(["cp", *BUILD.glob("bin/bench_*"), PRODUCT / "bin"], check=True)
-    library = next(PRODUCT.rglob("libktreec.so")).parent
-    os.environ["LD_LIBRARY_PATH"] = str(library)  # for the measuring programs; ours find it by themselves
-    os.environ["PATH"] = f"/mnt/fakes:{PRODUCT}/bin:{PRODUCT}/sbin:{os.environ['PATH']}"
+    cover(PRODUCT)
+    install()
+    os.environ["PATH"] = f"/mnt/fakes:{os.environ['PATH']}"
     pathlib.Path("/mnt/fakes").mkdir()
     mount("tmpfs", "/run")
     pathlib.Path("/run/lock").mkdir(mode=0o1777)
-    for folder in ("upper", "work"):
-        pathlib.Path("/mnt", folder).mkdir()
-    subprocess.run(["mount", "-t", "overlay", "etc", "-o", "lowerdir=/etc,upperdir=/mnt/upper,workdir=/mnt/work", "/etc"],
-                   check=True)
+    cover(pathlib.Path("/etc"))
     pathlib.Path("/etc/NAS_CFG").mkdir(exist_ok=True)
     mount("tmpfs", "/etc/NAS_CFG")
+
+
+def cover(folder):
+    """What is changed in the folder from now on goes to memory."""
+    over = pathlib.Path("/mnt/over", folder.name)
+    for part in ("upper", "work"):
+        (over / part).mkdir(parents=True)
+    subprocess.run(["mount", "-t", "overlay", "over", "-o",
+                    f"lowerdir={folder},upperdir={over / 'upper'},workdir={over / 'work'}", folder], check=True)
+
+
+def install():
+    """As the package does: where the loader looks by itself, and without search paths of the programs' own."""
+    subprocess.run(["cmake", "--install", BUILD, "--prefix", PRODUCT], check=True, stdout=subprocess.DEVNULL,
+                   env={**os.environ, "DESTDIR": ""})
+    script = pathlib.Path("/mnt/no_search_path.cmake")
+    manifest = map(pathlib.Path, (BUILD / "install_manifest.txt").read_text().split())
+    installed = [path for path in manifest if path.parent.name in ("bin", "sbin")]
+    script.write_text("".join(f'file(RPATH_REMOVE FILE "{path}")\n' for path in installed))
+    output("cmake", "-P", script, stderr=subprocess.DEVNULL)
+    subprocess.run(["cp", *BUILD.glob("bin/bench_*"), PRODUCT / "bin"], check=True)
+    subprocess.run(["ldconfig"], check=True)
 
 
 def mount(kind, path):
