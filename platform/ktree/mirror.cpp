@@ -1,7 +1,6 @@
 #include "ktree/mirror.h"
 
 #include <cstring>
-#include <utility>
 
 namespace ktree::mirror {
 namespace {
@@ -29,17 +28,21 @@ void copy_value(const Word* from, char* buffer, size_t size) {
 bool make_key(std::string_view path, Key& key) {
   char* text = reinterpret_cast<char*>(key.words);
   key.bytes = 0;
-  bool numbered = false;
-  for (const char* from = path.begin(); from != path.end(); from++) {
-    if (*from == '/') numbered = false;
-    if (*from == ':' && !std::exchange(numbered, true) &&
-        ends_with_one(from, static_cast<size_t>(path.end() - from))) {
-      from++;
-      continue;
-    }
-    if (key.bytes == kMaxPathBytes) return false;
-    text[key.bytes++] = *from;
+  bool numbered = false;  // a colon of the same element came before
+  for (const char *from = path.begin(), *end = path.end(); from != end;) {
+    const auto* colon = static_cast<const char*>(memchr(from, ':', static_cast<size_t>(end - from)));
+    const auto size = static_cast<size_t>((colon == nullptr ? end : colon) - from);
+    if (key.bytes + size > kMaxPathBytes) return false;
+    memcpy(text + key.bytes, from, size);
+    key.bytes += size;
+    numbered = numbered && memchr(from, '/', size) == nullptr;
+    if (colon == nullptr) break;
+    const bool is_one = !numbered && ends_with_one(colon, static_cast<size_t>(end - colon));
+    if (!is_one) text[key.bytes++] = ':';
+    from = colon + (is_one ? 2 : 1);
+    numbered = true;
   }
+  if (key.bytes > kMaxPathBytes) return false;
   key.count = words_for(key.bytes);
   memset(text + key.bytes, 0, key.count * sizeof(Word) - key.bytes);
   key.hash = 0;

@@ -139,6 +139,9 @@ TEST_F(MirrorTest, ValuesAndPathsThatAreTooLongAreNotInIt) {
   set(longest + "p", "y");
   EXPECT_EQ(read(longest), "x");
   EXPECT_EQ(read(longest + "p"), kNotThere);
+  EXPECT_EQ(read(longest + ":1"), "x");
+  EXPECT_EQ(read(longest + ":"), kNotThere);
+  EXPECT_EQ(read(longest + ":2"), kNotThere);
   writer_.fill();
   EXPECT_EQ(read(longest), "x");
   EXPECT_EQ(read(longest + "p"), kNotThere);
