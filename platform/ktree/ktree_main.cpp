@@ -101,11 +101,13 @@ size_t client_limit() {
   return std::min((limit - kOwnDescriptors) / 2, kMaxClients);
 }
 
-// SIGTERM and SIGINT as a descriptor. A shell starts a background command with SIGINT ignored, which would
-// keep it from the descriptor, too.
+// SIGTERM and SIGINT as a descriptor. A file that may not get so large (RLIMIT_FSIZE counts memory files,
+// too) is an error, not the end. A shell starts a background command with SIGINT ignored, which would keep it
+// from the descriptor, too.
 int open_signals() {
   signal(SIGPIPE, SIG_IGN);
   signal(SIGHUP, SIG_IGN);
+  signal(SIGXFSZ, SIG_IGN);
   signal(SIGTERM, SIG_DFL);
   signal(SIGINT, SIG_DFL);
   sigset_t mask;

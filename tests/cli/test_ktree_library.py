@@ -301,6 +301,16 @@ def test_threads_read_together(daemon, caller):
     assert caller("threads /t 500") == "4000"
 
 
+def test_a_daemon_that_may_write_no_large_file_has_no_mirror():
+    daemon = Daemon(prefix=["prlimit", "--fsize=1000000"])
+    caller = Caller(daemon.socket)
+    read_often(caller)
+    assert caller("get /warm 10") == "1 x"
+    assert daemon.process.poll() is None
+    caller.close()
+    daemon.close()
+
+
 def answers_gets(with_mirror):
     """Serves a daemon whose every value is "value"; with_mirror(connection) answers the request for the mirror."""
     requests = []
