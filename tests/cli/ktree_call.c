@@ -4,12 +4,15 @@
  *
  *   set PATH VALUE | get PATH SIZE | del PATH | dump FILE | load FILE
  *   fork PATH            a child reads PATH and exits, then this process does
+ *   clone PATH           the same, but the C library does not know of the child
  *   threads PATH COUNT   eight threads read PATH, COUNT times each
  *   sh COMMAND           what a command started from here prints, in one line */
 #include <pthread.h>
+#include <signal.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -25,9 +28,13 @@ static void get(const char* path, size_t size) {
   printf("%d %s\n", result, size > 0 ? buffer : "");
 }
 
-static void fork_and_get(const char* path) {
+static pid_t fork_unseen(void) {
+  return (pid_t)syscall(SYS_clone, SIGCHLD, 0, 0, 0, 0);
+}
+
+static void fork_and_get(const char* path, pid_t (*make_child)(void)) {
   fflush(stdout);
-  const pid_t child = fork();
+  const pid_t child = make_child();
   get(path, 1000);
   if (child == 0) {
     fflush(stdout);
@@ -100,7 +107,9 @@ static void call(char* line) {
   } else if (!strcmp(word, "load")) {
     printf("%d\n", ktreec_load(socket_path, 0, first));
   } else if (!strcmp(word, "fork")) {
-    fork_and_get(first);
+    fork_and_get(first, fork);
+  } else if (!strcmp(word, "clone")) {
+    fork_and_get(first, fork_unseen);
   } else if (!strcmp(word, "threads")) {
     threads(first, atoi(save));
   }

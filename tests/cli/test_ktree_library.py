@@ -209,6 +209,17 @@ def test_a_child_has_a_connection_of_its_own(daemon, caller):
     assert caller("get /a 10") == "1 x"
 
 
+def test_nor_does_a_child_speak_for_its_parent_that_was_made_without_a_word_to_the_library(listen):
+    serve, _ = answers_gets(refused)
+    listener = listen(lambda *connection: threading.Thread(target=serve, args=connection, daemon=True).start())
+    caller = Caller(listener.path)
+    assert caller("get /a 10") == "5 value"
+    caller.send("clone /a")
+    assert [caller.answer(), caller.answer()] == ["5 value", "5 value"]
+    assert len(listener.accepted) == 2
+    caller.close()
+
+
 def test_no_descriptor_goes_to_a_child_program(daemon, caller):
     caller("set /a x")
     caller(f"dump {daemon.folder}/vv.xml")
@@ -299,6 +310,21 @@ def test_a_child_reads_as_its_parent_did(daemon, caller):
 def test_threads_read_together(daemon, caller):
     read_often(caller)
     assert caller("threads /t 500") == "4000"
+
+
+def test_a_read_that_asks_for_the_mirror_waits_no_longer_than_another(daemon, caller):
+    caller("set /a x")
+    assert caller("get /a 10") == "1 x"
+    daemon.process.send_signal(signal.SIGSTOP)
+    start = time.monotonic()
+    assert caller("get /a 10") == "-1 "
+    assert 4 < time.monotonic() - start < 8
+    daemon.process.send_signal(signal.SIGCONT)
+    for _ in range(3):
+        assert caller("get /a 10") == "1 x"
+    daemon.process.send_signal(signal.SIGSTOP)
+    assert caller("get /a 10") == "1 x"  # it was asked for again
+    daemon.process.send_signal(signal.SIGCONT)
 
 
 def test_a_daemon_that_may_write_no_large_file_has_no_mirror():

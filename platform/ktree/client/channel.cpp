@@ -28,9 +28,10 @@ struct Channel {
   Channel* next;
   pthread_mutex_t lock;
   int fd;                      // -1: not connected
+  pid_t owner;                 // the process that connected
   const mirror::Word* mirror;  // of the daemon at the other end, or null
   bool has_read;               // on this connection
-  bool without_mirror;         // this daemon has none
+  bool without_mirror;         // none was to be had: none is asked for again
   sockaddr_un address;
 };
 
@@ -61,11 +62,11 @@ enum class TryOutcome {
   kTimedOut,  // or the daemon speaks another language
 };
 
+// What a thread lets go of here is nobody's in a child that another thread forks meanwhile: the number or the
+// place may be a stranger's by then.
 void disconnect(Channel& channel) {
-  if (channel.fd >= 0) close(channel.fd);
-  channel.fd = -1;
-  unmap_mirror(channel.mirror);
-  channel.mirror = nullptr;
+  if (channel.fd >= 0) close(std::exchange(channel.fd, -1));
+  unmap_mirror(std::exchange(channel.mirror, nullptr));
   channel.has_read = false;
 }
 
@@ -145,6 +146,7 @@ bool connect_channel(Channel& channel, Deadline& deadline) {
     return false;
   }
   deadline.tight = true;
+  channel.owner = getpid();
   channel.fd = fd;
   return true;
 }
@@ -264,8 +266,9 @@ CallResult result_of(uint8_t status) {
   return CallResult::kFailed;
 }
 
-CallResult request_on(Channel& channel, Call& call) {
-  Deadline deadline = {Deadline::now() + kRequestMilliseconds, false};
+// A child may have been made without fork(3), so that nothing was started anew there.
+CallResult request_on(Channel& channel, Call& call, Deadline& deadline) {
+  if (channel.fd >= 0 && channel.owner != getpid()) disconnect(channel);
   for (int i = 0; i < kTries; i++) {
     if (channel.fd < 0 && !connect_channel(channel, deadline)) return CallResult::kUnreachable;
     ReplyHeader header = {};
@@ -277,14 +280,16 @@ CallResult request_on(Channel& channel, Call& call) {
   return CallResult::kUnreachable;
 }
 
-// Asks for the mirror at the second read of a connection: the next ones need no request then.
-void open_mirror(Channel& channel) {
+// Asks for the mirror at the second read of a connection: the next ones need no request then. Returns true
+// when it has come.
+bool open_mirror(Channel& channel, Deadline& deadline) {
   const bool is_first = !std::exchange(channel.has_read, true);
-  if (channel.fd < 0 || channel.without_mirror || is_first) return;
+  if (channel.mirror != nullptr || channel.fd < 0 || channel.without_mirror || is_first) return false;
   Call call = {Operation::kMirror, {}, {}, -1, nullptr, 0, 0};
-  if (request_on(channel, call) == CallResult::kDone) channel.mirror = map_mirror(call.came);
-  channel.without_mirror = channel.mirror == nullptr;
+  if (request_on(channel, call, deadline) == CallResult::kDone) channel.mirror = map_mirror(call.came);
+  channel.without_mirror = channel.mirror == nullptr && deadline.left() > 0;
   if (call.came >= 0) close(call.came);
+  return channel.mirror != nullptr;
 }
 
 // The other end is closed when the daemon is gone. What was read before that was so.
@@ -294,8 +299,7 @@ bool is_alive(const Channel& channel) {
 }
 
 // A value that is in the mirror is read there. Returns false when the daemon is to be asked.
-bool get_from_mirror(Channel& channel, Call& call) {
-  if (channel.mirror == nullptr) open_mirror(channel);
+bool get_from_mirror(const Channel& channel, Call& call) {
   if (channel.mirror == nullptr) return false;
   const int size = mirror::read(channel.mirror, call.path, call.body, call.room);
   if (size < 0 || !is_alive(channel)) return false;
@@ -311,9 +315,16 @@ bool is_in_mirror(const Channel& channel, const Call& call) {
   return size >= 0 && call.value == std::string_view(value, static_cast<size_t>(size)) && is_alive(channel);
 }
 
-bool done_by_mirror(Channel& channel, Call& call) {
+bool done_by_mirror(const Channel& channel, Call& call) {
   return (call.operation == Operation::kGet && get_from_mirror(channel, call)) ||
          (call.operation == Operation::kSet && is_in_mirror(channel, call));
+}
+
+CallResult carry_out(Channel& channel, Call& call) {
+  if (done_by_mirror(channel, call)) return CallResult::kDone;
+  Deadline deadline = {Deadline::now() + kRequestMilliseconds, false};
+  const bool came = call.operation == Operation::kGet && open_mirror(channel, deadline);
+  return came && get_from_mirror(channel, call) ? CallResult::kDone : request_on(channel, call, deadline);
 }
 
 }  // namespace
@@ -324,7 +335,7 @@ CallResult request(const char* socket, Call& call) {
   if (channel == nullptr) return CallResult::kUnreachable;
   if (call.path.size() > kMaxPathBytes || call.value.size() > kMaxValueBytes) return CallResult::kRefused;
   pthread_mutex_lock(&channel->lock);
-  const CallResult result = done_by_mirror(*channel, call) ? CallResult::kDone : request_on(*channel, call);
+  const CallResult result = carry_out(*channel, call);
   pthread_mutex_unlock(&channel->lock);
   return result;
 }
