@@ -28,7 +28,8 @@ void copy_value(const Word* from, char* buffer, size_t size) {
 bool make_key(std::string_view path, Key& key) {
   char* text = reinterpret_cast<char*>(key.words);
   key.bytes = 0;
-  bool numbered = false;  // a colon of the same element came before
+  // A colon of the same element came before, or there is no element yet that could have a number.
+  bool numbered = true;
   for (const char *from = path.begin(), *end = path.end(); from != end;) {
     const auto* colon = static_cast<const char*>(memchr(from, ':', static_cast<size_t>(end - from)));
     const auto size = static_cast<size_t>((colon == nullptr ? end : colon) - from);
@@ -60,7 +61,7 @@ int read(const Word* words, std::string_view path, char* buffer, size_t most) {
     const Word version = __atomic_load_n(&words[kVersion], __ATOMIC_ACQUIRE);
     if (version % 2 != 0) continue;
     Entry entry = {};
-    const bool found = find_entry(words, key, entry);
+    const bool found = find_entry(words, key, entry, kMostSteps);
     const size_t size = entry.value_bytes < most ? entry.value_bytes : most;
     if (found) copy_value(words + entry.value_place(), buffer, size);
     __atomic_thread_fence(__ATOMIC_ACQUIRE);

@@ -9,10 +9,11 @@
 // it:
 //   0        the version
 //   1, 2     the place of the heads, and how many there are
+//   3        how many words have memory; it never gets less
 //   a head   by the hash of a path: the place of the first entry, 0 for none
 //   an entry the place of the next entry of the same head; the sizes: bytes of the path, bytes of the value
-//   << 8, room for
-//            the value in words << 16; the path and then the value, each filled up with zeros to whole words
+//            << 8, room for the value in words << 16; the path and then the value, each filled up with zeros
+//            to whole words
 // Every word is read and written as one, so that what a reader sees in the middle of a change is wrong but
 // never undefined: all that it takes for a place or a size is checked.
 #ifndef PLATFORM_KTREE_MIRROR_H
@@ -40,7 +41,8 @@ constexpr size_t kMaxValueBytes = 255;
 constexpr size_t kVersion = 0;
 constexpr size_t kHeadsPlace = 1;
 constexpr size_t kHeadsCount = 2;
-constexpr size_t kFirstPlace = 3;
+constexpr size_t kEnd = 3;
+constexpr size_t kFirstPlace = 4;
 constexpr size_t kEntryHeader = 2;
 
 [[nodiscard]] inline Word load(const Word& word) {
@@ -59,11 +61,20 @@ struct Key {
 // long.
 [[nodiscard]] bool make_key(std::string_view path, Key& key);
 
+// Behind the last word that has memory. To look at one without would take a page of it, or be a SIGBUS when
+// there is none.
+[[nodiscard]] inline size_t end_of(const Word* words) {
+  const size_t end = load(words[kEnd]);
+  return end < kWords ? end : kWords;
+}
+
 // The place of the key's head, 0 when the words hold none.
 [[nodiscard]] inline size_t head_of(const Word* words, const Key& key) {
   const size_t place = load(words[kHeadsPlace]);
   const size_t count = load(words[kHeadsCount]);
-  return count == 0 || place < kFirstPlace || place + count > kWords ? 0 : place + key.hash % count;
+  const size_t end = end_of(words);
+  return count == 0 || place < kFirstPlace || place > end || count > end - place ? 0
+                                                                                 : place + key.hash % count;
 }
 
 struct Entry {
@@ -80,10 +91,11 @@ struct Entry {
 
 // Returns false when there can be no entry.
 [[nodiscard]] inline bool load_entry(const Word* words, size_t place, Entry& entry) {
-  if (place < kFirstPlace || place > kWords - kEntryHeader) return false;
+  const size_t end = end_of(words);
+  if (place < kFirstPlace || place > end || end - place < kEntryHeader) return false;
   const Word sizes = load(words[place + 1]);
   entry = {place, load(words[place]), sizes & 0xFFU, (sizes >> 8) & 0xFFU, sizes >> 16};
-  return words_for(entry.value_bytes) <= entry.room && place + entry.words() <= kWords;
+  return words_for(entry.value_bytes) <= entry.room && entry.words() <= end - place;
 }
 
 [[nodiscard]] inline bool has_path(const Word* words, const Entry& entry, const Key& key) {
@@ -94,12 +106,14 @@ struct Entry {
   return true;
 }
 
-// Returns false when there is no entry of the path.
-[[nodiscard]] inline bool find_entry(const Word* words, const Key& key, Entry& entry) {
-  constexpr int kMostSteps = 1000;  // what is changed meanwhile may look like a circle
+// How far a reader follows a chain: what is changed meanwhile may look like a circle.
+constexpr size_t kMostSteps = 1000;
+
+// Returns false when there is no entry of the path among the first `most_steps` of its chain.
+[[nodiscard]] inline bool find_entry(const Word* words, const Key& key, Entry& entry, size_t most_steps) {
   const size_t head = head_of(words, key);
   size_t place = head == 0 ? 0 : load(words[head]);
-  for (int i = 0; i < kMostSteps && load_entry(words, place, entry); i++) {
+  for (size_t i = 0; i < most_steps && load_entry(words, place, entry); i++) {
     if (has_path(words, entry, key)) return true;
     place = entry.next;
   }

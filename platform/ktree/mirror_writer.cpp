@@ -93,11 +93,16 @@ class MirrorWriter::Change {
 };
 
 MirrorWriter::~MirrorWriter() {
-  if (words_ != nullptr) munmap(words_, kBytes);
-  if (fd_ >= 0) close(fd_);
+  drop();
+}
+
+void MirrorWriter::drop() {
+  if (words_ != nullptr) munmap(std::exchange(words_, nullptr), kBytes);
+  if (fd_ >= 0) close(std::exchange(fd_, -1));
 }
 
 bool MirrorWriter::make() {
+  reserved_ = 0;
   fd_ = memfd_create("ktree-mirror", MFD_CLOEXEC | MFD_ALLOW_SEALING);
   if (fd_ < 0 || ftruncate(fd_, kBytes) != 0) return false;
   void* words = mmap(nullptr, kBytes, PROT_READ | PROT_WRITE, MAP_SHARED, fd_, 0);
@@ -108,13 +113,13 @@ bool MirrorWriter::make() {
 }
 
 int MirrorWriter::descriptor() {
-  if (fd_ >= 0) return words_ == nullptr ? -1 : fd_;
+  if (fd_ >= 0) return fd_;
   if (make()) {
     fill();
-  } else if (words_ != nullptr) {
-    munmap(std::exchange(words_, nullptr), kBytes);
+  } else {
+    drop();
   }
-  return words_ == nullptr ? -1 : fd_;
+  return fd_;
 }
 
 // Sees to it that the first `words` have memory: a page that the machine has none for would be a SIGBUS.
@@ -126,6 +131,7 @@ bool MirrorWriter::reserve(size_t words) {
   const auto size = static_cast<off_t>((wanted - reserved_) * sizeof(Word));
   if (fallocate(fd_, 0, begin, size) != 0) return false;
   reserved_ = wanted;
+  store(mirror::kEnd, static_cast<Word>(reserved_));
   return true;
 }
 
@@ -146,10 +152,15 @@ void MirrorWriter::store_value(const Entry& entry, std::string_view value) {
   store_text(entry.value_place(), value);
 }
 
+// Also where no reader would look any more: what is deleted must not come back when the chain gets shorter.
+bool MirrorWriter::find(const Key& key, Entry& entry) const {
+  return find_entry(words_, key, entry, mirror::kWords);
+}
+
 // Takes the path's entry out of its chain, where there is one.
 void MirrorWriter::take_out(const Key& key) {
   Entry entry = {};
-  if (!find_entry(words_, key, entry)) return;
+  if (!find(key, entry)) return;
   size_t link = head_of(words_, key);  // the word that leads to the entry
   while (words_[link] != entry.place) link = words_[link];
   store(link, static_cast<Word>(entry.next));
@@ -176,7 +187,7 @@ void MirrorWriter::set(std::string_view path, std::string_view value) {
   {
     const Change change(words_);
     Entry entry = {};
-    const bool held = find_entry(words_, key, entry);
+    const bool held = find(key, entry);
     if (held && value.size() <= mirror::kMaxValueBytes && words_for(value.size()) <= entry.room) {
       store_value(entry, value);
     } else {
@@ -228,7 +239,7 @@ void MirrorWriter::fill() {
   if (words_ == nullptr) return;
   const Change change(words_);
   size_t heads = std::max(kFewestHeads, std::bit_ceil(tree_.node_count() / 2));
-  if (!reserve(mirror::kFirstPlace + heads)) heads = kFewestHeads;
+  while (heads > kFewestHeads && !reserve(mirror::kFirstPlace + heads)) heads /= 2;
   store(mirror::kHeadsPlace, mirror::kFirstPlace);
   store(mirror::kHeadsCount, static_cast<Word>(heads));
   for (size_t i = 0; i < heads; i++) store(mirror::kFirstPlace + i, 0);

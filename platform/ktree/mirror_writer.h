@@ -20,7 +20,7 @@ class MirrorWriter {
   MirrorWriter& operator=(const MirrorWriter&) = delete;
   ~MirrorWriter();
 
-  // The memory file, made and filled at the first call; -1 when it cannot be had. Its size is sealed, and
+  // The memory file, made and filled at the first call; -1 while it cannot be had. Its size is sealed, and
   // nobody else can write it. Before that call there is no mirror, and all below do nothing.
   [[nodiscard]] int descriptor();
 
@@ -39,7 +39,9 @@ class MirrorWriter {
   class Change;
 
   [[nodiscard]] bool make();
+  void drop();
   [[nodiscard]] bool reserve(size_t words);
+  [[nodiscard]] bool find(const mirror::Key& key, mirror::Entry& entry) const;
   void store(size_t place, mirror::Word word);
   void store_text(size_t place, std::string_view text);
   void store_value(const mirror::Entry& entry, std::string_view value);

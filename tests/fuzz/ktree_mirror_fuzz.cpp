@@ -31,13 +31,14 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   memcpy(&words[first], data, count * sizeof(Word));
   words[mirror::kHeadsPlace] = mirror::kFirstPlace;
   words[mirror::kHeadsCount] = kHeads;
+  words[mirror::kEnd] = static_cast<Word>(mirror::kWords);
   const size_t head = head_of(words.data(), key);
   words[head] = static_cast<Word>(data[1] % 16 == 0 ? mirror::kWords - data[0] % 64 : first);
   if (data[1] % 2 == 0 && first + 64 < mirror::kWords) {  // an entry of this path
     words[first + 1] = (words[first + 1] & ~0xFFU) | static_cast<Word>(key.bytes);
     memcpy(&words[first + mirror::kEntryHeader], key.words, key.count * sizeof(Word));
   }
-  if (data[1] % 32 == 1) memcpy(&words[mirror::kHeadsPlace], data + 4, 2 * sizeof(Word));
+  if (data[1] % 32 == 1) memcpy(&words[mirror::kHeadsPlace], data, 3 * sizeof(Word));
   const size_t room = data[size - 1];
   std::string buffer(room + 8, 'x');
   const int got = mirror::read(words.data(), path, buffer.data(), room);

@@ -4,10 +4,13 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/mman.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <cerrno>
 #include <cstdint>
+#include <cstring>
 #include <optional>
 #include <random>
 #include <string>
@@ -21,6 +24,7 @@
 namespace {
 
 size_t memory_left = SIZE_MAX;
+unsigned refusals = 0;
 
 }  // namespace
 
@@ -28,6 +32,7 @@ size_t memory_left = SIZE_MAX;
 extern "C" int __real_fallocate(int fd, int mode, off_t offset, off_t size);
 extern "C" int __wrap_fallocate(int fd, int mode, off_t offset, off_t size) {
   if (memory_left < static_cast<size_t>(size)) {
+    refusals++;
     errno = ENOSPC;
     return -1;
   }
@@ -106,8 +111,9 @@ TEST_F(MirrorTest, KnowsEverySpelling) {
   set("/id/a:1/b:11", "x");
   for (const char* path : {"/id:1/a/b:11", "/id/a/b:11", "/id:1/a:1/b:11", "/id/a:1/b:11"})
     EXPECT_EQ(read(path), "x") << path;
-  for (const char* path : {"", "/", ":1", "/id", "/id/a/b", "/id/a/b:1", "/id:1:1/a/b:11", "/id:01/a/b:11",
-                           "/id:/a/b:11", "/id/a/b:111", "/id/a/b:11:1", "/id:1:1/a:1/b:11:1"}) {
+  for (const char* path :
+       {"", "/", ":1", "/id", "/id/a/b", "/id/a/b:1", "/id:1:1/a/b:11", "/id:01/a/b:11", "/id:/a/b:11",
+        "/id/a/b:111", "/id/a/b:11:1", "/id:1:1/a:1/b:11:1", ":1/id/a/b:11", "/:1/id/a/b:11"}) {
     EXPECT_EQ(read(path), kNotThere) << path;
   }
 }
@@ -189,6 +195,70 @@ TEST_F(MirrorTest, ItMayBeFull) {
   EXPECT_EQ(read("/b:4096"), "z");
 }
 
+// Many nodes, of which few have values, and no memory for as many heads.
+TEST_F(MirrorTest, WithFewHeadsItIsNotFilledAnewAllTheTime) {
+  open();
+  memory_left = 3 << 16;
+  for (unsigned i = 1; i <= 40; i++) set("/n:" + std::to_string(i) + "/i:4096", "x");
+  for (unsigned i = 1; i <= 4096; i++) set("/v:" + std::to_string(i), "x");
+  for (unsigned i = 1; i <= 4096; i++) set("/w:" + std::to_string(i), "x");
+  EXPECT_EQ(read("/v:4"), "x");
+  refusals = 0;
+  for (unsigned i = 0; i < 1000; i++) set("/v:4", std::to_string(i % 10));
+  EXPECT_LT(refusals, 5U);
+}
+
+// Paths whose entries all are in one chain, more of them than a reader looks through.
+TEST_F(MirrorTest, WhatIsFarDownAChainIsTakenOut) {
+  open();
+  std::vector<std::string> paths;
+  for (unsigned i = 0; paths.size() < 1100; i++) {
+    mirror::Key key;
+    ASSERT_TRUE(make_key("/p" + std::to_string(i), key));
+    if (key.hash % 1024 == 0) paths.push_back("/p" + std::to_string(i));
+  }
+  for (const std::string& path : paths) set(path, "old");
+  ASSERT_EQ(words_[mirror::kHeadsCount], 1024U);
+  EXPECT_EQ(read(paths[0]), kNotThere);
+  EXPECT_EQ(read(paths[1099]), "old");
+  set(paths[0], "another");
+  del(paths[0]);
+  for (unsigned i = 200; i < 1100; i++) del(paths[i]);
+  EXPECT_EQ(read(paths[0]), kNotThere);
+  EXPECT_EQ(read(paths[1]), "old");
+}
+
+// A page that nobody has had memory for would be taken by the look itself, or end the reader when there is
+// none.
+TEST_F(MirrorTest, AReaderTouchesNothingThatHasNoMemory) {
+  const int fd = memfd_create("test", MFD_CLOEXEC);
+  ASSERT_EQ(ftruncate(fd, mirror::kBytes), 0);
+  void* map = mmap(nullptr, mirror::kBytes, PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
+  ASSERT_NE(map, MAP_FAILED);
+  auto* words = static_cast<mirror::Word*>(map);
+  mirror::Key key;
+  ASSERT_TRUE(make_key("/a", key));
+  words[mirror::kEnd] = 8192;
+  words[mirror::kHeadsPlace] = mirror::kFirstPlace;
+  words[mirror::kHeadsCount] = 1;
+  struct stat before = {};
+  struct stat after = {};
+  memset(words + 2000, 0xFF,
+         (8192 - 2000) * sizeof(mirror::Word));  // what is a value, and looks like an entry
+  ASSERT_EQ(fstat(fd, &before), 0);
+  char buffer[300];
+  for (const mirror::Word place : {8192U, 1000000U, 8191U, 8190U, 2000U}) {
+    words[mirror::kFirstPlace] = place;
+    EXPECT_EQ(mirror::read(words, "/a", buffer, sizeof buffer), -1);
+  }
+  words[mirror::kHeadsPlace] = 1000000;
+  EXPECT_EQ(mirror::read(words, "/a", buffer, sizeof buffer), -1);
+  ASSERT_EQ(fstat(fd, &after), 0);
+  EXPECT_EQ(after.st_blocks, before.st_blocks);
+  munmap(map, mirror::kBytes);
+  close(fd);
+}
+
 // A value that grows again and again leaves its old places behind; they are had back.
 TEST_F(MirrorTest, OldPlacesAreUsedAgain) {
   open();
@@ -208,6 +278,10 @@ TEST_F(MirrorTest, WithoutMemoryThereIsNone) {
   set("/a", "x");
   del("/a");
   writer_.fill();
+  memory_left = SIZE_MAX;
+  set("/b", "y");
+  open();
+  EXPECT_EQ(read("/b"), "y");
 }
 
 TEST_F(MirrorTest, NobodyElseCanWriteOrCutIt) {
