@@ -56,11 +56,6 @@ size_t cells_of(wchar_t character) {
   return width > 0 ? static_cast<size_t>(width) : 0;
 }
 
-// Most text is: what is to be known of it needs no locale, which has to be read from a file.
-bool is_printable_ascii(std::string_view text) {
-  return std::all_of(text.begin(), text.end(), [](char byte) { return byte >= 0x20 && byte < 0x7f; });
-}
-
 void append_escaped(std::string& text, std::string_view bytes) {
   for (const char byte : bytes) {
     char hex[8];
@@ -76,6 +71,10 @@ bool is_plain(std::string_view bytes, const std::wstring& characters, size_t at)
 }
 
 }  // namespace
+
+bool is_printable_ascii(std::string_view text) {
+  return std::all_of(text.begin(), text.end(), [](char byte) { return byte >= 0x20 && byte < 0x7f; });
+}
 
 bool decode(std::string_view text, std::wstring& characters) {
   characters.clear();
@@ -169,10 +168,6 @@ std::string printable(std::string_view text) {
     text.remove_prefix(size == 0 ? 1 : size);
   }
   return shown;
-}
-
-bool is_ascii(std::string_view text) {
-  return std::none_of(text.begin(), text.end(), [](char byte) { return (byte & 0x80) != 0; });
 }
 
 std::string ascii(std::string_view text) {

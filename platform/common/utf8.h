@@ -7,6 +7,10 @@
 
 namespace platform {
 
+// True for what most text is: a byte is a character and takes one cell, and no locale has to be read from a
+// file to know that.
+bool is_printable_ascii(std::string_view text);
+
 // Puts the characters of `text` into `characters`. Returns false when it is not UTF-8; there are none then.
 bool decode(std::string_view text, std::wstring& characters);
 
@@ -35,8 +39,6 @@ size_t first_cells(std::string_view text, size_t most);
 // `text` as it may stand on a line: control and invisible characters as \xHH, and all that is not ASCII as
 // well when it is not UTF-8.
 std::string printable(std::string_view text);
-
-bool is_ascii(std::string_view text);
 
 // `text` with all that is not ASCII as \xHH.
 std::string ascii(std::string_view text);

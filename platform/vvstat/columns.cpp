@@ -148,8 +148,10 @@ bool has_utf8() {
 
 // The text as it may stand in a cell.
 std::string cell(const Column& column, const Row& row, const Layout& layout) {
-  const std::string text = platform::printable(column.text(row, layout));
-  return platform::is_ascii(text) || has_utf8() ? text : platform::ascii(text);
+  std::string text = column.text(row, layout);
+  if (platform::is_printable_ascii(text)) return text;
+  text = platform::printable(text);
+  return platform::is_printable_ascii(text) || has_utf8() ? text : platform::ascii(text);
 }
 
 size_t find_column(std::string_view name) {

@@ -167,10 +167,17 @@ Row row_of_volume(const Target& target, const TargetFacts& target_facts, size_t 
   return row;
 }
 
+size_t number_of_rows(const Status& status) {
+  size_t number = 0;
+  for (const Target& target : status.targets) number += std::max<size_t>(1, target.volumes.size());
+  return number;
+}
+
 }  // namespace
 
 std::vector<Row> assess(const Status& status, const std::vector<TargetFacts>& facts) {
   std::vector<Row> rows;
+  rows.reserve(number_of_rows(status));
   for (size_t at = 0; at < status.targets.size(); at++) {
     const Target& target = status.targets[at];
     if (target.volumes.empty()) rows.push_back(row_without_volume(target, facts[at]));

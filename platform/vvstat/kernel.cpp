@@ -34,19 +34,55 @@ class MountTable {
   bool read_ = false;
 };
 
+// Asks for mount points, which have one folder as a rule: that is looked for once. Where it is missing, so
+// are they.
+class MountPoints {
+ public:
+  // Returns whether there is an answer; errno says why not.
+  bool ask(const std::string& path, struct statx& info) {
+    const size_t slash = path.rfind('/');
+    const bool has_folder = slash != std::string::npos && slash > 0 && slash + 1 < path.size();
+    if (has_folder && path.compare(0, slash, folder_) != 0) enter(path.substr(0, slash));
+    if (!has_folder || !(file_.ok() || is_missing_)) return ask(AT_FDCWD, path.c_str(), info);
+    if (is_missing_) errno = ENOENT;
+    return !is_missing_ && ask(file_.get(), path.c_str() + slash + 1, info);
+  }
+
+ private:
+  static bool ask(int folder, const char* path, struct statx& info) {
+    constexpr int kFlags = AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC | AT_SYMLINK_NOFOLLOW;
+    return statx(folder, path, kFlags, STATX_BTIME, &info) == 0;
+  }
+
+  void enter(const std::string& folder) {
+    folder_ = folder;
+    file_.reset(open(folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    is_missing_ = !file_.ok() && (errno == ENOENT || errno == ENOTDIR);
+  }
+
+  std::string folder_;
+  platform::Fd file_;
+  bool is_missing_ = false;
+};
+
+// What is asked for all volumes together.
+struct Tables {
+  MountTable mounts;
+  MountPoints points;
+};
+
 // statx(2) tells the root of a mount since Linux 5.8, from the inode at hand, and with it when that was made:
 // the file system's own beginning. An XFS that has shut itself down fails even that; it is mounted all the
 // same.
-bool find_mount(const std::string& path, MountTable& mounts, VolumeFacts& facts, dev_t& device) {
+bool find_mount(const std::string& path, Tables& tables, VolumeFacts& facts, dev_t& device) {
   struct statx info {};
-  constexpr int kFlags = AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC | AT_SYMLINK_NOFOLLOW;
-  if (statx(AT_FDCWD, path.c_str(), kFlags, STATX_BTIME, &info) == 0) {
+  if (tables.points.ask(path, info)) {
     device = makedev(info.stx_dev_major, info.stx_dev_minor);
     if ((info.stx_mask & STATX_BTIME) != 0) facts.made = static_cast<time_t>(info.stx_btime.tv_sec);
     return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
   }
   if (errno != EIO) return false;
-  const Mount* mount = mounts.on(path);
+  const Mount* mount = tables.mounts.on(path);
   if (mount == nullptr) return false;
   facts.shut_down = true;
   device = mount->device;
@@ -95,11 +131,11 @@ std::string options_of(const std::string& mount_point, MountTable& mounts) {
   return mount != nullptr ? mount->options : std::string();
 }
 
-VolumeFacts facts_of(const Volume& volume, bool answering, Extent extent, MountTable& mounts) {
+VolumeFacts facts_of(const Volume& volume, bool answering, Extent extent, Tables& tables) {
   VolumeFacts facts;
   dev_t device{};
   struct statvfs space {};
-  if (volume.mount_point.empty() || !find_mount(volume.mount_point, mounts, facts, device) ||
+  if (volume.mount_point.empty() || !find_mount(volume.mount_point, tables, facts, device) ||
       statvfs(volume.mount_point.c_str(), &space) != 0) {
     return {};
   }
@@ -111,7 +147,7 @@ VolumeFacts facts_of(const Volume& volume, bool answering, Extent extent, MountT
   facts.disk_read_only = facts.read_only && is_read_only_disk(volume.device);
   facts.size = static_cast<unsigned long long>(space.f_blocks) * space.f_frsize;
   facts.used = static_cast<unsigned long long>(space.f_blocks - space.f_bfree) * space.f_frsize;
-  if (extent == Extent::kAll) facts.options = options_of(volume.mount_point, mounts);
+  if (extent == Extent::kAll) facts.options = options_of(volume.mount_point, tables.mounts);
   return facts;
 }
 
@@ -127,7 +163,7 @@ const Session* session_of(const Target& target, const std::vector<Session>& sess
 
 std::vector<TargetFacts> read_facts(const Status& status, Extent extent) {
   const std::vector<Session> sessions = platform::read_sessions();
-  MountTable mounts;
+  Tables tables;
   std::vector<TargetFacts> all;
   for (const Target& target : status.targets) {
     TargetFacts facts;
@@ -137,8 +173,9 @@ std::vector<TargetFacts> read_facts(const Status& status, Extent extent) {
       if (extent == Extent::kAll) facts.address = platform::address_of(*session);
     }
     const bool answering = session != nullptr && session->link == Link::kUp;
+    facts.volumes.reserve(target.volumes.size());
     for (const Volume& volume : target.volumes) {
-      facts.volumes.push_back(facts_of(volume, answering, extent, mounts));
+      facts.volumes.push_back(facts_of(volume, answering, extent, tables));
     }
     all.push_back(std::move(facts));
   }

@@ -101,9 +101,9 @@ int show_once(const PageOptions& options) {
     fputs(why_unreachable(), stderr);
     return kUnreachable;
   }
-  const Page page = page_of(seen, options);
-  const char* between = page.table.empty() || page.verdict.empty() ? "" : "\n";
-  put(page.table + between + page.verdict);
+  Page page = page_of(seen, options);
+  if (!page.table.empty() && !page.verdict.empty()) page.table += '\n';
+  put(page.table.append(page.verdict));
   return finish(exit_status(seen));
 }
 

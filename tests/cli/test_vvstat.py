@@ -314,6 +314,16 @@ def test_only_what_is_shown_is_asked_of_the_kernel(example, options, everything)
     assert IS_DISK_READ_ONLY not in paths  # of what can be written
 
 
+@pytest.mark.parametrize("place, mounted", [("/mnt/link/Backup", True), ("/mnt/VV/Backup/", True), ("/mnt/VV/../VV/Backup", True),
+                                            ("/", True), ("Backup", False), ("/Backup", False), ("/mnt/none/Backup", False),
+                                            ("/mnt/VV/Backup/file", False), ("/mnt/VV/Backup/file/x", False)])
+def test_a_mount_point_wherever_it_is(example, place, mounted):
+    """The second volume's is in the usual folder."""
+    example.run(["ln", "-s", "/mnt/VV", "/mnt/link"])
+    change(example, {"lun/id:1/mnt": place})
+    assert [volume["mounted"] for volume in volumes(example)[:2]] == [mounted, True]
+
+
 def test_a_locale_is_read_only_where_a_name_needs_one(example):
     assert any("locale" in path for path in opened(example))
     change(example, {"lun/id:2/share": "Photos", "lun/id:2/mnt": "/mnt/VV/Photos"})
