@@ -196,8 +196,9 @@ int serve() {
 
 constexpr char kHelp[] =
     "usage: remvol-events [--test]\n"
-    "Runs \"remvol --oiscsi_evt_reopen -n TARGET\" when the connection of an iSCSI session is lost and\n"
-    "\"remvol --oiscsi_evt_recover -n TARGET\" when the session is back, and remvol-notify after each.\n"
+    "When the connection of an iSCSI session is lost it runs\n"
+    "\"remvol --oiscsi_evt_reopen -n TARGET\", when the session is back\n"
+    "\"remvol --oiscsi_evt_recover -n TARGET\", and remvol-notify after each.\n"
     "Stays in the foreground.\n"
     "  --test         has remvol-notify tell of a made-up event, and ends\n"
     "  -h, --help     this text\n"

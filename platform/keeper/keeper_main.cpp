@@ -186,8 +186,8 @@ int serve() {
 
 constexpr char kHelp[] =
     "usage: remvol-keeper\n"
-    "Starts the initiator's daemon again when it has died, and has targets connected that should be and are "
-    "not.\n"
+    "Starts the initiator's daemon again when it has died, and has targets connected\n"
+    "that should be and are not.\n"
     "Stays in the foreground.\n"
     "  -h, --help     this text\n"
     "  -V, --version  the version\n";

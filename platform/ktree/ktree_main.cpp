@@ -37,7 +37,8 @@ constexpr char kUsage[] =
     "\n"
     "  -n NAME        name of the tree; the process number goes into SOCKET_NAME.pid\n"
     "  -s SOCKET      path of the socket\n"
-    "  -l FILE        load the settings file first; of several, the first that can be loaded\n"
+    "  -l FILE        load the settings file first; of several, the first that can be\n"
+    "                 loaded\n"
     "  -h, --help     print this text and exit\n"
     "  -V, --version  print the version and exit\n";
 

@@ -118,14 +118,14 @@ int tell_of_failed_recovery(const char* target) {
 
 constexpr char kHelp[] =
     "usage: remvol-notify [--test | --recovery-failed TARGET]\n"
-    "Looks at the volumes of remote targets and tells what has changed since its last look: in the\n"
-    "journal, by mail and by programs, as remvol.conf(5) says.\n"
+    "Looks at the volumes of remote targets and tells what has changed since its last\n"
+    "look: in the journal, by mail and by programs, as remvol.conf(5) says.\n"
     "  --test                    tells of a made-up event\n"
     "  --recovery-failed TARGET  tells that a recovery is not tried again\n"
     "  -h, --help                this text\n"
     "  -V, --version             the version\n"
-    "Exit status: 0 all is told, 1 something could not be, 2 usage, 3 the configuration tree cannot be\n"
-    "reached.\n";
+    "Exit status: 0 all is told, 1 something could not be, 2 usage,\n"
+    "3 the configuration tree cannot be reached.\n";
 
 constexpr option kLongOptions[] = {{"test", no_argument, nullptr, 't'},
                                    {"recovery-failed", required_argument, nullptr, 'r'},

@@ -28,8 +28,9 @@ constexpr char kHelpBegin[] =
     "Commands:\n";
 constexpr char kHelpEnd[] =
     "\n"
-    "Exit status: 0 done, 1 failed, 2 wrong usage or no such share or target, 3 the configuration\n"
-    "tree cannot be reached, 4 refused: not confirmed, or there is data on the disk.\n"
+    "Exit status: 0 done, 1 failed, 2 wrong usage or no such share or target,\n"
+    "3 the configuration tree cannot be reached, 4 refused: not confirmed, or there\n"
+    "is data on the disk.\n"
     "\"vv status\" is vvstat, with its options and exit status.\n";
 
 // As getopt_long(3) wants them.

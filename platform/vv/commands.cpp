@@ -16,7 +16,7 @@ constexpr Command kCommands[] = {
     {"connect", "SHARE|TARGET", 0, 0, connect, "logs in, and mounts the target's volumes"},
     {"disconnect", "SHARE|TARGET", kYes, 0, disconnect, "unmounts the target's volumes, and logs out"},
     {"format", "SHARE", kDestroyData | kYes, 0, format, "makes a new file system on the share's LUN"},
-    {"delete", "SHARE|TARGET", kYes, 0, remove, "ends its use here; the data stays on the storage server"},
+    {"delete", "SHARE|TARGET", kYes, 0, remove, "ends its use here; the server keeps the data"},
     {"rename-portal", "SHARE|TARGET", kPortal, kPortal, rename_portal, "the target is at another portal now"},
     {"password", "SHARE|TARGET", kUser | kNoPassword | kYes, 0, password,
      "changes the user and the password of the target"},

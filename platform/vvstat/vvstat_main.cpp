@@ -170,8 +170,8 @@ constexpr char kHelp[] =
     "  -V, --version       the version\n"
     "Columns:\n";
 constexpr char kStatusHelp[] =
-    "Exit status: 0 all that is wanted is healthy, 1 something is not, 2 wrong usage or the\n"
-    "output cannot be written, 3 the configuration tree cannot be reached.\n";
+    "Exit status: 0 all that is wanted is healthy, 1 something is not, 2 wrong usage\n"
+    "or the output cannot be written, 3 the configuration tree cannot be reached.\n";
 
 constexpr option kLongOptions[] = {{"unhealthy", no_argument, nullptr, 'x'},
                                    {"watch", no_argument, nullptr, 'w'},

@@ -122,6 +122,12 @@ def test_a_command_of_the_tool_in_a_sentence_is_one(document, command):
             assert re.fullmatch(r"-[ipnsvcUPdlhow]", word), document
 
 
+@pytest.mark.parametrize("program", ["vv", "vvstat", "ktree", "ktreec", "remvol-events", "remvol-keeper", "remvol-notify"])
+def test_the_help_of_a_program_fits_a_screen(program):
+    told = subprocess.run([BUILD / "bin" / program, "--help"], stdout=subprocess.PIPE, text=True, check=True).stdout
+    assert [line for line in told.splitlines() if len(line) > 80] == []
+
+
 @pytest.mark.parametrize("program, page", [("vv", "vv.8"), ("vvstat", "vvstat.1"), ("ktree", "ktree.8"), ("ktreec", "ktreec.1"),
                                            ("remvol-events", "remvol-events.8"), ("remvol-keeper", "remvol-keeper.8"),
                                            ("remvol-notify", "remvol-notify.8")])

@@ -22,7 +22,8 @@ constexpr int kUnreachable = 3;
 
 constexpr char kUsage[] =
     "Usage: ktreec [-S SOCKET] OPERATION\n"
-    "Reads and changes the configuration tree of the ktree daemon on SOCKET (/var/run/ktree_sock).\n"
+    "Reads and changes the configuration tree of the ktree daemon on SOCKET\n"
+    "(/var/run/ktree_sock).\n"
     "\n"
     "  -g PATH        print the value\n"
     "  -s PATH VALUE  set the value\n"
@@ -33,7 +34,8 @@ constexpr char kUsage[] =
     "  -h, --help     print this text and exit\n"
     "  -V, --version  print the version and exit\n"
     "\n"
-    "Exit status: 0 done, 1 missing or refused, 2 wrong usage, 3 the daemon cannot be reached.\n";
+    "Exit status: 0 done, 1 missing or refused, 2 wrong usage,\n"
+    "3 the daemon cannot be reached.\n";
 
 struct CommandLine {
   const char* socket;
