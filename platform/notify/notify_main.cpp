@@ -85,7 +85,9 @@ int tell(const std::vector<Event>& events) {
 int look_and_tell() {
   const vvstat::Status status = vvstat::read_status(platform::TreeListing());
   if (!status.reachable) {
-    platform::report(LOG_WARNING, "remvol-notify: the configuration tree cannot be reached");
+    platform::report(LOG_WARNING, "remvol-notify: %s",
+                     geteuid() == 0 ? "the configuration tree cannot be reached"
+                                    : "only root may read the configuration tree");
     return kUnreachable;
   }
   std::vector<Event> events;

@@ -107,9 +107,11 @@ int show_once(const PageOptions& options) {
   return finish(exit_status(seen));
 }
 
-// For a collector of metrics the absence of the tree is news as well.
+// For a collector of metrics the absence of the tree is news as well. What keeps it from being read is said
+// only where that is the user.
 int show_metrics() {
   const Snapshot seen = look(Extent::kHealth);
+  if (!seen.status.reachable && geteuid() != 0) fputs(why_unreachable(), stderr);
   put(metrics(seen.status.reachable, seen.rows, time(nullptr)));
   return finish(exit_status(seen));
 }

@@ -306,6 +306,12 @@ def test_without_the_tree(example, journal):  # noqa: F811
     assert journal.entries() == []
 
 
+def test_somebody_who_may_not_read_the_tree_is_told(example, journal):  # noqa: F811
+    done = example.run(["/usr/bin/setpriv", "--reuid=65534", "--regid=65534", "--clear-groups", "remvol-notify"],
+                       env={"LD_PRELOAD": None})
+    assert (done.status, done.stderr) == (3, "remvol-notify: only root may read the configuration tree\n")
+
+
 def test_looks_at_the_same_time_tell_a_change_once(example, journal):  # noqa: F811
     notify(example)
     lose(example)

@@ -567,7 +567,15 @@ def test_promtool_accepts_the_metrics_without_the_tree(box):
 def test_metrics_without_the_tree_say_so(box):
     box.tree.stop()
     assert metrics(box) == {"remvol_tree_reachable": {(): 0}}
-    assert vvstat(box, "-P").status == 3
+    done = vvstat(box, "-P")
+    assert (done.status, done.stderr) == (3, "")  # a collector asks every minute, and has it in the metrics
+
+
+def test_metrics_without_root_say_that_root_is_needed(example):
+    done = example.run(["/usr/bin/setpriv", "--reuid=65534", "--regid=65534", "--clear-groups", "vvstat", "-P"],
+                       env={"LD_PRELOAD": None})
+    assert (done.status, done.stderr) == (3, "vvstat: only root may read the configuration tree\n")
+    assert done.stdout.endswith("\nremvol_tree_reachable 0\n")
 
 
 @pytest.mark.parametrize("name", ['a"b', "a\\b", "a\nb", "a\udcffb", "{x=}"])
