@@ -11,7 +11,7 @@ import pytest
 
 from harness.documents import blocks_of
 from harness.ktree_daemon import BUILD, Daemon
-from test_vvstat import promtool
+from test_vvstat import TREE_PROBLEMS, UNMOUNTED_PROBLEMS, promtool
 
 TOP = pathlib.Path(__file__).resolve().parents[2]
 DOCS = TOP / "docs"
@@ -120,6 +120,11 @@ def test_a_command_of_the_tool_in_a_sentence_is_one(document, command):
             assert word[2:] in COMMANDS, document
         elif word.startswith("-"):
             assert re.fullmatch(r"-[ipnsvcUPdlhow]", word), document
+
+
+@pytest.mark.parametrize("status", sorted({status for _, status, _, _ in [*TREE_PROBLEMS, *UNMOUNTED_PROBLEMS]}))
+def test_a_status_that_vvstat_shows_is_in_the_guide(status):
+    assert re.search(rf'(^\| |"){status}( \||")', (DOCS / "operators-guide.md").read_text(), re.M)
 
 
 @pytest.mark.parametrize("program", ["vv", "vvstat", "ktree", "ktreec", "remvol-events", "remvol-keeper", "remvol-notify"])

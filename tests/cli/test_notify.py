@@ -184,6 +184,13 @@ def test_every_event_has_a_text_in_the_catalog(example, journal):  # noqa: F811
     assert journal.entries()[0]["MESSAGE_ID"] in ids
 
 
+@pytest.mark.parametrize("subject", ["A volume became read-only", "A volume is nearly full"])
+def test_the_catalog_says_the_commands_that_a_person_uses(subject):
+    catalog = (PACKAGING / "remvol.catalog").read_text()
+    text, = [text for text in catalog.split("\n-- ") if f"\nSubject: {subject}\n" in text]
+    assert re.findall(r"^    (.*)$", text, re.M) == ["vv disconnect @TARGET@", "vv connect @TARGET@"]
+
+
 def test_the_program_gets_the_event_as_words(example):  # noqa: F811
     notify(example)
     example.write(CONFIG, "# who is told\n\tPROGRAM  /opt/tell me  # here\n")
