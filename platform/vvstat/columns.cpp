@@ -257,7 +257,16 @@ std::vector<size_t> widths_of(const std::vector<Wish>& wishes, size_t asked_for,
   return widths[kFirst + asked_for - 1] != 0 ? widths : fitting_widths(wishes, layout.width);
 }
 
-std::vector<Place> places_of(const std::vector<Content>& contents, const Layout& layout) {
+// A text that is cut says so.
+void cut(Content& content, size_t width) {
+  if (content.width <= width) return;
+  for (std::string& text : content.cells) {
+    if (platform::cells(text) > width) text = text.substr(0, platform::first_cells(text, width - 1)) + "~";
+  }
+}
+
+// Cuts the contents to their places.
+std::vector<Place> places_of(std::vector<Content>& contents, const Layout& layout) {
   std::vector<Place> places;
   if (layout.form != Form::kTable) {
     for (const Content& content : contents) places.push_back({&content, kUncut});
@@ -267,9 +276,11 @@ std::vector<Place> places_of(const std::vector<Content>& contents, const Layout&
   std::vector<Wish> wishes;
   for (const Content* content : order) wishes.push_back(wish_of(*content));
   const std::vector<size_t> widths = widths_of(wishes, contents.size() - kUsual, layout);
-  for (const Content& content : contents) {
+  for (Content& content : contents) {
     const size_t at = static_cast<size_t>(std::find(order.begin(), order.end(), &content) - order.begin());
-    if (widths[at] != 0) places.push_back({&content, widths[at]});
+    if (widths[at] == 0) continue;
+    cut(content, widths[at]);
+    places.push_back({&content, widths[at]});
   }
   return places;
 }
@@ -285,12 +296,6 @@ std::string line_of_block(const Column& column, const std::string& value, size_t
   const std::string lines = std::string_view(column.name) == "COMMAND" ? folded_command(value, indents, width)
                                                                        : folded(value, indents, width);
   return name + lines.substr(indent);
-}
-
-// A text that is cut says so.
-std::string cut(const std::string& text, size_t width) {
-  if (width == kUncut || platform::cells(text) <= width) return text;
-  return text.substr(0, platform::first_cells(text, width - 1)) + "~";
 }
 
 bool add_column(libscols_table* table, const Place& place) {
@@ -310,7 +315,7 @@ bool add_row(libscols_table* table, const Row& row, size_t number, const std::ve
   libscols_line* line = scols_table_new_line(table, nullptr);
   if (line == nullptr) return false;
   for (size_t at = 0; at < places.size(); at++) {
-    const std::string text = cut(places[at].content->cells[number], places[at].width);
+    const std::string& text = places[at].content->cells[number];
     if (text.empty()) continue;
     if (scols_line_set_data(line, at, text.c_str()) != 0) return false;
     if (layout.colour && places[at].content->column == kStatus && row.wanted) {
@@ -322,7 +327,7 @@ bool add_row(libscols_table* table, const Row& row, size_t number, const std::ve
 
 platform::ScolsTable table_of(const std::vector<Row>& rows, const Layout& layout) {
   platform::ScolsTable table(scols_new_table());
-  const std::vector<Content> contents = contents_of(rows, layout);
+  std::vector<Content> contents = contents_of(rows, layout);
   const std::vector<Place> places = places_of(contents, layout);
   bool good = table != nullptr && scols_table_set_name(table.get(), "volumes") == 0;
   for (const Place& place : places) good = good && add_column(table.get(), place);
