@@ -14,6 +14,8 @@ namespace remvol {
 
 namespace {
 
+constexpr int kCheckFailed = 1;  // a result of the handler's own
+
 // Returns whether the request names a target and a portal; logs what is missing.
 bool check_request(const TargetEntry& request) {
   if (request.target_name[0] == '\0') {
@@ -49,18 +51,18 @@ int modify_address(const TargetEntry& request) {
     print_open(0, "Target %s is not existed in config", request.target_name);
     return kFailed;
   }
-  if (check_target_connected(request.target_name) != 0) return refuse_connected(request);
+  if (check_target_connected(request.target_name) != kNotLoggedIn) return refuse_connected(request);
   switch (Portal_search_target(request.target_name, request.ip, request.port)) {
-    case 0:
+    case kNotOffered:
       print_open(kNote, "Can not find %s at IP: %s Port: %d", request.target_name, request.ip, request.port);
       return kOk;
-    case 1:
+    case kOffered:
       return store_portal(request, dbidx);
-    case 2:
+    case kLoggedInAlready:
       return refuse_connected(request);
     default:
       LOG(0, "Portal_search_target() failed");
-      return 1;
+      return kCheckFailed;
   }
 }
 

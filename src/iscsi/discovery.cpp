@@ -70,14 +70,14 @@ void publish_names(const char* socket, const DiscoveredNames& names) {
 int search_portal(const TargetEntry& request, const char* socket) {
   const TempFile path(discovery_path());
   LOG(kNote, "ip: %s, port: %d", request.ip, request.port);
-  int result = discover(request.ip, request.port, request.iface, path) ? 0 : 1;
+  int result = discover(request.ip, request.port, request.iface, path) ? kSearched : kSearchFailed;
   File file(fopen(path, "re"));
-  if (file == nullptr) return 2;
+  if (file == nullptr) return kSearchUnread;
   DiscoveredNames names;
-  if (!read_names(file.get(), request.ip, &names)) return 1;
+  if (!read_names(file.get(), request.ip, &names)) return kSearchFailed;
   publish_names(socket, names);
   file.reset();
-  if (tree_write_once_to(socket, key::kSearchDone, "1") != kOk) result = 1;
+  if (tree_write_once_to(socket, key::kSearchDone, "1") != kOk) result = kSearchFailed;
   return result;
 }
 
@@ -97,7 +97,7 @@ bool check_portal_arguments(const char* name, const char* address, int port) {
 
 int not_offered(const char* name, const char* address, int port) {
   LOG(2, "Can not find %s at IP: %s Port: %d", name, address, port);
-  return 0;
+  return kNotOffered;
 }
 
 bool find_offer(FILE* file, const char* name, const char* address, int port) {
@@ -117,7 +117,7 @@ int task_search(const TargetEntry& request, const char* output_file) {
   LOG(2, "start");
   // Without an interface no private daemon is started, and what is dumped at the end is the default tree.
   const char* socket = nullptr;
-  int result = 1;
+  int result = kSearchFailed;
   TargetEntry portal = request;
   if (get_iface_name(&portal) == 0) {
     socket = open_results(kTargetResults, output_file);
@@ -131,9 +131,9 @@ int task_search(const TargetEntry& request, const char* output_file) {
 int Portal_search_target(const char* name, const char* address, int port) {
   const LogScope scope;
   if (!check_portal_arguments(name, address, port)) return kFailed;
-  if (check_target_connected(name) != 0) {
+  if (check_target_connected(name) != kNotLoggedIn) {
     LOG(1, "%s is connecting.", name);
-    return 2;
+    return kLoggedInAlready;
   }
   char iface[16];
   if (_get_iface_name(iface, sizeof iface, address) != 0) return kFailed;
@@ -143,12 +143,12 @@ int Portal_search_target(const char* name, const char* address, int port) {
   File file(fopen(path, "re"));
   if (file == nullptr) {
     LOG(1, "discovery target failed at IP: %s Port: %d", address, port);
-    return 0;
+    return kNotOffered;
   }
   const bool offered = find_offer(file.get(), name, address, port);
   file.reset();
   _remove_file(path);
-  return offered ? 1 : not_offered(name, address, port);
+  return offered ? kOffered : not_offered(name, address, port);
 }
 
 }  // namespace remvol

@@ -15,7 +15,7 @@ constexpr int kWaitSeconds = 3;
 
 int publish_luns(const char* socket, const char* name, DeviceNodeMaker make_node) {
   const int ready = _wait_sess_lun_ready(name, kWaitSeconds);
-  if (ready == 1) {
+  if (ready == kNoLunReady) {
     LOG(1, "Can not find any available LUN on target %s", name);
     print_lun_list(nullptr, name);
     ktree_update_search_lun_result(socket, nullptr, name);
@@ -23,7 +23,7 @@ int publish_luns(const char* socket, const char* name, DeviceNodeMaker make_node
     return kOk;
   }
   LunNode* luns = nullptr;
-  if (ready != 0 || _get_sess_lun_list(&luns, name, make_node) != 0) {
+  if (ready != kOk || _get_sess_lun_list(&luns, name, make_node) != kOk) {
     LOG(0, "get session lun list failed");
     return kFailed;
   }

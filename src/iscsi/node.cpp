@@ -69,7 +69,7 @@ void log_in_again(const TargetEntry& entry) {
 
 // Returns whether the session to `name` is there.
 bool confirm_login(const char* name, const char* requested) {
-  if (check_target_connected(name) == 1) return true;
+  if (check_target_connected(name) == kLoggedIn) return true;
   LOG(0, "Can not find target %s in session\n, connect failed.", requested);
   return false;
 }
@@ -81,9 +81,9 @@ int _target_connect_run(const TargetEntry& entry, const char* requested) {
   LOG(1, "try to login - cmd: %s \n", login.c_str());
   FILE* output = nullptr;
   if (run_login(login, &output)) log_in_again(entry);
-  if (output == nullptr) return 1;
+  if (output == nullptr) return kNotConfirmed;
   pclose(output);
-  return confirm_login(entry.target_name, requested) ? 0 : 1;
+  return confirm_login(entry.target_name, requested) ? kOk : kNotConfirmed;
 }
 
 }  // namespace

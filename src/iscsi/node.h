@@ -15,9 +15,12 @@ int Target_Config_Gen(TargetEntry* entry);
 // interface could be chosen.
 int delete_node_record(TargetEntry* entry);
 
+// What _target_login gives for a login that did not start, or that no session confirmed.
+inline constexpr int kNotConfirmed = 1;
+
 // Logs in. The message that the session is not there names `requested`, the target that the command is for:
-// none at start-up. Returns 0; 1 when the login was not confirmed or the command did not start; -1 when no
-// interface could be chosen or the port is out of range.
+// none at start-up. Returns 0; kNotConfirmed; -1 when no interface could be chosen or the port is out of
+// range.
 [[nodiscard]] int _target_login(TargetEntry* entry, const char* requested);
 
 // Sets the connect state "connecting" and logs in, with `requested` as above. Returns 0 or -1. The caller

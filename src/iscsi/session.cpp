@@ -191,7 +191,7 @@ int ktree_update_dev(TargetEntry* entry) {
   const TempFile path(PathText("/tmp/%s.tmp", program_name()));
   const int listed = list_sessions(session_devices_command(path));
   // No session at all changes nothing: the stored device names stay.
-  if (listed != 0) return listed < 0 ? listed : kOk;
+  if (listed != kSessionsListed) return listed < 0 ? listed : kOk;
   return store_listed_devices(entry, path);
 }
 
@@ -207,7 +207,7 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
     LOG(1, "wait lun ready iter = %d", polls);
     const TempFile path(drawn);
     const int listed = list_in_detail(path);
-    if (listed != 0) return listed < 0 ? listed : kOk;
+    if (listed != kSessionsListed) return listed < 0 ? listed : kOk;
     const File file(fopen(path, "re"));
     if (file == nullptr) continue;
     // The count of targets and a LOGGED_IN seen by an earlier poll stay.
@@ -217,7 +217,7 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
     ready = next_usable_lun(file.get(), &listing, line, name);
     _remove_file(path);
   }
-  return ready ? 0 : 1;
+  return ready ? kOk : kNoLunReady;
 }
 
 int _get_sess_lun_list(LunNode** head, const char* name, DeviceNodeMaker make_node) {
@@ -225,7 +225,7 @@ int _get_sess_lun_list(LunNode** head, const char* name, DeviceNodeMaker make_no
   if (check_target_name(head != nullptr ? name : nullptr) != kOk) return kFailed;
   const TempFile path(draw_temp_path("get"));
   const int listed = list_in_detail(path);
-  if (listed != 0) return listed < 0 ? listed : kOk;
+  if (listed != kSessionsListed) return listed < 0 ? listed : kOk;
   *head = nullptr;
   const File file(fopen(path, "re"));
   if (file == nullptr) return 0;

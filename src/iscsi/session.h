@@ -17,6 +17,9 @@ enum DeviceResult : int {
   kNoRunningDisk = -2,
 };
 
+// What _wait_sess_lun_ready gives when the time was too short.
+inline constexpr int kNoLunReady = 1;
+
 // Empties the stored device names of the target's LUNs, up to the first empty slot. Returns 0; -1 for a null
 // entry or an unknown target; -103 when a write failed.
 [[nodiscard]] int ktree_clean_target_dev(TargetEntry* entry);
@@ -28,8 +31,8 @@ enum DeviceResult : int {
 [[nodiscard]] int ktree_update_dev(TargetEntry* entry);
 
 // Waits until the target shows a usable LUN: wait_seconds * 10 polls of 100 ms, one poll for 0. Returns 0
-// ready (also when there is no session at all); 1 not ready in time; -1 bad name; -106 the listing command
-// failed.
+// ready (also when there is no session at all); kNoLunReady; -1 bad name; -106 the listing
+// command failed.
 [[nodiscard]] int _wait_sess_lun_ready(const char* name, int wait_seconds);
 
 // Makes the device node of a disk by its kernel name, such as sdb. Returns 0 or -1.

@@ -16,8 +16,8 @@ namespace remvol {
 
 int list_sessions(const char* command) {
   const int status = system(command);
-  if (status == 0) return 0;
-  if (command_exit_code(status) == kNoSessionExit) return 1;
+  if (status == 0) return kSessionsListed;
+  if (command_exit_code(status) == kNoSessionExit) return kNoSessionAtAll;
   LOG(0, "system() of cmd '%s' failed", command);
   log_command_status(status);
   return kListingFailed;
@@ -28,9 +28,9 @@ int check_target_connected(const char* name) {
   if (name == nullptr || name[0] == '\0') return kFailed;
   const TempFile path(PathText("/tmp/%s_session.tmp", program_name()));
   const int listed = list_sessions(sessions_command(path));
-  if (listed != 0) return listed < 0 ? listed : kOk;
+  if (listed != kSessionsListed) return listed < 0 ? listed : kNotLoggedIn;
   File file(fopen(path, "re"));
-  if (file == nullptr) return 0;
+  if (file == nullptr) return kNotLoggedIn;
   char line[kListingLineSize];
   bool connected = false;
   while (!connected && fgets(line, sizeof line, file.get()) != nullptr) {
@@ -38,7 +38,7 @@ int check_target_connected(const char* name) {
   }
   file.reset();
   _remove_file(path);
-  return connected ? 1 : 0;
+  return connected ? kLoggedIn : kNotLoggedIn;
 }
 
 }  // namespace remvol

@@ -4,12 +4,23 @@
 
 namespace remvol {
 
-// Returns 1 when a session to the target called `name` exists; 0 when not (also when there is no session at
-// all, or the listing could not be read); -1 for a null or empty name; -106 when the listing command failed.
+// Results of the two below that their callers tell apart.
+enum SessionCheck : int {
+  kNotLoggedIn = 0,
+  kLoggedIn = 1,
+};
+enum SessionsListed : int {
+  kSessionsListed = 0,
+  kNoSessionAtAll = 1,
+};
+
+// Returns kLoggedIn when a session to the target called `name` exists; kNotLoggedIn when not (also when there
+// is no session at all, or the listing could not be read); -1 for a null or empty name; -106 when the listing
+// command failed.
 [[nodiscard]] int check_target_connected(const char* name);
 
-// Runs `command`, which lists the sessions. Returns 0; 1 when there is no session at all; -106 when the
-// command failed, which is logged in the innermost scope's name.
+// Runs `command`, which lists the sessions. Returns a SessionsListed; -106 when the command failed, which is
+// logged in the innermost scope's name.
 [[nodiscard]] int list_sessions(const char* command);
 
 }  // namespace remvol

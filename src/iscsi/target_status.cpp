@@ -53,7 +53,7 @@ int ktree_update_status(const TargetEntry* entry, int state) {
   // While the sessions are listed another run may bring the target up, or fail to: what it wrote counts then.
   for (int tries = 0; tries < kStatusTries; tries++) {
     if (state == kRecovering && entry->conn_set == 1) return write_target_status(n, kReconnecting);
-    connected = check_target_connected(entry->target_name) == 1;
+    connected = check_target_connected(entry->target_name) == kLoggedIn;
     const SlotsHeld held(SlotsHeld::kChange);
     const int seen = std::exchange(state, read_connect_state(n));
     if (state == seen) return write_target_state(n, connected, state);

@@ -102,7 +102,7 @@ int task_add(const TargetEntry& request) {
 
   const TargetHold hold(entry.target_name, entry.lun);
   int result = kOk;
-  if (check_target_connected(entry.target_name) == 0) {
+  if (check_target_connected(entry.target_name) == kNotLoggedIn) {
     Target_Config_Gen(&entry);  // no login: the volume is mounted when the target is next connected
   } else if (!mount_added_lun(&entry, dbidx, lun_dbidx, &result)) {
     return result;

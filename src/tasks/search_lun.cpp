@@ -21,14 +21,15 @@ namespace {
 // Logs in for the time of the search. The node record that this makes is left in place.
 bool log_in(TargetEntry* target) {
   Target_Config_Gen(target);
-  return _target_login(target, target->target_name) == 0 && check_target_connected(target->target_name) != 0;
+  return _target_login(target, target->target_name) == 0 &&
+         check_target_connected(target->target_name) != kNotLoggedIn;
 }
 
 // Makes sure of a session, given whether the target is connected; `logged_in` tells whether it was opened
 // here. Returns 0 or -1.
 int open_session(const char* socket, TargetEntry* target, int connected, bool* logged_in) {
-  if (connected == 1) return kOk;
-  if (connected != 0) {
+  if (connected == kLoggedIn) return kOk;
+  if (connected != kNotLoggedIn) {
     LOG(0, "check_target_connected failed");
     return kFailed;
   }
@@ -45,7 +46,7 @@ int search_luns(const char* socket, TargetEntry* target) {
   const char* name = target->target_name;
   std::optional<BriefTargetHold> hold;
   int connected = check_target_connected(name);
-  if (connected == 0 && hold.emplace(name, is_no_lun_formatting).waited()) {
+  if (connected == kNotLoggedIn && hold.emplace(name, is_no_lun_formatting).waited()) {
     connected = check_target_connected(name);
   }
   bool logged_in = false;

@@ -53,7 +53,7 @@ bool has_mounted_volume(int db_idx) {
 int update_dev_at_start(TargetEntry* entry) {
   const int result = ktree_update_dev(entry);
   if (result != kNoRunningDisk || !has_mounted_volume(entry->db_idx)) return result;
-  if (_wait_sess_lun_ready(entry->target_name, kTakeOverSeconds) != 0) return result;
+  if (_wait_sess_lun_ready(entry->target_name, kTakeOverSeconds) != kOk) return result;
   return ktree_update_dev(entry);
 }
 
@@ -68,7 +68,7 @@ bool load_connected_target(TargetEntry* entry, int* result) {
   if (*result != 0) {
     if (*result == kTreeFailed) LOG(0, "ktree failed");
     give_up_session(entry, *result, kVolumeLost);
-    *result = -1;
+    *result = kFailed;
     return false;
   }
   sleep(kSettleSeconds);
