@@ -37,7 +37,7 @@ KeyText result_key() {
 
 // Those who started the command poll this key: empty while it runs, then its result.
 void record_result(const char* value) {
-  ktreec_set(kVolumesSocket, 0, result_key(), value);
+  (void)tree_write(result_key(), value);
 }
 
 int fail(bool show_usage) {

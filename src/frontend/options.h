@@ -19,15 +19,15 @@ void hide_secrets(int argc, char** argv, int* shown);
 
 // Reads the arguments into the request. -d and -v do their work at once and end the reading. A value that is
 // longer than its field fails; cut, two long names would become one.
-ParseEnd parse_options(int argc, char** argv);
+[[nodiscard]] ParseEnd parse_options(int argc, char** argv);
 
 // The one place where rules for target and share names would stand. Returns 0 to accept `name`, which it
 // always does, or a negative number.
-int check_name(const char* name);
+[[nodiscard]] int check_name(const char* name);
 
 // Resolves a host name or address to the numeric text of its first result (IPv6 in square brackets) in
 // `address`, which holds at least 48 bytes, and its family in `family`. Returns 0 or -1.
-int _resovle_net_address_to_ip(char* address, int* family, const char* host);
+[[nodiscard]] int _resovle_net_address_to_ip(char* address, int* family, const char* host);
 
 }  // namespace remvol
 

@@ -49,7 +49,7 @@ class RunLock {
 
   // Takes a lock again that was paused, or takes it for the first time: for one that is held many times.
   // Returns kTaken or kNone.
-  LockTry take_again(const char* name, LockMode mode);
+  [[nodiscard]] LockTry take_again(const char* name, LockMode mode);
 
   // Lets the lock go, and keeps its file open.
   void pause();
@@ -65,7 +65,7 @@ class RunLock {
   void release();
 
  private:
-  LockTry open_and_lock(const char* name, int open_flags, int operation);
+  [[nodiscard]] LockTry open_and_lock(const char* name, int open_flags, int operation);
 
   int fd_ = -1;
 };

@@ -79,7 +79,7 @@ template <size_t N>
 [[nodiscard]] int tree_write_once_to(const char* socket, const char* key, const char* value);
 
 // Logs what they do, for a value whose slot is gone. Returns -103.
-int tree_write_failed();
+[[nodiscard]] int tree_write_failed();
 
 inline constexpr int kWriteTries = 3;
 

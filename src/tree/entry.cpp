@@ -4,7 +4,6 @@
 #include <cstring>
 
 #include "frontend/log.h"
-#include "ktreec.h"
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
@@ -274,9 +273,8 @@ int ktree_get_lun_enable(int* enable, int dbidx, int lun_dbidx) {
   *enable = 0;
   const HeldSlot slot(dbidx, lun_dbidx);
   if (!slot) return kTreeFailed;
-  StateValue value = "";
-  const int length = ktreec_get_wb(kVolumesSocket, 0, KeyText(key::kLunEnable, slot.target(), slot.lun()),
-                                   value, sizeof value);
+  StateValue value;
+  const int length = tree_get(KeyText(key::kLunEnable, slot.target(), slot.lun()), value, sizeof value);
   if (length > 0 && value[0] != '\0') {
     *enable = atoi(value) != 0 ? 1 : 0;
     return kOk;

@@ -45,7 +45,7 @@ int set_value(const char* key, const char* value) {
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wformat-nonliteral"  // the formats are those of the table above
 void move_state(int n, const MovedState& state) {
-  char value[256];
+  TreeValue value;
   if (!tree_read(KeyText(state.from, n), value)) return;
   const KeyText key(state.to, n, kLunSlot);
   const NumberText number("%d", atoi(value));
@@ -56,7 +56,7 @@ void move_state(int n, const MovedState& state) {
 // The target's share becomes its LUN's. A share that is missing is logged as a failed write: that is how
 // those who read the log know it.
 int move_share(int n) {
-  char share[256];
+  TreeValue share;
   if (!tree_read(KeyText(key::kOldShare, n), share)) return set_failed();
   return set_value(KeyText(key::kLunShare, n, kLunSlot), share);
 }
@@ -90,7 +90,7 @@ int upgrade_target(int n) {
 }
 
 int upgrade_targets() {
-  char text[256];
+  TreeValue text;
   if (!tree_read(key::kTargetCount, text)) {
     LOG(1, "%s is NULL or disappear, exit func", key::kTargetCount);
     return kOk;

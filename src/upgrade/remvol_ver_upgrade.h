@@ -8,13 +8,13 @@ namespace remvol {
 constexpr int kSettingsVersion = 1;  // the layout that this tool reads and writes
 
 // Reads the stored version, 0 when missing. Returns 0, or -1 for a null `version`.
-int get_remvol_ver_from_db(int* version);
+[[nodiscard]] int get_remvol_ver_from_db(int* version);
 
 // Gives the stored and the current version. Returns their absolute difference, or -1.
-int compare_remvol_ver(int* stored, int* current);
+[[nodiscard]] int compare_remvol_ver(int* stored, int* current);
 
 // Returns 1 when the stored version differs from the current one, else 0.
-int is_remvol_ver_changed();
+[[nodiscard]] int is_remvol_ver_changed();
 
 // Stores `version`. Returns 0 or -1.
 int set_remvol_ver_to_db(int version);
