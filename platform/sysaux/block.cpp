@@ -16,9 +16,11 @@
 
 namespace sysaux {
 
+namespace {
+
 // The sysfs path of the device that a node missing in /dev would be: /dev may be static, and the node be made
 // once the disk is known. sysfs has an exclamation mark for a slash.
-static bool named_block_dir_path(const char* node, char* path, size_t size) {
+bool named_block_dir_path(const char* node, char* path, size_t size) {
   constexpr char kDev[] = "/dev/";
   constexpr char kClass[] = "/sys/class/block/";
   if (strncmp(node, kDev, strlen(kDev)) != 0 || node[strlen(kDev)] == '.') return false;
@@ -29,7 +31,7 @@ static bool named_block_dir_path(const char* node, char* path, size_t size) {
 }
 
 // The sysfs path of the block device `node`; a link to the device's directory.
-static bool block_dir_path(const char* node, char* path, size_t size) {
+bool block_dir_path(const char* node, char* path, size_t size) {
   struct stat info;
   if (node == nullptr) return false;
   if (stat(node, &info) != 0) return errno == ENOENT && named_block_dir_path(node, path, size);
@@ -37,6 +39,8 @@ static bool block_dir_path(const char* node, char* path, size_t size) {
   snprintf(path, size, "/sys/dev/block/%u:%u", major(info.st_rdev), minor(info.st_rdev));
   return true;
 }
+
+}  // namespace
 
 int open_block_dir(const char* node) {
   char path[64];

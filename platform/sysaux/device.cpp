@@ -12,13 +12,15 @@
 #include "sysaux.h"
 #include "sysaux/block.h"
 
-using platform::Fd;
+namespace {
 
-static long long size_of(int block_dir) {
+long long size_of(int block_dir) {
   long long sectors = 0;
   if (block_dir < 0 || !sysaux::read_number_at(block_dir, "size", &sectors)) return -1;
   return sectors * sysaux::kSectorBytes;
 }
+
+}  // namespace
 
 extern "C" {
 

@@ -17,7 +17,9 @@
 
 namespace sysaux {
 
-static bool read_partition(int block_dir, const char* name, Partition* partition) {
+namespace {
+
+bool read_partition(int block_dir, const char* name, Partition* partition) {
   long long number = 0;
   Extent& extent = partition->extent;
   if (strlen(name) >= sizeof partition->name) return false;
@@ -32,10 +34,47 @@ static bool read_partition(int block_dir, const char* name, Partition* partition
   return true;
 }
 
-static int by_number(const void* left, const void* right) {
+int by_number(const void* left, const void* right) {
   return static_cast<const Partition*>(left)->extent.number -
          static_cast<const Partition*>(right)->extent.number;
 }
+
+const Partition* find_partition(const DiskPartitions& list, int number) {
+  for (int i = 0; i < list.count; i++) {
+    if (list.at[i].extent.number == number) return &list.at[i];
+  }
+  return nullptr;
+}
+
+void tell_kernel(int disk, int operation, const Extent& extent) {
+  blkpg_partition partition{};
+  partition.pno = extent.number;
+  partition.start = extent.start * kSectorBytes;
+  partition.length = extent.size * kSectorBytes;
+  blkpg_ioctl_arg argument{};
+  argument.op = operation;
+  argument.datalen = sizeof partition;
+  argument.data = &partition;
+  ioctl(disk, BLKPG, &argument);  // the answer is what sysfs shows then
+}
+
+bool same(const Extent& left, const Extent& right) {
+  return left.number == right.number && left.start == right.start && left.size == right.size;
+}
+
+// The node /dev/NAME and the device whose number stands in the sysfs file `dev_file` are the same.
+bool node_is_there(int block_dir, const char* dev_file, const char* name) {
+  char number[32];
+  char node[64];
+  unsigned numbers[2];
+  struct stat info;
+  if (!read_line_at(block_dir, dev_file, number, sizeof number)) return false;
+  if (sscanf(number, "%u:%u", &numbers[0], &numbers[1]) != 2) return false;
+  snprintf(node, sizeof node, "/dev/%s", name);
+  return stat(node, &info) == 0 && S_ISBLK(info.st_mode) && info.st_rdev == makedev(numbers[0], numbers[1]);
+}
+
+}  // namespace
 
 bool read_partitions(int block_dir, DiskPartitions* list) {
   list->count = 0;
@@ -53,29 +92,6 @@ bool read_partitions(int block_dir, DiskPartitions* list) {
   return true;
 }
 
-static const Partition* find_partition(const DiskPartitions& list, int number) {
-  for (int i = 0; i < list.count; i++) {
-    if (list.at[i].extent.number == number) return &list.at[i];
-  }
-  return nullptr;
-}
-
-static void tell_kernel(int disk, int operation, const Extent& extent) {
-  blkpg_partition partition{};
-  partition.pno = extent.number;
-  partition.start = extent.start * kSectorBytes;
-  partition.length = extent.size * kSectorBytes;
-  blkpg_ioctl_arg argument{};
-  argument.op = operation;
-  argument.datalen = sizeof partition;
-  argument.data = &partition;
-  ioctl(disk, BLKPG, &argument);  // the answer is what sysfs shows then
-}
-
-static bool same(const Extent& left, const Extent& right) {
-  return left.number == right.number && left.start == right.start && left.size == right.size;
-}
-
 bool announce_partition(int disk, int block_dir, const Extent& extent, Partition* shown) {
   DiskPartitions list;
   if (!read_partitions(block_dir, &list)) return false;
@@ -90,18 +106,6 @@ bool announce_partition(int disk, int block_dir, const Extent& extent, Partition
   if (known == nullptr || !same(known->extent, extent)) return false;
   *shown = *known;
   return true;
-}
-
-// The node /dev/NAME and the device whose number stands in the sysfs file `dev_file` are the same.
-static bool node_is_there(int block_dir, const char* dev_file, const char* name) {
-  char number[32];
-  char node[64];
-  unsigned numbers[2];
-  struct stat info;
-  if (!read_line_at(block_dir, dev_file, number, sizeof number)) return false;
-  if (sscanf(number, "%u:%u", &numbers[0], &numbers[1]) != 2) return false;
-  snprintf(node, sizeof node, "/dev/%s", name);
-  return stat(node, &info) == 0 && S_ISBLK(info.st_mode) && info.st_rdev == makedev(numbers[0], numbers[1]);
 }
 
 bool wait_for_node(int block_dir, const char* disk, const char* partition) {
