@@ -246,7 +246,7 @@ void Server::answer(Connection& connection, std::string_view bytes) {
     drop(connection);
     return;
   }
-  // A receive stops at a passed descriptor and where its buffer is full. What came behind the request by then
+  // A receive stops at a passed descriptor and where its buffer is full. What came after the request by then
   // is not told of again.
   const bool stopped =
       connection.document >= 0 || connection.bytes != nullptr || bytes.size() == request_.size();

@@ -174,12 +174,12 @@ bool fits(const Options& options, unsigned given, std::string& why) {
 // What getopt_long(3) has found wrong with the word before the next one: `letter` is its answer.
 std::string why_not(int letter, std::string_view word) {
   const std::string_view name = word.substr(0, word.find('='));
-  if (letter == ':') return with_quoted("an argument is missing behind the option", name);
+  if (letter == ':') return with_quoted("an argument is missing after the option", name);
   if (optopt >= kPortalOption) return with_quoted("no value belongs to the option", name);
   return with_quoted("unrecognized option", name);
 }
 
-// The words behind the command.
+// The words after the command.
 int read_words(int argc, char** argv, Options& options, std::string& why) {
   const std::vector<option> known = long_options();
   unsigned given = 0;

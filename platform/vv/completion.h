@@ -1,4 +1,4 @@
-// What a shell offers behind the words that were typed: only what exists.
+// What a shell offers after the words that were typed: only what exists.
 #ifndef PLATFORM_VV_COMPLETION_H
 #define PLATFORM_VV_COMPLETION_H
 

@@ -22,7 +22,7 @@ struct Options {
   bool yes = false;
   bool destroy_data = false;
   bool json = false;
-  char** rest = nullptr;  // the words behind a command whose words are another program's, ended by a null
+  char** rest = nullptr;  // the words after a command whose words are another program's, ended by a null
 };
 
 // Options that a command takes, as bits.

@@ -61,7 +61,7 @@ struct SeenWhen {
 
 SeenWhen seen_when;
 
-// What a slot holds is looked at behind a command to see what has become of it meanwhile, by whomever.
+// What a slot holds is looked at after a command to see what has become of it meanwhile, by whomever.
 int commands_noticed = 0;
 
 void notice_commands() {

@@ -128,7 +128,7 @@ def test_version(box):
     (["connect", ""], "connect takes one"), (["connect", "a", "b"], "connect takes one"),
     (["connect", "a", "--lun", "1"], "connect takes no --lun"), (["connect", "a", "--yes"], "connect takes no --yes"),
     (["add", "a", "--portal", "10.9.0.2"], "add needs --lun"), (["add", "a", "--bad"], 'unrecognized option "--bad"'),
-    (["add", "a", "--lun"], 'an argument is missing behind the option "--lun"'),
+    (["add", "a", "--lun"], 'an argument is missing after the option "--lun"'),
     (["add", "a", "--lun", "1x"], 'no number of a LUN: "1x"'),
     (["add", "a", "--lun", "-1"], "no number of a LUN"), (["add", "a", "--lun", "99999"], "no number of a LUN"),
     (["add", "a", "--lun", ""], "no number of a LUN"), (["luns", "a", "--portal", ""], "the value of an option is empty"),
