@@ -23,7 +23,7 @@ CLEAN = {
 
 
 def checked(folder, files):
-    """What the check says of the clean sources with these files in place of some, a line each."""
+    """What the check says of the clean sources with these files in place of some, line by line."""
     for name, text in {**CLEAN, **files}.items():
         path = folder / name
         path.parent.mkdir(parents=True, exist_ok=True)
@@ -72,6 +72,10 @@ def test_a_circle(tmp_path, files):
 def test_an_include_that_is_not_from_below(tmp_path, path, name, complaint):
     there = {"src/support/net.h": "", "src/tasks/add.h": "", "src/frontend/options.h": "", "src/tree/state.h": "", "platform/tool/tool.h": ""}
     assert checked(tmp_path, {**there, path: f'#include "{name}"'}) == [complaint]
+
+
+def test_an_include_of_ours_between_angles(tmp_path):
+    assert checked(tmp_path, {"src/tree/state.cpp": "#include <tree/keys.h>"}) == ["src/tree/state.cpp: tree/keys.h is ours and belongs between quotes"]
 
 
 @pytest.mark.parametrize("lines, too_long", [(80, False), (81, True)])
