@@ -20,9 +20,10 @@ from figures import Figure, Growth, Table, number  # noqa: E402
 
 def measurements():
     import runs
+    import scale
     import tree
     return [tree.round_trips, tree.many_clients, tree.nodes, tree.settings, tree.values, runs.share_name, runs.volumes,
-            runs.status, runs.size, runs.instructions, runs.idle]
+            runs.status, runs.size, runs.instructions, runs.idle, scale.scale]
 
 
 def show(found):
@@ -56,6 +57,9 @@ def measure_inside(options):
 
 
 def measure(options):
+    if not options.short and options.only in "scale":
+        import scale
+        scale.build()
     with tempfile.NamedTemporaryFile(dir=os.environ["REMVOL_BUILD"], suffix=".json") as results:
         words = ["--inside", results.name, "--only", options.only] + ["--short"] * options.short
         # Before all other processes of the machine.

@@ -6,13 +6,20 @@ LUN_KEYS = {"enable": "1", "vol_access_right": "1", "format_state": "0", "format
             "status": "Running", "size": "1000000/100000000", "fs_type": "ext4"}
 
 
+MOST_LUNS = 16  # of a target; what the disks are numbered by
+
+
 def name_of(target):
     return f"iqn.2026-01.org.example:storage.disk{target}"
 
 
 def disk_of(target, lun):
-    number = (target - 1) * 8 + lun - 1
-    return "sd" + (chr(ord("a") + number // 26 - 1) if number >= 26 else "") + chr(ord("a") + number % 26)
+    """The kernel's name of a disk: sda to sdz, sdaa to sdzz, sdaaa ..."""
+    number, letters = (target - 1) * MOST_LUNS + lun, ""
+    while number > 0:
+        number, letter = divmod(number - 1, 26)
+        letters = chr(ord("a") + letter) + letters
+    return "sd" + letters
 
 
 def elements(values):
@@ -38,14 +45,24 @@ def sessions(targets):
     return "".join(f"tcp: [{n}] 10.9.0.2:3260,1 {name_of(n)} (non-flash)\n" for n in range(1, targets + 1))
 
 
+def session_in_detail(number, name, disks):
+    """What is listed of one session, with a LUN for each of the disks."""
+    return (f"Target: {name} (non-flash)\n\tCurrent Portal: 10.9.0.2:3260,1\n"
+            f"\t\tiSCSI Session State: LOGGED_IN\n\t\tHost Number: {number}\tState: running\n" +
+            "".join(f"\t\tscsi{number} Channel 00 Id 0 Lun: {m}\n\t\t\tAttached scsi disk {disk}\t\tState: running\n"
+                    for m, disk in enumerate(disks, 1)))
+
+
 def sessions_in_detail(targets, luns):
+    return "".join(session_in_detail(n, name_of(n), [disk_of(n, m) for m in range(1, luns + 1)]) for n in range(1, targets + 1))
+
+
+def sessions_among_others(targets, luns, others):
+    """The same, with the sessions of so many further targets of MOST_LUNS in front of each."""
     text = ""
     for n in range(1, targets + 1):
-        text += (f"Target: {name_of(n)} (non-flash)\n\tCurrent Portal: 10.9.0.2:3260,1\n"
-                 f"\t\tiSCSI Session State: LOGGED_IN\n\t\tHost Number: {n}\tState: running\n")
-        for m in range(1, luns + 1):
-            text += (f"\t\tscsi{n} Channel 00 Id 0 Lun: {m}\n"
-                     f"\t\t\tAttached scsi disk {disk_of(n, m)}\t\tState: running\n")
+        text += "".join(session_in_detail(n, f"{name_of(n)}.other{k}", ["sdzzz"] * MOST_LUNS) for k in range(others))
+        text += session_in_detail(n, name_of(n), [disk_of(n, m) for m in range(1, luns + 1)])
     return text
 
 

@@ -32,10 +32,10 @@ def volumes(short):
     yield ratio("Whole runs", "vvstat of 64 volumes / lsblk", ours, lsblk, 1)
 
 
-def fake_iscsiadm(targets, luns):
+def fake_iscsiadm(targets, luns, details=None):
     fakes = pathlib.Path("/mnt/fakes")
     (fakes / "sessions").write_text(sessions(targets))
-    (fakes / "details").write_text(sessions_in_detail(targets, luns))
+    (fakes / "details").write_text(details or sessions_in_detail(targets, luns))
     iscsiadm = fakes / "iscsiadm"
     iscsiadm.write_text("#!/bin/sh\ncase $* in\n*-P*3) cat /mnt/fakes/details ;;\n*) cat /mnt/fakes/sessions ;;\nesac\n")
     iscsiadm.chmod(0o755)
@@ -49,6 +49,16 @@ def write_commands(trace):
     return len(lines)
 
 
+def traced(command):
+    """Runs the command. Returns how many shell commands it took, which are written down, and requests to the tree."""
+    ended = subprocess.run(["strace", "-f", "-qq", "-s", "4096", "-e", "trace=execve,sendmsg", "-o", TRACE, *command],
+                           stdout=subprocess.DEVNULL).returncode
+    if ended not in (0, 1):  # vvstat says with 1 that not all is well
+        raise RuntimeError(f"{command} ended with {ended}")
+    text = pathlib.Path(TRACE).read_text()
+    return write_commands(text), text.count("sendmsg(")
+
+
 def status_beside_commands(targets, luns, rounds):
     """The tool beside its shell commands alone, run by the same system calls. Returns the times of both, the most memory
     of the run, and how many commands and requests it took."""
@@ -57,11 +67,7 @@ def status_beside_commands(targets, luns, rounds):
     with one_processor(), ktree():
         load(document(targets, luns))
         output(*tool)
-        subprocess.run(["strace", "-f", "-qq", "-s", "4096", "-e", "trace=execve,sendmsg", "-o", TRACE, *tool], check=True,
-                       stdout=subprocess.DEVNULL)
-        text = pathlib.Path(TRACE).read_text()
-        commands = write_commands(text)
-        requests = text.count("sendmsg(")
+        commands, requests = traced(tool)
         (ours, alone), (peak, _) = in_turn(rounds, tool, [program("bench_system"), COMMANDS])
     return ours, alone, peak, commands, requests
 

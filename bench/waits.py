@@ -99,8 +99,9 @@ def time_table(runs):
         "Where a person's time goes", ["command", "seconds", "waits", "programs", "tree", "disks", "kernel", "start", "ours", "share of ours"],
         rows, f"""Of each command the run whose time is the median, in the virtual appliance (QEMU's software emulation, one processor). *Waits* are
 those that the tool asks for, *programs* those that it runs, by a shell; *tree* is the time in the tree's library and its daemon, *disks*
-that in `libsysaux`, *kernel* the calls of the kernel that the tool makes itself (files, locks) and the time that the kernel lets it stand, *start* what the kernel and the loader need before
-the tool's first instruction and behind its last. *Ours* is all that is left of the processor's time: at most {MOST} % of the command.""")
+that in `libsysaux`, *kernel* the calls of the kernel that the tool makes itself (files, locks) and the time that the kernel lets it
+stand, *start* what the kernel and the loader need before the tool's first instruction and behind its last. *Ours* is all that is left
+of the processor's time: at most {MOST} % of the command.""")
 
 
 def wait_table(runs):
@@ -111,8 +112,7 @@ def wait_table(runs):
     rows = [[wait.name, ", ".join(f"`{file}`" for file in wait.files), wait.length, wait.why, wait.instead, seen(wait)] for wait in SETTLED]
     return Table(
         "Settled waits", ["what for", "where", "how long", "why it stood", "the look that would do", "in the runs above"], rows,
-        """They are seen from outside and stay as they are. Each is longer than what a disk of today needs; what would be asked in its place
-stands beside it.""")
+        """They are seen from outside and stay as they are; beside each stands what could be asked in its place.""")
 
 
 def waits():

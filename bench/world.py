@@ -44,13 +44,16 @@ def install():
     """As the package does: where the loader looks by itself, and without search paths of the programs' own."""
     subprocess.run(["cmake", "--install", BUILD, "--prefix", PRODUCT], check=True, stdout=subprocess.DEVNULL,
                    env={**os.environ, "DESTDIR": ""})
-    script = pathlib.Path("/mnt/no_search_path.cmake")
     manifest = map(pathlib.Path, (BUILD / "install_manifest.txt").read_text().split())
-    installed = [path for path in manifest if path.parent.name in ("bin", "sbin")]
-    script.write_text("".join(f'file(RPATH_REMOVE FILE "{path}")\n' for path in installed))
-    output("cmake", "-P", script, stderr=subprocess.DEVNULL)
+    drop_search_paths(path for path in manifest if path.parent.name in ("bin", "sbin"))
     subprocess.run(["cp", *BUILD.glob("bin/bench_*"), PRODUCT / "bin"], check=True)
     subprocess.run(["ldconfig"], check=True)
+
+
+def drop_search_paths(programs):
+    script = pathlib.Path("/mnt/no_search_path.cmake")
+    script.write_text("".join(f'file(RPATH_REMOVE FILE "{path}")\n' for path in programs))
+    output("cmake", "-P", script, stderr=subprocess.DEVNULL)
 
 
 def mount(kind, path):

@@ -3,6 +3,7 @@
 option(REMVOL_TESTS "Build the tests and the benchmarks" OFF)
 option(REMVOL_SHARED_RUNTIME "Have every program load the system's C++ runtime, with its updates" OFF)
 set(REMVOL_SANITIZE "" CACHE STRING "Sanitizers to build with, such as address,undefined")
+set(REMVOL_LIMITS "" CACHE STRING "Most targets, and LUNs of each, other than include/tree_layout.h has, to see what they cost: 64;16")
 
 if(NOT CMAKE_BUILD_TYPE)
   set(CMAKE_BUILD_TYPE Release)
@@ -36,6 +37,12 @@ function(with_own_runtime target)
 endfunction()
 
 add_compile_definitions(_GNU_SOURCE)
+if(REMVOL_LIMITS)
+  list(GET REMVOL_LIMITS 0 targets)
+  list(GET REMVOL_LIMITS 1 luns)
+  math(EXPR all_luns "${targets} * ${luns}")
+  add_compile_definitions(REMVOL_MAX_TARGETS=${targets} REMVOL_MAX_LUNS_PER_TARGET=${luns} REMVOL_MAX_LUNS=${all_luns})
+endif()
 # Sizes of files and times have 64 bits on 32-bit processors too.
 if(CMAKE_SIZEOF_VOID_P EQUAL 4)
   add_compile_definitions(_FILE_OFFSET_BITS=64 _TIME_BITS=64)

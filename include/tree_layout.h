@@ -16,10 +16,16 @@ inline constexpr char kSettingsFile[] = "/etc/NAS_CFG/vv.xml";
 // Where volumes are mounted, each on a folder of its share's name.
 inline constexpr char kMountRoot[] = "/mnt/VV/";
 
-constexpr int kMaxTargets = 8;         // target slots, dbidx 1 to 8
-constexpr int kMaxLunsPerTarget = 8;   // LUN slots of a target, dbidx 1 to 8
-constexpr int kMaxLuns = 8;            // LUNs in the whole system
-constexpr int kMaxRecoverQueue = 100;  // names in the recover queue
+// How much there may be. A build may be told other numbers, to see what they would cost: cmake/options.cmake.
+#ifndef REMVOL_MAX_TARGETS
+#define REMVOL_MAX_TARGETS 8
+#define REMVOL_MAX_LUNS_PER_TARGET 8
+#define REMVOL_MAX_LUNS 8
+#endif
+constexpr int kMaxTargets = REMVOL_MAX_TARGETS;                // target slots, dbidx 1 to 8
+constexpr int kMaxLunsPerTarget = REMVOL_MAX_LUNS_PER_TARGET;  // LUN slots of a target, dbidx 1 to 8
+constexpr int kMaxLuns = REMVOL_MAX_LUNS;                      // LUNs in the whole system
+constexpr int kMaxRecoverQueue = 100;                          // names in the recover queue
 
 enum ConnectState : int {
   kDisconnected = 0,

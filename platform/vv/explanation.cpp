@@ -12,7 +12,8 @@ using vvstat::Row;
 
 constexpr size_t kMostLines = 4;
 
-static_assert(remvol::kMaxLuns == 8, "a reason below names the number");
+#define TEXT_OF(words) #words
+#define NUMBER_TEXT(macro) TEXT_OF(macro)
 
 // What is heard of a failure, and what it means. The first that is found counts.
 constexpr struct {
@@ -47,7 +48,8 @@ constexpr struct {
     {"Create Format FAILED", "no file system could be made on it",
      "look at the storage server and at the kernel's log: dmesg", kFormatStep},
     {"has benn used", "another volume has that share name", "choose another name"},
-    {"can not add target", "at most 8 volumes can be configured", "delete one that is not needed"},
+    {"can not add target", "at most " NUMBER_TEXT(REMVOL_MAX_LUNS) " volumes can be configured",
+     "delete one that is not needed"},
     {"disconnect it before modifying its address", "the target is connected", "disconnect it first"},
     {" at IP: ", "the target is not offered there", "see what is: vv discover PORTAL"},
     {"the configuration tree was started anew", "the configuration tree was started anew meanwhile",
