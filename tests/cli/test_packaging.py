@@ -19,6 +19,16 @@ BLOCK = """
 """
 
 
+def test_the_documents_that_the_manual_pages_name_are_in_the_package():
+    folder = PACKAGING.parent
+    shipped = {pathlib.Path(line).name for line in (folder / "debian/remvol.docs").read_text().splitlines()}
+    named = {name for page in (folder / "docs/man").iterdir()
+             for name in re.findall(r"/usr/share/doc/remvol/([\w.-]+\w)", page.read_text())}
+    first = (folder / "README.md").read_text().split("\n## ")[0]
+    named |= {name.split("/")[-1] for name in re.findall(r"`((?:docs/)?[\w-]+\.md)`", first)}
+    assert {"vv.schema.json", "SECURITY.md"} <= named and named <= shipped
+
+
 def helper(box, name, *args):
     return box.run([PACKAGING / "helpers" / name, *args], env={"LD_PRELOAD": None})
 
