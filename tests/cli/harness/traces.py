@@ -43,7 +43,7 @@ CHANGING = [(re.compile(pattern), text) for pattern, text in (
 FLEETING = re.compile("|".join((
     r"^    (?:! )?(resize2fs[ :]|The filesystem is already|Filesystem at .* is mounted on|old_desc_blocks|/dev/\S+: *$)",  # in the background
     r"^  set \S+/format_progress ",  # what a format has got to when somebody looks
-    r"^    (?:! )?(?:(logging in|logged in) to |\S.*: (looking at its disk|mounted)$)",  # steps that are shown when they are seen
+    r"^    (?:! )?(?:(logging in|logged in) to |\S.*: (looking at its disk|its disk is ready|mounted)$)",  # steps that are shown when they are seen
     r"^  run remvol-notify ",  # started beside the listener
     r"^ *!? *$",
 )))
