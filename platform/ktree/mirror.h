@@ -10,6 +10,7 @@
 //   0        the version
 //   1, 2     the place of the heads, and how many there are
 //   3        how many words have memory; it never gets less
+//   4        the number of this layout: a library may meet the daemon of another version
 //   a head   by the hash of a path: the place of the first entry, 0 for none
 //   an entry the place of the next entry of the same head; the sizes: bytes of the path, bytes of the value
 //            << 8, room for the value in words << 16; the path and then the value, each filled up with zeros
@@ -42,8 +43,12 @@ constexpr size_t kVersion = 0;
 constexpr size_t kHeadsPlace = 1;
 constexpr size_t kHeadsCount = 2;
 constexpr size_t kEnd = 3;
-constexpr size_t kFirstPlace = 4;
+constexpr size_t kLayout = 4;
+constexpr size_t kFirstPlace = 5;
 constexpr size_t kEntryHeader = 2;
+
+// To be counted up with every change of the words, of make_key() or of kBytes.
+constexpr Word kThisLayout = 1;
 
 [[nodiscard]] inline Word load(const Word& word) {
   return __atomic_load_n(&word, __ATOMIC_RELAXED);

@@ -240,6 +240,7 @@ void MirrorWriter::fill() {
   const Change change(words_);
   size_t heads = std::max(kFewestHeads, std::bit_ceil(tree_.node_count() / 2));
   while (heads > kFewestHeads && !reserve(mirror::kFirstPlace + heads)) heads /= 2;
+  store(mirror::kLayout, mirror::kThisLayout);
   store(mirror::kHeadsPlace, mirror::kFirstPlace);
   store(mirror::kHeadsCount, static_cast<Word>(heads));
   for (size_t i = 0; i < heads; i++) store(mirror::kFirstPlace + i, 0);

@@ -337,6 +337,20 @@ def test_a_daemon_that_may_write_no_large_file_has_no_mirror():
     daemon.close()
 
 
+def test_the_next_daemon_is_asked_for_its_mirror_again():
+    daemon = Daemon(prefix=["prlimit", "--fsize=1000000"])
+    caller = Caller(daemon.socket)
+    read_often(caller)
+    daemon.stop()
+    daemon.start()
+    caller("set /warm y")
+    for mapped in ("0", "1"):  # from its second read on
+        assert caller("get /warm 10") == "1 y"
+        assert caller("sh grep -c ktree-mirror /proc/$PPID/maps").strip() == mapped
+    caller.close()
+    daemon.close()
+
+
 def answers_gets(with_mirror):
     """Serves a daemon whose every value is "value"; with_mirror(connection) answers the request for the mirror."""
     requests = []

@@ -307,6 +307,20 @@ TEST(MirrorMap, TakesNothingElse) {
   close(unsealed);
 }
 
+// A library and a daemon of different versions meet whenever one of them was updated and the other still runs.
+TEST(MirrorMap, TakesNoOtherLayout) {
+  const int fd = memfd_create("test", MFD_CLOEXEC | MFD_ALLOW_SEALING);
+  ASSERT_EQ(ftruncate(fd, mirror::kBytes), 0);
+  ASSERT_EQ(fcntl(fd, F_ADD_SEALS, F_SEAL_SHRINK), 0);
+  for (const mirror::Word layout : {mirror::kThisLayout, mirror::kThisLayout + 1, mirror::Word{0}}) {
+    ASSERT_EQ(pwrite(fd, &layout, sizeof layout, mirror::kLayout * sizeof layout), 4);
+    const mirror::Word* words = client::map_mirror(fd);
+    EXPECT_EQ(words != nullptr, layout == mirror::kThisLayout) << layout;
+    client::unmap_mirror(words);
+  }
+  close(fd);
+}
+
 // Random changes: whatever the mirror answers is what the tree holds.
 TEST_F(MirrorTest, AgreesWithTheTree) {
   open();

@@ -30,8 +30,8 @@ struct Channel {
   int fd;                      // -1: not connected
   pid_t owner;                 // the process that connected
   const mirror::Word* mirror;  // of the daemon at the other end, or null
-  bool has_read;               // on this connection
-  bool without_mirror;         // none was to be had: none is asked for again
+  bool has_read;               // both of this connection
+  bool without_mirror;         // nor is there one to be had
   sockaddr_un address;
 };
 
@@ -67,7 +67,7 @@ enum class TryOutcome {
 void disconnect(Channel& channel) {
   if (channel.fd >= 0) close(std::exchange(channel.fd, -1));
   unmap_mirror(std::exchange(channel.mirror, nullptr));
-  channel.has_read = false;
+  channel.has_read = channel.without_mirror = false;
 }
 
 // In a forked child: it must not speak on its parent's connections, and a lock that a thread of the parent

@@ -22,7 +22,10 @@ const mirror::Word* map_mirror(int fd) {
   void* words = mmap(nullptr, mirror::kBytes, PROT_READ, MAP_SHARED, fd, 0);
   if (words == MAP_FAILED) return nullptr;
   madvise(words, mirror::kBytes, MADV_DONTDUMP);  // it holds secrets
-  return static_cast<const mirror::Word*>(words);
+  const auto* mirror = static_cast<const mirror::Word*>(words);
+  if (mirror::load(mirror[mirror::kLayout]) == mirror::kThisLayout) return mirror;
+  unmap_mirror(mirror);
+  return nullptr;
 }
 
 void unmap_mirror(const mirror::Word* words) {

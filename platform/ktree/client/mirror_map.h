@@ -6,8 +6,8 @@
 
 namespace ktree::client {
 
-// Maps the memory file `fd`, which may be closed afterwards. Returns null when it is no mirror, or memory is
-// short.
+// Maps the memory file `fd`, which may be closed afterwards. Returns null when it is no mirror, one of
+// another layout, or memory is short.
 [[nodiscard]] const mirror::Word* map_mirror(int fd);
 
 // `words` may be null.
