@@ -97,7 +97,8 @@ TEST_F(MirrorTest, IsOneForAll) {
 
 TEST_F(MirrorTest, FollowsEverySet) {
   open();
-  for (const std::string value : {"x", "", "longer", std::string(255, 'y').c_str(), "short"}) {
+  const std::string longest(255, 'y');
+  for (const std::string& value : {std::string("x"), std::string(), longest, std::string("short")}) {
     set("/a", value);
     EXPECT_EQ(read("/a"), value);
   }
@@ -307,7 +308,8 @@ TEST(MirrorMap, TakesNothingElse) {
   close(unsealed);
 }
 
-// A library and a daemon of different versions meet whenever one of them was updated and the other still runs.
+// A library and a daemon of different versions meet whenever one of them was updated and the other still
+// runs.
 TEST(MirrorMap, TakesNoOtherLayout) {
   const int fd = memfd_create("test", MFD_CLOEXEC | MFD_ALLOW_SEALING);
   ASSERT_EQ(ftruncate(fd, mirror::kBytes), 0);
