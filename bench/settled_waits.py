@@ -8,11 +8,11 @@ from figures import number
 
 @dataclasses.dataclass
 class Wait:
-    """One kind of wait. `behind` is what the last command before it looks like, by which a measured wait is known."""
+    """One kind of wait. `after` is what the last command before it looks like, by which a measured wait is known."""
     files: tuple
     call: str  # as the sources have it
     name: str = ""
-    behind: str = ""
+    after: str = ""
     seconds: float = 0
     each: str = ""  # for what it is so long, and how often
     why: str = ""
@@ -23,7 +23,7 @@ class Wait:
         return f"{number(self.seconds)} s {self.each}".rstrip()
 
     def is_it(self, call, command):
-        return self.call.startswith(call + "(") and re.search(self.behind, command) is not None
+        return self.call.startswith(call + "(") and re.search(self.after, command) is not None
 
 
 # Settled: seen from outside, so they stay as they are.
@@ -41,7 +41,7 @@ SETTLED = [
     Wait(("src/iscsi/session.cpp",), "usleep(kPollInterval)", "LUNs show", r"^iscsiadm -m (session|node .*--login)",
          0.1, "a look, at most 30", "it waits in front of the first look too", "the look first"),
     Wait(("src/volume/format.cpp",), "sleep(1)", "the beginning was wiped", r"^dd if=/dev/zero", 1, "a format",
-         "a slow disk takes what dd wrote; mke2fs, behind it, uses the same cache", "none: dd has ended"),
+         "a slow disk takes what dd wrote; mke2fs, which follows, uses the same cache", "none: dd has ended"),
     Wait(("src/volume/mount_command.cpp",), "usleep(kMountRetryWait)", "a mount failed", r"^mount (?!-o remount)",
          0.5, "a try, at most 3", "a disk that is not ready yet", "mount's exit status, which tells a busy disk from a wrong one"),
     Wait(("src/support/command.cpp",), "usleep(static_cast<useconds_t>(wait))", "users are ended again", r"^fuser -mk",
@@ -50,7 +50,7 @@ SETTLED = [
     Wait(("src/volume/unmount.cpp",), "sleep(1)", "users of a volume end", r"^fuser -mk", 1, "a volume",
          "processes that were killed have to write and to end", "whether umount succeeds, tried at once"),
     Wait(("src/volume/remount.cpp",), "sleep(static_cast<unsigned>(wait_seconds))", "a remount shows", r"^mount -o remount",
-         5, "a volume", "a file system on a slow disk turns read-only late", "the mount table behind the remount, or one write"),
+         5, "a volume", "a file system on a slow disk turns read-only late", "the mount table after the remount, or one write"),
     Wait(("src/tasks/recover.cpp",), "sleep(1)", "a format or a resize shows", r"^ps ", 1, "a volume, 2 where one was formatted",
          "between two of its programs the list of processes has neither", "whether the format's lock is held"),
     Wait(("src/tasks/recover.cpp",), "sleep(static_cast<unsigned>(wait_seconds))", "a recovery was put off", r"^$",

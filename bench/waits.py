@@ -25,7 +25,7 @@ class Run:
     """One run of a command. Times are in seconds; together they are the total."""
     name: str
     total: float
-    start: float  # until the libraries were loaded, and behind the end of main
+    start: float  # until the libraries were loaded, and after the end of main
     waits: float
     programs: float
     tree: float
@@ -100,7 +100,7 @@ def time_table(runs):
         rows, f"""Of each command the run whose time is the median, in the virtual appliance (QEMU's software emulation, one processor). *Waits* are
 those that the tool asks for, *programs* those that it runs, by a shell; *tree* is the time in the tree's library and its daemon, *disks*
 that in `libsysaux`, *kernel* the calls of the kernel that the tool makes itself (files, locks) and the time that the kernel lets it
-stand, *start* what the kernel and the loader need before the tool's first instruction and behind its last. *Ours* is all that is left
+stand, *start* what the kernel and the loader need before the tool's first instruction and after its last. *Ours* is all that is left
 of the processor's time: at most {MOST} % of the command.""")
 
 

@@ -1,7 +1,7 @@
 // Runs a command and appends to a file where its time goes: bench_meter FILE NAME COMMAND [ARGUMENT...]. In
 // front of what meter.cpp (bench_meter.so, beside this program) writes of the command is a line
 //   run NAME
-// and behind it, what the clock said in nanoseconds before the start and behind the end:
+// and after it, what the clock said in nanoseconds before the start and after the end:
 //   around BEGIN END STATUS
 // Exit status: the command's.
 #include <spawn.h>

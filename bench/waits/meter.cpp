@@ -6,7 +6,7 @@
 //   program COMMAND               a shell command or a child was started
 //   wait CALL TIME                the tool waited, and how long
 //   spent ACCOUNT TIME PROCESSOR  by the clock, and of the processor, in the whole run
-//   alive BEGIN END               what the clock said behind the loading of the libraries, and at the end
+//   alive BEGIN END               what the clock said after the loading of the libraries, and at the end
 // Programs that the run starts are not measured.
 #include <dlfcn.h>
 #include <fcntl.h>
@@ -53,7 +53,7 @@ Moment now() {
 
 const char* report_path;
 Moment began, last;
-Account current = kMeter;  // before the begin and behind the end
+Account current = kMeter;  // before the begin and after the end
 Moment spent[kAccounts];
 long long bookings[kAccounts];
 Moment inside, outside;  // what a booking adds to its own account, and to the one around it

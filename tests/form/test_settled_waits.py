@@ -26,7 +26,7 @@ def test_every_wait_is_named():
 
 def test_each_settled_wait_says_why_it_stood_and_what_would_do():
     for wait in settled_waits.SETTLED:
-        assert wait.name and wait.behind and wait.seconds and wait.why and wait.instead, wait.files
+        assert wait.name and wait.after and wait.seconds and wait.why and wait.instead, wait.files
 
 
 def test_a_measured_wait_is_known_by_the_command_before_it():
