@@ -101,7 +101,7 @@ def time_table(runs):
 those that the tool asks for, *programs* those that it runs, by a shell; *tree* is the time in the tree's library and its daemon, *disks*
 that in `libsysaux`, *kernel* the calls of the kernel that the tool makes itself (files, locks) and the time that the kernel lets it
 stand, *start* what the kernel and the loader need before the tool's first instruction and after its last. *Ours* is all that is left
-of the processor's time: at most {MOST} % of the command.""")
+of the processor's time, with the faults of the tool's pages and what interrupts do meanwhile: at most {MOST} % of the command.""")
 
 
 def wait_table(runs):
