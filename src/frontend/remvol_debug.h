@@ -5,7 +5,7 @@
 namespace remvol {
 
 // Returns the debug level stored in the tree; 0 when the key is missing, empty or not a number.
-int dbg_get_remvol_debug_lv();
+[[nodiscard]] int dbg_get_remvol_debug_lv();
 
 }  // namespace remvol
 

@@ -55,7 +55,7 @@ int start_daemon(const char* command) {
 }
 
 void start_tree_daemon(const char* socket) {
-  start_daemon(start_tree_command(socket));
+  (void)start_daemon(start_tree_command(socket));
   sleep(1);
 }
 

@@ -8,7 +8,7 @@ namespace remvol {
 
 // Runs `command`, which puts a daemon in the background, in a process group of its own. Returns 0, or
 // non-zero when the command failed, which is logged in the innermost scope's name.
-int start_daemon(const char* command);
+[[nodiscard]] int start_daemon(const char* command);
 
 // Starts a configuration tree daemon that listens on `socket`, and gives it a second to do so.
 void start_tree_daemon(const char* socket);

@@ -147,7 +147,7 @@ int Portal_search_target(const char* name, const char* address, int port) {
   }
   const bool offered = find_offer(file.get(), name, address, port);
   file.reset();
-  _remove_file(path);
+  (void)_remove_file(path);
   return offered ? kOffered : not_offered(name, address, port);
 }
 

@@ -42,7 +42,7 @@ constexpr IfaceRecord kIfaceRecords[] = {
 int _set_iface_config(const char* iface, const char* /*mac*/, const char* netif) {
   const LogScope scope;
   if (iface == nullptr || iface[0] == '\0' || netif == nullptr || netif[0] == '\0') return kFailed;
-  run_command(new_iface_command(iface), kNote);
+  (void)run_command(new_iface_command(iface), kNote);
   return run_command(bind_iface_command(iface, netif)) == 0 ? kOk : kFailed;
 }
 

@@ -10,7 +10,7 @@ namespace remvol {
 
 // Makes or updates the records iface0, iface1 and ifbond; a port without hardware address gets none. Returns
 // 0.
-int Iface_Config_Gen();
+[[nodiscard]] int Iface_Config_Gen();
 
 // Fills the entry's iface when it is still empty, by its portal address. Returns 0, or -1 for a null entry or
 // an empty address.

@@ -72,7 +72,7 @@ bool write_iscsid_conf(const char* settings) {
 }
 
 void write_daemon_configuration() {
-  run_command(configure_iscsid_command(iscsid_settings("\\n")));
+  (void)run_command(configure_iscsid_command(iscsid_settings("\\n")));
   // The echo of dash knows no -e: it writes it into the file.
   const ConfText settings = iscsid_settings("\n");
   if (iscsid_conf_holds(settings) || write_iscsid_conf(settings)) return;
@@ -83,26 +83,26 @@ void write_daemon_configuration() {
 void reload_modules() {
   for (const char* module : kModules) System("%s", unload_module_quietly_command(module).c_str());
   for (int i = kModuleCount - 1; i >= 0; i--) {
-    run_command(load_module_command(kModules[i]));
+    (void)run_command(load_module_command(kModules[i]));
   }
 }
 
 InitiatorName write_initiator_name() {
   const InitiatorName name = make_initiator_name();
-  run_command(name_initiator_command(name));
+  (void)run_command(name_initiator_command(name));
   return name;
 }
 
 }  // namespace
 
 InitiatorName start_initiator() {
-  run_command(end_iscsid_quietly_command(), kNote);
+  (void)run_command(end_iscsid_quietly_command(), kNote);
   reload_modules();
-  run_command(make_system_folder_command(kIscsidFolder));
+  (void)run_command(make_system_folder_command(kIscsidFolder));
   write_daemon_configuration();
   const InitiatorName name = write_initiator_name();
   drop_empty_records();
-  start_daemon(start_iscsid_command());
+  (void)start_daemon(start_iscsid_command());
   return name;
 }
 

@@ -18,8 +18,8 @@ int publish_luns(const char* socket, const char* name, DeviceNodeMaker make_node
   if (ready == kNoLunReady) {
     LOG(1, "Can not find any available LUN on target %s", name);
     print_lun_list(nullptr, name);
-    ktree_update_search_lun_result(socket, nullptr, name);
-    ktree_update_search_lun_err_code(socket, kLunSearchDone);
+    (void)ktree_update_search_lun_result(socket, nullptr, name);
+    (void)ktree_update_search_lun_err_code(socket, kLunSearchDone);
     return kOk;
   }
   LunNode* luns = nullptr;
@@ -29,10 +29,10 @@ int publish_luns(const char* socket, const char* name, DeviceNodeMaker make_node
   }
   if (luns != nullptr) {
     print_lun_list(luns, name);
-    ktree_update_search_lun_result(socket, luns, name);
+    (void)ktree_update_search_lun_result(socket, luns, name);
     lun_node_free_list(luns);
   }
-  ktree_update_search_lun_err_code(socket, kLunSearchDone);
+  (void)ktree_update_search_lun_err_code(socket, kLunSearchDone);
   return kOk;
 }
 

@@ -29,8 +29,8 @@ int _target_chap_gen(const TargetEntry* entry) {
   const LogScope scope;
   if (entry == nullptr || entry->iface[0] == '\0') return kFailed;
   if (entry->chap != 1) return run_command(no_auth_command(*entry)) == 0 ? kOk : kFailed;
-  run_command(chap_method_command(*entry));
-  run_command(chap_user_command(*entry));
+  (void)run_command(chap_method_command(*entry));
+  (void)run_command(chap_user_command(*entry));
   return run_command(chap_secret_command(*entry)) == 0 ? kOk : kFailed;
 }
 
@@ -58,13 +58,13 @@ bool run_login(const char* command, FILE** output) {
 
 void close_own_session(const TargetEntry& entry) {
   const SessionClosing closing(entry.target_name);
-  run_command(portal_logout_command(entry));
+  (void)run_command(portal_logout_command(entry));
 }
 
 void log_in_again(const TargetEntry& entry) {
   close_own_session(entry);
   const LoginUnderWay under_way;
-  run_command(login_again_command(entry));
+  (void)run_command(login_again_command(entry));
 }
 
 // Returns whether the session to `name` is there.
@@ -92,14 +92,14 @@ int _target_connect_run(const TargetEntry& entry, const char* requested) {
 int delete_node_record(TargetEntry* entry) {
   const LogScope scope("Target_Config_Gen");
   if (entry == nullptr || get_iface_name(entry) != kOk) return kFailed;
-  run_command(delete_node_command(*entry));
+  (void)run_command(delete_node_command(*entry));
   return kOk;
 }
 
 int Target_Config_Gen(TargetEntry* entry) {
   const LogScope scope;
   if (delete_node_record(entry) != kOk) return kFailed;
-  run_command(new_node_command(*entry));
+  (void)run_command(new_node_command(*entry));
   return _target_chap_apply(entry);
 }
 
@@ -110,7 +110,7 @@ int _target_login(TargetEntry* entry, const char* requested) {
 
 int Target_Connect(TargetEntry* entry, const char* requested) {
   const LogScope scope;
-  ktree_set_connect_state(entry->db_idx, kConnecting);
+  (void)ktree_set_connect_state(entry->db_idx, kConnecting);
   if (_target_login(entry, requested) != 0) return kFailed;
   return confirm_login(entry->target_name, requested) ? kOk : kFailed;
 }

@@ -8,12 +8,12 @@ namespace remvol {
 
 // Builds the target's node record from scratch, CHAP settings included. Returns 0; -1 when the entry is null
 // or no interface could be chosen. Failed commands are logged and ignored.
-int Target_Config_Gen(TargetEntry* entry);
+[[nodiscard]] int Target_Config_Gen(TargetEntry* entry);
 
 // Deletes the target's node record for the entry's portal, and logs as the step of Target_Config_Gen() that
 // it is. Returns 0, also when the command failed (there may be no record); -1 when the entry is null or no
 // interface could be chosen.
-int delete_node_record(TargetEntry* entry);
+[[nodiscard]] int delete_node_record(TargetEntry* entry);
 
 // What _target_login gives for a login that did not start, or that no session confirmed.
 inline constexpr int kNotConfirmed = 1;

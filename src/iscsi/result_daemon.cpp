@@ -23,8 +23,8 @@ const char* open_results(const ResultDaemon& daemon, const char* output_file) {
   if (check_path_exist(daemon.socket) == 0) {
     stop(daemon);
     sleep(1);
-    _remove_file(daemon.socket);
-    _remove_file(daemon.pid_file);
+    (void)_remove_file(daemon.socket);
+    (void)_remove_file(daemon.pid_file);
   }
   start_tree_daemon(daemon.socket);
   return daemon.socket;

@@ -77,7 +77,7 @@ int list_in_detail(const char* path) {
   const CommandText command = session_luns_command(path);
   LOG(2, "run cmd: %s", command.c_str());
   const int listed = list_sessions(command);
-  if (listed != 0) _remove_file(path);
+  if (listed != 0) (void)_remove_file(path);
   return listed;
 }
 
@@ -215,7 +215,7 @@ int _wait_sess_lun_ready(const char* name, int wait_seconds) {
     listing.after_lun = false;
     char line[kListingLineSize];
     ready = next_usable_lun(file.get(), &listing, line, name);
-    _remove_file(path);
+    (void)_remove_file(path);
   }
   return ready ? kOk : kNoLunReady;
 }
@@ -242,7 +242,7 @@ int _get_sess_lun_list(LunNode** head, const char* name, DeviceNodeMaker make_no
       lun_node_append(*head, node);
     }
   }
-  _remove_file(path);
+  (void)_remove_file(path);
   return 0;
 }
 

@@ -37,7 +37,7 @@ int check_target_connected(const char* name) {
     connected = session_line_shows(line, name);
   }
   file.reset();
-  _remove_file(path);
+  (void)_remove_file(path);
   return connected ? kLoggedIn : kNotLoggedIn;
 }
 

@@ -36,7 +36,7 @@ int write_target_state(int dbidx, bool connected, int state) {
 
 int read_connect_state(int dbidx) {
   int state = -1;
-  ktree_get_connect_state(dbidx, &state);
+  (void)ktree_get_connect_state(dbidx, &state);
   return state;
 }
 

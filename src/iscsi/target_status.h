@@ -8,10 +8,10 @@ namespace remvol {
 
 // Writes the target's status text and the connect state that goes with it. Returns 0 or -103; the result of
 // the connect-state write, when one was made, hides an earlier failed status write.
-int ktree_update_status(const TargetEntry* entry);
+[[nodiscard]] int ktree_update_status(const TargetEntry* entry);
 
 // The same for a target whose connect state was just read.
-int ktree_update_status(const TargetEntry* entry, int state);
+[[nodiscard]] int ktree_update_status(const TargetEntry* entry, int state);
 
 }  // namespace remvol
 

@@ -9,7 +9,7 @@ namespace remvol {
 // Runs `command` with system(3). A status other than 0 is logged at level 0 as "system() of cmd '%s' failed"
 // in the innermost scope's name; `failure` is kNote where that is no failure of the tool's, such as ending a
 // program that does not run. Returns the raw status; see wait(2).
-int run_command(const char* command, Weight failure = 0);
+[[nodiscard]] int run_command(const char* command, Weight failure = 0);
 
 // Returns a mark of the commands that this run has waited for: another one once a further command has ended.
 [[nodiscard]] long command_mark();

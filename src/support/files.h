@@ -32,7 +32,7 @@ using Directory = std::unique_ptr<DIR, DirectoryCloser>;
 [[nodiscard]] int make_dir_include_parent(const char* path, mode_t mode);
 
 // Removes the file `path`. Returns 0 when it is gone or was absent, else -1.
-int _remove_file(const char* path);
+[[nodiscard]] int _remove_file(const char* path);
 
 // Removes whatever is at `path`, a folder with all that is in it. Follows no link.
 void remove_path(const char* path);

@@ -16,7 +16,7 @@ inline constexpr char kRecoverQueueLock[] = "/var/lock/virtual_volume/remvol_rec
 [[nodiscard]] int get_recover_cri_flock();
 
 // Releases the recover lock and closes `fd` in every case. Returns 0, -1, -2 (bad descriptor) or -10.
-int unlock_recover_cri_flock(int fd);
+[[nodiscard]] int unlock_recover_cri_flock(int fd);
 
 // Takes a write lock on the file at `path`, with random waits below `max_wait_us` (above 0) microseconds
 // between tries. Returns the descriptor; -1 when the retries ran out, -10 on another error, -108 when the
@@ -24,7 +24,7 @@ int unlock_recover_cri_flock(int fd);
 [[nodiscard]] int wait_flock(const char* path, int max_retries, int max_wait_us);
 
 // Releases a lock of wait_flock and closes `fd` in every case. Returns 0, -1, -2 or -10.
-int unlock_flock(int fd);
+[[nodiscard]] int unlock_flock(int fd);
 
 }  // namespace remvol
 

@@ -1,6 +1,6 @@
 // Result codes that travel between the layers. 0 is success; a few operations define further codes of their
-// own, which their headers name. A result that need not be looked at ([[nodiscard]]) tells of a failure that
-// is logged where it happens, or shows in what the operation gives.
+// own, which their headers name. Every result has to be looked at ([[nodiscard]]); a step that goes on
+// whatever came of it says so by a (void) in front, where the order of the steps is settled to be so.
 #ifndef REMVOL_SUPPORT_RESULT_H
 #define REMVOL_SUPPORT_RESULT_H
 

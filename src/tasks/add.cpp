@@ -54,10 +54,10 @@ bool mount_added_lun(TargetEntry* entry, int dbidx, int lun_dbidx, int* result) 
   *result = ktree_get_lun_enable(&enable, dbidx, lun_dbidx);
   if (*result != kOk || enable != 1) return true;
 
-  ktree_update_volume_state(entry, kVolumeCreating);
+  (void)ktree_update_volume_state(entry, kVolumeCreating);
   const MountOutcome& outcome = mount_outcome(Target_mount(entry, 0, 0));
-  ktree_update_volume_state(entry, outcome.state);
-  ktree_update_lun_status(entry, 0);
+  (void)ktree_update_volume_state(entry, outcome.state);
+  (void)ktree_update_lun_status(entry, 0);
   unmount_if_deleted(entry);
   *result = outcome.result;
   return &outcome != &kMountBroken;
@@ -97,17 +97,17 @@ int task_add(const TargetEntry& request) {
   int dbidx = 0;
   int lun_dbidx = 0;
   if (store_lun(&entry, &dbidx, &lun_dbidx) != kOk) return kFailed;
-  ktree_update_lun_status(&entry, 0);
-  ktree_update_status(&entry);
+  (void)ktree_update_lun_status(&entry, 0);
+  (void)ktree_update_status(&entry);
 
   const TargetHold hold(entry.target_name, entry.lun);
   int result = kOk;
   if (check_target_connected(entry.target_name) == kNotLoggedIn) {
-    Target_Config_Gen(&entry);  // no login: the volume is mounted when the target is next connected
+    (void)Target_Config_Gen(&entry);  // no login: the volume is mounted when the target is next connected
   } else if (!mount_added_lun(&entry, dbidx, lun_dbidx, &result)) {
     return result;
   }
-  ktree_update_current_targetcnt();
+  (void)ktree_update_current_targetcnt();
   LOG(2, "end");
   return result;
 }

@@ -42,11 +42,11 @@ VolumeState state_after_mount(MountResult mounted) {
 
 // Mounts the LUN in `entry` and stores what became of it; a failure shows in the volume state alone.
 void mount_connected_lun(TargetEntry* entry) {
-  ktree_update_volume_state(entry, kVolumeCreating);
+  (void)ktree_update_volume_state(entry, kVolumeCreating);
   VolumeState state = kVolumeOffline;
   if (entry->dev[0] != '\0') state = state_after_mount(Target_mount(entry, 0, 0));
-  ktree_update_volume_state(entry, state);
-  ktree_update_lun_status(entry, 0);
+  (void)ktree_update_volume_state(entry, state);
+  (void)ktree_update_lun_status(entry, 0);
   unmount_if_deleted(entry);
 }
 
@@ -76,7 +76,7 @@ int present_volumes(TargetEntry* entry) {
   }
   sleep(kSettleSeconds);
   const int result = mount_enabled_luns(entry, entry->db_idx);
-  ktree_update_status(entry);
+  (void)ktree_update_status(entry);
   reload_share_services();
   return result;
 }
@@ -93,8 +93,8 @@ int disconnect_target(const char* target_name) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(target_name, &entry) != kOk) return kFailed;
   const BriefTargetHold hold(entry.target_name, is_no_lun_formatting);
-  Target_Disconnect(&entry);
-  ktree_update_status(&entry);
+  (void)Target_Disconnect(&entry);
+  (void)ktree_update_status(&entry);
   return kOk;
 }
 
@@ -109,20 +109,20 @@ int task_connect(const TargetEntry& request) {
     LOG(1, "Can not find: %s", request.target_name);
     return kTreeFailed;
   }
-  ktree_set_connect_state(entry.db_idx, kConnecting);
-  ktree_update_status(&entry);
-  Target_Config_Gen(&entry);
+  (void)ktree_set_connect_state(entry.db_idx, kConnecting);
+  (void)ktree_update_status(&entry);
+  (void)Target_Config_Gen(&entry);
   const int login = Target_Connect(&entry, request.target_name);
   if (login != kOk) {
     LOG(0, "Target_Connect failed , target name = %s", entry.target_name);
-    ktree_set_connect_state(entry.db_idx, kConnectError);
+    (void)ktree_set_connect_state(entry.db_idx, kConnectError);
     return login;
   }
   entry.conn_set = 1;
-  ktree_record_connect_set(&entry);
-  ktree_set_connect_state(entry.db_idx, kConnected);
+  (void)ktree_record_connect_set(&entry);
+  (void)ktree_set_connect_state(entry.db_idx, kConnected);
   const int result = present_volumes(&entry);
-  if (!HeldSlot(entry.db_idx)) Target_Logout(&entry);  // deleted meanwhile
+  if (!HeldSlot(entry.db_idx)) (void)Target_Logout(&entry);  // deleted meanwhile
   LOG(2, "end, ret = %d", result);
   return result;
 }

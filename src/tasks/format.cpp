@@ -44,25 +44,25 @@ Result read_lun_to_format(const TargetEntry& request, TargetEntry* entry) {
 // Formats and mounts the LUN anew, with its FTP share taken down meanwhile. Returns -1 when the mount table
 // cannot be read, else the result of the mount.
 int remake_volume(TargetEntry* entry) {
-  ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0);
-  ktree_update_lun_status(entry, 1);
-  ktree_update_volume_state(entry, kVolumeCreating);
+  (void)ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0);
+  (void)ktree_update_lun_status(entry, 1);
+  (void)ktree_update_volume_state(entry, kVolumeCreating);
 
   FtpPath ftp_path;
   if (take_ftp_share_down(entry, ftp_path) != kOk) {
-    ktree_update_volume_state(entry, kVolumeNormal);
+    (void)ktree_update_volume_state(entry, kVolumeNormal);
     return kFailed;
   }
   (void)Target_LUN_umount(entry);
   const MountResult mounted = Target_mount(entry, 1, 0);
   if (mounted != kMounted && mounted != kMountUnsupported && mounted != kMountReadOnly) {
-    ktree_update_volume_state(entry, kVolumeFailed);
+    (void)ktree_update_volume_state(entry, kVolumeFailed);
   }
   if (ftp_path[0] != '\0') {
     LOG(1, "mount_ftp : FTP SHARE PATH = %s", ftp_path);
     (void)Target_remount_ftp(entry, ftp_path);
   }
-  ktree_update_lun_status(entry, 0);
+  (void)ktree_update_lun_status(entry, 0);
   unmount_if_deleted(entry);
   return mounted;
 }
@@ -80,7 +80,7 @@ void store_chap(const TargetEntry& request, TargetEntry* entry) {
   copy_text(entry->chap_name, request.chap_name);
   copy_text(entry->chap_pwd, request.chap_pwd);
   _update_stored_target(entry);
-  Target_Config_Gen(entry);
+  (void)Target_Config_Gen(entry);
 }
 
 // Logs the target in with its new settings and mounts its volumes. A failure is stored, not returned: the
@@ -89,12 +89,12 @@ void reconnect(TargetEntry* entry, int conn_set) {
   if (Target_Connect(entry, entry->target_name) != kOk) {
     LOG(0, "Reconnect failed , target name = %s", entry->target_name);
     entry->conn_set = 0;
-    ktree_record_connect_set(entry);
-    ktree_set_connect_state(entry->db_idx, kConnectError);
+    (void)ktree_record_connect_set(entry);
+    (void)ktree_set_connect_state(entry->db_idx, kConnectError);
     return;
   }
   entry->conn_set = conn_set;
-  ktree_record_connect_set(entry);
+  (void)ktree_record_connect_set(entry);
   (void)ktree_update_dev(entry);
   sleep(kSettleSeconds);
   (void)Target_mount_all_lun(entry, 0, 1);
@@ -121,10 +121,10 @@ int task_modify(const TargetEntry& request) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(request.target_name, &entry) == kOk) {
     const int conn_set = entry.conn_set;
-    Target_Disconnect(&entry);
+    (void)Target_Disconnect(&entry);
     store_chap(request, &entry);
     if (conn_set != 0) reconnect(&entry, conn_set);
-    ktree_update_status(&entry);
+    (void)ktree_update_status(&entry);
     result = kOk;
   }
   LOG(2, "end");

@@ -88,7 +88,7 @@ bool is_lost(int dbidx) {
   TargetEntry target;
   int state = kDisconnected;
   if (ktree_get_entry_by_dbidx(dbidx, &target) != kOk) return false;
-  ktree_get_connect_state(dbidx, &state);
+  (void)ktree_get_connect_state(dbidx, &state);
   return target.conn_set != 0 && state == kRecovering;
 }
 
@@ -102,14 +102,14 @@ bool store_recovered(TargetEntry* entry) {
   const SlotsHeld held(SlotsHeld::kChange);
   if (!is_lost(entry->db_idx)) return false;
   entry->conn_set = 1;
-  ktree_record_connect_set(entry);
-  ktree_set_connect_state(entry->db_idx, kConnected);
+  (void)ktree_record_connect_set(entry);
+  (void)ktree_set_connect_state(entry->db_idx, kConnected);
   return true;
 }
 
 int keep_volumes(TargetEntry* entry) {
   if (!store_recovered(entry)) return leave_target(entry);
-  ktree_update_status(entry);
+  (void)ktree_update_status(entry);
   return kOk;
 }
 
@@ -119,7 +119,7 @@ CommandText later_recovery_command(const char* target_name) {
 }
 
 void postpone(const TargetEntry* entry) {
-  run_command(later_recovery_command(entry->target_name));
+  (void)run_command(later_recovery_command(entry->target_name));
 }
 
 // Takes every volume of the target at `dbidx` away. A slot that cannot be read is passed over, an empty one
@@ -146,13 +146,13 @@ int rebuild(TargetEntry* entry) {
   }
   if (!is_lost(entry->db_idx)) return leave_target(entry);
   unmount_luns(entry->db_idx);
-  Target_Logout(entry);
+  (void)Target_Logout(entry);
   entry->conn_set = 1;
-  ktree_set_connect_state(entry->db_idx, kConnecting);
+  (void)ktree_set_connect_state(entry->db_idx, kConnecting);
   const int result = task_connect(*entry);
   int state = kDisconnected;
   if (result == kTreeFailed && ktree_get_connect_state(entry->db_idx, &state) == kOk && state != kConnected) {
-    ktree_set_connect_state(entry->db_idx, kDisconnected);
+    (void)ktree_set_connect_state(entry->db_idx, kDisconnected);
   }
   return result;
 }
@@ -194,7 +194,7 @@ int queue_target(const char* name) {
     return kFailed;
   }
   const int result = ktree_insert_recover_queue(name);
-  unlock_flock(lock);
+  (void)unlock_flock(lock);
   return result;
 }
 
@@ -206,7 +206,7 @@ Result mark_as_lost(const char* name) {
     return kNotStored;
   }
   if (entry.conn_set != 0) {
-    ktree_set_connect_state(entry.db_idx, kRecovering);
+    (void)ktree_set_connect_state(entry.db_idx, kRecovering);
   } else {
     LOG(1, "This target %s has not been set to connect", name);
   }
@@ -226,7 +226,7 @@ int recover_or_queue(const char* name, int wait_seconds) {
   const int lock = get_recover_cri_flock();
   if (lock < 0) return queue_target(name);
   const int result = drain_queue(name);
-  unlock_recover_cri_flock(lock);
+  (void)unlock_recover_cri_flock(lock);
   return result;
 }
 

@@ -56,7 +56,7 @@ Result delete_slot_of_last_lun(int dbidx, int lun) {
   if (lun_dbidx <= 0) lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);  // the read may have failed
   if (has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return delete_stored_slot(dbidx, 0);
   const Result result = lun_dbidx > 0 ? delete_stored_slot(dbidx, lun_dbidx) : kOk;
-  ktree_update_current_luncnt(dbidx);
+  (void)ktree_update_current_luncnt(dbidx);
   return result;
 }
 
@@ -67,8 +67,8 @@ Result remove_target(TargetEntry* entry, int last_lun) {
   TargetEntry lun;
   LunWalk luns(entry->db_idx, LunWalk::kAtUnreadable);
   while (luns.next(&lun)) reload_lun_share(&lun);
-  Target_Disconnect(entry);
-  delete_node_record(entry);
+  (void)Target_Disconnect(entry);
+  (void)delete_node_record(entry);
   if (last_lun == kEveryLun) return delete_stored_slot(entry->db_idx, 0);
   return delete_slot_of_last_lun(entry->db_idx, last_lun);
 }
@@ -91,7 +91,7 @@ Result remove_named_target(const char* name, int last_lun) {
   } else {
     LOG(1, "Can not find: %s", name);
   }
-  ktree_update_current_targetcnt();
+  (void)ktree_update_current_targetcnt();
   LOG(2, "end");
   return result;
 }
@@ -132,7 +132,7 @@ int task_del_lun(const TargetEntry& request) {
     // Another run has removed the others meanwhile.
     if (target_gone) result = remove_target_with_last_lun(request);
   }
-  if (dbidx >= 1 && !target_gone) ktree_update_current_luncnt(dbidx);
+  if (dbidx >= 1 && !target_gone) (void)ktree_update_current_luncnt(dbidx);
   LOG(2, "end, ret = %d", result);
   return result;
 }

@@ -45,10 +45,10 @@ bool shows_ended_work(const TargetEntry* target) {
 
 int repair_target_state(const TargetEntry* target) {
   int state = kDisconnected;
-  ktree_get_connect_state(target->db_idx, &state);
+  (void)ktree_get_connect_state(target->db_idx, &state);
   if (state != kConnecting || !IdleTarget(target->target_name)) return state;
-  ktree_set_connect_state(target->db_idx, kDisconnected);
-  ktree_get_connect_state(target->db_idx, &state);
+  (void)ktree_set_connect_state(target->db_idx, kDisconnected);
+  (void)ktree_get_connect_state(target->db_idx, &state);
   return state;
 }
 
@@ -57,8 +57,8 @@ void repair_lun_state(const TargetEntry* lun, LunState* state) {
   const IdleTarget idle(lun->target_name, lun->lun);
   if (!idle) return;
   if (lun->dev[0] != '\0' && has_process(kMke2fs, Text<32>("/dev/%s", lun->dev))) return;
-  if (is_format_under_way(state->format)) ktree_update_formatting_state(lun, kFormatIdle);
-  if (state->volume == kVolumeCreating) ktree_update_volume_state(lun, kVolumeNormal);
+  if (is_format_under_way(state->format)) (void)ktree_update_formatting_state(lun, kFormatIdle);
+  if (state->volume == kVolumeCreating) (void)ktree_update_volume_state(lun, kVolumeNormal);
   (void)read_lun_state(lun->db_idx, lun->lun_db_idx, state);
 }
 

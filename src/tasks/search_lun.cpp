@@ -20,7 +20,7 @@ namespace {
 
 // Logs in for the time of the search. The node record that this makes is left in place.
 bool log_in(TargetEntry* target) {
-  Target_Config_Gen(target);
+  (void)Target_Config_Gen(target);
   return _target_login(target, target->target_name) == 0 &&
          check_target_connected(target->target_name) != kNotLoggedIn;
 }
@@ -36,7 +36,7 @@ int open_session(const char* socket, TargetEntry* target, int connected, bool* l
   *logged_in = log_in(target);
   if (*logged_in) return kOk;
   LOG(0, "Target_Connect %s failed", target->target_name);
-  ktree_update_search_lun_err_code(socket, kLunSearchLoginFailed);
+  (void)ktree_update_search_lun_err_code(socket, kLunSearchLoginFailed);
   return kFailed;
 }
 
@@ -52,7 +52,7 @@ int search_luns(const char* socket, TargetEntry* target) {
   bool logged_in = false;
   int result = open_session(socket, target, connected, &logged_in);
   if (result == kOk) result = publish_luns(socket, name, _create_device_node);
-  if (logged_in) _target_disconnect(target);
+  if (logged_in) (void)_target_disconnect(target);
   return result;
 }
 

@@ -18,12 +18,12 @@ int task_init() {
   const LogScope scope;
   LOG(2, "start");
   start_settings_daemon();
-  if (is_remvol_ver_changed() != 0) version_upgrade();
-  set_remvol_ver_to_db(kSettingsVersion);
+  if (is_remvol_ver_changed() != 0) (void)version_upgrade();
+  (void)set_remvol_ver_to_db(kSettingsVersion);
   const InitiatorName name = start_initiator();
-  Iface_Config_Gen();
-  ktree_update_initiator_iqn(name);
-  Target_load_all();
+  (void)Iface_Config_Gen();
+  (void)ktree_update_initiator_iqn(name);
+  (void)Target_load_all();
   LOG(2, "end");
   return 0;
 }

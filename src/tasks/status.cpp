@@ -30,10 +30,10 @@ void refresh_luns(TargetEntry* entry, SlotsHeld* held) {
   while (luns.next_of_target(entry) && read_lun_state(entry->db_idx, entry->lun_db_idx, &state) == kOk) {
     held->let_go();
     repair_lun_state(entry, &state);
-    ktree_update_lun_status(entry, state);
+    (void)ktree_update_lun_status(entry, state);
     held->take();
   }
-  ktree_refresh_total_luncnt();
+  (void)ktree_refresh_total_luncnt();
 }
 
 // Refreshes the target in `entry`. The slots are let go of while the sessions are listed. Returns 0, also
@@ -50,7 +50,7 @@ int refresh_target(TargetEntry* entry, SlotsHeld* held) {
     held->take();
     return kOk;
   }
-  ktree_update_status(entry, repair_target_state(entry));
+  (void)ktree_update_status(entry, repair_target_state(entry));
   held->take();
   refresh_luns(entry, held);
   return kOk;
@@ -124,7 +124,7 @@ int task_status() {
   const LogScope scope;
   LOG(2, "start");
   drop_half_made_slots();
-  if (has_uncounted_target()) ktree_update_current_targetcnt();
+  if (has_uncounted_target()) (void)ktree_update_current_targetcnt();
   StateValue text;
   if (!tree_read(key::kTargetCount, text)) return kFailed;
   const int count = std::min(atoi(text), kMaxTargets);

@@ -61,7 +61,7 @@ int update_dev_at_start(TargetEntry* entry) {
 bool load_connected_target(TargetEntry* entry, int* result) {
   *result = Target_Connect(entry, kNoRequest);
   if (*result != 0) {
-    ktree_set_connect_state(entry->db_idx, kConnectError);
+    (void)ktree_set_connect_state(entry->db_idx, kConnectError);
     return false;
   }
   *result = update_dev_at_start(entry);
@@ -84,10 +84,10 @@ bool load_target(int n, int* result) {
   if (ktree_get_entry_by_dbidx(n, &entry) == kOk) {
     const TargetHold hold(entry.target_name);
     if (hold.waited() && ktree_get_entry_by_dbidx(n, &entry) != kOk) return false;
-    Target_Config_Gen(&entry);
+    (void)Target_Config_Gen(&entry);
     mounted = entry.conn_set != 0 && load_connected_target(&entry, result);
   }
-  ktree_update_status(&entry);
+  (void)ktree_update_status(&entry);
   return mounted;
 }
 
@@ -97,7 +97,7 @@ int Target_Logout(TargetEntry* entry) {
   const LogScope scope;
   const int result = log_out(entry);
   entry->conn_set = 0;
-  ktree_set_connect_state(entry->db_idx, kDisconnected);
+  (void)ktree_set_connect_state(entry->db_idx, kDisconnected);
   return result;
 }
 
@@ -114,8 +114,8 @@ void give_up_session(TargetEntry* entry, int reason, VolumeState state) {
   }
   // Written after a logout that worked; readers of the log know it so.
   if (Target_Logout(entry) == kOk) LOG(1, "Logout Fail on Target: %s ", entry->target_name);
-  ktree_record_connect_set(entry);
-  ktree_update_all_volume_state(entry, state);
+  (void)ktree_record_connect_set(entry);
+  (void)ktree_update_all_volume_state(entry, state);
 }
 
 int _target_disconnect(const TargetEntry* entry) {
@@ -142,9 +142,9 @@ int Target_Disconnect(TargetEntry* entry) {
   LOG(2, "logout start");
   const int result = log_out(entry);
   LOG(2, "logout end ");
-  ktree_set_connect_state(entry->db_idx, kDisconnected);
+  (void)ktree_set_connect_state(entry->db_idx, kDisconnected);
   entry->conn_set = 0;
-  ktree_record_connect_set(entry);
+  (void)ktree_record_connect_set(entry);
   (void)ktree_update_dev(entry);
   LOG(2, "end");
   return result;
@@ -160,7 +160,7 @@ int Target_load_all() {
     if (is_target_stored(n) && load_target(n, &result)) mounted++;
   }
   if (mounted > 0) reload_share_services();
-  ktree_update_current_targetcnt();
+  (void)ktree_update_current_targetcnt();
   LOG(2, "end");
   return result;
 }

@@ -9,7 +9,7 @@ namespace remvol {
 
 // Logs out, clears conn_set in the entry and sets the connect state "disconnected". Returns 0, or 1 when the
 // command failed.
-int Target_Logout(TargetEntry* entry);
+[[nodiscard]] int Target_Logout(TargetEntry* entry);
 
 // Gives up a login whose session shows no disk that could be mounted: logs out, stores that the target stays
 // disconnected and `state` for all its LUNs. `reason` is the result of ktree_update_dev; it and the outcome
@@ -17,15 +17,15 @@ int Target_Logout(TargetEntry* entry);
 void give_up_session(TargetEntry* entry, int reason, VolumeState state);
 
 // Logs out and changes nothing else. Returns 0, 1 when the command failed, -1 for an empty target name.
-int _target_disconnect(const TargetEntry* entry);
+[[nodiscard]] int _target_disconnect(const TargetEntry* entry);
 
 // Unmounts all volumes of the target, reloads the shares, logs out and stores that the target stays
 // disconnected. Returns 0, 1 when the logout command failed, -1 when the target is unknown.
-int Target_Disconnect(TargetEntry* entry);
+[[nodiscard]] int Target_Disconnect(TargetEntry* entry);
 
 // Start-up: builds the node record of every stored target, logs in to those that are set to connect and
 // mounts their volumes. Returns the result of the last target handled.
-int Target_load_all();
+[[nodiscard]] int Target_load_all();
 
 }  // namespace remvol
 

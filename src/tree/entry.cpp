@@ -263,7 +263,7 @@ void ktree_complete_lun_entry(const TargetEntry* entry, int lun_dbidx) {
   if (tree_is_missing(enable, number)) set_value(enable, 1);
   if (tree_is_missing(right, number)) set_value(right, VOL_AC_RW);
   if (tree_read_number(KeyText(key::kTargetLunCount, n), 0) != count_all_luns_at(n)) {
-    ktree_update_current_luncnt(n);
+    (void)ktree_update_current_luncnt(n);
   }
 }
 
@@ -335,7 +335,7 @@ int ktree_add_lun_entry(TargetEntry* entry) {
                       set_value(KeyText(key::kLunEnable, n, m), 1) &&
                       set_value(KeyText(key::kLunAccessRight, n, m), VOL_AC_RW);
   if (!stored) return kTreeFailed;
-  ktree_update_current_luncnt(n);
+  (void)ktree_update_current_luncnt(n);
   return m;
 }
 

@@ -36,7 +36,7 @@ namespace remvol {
 [[nodiscard]] int ktree_get_found_lun_entry(TargetEntry* entry, int dbidx, int lun_dbidx, int lun);
 
 // Rewrites the count of targets: every filled slot of the eight, gaps or not. Returns 0 or -103.
-int ktree_update_current_targetcnt();
+[[nodiscard]] int ktree_update_current_targetcnt();
 
 // Returns the number of LUNs over all targets; the walk stops at the first empty slot of either kind.
 [[nodiscard]] int ktree_get_total_luncnt();
@@ -49,10 +49,10 @@ int ktree_update_current_targetcnt();
 [[nodiscard]] bool has_no_further_lun(int dbidx, int most);
 
 // Rewrites the count of LUNs over all targets. Returns 0 or -103.
-int ktree_refresh_total_luncnt();
+[[nodiscard]] int ktree_refresh_total_luncnt();
 
 // Rewrites the target's count of LUNs (every filled slot, gaps or not), then the total. Returns 0 or -103.
-int ktree_update_current_luncnt(int dbidx);
+[[nodiscard]] int ktree_update_current_luncnt(int dbidx);
 
 // Reads whether the LUN is enabled: `enable` becomes 1 for any non-zero value, else 0. Returns 0; -103 with
 // `enable` 0 when the value is missing or empty (-1 when the read reported failure yet left text in the

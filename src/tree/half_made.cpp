@@ -53,7 +53,7 @@ void count_luns_of(int n) {
   TreeValue name;
   if (read_target_name(n, name) && tree_read_number(KeyText(key::kTargetLunCount, n), 0) < last_lun_at(n) &&
       IdleTarget(name)) {
-    ktree_update_current_luncnt(n);
+    (void)ktree_update_current_luncnt(n);
   }
 }
 
@@ -88,7 +88,7 @@ void drop_half_made_slots() {
     count_luns_of(n);
     if (!is_half_made_target(n)) continue;
     drop(KeyText(key::kTarget, n));
-    ktree_update_current_targetcnt();
+    (void)ktree_update_current_targetcnt();
   }
 }
 

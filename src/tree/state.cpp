@@ -106,7 +106,7 @@ bool is_no_lun_formatting(const char* target_name) {
   const int dbidx = ktree_get_dbidx_by_targetname(target_name);
   for (const int m : stored_luns(dbidx)) {
     int state = kFormatIdle;
-    ktree_get_lun_format_state(dbidx, m, &state);
+    (void)ktree_get_lun_format_state(dbidx, m, &state);
     if (state == kFormatting || state == kFormatWaiting) return false;
   }
   return true;
@@ -184,8 +184,8 @@ int read_lun_state(int dbidx, int lun_dbidx, LunState* state) {
   int enabled = 0;
   if (ktree_get_lun_vol_access_right(&state->right, dbidx, lun_dbidx) != kOk) return kFailed;
   state->enabled = ktree_get_lun_enable(&enabled, dbidx, lun_dbidx) == kOk && enabled != 0;
-  ktree_get_lun_format_state(dbidx, lun_dbidx, &state->format);
-  ktree_get_lun_volume_state(dbidx, lun_dbidx, &state->volume);
+  (void)ktree_get_lun_format_state(dbidx, lun_dbidx, &state->format);
+  (void)ktree_get_lun_volume_state(dbidx, lun_dbidx, &state->volume);
   return kOk;
 }
 

@@ -9,14 +9,14 @@
 namespace remvol {
 
 // Writes the target's connect state in one try. Returns 0 or -103.
-int ktree_set_connect_state(int dbidx, int state);
+[[nodiscard]] int ktree_set_connect_state(int dbidx, int state);
 
 // Read one state number into `value`. Return 0; -103 when the key is missing, `value` is then -1 (format,
 // volume and connect state) or 0 (progress).
-int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value);
-int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value);
-int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value);
-int ktree_get_connect_state(int dbidx, int* value);
+[[nodiscard]] int ktree_get_lun_format_state(int dbidx, int lun_dbidx, int* value);
+[[nodiscard]] int ktree_get_lun_format_progress(int dbidx, int lun_dbidx, int* value);
+[[nodiscard]] int ktree_get_lun_volume_state(int dbidx, int lun_dbidx, int* value);
+[[nodiscard]] int ktree_get_connect_state(int dbidx, int* value);
 
 // Writes the LUN's access right. Returns 0; -1 for a right that is neither VOL_AC_RW nor VOL_AC_RO or a dbidx
 // below 1; -103.
@@ -27,31 +27,31 @@ int ktree_get_connect_state(int dbidx, int* value);
 [[nodiscard]] int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx);
 
 // Writes the format state of the entry's LUN. Returns 0 or -103.
-int ktree_update_formatting_state(const TargetEntry* entry, int state);
+[[nodiscard]] int ktree_update_formatting_state(const TargetEntry* entry, int state);
 
 // Returns whether no LUN of the target is being formatted or waits for that, by the stored states.
 [[nodiscard]] bool is_no_lun_formatting(const char* target_name);
 
 // Writes the format progress in percent. Returns 0, -1 for a dbidx below 1, or -103.
-int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent);
+[[nodiscard]] int ktree_update_format_progress(int dbidx, int lun_dbidx, int percent);
 
 // Writes the volume state of the entry's LUN. Returns 0 or -103.
-int ktree_update_volume_state(const TargetEntry* entry, int state);
+[[nodiscard]] int ktree_update_volume_state(const TargetEntry* entry, int state);
 
 // Writes one volume state to every LUN of the entry's target, up to the first empty slot, and leaves the last
 // slot in lun_db_idx. Returns 0, -1 for a null entry or an unknown target, or the first failing result.
-int ktree_update_all_volume_state(TargetEntry* entry, int state);
+[[nodiscard]] int ktree_update_all_volume_state(TargetEntry* entry, int state);
 
 // Records a mount: copies the node and the mount point into the entry and writes both and the file-system
 // type to the tree, in one try each. Returns 0; write failures are ignored.
-int ktree_update_mount_info(TargetEntry* entry, const char* node, const char* mount_point,
-                            const char* fs_type);
+[[nodiscard]] int ktree_update_mount_info(TargetEntry* entry, const char* node, const char* mount_point,
+                                          const char* fs_type);
 
 // Writes the initiator's iSCSI name. Returns 0 or -103.
-int ktree_update_initiator_iqn(const char* name);
+[[nodiscard]] int ktree_update_initiator_iqn(const char* name);
 
 // Stores the entry's conn_set, in one try. Returns 0 or -103.
-int ktree_record_connect_set(const TargetEntry* entry);
+[[nodiscard]] int ktree_record_connect_set(const TargetEntry* entry);
 
 // What is stored of a LUN that its status text is made of.
 struct LunState {

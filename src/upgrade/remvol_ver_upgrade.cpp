@@ -120,7 +120,7 @@ int upgrade_from(int stored, int current) {
     return kOk;
   }
   const int result = version_upgrade_v0_to_v1();
-  if (result == kOk) set_remvol_ver_to_db(current);
+  if (result == kOk) (void)set_remvol_ver_to_db(current);
   return result;
 }
 

@@ -17,7 +17,7 @@ constexpr int kSettingsVersion = 1;  // the layout that this tool reads and writ
 [[nodiscard]] int is_remvol_ver_changed();
 
 // Stores `version`. Returns 0 or -1.
-int set_remvol_ver_to_db(int version);
+[[nodiscard]] int set_remvol_ver_to_db(int version);
 
 // Deletes the flag that a firmware upgrade leaves.
 void delete_fw_flag();
@@ -28,7 +28,7 @@ int version_upgrade_v0_to_v1();
 
 // Converts the settings when their version asks for it. Returns 0, or -1 when the conversion failed or the
 // stored version is newer than this tool's.
-int version_upgrade();
+[[nodiscard]] int version_upgrade();
 
 }  // namespace remvol
 

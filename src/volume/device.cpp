@@ -43,7 +43,7 @@ void make_node(const char* name, const DeviceId& id) {
   struct stat status;
   if (stat(node, &status) == 0) {
     if (S_ISBLK(status.st_mode)) return;
-    _remove_file(node);
+    (void)_remove_file(node);
   }
   errno = 0;
   if (mknod(node, kNodeMode, makedev(id.major, id.minor)) == 0 && errno == 0) return;

@@ -16,7 +16,7 @@ namespace {
 
 int read_progress(const TargetEntry* entry) {
   int progress = 0;
-  ktree_get_lun_format_progress(entry->db_idx, entry->lun_db_idx, &progress);
+  (void)ktree_get_lun_format_progress(entry->db_idx, entry->lun_db_idx, &progress);
   return progress;
 }
 

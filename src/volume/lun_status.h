@@ -10,11 +10,11 @@ namespace remvol {
 // Writes the LUN's status text, its file-system type and its size. `formatting` non-zero: the text shows the
 // stored progress. Returns 0, -1 when a dbidx is below 1, or -103 when a write failed (the following writes
 // still run).
-int ktree_update_lun_status(const TargetEntry* entry, int formatting);
+[[nodiscard]] int ktree_update_lun_status(const TargetEntry* entry, int formatting);
 
 // Writes the status of a LUN whose state was just read, as formatting when the state says so. Returns 0 or
 // -103.
-int ktree_update_lun_status(const TargetEntry* entry, const LunState& state);
+[[nodiscard]] int ktree_update_lun_status(const TargetEntry* entry, const LunState& state);
 
 }  // namespace remvol
 

@@ -229,7 +229,7 @@ MountResult open_to_everybody(const Mounting* volume) {
 }
 
 MountResult record_mount(const Mounting* volume) {
-  ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
+  (void)ktree_update_mount_info(volume->entry, volume->node, volume->mount_point, volume->fs_type);
   const FileSystem* file_system = find_file_system(volume->fs_type);
   if (file_system != nullptr && file_system->grow != nullptr) {
     System("%s", file_system->grow(volume->node).c_str());
@@ -318,7 +318,7 @@ Result Target_mount_all_lun(TargetEntry* entry, int force_format, int update_sha
   LunWalk luns(entry->db_idx, LunWalk::kAtEmpty);
   while (luns.next(&lun)) {
     (void)Target_mount(&lun, force_format, update_share);
-    ktree_update_lun_status(&lun, 0);
+    (void)ktree_update_lun_status(&lun, 0);
   }
   LOG(2, "end");
   return kOk;

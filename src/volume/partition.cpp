@@ -28,15 +28,15 @@ int list_partitions(const char* device, PartitionList& partitions) {
 
 bool create_partition(const TargetEntry* entry, const char* device) {
   LOG(2, "No partitions found on %s, try to create partition...", device);
-  ktree_update_volume_state(entry, kVolumeCreating);
+  (void)ktree_update_volume_state(entry, kVolumeCreating);
   LOG(2, "Creating partition on %s", device);
   const SessionKept kept(entry->target_name);
   if (is_foreign_disk(entry, device) || sys_create_1_partition(device) != 0) {
     LOG(0, "Create partition FAILED");
-    ktree_update_volume_state(entry, kVolumeFailed);
+    (void)ktree_update_volume_state(entry, kVolumeFailed);
     return false;
   }
-  ktree_update_volume_state(entry, kVolumeNormal);
+  (void)ktree_update_volume_state(entry, kVolumeNormal);
   (void)_create_device_node(entry->dev);
   return true;
 }
@@ -46,13 +46,13 @@ bool create_partition(const TargetEntry* entry, const char* device) {
 void expand_partition(const TargetEntry* entry, const char* device) {
   LOG(2, "%s, try to expand partition...", device);
   LOG(2, "Expanding partition on %s", device);
-  ktree_update_volume_state(entry, kVolumeCreating);
+  (void)ktree_update_volume_state(entry, kVolumeCreating);
   const SessionKept kept(entry->target_name);
   if (is_foreign_disk(entry, device) || sys_expand_1_partition(device) != 0) {
     LOG(0, "Expand partition FAILED");
     return;
   }
-  ktree_update_volume_state(entry, kVolumeNormal);
+  (void)ktree_update_volume_state(entry, kVolumeNormal);
   (void)_create_device_node(entry->dev);
 }
 
@@ -116,7 +116,7 @@ MountResult prepare_partitions(const TargetEntry* entry, PartitionList& partitio
   if (!adjust_partitions(entry, device, partitions, force_format)) return kMountNoPartition;
   if (partitions[0] == '\0') {
     LOG(0, "Create partition FAILED");
-    ktree_update_volume_state(entry, kVolumeFailed);
+    (void)ktree_update_volume_state(entry, kVolumeFailed);
     return kMountNoPartition;
   }
   if (check_path_exist(device) != 0 && _create_device_node(entry->dev) != kOk) {

@@ -113,7 +113,7 @@ void umount_luns(int dbidx) {
   LunWalk luns(dbidx, LunWalk::kAtEmpty);
   while (luns.next(&lun)) {
     (void)Target_LUN_umount(&lun);
-    ktree_update_lun_status(&lun, 0);
+    (void)ktree_update_lun_status(&lun, 0);
   }
 }
 

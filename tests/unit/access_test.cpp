@@ -86,9 +86,9 @@ TEST_F(DebugLevel, IsTheStoredNumberOrZero) {
 
 TEST_F(DebugLevel, IsLoggedUnderItsOwnFileName) {
   fakes::tree_set({{"/iscsi/initiator/dbg", "7"}});
-  EXPECT_EQ(fakes::logged(1, [] { dbg_get_remvol_debug_lv(); }),
+  EXPECT_EQ(fakes::logged(1, [] { (void)dbg_get_remvol_debug_lv(); }),
             Texts{"remvol_debug.cpp:dbg_get_remvol_debug_lv: get debug level = 7"});
-  EXPECT_EQ(fakes::logged(0, [] { dbg_get_remvol_debug_lv(); }), Texts{});
+  EXPECT_EQ(fakes::logged(0, [] { (void)dbg_get_remvol_debug_lv(); }), Texts{});
 }
 
 }  // namespace

@@ -253,7 +253,7 @@ TEST_F(Slots, NothingIsWrittenForATargetThatWasDeleted) {
   EXPECT_EQ(ktree_update_lun_vol_access_right(VOL_AC_RO, 3, 1), -103);
   EXPECT_EQ(ktree_record_connect_set(&lun), -103);
   EXPECT_EQ(ktree_update_current_luncnt(3), -103);
-  ktree_update_mount_info(&lun, "/dev/sdb1", "/mnt/VV/s31", "ext4");
+  (void)ktree_update_mount_info(&lun, "/dev/sdb1", "/mnt/VV/s31", "ext4");
   EXPECT_EQ(fakes::tree_dump(), before);
 }
 
