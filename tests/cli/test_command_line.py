@@ -7,6 +7,7 @@ import subprocess
 import pytest
 
 from harness import log_lines, messages
+from harness.initiator import store
 from harness.ktree_daemon import BUILD
 
 USAGE = (
@@ -226,9 +227,7 @@ class TestSecret:
     def test_no_message_and_no_temporary_file_shows_it(self, box, level, secret, command):
         box.default("iscsiadm", status=6)
         box.debug(level)
-        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t", "/iscsi/initiator/id:1/ip": "10.0.0.1",
-                      "/iscsi/initiator/id:1/port": 3260, "/iscsi/initiator/id:1/chap": 1,
-                      "/iscsi/initiator/id:1/chap_name": "u", "/iscsi/initiator/id:1/chap_pwd": secret})
+        store(box, "iqn.t", ip="10.0.0.1", chap=1, chap_name="u", chap_pwd=secret)
         words = ["-n", "iqn.t", "-i", "10.0.0.1", "-p", "3260", "-c", "1", "-U", "u", "-P", secret, f"-P{secret}"]
         done = box.remvol(*command, *words)
         shown = done.stdout + done.stderr
@@ -504,8 +503,7 @@ class TestSuccessOfOtherCommands:
 
     @pytest.mark.parametrize("share,status", [("taken", 1), ("free", 0), ("Taken", 0)])
     def test_check_share_name_gives_its_answer(self, box, share, status):
-        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t", "/iscsi/initiator/id:1/lun/id:1/lun": "0",
-                      "/iscsi/initiator/id:1/lun/id:1/share": "taken"})
+        store(box, "iqn.t", luns=[("taken", 0)])
         done = box.remvol("--check_share_name", "-s", share)
         assert done.status == status
         assert box.tree.get("/result/check_share_name") == str(status)
@@ -517,8 +515,7 @@ class TestFieldSizes:
 
     @pytest.mark.parametrize("length,status", [(126, 0), (127, 1), (128, 255), (5000, 255)])
     def test_a_share_name_holds_127_bytes(self, box, length, status):
-        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t", "/iscsi/initiator/id:1/lun/id:1/lun": "0",
-                      "/iscsi/initiator/id:1/lun/id:1/share": "s" * 127})
+        store(box, "iqn.t", luns=[("s" * 127, 0)])
         assert box.remvol("--check_share_name", "-s", "s" * length).status == status
 
     @pytest.mark.parametrize("option,most", [("n", 255), ("s", 127), ("U", 127), ("P", 127)])

@@ -10,6 +10,7 @@ import xml.etree.ElementTree
 import pytest
 
 from harness.documents import blocks_of
+from harness.initiator import store
 from harness.ktree_daemon import BUILD, Daemon
 from test_vvstat import TREE_PROBLEMS, UNMOUNTED_PROBLEMS, promtool
 
@@ -145,11 +146,9 @@ def test_a_manual_page_has_every_option_of_its_program(program, page):
 
 
 def test_the_monitoring_guide_has_every_metric(box):
-    box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/lun/id:1/lun": "1",
-                  "/iscsi/initiator/id:1/lun/id:1/format_state": "1", "/iscsi/initiator/id:1/lun/id:1/mnt": "/mnt/VV"})
+    store(box, "iqn.t1", conn_set=1, luns=[(None, 1, {"format_state": 1, "mnt": "/mnt/VV"})])
     box.path("/mnt/VV").mkdir(parents=True)
     assert box.run(["/bin/mount", "-t", "tmpfs", "volume", "/mnt/VV"], env={"LD_PRELOAD": None}).status == 0
-    box.tree.set({"/iscsi/initiator/id:1/conn_set": "1", "/iscsi/initiator/id:1/lun/id:1/enable": "1"})
     assert box.run(["remvol-notify"], env={"LD_PRELOAD": None}).status == 0
     told = set(re.findall(r"^# TYPE (\w+)", box.run(["vvstat", "-P"], env={"LD_PRELOAD": None}).stdout, re.M))
     guide = (DOCS / "monitoring.md").read_text()
@@ -222,7 +221,7 @@ def test_the_check_of_the_monitoring_guide(box, wanted, status, line):
     if wanted is None:
         box.tree.stop()
     else:
-        box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/conn_set": wanted})
+        store(box, "iqn.t1", conn_set=wanted)
     done = box.run(["/check_remvol"], env={"LD_PRELOAD": None})
     assert (done.status, done.lines[0].startswith(line)) == (status, True), done.stdout
 

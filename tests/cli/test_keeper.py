@@ -3,6 +3,7 @@
 import signal
 
 import pytest
+from harness.initiator import store
 
 SESSIONS = "/sys/class/iscsi_session"
 
@@ -20,9 +21,7 @@ class Keeper:
         self.daemon = None
 
     def target(self, number, port=1, state=4, wanted=1):
-        self.box.tree.set({f"/iscsi/initiator/id:{number}/{key}": str(value) for key, value in
-                           {"target": f"iqn.t{number}", "ip": "127.0.0.1", "port": port, "conn_state": state,
-                            "conn_set": wanted}.items()})
+        store(self.box, f"iqn.t{number}", slot=number, ip="127.0.0.1", port=port, conn_state=state, conn_set=wanted)
 
     def session(self, number):
         self.box.write(f"{SESSIONS}/session{number}/targetname", f"iqn.t{number}\n")

@@ -6,6 +6,7 @@ import signal
 import pytest
 
 from harness import log_lines, messages
+from harness.initiator import store
 
 
 def texts_of_an_upgrade(box):
@@ -131,8 +132,7 @@ class TestJournal:
         assert (4, "system() of cmd 'insmod /usr/local/modules/driver/libiscsi.ko' failed") in lines
 
     def test_every_line_of_a_message_has_the_priority(self, box):
-        box.tree.set({"/iscsi/initiator/count": "1", "/iscsi/initiator/id:1/target": "iqn.t1",
-                      "/iscsi/initiator/id:1/ip": "10.9.0.2", "/iscsi/initiator/id:1/port": "3260"})
+        store(box, "iqn.t1", ip="10.9.0.2")
         box.unscripted_ok()
         lines = in_a_unit(box, "remvol", "--connect", "-n", "iqn.t1")
         at = lines.index((4, "Can not find target iqn.t1 in session"))

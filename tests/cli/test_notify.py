@@ -10,7 +10,7 @@ import time
 
 import pytest
 
-from test_vvstat import EXAMPLE, T1, T1_NAME, change, example, run, session  # noqa: F401
+from test_vvstat import T1, T1_NAME, change, example, run, session, store_example  # noqa: F401
 
 PACKAGING = pathlib.Path(__file__).resolve().parents[2] / "packaging"
 CONFIG = "/etc/remvol/remvol.conf"
@@ -136,7 +136,7 @@ def test_a_format_between_two_looks(example, journal):  # noqa: F811
 def test_a_first_volume_that_is_made_between_two_looks(example, journal):  # noqa: F811
     example.tree.delete("/iscsi/initiator")
     assert notify(example).status == 0
-    example.tree.set(EXAMPLE)
+    store_example(example)
     run(example, "/bin/umount", "/mnt/VV/Backup")
     example.disk("sdb", 64 << 20)
     run(example, "/sbin/mke2fs", "-q", "-t", "ext4", "/dev/sdb")

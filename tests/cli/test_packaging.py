@@ -7,6 +7,7 @@ import shlex
 
 import pytest
 
+from harness.initiator import store
 from harness.tree import Tree
 
 PACKAGING = pathlib.Path(__file__).resolve().parents[2] / "packaging"
@@ -141,7 +142,7 @@ METRICS = "/var/lib/prometheus/node-exporter"
 def test_metrics_are_written_in_one_step(box):
     box.path(METRICS).mkdir(parents=True)
     box.write(f"{METRICS}/remvol.prom", "old")
-    box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/conn_set": "1"})
+    store(box, "iqn.t1", conn_set=1)
     assert helper(box, "metrics").status == 0
     assert [path.name for path in box.path(METRICS).iterdir()] == ["remvol.prom"]
     file = box.path(f"{METRICS}/remvol.prom")
@@ -343,10 +344,8 @@ class Completion:
 
 @pytest.fixture
 def complete(box):
-    box.tree.set({"/iscsi/initiator/id:1/target": "iqn.t1", "/iscsi/initiator/id:1/ip": "10.9.0.2",
-                  "/iscsi/initiator/id:1/lun/id:1/lun": "3", "/iscsi/initiator/id:1/lun/id:1/share": "Two words",
-                  "/iscsi/initiator/id:2/target": "iqn.t2", "/iscsi/initiator/id:2/lun/id:1/lun": "3",
-                  "/iscsi/initiator/id:2/lun/id:1/share": "q'uote"})
+    store(box, "iqn.t1", ip="10.9.0.2", luns=[("Two words", 3)])
+    store(box, "iqn.t2", slot=2, ip=None, luns=[("q'uote", 3)])
     return Completion(box)
 
 

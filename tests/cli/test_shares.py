@@ -4,6 +4,7 @@ import os
 import time
 
 import pytest
+from harness.initiator import store
 
 SMB_CONF = "/etc/samba/smb.conf"
 SHARES = "/run/remvol/smb-shares.conf"
@@ -36,10 +37,7 @@ class Shares:
     def add(self, name, mounted=True, **keys):
         """Adds a target with one volume to the tree."""
         self.volumes += 1
-        target = f"/iscsi/initiator/id:{self.volumes}"
-        values = {f"{target}/target": f"iqn.t{self.volumes}", f"{target}/lun/id:1/lun": "0",
-                  f"{target}/lun/id:1/share": name, f"{target}/lun/id:1/fs_type": "ext4"}
-        self.box.tree.set({**values, **{f"{target}/lun/id:1/{key}": value for key, value in keys.items()}})
+        store(self.box, f"iqn.t{self.volumes}", slot=self.volumes, luns=[(name, 0, {"fs_type": "ext4", **keys})])
         if mounted:
             self.mount(name)
 

@@ -5,6 +5,7 @@ import signal
 import stat
 
 import pytest
+from harness.initiator import store
 from harness.volumes import drive
 
 RUNS = 20
@@ -96,9 +97,7 @@ def test_a_strangers_semaphore_is_no_hindrance(box):
 
 def test_a_second_lun_is_not_kept_waiting_by_the_first(box):
     """A format that could not write leaves the semaphore to its process, which has the next one to do."""
-    box.tree.set({f"/iscsi/initiator/id:1/{key}": value for key, value in {
-        "target": "iqn.t1", "lun/id:1/lun": 0, "lun/id:1/share": "a", "lun/id:1/dev": "sdb",
-        "lun/id:2/lun": 1, "lun/id:2/share": "b", "lun/id:2/dev": "sdc"}.items()})
+    store(box, "iqn.t1", luns=[("a", 0, {"dev": "sdb"}), ("b", 1, {"dev": "sdc"})])
     for disk in ("sdb", "sdc"):
         box.hook("sys_get_disk_space", f"/dev/{disk}", ret=256 << 20)
         box.hook("sys_get_partition_list", f"/dev/{disk}", ret=1, out=f"{disk}1")

@@ -14,29 +14,13 @@ import jsonschema
 import prometheus_client.parser
 import pytest
 
+from harness.initiator import store
 from harness.terminal import Terminal
 
 SCHEMA = json.loads((pathlib.Path(__file__).resolve().parents[2] / "docs/vvstat.schema.json").read_text())
 T1, T2 = "/iscsi/initiator/id:1", "/iscsi/initiator/id:2"
 T1_NAME = "iqn.2026-01.org.example:t1"
 LONG_NAME = "iqn.2026-01.org.example:a-target-whose-name-has-a-length-as-in-life"
-
-EXAMPLE = {
-    f"{T1}/target": T1_NAME, f"{T1}/ip": "10.9.0.2", f"{T1}/port": "3260",
-    f"{T1}/chap_pwd": "canary-secret", f"{T1}/chap_name": "user",
-    f"{T1}/conn_set": "1", f"{T1}/conn_state": "1", f"{T1}/status": "Connected",
-    f"{T1}/lun/id:1/lun": "0", f"{T1}/lun/id:1/share": "Backup", f"{T1}/lun/id:1/enable": "1",
-    f"{T1}/lun/id:1/vol_access_right": "1", f"{T1}/lun/id:1/status": "Running",
-    f"{T1}/lun/id:1/size": "1/2", f"{T1}/lun/id:1/fs_type": "ext4",
-    f"{T1}/lun/id:1/dev": "sdb", f"{T1}/lun/id:1/mnt": "/mnt/VV/Backup", f"{T1}/lun/id:1/format_state": "0",
-    f"{T1}/lun/id:1/volume_state": "0",
-    f"{T1}/lun/id:2/lun": "1", f"{T1}/lun/id:2/share": "Fotos 日本", f"{T1}/lun/id:2/enable": "1",
-    f"{T1}/lun/id:2/vol_access_right": "1", f"{T1}/lun/id:2/status": "Running", f"{T1}/lun/id:2/size": "0/0",
-    f"{T1}/lun/id:2/fs_type": "ext4", f"{T1}/lun/id:2/dev": "sdc", f"{T1}/lun/id:2/mnt": "/mnt/VV/Fotos 日本",
-    f"{T1}/lun/id:2/format_state": "0", f"{T1}/lun/id:2/volume_state": "0",
-    f"{T2}/target": "iqn.t2", f"{T2}/ip": "[fe80::1]", f"{T2}/port": "3261", f"{T2}/conn_set": "0",
-    f"{T2}/conn_state": "0", f"{T2}/status": "Disconnected",
-}
 
 TABLE = """\
 SHARE        STATUS         USED SIZE USE% LUN PORTAL
@@ -83,11 +67,19 @@ def session(box, number, target, state="LOGGED_IN", address="10.9.0.2"):
     box.write(f"/sys/class/iscsi_connection/connection{number}:0/persistent_address", address + "\n")
 
 
+def store_example(box):
+    idle = {"fs_type": "ext4", "format_state": 0, "volume_state": 0, "status": "Running"}
+    store(box, T1_NAME, conn_set=1, conn_state=1, status="Connected", chap_name="user", chap_pwd="canary-secret",
+          luns=[("Backup", 0, {**idle, "size": "1/2", "dev": "sdb", "mnt": "/mnt/VV/Backup"}),
+                ("Fotos 日本", 1, {**idle, "size": "0/0", "dev": "sdc", "mnt": "/mnt/VV/Fotos 日本"})])
+    store(box, "iqn.t2", slot=2, ip="[fe80::1]", port=3261, conn_set=0, conn_state=0, status="Disconnected")
+
+
 @pytest.fixture
 def example(box):
     """Two volumes of one target, mounted, and a target that nobody wants to be connected."""
     run(box, "/bin/mount", "-t", "tmpfs", "class", "/sys/class")
-    box.tree.set(EXAMPLE)
+    store_example(box)
     session(box, 3, T1_NAME)
     mount(box, "/mnt/VV/Backup")
     mount(box, "/mnt/VV/Fotos 日本")
@@ -758,13 +750,8 @@ def test_names_of_users_break_no_form(example, name, shown):
 
 
 def test_eight_targets_with_eight_volumes(box):
-    values = {}
     for target in range(1, 9):
-        values[f"/iscsi/initiator/id:{target}/target"] = f"iqn.{target}"
-        for lun in range(1, 9):
-            values[f"/iscsi/initiator/id:{target}/lun/id:{lun}/lun"] = str(lun)
-            values[f"/iscsi/initiator/id:{target}/lun/id:{lun}/share"] = f"s{target}{lun}"
-    box.tree.set(values)
+        store(box, f"iqn.{target}", slot=target, luns=[(f"s{target}{lun}", lun) for lun in range(1, 9)])
     assert len(vvstat(box, "-n").lines) == 64
 
 
