@@ -33,7 +33,7 @@ bool make_key(std::string_view path, Key& key) {
   for (const char *from = path.begin(), *end = path.end(); from != end;) {
     const auto* colon = static_cast<const char*>(memchr(from, ':', static_cast<size_t>(end - from)));
     const auto size = static_cast<size_t>((colon == nullptr ? end : colon) - from);
-    if (key.bytes + size > kMaxPathBytes) return false;
+    if (key.bytes + size > kLongestPath) return false;
     memcpy(text + key.bytes, from, size);
     key.bytes += size;
     numbered = numbered && memchr(from, '/', size) == nullptr;
@@ -43,7 +43,7 @@ bool make_key(std::string_view path, Key& key) {
     from = colon + (is_one ? 2 : 1);
     numbered = true;
   }
-  if (key.bytes > kMaxPathBytes) return false;
+  if (key.bytes > kLongestPath) return false;
   key.count = words_for(key.bytes);
   memset(text + key.bytes, 0, key.count * sizeof(Word) - key.bytes);
   key.hash = 0;

@@ -32,8 +32,8 @@ using Word = uint32_t;
 constexpr size_t kBytes = size_t{64} << 20;
 constexpr size_t kWords = kBytes / sizeof(Word);
 
-constexpr size_t kMaxPathBytes = 255;
-constexpr size_t kMaxValueBytes = 255;
+constexpr size_t kLongestPath = 255;
+constexpr size_t kLongestValue = 255;
 
 [[nodiscard]] constexpr size_t words_for(size_t bytes) {
   return (bytes + sizeof(Word) - 1) / sizeof(Word);
@@ -56,7 +56,7 @@ constexpr Word kThisLayout = 1;
 
 // A path as the entries hold it.
 struct Key {
-  Word words[words_for(kMaxPathBytes)];
+  Word words[words_for(kLongestPath)];
   size_t count;
   size_t bytes;
   Word hash;

@@ -17,7 +17,7 @@ using mirror::Key;
 using mirror::Word;
 using mirror::words_for;
 
-constexpr size_t kPathRoom = mirror::kMaxPathBytes;
+constexpr size_t kPathRoom = mirror::kLongestPath;
 constexpr size_t kPiece = 16384;  // words that memory is taken for at once
 constexpr size_t kFewestHeads = 1024;
 constexpr size_t kEntriesAHead = 4;  // on average, before there are more heads
@@ -172,7 +172,7 @@ void MirrorWriter::take_out(const Key& key) {
 void MirrorWriter::put(const Key& key, std::string_view value, size_t spare_words) {
   const size_t head = head_of(words_, key);
   const Entry entry = {used_, words_[head], key.bytes, value.size(), words_for(value.size()) + spare_words};
-  if (value.size() > mirror::kMaxValueBytes || !reserve(used_ + entry.words())) return;
+  if (value.size() > mirror::kLongestValue || !reserve(used_ + entry.words())) return;
   store(entry.place, static_cast<Word>(entry.next));
   store_text(entry.path_place(), {reinterpret_cast<const char*>(key.words), key.bytes});
   store_value(entry, value);
@@ -188,7 +188,7 @@ void MirrorWriter::set(std::string_view path, std::string_view value) {
     const Change change(words_);
     Entry entry = {};
     const bool held = find(key, entry);
-    if (held && value.size() <= mirror::kMaxValueBytes && words_for(value.size()) <= entry.room) {
+    if (held && value.size() <= mirror::kLongestValue && words_for(value.size()) <= entry.room) {
       store_value(entry, value);
     } else {
       take_out(key);

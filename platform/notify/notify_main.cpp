@@ -63,7 +63,7 @@ bool look(const vvstat::Status& status, std::vector<Event>& events) {
   const std::string before = platform::content_of(file);
   History history = vvstat::history_of(before);
   const time_t last_look = time_of(file, fresh, before, history), now = time(nullptr);
-  events = compare(vvstat::assess(status, vvstat::read_facts(status, vvstat::Extent::kHealth)), now,
+  events = compare(vvstat::assess(status, vvstat::read_facts(status, vvstat::Detail::kHealth)), now,
                    last_look, history);
   const std::string text = vvstat::text_of(history);
   // The time is set as well: an empty history is one, and writing nothing leaves the time as it was.

@@ -29,7 +29,7 @@ Look::Look() : Look(platform::TreeListing()) {}
 
 Look::Look(const platform::TreeListing& tree)
     : status_(vvstat::read_status(tree)),
-      rows_(vvstat::assess(status_, vvstat::read_facts(status_, vvstat::Extent::kHealth))) {}
+      rows_(vvstat::assess(status_, vvstat::read_facts(status_, vvstat::Detail::kHealth))) {}
 
 const Row* Look::share(const std::string& name) const {
   return find_row(rows_, [&name](const Row& row) { return row.volume->share == name; });

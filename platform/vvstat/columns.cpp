@@ -53,7 +53,7 @@ struct Column {
   int type;      // in JSON
   bool right;
   std::string (*text)(const Row& row, const Layout& layout);
-  Extent extent = Extent::kHealth;  // of the facts that tell it
+  Detail detail = Detail::kHealth;  // of the facts that tell it
 };
 
 constexpr int kText = SCOLS_JSON_STRING, kNumber = SCOLS_JSON_NUMBER, kFlag = SCOLS_JSON_BOOLEAN;
@@ -111,7 +111,7 @@ constexpr Column kColumns[] = {
        return row.volume != nullptr ? row.volume->mount_point : std::string();
      }},
     {"OPTIONS", "the options that it is mounted with", 12, kText, false,
-     [](const Row& row, const Layout&) { return row.options; }, Extent::kAll},
+     [](const Row& row, const Layout&) { return row.options; }, Detail::kAll},
     {"DEVICE", "name of its disk", 0, kText, false,
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->device : std::string();
@@ -128,7 +128,7 @@ constexpr Column kColumns[] = {
     {"SESSION", "the kernel's word for the session's state", 0, kText, false,
      [](const Row& row, const Layout&) { return row.session; }},
     {"ADDRESS", "the address that the session is connected with", 12, kText, false,
-     [](const Row& row, const Layout&) { return row.address; }, Extent::kAll},
+     [](const Row& row, const Layout&) { return row.address; }, Detail::kAll},
     {"TREE-STATUS", "the volume's status as the configuration tree has it", 14, kText, false,
      [](const Row& row, const Layout&) {
        return row.volume != nullptr ? row.volume->status : std::string();
@@ -170,15 +170,15 @@ std::vector<size_t> first_columns(size_t count) {
 }
 
 // What a column shows of the rows.
-struct Content {
+struct ColumnTexts {
   size_t column;
   std::vector<std::string> cells;  // one of each row
   size_t width;                    // of the widest one, and of the name
 };
 
-Content content_of(const std::vector<Row>& rows, size_t number, const Layout& layout) {
+ColumnTexts texts_of(const std::vector<Row>& rows, size_t number, const Layout& layout) {
   const Column& column = kColumns[number];
-  Content content{number, {}, std::string_view(column.name).size()};
+  ColumnTexts content{number, {}, std::string_view(column.name).size()};
   content.cells.reserve(rows.size());
   for (const Row& row : rows) {
     content.cells.push_back(cell(column, row, layout));
@@ -193,15 +193,15 @@ bool is_steady(size_t column) {
 }
 
 // The cells that a column takes as it is.
-Wish wish_of(const Content& content) {
+Wish wish_of(const ColumnTexts& content) {
   const size_t least = kColumns[content.column].least;
   const size_t natural = is_steady(content.column) ? std::max(content.width, least) : content.width;
   return {least != 0 ? std::min(natural, least) : natural, natural};
 }
 
-size_t natural_width(const std::vector<Content>& contents) {
+size_t natural_width(const std::vector<ColumnTexts>& contents) {
   size_t sum = 0;
-  for (const Content& content : contents) sum += wish_of(content).natural + 1;
+  for (const ColumnTexts& content : contents) sum += wish_of(content).natural + 1;
   return sum == 0 ? 0 : sum - 1;
 }
 
@@ -214,17 +214,17 @@ std::vector<size_t> columns_of_block(const Layout& layout) {
   return layout.columns.empty() ? first_columns(std::size(kColumns)) : layout.columns;
 }
 
-Extent extent_of(const std::vector<size_t>& columns) {
-  const auto needs_all = [](size_t column) { return kColumns[column].extent == Extent::kAll; };
-  return std::any_of(columns.begin(), columns.end(), needs_all) ? Extent::kAll : Extent::kHealth;
+Detail detail_of(const std::vector<size_t>& columns) {
+  const auto needs_all = [](size_t column) { return kColumns[column].detail == Detail::kAll; };
+  return std::any_of(columns.begin(), columns.end(), needs_all) ? Detail::kAll : Detail::kHealth;
 }
 
 // What the report is made of. The target is one of the usual columns of a table where there is room for it.
-std::vector<Content> contents_of(const std::vector<Row>& rows, const Layout& layout) {
-  std::vector<Content> contents;
-  for (const size_t column : columns_of(layout)) contents.push_back(content_of(rows, column, layout));
+std::vector<ColumnTexts> all_texts_of(const std::vector<Row>& rows, const Layout& layout) {
+  std::vector<ColumnTexts> contents;
+  for (const size_t column : columns_of(layout)) contents.push_back(texts_of(rows, column, layout));
   if (layout.form != Form::kTable || !layout.columns.empty()) return contents;
-  contents.push_back(content_of(rows, kTarget, layout));
+  contents.push_back(texts_of(rows, kTarget, layout));
   if (natural_width(contents) > layout.width) contents.pop_back();
   return contents;
 }
@@ -232,16 +232,17 @@ std::vector<Content> contents_of(const std::vector<Row>& rows, const Layout& lay
 // A column in a table. Of the library's own ways to cut a text none is the same in all its versions, so it
 // gets texts that fit.
 struct Place {
-  const Content* content;
+  const ColumnTexts* content;
   size_t width;  // cells; what is longer is cut
 };
 
 constexpr size_t kUncut = SIZE_MAX;
 
 // The order of importance: that of the line, but what was asked for beside the usual ones follows the status.
-std::vector<const Content*> by_importance(const std::vector<Content>& contents, const Layout& layout) {
-  std::vector<const Content*> order;
-  for (const Content& content : contents) order.push_back(&content);
+std::vector<const ColumnTexts*> by_importance(const std::vector<ColumnTexts>& contents,
+                                              const Layout& layout) {
+  std::vector<const ColumnTexts*> order;
+  for (const ColumnTexts& content : contents) order.push_back(&content);
   if (layout.added) {
     std::rotate(order.begin() + kFirst, order.begin() + static_cast<long>(kUsual), order.end());
   }
@@ -258,7 +259,7 @@ std::vector<size_t> widths_of(const std::vector<Wish>& wishes, size_t asked_for,
 }
 
 // A text that is cut says so.
-void cut(Content& content, size_t width) {
+void cut(ColumnTexts& content, size_t width) {
   if (content.width <= width) return;
   for (std::string& text : content.cells) {
     if (platform::cells(text) > width) text = text.substr(0, platform::first_cells(text, width - 1)) + "~";
@@ -266,17 +267,17 @@ void cut(Content& content, size_t width) {
 }
 
 // Cuts the contents to their places.
-std::vector<Place> places_of(std::vector<Content>& contents, const Layout& layout) {
+std::vector<Place> places_of(std::vector<ColumnTexts>& contents, const Layout& layout) {
   std::vector<Place> places;
   if (layout.form != Form::kTable) {
-    for (const Content& content : contents) places.push_back({&content, kUncut});
+    for (const ColumnTexts& content : contents) places.push_back({&content, kUncut});
     return places;
   }
-  const std::vector<const Content*> order = by_importance(contents, layout);
+  const std::vector<const ColumnTexts*> order = by_importance(contents, layout);
   std::vector<Wish> wishes;
-  for (const Content* content : order) wishes.push_back(wish_of(*content));
+  for (const ColumnTexts* content : order) wishes.push_back(wish_of(*content));
   const std::vector<size_t> widths = widths_of(wishes, contents.size() - kUsual, layout);
-  for (Content& content : contents) {
+  for (ColumnTexts& content : contents) {
     const size_t at = static_cast<size_t>(std::find(order.begin(), order.end(), &content) - order.begin());
     if (widths[at] == 0) continue;
     cut(content, widths[at]);
@@ -327,7 +328,7 @@ bool add_row(libscols_table* table, const Row& row, size_t number, const std::ve
 
 platform::ScolsTable table_of(const std::vector<Row>& rows, const Layout& layout) {
   platform::ScolsTable table(scols_new_table());
-  std::vector<Content> contents = contents_of(rows, layout);
+  std::vector<ColumnTexts> contents = all_texts_of(rows, layout);
   const std::vector<Place> places = places_of(contents, layout);
   bool good = table != nullptr && scols_table_set_name(table.get(), "volumes") == 0;
   for (const Place& place : places) good = good && add_column(table.get(), place);
@@ -380,12 +381,12 @@ std::string describe_columns() {
   return text;
 }
 
-Extent extent_of_report(const Layout& layout) {
-  return extent_of(columns_of(layout));
+Detail detail_of_report(const Layout& layout) {
+  return detail_of(columns_of(layout));
 }
 
-Extent extent_of_block(const Layout& layout) {
-  return extent_of(columns_of_block(layout));
+Detail detail_of_block(const Layout& layout) {
+  return detail_of(columns_of_block(layout));
 }
 
 std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {

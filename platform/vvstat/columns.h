@@ -31,8 +31,8 @@ bool choose_columns(std::string_view names, Layout& layout, std::string& unknown
 std::string describe_columns();
 
 // How much of the kernel's facts the report shows, and a block.
-Extent extent_of_report(const Layout& layout);
-Extent extent_of_block(const Layout& layout);
+Detail detail_of_report(const Layout& layout);
+Detail detail_of_block(const Layout& layout);
 
 // The report. A line of a table is never longer than the screen is wide: the columns that matter least are
 // cut first, then left out, PORTAL before LUN, USE%, SIZE, USED and STATUS; a text that is cut ends with "~".

@@ -131,7 +131,7 @@ std::string options_of(const std::string& mount_point, MountTable& mounts) {
   return mount != nullptr ? mount->options : std::string();
 }
 
-VolumeFacts facts_of(const Volume& volume, bool answering, Extent extent, Tables& tables) {
+VolumeFacts facts_of(const Volume& volume, bool answering, Detail detail, Tables& tables) {
   VolumeFacts facts;
   dev_t device{};
   struct statvfs space {};
@@ -147,7 +147,7 @@ VolumeFacts facts_of(const Volume& volume, bool answering, Extent extent, Tables
   facts.disk_read_only = facts.read_only && is_read_only_disk(volume.device);
   facts.size = static_cast<unsigned long long>(space.f_blocks) * space.f_frsize;
   facts.used = static_cast<unsigned long long>(space.f_blocks - space.f_bfree) * space.f_frsize;
-  if (extent == Extent::kAll) facts.options = options_of(volume.mount_point, tables.mounts);
+  if (detail == Detail::kAll) facts.options = options_of(volume.mount_point, tables.mounts);
   return facts;
 }
 
@@ -161,7 +161,7 @@ const Session* session_of(const Target& target, const std::vector<Session>& sess
 
 }  // namespace
 
-std::vector<TargetFacts> read_facts(const Status& status, Extent extent) {
+std::vector<TargetFacts> read_facts(const Status& status, Detail detail) {
   const std::vector<Session> sessions = platform::read_sessions();
   Tables tables;
   std::vector<TargetFacts> all;
@@ -170,12 +170,12 @@ std::vector<TargetFacts> read_facts(const Status& status, Extent extent) {
     const Session* session = session_of(target, sessions);
     if (session != nullptr) {
       facts.session = session->state;
-      if (extent == Extent::kAll) facts.address = platform::address_of(*session);
+      if (detail == Detail::kAll) facts.address = platform::address_of(*session);
     }
     const bool answering = session != nullptr && session->link == Link::kUp;
     facts.volumes.reserve(target.volumes.size());
     for (const Volume& volume : target.volumes) {
-      facts.volumes.push_back(facts_of(volume, answering, extent, tables));
+      facts.volumes.push_back(facts_of(volume, answering, detail, tables));
     }
     all.push_back(std::move(facts));
   }

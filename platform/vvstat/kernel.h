@@ -12,7 +12,7 @@
 namespace vvstat {
 
 // How much is to be known.
-enum class Extent {
+enum class Detail {
   kHealth,
   kAll,  // also what only a long report shows
 };
@@ -26,12 +26,12 @@ struct VolumeFacts {
   unsigned long long size = 0;
   bool shut_down = false;  // its file system refuses everything
   time_t made = 0;         // its file system was; 0: it is not mounted, or does not tell
-  std::string options{};   // of the mount; of Extent::kAll
+  std::string options{};   // of the mount; of Detail::kAll
 };
 
 struct TargetFacts {
   std::string session;  // its state: LOGGED_IN, FAILED, FREE; empty without a session
-  std::string address;  // the portal that it is connected with, without its port; of Extent::kAll
+  std::string address;  // the portal that it is connected with, without its port; of Detail::kAll
   std::vector<VolumeFacts> volumes;  // in the order of the tree
 };
 
@@ -41,7 +41,7 @@ struct TargetFacts {
 // tells whether it refuses writes. For all there is to know, and where a file system has shut itself down,
 // also /proc/self/mountinfo. The facts are in the order of status.targets; what cannot be read counts as not
 // there. Of several sessions of one target the one that is logged in counts.
-std::vector<TargetFacts> read_facts(const Status& status, Extent extent);
+std::vector<TargetFacts> read_facts(const Status& status, Detail detail);
 
 }  // namespace vvstat
 

@@ -35,10 +35,10 @@ struct Snapshot {
   std::vector<Row> rows;
 };
 
-Snapshot look(Extent extent) {
+Snapshot look(Detail detail) {
   Snapshot look;
   look.status = read_status(platform::TreeListing());
-  look.rows = assess(look.status, read_facts(look.status, extent));
+  look.rows = assess(look.status, read_facts(look.status, detail));
   recall(read_history(), look.rows);
   return look;
 }
@@ -96,7 +96,7 @@ size_t width_of_output() {
 }
 
 int show_once(const PageOptions& options) {
-  const Snapshot seen = look(extent_of_report(options.layout));
+  const Snapshot seen = look(detail_of_report(options.layout));
   if (!seen.status.reachable) {
     fputs(why_unreachable(), stderr);
     return kUnreachable;
@@ -110,7 +110,7 @@ int show_once(const PageOptions& options) {
 // For a collector of metrics the absence of the tree is news as well. What keeps it from being read is said
 // only where that is the user.
 int show_metrics() {
-  const Snapshot seen = look(Extent::kHealth);
+  const Snapshot seen = look(Detail::kHealth);
   if (!seen.status.reachable && geteuid() != 0) fputs(why_unreachable(), stderr);
   put(metrics(seen.status.reachable, seen.rows, time(nullptr)));
   return finish(exit_status(seen));
@@ -119,7 +119,7 @@ int show_metrics() {
 // Everything of the volume of that share, or of all volumes of that target.
 int show_one(const PageOptions& options) {
   const bool is_block = options.layout.form == Form::kTable;
-  const Snapshot seen = look(is_block ? extent_of_block(options.layout) : extent_of_report(options.layout));
+  const Snapshot seen = look(is_block ? detail_of_block(options.layout) : detail_of_report(options.layout));
   if (!seen.status.reachable) {
     fputs(why_unreachable(), stderr);
     return kUnreachable;
@@ -150,7 +150,7 @@ int show_again(PageOptions options) {
   Snapshot last;
   watch([&options, &last](size_t width) {
     if (width != 0) options.layout.width = width;
-    last = look(extent_of_report(options.layout));
+    last = look(detail_of_report(options.layout));
     return page_of(last, options);
   });
   return finish(exit_status(last));

@@ -351,7 +351,7 @@ TEST_F(MirrorTest, AgreesWithTheTree) {
     const std::string answer = read(asked);
     const std::optional<std::string> value = get(tree_, asked);
     if (answer == kNotThere) {
-      EXPECT_TRUE(!value || value->size() > mirror::kMaxValueBytes) << asked;
+      EXPECT_TRUE(!value || value->size() > mirror::kLongestValue) << asked;
     } else {
       answered++;
       ASSERT_EQ(answer, value) << asked;

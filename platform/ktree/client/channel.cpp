@@ -309,7 +309,7 @@ bool get_from_mirror(const Channel& channel, Call& call) {
 
 // To set the value that is there already changes nothing that anybody could see.
 bool is_in_mirror(const Channel& channel, const Call& call) {
-  char value[mirror::kMaxValueBytes];
+  char value[mirror::kLongestValue];
   if (channel.mirror == nullptr || call.value.size() > sizeof value) return false;
   const int size = mirror::read(channel.mirror, call.path, value, sizeof value);
   return size >= 0 && call.value == std::string_view(value, static_cast<size_t>(size)) && is_alive(channel);
