@@ -59,6 +59,7 @@ unmount() {
   mountpoint -q /mnt/VV/Data
   while pgrep -x resize2fs >/dev/null; do sleep 0.01; done
   umount /mnt/VV/Data
+  chattr -i /mnt/VV/Data 2>/dev/null || :  # the tool makes the folder below a volume immutable
   rmdir /mnt/VV/Data
   sync "${disk}p1"
 }
