@@ -24,7 +24,7 @@ constexpr size_t kEntriesAHead = 4;  // on average, before there are more heads
 constexpr size_t kSpareWords = 4;    // a value that has grown may grow again
 
 // Puts an element behind `length` bytes of `path`. Returns the new length, or 0 when it gets too long.
-size_t append_element(char* path, size_t length, std::string_view name, unsigned number) {
+size_t spell_element(char* path, size_t length, std::string_view name, unsigned number) {
   const size_t name_end = length + 1 + name.size();
   const size_t end = name_end + number_length(number);
   if (end > kPathRoom) return 0;
@@ -36,13 +36,13 @@ size_t append_element(char* path, size_t length, std::string_view name, unsigned
   return end;
 }
 
-// The shortest spelling of the first `depth` elements, the end of the path `number` instead of its own.
-// Returns its length, 0 when it is too long.
+// The shortest spelling of `path`, with `number` for that of its last element. Returns its length, 0 when it
+// is too long.
 size_t spell(const Path& path, unsigned number, char* text) {
   size_t length = 0;
   for (size_t i = 0; i < path.depth; i++) {
     const Element& element = path.elements[i];
-    length = append_element(text, length, element.name(), i + 1 == path.depth ? number : element.number);
+    length = spell_element(text, length, element.name(), i + 1 == path.depth ? number : element.number);
     if (length == 0) return 0;
   }
   return length;
@@ -70,7 +70,7 @@ void for_later_siblings(const Tree& tree, const Path& path, Visit visit) {
 template <typename Visit>
 void for_each_spelled_child(const Node& node, char* path, size_t length, Visit visit) {
   for_each_child(node, [&](const Node& child, unsigned number) {
-    const size_t longer = append_element(path, length, child.group->name, number);
+    const size_t longer = spell_element(path, length, child.group->name, number);
     if (longer != 0) visit(child, longer);
   });
 }
