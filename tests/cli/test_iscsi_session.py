@@ -360,10 +360,11 @@ def test_only_small_luns_give_neither_list_nor_result(box):
     assert published(box) == ["err_code=0"]
 
 
-def test_a_lun_of_five_terabytes(box):
+@pytest.mark.parametrize("size", [5 << 40, 20 << 40])
+def test_a_lun_of_many_tebibytes(box, size):
     show(box, plain=session(T1), detailed=HEADER + block(T1, {1: "sdb"}))
-    disk_sizes(box, sdb=5 << 40)
-    assert lun_line(1, 5 << 40, "unknown") in search_lun(box).stdout
+    disk_sizes(box, sdb=size)
+    assert lun_line(1, size, "unknown") in search_lun(box).stdout
 
 
 def test_the_wait_ends_with_the_first_usable_lun(box):

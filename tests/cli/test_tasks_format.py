@@ -184,6 +184,13 @@ class TestModify:
         )
         assert volume.mounted("data")
 
+    def test_a_lun_that_is_deleted_while_it_is_mounted_is_unmounted(self, volume, box):
+        box.hook("system", 'mount -t ext4 /dev/sdb1 "/mnt/VV/data"', through=True, times=1,
+                 effect="ktreec -S /var/run/ktree_sock_vv -d /iscsi/initiator/id:1/lun/id:1")
+        self.modify(box, "-c", "0")
+        assert volume.lun("share") is None
+        assert not volume.mounted("data")
+
     def test_a_disconnected_target_stays_so(self, disconnected, box):
         assert self.modify(box, "-c", "1", "-U", "user", "-P", "secret").status == 0
         assert [disconnected.target(key) for key in ("chap", "chap_name", "chap_pwd", "conn_set", "status")] == [

@@ -1,4 +1,5 @@
-// What the listings of iscsiadm say: on samples of both systems, and on what no system should print.
+// What the listings of iscsiadm say: on samples of the older system, on those recorded on each release of
+// Debian, and on what no system should print.
 #include <gtest/gtest.h>
 
 #include <cstring>
@@ -24,6 +25,17 @@ std::string sample(const std::string& name) {
   text << file.rdbuf();
   return text.str();
 }
+
+// What is recorded on each release.
+class Recorded : public testing::TestWithParam<const char*> {
+ protected:
+  static std::string recorded(const std::string& name) {
+    return sample(std::string(GetParam()) + "/" + name);
+  }
+};
+
+INSTANTIATE_TEST_SUITE_P(Debian, Recorded, testing::Values("bookworm", "trixie"),
+                         [](const auto& release) { return std::string(release.param); });
 
 // The text in the pieces that fgets would give.
 Texts pieces(const std::string& text) {
@@ -106,42 +118,42 @@ TEST(DetailedListing, LunsWithoutDiskHideNeitherTheNextLunNorTheNextTarget) {
   EXPECT_EQ(usable_luns(text, kT10), (Texts{"5:1 sdc", "5:2 sdd"}));
 }
 
-TEST(DetailedListing, TwelveLunsInTheOrderOfTheirText) {
-  EXPECT_EQ(usable_luns(sample("two-targets-session-P3.out"), kT1),
+TEST_P(Recorded, TwelveLunsInTheOrderOfTheirText) {
+  EXPECT_EQ(usable_luns(recorded("two-targets-session-P3.out"), kT1),
             (Texts{lun(1, 1, "sda"), lun(1, 10, "sdj"), lun(1, 11, "sdk"), lun(1, 12, "sdl"),
                    lun(1, 2, "sdb"), lun(1, 3, "sdc"), lun(1, 4, "sdd"), lun(1, 5, "sde"), lun(1, 6, "sdf"),
                    lun(1, 7, "sdg"), lun(1, 8, "sdh"), lun(1, 9, "sdi")}));
 }
 
 // Its only line is directly followed by the line of the next target.
-TEST(DetailedListing, TargetWithAControllerAloneHasNoLun) {
+TEST_P(Recorded, TargetWithAControllerAloneHasNoLun) {
   for (const char* name : {"controller-only", "two-targets", "four-targets", "two-interfaces"}) {
-    const std::string text = sample(std::string(name) + "-session-P3.out");
+    const std::string text = recorded(std::string(name) + "-session-P3.out");
     EXPECT_EQ(usable_luns(text, "iqn.2026-01.org.example:controller-only"), Texts{}) << name;
   }
 }
 
-TEST(DetailedListing, NamesThatBeginAlike) {
-  const std::string text = sample("four-targets-session-P3.out");
+TEST_P(Recorded, NamesThatBeginAlike) {
+  const std::string text = recorded("four-targets-session-P3.out");
   EXPECT_EQ(usable_luns(text, kT1).size(), 12u);
   EXPECT_EQ(usable_luns(text, kT10), (Texts{lun(2, 1, "sdm"), lun(2, 2, "sdn")}));
   EXPECT_EQ(usable_luns(text, "iqn.2026-01.org.example:t1-x"), (Texts{lun(3, 1, "sdo")}));
 }
 
-TEST(DetailedListing, AllSessionsOfATargetCount) {
+TEST_P(Recorded, AllSessionsOfATargetCount) {
   EXPECT_EQ(
-      usable_luns(sample("two-interfaces-session-P3.out"), kT10),
+      usable_luns(recorded("two-interfaces-session-P3.out"), kT10),
       (Texts{lun(2, 1, "sdm"), lun(2, 2, "sdn"), lun(3, 1, "sdo"), lun(3, 2, "sdp"), lun(4, 1, "sdq"),
              lun(4, 2, "sdr"), lun(5, 1, "sds"), lun(5, 2, "sdt"), lun(6, 1, "sdu"), lun(6, 2, "sdv")}));
 }
 
-TEST(DetailedListing, LostSessionsShowNoLun) {
+TEST_P(Recorded, LostSessionsShowNoLun) {
   for (const char* name : {"cable-cut", "cable-cut-given-up", "target-killed"}) {
-    const std::string text = sample(std::string(name) + "-session-P3.out");
+    const std::string text = recorded(std::string(name) + "-session-P3.out");
     EXPECT_EQ(usable_luns(text, kT1), Texts{}) << name;
     EXPECT_EQ(usable_luns(text, kT1, kDeviceListing), Texts{}) << name;
   }
-  EXPECT_EQ(usable_luns(sample("cable-back-session-P3.out"), kT1).size(), 12u);
+  EXPECT_EQ(usable_luns(recorded("cable-back-session-P3.out"), kT1).size(), 12u);
 }
 
 TEST(DetailedListing, DisksOfTheNextTargetAreNeverTaken) {
@@ -204,8 +216,8 @@ TEST(DetailedListing, HostAndLunAreReported) {
 }
 
 TEST(DetailedListing, CutAnywhereGivesTheFirstLunsAndNeverAnother) {
-  for (const char* name :
-       {"written-older-P3.txt", "written-controllers-P3.txt", "four-targets-session-P3.out"}) {
+  for (const char* name : {"written-older-P3.txt", "written-controllers-P3.txt",
+                           "bookworm/four-targets-session-P3.out", "trixie/four-targets-session-P3.out"}) {
     const std::string text = sample(name);
     const Texts all = usable_luns(text, kT1);
     for (size_t length = 0; length <= text.size(); length++) {
@@ -261,8 +273,8 @@ TEST(PlainListing, OlderSystem) {
   EXPECT_TRUE(shows(text, "iqn.2026-01.org.example:t3"));
 }
 
-TEST(PlainListing, CurrentSystem) {
-  const std::string text = sample("four-targets-session.out");
+TEST_P(Recorded, PlainListing) {
+  const std::string text = recorded("four-targets-session.out");
   EXPECT_TRUE(shows(text, kT1));
   EXPECT_TRUE(shows(text, kT10));
   EXPECT_TRUE(shows(text, "iqn.2026-01.org.example:controller"));
@@ -302,7 +314,7 @@ TEST(Discovery, LongNamesAreCut) {
   EXPECT_EQ(discovered("p " + doubled), (std::string(400, 'n') + doubled).substr(0, kListingLineSize - 1));
 }
 
-TEST(Discovery, CurrentSystem) {
+TEST_P(Recorded, Discovery) {
   const std::pair<const char*, const char*> kSamples[] = {
       {"discovery-iface0.out", "10.9.0.2"},
       {"discovery-ipv6-iface0.out", "[fd00:9::2]"},
@@ -310,7 +322,7 @@ TEST(Discovery, CurrentSystem) {
   };
   for (const auto& [file, address] : kSamples) {
     Texts names;
-    for (const std::string& line : pieces(sample(file))) {
+    for (const std::string& line : pieces(recorded(file))) {
       EXPECT_TRUE(is_discovery_line_of(line.c_str(), address)) << line;
       names.push_back(discovered(line).substr(strlen("iqn.2026-01.org.example:")));
     }
