@@ -93,9 +93,11 @@ def settings(short):
             load(wide(count))
             file = WORK / "settings.xml"
             output(program("ktreec"), "-S", SOCKET, "-D", file)
-            (dump, reload, lint), _ = in_turn(
-                rounds, [program("ktreec"), "-S", SOCKET, "-D", WORK / "dump.xml"],
-                [program("ktreec"), "-S", SOCKET, "-l", file], ["xmllint", "--noout", file])
+            dumped = WORK / "dump.xml"
+            (dump, reload, lint, _), _ = in_turn(
+                rounds, [program("ktreec"), "-S", SOCKET, "-D", dumped],
+                [program("ktreec"), "-S", SOCKET, "-l", file], ["xmllint", "--noout", file],
+                ["truncate", "--size=-1", dumped])  # a file that is as it should be would stay
             megabytes = file.stat().st_size / 1e6
             for name, times in (("dump", dump), ("load", reload)):
                 points[name].append((megabytes, statistics.median(times) / 1000, statistics.median(lint) / 1000))

@@ -96,7 +96,7 @@ double replies_a_second(std::vector<Client>& clients, std::chrono::milliseconds 
   const int poll = epoll_create1(EPOLL_CLOEXEC);
   for (size_t i = 0; i < clients.size(); i++) {
     epoll_event event = {EPOLLIN, {}};
-    event.data.u64 = i;
+    event.data.u32 = static_cast<uint32_t>(i);
     if (epoll_ctl(poll, EPOLL_CTL_ADD, clients[i].fd(), &event) != 0) fail("epoll_ctl");
     clients[i].ask();
   }
@@ -106,7 +106,7 @@ double replies_a_second(std::vector<Client>& clients, std::chrono::milliseconds 
     epoll_event events[64];
     const int count = epoll_wait(poll, events, 64, -1);
     for (int i = 0; i < count; i++) {
-      Client& client = clients[events[i].data.u64];
+      Client& client = clients[events[i].data.u32];
       if (!client.take()) continue;
       client.ask();
       replies++;

@@ -17,7 +17,8 @@ namespace {
 
 constexpr int kLockTries = 50;  // 100 ms apart: a starting daemon holds the lock for much less than 5 s
 constexpr long kLockPause = 100000000;
-constexpr int kNoLock = -2;  // what was there is removed
+constexpr int kNoLock = -2;      // what was there is removed
+constexpr char kNew[] = ".new";  // behind the name of a file that is not ready
 
 std::string folder_of(const std::string& path) {
   size_t slash = path.rfind('/');
@@ -115,9 +116,9 @@ bool Endpoint::open(const std::string& socket_path, const std::string& name, std
 
 bool Endpoint::open_locked(const std::string& socket_path, const std::string& name, std::string& error) {
   if (!make_free(socket_path, error)) return false;
-  pid_.name = name_of(socket_path) + "_" + name + ".pid";
-  if (!write_pid()) {
-    error = system_error(folder_of(socket_path) + "/" + pid_.name);
+  const std::string pid_name = name_of(socket_path) + "_" + name + ".pid";
+  if (!write_pid(pid_name)) {
+    error = system_error(folder_of(socket_path) + "/" + pid_name);
     return false;
   }
   if (!listen_on(socket_path)) {
@@ -150,41 +151,45 @@ bool Endpoint::make_free(const std::string& socket_path, std::string& error) con
   return true;
 }
 
+// Under another name first: whoever sees the socket finds it answered.
 bool Endpoint::listen_on(const std::string& socket_path) {
+  const std::string name = name_of(socket_path);
+  const std::string temporary = name + kNew;
   sockaddr_un address = {};
-  if (!socket_address(socket_path, address)) return false;
+  if (!socket_address(socket_path + kNew, address)) return false;
   listener_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
   if (listener_ < 0) return false;
+  unlinkat(folder_, temporary.c_str(), 0);
   // The mask makes the socket private from its first moment; a chmod after the bind would leave a gap.
   const mode_t mask = umask(0177);
   const int bound = bind(listener_, reinterpret_cast<const sockaddr*>(&address), sizeof address);
   umask(mask);
-  return bound == 0 && remember(socket_, name_of(socket_path)) && listen(listener_, SOMAXCONN) == 0;
+  return bound == 0 && remember(socket_, temporary) && listen(listener_, SOMAXCONN) == 0 &&
+         give_name(socket_, name);
 }
 
 // Writes the number into a file of another name first: whoever sees the pid file finds a whole number in it.
 // The file stays open, or a successor's could get the number of its inode.
-bool Endpoint::write_pid() {
+bool Endpoint::write_pid(const std::string& name) {
   char text[24];
   const int length = snprintf(text, sizeof text, "%ld\n", static_cast<long>(getpid()));
-  const std::string temporary = pid_.name + ".new";
+  const std::string temporary = name + kNew;
   unlinkat(folder_, temporary.c_str(), 0);
   pid_file_ = openat(folder_, temporary.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600);
-  if (pid_file_ < 0) return false;
-  const bool written = write(pid_file_, text, static_cast<size_t>(length)) == length;
-  if (written && renameat(folder_, temporary.c_str(), folder_, pid_.name.c_str()) == 0) {
-    return remember(pid_, pid_.name);
-  }
-  const int reason = errno;
-  unlinkat(folder_, temporary.c_str(), 0);
-  errno = reason;
-  return false;
+  return pid_file_ >= 0 && remember(pid_, temporary) &&
+         write(pid_file_, text, static_cast<size_t>(length)) == length && give_name(pid_, name);
 }
 
 bool Endpoint::remember(OwnFile& file, const std::string& name) const {
   struct stat info = {};
   if (fstatat(folder_, name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) return false;
   file = {name, info.st_dev, info.st_ino};
+  return true;
+}
+
+bool Endpoint::give_name(OwnFile& file, const std::string& name) const {
+  if (renameat(folder_, file.name.c_str(), folder_, name.c_str()) != 0) return false;
+  file.name = name;
   return true;
 }
 

@@ -16,10 +16,10 @@ class Endpoint {
   Endpoint& operator=(const Endpoint&) = delete;
   ~Endpoint();
 
-  // Makes the pid file SOCKET_NAME.pid and listens on `socket_path` (mode 0600). A socket file that a dead
-  // daemon left is replaced; when a daemon answers on it, or it is no socket, nothing is touched. Two daemons
-  // that start at the same time keep out of each other's way by the lock file SOCKET.lock. Returns false with
-  // a message in `error`.
+  // Makes the pid file SOCKET_NAME.pid and listens on `socket_path` (mode 0600), of at most 103 bytes. Both
+  // get their names when they are ready. A socket file that a dead daemon left is replaced; when a daemon
+  // answers on it, or it is no socket, nothing is touched. Two daemons that start at the same time keep out
+  // of each other's way by the lock file SOCKET.lock. Returns false with a message in `error`.
   [[nodiscard]] bool open(const std::string& socket_path, const std::string& name, std::string& error);
 
   [[nodiscard]] int listener() const { return listener_; }
@@ -34,8 +34,9 @@ class Endpoint {
 
   [[nodiscard]] bool make_free(const std::string& socket_path, std::string& error) const;
   [[nodiscard]] bool listen_on(const std::string& socket_path);
-  [[nodiscard]] bool write_pid();
+  [[nodiscard]] bool write_pid(const std::string& name);
   [[nodiscard]] bool remember(OwnFile& file, const std::string& name) const;
+  [[nodiscard]] bool give_name(OwnFile& file, const std::string& name) const;
   void remove(const OwnFile& file) const;
   [[nodiscard]] int open_lock(const std::string& name) const;
   [[nodiscard]] bool take_lock(const std::string& name, int& lock) const;

@@ -98,8 +98,8 @@ void limit_process() {
 size_t client_limit() {
   rlimit files = {};
   if (getrlimit(RLIMIT_NOFILE, &files) != 0) return 1;
-  const size_t limit = std::max<size_t>(files.rlim_cur, kOwnDescriptors + 2);
-  return std::min((limit - kOwnDescriptors) / 2, kMaxClients);
+  const rlim_t limit = std::max<rlim_t>(files.rlim_cur, kOwnDescriptors + 2);
+  return static_cast<size_t>(std::min<rlim_t>((limit - kOwnDescriptors) / 2, kMaxClients));
 }
 
 // SIGTERM and SIGINT as a descriptor. A file that may not get so large (RLIMIT_FSIZE counts memory files,

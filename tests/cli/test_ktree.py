@@ -243,6 +243,31 @@ def test_nobody_gets_an_answer_before_the_settings_are_loaded(place):
     place.process.wait(20)
 
 
+def test_whoever_sees_the_socket_is_answered(place):
+    place.process = subprocess.Popen(["strace", "-f", "-o", "/dev/null", "-e", "inject=listen:delay_enter=500000",
+                                      KTREE, "-n", "config", "-s", place.socket], env=TRACED)
+    until(place.socket.exists)
+    assert place.run("-t").returncode == 0
+    os.kill(place.pid(), signal.SIGTERM)
+    place.process.wait(20)
+    assert os.listdir(place.folder) == []
+
+
+@pytest.mark.parametrize("fault", ["listen:error=EADDRINUSE", "renameat:error=EIO:when=1", "renameat:error=EIO:when=2"])
+def test_a_start_that_fails_leaves_no_file(place, fault):
+    done = subprocess.run(["strace", "-o", "/dev/null", "-e", f"inject={fault}", KTREE, "-n", "config", "-s", place.socket],
+                          env=TRACED, capture_output=True, timeout=60)
+    assert done.returncode == 1
+    assert os.listdir(place.folder) == []
+
+
+def test_what_a_killed_start_left_is_no_hindrance(place):
+    (place.folder / "sock.new").touch()
+    (place.folder / "sock_config.pid.new").touch()
+    place.start()
+    assert sorted(os.listdir(place.folder)) == ["sock", "sock_config.pid"]
+
+
 def test_the_service_manager_is_told_when_it_answers(place):
     with socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as manager:
         manager.bind(str(place.folder / "notify"))
@@ -621,6 +646,68 @@ def test_a_dump_is_on_the_disk_before_it_gets_the_name_and_the_folder_after_it(d
     log.unlink()
     assert [line.split("(")[0] for line in lines[:3]] == ["fsync", "rename", "fsync"]
     assert ".tmp>" in lines[0] and f"{daemon.folder}>" in lines[2]
+
+
+def test_a_dump_that_changes_nothing_writes_nothing_and_is_on_the_disk(daemon):
+    daemon.set("/a", "x" * 40000)
+    file = daemon.folder / "vv.xml"
+    assert daemon.run("-D", file).returncode == 0
+    before = file.stat()
+    log = daemon.folder.parent / f"{daemon.folder.name}.log"
+    run("strace", "-y", "-o", log, "-e", "trace=fsync,rename,write", KTREEC, "-S", daemon.socket, "-D", file, env=TRACED,
+        check=True)
+    lines = [line for line in log.read_text().splitlines() if not line.startswith("+++")]
+    log.unlink()
+    assert [line.split("(")[0] for line in lines] == ["fsync", "fsync"]
+    assert f"{file}>" in lines[0] and f"{daemon.folder}>" in lines[1]
+    after = file.stat()
+    assert (after.st_ino, after.st_ctime_ns) == (before.st_ino, before.st_ctime_ns)
+
+
+def another_text(file):
+    data = file.read_bytes()
+    file.write_bytes(data.replace(b"x</a>", b"y</a>"))
+
+
+def another_length(file):
+    with file.open("ab") as end:
+        end.write(b"\n")
+
+
+def another_name(file):
+    file.with_name("second").hardlink_to(file)
+
+
+def behind_a_link(file):
+    file.rename(file.with_name("target"))
+    file.symlink_to("target")
+
+
+@pytest.mark.parametrize("change", [another_text, another_length, another_name, behind_a_link, os.unlink,
+                                    lambda file: file.chmod(0o640), lambda file: os.chown(file, 1, 1)],
+                         ids=["text", "length", "name", "link", "gone", "mode", "owner"])
+def test_a_dump_replaces_what_is_not_its_own_work_any_more(daemon, change):
+    daemon.set("/a", "x" * 40000)
+    file = daemon.folder / "vv.xml"
+    assert daemon.run("-D", file).returncode == 0
+    with file.open() as keep:  # nobody gets its number
+        before = os.stat(keep.fileno()).st_ino
+        change(file)
+        assert daemon.run("-D", file).returncode == 0
+    info = file.lstat()
+    assert info.st_ino != before and stat.S_IMODE(info.st_mode) == 0o600 and info.st_uid == os.geteuid()
+    assert stat.S_ISREG(info.st_mode) and info.st_nlink == 1
+    assert file.read_bytes() == daemon.run("-D", "-").stdout
+
+
+def test_a_file_that_its_disk_does_not_take_is_written_anew(daemon):
+    daemon.set("/a", "x")
+    file = daemon.folder / "vv.xml"
+    assert daemon.run("-D", file).returncode == 0
+    with file.open() as keep:
+        before = os.stat(keep.fileno()).st_ino
+        assert traced_dump(daemon, file, "fsync:error=EIO:when=1").returncode == 0
+        assert file.stat().st_ino != before
 
 
 def test_what_no_dump_takes_the_place_of(daemon):

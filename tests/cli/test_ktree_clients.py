@@ -419,6 +419,7 @@ def test_a_request_that_follows_one_with_a_file_ends_the_connection(daemon):
     assert daemon.listing() == []
 
 
+@pytest.mark.native
 def test_other_files_are_refused_and_closed(daemon, tmp_path):
     client = daemon.connect()
     reader, writer = os.pipe()
@@ -438,6 +439,7 @@ def test_other_files_are_refused_and_closed(daemon, tmp_path):
     assert open_descriptors(daemon) == before
 
 
+@pytest.mark.native
 def test_the_file_of_a_request_that_never_ends_goes_with_its_client(daemon):
     before = open_descriptors(daemon)
     for _ in range(20):
@@ -464,6 +466,7 @@ def test_a_large_document_is_loaded_and_the_memory_given_back(daemon):
 
 
 @pytest.mark.unsanitized
+@pytest.mark.native
 def test_the_full_tree_is_small(daemon):
     """Eight targets and eight LUNs stay under 4 MB; the sanitizers' shadow is not the daemon's."""
     for target in range(1, 9):

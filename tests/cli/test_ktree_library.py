@@ -171,6 +171,7 @@ def test_a_missing_daemon_is_an_error_at_once():
 
 
 @pytest.mark.unsanitized  # a sanitizer brings its own
+@pytest.mark.native
 def test_the_library_needs_nothing_but_the_c_library():
     library = BUILD / "lib/libktreec.so"
     needed = subprocess.run(["readelf", "-d", library], capture_output=True, text=True, check=True).stdout

@@ -170,6 +170,27 @@ def test_settings_that_are_lost_come_from_the_flash(bare_box, saved):
         assert kept.stat().st_mode & 0o777 == 0o600
 
 
+@pytest.mark.parametrize("saved", [settings("saved"), ""])
+def test_a_tree_that_a_killed_start_left_empty_is_loaded(box, saved):
+    appliance(box)
+    box.write(SAVED, saved)
+    box.write(COPY, settings("copy"))
+    assert box.tree.get("/x") is None
+    init(box)
+    assert START_TREE[0] not in box.trace()
+    assert prefix(box) == ("saved" if saved else "copy")
+
+
+def test_a_tree_that_cannot_be_read_is_not_loaded_again(box):
+    appliance(box)
+    box.write(SAVED, settings("saved"))
+    box.tree.set({"/iscsi/initiator/ver": "1", "/iscsi/initiator/prefix": "newer"})
+    for key in ("ver", "count"):
+        box.hook("ktreec_get_wb", f"/iscsi/initiator/{key}", ret=-1)
+    init(box)
+    assert prefix(box) == "newer"
+
+
 @pytest.mark.parametrize("source", [SAVED, COPY])
 def test_what_was_read_of_the_slots_before_settings_are_loaded_is_believed_no_more(bare_box, source):
     box = bare_box
@@ -182,6 +203,20 @@ def test_what_was_read_of_the_slots_before_settings_are_loaded_is_believed_no_mo
     assert prefix(box) == "saved"
     assert box.path("/root/held").exists()
     assert int(box.path("/root/moves").read_text()) >= 1
+
+
+@pytest.mark.parametrize("source", [SAVED, COPY])
+@pytest.mark.parametrize("status", [-1, 9, 127 << 8])
+def test_a_command_that_could_not_load_the_settings_is_run_again(bare_box, source, status):
+    """The tree would count as fresh, and be dumped over them."""
+    box = bare_box
+    appliance(box)
+    box.path("/etc/NAS_CFG").mkdir()
+    box.write(source, settings("saved"))
+    box.hook("system", f"ktreec -S /var/run/ktree_sock_vv -l {source}", ret=status, times=1)
+    init(box)
+    assert prefix(box) == "saved"
+    assert box.trace("system", "sleep").count("sleep 1") >= 1
 
 
 def test_damaged_settings_without_a_copy_are_kept(bare_box):

@@ -95,7 +95,6 @@ class Replacement {
   // Makes it in the folder of `file`. Returns 0 or an errno value. The name holds the process and thread, so
   // what is there already was left by one that died.
   int create(const char* file) {
-    remove_left_overs_of(file);
     const int length =
         snprintf(path_, sizeof path_, "%s.%ld%s", file, static_cast<long>(gettid()), kTemporaryEnd);
     if (length < 0 || static_cast<size_t>(length) >= sizeof path_) {
@@ -154,6 +153,28 @@ class Replacement {
   char path_[PATH_MAX] = "";
 };
 
+// Whether both hold the same bytes.
+bool is_same(int one, int other) {
+  char left[16384];
+  char right[sizeof left];
+  for (off_t offset = 0;;) {
+    const ssize_t n = pread(one, left, sizeof left, offset);
+    if (n < 0 || pread(other, right, sizeof right, offset) != n) return false;
+    if (n == 0) return true;
+    if (memcmp(left, right, static_cast<size_t>(n)) != 0) return false;
+    offset += n;
+  }
+}
+
+// Whether `file` is on its disk as a replacement that holds `document` would be.
+bool is_there_already(const char* file, int document) {
+  const platform::Fd fd(open(file, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  struct stat info = {};
+  return fd.ok() && fstat(fd.get(), &info) == 0 && info.st_mode == (S_IFREG | 0600) &&
+         info.st_uid == geteuid() && info.st_nlink == 1 && is_same(fd.get(), document) &&
+         fsync(fd.get()) == 0;
+}
+
 // A rename is on the disk when its folder is.
 int sync_folder_of(const char* file) {
   const int fd = open_folder_of(file);
@@ -200,6 +221,8 @@ int MemoryFile::write_to(int fd) const {
 int MemoryFile::replace_file(const char* file) const {
   int wrong = check_replaceable(file);
   if (wrong != 0) return wrong;
+  remove_left_overs_of(file);
+  if (is_there_already(file, fd_)) return sync_folder_of(file);
   Replacement replacement;
   wrong = replacement.create(file);
   if (wrong == 0) wrong = write_to(replacement.fd());

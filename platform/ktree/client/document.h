@@ -25,8 +25,9 @@ class MemoryFile {
 
   // Makes `file` a regular file, mode 0600, that holds all of it, in one step: at any moment, also after a
   // power cut, `file` is the whole old one or the whole new one. A symbolic link is replaced, not followed; a
-  // device, a pipe or a folder is refused. Returns 0 or an errno value; `file` is then as it was, unless the
-  // very last step failed, the writing of the folder to its disk.
+  // device, a pipe or a folder is refused. A file that is like that already stays, so that asking again and
+  // again wears no flash; it is on its disk afterwards as well. Returns 0 or an errno value; `file` is then
+  // as it was, unless the very last step failed, the writing of the folder to its disk.
   [[nodiscard]] int replace_file(const char* file) const;
 
  private:
