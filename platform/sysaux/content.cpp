@@ -87,6 +87,14 @@ class Probe {
     return type != nullptr && strcmp(type, "PMBR") == 0;
   }
 
+  // The kind of a table with partitions that a probe is silent about: libblkid shows those of a BSD disk
+  // label to who asks for partitions alone. Null without one.
+  const char* silent_table() {
+    blkid_partlist table = blkid_probe_get_partitions(probe_);
+    if (table == nullptr || blkid_partlist_numof_partitions(table) <= 0) return nullptr;
+    return blkid_parttable_get_type(blkid_partition_get_table(blkid_partlist_get_partition(table, 0)));
+  }
+
   // The partitions in the table. An empty table of another kind may hide a GPT, so that is looked for then.
   int partitions(Extent* extents, int max) {
     if (!ready_) return 0;
@@ -126,9 +134,10 @@ bool is_unknown_boot_sector(Probe& probe) {
          !table_has_partitions(probe);
 }
 
-Content recognise_copy(int device, char name[16]) {
-  const char* found = nullptr;
-  if (!find_copy(device, &found)) return Content::kUnreadable;
+// What there is where a probe finds nothing.
+Content recognise_hidden(int device, Probe& probe, char name[16]) {
+  const char* found = probe.silent_table();
+  if (found == nullptr && !find_copy(device, &found)) return Content::kUnreadable;
   if (found == nullptr) return Content::kNothing;
   snprintf(name, 16, "%.15s", found);
   return Content::kSignature;
@@ -152,7 +161,7 @@ Content recognise(int device, char name[16]) {
   if (answer != Finding::kAmbivalent && answer != Finding::kFailed && probe.value("TYPE") == nullptr) {
     answer = probe.run(BLKID_SUBLKS_BADCSUM);
   }
-  if (answer == Finding::kNothing) return recognise_copy(device, name);
+  if (answer == Finding::kNothing) return recognise_hidden(device, probe, name);
   if (answer != Finding::kFound && answer != Finding::kAmbivalent) return Content::kUnreadable;
   const char* type = answer == Finding::kFound ? probe.value("TYPE") : "ambivalent";
   const char* found = type != nullptr ? type : probe.value("PTTYPE");

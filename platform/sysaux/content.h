@@ -18,7 +18,9 @@ enum class Content {
 // Recognises what the open device carries. A signature whose checksum is wrong counts: it marks data that
 // somebody may want to save. The name goes into `name`, which holds 16 characters, cut when longer: that of
 // the file system or other signature, "ambivalent" when several contradict each other, "damaged_..." when
-// only copies of a file system's first sectors are left, the table's name for a table; empty otherwise.
+// only copies of a file system's first sectors are left, the table's name for a table; empty otherwise. A
+// table that libblkid tells of only when asked for partitions, a BSD disk label, is a signature: the kernel
+// has no disks for its partitions.
 Content recognise(int device, char name[16]);
 
 // The partitions that the partition table of the open disk has, in the order of their numbers, at most `max`.

@@ -14,6 +14,9 @@
 
 namespace {
 
+// cmake/options.cmake sees to it on 32-bit processors: disks are large, and the year 2038 is near.
+static_assert(sizeof(off_t) == 8 && sizeof(time_t) == 8);
+
 long long size_of(int block_dir) {
   long long sectors = 0;
   if (block_dir < 0 || !sysaux::read_number_at(block_dir, "size", &sectors)) return -1;

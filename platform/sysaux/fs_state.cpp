@@ -78,6 +78,8 @@ int sysaux_state_check_fs_state(const char* node) {
   const errcode_t error = ext2fs_open(node, kFlags, 0, 0, &plain_reads, &file_system);
   if (error == EXT2_ET_SB_CSUM_INVALID || error == EXT2_ET_CORRUPT_SUPERBLOCK) return 1;
   if (error != 0) return 0;
+  // On a 32-bit processor Debian 12's library has times of 32 bits, unlike this code: what stands behind the
+  // structure's `now` is elsewhere for it.
   const ext2_super_block* super = file_system->super;
   const bool wants_check = (super->s_state & EXT2_VALID_FS) == 0 || (super->s_state & EXT2_ERROR_FS) != 0 ||
                            (super->s_feature_incompat & EXT3_FEATURE_INCOMPAT_RECOVER) != 0;

@@ -15,16 +15,15 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "common/fd.h"
 #include "sysaux.h"
 
 namespace {
 
 enum class KernelAnswer { kNo, kYes, kUnknown };
 
-KernelAnswer ask_kernel(int directory, const char* path, int flags) {
+KernelAnswer ask_kernel(const char* path) {
   struct statx info;
-  if (statx(directory, path, flags | AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC, 0, &info) != 0) {
+  if (statx(AT_FDCWD, path, AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC, 0, &info) != 0) {
     return errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG ? KernelAnswer::kNo
                                                                         : KernelAnswer::kUnknown;
   }
@@ -53,29 +52,23 @@ bool listed(const char* path) {
   return listed_once(name) || listed_once(name);
 }
 
-bool is_mount_root(int directory, const char* path, int flags, const char* name) {
-  const KernelAnswer answer = ask_kernel(directory, path, flags);
-  return answer == KernelAnswer::kUnknown ? listed(name) : answer == KernelAnswer::kYes;
-}
-
 }  // namespace
 
 extern "C" {
 
 int sys_mount_point(const char* path) {
   if (path == nullptr || path[0] == '\0') return 0;
-  return is_mount_root(AT_FDCWD, path, 0, path) ? 1 : 0;
+  const KernelAnswer answer = ask_kernel(path);
+  return answer == KernelAnswer::kYes || (answer == KernelAnswer::kUnknown && listed(path)) ? 1 : 0;
 }
 
-// One descriptor serves both questions, so the numbers are never those of the file system below a volume that
-// was unmounted in between.
+// Without a descriptor, which would make the caller a user of the volume: an unmount would fail, or end the
+// caller. Asked before and after, since the numbers are those of the file system below a volume that was
+// unmounted in between.
 int sys_get_df_info(const char* path, unsigned long long* total, unsigned long long* used,
                     unsigned long long* available) {
-  if (path == nullptr || path[0] == '\0') return -1;
-  const platform::Fd place(open(path, O_PATH | O_CLOEXEC));
   struct statvfs space;
-  if (!place.ok() || !is_mount_root(place.get(), "", AT_EMPTY_PATH, path)) return -1;
-  if (fstatvfs(place.get(), &space) != 0) return -1;
+  if (sys_mount_point(path) == 0 || statvfs(path, &space) != 0 || sys_mount_point(path) == 0) return -1;
   const unsigned long long unit = space.f_frsize;
   *total = space.f_blocks * unit;
   *used = (space.f_blocks - space.f_bfree) * unit;

@@ -65,6 +65,7 @@ def test_the_node_is_there_when_the_call_returns(loop):
     assert call("fs_type", disk.part) == (0, "ext4")
 
 
+@pytest.mark.native
 def test_a_disk_with_sectors_of_4096_bytes(loop):
     disk = loop(300 * MIB, "--sector-size", "4096")
     assert call("create", disk.node) == 0
@@ -498,6 +499,7 @@ def assert_intact(disk):
 
 
 @pytest.mark.parametrize("more", [50 * MIB, 200 * MIB])
+@pytest.mark.native
 def test_the_partition_grows_with_the_disk_and_keeps_its_data(loop, more):
     disk = filled(loop)
     before = disk.table()
@@ -515,6 +517,7 @@ def test_the_partition_grows_with_the_disk_and_keeps_its_data(loop, more):
     assert_intact(disk)
 
 
+@pytest.mark.native
 def test_a_mounted_partition_grows(loop):
     disk = filled(loop)
     disk.grow(400 * MIB)
@@ -527,6 +530,7 @@ def test_a_mounted_partition_grows(loop):
     assert_intact(disk)
 
 
+@pytest.mark.native
 def test_a_partition_that_ends_unaligned_grows_to_an_aligned_end(loop):
     disk = filled(loop, "label: gpt\nstart=2049,size=100001\n")
     assert call("expand", disk.node) == 0
@@ -534,6 +538,7 @@ def test_a_partition_that_ends_unaligned_grows_to_an_aligned_end(loop):
     assert_intact(disk)
 
 
+@pytest.mark.native
 def test_a_partition_that_is_not_the_first_grows(loop):
     disk = loop(200 * MIB)
     disk.sfdisk("label: gpt\n3: start=4096,size=40960\n")
@@ -550,6 +555,7 @@ def test_a_partition_at_the_end_stays_as_it_is(loop):
     assert disk.digest() == before
 
 
+@pytest.mark.native
 def test_a_partition_of_a_dos_table_grows(loop):
     disk = filled(loop, "label: dos\nstart=2048,size=204800,bootable\n", size=101 * MIB)
     disk.grow(400 * MIB)
@@ -560,6 +566,7 @@ def test_a_partition_of_a_dos_table_grows(loop):
     assert_intact(disk)
 
 
+@pytest.mark.native
 def test_a_dos_table_ends_at_2_tebibytes(loop):
     disk = loop(MIB << 10)
     disk.sfdisk("label: dos\nstart=2048,size=204800\n")
@@ -573,6 +580,7 @@ def test_a_dos_table_ends_at_2_tebibytes(loop):
     assert disk.digest() == before
 
 
+@pytest.mark.native
 def test_a_gpt_grows_beyond_2_tebibytes(loop):
     disk = loop(MIB << 20)
     assert call("create", disk.node) == 0
@@ -622,6 +630,7 @@ def test_a_partition_that_the_kernel_has_elsewhere_is_left_alone(loop):
     assert disk.partitions() == {1: (4096, 20480)}
 
 
+@pytest.mark.native
 def test_a_kernel_that_missed_the_growth_is_told_again(loop):
     disk = loop()
     assert call("create", disk.node) == 0
@@ -632,6 +641,7 @@ def test_a_kernel_that_missed_the_growth_is_told_again(loop):
     assert disk.partitions() == shown
 
 
+@pytest.mark.native
 def test_a_change_that_the_kernel_refuses_is_no_success(loop):
     """The kernel's refusal is the only sign: the table is written by then."""
     grown, fresh = loop(), loop()
@@ -703,6 +713,7 @@ def test_creation_under_faults_tells_the_truth(loop, fault):
 
 @pytest.mark.parametrize("fault", ["write", "fsync", "ioctl", "close"])
 @pytest.mark.parametrize("end", ["error=EIO", "signal=SIGKILL"])
+@pytest.mark.native
 def test_growth_that_is_cut_short_keeps_the_partition(loop, fault, end):
     disk = filled(loop, size=20 * MIB)
     disk.grow(40 * MIB)

@@ -1,7 +1,9 @@
 """Mount points and the space below them, by the kernel's word and by the mount table."""
 
 import os
+import pathlib
 import subprocess
+import time
 
 import pytest
 from harness.sysaux import CALL, MIB, TRACED, call, loop, make_ext, run
@@ -51,6 +53,7 @@ def test_a_folder_bound_to_itself_is_a_mount_point(tmp_path, way):
     assert call("mount_point", tmp_path, WAYS[way]) == 0
 
 
+@pytest.mark.native
 def test_what_is_not_there_is_no_mount_point(tmp_path):
     file = tmp_path / "file"
     file.touch()
@@ -100,3 +103,41 @@ def test_a_folder_below_a_mount_point_has_no_space_of_its_own(mounted):
     (mounted / "inside").mkdir()
     assert int(call("df_info", mounted)[1]) == 16 * MIB
     assert call("df_info", mounted / "inside")[0] == -1
+
+
+def users_of(folder):
+    """Whom fuser(1) would find by an open file."""
+    device = os.stat(folder).st_dev
+    users = []
+    for link in pathlib.Path("/proc").glob("[0-9]*/fd/*"):
+        try:
+            if link.stat().st_dev == device:
+                users.append(link.parts[2])
+        except OSError:
+            pass
+    return users
+
+
+@pytest.fixture
+def asking(mounted):
+    """A program in the middle of asking for the space of a volume."""
+    log = mounted.with_name("log")
+    with subprocess.Popen(["strace", "-qq", "-o", log, "-e", "trace=statfs,fstatfs",
+                           "-e", "inject=statfs,fstatfs:delay_enter=1500000", CALL, "df_info", mounted],
+                          stdout=subprocess.PIPE, text=True, env=TRACED) as process:
+        while not (log.exists() and "statfs(" in log.read_text()):
+            assert process.poll() is None
+            time.sleep(0.02)
+        yield process
+
+
+@pytest.mark.parametrize("mounted", ["plain"], indirect=True)
+def test_whoever_asks_for_the_space_is_no_user_whom_an_unmount_would_end(mounted, asking):
+    assert users_of(mounted) == []
+    assert int(asking.stdout.read().split()[1]) == 16 * MIB
+
+
+@pytest.mark.parametrize("mounted", ["plain"], indirect=True)
+def test_a_volume_that_goes_while_its_space_is_asked_for_has_none(mounted, asking):
+    run("umount", mounted)
+    assert asking.stdout.read().split()[0] == "-1"

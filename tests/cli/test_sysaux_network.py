@@ -28,6 +28,7 @@ def link_speed(network, port):
     return int(network(CALL, "link_speed", port))
 
 
+@pytest.mark.native
 def test_a_port_has_a_link_when_both_ends_are_up(network):
     assert link_speed(network, 0) == 0
     network("ip", "link", "set", "egiga0", "up")

@@ -142,6 +142,27 @@ def test_a_wrong_checksum_does_not_make_a_signature_invisible(loop):
     assert call("fs_type", disk.node) == (0, "LVM2_member")
 
 
+def bsd_label(checksum=None):
+    """One with a partition, to be written at byte 64 of a disk (bsd/disklabel.h)."""
+    label = bytearray(276)
+    struct.pack_into("<I", label, 0, 0x82564557)
+    struct.pack_into("<I", label, 132, 0x82564557)
+    struct.pack_into("<HHII", label, 136, 0, 8, 8192, 8192)
+    struct.pack_into("<IIIBBH", label, 148, 8192, 2048, 1024, 7, 8, 16)
+    right = 0
+    for word in struct.unpack("<138H", label):
+        right ^= word
+    struct.pack_into("<H", label, 136, right if checksum is None else checksum)
+    return bytes(label)
+
+
+@pytest.mark.parametrize("checksum", [None, 0x1234], ids=["right", "wrong"])
+def test_a_disk_label_is_not_nothing(loop, checksum):
+    disk = loop()
+    disk.write(64, bsd_label(checksum))
+    assert call("fs_type", disk.node) == (0, "bsd")
+
+
 def test_the_cache_of_blkid_is_never_asked(loop):
     disk = loop()
     run("mkswap", disk.node)
@@ -219,18 +240,19 @@ def write_backup_table(disk):
     disk.write(0, bytes(MIB))
 
 
-AT_THE_END = {
+FOUND_LAST = {
     "raid": lambda disk: disk.write(*md_member(64 * MIB, "1.0")),
     "zfs": lambda disk: write_zfs_labels(disk, *ZFS_AT_THE_END),
     "table": write_backup_table,
+    "label": lambda disk: disk.write(64, bsd_label()),
 }
 
 
 @pytest.mark.parametrize("times", ["", "+"])
-@pytest.mark.parametrize("content", AT_THE_END)
-def test_failing_reads_never_hide_what_lies_at_the_end(loop, content, times):
+@pytest.mark.parametrize("content", FOUND_LAST)
+def test_failing_reads_never_hide_what_is_found_last(loop, content, times):
     disk = loop()
-    AT_THE_END[content](disk)
+    FOUND_LAST[content](disk)
     assert call("fs_type", disk.node)[0] == 0
     total = len(calls_of("fs_type", disk.node, disk.node, "read"))
     for when in range(1, total + 2):

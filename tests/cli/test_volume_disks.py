@@ -280,6 +280,7 @@ def test_a_disk_that_grew_a_little_is_left_alone(luns):
     assert_files(lun)
 
 
+@pytest.mark.native
 def test_a_disk_that_grew_gets_its_partition_grown(luns):
     lun = luns(400 * MIB)
     lun.mount()
