@@ -41,7 +41,7 @@ constexpr struct {
     {"non-retryable iSCSI login failure", "the storage server refused the login",
      "see whether the target is still there, and lets this initiator in"},
     {"No records found", "the target's record could not be made",
-     "look at the target's name and at /etc/iscsi/nodes"},
+     "look at the target's name and at the initiator's records: /etc/iscsi/nodes, /var/lib/iscsi/nodes"},
     {"is not the disk of", "the disk's name is another disk's by now", "connect it again"},
     {"is in use, it is not formatted", "something besides the volume uses the disk",
      "see what does: lsblk, and the holders in /sys/class/block"},
@@ -65,11 +65,18 @@ std::string_view without_prefix(std::string_view line) {
 
 // What is said in every run, or says less than the line behind it.
 bool says_nothing(std::string_view line) {
-  constexpr std::string_view kPlain[] = {"execute failed.",   "Logging in to ",
-                                         "Login to ",         "Logging out of ",
-                                         "Logout of ",        "ip: ",
-                                         "vector size: ",     "Got FS type = ",
-                                         "semget(...) == -1", "lun"};
+  constexpr std::string_view kPlain[] = {"execute failed.",
+                                         "Logging in to ",
+                                         "Login to ",
+                                         "Logging out of ",
+                                         "Logout of ",
+                                         "New iSCSI node ",
+                                         "iscsiadm: using tpgt ",
+                                         "ip: ",
+                                         "vector size: ",
+                                         "Got FS type = ",
+                                         "semget(...) == -1",
+                                         "lun"};
   return line.empty() || std::any_of(std::begin(kPlain), std::end(kPlain),
                                      [line](std::string_view plain) { return line.starts_with(plain); });
 }

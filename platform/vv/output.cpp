@@ -6,6 +6,7 @@
 #include <cstring>
 #include <memory>
 
+#include "common/memory.h"
 #include "common/scols.h"
 #include "common/utf8.h"
 #include "vv/list.h"
@@ -35,7 +36,8 @@ platform::ScolsTable filled(const Table& table) {
   bool good = made != nullptr && scols_table_set_name(made.get(), table.name) == 0;
   for (const TableColumn& column : table.columns) good = good && add_column(made.get(), column);
   for (const auto& row : table.rows) good = good && add_row(made.get(), row);
-  return good ? std::move(made) : nullptr;
+  if (!good) platform::end_without_memory();
+  return made;
 }
 
 std::string joined(const std::vector<std::string>& lines) {
@@ -95,15 +97,10 @@ void tell_failure(const Outcome& outcome) {
 
 std::string shown(const Table& table, bool json) {
   const platform::ScolsTable made = filled(table);
-  if (made == nullptr) return {};
   scols_table_enable_noencoding(made.get(), 1);  // add_row() has done it
   scols_table_enable_json(made.get(), json);
   scols_table_set_termforce(made.get(), SCOLS_TERMFORCE_NEVER);
-  char* text = nullptr;
-  if (scols_print_table_to_string(made.get(), &text) != 0) return {};
-  const std::unique_ptr<char, decltype(&free)> owned(text, free);
-  // The library ends all lines but the last one.
-  return std::string(text).append("\n");
+  return platform::printed(made);
 }
 
 void put(const std::string& text) {

@@ -2,11 +2,14 @@
 // and explains what went wrong.
 #include <sys/prctl.h>
 
+#include "common/memory.h"
 #include "vv/command_line.h"
+#include "vv/options.h"
 #include "vvstat/columns.h"
 
 int main(int argc, char** argv) {
   prctl(PR_SET_DUMPABLE, 0);  // a core would hold the passwords
+  platform::end_when_memory_is_short(vv::kFailed);
   vvstat::use_utf8();
   vv::Options options;
   const int status = vv::read_options(argc, argv, options);

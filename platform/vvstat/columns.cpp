@@ -10,6 +10,7 @@
 #include <iterator>
 #include <memory>
 
+#include "common/memory.h"
 #include "common/scols.h"
 #include "common/utf8.h"
 #include "tree_layout.h"
@@ -334,7 +335,8 @@ platform::ScolsTable table_of(const std::vector<Row>& rows, const Layout& layout
   for (const Place& place : places) good = good && add_column(table.get(), place);
   for (size_t at = 0; at < rows.size(); at++)
     good = good && add_row(table.get(), rows[at], at, places, layout);
-  return good ? std::move(table) : nullptr;
+  if (!good) platform::end_without_memory();
+  return table;
 }
 
 }  // namespace
@@ -393,7 +395,6 @@ std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {
   Layout layout = asked;
   layout.bytes = layout.bytes || layout.form == Form::kJson;
   const platform::ScolsTable table = table_of(rows, layout);
-  if (table == nullptr) return {};
   scols_table_enable_noencoding(table.get(), 1);  // cell() has done it
   scols_table_enable_json(table.get(), layout.form == Form::kJson);
   scols_table_enable_raw(table.get(), layout.form == Form::kRaw);
@@ -401,11 +402,7 @@ std::string volume_report(const std::vector<Row>& rows, const Layout& asked) {
   scols_table_enable_colors(table.get(), layout.colour);
   scols_table_set_termforce(table.get(), SCOLS_TERMFORCE_ALWAYS);
   scols_table_set_termwidth(table.get(), layout.width);
-  char* text = nullptr;
-  if (scols_print_table_to_string(table.get(), &text) != 0) return {};
-  const std::unique_ptr<char, decltype(&free)> owned(text, free);
-  // The library ends all lines but the last one.
-  return std::string(text).append("\n");
+  return platform::printed(table);
 }
 
 std::string block(const Row& row, const Layout& layout) {

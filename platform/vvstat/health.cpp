@@ -64,7 +64,7 @@ Problem problem_of_target(const Target& target, const Volume* volume, const Targ
   return kNone;
 }
 
-Problem problem_of_unmounted(const Target& target, const Volume& volume) {
+Problem problem_of_unmounted(const Target& target, const Volume& volume, bool worked_on) {
   const std::string format = vv_command("format --destroy-data", volume.share);
   if (volume.format_state == remvol::kFormatFailed) {
     return {Ailment::kFailed, "Format Failed", "its format failed",
@@ -82,11 +82,13 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume) {
     return {Ailment::kFailed, "No Disk", "its LUN has no disk here",
             "see whether the storage server still offers it", connect_command_of(target, &volume)};
   }
+  if (worked_on)
+    return {Ailment::kBusy, "Mounting", "is not mounted while a command works on its target", "wait", ""};
   return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again",
           connect_command_of(target, &volume)};
 }
 
-Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {
+Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts, bool worked_on) {
   if (volume.format_state == remvol::kFormatting) {
     return {Ailment::kBusy, "Formatting", "is being formatted, " + std::to_string(volume.progress) + "%",
             "wait", ""};
@@ -97,7 +99,7 @@ Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts
   if (volume.volume_state == remvol::kVolumeCreating) {
     return {Ailment::kBusy, "Creating", "is being created", "wait", ""};
   }
-  if (!facts.mounted) return problem_of_unmounted(target, volume);
+  if (!facts.mounted) return problem_of_unmounted(target, volume, worked_on);
   if (facts.disk_lost) {
     return {Ailment::kFailed, "No Disk", "its disk is gone, though its target is connected",
             "have it mounted anew", mount_anew(volume)};
@@ -161,7 +163,7 @@ Row row_of_volume(const Target& target, const TargetFacts& target_facts, size_t 
   row.wanted = row.wanted && volume.enabled;
   if (!row.wanted) row.problem = kNone;
   const bool lost = !row.healthy();
-  if (row.wanted && !lost) row.problem = problem_of(target, volume, facts);
+  if (row.wanted && !lost) row.problem = problem_of(target, volume, facts, target_facts.worked_on);
   row.status = lost ? row.problem.status : status_of(volume, row);
   row.otherwise = otherwise(row, volume.status);
   return row;

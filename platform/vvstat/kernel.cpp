@@ -1,18 +1,23 @@
 #include "vvstat/kernel.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <sys/sysmacros.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
+#include <cstdio>
 #include <cstdlib>
 
 #include "common/fd.h"
 #include "common/sessions.h"
 #include "vvstat/mounts.h"
+
+#include "run_folder.h"
 
 namespace vvstat {
 namespace {
@@ -151,6 +156,19 @@ VolumeFacts facts_of(const Volume& volume, bool answering, Detail detail, Tables
   return facts;
 }
 
+// Whether a run of the tool has the target for itself. What is tried in vain is held for a moment otherwise.
+bool is_worked_on(const std::string& target) {
+  char name[64];
+  snprintf(name, sizeof name, remvol::kLockFormat, remvol::kTargetLock, remvol::name_hash(target.c_str()));
+  const std::string path = std::string(remvol::kRunDir) + "/" + name;
+  const platform::Fd lock(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+  return lock.ok() && flock(lock.get(), LOCK_SH | LOCK_NB) != 0 && errno == EWOULDBLOCK;
+}
+
+bool lacks_a_mount(const std::vector<VolumeFacts>& volumes) {
+  return std::any_of(volumes.begin(), volumes.end(), [](const VolumeFacts& each) { return !each.mounted; });
+}
+
 const Session* session_of(const Target& target, const std::vector<Session>& sessions) {
   const Session* found = nullptr;
   for (const Session& session : sessions) {
@@ -177,6 +195,7 @@ std::vector<TargetFacts> read_facts(const Status& status, Detail detail) {
     for (const Volume& volume : target.volumes) {
       facts.volumes.push_back(facts_of(volume, answering, detail, tables));
     }
+    facts.worked_on = answering && lacks_a_mount(facts.volumes) && is_worked_on(target.name);
     all.push_back(std::move(facts));
   }
   return all;

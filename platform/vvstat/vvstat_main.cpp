@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "common/memory.h"
 #include "common/utf8.h"
 #include "vvstat/columns.h"
 #include "vvstat/metrics.h"
@@ -279,5 +280,6 @@ int run(int argc, char** argv) {
 }  // namespace vvstat
 
 int main(int argc, char** argv) {
+  platform::end_when_memory_is_short(vvstat::kFailed);
   return vvstat::run(argc, argv);
 }

@@ -6,7 +6,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdint>
 #include <cstdio>
 
 #include "support/files.h"
@@ -15,6 +14,9 @@
 namespace remvol {
 
 namespace {
+
+// cmake/options.cmake sees to it on 32-bit processors: disks are large, and the year 2038 is near.
+static_assert(sizeof(off_t) == 8 && sizeof(time_t) == 8);
 
 constexpr int kPollsPerSecond = 50;
 constexpr useconds_t kPoll = 1'000'000 / kPollsPerSecond;
@@ -31,17 +33,10 @@ bool lock_file(int fd, int operation) {
   return true;
 }
 
-// FNV-1a.
-uint64_t hash_of(const char* text) {
-  uint64_t hash = 14695981039346656037U;
-  for (; *text != '\0'; text++) hash = (hash ^ static_cast<unsigned char>(*text)) * 1099511628211U;
-  return hash;
-}
-
 }  // namespace
 
 LockName hashed_lock_name(const char* kind, const char* name) {
-  return LockName("%s-%016llx.lock", kind, static_cast<unsigned long long>(hash_of(name)));
+  return LockName(kLockFormat, kind, name_hash(name));
 }
 
 LockTry RunLock::open_and_lock(const char* name, int open_flags, int operation) {

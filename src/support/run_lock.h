@@ -6,11 +6,10 @@
 #ifndef REMVOL_SUPPORT_RUN_LOCK_H
 #define REMVOL_SUPPORT_RUN_LOCK_H
 
+#include "run_folder.h"
 #include "support/text.h"
 
 namespace remvol {
-
-inline constexpr char kRunDir[] = "/run/remvol";
 
 // Seconds. For longer no run waits for one that keeps a session open, closes it, or works on a mount point.
 inline constexpr int kLongestHold = 60;

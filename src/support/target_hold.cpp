@@ -18,7 +18,7 @@ constexpr int kBriefPolls = 600;
 char held_target[256];
 
 LockName target_lock(const char* target_name) {
-  return hashed_lock_name("target", target_name);
+  return hashed_lock_name(kTargetLock, target_name);
 }
 
 LockName lun_lock(const char* target_name, int lun) {

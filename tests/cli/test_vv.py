@@ -201,6 +201,7 @@ def test_somebody_who_is_not_root_is_told(machine):
     assert (done.status, done.stderr) == (3, "vv: only root may do this\n")
 
 
+@pytest.mark.native
 def test_without_the_tool(photos):
     # The words of the box's PATH without the folder of the programs.
     photos.box.path("/only").mkdir()
@@ -247,7 +248,7 @@ def test_a_portal_that_offers_nothing(machine):
     assert machine.says("discover", "10.9.0.2") == (0, {"targets": []})
 
 
-SAMPLES = pathlib.Path(__file__).resolve().parents[1] / "samples/iscsiadm"
+SAMPLES = pathlib.Path(__file__).resolve().parents[1] / "samples/iscsiadm/bookworm"  # tests/unit reads those of all releases
 
 
 def sample(name):

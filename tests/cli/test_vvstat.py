@@ -1,11 +1,14 @@
 """vvstat: how the volumes are, for an operator and for programs."""
 
+import contextlib
 import datetime
+import fcntl
 import json
 import os
 import pathlib
 import re
 import signal
+import struct
 import subprocess
 import time
 import unicodedata
@@ -21,6 +24,8 @@ SCHEMA = json.loads((pathlib.Path(__file__).resolve().parents[2] / "docs/vvstat.
 T1, T2 = "/iscsi/initiator/id:1", "/iscsi/initiator/id:2"
 T1_NAME = "iqn.2026-01.org.example:t1"
 LONG_NAME = "iqn.2026-01.org.example:a-target-whose-name-has-a-length-as-in-life"
+
+MANY = 1_000_000  # allocations
 
 TABLE = """\
 SHARE        STATUS         USED SIZE USE% LUN PORTAL
@@ -196,6 +201,38 @@ def test_a_volume_that_is_not_mounted(example, values, status, problem, command)
     change(example, values)
     check_problem(example, status, problem, command)
     assert volumes(example)[0]["size"] is None
+
+
+@contextlib.contextmanager
+def a_run_works(box, target, how=fcntl.LOCK_EX):
+    """What a run of the tool does while it works on a target."""
+    digest = 14695981039346656037
+    for byte in target.encode():
+        digest = (digest ^ byte) * 1099511628211 % 2 ** 64
+    folder = box.path("/run/remvol")
+    folder.mkdir(mode=0o700, parents=True, exist_ok=True)
+    with open(folder / f"target-{digest:016x}.lock", "w", encoding="ascii") as lock:
+        fcntl.flock(lock, how)
+        yield
+
+
+def test_a_volume_that_is_not_mounted_while_a_command_works_on_its_target(example):
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    with a_run_works(example, T1_NAME):
+        check_problem(example, "Mounting", "is not mounted while a command works on its target", None)
+    check_problem(example, "Not Mounted", "is not mounted", CONNECT)
+
+
+def test_a_command_that_works_on_another_volume_of_the_target_mounts_this_one_not(example):
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    with a_run_works(example, T1_NAME, fcntl.LOCK_SH):
+        check_problem(example, "Not Mounted", "is not mounted", CONNECT)
+
+
+def test_a_session_that_is_gone_is_lost_whoever_works_on_its_target(example):
+    example.path("/sys/class/iscsi_session/session3").rename(example.path("/sys/class/gone"))
+    with a_run_works(example, T1_NAME):
+        assert volumes(example)[0]["status"] == "No Session"
 
 
 @pytest.mark.parametrize("state, status, problem, command", [
@@ -897,3 +934,27 @@ def test_a_system_without_the_utf8_locale(example):
     assert done.status == 0
     done = vvstat(example)
     assert done.status == 0 and "\nFotos \\xE6\\x97\\xA5\\xE6\\x9C\\xAC Running " in done.stdout
+
+
+# Not the table: libsmartcols 2.38 goes on for ever when it gets no memory while it chooses widths.
+@pytest.mark.unsanitized
+def test_whichever_allocation_fails(example):
+    counter = example.path("/left")
+    right = vvstat(example, "--json")
+
+    def short_of_memory(left):
+        counter.write_bytes(struct.pack("=q", left))
+        done = vvstat(example, "--json", env={"LD_PRELOAD": f"{example.tools}/libscarce.so", "SCARCE_FILE": "/left",
+                                              "SCARCE_PROGRAM": "vvstat"})
+        return done, struct.unpack("=q", counter.read_bytes())[0]
+
+    done, left = short_of_memory(MANY)
+    assert without_clock(done.stdout) == without_clock(right.stdout)
+    allocations = MANY - left
+    for n in range(max(1, allocations - 80), allocations + 1):  # the output is made last
+        done, left = short_of_memory(n)
+        assert left == 0
+        if (done.status, done.stdout) != (2, ""):
+            assert (done.status, without_clock(done.stdout)) == (right.status, without_clock(right.stdout)), n
+        else:
+            assert done.stderr == "vvstat: out of memory\n"

@@ -164,12 +164,22 @@ TEST(Explanation, RealOutputOfTheInitiatorIsUnderstood) {
       {"discovery-ipv6.err", "no network of this machine leads to that address"},
       {"login-unknown-target.err", "the target's record could not be made"},
   };
-  for (const auto& one : kCases) {
-    const Failure failure = explain_output(sample(one.file), kLoginStep);
-    EXPECT_EQ(failure.why, one.why) << one.file;
-    EXPECT_NE(failure.advice, "") << one.file;
-    EXPECT_EQ(failure.details.size(), 1U) << one.file;
-    EXPECT_EQ(failure.step, kLoginStep);
+  for (const char* release : {"bookworm", "trixie"}) {
+    for (const auto& one : kCases) {
+      const std::string file = std::string(release) + "/" + one.file;
+      const Failure failure = explain_output(sample(file), kLoginStep);
+      EXPECT_EQ(failure.why, one.why) << file;
+      EXPECT_NE(failure.advice, "") << file;
+      EXPECT_EQ(failure.details.size(), 1U) << file;
+      EXPECT_EQ(failure.step, kLoginStep);
+    }
+  }
+}
+
+TEST(Explanation, WhatTheInitiatorSaysInEveryRunIsNotShown) {
+  for (const char* file : {"bookworm/login.out", "bookworm/new-t1.out", "trixie/login.out",
+                           "trixie/new-t1.out", "trixie/new-t1.err", "trixie/logout.out"}) {
+    EXPECT_EQ(telling_lines(sample(file)), Steps{}) << file;
   }
 }
 

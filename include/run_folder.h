@@ -1,0 +1,25 @@
+// The folder where the tool's runs, and the platform's programs, keep what is theirs while the machine runs.
+#ifndef REMVOL_RUN_FOLDER_H
+#define REMVOL_RUN_FOLDER_H
+
+#include <cstdint>
+
+namespace remvol {
+
+inline constexpr char kRunDir[] = "/run/remvol";  // only root may enter it
+
+// The name of a run's lock file, by printf(3): the kind, and name_hash() of what it is for. A run that works
+// on a target as a whole has the file of the kind kTargetLock locked alone (flock(2), LOCK_EX).
+inline constexpr char kLockFormat[] = "%s-%016llx.lock";
+inline constexpr char kTargetLock[] = "target";
+
+// FNV-1a.
+constexpr unsigned long long name_hash(const char* name) {
+  uint64_t hash = 14695981039346656037U;
+  for (; *name != '\0'; name++) hash = (hash ^ static_cast<unsigned char>(*name)) * 1099511628211U;
+  return hash;
+}
+
+}  // namespace remvol
+
+#endif
