@@ -24,10 +24,11 @@ namespace {
 
 using platform::read_sessions;
 
-constexpr char kNotifier[] = "remvol-notify";
+constexpr char kDefaultNotifier[] = "remvol-notify";
 constexpr int kMuchHurry = 50, kSomeHurry = 1000;  // milliseconds between looks
 
 struct Listener {
+  const char* notifier = kDefaultNotifier;
   int signals = -1;
   int devices = -1;
   int iscsi = -1;
@@ -67,12 +68,12 @@ pid_t start_tool(const Order& order) {
 }
 
 // The tree is up to date now: people and programs are told of what has changed.
-void notify(const OrderEnd& end) {
-  const char* changes[] = {kNotifier, nullptr};
-  const char* failure[] = {kNotifier, "--recovery-failed", end.given_up.c_str(), nullptr};
+void notify(const char* notifier, const OrderEnd& end) {
+  const char* changes[] = {notifier, nullptr};
+  const char* failure[] = {notifier, "--recovery-failed", end.given_up.c_str(), nullptr};
   const auto start = platform::start;
-  if (start(kNotifier, changes) < 0 || (!end.given_up.empty() && start(kNotifier, failure) < 0)) {
-    complain(kNotifier);
+  if (start(notifier, changes) < 0 || (!end.given_up.empty() && start(notifier, failure) < 0)) {
+    complain(notifier);
   }
 }
 
@@ -112,7 +113,7 @@ void take_signals(Listener& daemon) {
   int status = 0;
   for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) {
     const OrderEnd end = daemon.targets.ended(child, status != 0);
-    if (end.ordered) notify(end);
+    if (end.ordered) notify(daemon.notifier, end);
   }
 }
 
@@ -182,8 +183,9 @@ void run(Listener& daemon) {
   }
 }
 
-int serve() {
+int serve(const char* notifier) {
   Listener daemon;
+  daemon.notifier = notifier;
   daemon.signals = open_signals();
   daemon.devices = open_device_events();
   if (daemon.signals < 0 || daemon.devices < 0) {
@@ -195,21 +197,23 @@ int serve() {
 }
 
 constexpr char kHelp[] =
-    "usage: remvol-events [--test]\n"
+    "usage: remvol-events [--notifier PROGRAM | --test]\n"
     "When the connection of an iSCSI session is lost it runs\n"
     "\"remvol --oiscsi_evt_reopen -n TARGET\", when the session is back\n"
     "\"remvol --oiscsi_evt_recover -n TARGET\", and remvol-notify after each.\n"
     "Stays in the foreground.\n"
-    "  --test         has remvol-notify tell of a made-up event, and ends\n"
-    "  -h, --help     this text\n"
-    "  -V, --version  the version\n";
+    "  --notifier PROGRAM  is run in place of remvol-notify\n"
+    "  --test              has remvol-notify tell of a made-up event, and ends\n"
+    "  -h, --help          this text\n"
+    "  -V, --version       the version\n";
 
 }  // namespace
 }  // namespace events
 
 int main(int argc, char** argv) {
-  if (argc == 1) return events::serve();
+  if (argc == 1) return events::serve(events::kDefaultNotifier);
   const std::string_view option = argc == 2 ? argv[1] : "";
+  if (argc == 3 && std::string_view(argv[1]) == "--notifier") return events::serve(argv[2]);
   if (option == "--test") {
     execlp("remvol-notify", "remvol-notify", "--test", nullptr);
     perror("remvol-events: remvol-notify");

@@ -42,7 +42,7 @@ struct Keeper {
   bool first = true;     // no look yet: what is away now was taken down when the settings say so
 };
 
-long now() {
+time_t now() {
   timespec time{};
   clock_gettime(CLOCK_MONOTONIC, &time);
   return time.tv_sec;
@@ -145,7 +145,7 @@ bool take_signals(Keeper& daemon) {
 bool wait_for_look(Keeper& daemon) {
   static unsigned char buffer[1 << 14];
   const bool hurry = daemon.schedule.anything_missing() || daemon.no_initiator > 0;
-  const long due = now() + (hurry ? kHurry : kRest);
+  const time_t due = now() + (hurry ? kHurry : kRest);
   for (bool session = false; !session && now() < due;) {
     pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}};
     poll(inputs, 2, static_cast<int>(due - now()) * 1000);

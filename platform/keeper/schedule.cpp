@@ -22,7 +22,7 @@ Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
   return targets_.back();
 }
 
-void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, long now) {
+void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) {
   if (wanted.connected) {
     target.tell = target.missing && !target.tell;
     target.missing = target.taken = false;
@@ -38,7 +38,7 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, long now) {
   target.due = now;
 }
 
-void Schedule::look(const std::vector<Wanted>& wanted, long now) {
+void Schedule::look(const std::vector<Wanted>& wanted, time_t now) {
   for (AwaitedTarget& target : targets_) target.seen = false;
   for (const Wanted& one : wanted) {
     AwaitedTarget& target = find(one.name);
@@ -58,7 +58,7 @@ Change Schedule::next_change(std::string& name) {
   return Change::kNone;
 }
 
-bool Schedule::next_try(Try& next, long now) {
+bool Schedule::next_try(Try& next, time_t now) {
   for (AwaitedTarget& target : targets_) {
     if (!target.missing || now < target.due) continue;
     next = {target.name, target.pause == kFirstPause};

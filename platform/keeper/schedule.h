@@ -2,6 +2,7 @@
 #ifndef PLATFORM_KEEPER_SCHEDULE_H
 #define PLATFORM_KEEPER_SCHEDULE_H
 
+#include <ctime>
 #include <string>
 #include <vector>
 
@@ -26,18 +27,18 @@ class Schedule {
  public:
   // Compares with what the machine has; to be called about once a second, `now` in seconds. A target that is
   // no longer wanted is forgotten.
-  void look(const std::vector<Wanted>& wanted, long now);
+  void look(const std::vector<Wanted>& wanted, time_t now);
 
   // Takes a change that is to be told: a target is missing, or is back. Returns kNone when there is none.
   Change next_change(std::string& target);
 
   // Takes a target that is to be tried now; the next try comes later, up to kLongestPause seconds.
-  bool next_try(Try& next, long now);
+  bool next_try(Try& next, time_t now);
 
   // True when something is missing, so that looking every second is worth it.
   bool anything_missing() const;
 
-  static constexpr long kFirstPause = 1, kLongestPause = 60;
+  static constexpr time_t kFirstPause = 1, kLongestPause = 60;
 
  private:
   struct AwaitedTarget {
@@ -47,11 +48,11 @@ class Schedule {
     bool missing = false;  // told
     bool tell = false;
     int absent = 0;  // looks in a row without a session
-    long pause = kFirstPause, due = 0;
+    time_t pause = kFirstPause, due = 0;
   };
 
   AwaitedTarget& find(const std::string& name);
-  static void settle(AwaitedTarget& target, const Wanted& wanted, long now);
+  static void settle(AwaitedTarget& target, const Wanted& wanted, time_t now);
 
   std::vector<AwaitedTarget> targets_;
 };

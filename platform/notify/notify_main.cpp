@@ -18,10 +18,11 @@
 #include "vvstat/kernel.h"
 #include "vvstat/status.h"
 
+#include "run_folder.h"
+
 namespace notify {
 namespace {
 
-constexpr char kRunFolder[] = "/run/remvol";  // the tool's too; only root may enter it
 constexpr char kConfig[] = "/etc/remvol/remvol.conf";
 constexpr int kFailed = 1, kUsage = 2, kUnreachable = 3;
 
@@ -56,7 +57,7 @@ time_t time_of(int file, bool fresh, const std::string& text, const History& his
 // Another look at the same time waits: each change is found by one of them. The file goes with the machine's
 // run time, so a torn one costs a message told twice.
 bool look(const vvstat::Status& status, std::vector<Event>& events) {
-  mkdir(kRunFolder, 0700);
+  mkdir(remvol::kRunDir, 0700);
   const bool fresh = access(vvstat::kHistoryFile, F_OK) != 0;
   const int file = open(vvstat::kHistoryFile, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
   if (file < 0 || flock(file, LOCK_EX) != 0) return complain(vvstat::kHistoryFile);

@@ -49,9 +49,9 @@ class Events:
         folder = self.box.path(f"{SESSIONS}/session{number}")
         folder.rename(self.box.path(f"/sys/class/gone{number}"))
 
-    def start(self):
+    def start(self, *options):
         preload = self.box.tools / "libnetlink.so"
-        self.daemon = self.box.start([self.box.build / "bin" / "remvol-events"], env={"LD_PRELOAD": str(preload)})
+        self.daemon = self.box.start([self.box.build / "bin" / "remvol-events", *options], env={"LD_PRELOAD": str(preload)})
         self.box.wait_until(self.place(DEVICE_EVENTS).exists, what="the listener")
         self.sync()
 
@@ -274,6 +274,7 @@ def test_a_recovery_that_the_next_loss_overtakes_is_left_out(connected):
     connected.wait_runs(reopen("iqn.a"), reopen("iqn.a"), recover("iqn.a"))
 
 
+@pytest.mark.native
 def test_a_recovery_that_failed_is_tried_again(connected):
     connected.box.fake("remvol", "--oiscsi_evt_recover", status=255, times=2)
     connected.state(1, "FAILED")
@@ -285,6 +286,7 @@ def test_a_recovery_that_failed_is_tried_again(connected):
     connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end of the retries")
 
 
+@pytest.mark.native
 def test_a_recovery_that_was_killed_behind_the_logout_is_tried_again(connected):
     gone = f"mv {SESSIONS}/session1 /sys/class/gone1; exit 255"
     connected.box.fake("remvol", "--oiscsi_evt_recover", status=255, effect=gone, times=1)
@@ -297,6 +299,7 @@ def test_a_recovery_that_was_killed_behind_the_logout_is_tried_again(connected):
     connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end of the retries")
 
 
+@pytest.mark.native
 def test_a_reopen_that_failed_is_not_tried_again(connected):
     connected.box.fake("remvol", "--oiscsi_evt_reopen", status=255)
     connected.state(1, "FAILED")
@@ -308,6 +311,7 @@ def test_a_reopen_that_failed_is_not_tried_again(connected):
     connected.box.wait_until(lambda: connected.asleep_for_good(), what="no retry")
 
 
+@pytest.mark.native
 def test_people_are_told_after_each_order(connected):
     connected.state(1, "FAILED")
     connected.send(message(LOST, 1))
@@ -321,6 +325,15 @@ def test_people_are_told_after_each_order(connected):
     connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end")
 
 
+def test_another_program_may_tell_people(events):
+    events.box.default("teller")
+    events.session(1, "iqn.a")
+    events.start("--notifier", "teller")
+    events.box.wait_until(lambda: events.box.runs("teller") == [[]], what="news of the first look")
+    assert events.box.runs("remvol-notify") == []
+
+
+@pytest.mark.native
 def test_a_recovery_that_is_given_up_is_told(connected):
     connected.box.fake("remvol", "--oiscsi_evt_recover", status=255)
     connected.state(1, "FAILED")
@@ -424,6 +437,7 @@ def test_a_target_name_is_one_argument_whatever_it_holds(events):
     assert not events.box.path("/bad").exists()
 
 
+@pytest.mark.native
 def test_a_tool_that_cannot_be_started_ends_nothing(events):
     events.session(1, "iqn.a", state="FAILED")
     events.box.environment["PATH"] = "/nowhere"
@@ -454,7 +468,7 @@ def test_help_version_and_usage(bare_box):
         done = bare_box.run([program, option])
         assert done.status == 0 and done.stdout.startswith("usage: remvol-events") and done.stderr == ""
     assert bare_box.run([program, "--version"]).stdout.startswith("remvol-events ")
-    for words in (["--what"], ["--test", "x"], ["--help", "x"], [""]):
+    for words in (["--what"], ["--test", "x"], ["--notifier"], ["--notifier", "x", "x"], ["--help", "x"], [""]):
         done = bare_box.run([program, *words])
         assert (done.status, done.stdout) == (2, "") and done.stderr.startswith("usage: ")
 

@@ -10,7 +10,7 @@ import time
 
 import pytest
 
-from test_vvstat import T1, T1_NAME, change, example, run, session, store_example  # noqa: F401
+from test_vvstat import T1, T1_NAME, a_run_works, change, example, run, session, store_example  # noqa: F401
 
 PACKAGING = pathlib.Path(__file__).resolve().parents[2] / "packaging"
 CONFIG = "/etc/remvol/remvol.conf"
@@ -100,6 +100,16 @@ def test_events(example, journal, values, mounted, event, priority):  # noqa: F8
     change(example, values)
     notify(example)
     assert [(e["EVENT"], e["PRIORITY"]) for e in journal.entries() if e["SHARE"] == "Backup"] == [(event, priority)]
+
+
+def test_a_volume_that_is_being_mounted_has_not_failed(example, journal):  # noqa: F811
+    notify(example)
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    with a_run_works(example, T1_NAME):
+        notify(example)
+        assert journal.entries() == []
+    notify(example)
+    assert [entry["EVENT"] for entry in journal.entries()] == ["volume-failed"]
 
 
 def test_a_volume_that_turns_read_only(example, journal):  # noqa: F811

@@ -90,19 +90,16 @@ def kernel(bare_box):
         answer = {"libiscsi": path + ".xz", "libiscsi_tcp": "(builtin)"}.get(name, path)
         bare_box.fake("modinfo", f"-n {name}", stdout=answer + "\n", exact=True)
     bare_box.default("modprobe")
-    bare_box.fake("modprobe", "-D iscsi_tcp", stdout="insmod /lib/modules/x/scsi_common.ko \n"
-                  "insmod /lib/modules/x/scsi_mod.ko.xz a=1\ninsmod /lib/modules/x/scsi_transport_iscsi.ko \n"
-                  "builtin crc32c\ninsmod /lib/modules/x/iscsi_tcp.ko \n")
     return bare_box
 
 
-def test_modules_are_linked_and_what_they_need_is_loaded(kernel):
+def test_modules_are_linked_and_loaded(kernel):
     done = helper(kernel, "modules")
     assert (done.status, done.stderr) == (0, "")
     links = {path.name: str(path.readlink()) for path in kernel.path(FOLDER).iterdir()}
     assert links == {"scsi_transport_iscsi.ko": "/lib/modules/x/scsi_transport_iscsi.ko",
                      "libiscsi.ko": "/lib/modules/x/libiscsi.ko.xz", "iscsi_tcp.ko": "/lib/modules/x/iscsi_tcp.ko"}
-    assert kernel.runs("modprobe")[1:] == [["-q", "scsi_common"], ["-q", "scsi_mod"], ["-q", "sd_mod"]]
+    assert kernel.runs("modprobe") == [["-a", "iscsi_tcp", "sd_mod"]]
 
 
 def test_modules_of_an_earlier_kernel_are_replaced(kernel):
@@ -172,18 +169,78 @@ def test_a_machine_without_the_folder_is_told(box):
     assert done.status != 0 and "/nowhere" in done.stderr
 
 
+# --- news ---
+
+
+def news(box, *arguments):
+    """What was started: units, and programs without one."""
+    assert helper(box, "notify", *arguments).status == 0
+    return [words for words in box.runs("systemctl") if "start" in words], box.runs("remvol-notify")
+
+
+LOOK = ["--quiet", "start", "remvol-notify.service"]
+
+
+@pytest.mark.parametrize("state, starts", [("inactive", 1), ("failed", 1), ("activating", 2)])
+def test_a_change_is_seen_by_a_look_that_begins_after_it(bare_box, state, starts):
+    bare_box.path("/run/systemd/system").mkdir(parents=True)
+    bare_box.fake("systemctl", "show", stdout=state + "\n")
+    bare_box.default("systemctl")
+    units, programs = news(bare_box)
+    assert units == [LOOK] * starts and programs == []
+
+
+def test_a_recovery_that_is_given_up_has_a_unit_of_its_own(bare_box):
+    bare_box.path("/run/systemd/system").mkdir(parents=True)
+    bare_box.default("systemctl")
+    bare_box.fake("systemd-escape", "--template=remvol-recovery-failed@.service iqn.a", stdout="escaped\n")
+    assert news(bare_box, "--recovery-failed", "iqn.a") == ([["--quiet", "start", "--no-block", "escaped"]], [])
+
+
+def test_of_a_target_whose_name_is_too_long_for_a_unit_people_are_told_at_once(bare_box):
+    bare_box.path("/run/systemd/system").mkdir(parents=True)
+    bare_box.default("systemctl")
+    bare_box.default("remvol-notify")
+    bare_box.fake("systemd-escape", status=1)
+    assert news(bare_box, "--recovery-failed", "iqn.long") == ([], [["--recovery-failed", "iqn.long"]])
+
+
+def test_a_name_is_no_variable_for_systemd():
+    assert Unit("remvol-recovery-failed@.service")["Service"]["ExecStart"].startswith(":")
+
+
+@pytest.mark.parametrize("arguments", [[], ["--recovery-failed", "iqn.a"]])
+def test_a_machine_that_goes_down_starts_no_unit_any_more(bare_box, arguments):
+    bare_box.path("/run/systemd/system").mkdir(parents=True)
+    bare_box.default("systemctl")
+    bare_box.fake("systemctl", "is-system-running", stdout="stopping\n", status=1)
+    assert news(bare_box, *arguments) == ([], [])
+
+
+@pytest.mark.parametrize("arguments", [[], ["--recovery-failed", "iqn.a"]])
+def test_where_there_is_no_systemd_people_are_told_at_once(bare_box, arguments):
+    bare_box.default("remvol-notify")
+    assert news(bare_box, *arguments) == ([], [arguments])
+
+
 # --- the initiator ---
 
 FILES = {"/etc/iscsi/iscsid.conf": "of Debian\n", "/etc/iscsi/initiatorname.iscsi": "InitiatorName=iqn.debian\n"}
 MASKED = ["iscsid.service", "iscsid.socket", "open-iscsi.service"]
-NODE = "/etc/iscsi/nodes/iqn.other/10.1.1.1,3260,1/default"
+OF_ANOTHER = "nodes/iqn.other/10.1.1.1,3260,1/default"
+
+
+@pytest.fixture(params=["/etc/iscsi", "/var/lib/iscsi"])
+def place(request):
+    """Where the initiator has its records: open-iscsi until 2.1.9, and later."""
+    return request.param
 
 
 @pytest.fixture
-def initiator(bare_box):
+def initiator(bare_box, place):
     """A box in which the initiator has its own files, and a target of somebody else."""
-    bare_box.run(["rm", "-rf", "/etc/iscsi", "/etc/systemd/system", "/var/lib/remvol"])
-    for path, text in {**FILES, NODE: "record"}.items():
+    bare_box.run(["rm", "-rf", "/etc/iscsi", "/var/lib/iscsi", "/etc/systemd/system", "/var/lib/remvol"])
+    for path, text in {**FILES, f"{place}/{OF_ANOTHER}": "record"}.items():
         bare_box.write(path, text)
     bare_box.default("deb-systemd-helper")
     return bare_box
@@ -194,22 +251,33 @@ def masked(box):
     return sorted(path.name for path in folder.iterdir() if path.is_symlink()) if folder.exists() else []
 
 
-def test_the_initiator_is_given_back_as_it_was(initiator):
+def test_the_initiator_is_given_back_as_it_was(initiator, place):
     taken = helper(initiator, "initiator", "take")
     assert taken.status == 0
     assert "  recorded: iqn.other at 10.1.1.1:3260\n" in taken.stderr
     assert masked(initiator) == MASKED
     for path in FILES:
         initiator.write(path, "ours")
-    ours = initiator.write("/etc/iscsi/nodes/iqn.ours/10.9.0.2,3260/default", "secret")
+    ours = initiator.write(f"{place}/nodes/iqn.ours/10.9.0.2,3260/default", "secret")
     again = helper(initiator, "initiator", "take")
     assert (again.status, again.stderr) == (0, "")
     assert helper(initiator, "initiator", "give").status == 0
     assert {path: initiator.path(path).read_text() for path in FILES} == FILES
-    assert initiator.path(NODE).read_text() == "record"
+    assert initiator.path(f"{place}/{OF_ANOTHER}").read_text() == "record"
     assert not ours.exists() and not ours.parent.parent.exists()
     assert masked(initiator) == []
     assert not initiator.path("/var/lib/remvol/initiator").exists()
+
+
+@pytest.mark.parametrize("place", ["/etc/iscsi"])
+def test_records_that_an_update_of_the_initiator_has_moved_stay_whose_they_were(initiator):
+    helper(initiator, "initiator", "take")
+    ours = initiator.write("/etc/iscsi/nodes/iqn.ours/10.9.0.2,3260/default", "secret")
+    initiator.run(["mkdir", "-p", "/var/lib/iscsi"])
+    initiator.run(["mv", "/etc/iscsi/nodes", "/var/lib/iscsi/"])
+    helper(initiator, "initiator", "give")
+    assert initiator.path(f"/var/lib/iscsi/{OF_ANOTHER}").read_text() == "record"
+    assert not initiator.path("/var/lib/iscsi/nodes/iqn.ours").exists() and not ours.exists()
 
 
 def test_a_unit_that_the_administrator_masked_stays_masked(initiator):
@@ -222,7 +290,7 @@ def test_a_unit_that_the_administrator_masked_stays_masked(initiator):
 
 
 def test_an_initiator_without_files_gets_none_back(initiator):
-    initiator.run(["rm", "-r", "/etc/iscsi"])
+    initiator.run(["rm", "-rf", "/etc/iscsi", "/var/lib/iscsi"])
     assert (helper(initiator, "initiator", "take").stderr) == ""
     for path in FILES:
         initiator.write(path, "ours")
@@ -296,17 +364,19 @@ def capabilities(name):
     return set(" ".join(lines).split())
 
 
-def test_the_notifier_may_do_as_the_listeners_child_what_it_may_do_in_its_own_unit():
-    """Whichever is the first to see it has a loss mailed: a mail server's programs need the same of both."""
-    assert "CAP_CHOWN" in capabilities("remvol-notify.service")
-    assert capabilities("remvol-notify.service") <= capabilities("remvol-events.service")
+def test_whoever_has_people_told_they_are_told_with_the_same_rights():
+    """A mail server's programs become its user and give it their files."""
+    for name in ("remvol-notify.service", "remvol-recovery-failed@.service"):
+        assert Unit(name)["Service"]["ExecStart"].lstrip(":").startswith("/usr/bin/remvol-notify")
+    assert {"CAP_CHOWN", "CAP_SETUID", "CAP_SETGID"} <= capabilities("remvol-notify.service.d/notify.conf")
+    assert "--notifier /usr/lib/remvol/notify" in Unit("remvol-events.service")["Service"]["ExecStart"]
 
 
 @pytest.mark.parametrize("path", sorted((PACKAGING / "units").glob("*.service")), ids=lambda path: path.name)
 def test_what_a_unit_starts_is_installed(path):
     helpers = {p.name for p in (PACKAGING / "helpers").iterdir()}
     ours = {"remvol", "ktree", "remvol-events", "remvol-keeper", "remvol-notify", "winshare_reload", "macshare_reload"}
-    started = [pathlib.PurePath(name) for name in re.findall(r"^Exec\w+=[-+]?(\S+)", path.read_text(), re.M)]
+    started = [pathlib.PurePath(name) for name in re.findall(r"^Exec\w+=[-+:]?(\S+)", path.read_text(), re.M)]
     assert started
     for program in started:
         places = {"/usr/lib/remvol": helpers, "/usr/bin": ours, "/bin": {"sh"}}
