@@ -10,7 +10,9 @@ namespace remvol {
 
 namespace {
 
-constexpr const char* kRecordFolders[] = {"/etc/iscsi/nodes", "/etc/iscsi/ifaces"};
+// open-iscsi has them in /var/lib since 2.1.10 (Debian 13).
+constexpr const char* kRecordFolders[] = {"/etc/iscsi/nodes", "/etc/iscsi/ifaces", "/var/lib/iscsi/nodes",
+                                          "/var/lib/iscsi/ifaces"};
 constexpr int kOpenFolders = 4;
 
 int drop_when_empty(const char* path, const struct stat* info, int type, struct FTW* /*place*/) {

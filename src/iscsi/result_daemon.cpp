@@ -32,7 +32,9 @@ const char* open_results(const ResultDaemon& daemon, const char* output_file) {
 
 void close_results(const ResultDaemon& daemon, const char* socket, const char* output_file) {
   if (output_file == nullptr) return;
-  ktreec_dump(socket, 0, output_file);
+  if (ktreec_dump(socket, 0, output_file) != 0 && socket != nullptr) {
+    LOG(0, "ktreec_dump(%s) failed", output_file);
+  }
   stop(daemon);
 }
 

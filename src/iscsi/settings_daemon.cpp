@@ -2,6 +2,8 @@
 
 #include <unistd.h>
 
+#include <cerrno>
+
 #include "frontend/log.h"
 #include "iscsi/daemon.h"
 #include "support/command.h"
@@ -19,44 +21,56 @@ namespace {
 constexpr char kSettingsPidFile[] = "/var/run/ktree_sock_vv_config.pid";
 constexpr char kFlashCopy[] = "/usr/local/config/vv.xml";
 
-// Exit statuses of ktreec.
+// Exit status of ktreec.
 constexpr int kSettingsRefused = 1;
-constexpr int kTreeUnreachable = 3;
 constexpr int kLoadTries = 10;  // one a second
 
-// Returns the exit status of the command that loads `file` into the tree, which moves all slots at once: a
-// run that has found them empty a moment ago must not take them for garbage.
+// Returns the exit status of the command that loads `file` into the tree, or -1 when it did not come to its
+// end. Loading moves all slots at once: a run that has found them empty a moment ago must not take them for
+// garbage.
 int load_tree(const char* file) {
   const SlotsHeld held(SlotsHeld::kChange);
   slots_move();
-  return command_exit_code(run_command(load_tree_command(kVolumesSocket, file)));
+  const int status = run_command(load_tree_command(kVolumesSocket, file));
+  const int ended = command_exit_code(status);
+  return ended == 0 && status != 0 ? -1 : ended;
 }
 
-// A daemon that a busy machine has not started in its second is waited for: without its settings the tree
-// would count as fresh, and be dumped over them.
-int load_saved_settings() {
-  int ended = load_tree(kSettingsFile);
-  for (int i = 0; i < kLoadTries && ended == kTreeUnreachable && access(kSettingsFile, F_OK) == 0; i++) {
+// Loads what is there: without its settings the tree would count as fresh, and be dumped over them. A daemon
+// that a busy machine has not started in its second is waited for, and a command that could not run is run
+// again.
+int load_surely(const char* file) {
+  int ended = load_tree(file);
+  for (int i = 0; i < kLoadTries && ended != 0 && ended != kSettingsRefused && access(file, F_OK) == 0; i++) {
     sleep(1);
-    ended = load_tree(kSettingsFile);
+    ended = load_tree(file);
   }
   return ended;
 }
 
 // Settings that are missing or damaged are replaced by their copy on the configuration flash.
 void load_settings() {
-  if (load_saved_settings() != kSettingsRefused) return;
+  if (load_surely(kSettingsFile) != kSettingsRefused) return;
   keep_damaged_settings();
-  if (access(kFlashCopy, F_OK) != 0 || load_tree(kFlashCopy) != 0) return;
+  if ((access(kFlashCopy, F_OK) != 0 && errno == ENOENT) || load_surely(kFlashCopy) != 0) return;
   LOG(0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
+}
+
+// A run that was killed between starting the daemon and loading has left a tree that answers and holds
+// nothing.
+bool was_left_empty() {
+  return tree_is_missing(key::kVersion, key::kVersion) &&
+         tree_is_missing(key::kTargetCount, key::kTargetCount) &&
+         (settings_file_has_version(kSettingsFile) || settings_file_has_version(kFlashCopy));
 }
 
 }  // namespace
 
 // A killed daemon leaves its pid file behind. The result key was set a moment ago.
 void start_settings_daemon() {
-  if (check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult))) return;
-  start_tree_daemon(kVolumesSocket);
+  const bool runs = check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult));
+  if (runs && !was_left_empty()) return;
+  if (!runs) start_tree_daemon(kVolumesSocket);
   load_settings();
 }
 

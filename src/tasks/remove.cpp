@@ -7,6 +7,7 @@
 #include "support/text.h"
 #include "tasks/requested_lun.h"
 #include "tasks/whole_target.h"
+#include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
 #include "tree/slots.h"
@@ -29,14 +30,15 @@ void reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
 }
 
 // Deletes a slot, or the whole target's when `lun_dbidx` is 0; the tree moves the slots behind it down. What
-// another run has deleted meanwhile is deleted. Returns 0 or kNotDeleted.
+// another run has deleted meanwhile is deleted, and so is what a try has deleted whose answer was lost:
+// another one would take the slot that has moved there. Returns 0 or kNotDeleted.
 Result delete_stored_slot(int dbidx, int lun_dbidx) {
   const SlotsHeld held(SlotsHeld::kChange);
-  const HeldSlot slot(dbidx, lun_dbidx);
-  if (!slot) return kOk;
-  const KeyText key =
-      lun_dbidx > 0 ? KeyText(key::kLun, slot.target(), slot.lun()) : KeyText(key::kTarget, slot.target());
   for (int tries = 0; tries < kDeleteTries; tries++) {
+    const HeldSlot slot(dbidx, lun_dbidx);
+    if (!slot) return kOk;
+    const KeyText key =
+        lun_dbidx > 0 ? KeyText(key::kLun, slot.target(), slot.lun()) : KeyText(key::kTarget, slot.target());
     if (delete_slot(key) == kOk) return kOk;
     LOG(0, "ktreec_del() of path '%s' failed", key.c_str());
   }
@@ -55,6 +57,7 @@ Result delete_slot_of_last_lun(int dbidx, int lun) {
   int lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);
   if (lun_dbidx <= 0) lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);  // the read may have failed
   if (has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return delete_stored_slot(dbidx, 0);
+  if (lun_dbidx <= 0 && !tree_is_loaded()) return kNotDeleted;  // nothing can be read
   const Result result = lun_dbidx > 0 ? delete_stored_slot(dbidx, lun_dbidx) : kOk;
   (void)ktree_update_current_luncnt(dbidx);
   return result;

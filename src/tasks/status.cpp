@@ -130,6 +130,7 @@ int task_status() {
   const int count = std::min(atoi(text), kMaxTargets);
   if (refresh_targets(count) != kOk || refresh_ended_work_behind(count) != kOk) return kTreeFailed;
   prune_slots_behind(count);
+  if (has_counted_gone_target()) (void)ktree_update_current_targetcnt();
   LOG(2, "end");
   return kOk;
 }

@@ -91,6 +91,14 @@ bool load_target(int n, int* result) {
   return mounted;
 }
 
+// Returns whether a volume is mounted from the target's session, after logging so: a listing of the sessions
+// that failed, or a disk that does not run just now, is no reason to pull it from under a volume.
+bool is_session_needed(const char* target_name) {
+  if (!has_session_volume(target_name)) return false;
+  LOG(0, "the session of target %s stays, a volume is mounted from it", target_name);
+  return true;
+}
+
 }  // namespace
 
 int Target_Logout(TargetEntry* entry) {
@@ -107,11 +115,7 @@ void give_up_session(TargetEntry* entry, int reason, VolumeState state) {
   } else if (reason == kNoRunningDisk) {
     LOG(1, "Can not find Device for Target: %s on iscsiadm -m session", entry->target_name);
   }
-  // A listing that failed, or a disk that does not run just now, is no reason to pull it from under a volume.
-  if (has_session_volume(entry->target_name)) {
-    LOG(0, "the session of target %s stays, a volume is mounted from it", entry->target_name);
-    return;
-  }
+  if (is_session_needed(entry->target_name)) return;
   // Written after a logout that worked; readers of the log know it so.
   if (Target_Logout(entry) == kOk) LOG(1, "Logout Fail on Target: %s ", entry->target_name);
   (void)ktree_record_connect_set(entry);
@@ -124,7 +128,7 @@ int _target_disconnect(const TargetEntry* entry) {
     LOG(0, "parameter error");
     return kFailed;
   }
-  return log_out(entry);
+  return is_session_needed(entry->target_name) ? kOk : log_out(entry);
 }
 
 int Target_Disconnect(TargetEntry* entry) {

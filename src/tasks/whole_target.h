@@ -16,7 +16,8 @@ namespace remvol {
 // are logged in the innermost scope's name.
 void give_up_session(TargetEntry* entry, int reason, VolumeState state);
 
-// Logs out and changes nothing else. Returns 0, 1 when the command failed, -1 for an empty target name.
+// Logs out and changes nothing else, unless a volume is mounted from the session, which is logged. Returns 0,
+// 1 when the command failed, -1 for an empty target name.
 [[nodiscard]] int _target_disconnect(const TargetEntry* entry);
 
 // Unmounts all volumes of the target, reloads the shares, logs out and stores that the target stays

@@ -76,6 +76,13 @@ bool has_uncounted_target() {
   return false;
 }
 
+bool has_counted_gone_target() {
+  const SlotsHeld held;
+  const int count = tree_read_number(key::kTargetCount, 0);
+  return count >= 1 && count <= kMaxTargets &&
+         tree_is_missing(KeyText(key::kTargetName, count), key::kTargetCount);
+}
+
 void drop_half_made_luns() {
   const SlotsHeld held(SlotsHeld::kChange);
   for (int n = 1; n <= kMaxTargets; n++) drop_half_made_luns_of(n);

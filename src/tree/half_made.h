@@ -16,6 +16,9 @@ void drop_half_made_slots();
 // killed in between.
 [[nodiscard]] bool has_uncounted_target();
 
+// Returns whether a counted slot holds no target, since a run was killed after it had deleted one.
+[[nodiscard]] bool has_counted_gone_target();
+
 }  // namespace remvol
 
 #endif

@@ -89,17 +89,17 @@ void forget_changed_slots() {
 // is looked at again.
 enum class Belief { kSinceCommand, kAny };
 
-// Reads the value at `key`, which defines a slot, or takes it from `seen` while the slots are held; null:
+// Reads the value at key(), which defines a slot, or takes it from `seen` while the slots are held; null:
 // nothing is kept of it. Returns what tree_get() does.
-template <size_t N>
-int get_slot_value(const char* key, Seen<N>* seen, TreeValue& value, Belief belief) {
+template <size_t N, typename Key>
+int get_slot_value(Key key, Seen<N>* seen, TreeValue& value, Belief belief) {
   if (!are_locked) seen = nullptr;
   if (seen != nullptr && seen->what != seen->kNothing &&
       (belief == Belief::kAny || seen->commands == commands_noticed)) {
-    copy_text(value, seen->value);
+    memcpy(value, seen->value, N);
     return seen->what == seen->kMissing ? -1 : static_cast<int>(strlen(value));
   }
-  const int length = tree_get(key, value, sizeof value);
+  const int length = tree_get(key(), value, sizeof value);
   if (seen == nullptr) return length;
   *seen = {};
   seen->commands = commands_noticed;
@@ -124,12 +124,12 @@ int known_lun(int n, int m) {
 
 int get_target_name(int n, TargetName& name, Belief belief) {
   auto* const seen = is_target_slot(n) ? &seen_slots[n].target : nullptr;
-  return get_slot_value(KeyText(key::kTargetName, n), seen, name, belief);
+  return get_slot_value([n] { return KeyText(key::kTargetName, n); }, seen, name, belief);
 }
 
 int get_lun_number(int n, int m, TreeValue& number, Belief belief) {
   auto* const seen = is_lun_slot(n, m) ? &seen_slots[n].luns[m] : nullptr;
-  return get_slot_value(KeyText(key::kLunNumber, n, m), seen, number, belief);
+  return get_slot_value([n, m] { return KeyText(key::kLunNumber, n, m); }, seen, number, belief);
 }
 
 bool holds_target(int n, const char* target_name) {

@@ -38,18 +38,23 @@ int set_failed() {
   return kFailed;
 }
 
+// Whatever comes of the upgrade it is not tried again, so a write is.
+int write_surely(const char* key, const char* value) {
+  return tree_write(key, value) == kOk ? kOk : tree_write(key, value);
+}
+
 int set_value(const char* key, const char* value) {
-  return tree_write(key, value) == kOk ? kOk : set_failed();
+  return write_surely(key, value) == kOk ? kOk : set_failed();
 }
 
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Wformat-nonliteral"  // the formats are those of the table above
 void move_state(int n, const MovedState& state) {
   TreeValue value;
-  if (!tree_read(KeyText(state.from, n), value)) return;
+  if (!tree_read_surely(KeyText(state.from, n), value, sizeof value)) return;
   const KeyText key(state.to, n, kLunSlot);
   const NumberText number("%d", atoi(value));
-  if (tree_write(key, number) != kOk) LOG(0, "ktreec_set %s= %s failed", key.c_str(), number.c_str());
+  if (write_surely(key, number) != kOk) LOG(0, "ktreec_set %s= %s failed", key.c_str(), number.c_str());
 }
 #pragma GCC diagnostic pop
 
@@ -57,7 +62,7 @@ void move_state(int n, const MovedState& state) {
 // those who read the log know it.
 int move_share(int n) {
   TreeValue share;
-  if (!tree_read(KeyText(key::kOldShare, n), share)) return set_failed();
+  if (!tree_read_surely(KeyText(key::kOldShare, n), share, sizeof share)) return set_failed();
   return set_value(KeyText(key::kLunShare, n, kLunSlot), share);
 }
 
@@ -91,7 +96,7 @@ int upgrade_target(int n) {
 
 int upgrade_targets() {
   TreeValue text;
-  if (!tree_read(key::kTargetCount, text)) {
+  if (!tree_read_surely(key::kTargetCount, text, sizeof text)) {
     LOG(1, "%s is NULL or disappear, exit func", key::kTargetCount);
     return kOk;
   }

@@ -30,7 +30,7 @@ PathText sysfs_dir(const char* name) {
 
 bool parse_number(const char* text, unsigned* number) {
   errno = 0;
-  *number = static_cast<unsigned>(strtol(text, nullptr, 10));
+  *number = static_cast<unsigned>(strtoll(text, nullptr, 10));  // a long may be too short
   if (errno == 0) return true;
   const int error = errno;
   LOG(0, "strtol failed, error = %d (%s)", error, strerror(error));

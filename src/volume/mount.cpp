@@ -25,6 +25,7 @@
 #include "volume/mount_table.h"
 #include "volume/partition.h"
 #include "volume/share_services.h"
+#include "volume/unmount.h"
 
 namespace remvol {
 
@@ -319,6 +320,7 @@ Result Target_mount_all_lun(TargetEntry* entry, int force_format, int update_sha
   while (luns.next(&lun)) {
     (void)Target_mount(&lun, force_format, update_share);
     (void)ktree_update_lun_status(&lun, 0);
+    unmount_if_deleted(&lun);
   }
   LOG(2, "end");
   return kOk;

@@ -13,8 +13,8 @@ namespace remvol {
 // the result is kMounted and the volume state 3.
 MountResult Target_mount(TargetEntry* entry, int force_format, int update_share);
 
-// Mounts every LUN of the target up to the first empty slot and refreshes its status. Returns 0, or -1 for a
-// null entry or a db_idx below 1.
+// Mounts every LUN of the target up to the first empty slot and refreshes its status. One that was deleted
+// meanwhile is unmounted. Returns 0, or -1 for a null entry or a db_idx below 1.
 Result Target_mount_all_lun(TargetEntry* entry, int force_format, int update_share);
 
 }  // namespace remvol

@@ -73,7 +73,7 @@ Mounted search_table(Fits fits, MountLine* mount) {
     if (parse_line(buffer, mount) && fits(*mount)) found = Mounted::kYes;
   }
   const Memory<char> owner(buffer);
-  return found == Mounted::kNo && ferror(table.get()) != 0 ? Mounted::kUnknown : found;
+  return found == Mounted::kNo && feof(table.get()) == 0 ? Mounted::kUnknown : found;
 }
 
 // The table may miss lines while another process unmounts (until kernel 5.8): "not mounted" counts only when

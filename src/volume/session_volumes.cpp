@@ -1,5 +1,6 @@
 #include "volume/session_volumes.h"
 
+#include <cerrno>
 #include <cstring>
 
 #include "frontend/log.h"
@@ -24,14 +25,16 @@ bool is_session_volume(const MountLine& mount, const void* target_name) {
          is_session_disk(mount.source, static_cast<const char*>(target_name));
 }
 
-bool find_session_volume(const char* target_name, MountLine* mount) {
-  return find_mount(is_session_volume, target_name, mount) == Mounted::kYes;
-}
-
-// Returns whether none is left.
+// Returns whether none is left. A table that is there and cannot be read may show one.
 bool unmount_session_volumes(const char* target_name) {
   MountLine mount;
-  for (int volumes = 0; find_session_volume(target_name, &mount); volumes++) {
+  for (int volumes = 0;; volumes++) {
+    const Mounted found = find_mount(is_session_volume, target_name, &mount);
+    if (found == Mounted::kNo || (found == Mounted::kUnknown && errno == ENOENT)) return true;
+    if (found == Mounted::kUnknown) {
+      LOG(0, "%s cannot be read: %s, no session is closed", kMountInfo, strerror(errno));
+      return false;
+    }
     TargetEntry entry = {};
     copy_text(entry.share, mount.path + strlen(kMountRoot));
     copy_text(entry.mnt_dev, mount.source);
@@ -39,14 +42,13 @@ bool unmount_session_volumes(const char* target_name) {
     LOG(0, "the session of %s stays, it is mounted on %s", mount.source, mount.path);
     return false;
   }
-  return true;
 }
 
 }  // namespace
 
 bool has_session_volume(const char* target_name) {
   MountLine mount;
-  return find_session_volume(target_name, &mount);
+  return find_mount(is_session_volume, target_name, &mount) == Mounted::kYes;
 }
 
 int close_sessions(const char* target_name, const char* logout) {

@@ -11,8 +11,9 @@ namespace remvol {
 
 // Closes the target's session, or all for null, by the command `logout`. Volumes that are mounted still,
 // since the tree does not know them or another run has mounted them meanwhile, are unmounted before; no run
-// mounts one until the command has ended. Returns 0; or 1 when the command failed, or a volume stays mounted,
-// which is logged at level 0 in the innermost scope's name: then the command does not run.
+// mounts one until the command has ended. Returns 0; or 1 when the command failed, or a volume stays mounted
+// or the kernel's table of mounts cannot be read, which is logged at level 0 in the innermost scope's name:
+// then the command does not run.
 [[nodiscard]] int close_sessions(const char* target_name, const char* logout);
 
 }  // namespace remvol

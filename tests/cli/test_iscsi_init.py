@@ -137,6 +137,20 @@ def test_settings_of_the_old_layout_are_upgraded_before_anything_is_loaded(box, 
     assert sets.index("set /iscsi/initiator/ver=1") < sets.index("run killall -q -SIGTERM iscsid")
 
 
+@pytest.mark.parametrize("function, key", [("ktreec_get_wb", "count"), ("ktreec_get_wb", "id:1/share"),
+                                           ("ktreec_get_wb", "id:1/format_state"), ("ktreec_set", "id:1/lun/count"),
+                                           ("ktreec_set", "id:1/lun/id:1/lun"), ("ktreec_set", "id:1/lun/id:1/enable"),
+                                           ("ktreec_set", "id:1/lun/id:1/share"), ("ktreec_set", "id:1/lun/id:1/format_state")])
+def test_one_access_that_fails_ends_no_upgrade(box, initiator, function, key):
+    """It is not tried again: the version is the new one, whatever came of it."""
+    box.tree.set({"/iscsi/initiator/id:1/target": T1, "/iscsi/initiator/id:1/share": "old",
+                  "/iscsi/initiator/id:1/format_state": "3", "/iscsi/initiator/count": "1"})
+    box.hook(function, f"/iscsi/initiator/{key}", ret=-1, times=1)
+    init(box)
+    lun = {name: box.tree.get(f"/iscsi/initiator/id:1/lun/id:1/{name}") for name in ("lun", "enable", "share", "format_state")}
+    assert lun == {"lun": "0", "enable": "1", "share": "old", "format_state": "3"}
+
+
 def test_current_settings_are_not_converted(box, initiator):
     box.tree.set({"/iscsi/initiator/ver": "1", "/iscsi/initiator/id:1/target": T1,
                   "/iscsi/initiator/id:1/share": "old", "/iscsi/initiator/count": "1",
@@ -158,22 +172,23 @@ def test_every_failure_is_logged_and_the_next_step_runs(box, initiator):
     assert box.tree.get("/iscsi/initiator/iqn") == NAME
 
 
-def test_records_that_a_power_cut_left_empty_are_removed(box, initiator):
-    folder = "/etc/iscsi/nodes/iqn.2026-01.org.example:t1"
-    empty = [f"{folder}/10.9.0.2,3260", f"{folder}/10.9.1.2,3260,1/iface0", "/etc/iscsi/ifaces/iface1"]
-    whole = [f"{folder}/10.9.0.3,3260", "/etc/iscsi/ifaces/iface0"]
+@pytest.mark.parametrize("place", ["/etc/iscsi", "/var/lib/iscsi"])  # open-iscsi until 2.1.9, and later
+def test_records_that_a_power_cut_left_empty_are_removed(box, initiator, place):
+    folder = f"{place}/nodes/iqn.2026-01.org.example:t1"
+    empty = [f"{folder}/10.9.0.2,3260", f"{folder}/10.9.1.2,3260,1/iface0", f"{place}/ifaces/iface1"]
+    whole = [f"{folder}/10.9.0.3,3260", f"{place}/ifaces/iface0"]
     for path in empty:
         box.write(path, "")
     for path in whole:
         box.write(path, "# BEGIN RECORD 2.1.8\n")
-    box.path("/etc/iscsi/ifaces/link").symlink_to("/etc/iscsi/elsewhere")
-    box.write("/etc/iscsi/elsewhere", "")
+    box.path(f"{place}/ifaces/link").symlink_to(f"{place}/elsewhere")
+    box.write(f"{place}/elsewhere", "")
     done = init(box)
     assert box.trace() == bring_up()
     assert [path for path in empty if box.path(path).exists()] == []
     assert sorted(re.findall(r": the empty record (\S+) is removed", done.stdout)) == sorted(empty)
-    assert all(box.path(path).exists() for path in [*whole, "/etc/iscsi/elsewhere"])
-    assert box.path("/etc/iscsi/ifaces/link").is_symlink()
+    assert all(box.path(path).exists() for path in [*whole, f"{place}/elsewhere"])
+    assert box.path(f"{place}/ifaces/link").is_symlink()
 
 
 def test_missing_modules_and_a_missing_iscsiadm_leave_a_clear_state(box, initiator):

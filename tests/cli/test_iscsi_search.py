@@ -219,6 +219,13 @@ def test_with_an_output_file_a_private_tree_holds_the_names(box):
     }
 
 
+def test_an_output_file_that_cannot_be_written_is_told(box):
+    private_tree(box, "search")
+    box.fake("iscsiadm", "-m discovery", stdout=lines("iqn.x:a"))
+    done = search(box, "-o", "/tmp/missing/out.xml")
+    assert "): ktreec_dump(/tmp/missing/out.xml) failed\n" in done.stdout
+
+
 def load(box, file):
     assert box.run(["ktreec", "-S", "/var/run/ktree_sock_vv", "-l", file], env={"LD_PRELOAD": None}).status == 0
 

@@ -387,6 +387,12 @@ class TestASessionUnderAVolume:
         assert box.remvol(*command).status == 0
         assert stored.mounted("other")
 
+    def test_a_search_closes_no_session_that_a_listing_did_not_show(self, unknown, box):
+        box.fake("iscsiadm", "-m session", times=1)
+        said = messages(box.remvol("--search_lun", "-n", "iqn.t1", "-c", "0", "-i", "10.9.0.2", "-p", "3260"))
+        assert "the session of target iqn.t1 stays, a volume is mounted from it" in said
+        assert unknown.logged_in("iqn.t1") and unknown.mounted("unknown")
+
     def test_a_listing_that_fails_gives_no_session_up(self, unknown, box):
         box.fake("iscsiadm", "-m session -P3", status=1)
         said = messages(box.remvol("--connect", "-n", "iqn.t1"))

@@ -24,8 +24,8 @@ def sessions(box, connected=True, disk=True):
     initiator.log_in(name)
 
 
-def mount_volume(box):
-    box.run(["/bin/sh", "-c", "mkdir -p /mnt/VV/data && /bin/mount -t tmpfs -o size=1m volume /mnt/VV/data"])
+def mount_volume(box, size=1 << 20):
+    box.run(["/bin/sh", "-c", f"mkdir -p /mnt/VV/data && /bin/mount -t tmpfs -o size={size} volume /mnt/VV/data"])
 
 
 def status(box):
@@ -99,6 +99,15 @@ def test_a_mounted_volume_is_running_and_shows_its_size(box, right, text):
     assert status(box) == text
     used, total = box.tree.get(f"{LUN}/size").split("/")
     assert int(total) == 1 << 20 and int(used) < int(total)
+
+
+def test_the_size_of_a_volume_may_be_beyond_16_tebibytes(box):
+    store(box)
+    sessions(box)
+    mount_volume(box, size=20 << 40)
+    box.hook("sys_get_fs_type", "/dev/sdb1", out="ext4", ret=0)
+    assert status(box) == "Running"
+    assert box.tree.get(f"{LUN}/size").split("/")[1] == str(20 << 40)
 
 
 def test_a_format_shows_its_progress(box):

@@ -7,6 +7,7 @@ from harness import messages
 from harness.initiator import SHARES
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
+DELETED = "ktreec -S /var/run/ktree_sock_vv -d /iscsi/initiator/id:1"
 RECORD_DELETE = "iscsiadm -m node -I default -T iqn.t1 -p 10.9.0.2:3260 -o delete"
 
 
@@ -96,6 +97,13 @@ class TestTarget:
         assert trace[trace.index("del id:1"):last] == ["del id:1"] * min(failures + 1, 4)
         assert_order(trace, "del id:1", f"set count={1 if failures == 4 else 0}")
 
+    def test_a_slot_that_is_deleted_though_the_answer_is_lost_is_deleted_once(self, site, box):
+        site.store("iqn.t1")
+        site.store("iqn.t2", slot=2)
+        box.hook("ktreec_del", "/iscsi/initiator/id:1", ret=-1, times=1, effect=DELETED)
+        assert box.remvol("--del", "-n", "iqn.t1").status == 0
+        assert (site.target("target"), site.target("target", 2)) == ("iqn.t2", None)
+
     @pytest.mark.parametrize("name", ["iqn.t3", "iqn.t", "", "x" * 255])
     def test_an_unknown_target_refreshes_the_count_alone(self, site, box, name):
         site.store("iqn.t1", luns=[("a", 0)])
@@ -164,6 +172,12 @@ class TestLun:
         assert site.trace().count("del id:1/lun/id:1") == min(failures + 1, 4)
         assert_order(site.trace(), "del id:1/lun/id:1", f"set id:1/lun/count={2 if failures == 4 else 1}")
 
+    def test_a_slot_that_is_deleted_though_the_answer_is_lost_is_deleted_once(self, site, box):
+        site.store("iqn.t1", luns=[("a", 0), ("b", 1), ("c", 2)])
+        box.hook("ktreec_del", "/iscsi/initiator/id:1/lun/id:1", ret=-1, times=1, effect=f"{DELETED}/lun/id:1")
+        assert box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0").status == 0
+        assert [site.lun("share", n) for n in (1, 2, 3)] == ["b", "c", None]
+
     def test_a_failed_unmount_does_not_stop_it(self, mounted, box):
         box.fake("rm", status=1)
         assert box.remvol("--del_lun", "-n", "iqn.t1", "-l", "1").status == 0
@@ -212,6 +226,15 @@ class TestLun:
         box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0")
         assert {"y", "z"} <= {mounted.lun("share", n) for n in (1, 2, 3)}
         assert mounted.logged_in("iqn.t1") and mounted.mounted("y") and mounted.mounted("z")
+
+    @pytest.mark.parametrize("skip", range(0, 64))
+    def test_a_tree_that_cannot_be_read_any_more_does_not_say_that_the_last_lun_is_gone(self, site, box, skip):
+        site.store("iqn.t1", luns=[("a", 0)])
+        site.store("iqn.t2", slot=2, luns=[("b", 0)])
+        box.hook("ktreec_get_wb", ret=-1, skip=skip)
+        done = box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0")
+        assert done.status == 255 or site.target("target") == "iqn.t2" or site.lun("share") is None
+        assert "iqn.t2" in (site.target("target"), site.target("target", 2))
 
     def test_nothing_is_said_of_what_is_only_looked_at(self, site, box):
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])

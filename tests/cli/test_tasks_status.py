@@ -1,5 +1,7 @@
 """--status."""
 
+import os
+
 import pytest
 
 from appliance import assert_order, settings
@@ -41,6 +43,21 @@ class TestTargets:
         site.store("iqn.t1")
         status(box)
         assert not any("flashrun" in line or "reload" in line for line in box.shell())
+
+    def test_asked_again_when_nothing_has_changed_it_writes_nothing_to_the_disk(self, site, box):
+        site.store("iqn.t1", luns=[("a", 0)])
+        site.offer("iqn.t1", {0: "sdb"})
+        site.log_in("iqn.t1")
+        site.disk("sdb")
+        box.path("/etc/NAS_CFG").mkdir(exist_ok=True)
+        saved = box.path("/etc/NAS_CFG/vv.xml")
+        assert status(box).status == 0
+        with saved.open() as before:
+            assert status(box).status == 0
+            assert os.path.samestat(os.stat(before.fileno()), saved.stat())
+            site.tree.set(f"{INITIATOR}/id:1/lun/id:1/share", "b")
+            assert status(box).status == 0
+            assert not os.path.samestat(os.stat(before.fileno()), saved.stat())
 
     @pytest.mark.parametrize("value", [None, ""])
     def test_without_a_count(self, site, box, value):
@@ -194,6 +211,7 @@ class TestBrokenSlots:
         assert done.status == 0
         assert site.target("status") == "Disconnected"
         assert messages(done) == [f"ktreec_del() of path '{INITIATOR}/id:{n}' failed" for n in (2, 3)]
+        assert box.tree.get(f"{INITIATOR}/count") == "1"
 
     @pytest.mark.parametrize("count", ["2147483647", "99999999999999999999"])
     def test_a_senseless_count_ends_all_the_same(self, site, box, count):

@@ -28,6 +28,12 @@ unsigned refusals = 0;
 
 }  // namespace
 
+// The function's name where offsets of 64 bits are not the processor's own.
+#if __SIZEOF_LONG__ == 4
+#define __real_fallocate __real_fallocate64
+#define __wrap_fallocate __wrap_fallocate64
+#endif
+
 // The memory of a file, of which there may be little.
 extern "C" int __real_fallocate(int fd, int mode, off_t offset, off_t size);
 extern "C" int __wrap_fallocate(int fd, int mode, off_t offset, off_t size) {

@@ -56,6 +56,10 @@ TEST_F(Partition, ExpansionComparesIn64Bits) {
   fakes::on("sys_get_disk_space", "/dev/sdb").returns(16LL << 40);
   fakes::on("sys_get_partition_size", "sdb1").returns((16LL << 40) - 100'000'000);
   EXPECT_EQ(check_1part_disk_need_to_expand("/dev/sdb"), 0);
+  fakes::on("sys_get_disk_space", "/dev/sdc").returns(20LL << 40);  // in 32 bits both sizes are 0
+  fakes::on("sys_get_partition_list", "/dev/sdc").text("sdc1").returns(1);
+  fakes::on("sys_get_partition_size", "sdc1").returns(16LL << 40);
+  EXPECT_EQ(check_1part_disk_need_to_expand("/dev/sdc"), 1);
 }
 
 TEST_F(Partition, ExpansionNeedsExactlyOnePartition) {

@@ -2,12 +2,14 @@
 #include "volume/unmount.h"
 
 #include <fcntl.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
 
 #include "volume/bare_folder.h"
+#include "volume/session_volumes.h"
 #include "volume_fixture.h"
 
 using namespace remvol;
@@ -75,6 +77,22 @@ TEST_F(Unmount, AFolderThatIsNotMountedIsRemoved) {
   not_mounted();
   EXPECT_EQ(unmount(), 0);
   EXPECT_EQ(fakes::commands(), (Texts{kKillDevice, kRemove}));
+}
+
+TEST_F(Unmount, NoSessionIsClosedWhileTheTableOfMountsCannotBeRead) {
+  int result = 0;
+  log = fakes::output_of([&] {
+    rlimit before{};
+    getrlimit(RLIMIT_NOFILE, &before);
+    const rlimit none = {0, before.rlim_max};
+    setrlimit(RLIMIT_NOFILE, &none);
+    result = close_sessions("iqn.t1", "logout");
+    setrlimit(RLIMIT_NOFILE, &before);
+  });
+  EXPECT_EQ(result, 1);
+  EXPECT_EQ(fakes::calls(), Texts{});
+  EXPECT_TRUE(has(log, "/proc/self/mountinfo cannot be read: Too many open files, no session is closed"));
+  EXPECT_EQ(close_sessions("iqn.t1", "logout"), 0);
 }
 
 TEST_F(Unmount, BadEntriesTouchNothing) {

@@ -42,7 +42,7 @@ void wait_for_test(const char* word) {
   if (fgets(line, sizeof line, stdin) == nullptr) return;
 }
 
-long microseconds() {
+long long microseconds() {
   timespec now{};
   clock_gettime(CLOCK_MONOTONIC, &now);
   return now.tv_sec * 1000000 + now.tv_nsec / 1000;
@@ -50,9 +50,9 @@ long microseconds() {
 
 int do_mount(char** arguments) {
   if (!load(arguments)) return -999;
-  const long began = microseconds();
+  const long long began = microseconds();
   const int result = Target_mount(&entry, number(arguments[2]), number(arguments[3]));
-  printf("took = %ld microseconds\n", microseconds() - began);
+  printf("took = %lld microseconds\n", microseconds() - began);
   return result;
 }
 int do_mount_all(char** arguments) {
