@@ -15,6 +15,7 @@ sys.path.insert(0, str(pathlib.Path(__file__).parent))
 from faults import Faults, Outcomes  # noqa: E402
 from many import Round  # noqa: E402
 from pairs import PAIRS, torment  # noqa: E402
+import disks  # noqa: E402
 import fuzz  # noqa: E402
 import power  # noqa: E402
 import replay  # noqa: E402
@@ -158,6 +159,7 @@ def main():
     faults.add_argument("--shard", type=shard, default=(0, 1), help="I/N: the I-th of N parts, from 0")
     faults.add_argument("--results", help="file for what became of each; those that stand in it are not tried again")
     faults.set_defaults(run=run_faults)
+    disks.add_form(forms)
     fuzz.add_form(forms)
     power.add_form(forms)
     replay.add_form(forms)

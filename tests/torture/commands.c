@@ -272,6 +272,19 @@ static int node_record(char** argv) {
   return 0;
 }
 
+/* A portal offers every target with a LUN; a record is made for those that have none. */
+static int discover(char** argv) {
+  const char* portal = option(argv, "-p");
+  if (portal == NULL) return 7;
+  for (int t = 1; t <= TARGETS; t++) {
+    struct target* target = &world->targets[t];
+    if (!target->luns[0].offered) continue;
+    target->record = 1;
+    if (!muted) printf("%s,1 " NAME_BASE "%d\n", portal, t);
+  }
+  return 0;
+}
+
 static int do_iscsiadm(char** argv) {
   const char* mode = option(argv, "-m");
   int login = has(argv, "--login");
@@ -283,6 +296,8 @@ static int do_iscsiadm(char** argv) {
     status = list_sessions(has(argv, "-P3") || has(argv, "-P"));
   } else if (strcmp(mode, "iface") == 0) {
     status = 0;
+  } else if (strcmp(mode, "discovery") == 0) {
+    status = discover(argv);
   } else if (login) {
     status = log_in(target_number(argv));
   } else if (has(argv, "--logout")) {

@@ -1,7 +1,6 @@
 """What must hold of the tree, the settings file and the disks once every run has ended and `--status` has run."""
 
 import re
-import time
 
 from world import FLASH, INITIATOR, LUNS, NAME, SAVED, TARGETS
 
@@ -109,11 +108,11 @@ def disk_findings(world):
         share = point.rsplit("/", 1)[1]
         if len(sources) > 1:
             wrong.append(f"mounted-twice: {point} from {sources}")
-        try:
-            t, l, stamp = map(int, (world.box.path(point) / ".data").read_text().split())
-        except (OSError, ValueError):
+        mark = world.mark(point)
+        if mark is None:
             wrong.append(f"files-lost: the files of the volume at {point} are gone")
             continue
+        t, l, stamp = mark
         lun = state[t][3][l]
         if not lun.dev:
             wrong.append(f"pulled: {point} is mounted from {sources[-1]}, and t{t} has no session")
@@ -123,42 +122,28 @@ def disk_findings(world):
             wrong.append(f"foreign-disk: the share {share} is of {known[share]} and shows t{t} LUN {l}")
         if share not in known:
             wrong.append(f"left-over: {point} is mounted and no slot has it")
-    folder = world.box.path("/mnt/VV")
-    for entry in folder.iterdir() if folder.exists() else ():
-        if f"/mnt/VV/{entry.name}" not in world.mounts():
-            wrong.append(f"left-over: the folder {entry.name} in /mnt/VV without a mount")
+    for name in world.folders():
+        if f"/mnt/VV/{name}" not in world.mounts():
+            wrong.append(f"left-over: the folder {name} in /mnt/VV without a mount")
     return wrong
 
 
 def settings_findings(world):
     """The settings file and its flash copy are whole, and the file is the tree."""
-    wrong, box = [], world.box
-    other = "/run/other"
-    second = box.start(["ktree", "-n", "config", "-s", other], env={"LD_PRELOAD": None})
-    try:
-        end = time.monotonic() + 10
-        # Its socket is there before it can be reached.
-        while box.run(["ktreec", "-S", other, "-t"], env={"LD_PRELOAD": None}).status == 3 and time.monotonic() < end:
-            box.pump(0.005)
-        for file in (SAVED, FLASH):
-            if not box.path(file).exists():
-                wrong.append(f"settings: no {file}")
-                continue
-            load = box.run(["ktreec", "-S", other, "-l", file], env={"LD_PRELOAD": None})
-            if load.status != 0:
-                wrong.append(f"settings: {file} cannot be loaded: {load.stderr}")
-            elif file == SAVED:
-                saved = box.run(["ktreec", "-S", other, "-t", INITIATOR], env={"LD_PRELOAD": None}).stdout
-                here = world.ktreec("-t", INITIATOR).stdout
-                if sorted(saved.split("\n")) != sorted(here.split("\n")):
-                    wrong.append("settings: the file is not the tree, although --status wrote it last")
-    finally:
-        second.kill(9)
-        second.wait()
+    wrong, settings = [], world.settings()
+    for file in (SAVED, FLASH):
+        if file not in settings:
+            wrong.append(f"settings: no {file}")
+            continue
+        error, lines = settings[file]
+        if error:
+            wrong.append(f"settings: {file} cannot be loaded: {error}")
+        elif file == SAVED and sorted(lines) != sorted(world.tree_lines()):
+            wrong.append("settings: the file is not the tree, although --status wrote it last")
     return wrong
 
 
 def lock_findings(world):
     """Nothing blocks: the format semaphore is gone, or free (a run that was killed leaves it so)."""
-    value = world.box.run(["world", "semaphore"], env={"LD_PRELOAD": None}).stdout.strip()
+    value = world.semaphore()
     return [f"left-over: the format semaphore stands at {value} and nobody runs"] if value not in ("", "1") else []

@@ -54,10 +54,12 @@ def first_seed(wanted):
     return wanted if wanted is not None else random.SystemRandom().randrange(1 << 30)
 
 
-def prepare():
-    """The scenario and the archive of the project that every machine boots with."""
+def prepare(script="power.sh"):
+    """The scenario, which ends with answer.sh, and the archive of the project that every machine boots with."""
     os.environ["LAB_BUILD"] = str(build())
-    scenario = lab.Scenario(str(pathlib.Path(__file__).parent / "power.sh"))
+    folder = pathlib.Path(__file__).parent
+    scenario = lab.Scenario(str(folder / script))
+    scenario.text += (folder / "answer.sh").read_text()
     lab.CACHE.mkdir(parents=True, exist_ok=True)
     projects = lab.project_archives([scenario])
     lab.prepare_bases([scenario])

@@ -9,7 +9,7 @@ import re
 # What the next --status or --connect writes again. Its writers' results are not looked at by the commands.
 SHOWN = r"status|size|conn_state|dev|format_state|format_progress|volume_state|mnt|mnt_dev|fs_type|vol_access_right"
 COUNTS = r"count|total_lun_count"
-BRINGS_UP = r"^(connect|connect-again|modify|init|recover)$"
+BRINGS_UP = r"^(connect|modify|init|recover)"
 
 SUCCESS = (
     ("", rf"tree /iscsi/initiator/id:\d+/(lun/id:\d+/)?({SHOWN}):",
@@ -22,30 +22,47 @@ SUCCESS = (
      "the result of the dump is not looked at; that it failed is told at level 0"),
     (BRINGS_UP, r"(disk|folder|mount) ",
      "a volume that cannot be mounted is told by its volume state and fails no command that brings a target up"),
-    (r"^(modify|init|recover)$", r"target \d",
+    (r"^(modify|init|recover)", r"target \d",
      "a login that fails is told by the connect state, and the command has done its work"),
-    (r"^init$", r"tree /iscsi/initiator/(ver|iqn):",
-     "--init is through whatever failed on the way"),
-    (r"^add$", r"target 4:",
+    (r"^init", r"(daemon: gone|tree /iscsi/initiator/)",
+     "--init is through whatever failed on the way; the next one brings up what is not"),
+    (r"^add(-first|-second)?$", r"target \d:",
      "the node record is made anew by every login, so a failure to make it fails no --add"),
     (r"^add-connected$", r"(disk|folder|mount) ",
      "a LUN that shows no usable disk, cannot be read back, or whose mount does not take hold stays added, and is "
      "mounted by the next --connect"),
-    (r"^recover$", r"tree /temp/remvol/recover/queue/",
+    (r"^recover", r"tree /temp/remvol/recover/queue/",
      "a run that does not get the recover lock, whatever the reason, has put its target into the queue; the next "
      "recovery takes it from there"),
     (r"^format$", r"(folder|mount|disk) ",
      "a mount that never takes hold after the format is told by volume state 3 alone"),
-    (r"^(disconnect|disconnect-all|del|del_lun)$", r"(folder|mount|target) ",
-     "a failure to unmount or to log out stops neither a --disconnect nor a deletion"),
+    (r"^(disconnect|del|deinit|system_off)", r"(folder|mount|target) ",
+     "a failure to unmount or to log out stops neither a --disconnect nor a deletion nor a shutdown"),
+    (r"^(deinit|system_off)$", r"daemon: there",
+     "a failure to end the tree's daemon fails no shutdown"),
+    (r"^(search|search_lun)", r"found: ",
+     "what of a search's results could not be written is told at level 0 and fails no search; its end is in them"),
+    (r"^search$", r"target \d: None for online=0 record=1",
+     "a discovery whose command says 0 has found what it has recorded"),
+    (r"^search_lun", r"target ",
+     "a search that has logged in ends with its own result, whatever the logout's is"),
+    (r"^modify_address", r"(target 3|tree /iscsi/initiator/id:3/(ip|port)):",
+     "a portal that does not offer the target, or cannot be asked, is a refusal, which is printed, and no failure"),
+    (r"^check_share_name", r"result 0 ",
+     "a name is free when no LUN is seen to have it, also in a tree that cannot be read; --add looks again"),
 )
 
 AFTER = (
     ("", r"tree /iscsi/initiator/id:\d+/lun/id:\d+/format_progress:",
      "the progress of a format that came to an early end stays in the tree; nothing shows it"),
-    (r"^(del|del_lun)$", r"(folder|mount|target|disk) ",
+    (r"^del", r"(folder|mount|target|disk) ",
      "a slot is deleted although its volume could not be unmounted or its session closed, and the deletion that is "
      "asked for again finds no slot"),
+    (r"^init-old", r"(tree|settings|folder|mount|target) ?",
+     "after any --init the version is the new one; what of the conversion failed for ever is not tried again"),
+    (r"^search_lun-", r"(target \d|tree /iscsi/initiator/id:\d+/(lun/id:\d+/)?(conn_state|status|dev):)",
+     "a search that ends before its logout leaves the target logged in, and the status says so; nobody can tell any "
+     "more who logged in"),
 )
 
 def reason(fault, text):

@@ -19,6 +19,7 @@
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/sysmacros.h>
+#include <sys/un.h>
 #include <time.h>
 #include <unistd.h>
 
@@ -126,12 +127,10 @@ CALL(int, -1, socket, "", (int family, int type, int protocol), (family, type, p
 CALL(int, -1, connect, "", (int fd, __CONST_SOCKADDR_ARG to, socklen_t size), (fd, to, size))
 CALL(ssize_t, -1, sendmsg, "", (int fd, const struct msghdr* message, int flags), (fd, message, flags))
 CALL(ssize_t, -1, recvmsg, "", (int fd, struct msghdr* message, int flags), (fd, message, flags))
-CALL(int, -1, kill, "", (pid_t pid, int number), (pid, number))
 CALL(int, -1, setpgid, "", (pid_t pid, pid_t group), (pid, group))
 CALL(pid_t, -1, fork, "", (void), ())
 CALL(int, -1, semget, "", (key_t key, int count, int flags), (key, count, flags))
 CALL(int, -1, semop, "", (int id, struct sembuf* what, size_t count), (id, what, count))
-CALL(int, -1, system, command, (const char* command), (command))
 CALL(FILE*, NULL, popen, command, (const char* command, const char* mode), (command, mode))
 CALL(int, EAI_MEMORY, getaddrinfo, node,
      (const char* node, const char* service, const struct addrinfo* hints, struct addrinfo** result),
@@ -263,7 +262,46 @@ PUBLIC int semctl(int id, int number, int command, ...) {
   return REAL(semctl)(id, number, command, last);
 }
 
-/* --- time --- */
+/* --- time: a second, which is short here, is long enough for a daemon to start or to end --- */
+
+enum { DAEMON_TRIES = 5000 }; /* one a millisecond */
+
+static int is_listening(const char* path) {
+  struct sockaddr_un to = {.sun_family = AF_UNIX};
+  int fd = (int)syscall(SYS_socket, AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  snprintf(to.sun_path, sizeof to.sun_path, "%s", path);
+  long status = syscall(SYS_connect, fd, &to, sizeof to);
+  syscall(SYS_close, fd);
+  return status == 0;
+}
+
+static void await_daemon(const char* command) {
+  const struct timespec pause = {0, 1000000};
+  char path[100];
+  if (sscanf(command, "ktree -n config -s %99s", path) != 1) return;
+  for (int i = 0; i < DAEMON_TRIES && !is_listening(path); i++)
+    clock_nanosleep(CLOCK_MONOTONIC, 0, &pause, NULL);
+}
+
+PUBLIC int system(const char* command) {
+  if (due(FAULT_CALL, "system", command)) return -1;
+  int outer = inside;
+  inside = 1;
+  int status = REAL(system)(command);
+  if (in_tool && command != NULL) await_daemon(command);
+  inside = outer;
+  return status;
+}
+
+PUBLIC int kill(pid_t pid, int number) {
+  const struct timespec pause = {0, 1000000};
+  if (due(FAULT_CALL, "kill", "")) return -1;
+  int status = REAL(kill)(pid, number);
+  for (int i = 0; in_tool && number == SIGTERM && i < DAEMON_TRIES && REAL(kill)(pid, 0) == 0; i++) {
+    clock_nanosleep(CLOCK_MONOTONIC, 0, &pause, NULL);
+  }
+  return status;
+}
 
 static void nap(long long microseconds) {
   microseconds = microseconds * world_map()->pace / 5000;

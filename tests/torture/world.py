@@ -30,6 +30,7 @@ FLASH = "/usr/local/config/vv.xml"
 TARGETS, LUNS = 8, 8
 MORE_COMMANDS = "rm mkdir chmod grep cp kill udevadm world".split()
 CONTENT = {0: "nothing", 1: "ext4", 2: "torn"}
+UNREACHABLE = 3  # status of ktreec
 LONG = 60  # seconds: no run takes so long, whatever runs beside it
 
 # struct world
@@ -40,6 +41,18 @@ FAULTS = struct.Struct("12i")
 TARGET_SIZE = TARGET.size + LUNS * LUN.size
 FAULTS_AT = HEAD.size + (TARGETS + 1) * TARGET_SIZE
 SIZE = FAULTS_AT + FAULTS.size
+
+
+def after_boot(state):
+    """The state when the machine has been started anew: node records and disks' contents stay, no session is there."""
+    state = bytearray(state)
+    for t in range(1, TARGETS + 1):
+        at = HEAD.size + t * TARGET_SIZE
+        struct.pack_into("i", state, at, 0)
+        struct.pack_into("i", state, at + 8, 0)
+        for l in range(LUNS):
+            struct.pack_into("i", state, at + TARGET.size + l * LUN.size + 4, 0)
+    return bytes(state)
 
 
 class Lun:
@@ -77,9 +90,9 @@ def arguments(command, t=None, l=None, share=None, **more):
     words = [f"--{command}"]
     if t is not None:
         words += ["-n", NAME.format(t)]
-    if command in ("add", "modify_address"):
+    if command == "add":
         words += ["-i", f"10.9.0.{t}", "-p", "3260"]
-    if command in ("add", "modify"):
+    if command in ("add", "modify", "search_lun"):
         words += ["-c", "1", "-U", f"user{t}", "-P", f"secret{t}secret{t}"]
     if l is not None:
         words += ["-l", str(l)]
@@ -139,11 +152,14 @@ class World:
             if done.status != 0:
                 self.wrong.append(f"daemon: {words} after its start = {done.status}: {done.stderr}")
         if not post:
-            box.wait_until(lambda: self.ktreec("-t").status != 3, what="the tree's daemon")
+            box.wait_until(self.answers, what="the tree's daemon")
 
     def kill_daemon(self, number=9):
         self.daemon.kill(number)
         self.daemon.wait()
+
+    def answers(self):
+        return self.ktreec("-t").status != UNREACHABLE
 
     def ktreec(self, *words):
         return self.box.run(["ktreec", "-S", SOCKET, *words], env={"LD_PRELOAD": None})
@@ -192,7 +208,8 @@ class World:
     def restore(self, snapshot):
         """Before the daemon is started."""
         saved, flash, state, mounts = snapshot
-        self.box.write(SAVED, saved, 0o600)
+        if saved is not None:
+            self.box.write(SAVED, saved, 0o600)
         if flash is not None:
             self.box.write(FLASH, flash, 0o600)
         self.state_file.write_bytes(state)
@@ -204,8 +221,12 @@ class World:
         self.real("world", "degrade", f"/mnt/VV/{share}")
 
     def dump(self):
-        """The whole tree, as its daemon writes it."""
-        self.real("ktreec", "-S", SOCKET, "-D", "/fake/now.xml")
+        """The whole tree, as its daemon writes it; nothing when it does not run."""
+        done = self.ktreec("-D", "/fake/now.xml")
+        if done.status == UNREACHABLE:
+            return b""
+        if done.status != 0:
+            raise RuntimeError(f"the tree is not dumped: {done}")
         return (self.box.root / "fake/now.xml").read_bytes()
 
     def lasting(self):
@@ -293,6 +314,42 @@ class World:
             if point.startswith("/mnt/VV/"):
                 found.setdefault(point, []).append(line[line.index("-") + 2])
         return found
+
+    def mark(self, point):
+        """(target, LUN, stamp) of the data that is seen there; None when it is gone."""
+        try:
+            t, l, stamp = map(int, (self.box.path(point) / ".data").read_text().split())
+        except (OSError, ValueError):
+            return None
+        return t, l, stamp
+
+    def folders(self):
+        folder = self.box.path("/mnt/VV")
+        return [entry.name for entry in folder.iterdir()] if folder.exists() else []
+
+    def tree_lines(self):
+        return self.ktreec("-t", INITIATOR).stdout.splitlines()
+
+    def settings(self):
+        """{file: (what is wrong with it, the lines of the tree that it makes)} of those that are there."""
+        box, found, other = self.box, {}, "/run/other"
+        daemon = box.start(["ktree", "-n", "config", "-s", other], env={"LD_PRELOAD": None})
+        try:
+            # Its socket is there before it can be reached.
+            box.wait_until(lambda: box.run(["ktreec", "-S", other, "-t"], env={"LD_PRELOAD": None}).status != UNREACHABLE,
+                           what="a tree of its own")
+            for file in filter(lambda file: box.path(file).exists(), (SAVED, FLASH)):
+                load = box.run(["ktreec", "-S", other, "-l", file], env={"LD_PRELOAD": None})
+                lines = box.run(["ktreec", "-S", other, "-t", INITIATOR], env={"LD_PRELOAD": None}).stdout.splitlines()
+                found[file] = (load.stderr or f"status {load.status}" if load.status else "", lines)
+        finally:
+            daemon.kill(9)
+            daemon.wait()
+        return found
+
+    def semaphore(self):
+        """What the format semaphore stands at; "" when there is none."""
+        return self.real("world", "semaphore").strip()
 
     def crashes(self):
         found = [f"crash: {job}" for job in self.jobs if job.status is not None and job.status < 0 and not job.killed]
