@@ -9,7 +9,7 @@
 #   1        10.9.1.1  fd00:9:1::1                 10.9.1.2  fd00:9:1::2  fe80::12
 #
 # The variable PHASE is 1 at the first boot and one more after each power_pull and power_cycle. What is below /data,
-# /etc/NAS_CFG, /usr/local/config and /etc/iscsi outlives a boot.
+# /etc/NAS_CFG, /usr/local/config, /etc/iscsi and /var/lib/iscsi outlives a boot.
 
 # Folder of the LUNs' files. /data/luns makes them outlive a boot.
 LUN_DIR=${LUN_DIR:-/tmp/luns}
@@ -22,7 +22,7 @@ say() { printf '%s\n' "$*"; }
 
 fail() {
     say "FAILED (phase $PHASE): $*"
-    say "Under way: $(pgrep -a 'remvol|iscsiadm|mke2fs|e2fsck|mount' || echo nothing)"
+    say "Under way: $(pgrep -af 'remvol|iscsiadm|mke2fs|e2fsck|mount' || echo nothing)"
     exit 1
 }
 
@@ -191,6 +191,15 @@ target_chap() {
 
 # The names of the scenarios' targets begin with this.
 IQN=iqn.2026-01.org.example
+
+# general_tree_start: the tree for what does not belong to the volumes' settings. Nothing here starts units, so what the
+# installed project's unit runs is run; that it has one is seen, that it is started is seen in a full machine.
+general_tree_start() {
+    line=$(sed -n 's/^ExecStart=//p' /usr/lib/systemd/system/remvol-general-tree.service)
+    [ -n "$line" ] || fail "the project brings no general tree"
+    $line &
+    wait_for 10 test -S /var/run/ktree_sock
+}
 
 # tree_get KEY: the value, nothing when there is none.
 tree_get() { ktreec -S "$TREE_SOCKET" -g "$1"; }

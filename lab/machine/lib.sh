@@ -43,13 +43,66 @@ expect_active() {
     for unit in "$@"; do expect_equal "$unit" active "$(systemctl is-active "$unit")"; done
 }
 
+# unharmed: what holds when a scenario has come to its end, or a stage; the runner sees to it that it is asked.
+unharmed() {
+    [ $? = 0 ] || return
+    expect_equal "services that failed" "" "$(systemctl list-units --failed --no-legend --plain)"
+    expect_equal "errors that nothing provoked" "" "$(errors)"
+    # shellcheck disable=SC2046 # a list
+    expect_equal "what systemd-analyze verify says" "" \
+        "$(systemd-analyze verify --man=no $(our_units) 2>&1 | grep -F remvol)"
+}
+
+our_units() { systemctl list-unit-files --no-legend 'remvol*' | awk '{ print $1 }'; }
+
+# provokes PATTERN...: the scenario brings about errors of the journal that fit these (regular expressions).
+provokes() {
+    printf '%s\n' "$@" >>/data/provoked
+    sync /data/provoked
+}
+
+# What it says when the storage is taken from under volumes, or is not there: the initiator, the kernel, those who tell people.
+provokes_loss() {
+    provokes 'iscsid\[' 'remvol-notify\[' 'remvol\[.*(iscsiadm|log ?in|connect)' \
+        'kernel: .*(ping timeout|I/O error|offline (error|device)|EXT4-fs|JBD2|[Jj]ournal|Synchroniz|FAILED Result|Sense)'
+}
+
+# errors: those of all boots of this machine that nothing provoked.
+errors() {
+    touch /data/provoked
+    journalctl -q -p err -o short-monotonic --no-pager | grep -Ev -f /data/provoked
+}
+
 # messages UNIT...: what these units have said since the machine was started.
 messages() { journalctl -b -o cat --no-pager $(printf -- '-u %s ' "$@"); }
+
+# ---- promises ----
+
+# A promise in seconds is judged only while the emulated machine has a processor to itself: it says nothing where a program
+# takes ten times as long to start.
+QUICK=15  # milliseconds for the start of a program
+
+start_time() {
+    read -r began rest </proc/uptime
+    for _ in $(seq 100); do /bin/true; done
+    read -r ended rest </proc/uptime
+    awk "BEGIN { printf \"%d\", ($ended - $began) * 10 }"
+}
+
+# within DESCRIPTION SECONDS PROMISE: the promise was kept, or the machine was too busy to judge it.
+within() {
+    say "$1: $2 s, at most $3 s are promised"
+    awk "BEGIN { exit !($2 <= $3) }" && return
+    each=$(start_time)
+    [ "$each" -gt $QUICK ] || fail "$1: $2 s, more than $3 s"
+    say "  not judged: a program takes $each ms to start"
+}
 
 # ---- the power ----
 
 # reboot_machine: as an operator does it; the scenario starts again with PHASE one higher.
 reboot_machine() {
+    provokes 'kernel: watchdog: watchdog0: watchdog did not stop!'  # systemd of Debian 13 goes down under it
     printf '\036restart\n' >&9
     systemctl reboot
     sleep 1000

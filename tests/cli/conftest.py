@@ -7,13 +7,14 @@ import pytest
 sys.path.insert(0, str(pathlib.Path(__file__).parent))
 
 from appliance import Site  # noqa: E402
-from harness import Box, build_folder  # noqa: E402
+from harness import Box, build_folder, machine_folder  # noqa: E402
 from harness.traces import record_outside  # noqa: E402
 
 
 def pytest_configure(config):
     record_outside()
     config.addinivalue_line("markers", "unsanitized: says nothing about a build with sanitizers, and is left out there")
+    config.addinivalue_line("markers", "native: is left out where the programs are emulated (docs/lab.md)")
     config.addinivalue_line("markers", "long: waits for half a minute, and starts first so that nothing waits for it")
 
 
@@ -41,6 +42,8 @@ def pytest_collection_modifyitems(config, items):
     if config.getoption("--cases"):
         leave_out(config, items, set(further_cases(items, config.getoption("--cases"))))
     items.sort(key=lambda item: item.get_closest_marker("long") is None)
+    if machine_folder() != build_folder():
+        leave_out(config, items, {item for item in items if item.get_closest_marker("native")})
     if "REMVOL_SANITIZE:STRING=\n" in build_folder().joinpath("CMakeCache.txt").read_text():
         return
     leave_out(config, items, {item for item in items if item.get_closest_marker("unsanitized")})

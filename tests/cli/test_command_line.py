@@ -36,11 +36,13 @@ def options_for(bits):
 class TestTheProgram:
     """It is loaded once for every request."""
 
+    @pytest.mark.native
     def test_it_needs_the_platform_and_the_c_library_alone(self):
         table = subprocess.run(["readelf", "-d", BUILD / "bin/remvol"], capture_output=True, text=True, check=True).stdout
         needed = re.findall(r"NEEDED.*\[(\w+)\.so", table)
         assert sorted(needed) == ["libc", "libktreec", "libostel_common", "libsysaux"]
 
+    @pytest.mark.native
     def test_it_is_small(self, tmp_path):
         subprocess.run(["strip", "-o", tmp_path / "remvol", BUILD / "bin/remvol"], check=True)
         assert (tmp_path / "remvol").stat().st_size <= 150 * 1000
@@ -208,6 +210,7 @@ class TestSecret:
 
     @pytest.mark.parametrize("chap", ["1", "0"])
     @pytest.mark.parametrize("form", [["-P", SECRET], [f"-P{SECRET}"]])
+    @pytest.mark.native
     def test_it_is_gone_from_the_process_list(self, box, chap, form):
         box.hook("system", "winshare_reload", through=True, effect="cat /proc/$PPID/cmdline >/tmp/cmdline")
         box.remvol("--search", "-c", chap, "-U", "user", *form)
@@ -215,6 +218,7 @@ class TestSecret:
         assert words[:6] == [b"remvol", b"--search", b"-c", chap.encode(), b"-U", b"user"]
         assert b"Secret" not in b"\0".join(words)
 
+    @pytest.mark.native
     def test_it_is_gone_before_anything_is_waited_for(self, box):
         box.hook("getaddrinfo", "slow", ret=-2, effect="cat /proc/[0-9]*/cmdline >/tmp/cmdline")
         box.remvol("--search", "-i", "slow", "-c", "1", "-P", self.SECRET)

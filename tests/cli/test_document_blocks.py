@@ -55,6 +55,9 @@ ELSEWHERE = [
         "scripts/package": (RUNNER, "scripts/package"), "scripts/test machine": (RUNNER, "layer_machine()"),
         "lab/machine/run bookworm restart": (RUNNER, "lab/machine/run"),
         "lab/machine/run bookworm --shell": BY_HAND}),
+    ("docs/lab.md", "scripts/test arm", {
+        "scripts/test arm": (RUNNER, "layer_arm()"), "scripts/package --arch": (RUNNER, 'scripts/package --arch "$arch"'),
+        "scripts/fresh-root": (RUNNER, 'scripts/cross "$arch" scripts/test unit')}),
     ("docs/monitoring.md", "systemctl enable", NEWS),
     ("docs/operators-guide.md", "scripts/package", {"scripts/package": (RUNNER, "scripts/package"),
                                                     "apt-get install": (STAGE, "install_packages")}),

@@ -79,6 +79,12 @@ def plain(page):
     return re.sub(r"\\f[BRI]|\"", "", text).replace("\\-", "-")
 
 
+@pytest.mark.parametrize("page", sorted(path.name for path in (DOCS / "man").iterdir()))
+def test_a_page_with_a_table_asks_for_what_draws_it(page):
+    text = (DOCS / "man" / page).read_text()
+    assert text.startswith("'\\\" t\n") == ("\n.TS\n" in text)
+
+
 COMMANDS = re.findall(r'^    \{"(\w+)", ', (TOP / "src/frontend/commands.cpp").read_text(), re.M)
 
 
@@ -368,6 +374,7 @@ def pkg_config(prefix):
 
 
 @pytest.mark.unsanitized
+@pytest.mark.native
 def test_a_program_is_built_with_what_pkg_config_says(tmp_path):
     flags, libraries = pkg_config(tmp_path / "usr")
     (tmp_path / "program.c").write_text(PROGRAM)
@@ -378,6 +385,7 @@ def test_a_program_is_built_with_what_pkg_config_says(tmp_path):
 
 
 @pytest.mark.unsanitized
+@pytest.mark.native
 def test_the_program_of_the_library_s_manual_page(daemon, tmp_path):
     program, command = examples("libktreec.3")
     flags, libraries = pkg_config(tmp_path / "usr")

@@ -95,6 +95,7 @@ def test_a_plain_folder_is_simply_written(flash):
 
 
 @pytest.mark.unsanitized
+@pytest.mark.native
 def test_it_adds_less_than_50_ms_to_its_command(flash):
     def took():
         times = []
@@ -417,6 +418,7 @@ def test_a_copy_that_stays_open_to_others_is_told(copied):
 
 
 @pytest.mark.unsanitized
+@pytest.mark.native
 def test_a_flash_that_nobody_can_watch_is_closed_at_once(flash):
     flash.mount()
     done = traced(flash, ["-e", "inject=clone,clone3,fork,vfork:error=EAGAIN:when=1"], f"touch {FOLDER}/f")

@@ -43,7 +43,7 @@ class TestWorld:
         code = f"""if 1:
             import os, socket, subprocess
             mine, its = socket.socketpair(socket.AF_UNIX, socket.SOCK_SEQPACKET)
-            inner = subprocess.Popen([{str(bare_box.tools / "box")!r}, str(its.fileno())], pass_fds=[its.fileno()])
+            inner = subprocess.Popen([{str(bare_box.machine_tools / "box")!r}, str(its.fileno())], pass_fds=[its.fileno()])
             its.close()
             print(mine.recv(4096).decode().split()[0], flush=True)
             streams = [os.open("/dev/null", os.O_RDONLY), 1, 2]

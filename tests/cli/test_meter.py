@@ -12,6 +12,8 @@ from harness import build_folder
 sys.path.insert(0, str(pathlib.Path(__file__).parents[2] / "bench"))
 import waits  # noqa: E402
 
+pytestmark = pytest.mark.native  # the meter stands in front of this machine's programs
+
 PROGRAM = """
 import ctypes, os, time
 c = ctypes.CDLL(None)  # the meter's functions stand in front

@@ -437,6 +437,7 @@ def test_a_hung_smbcontrol_does_not_hang_the_reload(shares):
 
 
 @pytest.mark.unsanitized
+@pytest.mark.native
 def test_nothing_to_do_takes_less_than_50_ms(shares):
     for number in range(8):
         shares.add(f"V{number}")

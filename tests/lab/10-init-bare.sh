@@ -1,6 +1,6 @@
 # timeout: 150
 # --init on a bare appliance: daemon, modules, the initiator's files and interface records.
-rm -rf /etc/iscsi/*
+rm -rf /etc/iscsi/* /var/lib/iscsi/*
 works --init
 
 expect_equal "settings of the initiator's daemon" "node.startup = manual

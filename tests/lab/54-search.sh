@@ -17,8 +17,7 @@ works --init
 works --add -n ${T}pear -l 1 -i 10.9.0.2 -p 3260 -s Pears
 works --connect -n ${T}pear
 echo text >/mnt/VV/Pears/file
-ktree -n config -s $LISTS &
-wait_for 10 test -S $LISTS
+general_tree_start
 sorted="${T}apple ${T}fig ${T}lemon ${T}pear ${T}quince "
 
 works --search -i 10.9.0.2 -p 3260 -o /tmp/target-list

@@ -39,7 +39,7 @@ case $PHASE in
 2)
     all_back
     # The initiator's records are written without a sync: this is what the power may leave of them.
-    truncate -s 0 /etc/iscsi/nodes/${T}1/* /etc/iscsi/ifaces/iface0
+    truncate -s 0 $(find /etc/iscsi /var/lib/iscsi -path "*/nodes/${T}1/*" -type f -o -path '*/ifaces/iface0')
     sync
     power_pull
     ;;

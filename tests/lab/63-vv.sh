@@ -22,7 +22,7 @@ vv_fails() {
     expect_has "what vv $* says" "$part" "$(cat /tmp/vv.err)"
 }
 
-ktree -n config -s /var/run/ktree_sock &
+general_tree_start
 works --init
 vv_fails 1 "nothing listens at that port" discover 10.9.0.2
 

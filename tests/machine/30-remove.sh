@@ -34,7 +34,7 @@ as_before /etc/iscsi/iscsid.conf
 as_before /etc/iscsi/initiatorname.iscsi
 expect_equal "secrets that are left" "" "$(grep -rl s3cr3tw0rd /etc /usr/local /var/lib /run /tmp 2>/dev/null)"
 expect_equal "settings that are left" "" "$(ls -d /etc/NAS_CFG /usr/local/config/vv.xml 2>/dev/null)"
-expect_equal "node records that are left" "" "$(find /etc/iscsi/nodes /etc/iscsi/send_targets -type f 2>/dev/null)"
+expect_equal "node records that are left" "" "$(find /etc/iscsi/nodes /etc/iscsi/send_targets /var/lib/iscsi -type f 2>/dev/null)"
 expect_equal "loaded modules" "" "$(grep -o '^[a-z_]*iscsi[a-z_]*' /proc/modules)"
 expect_equal "files of the tool" "" "$(ls -d /tmp/remvol*.tmp /var/lock/virtual_volume /run/remvol 2>/dev/null)"
 

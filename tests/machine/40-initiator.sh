@@ -22,6 +22,8 @@ expect_well() {
     for unit in remvol remvol-tree remvol-events; do expect_active $unit; done
 }
 
+provokes_loss
+
 # Another one, and the sessions are its own: they heal after the cable was out.
 old=$(initiators)
 kill -KILL "$old"

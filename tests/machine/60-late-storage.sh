@@ -3,6 +3,7 @@
 # The storage server is not there at boot: the boot does not wait for it, the texts say so, and the volumes come when it does.
 if [ "$PHASE" = 1 ]; then
     target_at_boot off
+    provokes_loss
     reboot_machine
 fi
 reached() { systemctl is-active --quiet multi-user.target; }

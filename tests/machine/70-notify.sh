@@ -15,6 +15,7 @@ mailed() {
     return 1
 }
 
+provokes_loss
 mkdir -p $NEWS /etc/remvol/events.d
 printf '#!/bin/sh\ncat >%s/mail.$$\n' $NEWS >/usr/sbin/sendmail
 printf '#!/bin/sh\necho "$@" >>%s/program\n' $NEWS >/usr/local/sbin/volume-news

@@ -84,6 +84,6 @@ its time limit (20 s) is killed and raises.
 
 from .log_lines import log_lines, messages
 from .result import Call, Result, startswith
-from .world import Box, build_folder
+from .world import Box, build_folder, machine_folder
 
-__all__ = ["Box", "Call", "Result", "build_folder", "log_lines", "messages", "startswith"]
+__all__ = ["Box", "Call", "Result", "build_folder", "log_lines", "machine_folder", "messages", "startswith"]

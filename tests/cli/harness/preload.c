@@ -3,6 +3,8 @@
  *
  * A rule's result and errno are returned; its text is what the function hands out (see each function). A rule
  * with `through` only acts (side effect, delay, signal) and lets the real function go on. */
+#undef _FILE_OFFSET_BITS /* fcntl and fcntl64 would be one name */
+#undef _TIME_BITS
 #include <arpa/inet.h>
 #include <dlfcn.h>
 #include <errno.h>
@@ -143,8 +145,9 @@ PUBLIC int access(const char* path, int mode) {
 /* Record locks alone: the subject is "lock", "unlock" or "wait" (the blocking form). */
 static int locked(int fd, int command, void* argument, long long* result) {
   const struct flock* lock = argument;
-  if (command != F_SETLK && command != F_SETLKW) return 0;
-  const char* what = lock->l_type == F_UNLCK ? "unlock" : command == F_SETLK ? "lock" : "wait";
+  const int at_once = command == F_SETLK || command == F_SETLK64;
+  if (!at_once && command != F_SETLKW && command != F_SETLKW64) return 0;
+  const char* what = lock->l_type == F_UNLCK ? "unlock" : at_once ? "lock" : "wait";
   char link[64];
   char path[256] = "";
   snprintf(link, sizeof link, "/proc/self/fd/%d", fd);
@@ -165,6 +168,10 @@ static int locked(int fd, int command, void* argument, long long* result) {
   }
 DEFINE_FCNTL(fcntl)
 DEFINE_FCNTL(fcntl64)
+#if __TIMESIZE == 32 /* the names of what has 64-bit times */
+int __fcntl_time64(int fd, int command, ...);
+DEFINE_FCNTL(__fcntl_time64)
+#endif
 
 /* --- semaphores --- */
 
@@ -177,12 +184,8 @@ PUBLIC int semget(key_t key, int count, int flags) {
   return REAL(semget)(key, count, flags);
 }
 
-PUBLIC int semctl(int id, int number, int command, ...) {
-  va_list list;
-  long long result;
-  va_start(list, command);
-  void* argument = va_arg(list, void*);
-  va_end(list);
+/* Logs the call; answered when this is 1. */
+static int semctl_answered(int command, void* argument, long long* result) {
   const char* what = command == SETVAL     ? "SETVAL"
                      : command == GETNCNT  ? "GETNCNT"
                      : command == IPC_RMID ? "IPC_RMID"
@@ -194,9 +197,24 @@ PUBLIC int semctl(int id, int number, int command, ...) {
   if (command == IPC_SET)
     snprintf(value, sizeof value, "%o", ((const struct semid_ds*)argument)->sem_perm.mode);
   if (command != IPC_STAT) log_call("semctl", what, value, (char*)NULL);
-  if (answered_number("semctl", what, value, &result)) return (int)result;
-  return REAL(semctl)(id, number, command, argument);
+  return answered_number("semctl", what, value, result);
 }
+
+#define DEFINE_SEMCTL(name)                                              \
+  PUBLIC int name(int id, int number, int command, ...) {                \
+    va_list list;                                                        \
+    long long result;                                                    \
+    va_start(list, command);                                             \
+    void* argument = va_arg(list, void*);                                \
+    va_end(list);                                                        \
+    if (semctl_answered(command, argument, &result)) return (int)result; \
+    return REAL(name)(id, number, command, argument);                    \
+  }
+DEFINE_SEMCTL(semctl)
+#if __TIMESIZE == 32
+int __semctl64(int id, int number, int command, ...);
+DEFINE_SEMCTL(__semctl64)
+#endif
 
 PUBLIC int semop(int id, struct sembuf* operations, size_t count) {
   char text[64];

@@ -7,7 +7,7 @@ import shutil
 
 NAME = os.environ.get("REMVOL_UNDER", "")
 FOUND = os.environ.get("REMVOL_UNDER_FOUND", "")
-SLOWER = 15 if NAME else 1
+SLOWER = 15 if NAME else 5 if "REMVOL_MACHINE" in os.environ else 1
 # What the programs start themselves is left alone, but for themselves in the background.
 COMMANDS = {
     "": [],
@@ -27,7 +27,9 @@ def under(argv, build, log):
 
 
 def without(words):
-    """A process's words as they would be without the other program."""
+    """A process's words as they would be without the other program, or without an emulator of another processor."""
+    if words and words[0].endswith("-binfmt-P"):
+        return words[2:]  # the program as a file, and then as it was called
     if not NAME or not words or words[0] != COMMANDS[NAME][0]:
         return words
     return next(words[i:] for i in range(1, len(words) + 1) if i == len(words) or not words[i].startswith("-"))

@@ -82,9 +82,9 @@ def luns(box, tmp_path):
     box.tree.set(f"{SLOT}/target", "iqn.t1")
     made = []
 
-    def make(size, share=None, *options):
+    def make(size, share=None, *options, folder=tmp_path):
         slot = len(made) + 1
-        disk = Loop(tmp_path / f"disk{slot}", size, *options)
+        disk = Loop(folder / f"disk{slot}", size, *options)
         made.append(Lun(box, disk, slot, share or f"share{slot}"))
         return made[-1]
 

@@ -31,6 +31,11 @@ def build_folder():
     return (repository / os.environ.get("REMVOL_BUILD", "build/release")).resolve()
 
 
+def machine_folder():
+    """Where the boxes and fake commands are, which run on this machine: apart when the programs are another's."""
+    return pathlib.Path(os.environ.get("REMVOL_MACHINE", build_folder())).resolve()
+
+
 class Running:
     """A program in the box that has been started."""
 
@@ -69,6 +74,7 @@ class Box:
     def __init__(self):
         self.build = build_folder()
         self.tools = self.build / "tests" / "harness"
+        self.machine_tools = machine_folder() / "tests" / "harness"
         self.numbers = itertools.count(1)
         self.running = {}
         self.rules = {"first": [], "in order": [], "last": []}
@@ -90,7 +96,7 @@ class Box:
         repository = pathlib.Path(__file__).resolve().parents[3]
         keep = [repository] if self.build.is_relative_to(repository) else [repository, self.build]
         self.process = subprocess.Popen(
-            [self.tools / "box", str(theirs.fileno()), *keep], pass_fds=[theirs.fileno()]
+            [self.machine_tools / "box", str(theirs.fileno()), *keep], pass_fds=[theirs.fileno()]
         )
         theirs.close()
         answer = self.control.recv(4096).decode()
@@ -101,7 +107,7 @@ class Box:
     def _prepare_fakes(self):
         fake = self.root / "fake"
         (fake / "bin").mkdir()
-        shutil.copy(self.tools / "fakecmd", fake / "command")
+        shutil.copy(self.machine_tools / "fakecmd", fake / "command")
         for name in COMMANDS:
             (fake / "bin" / name).symlink_to("/fake/command")
         with open(fake / "counters", "wb") as counters:
@@ -161,13 +167,19 @@ class Box:
         env = {
             "PATH": f"/fake/bin:{self.build}/bin:{SYSTEM_PATH}",
             "HOME": "/root",
-            "LD_PRELOAD": str(self.tools / "libpreload.so"),
+            "LD_PRELOAD": self._preload(),
             "ASAN_OPTIONS": f"verify_asan_link_order=0:detect_leaks={int(self.check_leaks)}:{sanitizers}",
             "UBSAN_OPTIONS": f"print_stacktrace=1:{sanitizers}",
             **self.environment,
             **(extra or {}),
         }
         return {name: value for name, value in env.items() if value is not None}
+
+    def _preload(self):
+        """For programs of two architectures the loader of each puts its own folder in place of $LIB."""
+        if self.tools == self.machine_tools:
+            return str(self.tools / "libpreload.so")
+        return str(self.machine_tools / "$LIB" / "libpreload.so")
 
     def send(self, words, streams=()):
         data = b"\0".join(os.fsencode(str(word)) for word in words) + b"\0"

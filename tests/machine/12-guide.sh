@@ -39,7 +39,22 @@ everyday() {
     types "$1"
 }
 
-at_terminal() { script -qec "$1" /dev/null >/tmp/terminal.out; }
+# converse COMMAND [PROMPT ANSWER]...: runs a command at a terminal, where each prompt gets its answer when it is seen.
+converse() {
+    say "$1"
+    rm -f /tmp/keyboard /tmp/terminal
+    mkfifo /tmp/keyboard
+    script -qefc "$1" /tmp/terminal </tmp/keyboard >/dev/null 2>&1 &
+    conversation=$!
+    exec 8>/tmp/keyboard
+    while shift && [ $# -gt 0 ]; do
+        wait_for 60 grep -aqF "$1" /tmp/terminal
+        shift
+        echo "$1" >&8
+    done
+    wait $conversation || fail "the command at the terminal gave status $?: $(cat /tmp/terminal)"
+    exec 8>&-
+}
 
 booted
 target_start
@@ -67,8 +82,8 @@ expect_equal "vvstat's volume" "Photos Running" "$(sed -n 2p /tmp/vvstat.out | a
 expect_has "vvstat's verdict" "all 1 healthy, as of" "$(tail -n 1 /tmp/vvstat.out)"
 
 text 7 "adduser --no-create-home"
-printf '\n\n\n\n\nY\n' | at_terminal "$(block 7 | sed -n 1p)" || fail "adduser: $(cat /tmp/terminal.out)"
-{ sleep 10 && echo secret && sleep 5 && echo secret && sleep 5; } | at_terminal "$(block 7 | sed -n 2p)" || fail "smbpasswd: $(cat /tmp/terminal.out)"
+converse "$(block 7 | sed -n 1p)" "Full Name" "" "Room Number" "" "Work Phone" "" "Home Phone" "" Other "" "correct?" Y
+converse "$(block 7 | sed -n 2p)" "New SMB password:" secret "Retype new SMB password:" secret
 as_client() { target_run timeout 60 smbclient //10.9.1.1/Photos -U "$1" -m SMB3 -c "$2" >/tmp/client.out 2>&1; }
 echo "from a client" >/tmp/sent
 expect "a client with a password writes" as_client maria%secret "put /tmp/sent sent"
@@ -87,10 +102,16 @@ expect "smb.conf is good" testparm -s
 
 device=$(findmnt -no SOURCE /mnt/VV/Photos)
 text 11 "umount /mnt/VV/Photos"
-types "$(block 11 | sed "s,/dev/sdb1,$device,")"
+# A check of a file system wants a person.
+block 11 | as_operator | sed "s,/dev/sdb1,$device," >/tmp/commands
+converse "sh -e /tmp/commands"
 expect "the volume is mounted again" mounted Photos
 text 12 "MAILADDR admin"
 block 12 >>/etc/remvol/remvol.conf
+printf '#!/bin/sh\ncat >/var/lib/mail.$$\n' >/usr/sbin/sendmail
+chmod +x /usr/sbin/sendmail
+everyday 'remvol-events --test'
+expect "the mail is sent" grep -qsx "To: admin@example.org" /var/lib/mail.*
 does 13 "journalctl -x"
 
 everyday 'vvstat Photos'
@@ -110,6 +131,7 @@ cp /etc/NAS_CFG/vv.xml /root/saved.xml
 everyday 'systemctl stop remvol'
 expect_not "the volume is mounted" mounted Photos
 cp /root/saved.xml /etc/NAS_CFG/vv.xml
+everyday 'systemctl restart remvol-tree'
 everyday 'systemctl start remvol'
 wait_for 60 mounted Photos
 expect_equal "what the client has written" "from a client" "$(cat /mnt/VV/Photos/sent)"

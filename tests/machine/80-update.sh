@@ -8,7 +8,7 @@ busy_client() {
     while :; do
         number=$((number + 1))
         as_client "$1" "put /tmp/sent file-$number" >/dev/null 2>&1 && echo $number >>/data/written-$1
-        sleep 5
+        sleep 15
     done
 }
 
