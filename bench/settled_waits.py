@@ -62,7 +62,7 @@ SETTLED = [
 # Looks at a state that end as soon as it is there, and begin without a wait: they cost nothing unless something is amiss or
 # another run is at work.
 LOOKS = [
-    Wait(("src/support/run_lock.cpp",), "usleep(kPoll)"),
+    Wait(("src/iscsi/iscsid.cpp", "src/support/run_lock.cpp"), "usleep(kPoll)"),
     Wait(("src/support/target_hold.cpp",), "usleep(kBriefPoll)"),
     Wait(("src/volume/disk_use.cpp",), "usleep(kLookPause)"),
     Wait(("src/volume/unmount.cpp",), "usleep(kTreePause)"),

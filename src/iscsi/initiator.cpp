@@ -102,6 +102,7 @@ InitiatorName start_initiator() {
   write_daemon_configuration();
   const InitiatorName name = write_initiator_name();
   drop_empty_records();
+  if (!await_iscsid_end()) LOG(0, "the iscsid that was told to end has not ended");
   (void)start_daemon(start_iscsid_command());
   return name;
 }

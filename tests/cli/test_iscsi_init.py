@@ -306,6 +306,51 @@ def test_a_stopping_iscsid_takes_nothing_along(bare_box):
         assert done.stdout == "0\nalive\n"
 
 
+HOLDS_NAME = """
+import os, socket, time
+held = socket.socket(socket.AF_UNIX)
+held.bind("\\0ISCSIADM_ABSTRACT_NAMESPACE")
+held.listen()
+print("held", flush=True)
+while not os.path.exists("/fake/end"): time.sleep(0.01)
+"""
+
+
+def hold_name(box):
+    """The iscsid that was told to end has not ended yet."""
+    holder = box.start(["/usr/bin/python3", "-c", HOLDS_NAME], env={"LD_PRELOAD": None})
+    box.wait_until(lambda: holder.stdout == "held\n")
+    box.fake("iscsid", effect="grep -c ISCSIADM_ABSTRACT_NAMESPACE /proc/net/unix >/fake/held")
+    return holder
+
+
+def test_iscsid_is_started_when_the_one_before_has_ended(initiator, box):
+    holder = hold_name(box)
+    box.hook("usleep", "50000", effect="touch /fake/end")
+    done = init(box)
+    holder.wait()
+    assert box.path("/fake/held").read_text() == "0\n"
+    assert "usleep 50000" in box.trace("usleep")
+    assert "has not ended" not in done.stdout
+
+
+def test_an_iscsid_that_does_not_end_is_waited_for_ten_seconds(initiator, box):
+    holder = hold_name(box)
+    done = box.remvol("--init")
+    assert done.status == 0
+    assert box.trace("usleep") == ["usleep 50000"] * 200
+    assert "the iscsid that was told to end has not ended" in done.stdout
+    held = box.path("/fake/held")
+    box.wait_until(lambda: held.exists() and held.read_text() == "1\n")
+    holder.kill(9)
+    holder.wait()
+
+
+def test_without_an_iscsid_nothing_is_waited_for(initiator, box):
+    init(box)
+    assert box.trace("usleep") == []
+
+
 def test_each_daemon_has_a_process_group_of_its_own_even_when_the_tool_leads_a_session(bare_box):
     box = bare_box
     appliance(box)

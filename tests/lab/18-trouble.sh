@@ -69,6 +69,7 @@ expect_equal "what the user set" "$before" "$(wishes)"
 goes_on
 mv /tmp/iscsiadm /usr/sbin/
 says_error 3
+# At once: the iscsid of the --init before is still connecting its session anew when it is told to end.
 works --init
 expect_key id:1/status Connected
 expect_key id:1/lun/id:1/status Running
