@@ -8,10 +8,11 @@
 #include <cerrno>
 #include <cstdio>
 
+#include "run_folder.h"
+
 namespace platform {
 namespace {
 
-constexpr char kFolder[] = "/run/remvol";
 constexpr mode_t kOthersWrite = 022;
 constexpr mode_t kOthersOpen = 077;
 constexpr int kTries = 2;  // the second one after what was there was put away
@@ -25,14 +26,14 @@ bool is_ours(int fd, mode_t type, mode_t forbidden) {
 // Another user's folder cannot be removed while there is something in it, so it is put aside.
 void put_folder_aside() {
   char aside[64];
-  snprintf(aside, sizeof aside, "%s.%ld.foreign", kFolder, static_cast<long>(getpid()));
-  rename(kFolder, aside);
+  snprintf(aside, sizeof aside, "%s.%ld.foreign", remvol::kRunDir, static_cast<long>(getpid()));
+  rename(remvol::kRunDir, aside);
 }
 
 int open_folder() {
   for (int i = 0; i < kTries; i++) {
-    mkdir(kFolder, 0700);
-    const int folder = open(kFolder, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+    mkdir(remvol::kRunDir, 0700);
+    const int folder = open(remvol::kRunDir, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
     if (folder >= 0 && is_ours(folder, S_IFDIR, kOthersWrite)) return folder;
     if (folder >= 0) close(folder);
     put_folder_aside();
