@@ -48,12 +48,21 @@ int load_surely(const char* file) {
   return ended;
 }
 
-// Settings that are missing or damaged are replaced by their copy on the configuration flash.
-void load_settings() {
-  if (load_surely(kSettingsFile) != kSettingsRefused) return;
+bool is_nowhere(const char* file) {
+  return access(file, F_OK) != 0 && errno == ENOENT;
+}
+
+// Settings that are missing or damaged are replaced by their copy on the configuration flash. Returns whether
+// no settings are left that may be good and were not loaded.
+bool load_settings() {
+  int ended = load_surely(kSettingsFile);
+  if (ended == 0) return true;
+  if (ended != kSettingsRefused) return is_nowhere(kSettingsFile) && is_nowhere(kFlashCopy);
   keep_damaged_settings();
-  if ((access(kFlashCopy, F_OK) != 0 && errno == ENOENT) || load_surely(kFlashCopy) != 0) return;
-  LOG(0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
+  if (is_nowhere(kFlashCopy)) return true;
+  ended = load_surely(kFlashCopy);
+  if (ended == 0) LOG(0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
+  return ended == 0 || ended == kSettingsRefused;
 }
 
 // A run that was killed between starting the daemon and loading has left a tree that answers and holds
@@ -61,17 +70,17 @@ void load_settings() {
 bool was_left_empty() {
   return tree_is_missing(key::kVersion, key::kVersion) &&
          tree_is_missing(key::kTargetCount, key::kTargetCount) &&
-         (settings_file_has_version(kSettingsFile) || settings_file_has_version(kFlashCopy));
+         (settings_file_has_targets(kSettingsFile) || settings_file_has_targets(kFlashCopy));
 }
 
 }  // namespace
 
 // A killed daemon leaves its pid file behind. The result key was set a moment ago.
-void start_settings_daemon() {
+bool start_settings_daemon() {
   const bool runs = check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult));
-  if (runs && !was_left_empty()) return;
+  if (runs && !was_left_empty()) return true;
   if (!runs) start_tree_daemon(kVolumesSocket);
-  load_settings();
+  return load_settings();
 }
 
 void stop_settings_daemon() {

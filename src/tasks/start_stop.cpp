@@ -17,9 +17,11 @@ namespace remvol {
 int task_init() {
   const LogScope scope;
   LOG(2, "start");
-  start_settings_daemon();
-  if (is_remvol_ver_changed() != 0) (void)version_upgrade();
-  (void)set_remvol_ver_to_db(kSettingsVersion);
+  // Without a version the tree is dumped over no settings.
+  if (start_settings_daemon()) {
+    if (is_remvol_ver_changed() != 0) (void)version_upgrade();
+    (void)set_remvol_ver_to_db(kSettingsVersion);
+  }
   const InitiatorName name = start_initiator();
   (void)Iface_Config_Gen();
   (void)ktree_update_initiator_iqn(name);

@@ -17,8 +17,8 @@ namespace remvol {
 namespace {
 
 constexpr long kMostRead = 4L << 20;  // the settings of all targets are some ten kibibytes
-constexpr const char* kVersionPath[] = {"config", "iscsi", "initiator", "ver"};
-constexpr int kVersionDepth = sizeof kVersionPath / sizeof *kVersionPath;
+constexpr const char* kInitiatorPath[] = {"config", "iscsi", "initiator"};
+constexpr int kInitiatorDepth = sizeof kInitiatorPath / sizeof *kInitiatorPath;
 constexpr char kSettingsFolder[] = "/etc/NAS_CFG";
 constexpr char kFileEnd[] = "</config>";
 
@@ -66,17 +66,24 @@ bool has_text(FileText* text) {
   return c != EOF && c != '<';
 }
 
-bool find_version(FileText text) {
+// Returns whether the initiator's first element `name` has a text.
+bool find_value(FileText text, const char* name) {
   int depth = 0;
-  int on_path = 0;  // how many of the open elements lead to the version
+  int on_path = 0;  // how many of the open elements lead to it
   for (Tag tag; depth >= 0 && next_tag(&text, &tag);) {
-    if (tag.opens() && on_path == depth && tag.is_named(kVersionPath[depth])) on_path++;
-    if (on_path == kVersionDepth) return has_text(&text);
+    const bool next = tag.opens() && on_path == depth;
+    if (next && depth == kInitiatorDepth && tag.is_named(name)) return has_text(&text);
+    if (next && depth < kInitiatorDepth && tag.is_named(kInitiatorPath[depth])) on_path++;
     if (tag.opens()) depth++;
     if (tag.closes()) depth--;
     if (on_path > depth) on_path = depth;
   }
   return false;
+}
+
+bool has_value(const char* path, const char* name) {
+  const File file(fopen(path, "re"));
+  return file != nullptr && find_value({file.get()}, name);
 }
 
 // Where the folder is missing nobody keeps settings: that is no line of the log, which programs read.
@@ -92,8 +99,11 @@ void tell_failed_dump() {
 }  // namespace
 
 bool settings_file_has_version(const char* path) {
-  const File file(fopen(path, "re"));
-  return file != nullptr && find_version({file.get()});
+  return has_value(path, "ver");
+}
+
+bool settings_file_has_targets(const char* path) {
+  return settings_file_has_version(path) || has_value(path, "count");
 }
 
 bool settings_file_is_torn(const char* path) {

@@ -8,6 +8,9 @@ namespace remvol {
 // text, not a check of the file.
 [[nodiscard]] bool settings_file_has_version(const char* path);
 
+// The same for a settings version or, as those of version 0 have none, a count of targets.
+[[nodiscard]] bool settings_file_has_targets(const char* path);
+
 // Returns whether there is a file at `path` that does not end like a settings file: it is empty or cut off.
 [[nodiscard]] bool settings_file_is_torn(const char* path);
 

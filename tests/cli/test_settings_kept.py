@@ -170,7 +170,11 @@ def test_settings_that_are_lost_come_from_the_flash(bare_box, saved):
         assert kept.stat().st_mode & 0o777 == 0o600
 
 
-@pytest.mark.parametrize("saved", [settings("saved"), ""])
+# Those of version 0 have none.
+OLD = "<config><iscsi><initiator><prefix>saved</prefix><count>0</count></initiator></iscsi></config>"
+
+
+@pytest.mark.parametrize("saved", [settings("saved"), OLD, ""])
 def test_a_tree_that_a_killed_start_left_empty_is_loaded(box, saved):
     appliance(box)
     box.write(SAVED, saved)
@@ -217,6 +221,24 @@ def test_a_command_that_could_not_load_the_settings_is_run_again(bare_box, sourc
     init(box)
     assert prefix(box) == "saved"
     assert box.trace("system", "sleep").count("sleep 1") >= 1
+
+
+@pytest.mark.parametrize("source", [SAVED, COPY])
+def test_settings_that_can_never_be_loaded_are_not_buried(bare_box, source):
+    """With a version the tree would count as theirs, and be dumped over them and copied to the flash."""
+    box = bare_box
+    appliance(box)
+    box.path("/etc/NAS_CFG").mkdir()
+    box.write(SAVED, settings("saved") if source == SAVED else "<config><precious")
+    box.write(COPY, settings("copy"))
+    before = box.path(source).read_text()
+    box.hook("system", f"ktreec -S /var/run/ktree_sock_vv -l {source}", ret=127 << 8)
+    done = init(box)
+    assert box.trace("sleep").count("sleep 1") == 11
+    assert box.tree.get("/iscsi/initiator/ver") is None
+    assert box.path(source).read_text() == before
+    if source == SAVED:
+        assert f"{SAVED} is kept as it is: the tree was never loaded from it" in done.stdout
 
 
 def test_damaged_settings_without_a_copy_are_kept(bare_box):
