@@ -69,13 +69,15 @@ int move_share(int n) {
 // A conversion would make the first LUN of such a target its number 0 and forget the others. One that was
 // interrupted left number 0 and no share: it goes on.
 bool is_in_todays_form(int n) {
-  return tree_read_number(KeyText(key::kLunNumber, n, kLunSlot), 0) != 0 ||
-         tree_present(KeyText(key::kLunShare, n, kLunSlot));
+  TreeValue number;
+  return (tree_read_surely(KeyText(key::kLunNumber, n, kLunSlot), number, sizeof number) && atoi(number) != 0) ||
+         tree_present_surely(KeyText(key::kLunShare, n, kLunSlot));
 }
 
 int upgrade_target(int n) {
   const KeyText name(key::kTargetName, n);
-  if (tree_slot_is_free(name)) {
+  TreeValue stored;
+  if (!tree_read_surely(name, stored, sizeof stored) || stored[0] == '\0') {
     LOG(2, "get %s fail", name.c_str());
     return kFailed;
   }

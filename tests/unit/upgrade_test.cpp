@@ -207,6 +207,28 @@ TEST_F(Conversion, OneThatWasInterruptedBeforeTheShareGoesOn) {
   expect_converted(1);
 }
 
+// Whatever comes of it, --init stores the new version, and it is not tried again.
+TEST_F(Conversion, AReadThatFailsOnceChangesNothing) {
+  put_old_targets(3);
+  fakes::on("ktreec_get_wb", at(1, "target")).returns(-1).times(1);
+  fakes::on("ktreec_get_wb", at(2, "share")).returns(-1).times(1);
+  fakes::on("ktreec_get_wb", at(3, "volume_state")).returns(-1).times(1);
+  EXPECT_EQ(version_upgrade_v0_to_v1(), 0);
+  for (int n = 1; n <= 3; n++) expect_converted(n);
+  EXPECT_EQ(fakes::tree_get(at(3, "lun/id:1/volume_state")), "2");
+}
+
+TEST_F(Conversion, AReadThatFailsOnceMakesNoOldFormOfTodays) {
+  put_old_targets(2);
+  fakes::tree_set(
+      {{at(1, "lun/id:1/lun"), "5"}, {at(2, "lun/id:1/lun"), "0"}, {at(2, "lun/id:1/share"), "renamed"}});
+  fakes::on("ktreec_get_wb", at(1, "lun/id:1/lun")).returns(-1).times(1);
+  fakes::on("ktreec_get_wb", at(2, "lun/id:1/share")).returns(-1).times(1);
+  EXPECT_EQ(version_upgrade_v0_to_v1(), 0);
+  EXPECT_EQ(fakes::tree_get(at(1, "lun/id:1/lun")), "5");
+  EXPECT_EQ(fakes::tree_get(at(2, "lun/id:1/share")), "renamed");
+}
+
 class RefusedWrite : public fakes::Test, public testing::WithParamInterface<const char*> {};
 
 TEST_P(RefusedWrite, StopsTheConversion) {
