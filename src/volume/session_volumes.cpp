@@ -48,7 +48,8 @@ bool unmount_session_volumes(const char* target_name) {
 
 bool has_session_volume(const char* target_name) {
   MountLine mount;
-  return find_mount(is_session_volume, target_name, &mount) == Mounted::kYes;
+  const Mounted found = find_mount(is_session_volume, target_name, &mount);
+  return found == Mounted::kYes || (found == Mounted::kUnknown && errno != ENOENT);
 }
 
 int close_sessions(const char* target_name, const char* logout) {

@@ -6,7 +6,7 @@
 namespace remvol {
 
 // Returns whether a volume is mounted below "/mnt/VV/" from a disk of a session to the target, or to any
-// target when it is null. Where the kernel's tables cannot be read there is none.
+// target when it is null. A table of mounts that is there and cannot be read may show one.
 [[nodiscard]] bool has_session_volume(const char* target_name);
 
 // Closes the target's session, or all for null, by the command `logout`. Volumes that are mounted still,
