@@ -99,7 +99,7 @@ def test_modules_are_linked_and_loaded(kernel):
     links = {path.name: str(path.readlink()) for path in kernel.path(FOLDER).iterdir()}
     assert links == {"scsi_transport_iscsi.ko": "/lib/modules/x/scsi_transport_iscsi.ko",
                      "libiscsi.ko": "/lib/modules/x/libiscsi.ko.xz", "iscsi_tcp.ko": "/lib/modules/x/iscsi_tcp.ko"}
-    assert kernel.runs("modprobe") == [["-a", "iscsi_tcp", "sd_mod"]]
+    assert kernel.runs("modprobe") == [["-qa", "iscsi_tcp", "sd_mod"]]
 
 
 def test_modules_of_an_earlier_kernel_are_replaced(kernel):
@@ -296,6 +296,48 @@ def test_an_initiator_without_files_gets_none_back(initiator):
         initiator.write(path, "ours")
     helper(initiator, "initiator", "give")
     assert not any(initiator.path(path).exists() for path in FILES)
+
+
+def take_in_part(box):
+    """The installation was ended while it saved."""
+    box.path("/var/lib/remvol/initiator").mkdir(parents=True)
+
+
+def test_what_an_ended_installation_had_not_saved_is_saved_by_the_next(initiator, place):
+    take_in_part(initiator)
+    assert helper(initiator, "initiator", "take").status == 0
+    ours = initiator.write(f"{place}/nodes/iqn.ours/10.9.0.2,3260/default", "secret")
+    for path in FILES:
+        initiator.write(path, "ours")
+    helper(initiator, "initiator", "give")
+    assert {path: initiator.path(path).read_text() for path in FILES} == FILES
+    assert initiator.path(f"{place}/{OF_ANOTHER}").read_text() == "record" and not ours.exists()
+
+
+@pytest.mark.parametrize("loss", ["rm", "mkdir"])
+def test_nothing_is_taken_away_when_nobody_knows_whose_it_is(initiator, place, loss):
+    helper(initiator, "initiator", "take")
+    lists = "/var/lib/remvol/initiator/records"
+    initiator.run(["rm", lists])
+    if loss == "mkdir":  # there, and cannot be read
+        initiator.run(["mkdir", lists])
+    helper(initiator, "initiator", "give")
+    assert initiator.path(f"{place}/{OF_ANOTHER}").read_text() == "record"
+    assert {path: initiator.path(path).read_text() for path in FILES} == FILES
+
+
+def test_what_cannot_be_saved_is_not_taken(initiator):
+    initiator.run(["mkdir", "-p", "/var/lib/remvol/initiator/records.new"])  # as on a full disk: no list is made
+    assert helper(initiator, "initiator", "take").status == 1
+    assert masked(initiator) == []
+
+
+def test_that_a_recovery_has_failed_is_told_without_the_tree_too():
+    """Other news are of what the tree wants."""
+    units = pathlib.Path(__file__).parents[2] / "packaging/units"
+    assert "Requisite=remvol-tree.service" in (units / "remvol-notify.service").read_text()
+    for path in [*units.glob("remvol-notify.service.d/*"), units / "remvol-recovery-failed@.service"]:
+        assert "Requisite=" not in path.read_text()
 
 
 def test_what_was_not_taken_is_not_given_back(initiator):
