@@ -83,7 +83,7 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume, bool wo
             "see whether the storage server still offers it", connect_command_of(target, &volume)};
   }
   if (worked_on)
-    return {Ailment::kBusy, "Mounting", "is not mounted while a command works on its target", "wait", ""};
+    return {Ailment::kBusy, "Busy", "is not mounted while a command works on its target", "wait", ""};
   return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again",
           connect_command_of(target, &volume)};
 }

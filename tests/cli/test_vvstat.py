@@ -219,7 +219,7 @@ def a_run_works(box, target, how=fcntl.LOCK_EX):
 def test_a_volume_that_is_not_mounted_while_a_command_works_on_its_target(example):
     run(example, "/bin/umount", "/mnt/VV/Backup")
     with a_run_works(example, T1_NAME):
-        check_problem(example, "Mounting", "is not mounted while a command works on its target", None)
+        check_problem(example, "Busy", "is not mounted while a command works on its target", None)
     check_problem(example, "Not Mounted", "is not mounted", CONNECT)
 
 
