@@ -19,8 +19,14 @@ def pytest_configure(config):
 
 
 def pytest_addoption(parser):
-    parser.addoption("--cases", type=int, metavar="N",
-                     help="of each test at most N cases: the first, the last, and some at equal distances between them")
+    parser.addoption("--cases", type=choice, metavar="N[/EVERY]",
+                     help="of each test at most N cases: the first, the last, and some at equal distances between them; "
+                          "of each EVERY tests one alone")
+
+
+def choice(text):
+    most, _, every = text.partition("/")
+    return int(most), int(every or 1)
 
 
 def leave_out(config, items, left_out):
@@ -28,19 +34,19 @@ def leave_out(config, items, left_out):
     items[:] = [item for item in items if item not in left_out]
 
 
-def further_cases(items, most):
-    """The tests beyond so many cases of one function."""
+def not_chosen(items, most, every):
+    """The tests beyond so many cases of one function, and all of the functions between those that are chosen."""
     cases = {}
     for item in items:
         cases.setdefault(item.nodeid.partition("[")[0], []).append(item)
-    for same in cases.values():
-        chosen = {i * (len(same) - 1) // max(most - 1, 1) for i in range(most)}
+    for place, same in enumerate(cases.values()):
+        chosen = {i * (len(same) - 1) // max(most - 1, 1) for i in range(most)} if place % every == 0 else ()
         yield from (item for number, item in enumerate(same) if number not in chosen)
 
 
 def pytest_collection_modifyitems(config, items):
     if config.getoption("--cases"):
-        leave_out(config, items, set(further_cases(items, config.getoption("--cases"))))
+        leave_out(config, items, set(not_chosen(items, *config.getoption("--cases"))))
     items.sort(key=lambda item: item.get_closest_marker("long") is None)
     if machine_folder() != build_folder():
         leave_out(config, items, {item for item in items if item.get_closest_marker("native")})
