@@ -5,9 +5,9 @@
 namespace remvol {
 
 // Starts it and loads the settings, unless it runs. Settings that are missing or damaged are replaced by
-// their copy on the configuration flash. A failed step is logged in the innermost scope's name. Returns false when
-// settings are there that could not be loaded, though nothing is said against them: the tree without them is not
-// to be taken for theirs.
+// their copy on the configuration flash. A failed step is logged in the innermost scope's name. Returns false
+// when settings are there that could not be loaded, though nothing is said against them: the tree without
+// them is not to be taken for theirs.
 [[nodiscard]] bool start_settings_daemon();
 
 // Has it end.

@@ -70,7 +70,8 @@ int move_share(int n) {
 // interrupted left number 0 and no share: it goes on.
 bool is_in_todays_form(int n) {
   TreeValue number;
-  return (tree_read_surely(KeyText(key::kLunNumber, n, kLunSlot), number, sizeof number) && atoi(number) != 0) ||
+  return (tree_read_surely(KeyText(key::kLunNumber, n, kLunSlot), number, sizeof number) &&
+          atoi(number) != 0) ||
          tree_present_surely(KeyText(key::kLunShare, n, kLunSlot));
 }
 
