@@ -1,8 +1,8 @@
 """Results that are settled as they are although a step failed, each with its reason: a run says 0 and this is missing.
 
-A row: the roads, the finding that it explains (expressions, searched), the reason. What stays wrong after the command
-was run again is a matter of its own: the second table. Nothing here explains a crash, a hang, lost data, or a touch of
-a disk that is not the run's."""
+A row: the roads ("ROAD for ever" is one where that fault stayed), the finding that it explains (expressions, searched), the
+reason. What stays wrong after the command was run again is a matter of its own: the second table. Nothing here explains a
+crash, a hang, lost data, or a touch of a disk that is not the run's."""
 
 import re
 
@@ -58,7 +58,7 @@ AFTER = (
     (r"^del", r"(folder|mount|target|disk) ",
      "a slot is deleted although its volume could not be unmounted or its session closed, and the deletion that is "
      "asked for again finds no slot"),
-    (r"^init-old", r"(tree|settings|folder|mount|target) ?",
+    (r"^init-old.* for ever$", r"(tree|settings|folder|mount|target) ?",
      "after any --init the version is the new one; what of the conversion failed for ever is not tried again"),
     (r"^search_lun-", r"(target \d|tree /iscsi/initiator/id:\d+/(lun/id:\d+/)?(conn_state|status|dev):)",
      "a search that ends before its logout leaves the target logged in, and the status says so; nobody can tell any "
@@ -69,6 +69,7 @@ def reason(fault, text):
     kind, _, rest = text.partition(": ")
     table = {"success": SUCCESS, "after": AFTER}.get(kind, ())
     for roads, finding, why in table:
-        if re.search(roads, fault.road) and re.match(finding, rest):
+        of_road = re.search(roads, fault.road) or (fault.forever and re.search(roads, f"{fault.road} for ever"))
+        if of_road and re.match(finding, rest):
             return why
     return None
