@@ -170,11 +170,7 @@ def test_settings_that_are_lost_come_from_the_flash(bare_box, saved):
         assert kept.stat().st_mode & 0o777 == 0o600
 
 
-# Those of version 0 have none.
-OLD = "<config><iscsi><initiator><prefix>saved</prefix><count>0</count></initiator></iscsi></config>"
-
-
-@pytest.mark.parametrize("saved", [settings("saved"), OLD, ""])
+@pytest.mark.parametrize("saved", [settings("saved"), ""])
 def test_a_tree_that_a_killed_start_left_empty_is_loaded(box, saved):
     appliance(box)
     box.write(SAVED, saved)
@@ -183,6 +179,15 @@ def test_a_tree_that_a_killed_start_left_empty_is_loaded(box, saved):
     init(box)
     assert START_TREE[0] not in box.trace()
     assert prefix(box) == ("saved" if saved else "copy")
+
+
+def test_settings_of_version_0_are_loaded_into_a_tree_that_a_killed_start_left_empty(box):
+    """They have no version."""
+    appliance(box)
+    box.write(SAVED, "<config><iscsi><initiator><prefix>saved</prefix><count>0</count></initiator></iscsi></config>")
+    assert box.tree.get("/x") is None
+    init(box)
+    assert prefix(box) == "saved"
 
 
 def test_a_tree_that_cannot_be_read_is_not_loaded_again(box):
