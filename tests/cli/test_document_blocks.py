@@ -48,7 +48,7 @@ ELSEWHERE = [
         "scripts/install-packages": ("scripts/demo", "scripts/install-packages build lab"),
         "cmake --preset": (RUNNER, "cmake --preset $1 && cmake --build build/$1"),
         "scripts/package": (RUNNER, "scripts/package"), "lab/run smoke": ("tests/lab/check-runner", "lab/run"),
-        "lab/run -j4 --all": (RUNNER, "lab/run -j$((2 * jobs)) --all"),
+        "lab/run -j5 --all": (RUNNER, "lab/run -j$((2 * jobs + 1)) --all"),
         "lab/run --output": ("lab/record-samples", "lab/run --output"),
         "lab/shell": BY_HAND}),
     ("docs/lab.md", "scripts/package", {
