@@ -72,7 +72,7 @@ TEST_F(Fakes, CallsAreRecordedInOrderAndSleepsAreInstant) {
 
 TEST_F(Fakes, RulesAnswerInOrder) {
   fakes::otherwise("system").returns(1);
-  fakes::on("system", std::regex("^b")).returns(2).times(1);
+  fakes::on("system", fakes::Expression{"^b"}).returns(2).times(1);
   fakes::on("system", "a").returns(3).error(EAGAIN);
   EXPECT_EQ(system("bb"), 2);
   EXPECT_EQ(system("bb"), 1);

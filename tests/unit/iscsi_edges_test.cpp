@@ -37,7 +37,7 @@ class Iscsi : public fakes::Test {
 
   // Every listing command writes `text` to where it is sent.
   static void listing(const std::string& text) {
-    fakes::on("system", std::regex("^iscsiadm -m session")).does([text] {
+    fakes::on("system", fakes::Expression{"^iscsiadm -m session"}).does([text] {
       const std::string command = fakes::commands().back();
       const size_t from = command.find('>') + 1;
       std::ofstream(command.substr(from, command.find(' ', from) - from)) << text;

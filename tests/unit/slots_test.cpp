@@ -7,7 +7,6 @@
 #include <chrono>
 #include <filesystem>
 #include <fstream>
-#include <regex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -80,8 +79,8 @@ TEST_F(HeldSlots, AreReadAnewEachTimeWhenThereIsNoLock) {
 TEST_F(HeldSlots, AreReadOnce) {
   const SlotsHeld held;
   EXPECT_TRUE(HeldSlot(2, 1));
-  fakes::on("ktreec_get_wb", std::regex("/target$")).returns(-1);
-  fakes::on("ktreec_get_wb", std::regex("/lun$")).returns(-1);
+  fakes::on("ktreec_get_wb", fakes::Expression{"/target$"}).returns(-1);
+  fakes::on("ktreec_get_wb", fakes::Expression{"/lun$"}).returns(-1);
   EXPECT_TRUE(HeldSlot(2, 1));
   EXPECT_TRUE(is_target_stored(2));
   EXPECT_TRUE(is_lun_stored(2, 1));
@@ -128,7 +127,7 @@ TEST_F(HeldSlots, ShowEndedWorkWhereTheTargetIsNow) {
 
 TEST_F(HeldSlots, AreBelievedFromHoldToHold) {
   EXPECT_EQ(target_in_a_new_hold(), 2);
-  fakes::on("ktreec_get_wb", std::regex("/(target|lun)$")).returns(-1);
+  fakes::on("ktreec_get_wb", fakes::Expression{"/(target|lun)$"}).returns(-1);
   EXPECT_EQ(target_in_a_new_hold(), 2);
 }
 
@@ -274,7 +273,9 @@ TEST_F(Slots, ATreeThatDoesNotAnswerLeavesTheNumbersAsTheyAre) {
 
 TEST_F(Slots, ATreeThatWasSilentForAMomentHasDeletedNothing) {
   ASSERT_EQ(ktree_get_dbidx_by_targetname("iqn.t2"), 2);
-  fakes::on("ktreec_get_wb", std::regex("/target$")).returns(-1).times(9);  // the first look for the name
+  fakes::on("ktreec_get_wb", fakes::Expression{"/target$"})
+      .returns(-1)
+      .times(9);  // the first look for the name
   EXPECT_EQ(ktree_set_connect_state(2, kConnecting), 0);
   EXPECT_EQ(fakes::tree_get(key(2, "conn_state")), "2");
 }

@@ -134,7 +134,7 @@ TEST_F(Format, AFailingKillIsIgnored) {
 
 TEST_F(Format, APartitionThatCannotBeWrittenKeepsTheSemaphore) {
   debug_level = 1;
-  fakes::on("system", std::regex("^dd ")).returns(256);
+  fakes::on("system", fakes::Expression{"^dd "}).returns(256);
   const std::string log = fakes::output_of([this] { EXPECT_EQ(Target_format(&entry, kNode), -2); });
   EXPECT_TRUE(has(log, "dd /dev/sdb1 failed, this device is not able to write."));
   EXPECT_EQ(written("format_state"), (Texts{"4", "1"}));

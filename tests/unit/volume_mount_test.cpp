@@ -4,7 +4,6 @@
 
 #include <filesystem>
 #include <fstream>
-#include <regex>
 
 #include "volume_fixture.h"
 
@@ -326,7 +325,7 @@ class StockKernel : public Mount {
   // Mounts a volume of that file system with these drivers in the kernel; the drivers' list may be missing.
   Texts mount_with(const char* fs_type, const char* drivers) {
     fakes::on("sys_get_fs_type", kNode).text(fs_type);
-    fakes::on("system", std::regex("^mount -t ufsd")).returns(32 << 8);
+    fakes::on("system", fakes::Expression{"^mount -t ufsd"}).returns(32 << 8);
     cover("/proc");
     if (drivers != nullptr) std::ofstream("/proc/filesystems") << drivers;
     EXPECT_EQ(mount_it(0, 0), 0);

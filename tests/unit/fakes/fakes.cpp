@@ -218,7 +218,13 @@ testing::AssertionResult Test::has(const std::string& log, const std::string& me
 }
 
 std::string Test::messages(const std::function<void()>& function) {
-  return std::regex_replace(output_of(function), std::regex("\\([^:()]+:[^:()]+:\\d+\\): "), "");
+  const Expression prefix{R"(\([^:()]+:[^:()]+:[0-9]+\): )"};
+  std::string text = output_of(function), kept;
+  while (const std::optional<Match> found = match(prefix, text)) {
+    kept += found->before;
+    text = found->after;
+  }
+  return kept + text;
 }
 
 }  // namespace fakes

@@ -35,10 +35,11 @@
 #include <initializer_list>
 #include <map>
 #include <optional>
-#include <regex>
 #include <string>
 #include <utility>
 #include <vector>
+
+#include "expression.h"
 
 namespace fakes {
 
@@ -50,8 +51,8 @@ struct Subject {
   Subject() : fits([](const std::string&) { return true; }) {}
   Subject(const char* text) : Subject(std::string(text)) {}
   Subject(std::string text) : fits([text](const std::string& subject) { return subject == text; }) {}
-  Subject(std::regex expression)
-      : fits([expression](const std::string& subject) { return std::regex_search(subject, expression); }) {}
+  Subject(Expression expression)
+      : fits([expression](const std::string& subject) { return match(expression, subject).has_value(); }) {}
 
   std::function<bool(const std::string&)> fits;
 };

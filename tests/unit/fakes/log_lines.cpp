@@ -1,6 +1,5 @@
 #include "log_lines.h"
 
-#include <regex>
 #include <sstream>
 
 #include "fakes.h"
@@ -9,14 +8,15 @@
 namespace fakes {
 
 std::vector<std::string> logged(int level, const std::function<void()>& function) {
-  static const std::regex prefix(R"(^\(([^:()]+):([^:()]+):[1-9][0-9]*\): )");
+  const Expression prefix{R"(^\(([^:()]+):([^:()]+):[1-9][0-9]*\): )"};
   const int before = remvol::debug_level;
   remvol::debug_level = level;
   std::istringstream text(output_of(function));
   remvol::debug_level = before;
   std::vector<std::string> found;
   for (std::string line; std::getline(text, line);) {
-    found.push_back(std::regex_replace(line, prefix, "$1:$2: "));
+    const std::optional<Match> part = match(prefix, line);
+    found.push_back(part ? part->groups[1] + ":" + part->groups[2] + ": " + part->after : line);
   }
   return found;
 }

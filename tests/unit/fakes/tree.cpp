@@ -21,8 +21,7 @@ struct Element {
 };
 
 bool is_name(const std::string& text) {
-  static const std::regex form("[A-Za-z_][A-Za-z0-9_.-]*");
-  return std::regex_match(text, form);
+  return match(Expression{"^[A-Za-z_][A-Za-z0-9_.-]*$"}, text).has_value();
 }
 
 // Returns whether the path is one of the tree.
