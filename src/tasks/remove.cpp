@@ -55,7 +55,6 @@ bool has_at_most(int luns, int dbidx) {
 Result delete_slot_of_last_lun(int dbidx, int lun) {
   const SlotsHeld held(SlotsHeld::kChange);
   int lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);
-  if (lun_dbidx <= 0) lun_dbidx = ktree_get_dbidx_by_lun(dbidx, lun);  // the read may have failed
   if (has_at_most(lun_dbidx > 0 ? 1 : 0, dbidx)) return delete_stored_slot(dbidx, 0);
   if (lun_dbidx <= 0 && !tree_is_loaded()) return kNotDeleted;  // nothing can be read
   const Result result = lun_dbidx > 0 ? delete_stored_slot(dbidx, lun_dbidx) : kOk;

@@ -32,6 +32,12 @@ bool tree_takes_connections() {
   return !refused;
 }
 
+int get_once(const char* key, char* buffer, size_t size) {
+  memset(buffer, 0, size);
+  errno = 0;
+  return ktreec_get_wb(kVolumesSocket, 0, key, buffer, size);
+}
+
 }  // namespace
 
 bool tree_answers(const char* key) {
@@ -50,9 +56,8 @@ TreeInstance tree_instance() {
 }
 
 int tree_get(const char* key, char* buffer, size_t size) {
-  memset(buffer, 0, size);
-  errno = 0;
-  return ktreec_get_wb(kVolumesSocket, 0, key, buffer, size);
+  const int got = get_once(key, buffer, size);
+  return got == -1 && errno != ENODATA ? get_once(key, buffer, size) : got;
 }
 
 bool tree_read(const char* key, char* buffer, size_t size) {
@@ -62,15 +67,6 @@ bool tree_read(const char* key, char* buffer, size_t size) {
 bool tree_present(const char* key) {
   TreeValue value;
   return tree_read(key, value);
-}
-
-bool tree_read_surely(const char* key, char* buffer, size_t size) {
-  return tree_read(key, buffer, size) || (errno != ENODATA && tree_read(key, buffer, size));
-}
-
-bool tree_present_surely(const char* key) {
-  TreeValue value;
-  return tree_read_surely(key, value, sizeof value);
 }
 
 bool tree_is_missing(const char* key, const char* present) {

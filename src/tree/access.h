@@ -35,7 +35,8 @@ struct TreeInstance {
 
 // Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns what the read gives: the number
 // of bytes, -1 for a key that is missing; errno is ENODATA when the tree has said so, and it is no read that
-// failed (a tree's library of another platform may not tell).
+// failed (a tree's library of another platform may not tell). What is read decides what is written, formatted
+// and taken away, so a read that may have failed is done once more.
 [[nodiscard]] int tree_get(const char* key, char* buffer, size_t size);
 
 // The same. Returns whether the key is present.
@@ -48,11 +49,6 @@ template <size_t N>
 
 // Returns whether `key` is present.
 [[nodiscard]] bool tree_present(const char* key);
-
-// The same, for what counts, or seems free and is to be written to: where a read may have failed, it is
-// looked at once more.
-[[nodiscard]] bool tree_read_surely(const char* key, char* buffer, size_t size);
-[[nodiscard]] bool tree_present_surely(const char* key);
 
 // Returns whether `key` is missing for certain: the tree has said so, or it cannot be read twice, and
 // `present`, a key that is there, can be read in between.

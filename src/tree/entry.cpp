@@ -22,19 +22,12 @@ void read_field(const char* key, char (&field)[N]) {
   if (tree_read(key, value)) copy_text(field, value);
 }
 
-// Every stored target has a port, which is stored again with what was changed: one that could not be read is
-// read once more.
-int read_port(const char* key) {
-  const int port = tree_read_number(key, 0);
-  return port != 0 ? port : tree_read_number(key, 0);
-}
-
 void read_target_fields(TargetEntry* entry, int dbidx) {
   entry->chap = tree_read_number(KeyText(key::kTargetChap, dbidx), 0);
   read_field(KeyText(key::kTargetChapName, dbidx), entry->chap_name);
   read_field(KeyText(key::kTargetChapPwd, dbidx), entry->chap_pwd);
   read_field(KeyText(key::kTargetIp, dbidx), entry->ip);
-  entry->port = read_port(KeyText(key::kTargetPort, dbidx));
+  entry->port = tree_read_number(KeyText(key::kTargetPort, dbidx), 0);
   entry->conn_set = tree_read_number(KeyText(key::kTargetConnSet, dbidx), 0);
 }
 
@@ -72,7 +65,7 @@ int count_luns_at(int n) {
 int count_all_luns_at(int n) {
   int count = 0;
   for (int m = 1; m <= kMaxLunsPerTarget; m++) {
-    count += tree_present_surely(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
+    count += tree_present(KeyText(key::kLunNumber, n, m)) ? 1 : 0;
   }
   return count;
 }
@@ -207,7 +200,7 @@ int ktree_update_current_targetcnt() {
   const LogScope scope;
   const SlotsHeld held;
   int count = 0;
-  for (int n = 1; n <= kMaxTargets; n++) count += tree_present_surely(KeyText(key::kTargetName, n)) ? 1 : 0;
+  for (int n = 1; n <= kMaxTargets; n++) count += tree_present(KeyText(key::kTargetName, n)) ? 1 : 0;
   return tree_write_with_tries(key::kTargetCount, NumberText("%d", count));
 }
 

@@ -38,7 +38,7 @@ int publish_lun(const char* socket, const LunNode* lun, int k, int dbidx) {
 bool share_is_used_in(int dbidx, const char* share) {
   for (int m = 1; m <= kMaxLunsPerTarget; m++) {
     TreeValue stored;
-    if (!tree_read_surely(KeyText(key::kLunShare, dbidx, m), stored, sizeof stored)) return false;
+    if (!tree_read(KeyText(key::kLunShare, dbidx, m), stored)) return false;
     if (strcmp(stored, share) == 0) return true;
   }
   return false;

@@ -51,7 +51,7 @@ int set_value(const char* key, const char* value) {
 #pragma GCC diagnostic ignored "-Wformat-nonliteral"  // the formats are those of the table above
 void move_state(int n, const MovedState& state) {
   TreeValue value;
-  if (!tree_read_surely(KeyText(state.from, n), value, sizeof value)) return;
+  if (!tree_read(KeyText(state.from, n), value)) return;
   const KeyText key(state.to, n, kLunSlot);
   const NumberText number("%d", atoi(value));
   if (write_surely(key, number) != kOk) LOG(0, "ktreec_set %s= %s failed", key.c_str(), number.c_str());
@@ -62,7 +62,7 @@ void move_state(int n, const MovedState& state) {
 // those who read the log know it.
 int move_share(int n) {
   TreeValue share;
-  if (!tree_read_surely(KeyText(key::kOldShare, n), share, sizeof share)) return set_failed();
+  if (!tree_read(KeyText(key::kOldShare, n), share)) return set_failed();
   return set_value(KeyText(key::kLunShare, n, kLunSlot), share);
 }
 
@@ -70,15 +70,13 @@ int move_share(int n) {
 // interrupted left number 0 and no share: it goes on.
 bool is_in_todays_form(int n) {
   TreeValue number;
-  return (tree_read_surely(KeyText(key::kLunNumber, n, kLunSlot), number, sizeof number) &&
-          atoi(number) != 0) ||
-         tree_present_surely(KeyText(key::kLunShare, n, kLunSlot));
+  return (tree_read(KeyText(key::kLunNumber, n, kLunSlot), number) && atoi(number) != 0) ||
+         tree_present(KeyText(key::kLunShare, n, kLunSlot));
 }
 
 int upgrade_target(int n) {
   const KeyText name(key::kTargetName, n);
-  TreeValue stored;
-  if (!tree_read_surely(name, stored, sizeof stored) || stored[0] == '\0') {
+  if (!tree_present(name)) {
     LOG(2, "get %s fail", name.c_str());
     return kFailed;
   }
@@ -99,7 +97,7 @@ int upgrade_target(int n) {
 
 int upgrade_targets() {
   TreeValue text;
-  if (!tree_read_surely(key::kTargetCount, text, sizeof text)) {
+  if (!tree_read(key::kTargetCount, text)) {
     LOG(1, "%s is NULL or disappear, exit func", key::kTargetCount);
     return kOk;
   }

@@ -156,7 +156,7 @@ class TestStandingBehindAState:
 
 class TestHalfMadeSlots:
     def test_a_share_that_could_not_be_read_once_costs_no_lun(self, stored, box):
-        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/lun/id:1/share", ret=-1, times=1)
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/lun/id:1/share", ret=-1, times=2)
         status(box)
         assert (stored.lun("lun"), stored.lun("share")) == ("0", "a")
 

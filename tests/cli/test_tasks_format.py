@@ -135,7 +135,7 @@ class TestFormat:
 
     def test_an_entry_that_cannot_be_read(self, volume, box):
         box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/target", through=True, effect=SLOTS_MOVE)
-        box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/lun/id:1/lun", ret=-1, skip=1, times=1)
+        box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/lun/id:1/lun", ret=-1, skip=1, times=2)
         self.refused(volume, box, ["Can not get lun entry 0 under target iqn.t1"], "-n", "iqn.t1", "-l", "0")
 
     def test_it_logs_start_and_end(self, volume, box):

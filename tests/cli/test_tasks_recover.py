@@ -256,7 +256,7 @@ class TestDegradedVolumes:
         # The connection looks the target up again and does not find it: so many reads come before that one, one behind
         # each command at most, and one behind that state.
         box.hook("ktreec_set", f"{INITIATOR}/id:1/conn_state", value="2", through=True, effect=SLOTS_MOVE)
-        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=8, times=1)
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", ret=-1, skip=8, times=2)
         assert recover(box).status == 255
         assert lost.target("conn_state") == "0"
         assert_order(lost.trace(), "set id:1/conn_state=2", "set id:1/conn_state=0")
@@ -277,7 +277,7 @@ class TestDegradedVolumes:
         # Read: by the first walk, its look at the format state and its step to the next slot, by the presence check
         # of the second walk, then by the entry.
         box.hook("ktreec_get_wb", f"{INITIATOR}/id:1/target", through=True, effect=SLOTS_MOVE)
-        box.hook("ktreec_get_wb", key, ret=-1, skip=4, times=1)
+        box.hook("ktreec_get_wb", key, ret=-1, skip=4, times=2)
         recover(box)
         umounts = [line for line in box.shell() if line.startswith("umount")]
         assert umounts == ['umount -f "/mnt/VV/b"']

@@ -213,7 +213,7 @@ class TestLun:
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
         # The name is read by the look-up of the slot, by the two walks of the count, then by the entry.
         box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/target", through=True, effect=SLOTS_MOVE)
-        box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/lun/id:1/lun", ret=-1, skip=2, times=1)
+        box.hook("ktreec_get_wb", "/iscsi/initiator/id:1/lun/id:1/lun", ret=-1, skip=2, times=2)
         done = box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0")
         assert done.status == 255
         assert messages(done)[-1] == "Can not get lun entry 0 under target iqn.t1"
