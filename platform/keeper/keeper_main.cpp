@@ -48,9 +48,9 @@ time_t now() {
   return time.tv_sec;
 }
 
-// Sessions go because somebody wants them to.
-bool is_taken_down() {
-  return runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"});
+// Sessions go because somebody wants them to: this target's, or any.
+bool is_taken_down(const std::string& target = {}) {
+  return runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"}, target);
 }
 
 bool is_brought_up() {
@@ -79,7 +79,7 @@ void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
   start_program({kInitiatorDaemon, "-f"}, kInitiatorDaemon);
 }
 
-std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
+std::vector<Wanted> read_wanted(bool first, bool& answered) {
   const std::vector<platform::Session> sessions = platform::read_sessions();
   const bool at_work = is_brought_up();
   platform::TreeReader tree;
@@ -91,9 +91,9 @@ std::vector<Wanted> read_wanted(bool first, bool taken_down, bool& answered) {
     const bool connected =
         std::any_of(sessions.begin(), sessions.end(),
                     [&name](const platform::Session& session) { return session.target == name; });
-    const bool is_taken =
-        taken_down || (first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) ==
-                                    remvol::kDisconnected);
+    const bool was_taken = first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) ==
+                                        remvol::kDisconnected;
+    const bool is_taken = !connected && (was_taken || is_taken_down(name));
     wanted.push_back({name, connected, is_taken, at_work});
   }
   answered = tree.answered();
@@ -119,10 +119,9 @@ void tell(Keeper& daemon) {
 }
 
 void look(Keeper& daemon) {
-  const bool taken_down = is_taken_down();
   bool answered = false;
-  const std::vector<Wanted> wanted = read_wanted(daemon.first, taken_down, answered);
-  keep_initiator(daemon, answered, taken_down);
+  const std::vector<Wanted> wanted = read_wanted(daemon.first, answered);
+  keep_initiator(daemon, answered, is_taken_down());
   if (!answered) return;
   daemon.first = false;
   daemon.schedule.look(wanted, now());

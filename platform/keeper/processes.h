@@ -8,8 +8,9 @@
 namespace keeper {
 
 // True when a process runs the program of that name, and one of its arguments is one of `options` (any when
-// there are none).
-bool runs(std::string_view program, std::initializer_list<std::string_view> options = {});
+// there are none). With a target, only when it names no other one behind "-n".
+bool runs(std::string_view program, std::initializer_list<std::string_view> options = {},
+          std::string_view target = {});
 
 }  // namespace keeper
 

@@ -75,6 +75,21 @@ def test_a_target_that_is_to_be_away_is_left_away(keeper, values):
     assert keeper.runs == []
 
 
+@pytest.mark.parametrize("named", ["-n iqn.t2", "-n iqn.t1", ""], ids=["another", "itself", "all"])
+def test_only_a_command_for_the_target_keeps_it_away(keeper, named):
+    box = keeper.box
+    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
+    box.start(["/tmp/bin/remvol", "--disconnect", *named.split()], env={"LD_PRELOAD": None})
+    keeper.target(1, port=3260)
+    listen(box)
+    keeper.start()
+    if "t2" in named:
+        keeper.wait_runs(("--status",), ("--connect", "-n", "iqn.t1"))
+    else:
+        box.run(["/bin/sleep", "6"], env={"LD_PRELOAD": None})
+        assert keeper.runs == []
+
+
 def test_volumes_of_a_lost_session_are_recovered(keeper):
     box = keeper.box
     keeper.target(1, port=3260)
