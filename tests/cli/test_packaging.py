@@ -326,6 +326,21 @@ def test_nothing_is_taken_away_when_nobody_knows_whose_it_is(initiator, place, l
     assert {path: initiator.path(path).read_text() for path in FILES} == FILES
 
 
+def test_what_cannot_be_put_back_stays_saved(initiator):
+    helper(initiator, "initiator", "take")
+    for path in FILES:
+        initiator.write(path, "ours")
+    initiator.run(["mkdir", "-p", "/etc/iscsi/iscsid.conf.new/iscsid.conf"])  # as on a full disk: no copy is made
+    done = helper(initiator, "initiator", "give")
+    assert done.status == 1 and "stays in /var/lib/remvol/initiator" in done.stderr
+    assert masked(initiator) == MASKED
+    assert initiator.path("/var/lib/remvol/initiator/iscsid.conf").read_text() == "of Debian\n"
+    assert initiator.path("/etc/iscsi/iscsid.conf").read_text() == "ours"
+    initiator.run(["rm", "-r", "/etc/iscsi/iscsid.conf.new"])
+    assert helper(initiator, "initiator", "give").status == 0
+    assert {path: initiator.path(path).read_text() for path in FILES} == FILES
+
+
 def test_what_cannot_be_saved_is_not_taken(initiator):
     initiator.run(["mkdir", "-p", "/var/lib/remvol/initiator/records.new"])  # as on a full disk: no list is made
     assert helper(initiator, "initiator", "take").status == 1

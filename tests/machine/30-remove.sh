@@ -16,11 +16,16 @@ expect_nothing_runs() {
 as_before() { expect_not "$1 is ours" grep -q -e 'replacement_timeout = 30$' -e 'iqn\.2013-03' "$1"; }
 
 works --modify -n $IQN:t1 -c 1 -U maria -P s3cr3tw0rd
+mkdir -p /var/lib/prometheus/node-exporter
+systemctl enable --now remvol-metrics.timer
+systemctl start remvol-metrics.service
 sh -c 'while date; do sleep 0.2; done >/mnt/VV/Photos/busy 2>/dev/null' &
 apt_quiet remove remvol || fail "the package is not removed"
 expect_nothing_runs
 as_before /etc/iscsi/iscsid.conf
 as_before /etc/iscsi/initiatorname.iscsi
+expect_not "the metrics' timer runs" systemctl -q is-active remvol-metrics.timer
+expect_not "metrics are left" test -e /var/lib/prometheus/node-exporter/remvol.prom
 expect "the settings are there" grep -q Photos /etc/NAS_CFG/vv.xml
 
 works_again() { expect_equal "the file" "text of Photos" "$(cat /mnt/VV/Photos/file)"; }
