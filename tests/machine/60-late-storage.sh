@@ -16,7 +16,7 @@ says_so() { ! vvstat >/tmp/vvstat.out && ! grep -q Running /tmp/vvstat.out; }
 wait_for 60 says_so
 sleep 100
 expect "the texts are right" says_so
-lines=$(messages remvol-events | grep -c $IQN:t1)
+lines=$(messages remvol-events remvol-keeper | grep -c $IQN:t1)
 target_start
 all_there() { mounted Photos && mounted Music && vvstat; }
 wait_for 75 all_there
