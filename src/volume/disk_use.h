@@ -25,7 +25,7 @@ class DiskHeld {
   int fd_ = -1;
 };
 
-// Returns the mark of the first 4 KiB, where every file system that the tool makes has its signature.
+// Returns the mark of the first 4 KiB, where every file system that the tool makes notes its last mount.
 [[nodiscard]] ContentMark content_mark(const char* node);
 
 // Returns whether the mount table has the block device `node`; not when that cannot be told.

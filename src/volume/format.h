@@ -10,17 +10,23 @@ namespace remvol {
 enum [[nodiscard]] FormatResult : int;
 enum FormatResult : int {
   kFormatted = 0,        // also when mke2fs could not be started, failed, or a state could not be stored
-  kFormatLeftAlone = 1,  // the partition is mounted, or no longer as it was seen and recognised
+  kFormatLeftAlone = 1,  // the partition is mounted, or carries what was not seen on it
   kFormatRefused = -1,   // bad arguments, no semaphore, another disk than the entry's or one that is in use
   kFormatNotWritable = -2,  // the partition; this run keeps the semaphore until it ends
   kFormatNotStarted = -3,   // mke2fs could not be started: of a step alone, not told
 };
 
+// What a partition carried when its format was decided.
+struct SeenContent {
+  const char* fs_type;  // empty unless an earlier partition left it in the place of this new one
+  ContentMark mark;
+};
+
 // Formats the partition node `partition` for the entry's LUN, with the ext2, ext3 or ext4 found on it, else
-// with ext4. `seen_empty` is the partition's mark from when nothing was recognised on it; kNoMark when the
-// user asked for a format, whatever is on it. The result is that of leaving the semaphore, whatever happened
-// before (0, or -2 as if the partition could not be written), unless it is told above.
-FormatResult Target_format(TargetEntry* entry, const char* partition, ContentMark seen_empty = kNoMark);
+// with ext4. `seen` is null when the user asked for a format, whatever is there. The result is that of
+// leaving the semaphore, whatever happened before (0, or -2 as if the partition could not be written), unless
+// it is told above.
+FormatResult Target_format(TargetEntry* entry, const char* partition, const SeenContent* seen = nullptr);
 
 enum [[nodiscard]] ProcessState : int;
 enum ProcessState : int { kRunning = 0, kNotRunning = 1 };

@@ -64,8 +64,8 @@ struct Mounting {
   // follow one another read the disk once. It is not open during a format, which kills whoever uses the node,
   // nor longer than the looks, since an unmount by another run does that too.
   HeldNode held;
-  char fs_type[64];        // on the node; empty when none is known
-  ContentMark seen_empty;  // the node's mark when the format was decided; kNoMark when it was asked for
+  char fs_type[64];  // on the node; empty when none is known
+  ContentMark mark;  // the node's when the format was decided
   MountPointText mount_point;
 };
 
@@ -165,7 +165,8 @@ bool protect_data(Mounting* volume) {
 MountResult create_file_system(Mounting* volume) {
   LOG(kNote, "Got FS type = %s, creating volume", volume->fs_type);
   volume->held.release();
-  const FormatResult result = Target_format(volume->entry, volume->node, volume->seen_empty);
+  const SeenContent seen = {volume->fs_type, volume->mark};
+  const FormatResult result = Target_format(volume->entry, volume->node, volume->asked ? nullptr : &seen);
   if (result == kFormatted || (result == kFormatLeftAlone && !volume->asked)) return kMounted;
   if (result == kFormatNotWritable && !record_access_right(volume->entry, VOL_AC_RO)) return kMountUnrecorded;
   LOG(0, "Create Format FAILED");
@@ -185,7 +186,7 @@ MountResult keep_file_system(Mounting* volume) {
 // Leaves the chosen partition with a known file system.
 MountResult prepare_file_system(Mounting* volume) {
   LOG(2, "Got dev %s, force_format=%d", volume->node.c_str(), volume->force_format);
-  if (!volume->asked) volume->seen_empty = content_mark(volume->node);
+  volume->mark = content_mark(volume->node);
   detect_fs(volume);
   if (!protect_data(volume)) return kMountNoPartition;
   const MountResult result =

@@ -6,6 +6,7 @@ import pytest
 from appliance import settings
 from harness import messages
 from harness.initiator import INITIATOR
+from harness.sysaux import image
 from harness.volumes import drive, luns
 
 __all__ = ["luns"]
@@ -237,6 +238,32 @@ class TestOtherRuns:
         assert lun.mount().result == 0
         assert not formatted(lun.box)
         assert self.label(lun) == "theirs"
+
+    @pytest.mark.parametrize("kind", ["btrfs", "jfs", "udf"])
+    def test_nor_what_has_its_signature_further_in(self, lun, kind):
+        content = image(kind)
+        assert not any(content[:4096]), "the beginning stays as it was"
+        lun.box.path("/root/theirs").write_bytes(content)
+        while_waiting(lun.box, f"cat /root/theirs >{lun.disk.part}")
+        done = lun.mount()
+        assert not formatted(lun.box)
+        assert not ran(lun.box, "fuser", "mount -t")
+        assert f"{lun.disk.part} carries {kind} by now, it is not formatted" in messages(done)
+        assert (done.result, lun.key("format_state"), lun.key("volume_state")) == (-6, "0", "5")
+        with open(lun.disk.part, "rb") as partition:
+            assert partition.read(len(content)) == content
+
+    @pytest.mark.parametrize("use, label", [("", ""), ("mount {0} /mnt/other; umount /mnt/other", "earlier")],
+                             ids=["untouched", "used meanwhile"])
+    def test_what_an_earlier_partition_left(self, lun, use, label):
+        """It is seen in the new partition, which is formatted unless somebody has used it in between."""
+        lun.box.run(["/usr/sbin/mke2fs", "-q", "-t", "ext4", "-L", "earlier", lun.disk.part])
+        lun.disk.forget()
+        lun.disk.wipe_ends()
+        lun.box.path("/mnt/other").mkdir()
+        while_waiting(lun.box, use.format(lun.disk.part) or ":")
+        assert lun.mount().result == 0
+        assert (bool(formatted(lun.box)), self.label(lun), lun.mounted()) == (not use, label, True)
 
     def test_what_was_mounted_meanwhile_stays(self, lun):
         while_waiting(lun.box, f"{self.make(lun)}; mkdir -p {lun.mount_point}; mount {lun.disk.part} {lun.mount_point}; "

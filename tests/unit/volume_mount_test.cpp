@@ -223,6 +223,13 @@ TEST_F(Mount, WhatIsRecognisedOnTheSecondLookIsNotFormatted) {
   EXPECT_EQ(fakes::commands(), (Texts{kMkdir, kMount, kResize, kChmod, kReload}));
 }
 
+TEST_F(Mount, WhatIsRecognisedBehindTheSemaphoreIsNotFormatted) {
+  empty_partition(2);  // and what it begins with cannot be read
+  EXPECT_EQ(mount_it(), 0);
+  EXPECT_EQ(fakes::commands(), (Texts{kMkdir, kMount, kResize, kChmod, kReload}));
+  EXPECT_TRUE(has(log, "/dev/sdb1 carries ext4 by now, it is not formatted"));
+}
+
 TEST_F(Mount, WhatWasRecognisedIsNotTakenForEmptyLater) {
   fakes::on("sys_get_fs_type", kNode).text("ext4").returns(0).times(1);
   fakes::on("sys_get_fs_type", kNode).returns(-1);
