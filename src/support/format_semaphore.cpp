@@ -15,7 +15,7 @@ namespace {
 
 constexpr key_t kFormatSemKey = 90111;
 constexpr int kFormatSemMode = 0666;
-constexpr int kOwnMode = 0600;    // what a set of ours is left with
+constexpr int kOwnMode = 0600;    // of a set of ours, from its making on
 constexpr int kMaxReplaced = 16;  // a stranger may be quick to make another one
 
 int held_sem_id = -1;  // the set that this process has taken and not left
@@ -38,48 +38,52 @@ bool read_status(int sem_id, semid_ds* status) {
   return semctl(sem_id, 0, IPC_STAT, argument) == 0;
 }
 
+// Returns the id of the set, or -1 with errno. The id of a set that is closed to us is told as well, by a
+// call that asks for no permission: the units keep CAP_IPC_OWNER from a run, but what it may not use it may
+// remove.
+int get_set(int flags) {
+  const int sem_id = semget(kFormatSemKey, 1, flags);
+  if (sem_id != -1 || errno != EACCES) return sem_id;
+  const int closed = semget(kFormatSemKey, 0, 0);
+  errno = EACCES;
+  return closed;
+}
+
 // Removes a set that another user made or was given: whoever may change it can keep every format waiting.
 // Returns whether it was one.
 bool remove_stranger(int sem_id) {
   semid_ds status{};
-  if (!read_status(sem_id, &status)) return false;
-  if (status.sem_perm.uid == geteuid() && status.sem_perm.cuid == geteuid()) return false;
-  LOG(0, "the format semaphore belongs to user %u, it is replaced", status.sem_perm.cuid);
+  if (read_status(sem_id, &status)) {
+    if (status.sem_perm.uid == geteuid() && status.sem_perm.cuid == geteuid()) return false;
+    LOG(0, "the format semaphore belongs to user %u, it is replaced", status.sem_perm.cuid);
+  } else {
+    if (errno != EACCES) return false;
+    LOG(0, "the format semaphore belongs to another user, it is replaced");
+  }
   semctl(sem_id, 0, IPC_RMID);
   return true;
-}
-
-// Takes a set of ours from all other users. It has no value yet, so nobody has it.
-void close_to_others(int sem_id) {
-  semid_ds status{};
-  if (!read_status(sem_id, &status)) return;
-  status.sem_perm.mode = kOwnMode;
-  semun argument{};
-  argument.buf = &status;
-  semctl(sem_id, 0, IPC_SET, argument);
 }
 
 // Returns the id of a set that no other user made, or -1 with errno.
 int get_own_set(int flags) {
   for (int i = 0; i < kMaxReplaced; i++) {
-    const int sem_id = semget(kFormatSemKey, 1, flags);
+    const int sem_id = get_set(flags);
     if (sem_id == -1 || !remove_stranger(sem_id)) return sem_id;
   }
   errno = EACCES;
   return -1;
 }
 
-// Makes the semaphore set and gives it its value. The create is not exclusive: two runs that found it missing
-// at the same moment may both set the value, and both format then. That costs memory and time, not data,
-// since they format different volumes.
+// Makes the semaphore set and gives it its value. No other user may wait for it meanwhile, who would have it
+// first. The create is not exclusive: two runs that found it missing at the same moment may both set the
+// value, and both format then. That costs memory and time, not data, since they format different volumes.
 int create_format_sem(int initial) {
   LOG(2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
-  const int sem_id = get_own_set(IPC_CREAT | kFormatSemMode);
+  const int sem_id = get_own_set(IPC_CREAT | kOwnMode);
   if (sem_id == -1) {
     LOG(0, "semget(..., IPC_CREATE ) failed");
     return -1;
   }
-  close_to_others(sem_id);
   semun value{};
   value.val = initial > 0 ? initial : 1;
   LOG(2, "try to semctl(%d,0,SETVAL, %d )", sem_id, value.val);

@@ -1,12 +1,14 @@
 """Several runs at once: the locks, the format semaphore, formats and resizes of others. And device nodes."""
 
 import os
+import re
 import signal
 import stat
 
 import pytest
+from harness import messages
 from harness.initiator import store
-from harness.volumes import drive
+from harness.volumes import drive, with_result
 
 RUNS = 20
 
@@ -87,12 +89,30 @@ def test_a_new_format_after_the_last(box):
     assert box.trace("semctl").count("semctl SETVAL 1") == 3
 
 
-def test_a_strangers_semaphore_is_no_hindrance(box):
+# What a stranger does with the semaphore; its id is printed.
+STRANGER = "import ctypes, os; os.setuid(12345); print(ctypes.CDLL(None).semget(90111, 1, 0o%o))"
+# As in the units, which leave a run most rights of root but not that of using what belongs to others.
+BOUNDED = ["/usr/bin/setpriv", "--bounding-set", "-ipc_owner"]
+
+
+@pytest.mark.parametrize("bounds", [[], BOUNDED], ids=["root", "bounded"])
+@pytest.mark.parametrize("flags", [0o1666, 0o1600, 0o1000], ids=oct)
+def test_a_strangers_semaphore_is_no_hindrance(box, flags, bounds):
     """It has the value 0, so whoever waited for it would wait for ever."""
-    stranger = "import ctypes, os; os.setuid(12345); print(ctypes.CDLL(None).semget(90111, 1, 0o1666))"
-    assert box.run(["/usr/bin/python3", "-c", stranger]).stdout != "-1\n"
-    assert drive(box, "pass", "/tmp/inside").result == 0
+    assert box.run(["/usr/bin/python3", "-c", STRANGER % flags]).stdout != "-1\n"
+    done = with_result(box.run([*bounds, str(box.tools / "volume_driver"), "pass", "/tmp/inside"]))
+    assert done.result == 0
+    whose = "another user" if bounds and flags != 0o1666 else "user 12345"
+    assert f"the format semaphore belongs to {whose}, it is replaced" in messages(done)
     assert semaphores(box) == []
+
+
+def test_no_stranger_gets_at_a_semaphore_that_is_being_made(box):
+    """Whoever waits for it before it has its value gets in first, and need never leave."""
+    box.write("/tmp/stranger", STRANGER % 0o666)
+    box.hook("semctl", re.compile("IPC_SET|SETVAL"), through=True, effect="python3 /tmp/stranger >>/root/got")
+    assert drive(box, "pass", "/tmp/inside").result == 0
+    assert set(box.path("/root/got").read_text().split()) == {"-1"}
 
 
 def test_a_second_lun_is_not_kept_waiting_by_the_first(box):
