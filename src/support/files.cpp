@@ -47,6 +47,15 @@ bool is_own_folder(const struct stat& found) {
   return S_ISDIR(found.st_mode) && found.st_uid == geteuid();
 }
 
+// Removes what is at `path`, or puts it aside, unless it is a folder of our own user.
+void drop_foreign_folder(const char* path) {
+  struct stat found;
+  if (lstat(path, &found) != 0 || is_own_folder(found)) return;
+  remove_path(path);
+  // What its owner fills as fast as it is emptied is put aside.
+  rename(path, Text<PATH_MAX>("%s.foreign-%d", path, static_cast<int>(getpid())));
+}
+
 }  // namespace
 
 int check_path_exist(const char* path) {
@@ -88,14 +97,6 @@ int _remove_file(const char* path) {
 
 void remove_path(const char* path) {
   remove_at(AT_FDCWD, path, 0);
-}
-
-void drop_foreign_folder(const char* path) {
-  struct stat found;
-  if (lstat(path, &found) != 0 || is_own_folder(found)) return;
-  remove_path(path);
-  // What its owner fills as fast as it is emptied is put aside.
-  rename(path, Text<PATH_MAX>("%s.foreign-%d", path, static_cast<int>(getpid())));
 }
 
 bool claim_folder(const char* path) {

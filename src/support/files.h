@@ -37,9 +37,6 @@ using Directory = std::unique_ptr<DIR, DirectoryCloser>;
 // Removes whatever is at `path`, a folder with all that is in it. Follows no link.
 void remove_path(const char* path);
 
-// Removes what is at `path`, or puts it aside, unless it is a folder of our own user.
-void drop_foreign_folder(const char* path);
-
 // Makes sure that `path` is a folder of our own user which nobody else may enter: what is there and is not is
 // replaced. Its parent has to exist. Returns whether it is.
 [[nodiscard]] bool claim_folder(const char* path);

@@ -42,8 +42,8 @@ int open_lock_file(const char* path) {
 
 int make_lock_dir() {
   // Where everybody may make folders (a /var/lock of mode 1777) it may be somebody else's.
-  drop_foreign_folder(Text<sizeof kLockDir>("%.*s", static_cast<int>(sizeof kLockDir - 2), kLockDir));
-  if (make_dir_include_parent(kLockDir, 0700) == 0) return kOk;
+  const Text<sizeof kLockDir> folder("%.*s", static_cast<int>(sizeof kLockDir - 2), kLockDir);
+  if (make_dir_include_parent(folder, 0700) == 0 && claim_folder(folder)) return kOk;
   begin_line(0, stderr);
   perror(kLockDir);
   return kLockFileFailed;

@@ -7,6 +7,7 @@
 
 #include <cerrno>
 #include <filesystem>
+#include <fstream>
 
 #include "volume_fixture.h"
 
@@ -66,6 +67,36 @@ TEST_F(Locks, TheDirectoryIsMadeForRootAlone) {
   ASSERT_EQ(stat("/var/lock/virtual_volume", &status), 0);
   EXPECT_EQ(status.st_mode & 07777, 0700u);
   EXPECT_EQ(make_lock_dir(), 0) << "it exists";
+  ASSERT_EQ(chmod("/var/lock/virtual_volume", 0777), 0);
+  EXPECT_EQ(make_lock_dir(), 0);
+  ASSERT_EQ(stat("/var/lock/virtual_volume", &status), 0);
+  EXPECT_EQ(status.st_mode & 07777, 0700u);
+}
+
+TEST_F(Locks, WhatAStrangerPutInItsPlaceIsReplaced) {
+  std::filesystem::create_directory("/var/lock/elsewhere");
+  std::filesystem::create_directory_symlink("/var/lock/elsewhere", "/var/lock/virtual_volume");
+  EXPECT_EQ(make_lock_dir(), 0);
+  EXPECT_TRUE(std::filesystem::is_directory(std::filesystem::symlink_status("/var/lock/virtual_volume")));
+  std::filesystem::remove("/var/lock/virtual_volume");
+  std::ofstream("/var/lock/virtual_volume") << "x";
+  EXPECT_EQ(make_lock_dir(), 0);
+  ASSERT_EQ(chown("/var/lock/virtual_volume", 12345, 12345), 0);
+  EXPECT_EQ(make_lock_dir(), 0);
+  struct stat status {};
+  ASSERT_EQ(stat("/var/lock/virtual_volume", &status), 0);
+  EXPECT_EQ(status.st_uid, geteuid());
+}
+
+// A stranger's folder that can be neither emptied (it is too deep) nor put aside.
+TEST_F(Locks, AStrangersDirectoryThatStaysIsNotUsed) {
+  std::string below = "/var/lock/virtual_volume";
+  for (int depth = 0; depth < 40; depth++) below += "/x";
+  std::filesystem::create_directories(below);
+  std::filesystem::create_directories("/var/lock/virtual_volume.foreign-" + std::to_string(getpid()) + "/x");
+  ASSERT_EQ(chown("/var/lock/virtual_volume", 12345, 12345), 0);
+  EXPECT_EQ(call([] { return make_lock_dir(); }), -108);
+  EXPECT_EQ(errors, "/var/lock/virtual_volume/: File exists\n");
 }
 
 TEST_F(Locks, ADirectoryThatCannotBeMadeIsTold) {
