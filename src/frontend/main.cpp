@@ -69,7 +69,7 @@ void copy_to_flash() {
 bool dump_settings(const CommandRow& command) {
   // A tree that was told to end may be gone already, which is nothing to tell of.
   if (command.ends_tree) {
-    return !dump_would_bury_settings() && ktreec_dump(kVolumesSocket, 0, kSettingsFile) == 0;
+    return unloaded_settings() == nullptr && ktreec_dump(kVolumesSocket, 0, kSettingsFile) == 0;
   }
   RunLock lock;
   lock.take("settings.lock", LockMode::kExclusive);  // an older dump never replaces a newer one

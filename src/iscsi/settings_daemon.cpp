@@ -19,11 +19,11 @@ namespace remvol {
 namespace {
 
 constexpr char kSettingsPidFile[] = "/var/run/ktree_sock_vv_config.pid";
-constexpr char kFlashCopy[] = "/usr/local/config/vv.xml";
 
-// Exit status of ktreec.
-constexpr int kSettingsRefused = 1;
-constexpr int kLoadTries = 10;  // one a second
+// Exit statuses of ktreec.
+constexpr int kSettingsRefused = 1;  // missing or damaged
+constexpr int kLoadFailed = 4;       // nothing is said against the file
+constexpr int kLoadTries = 10;       // one a second
 
 // Returns the exit status of the command that loads `file` into the tree, or -1 when it did not come to its
 // end. Loading moves all slots at once: a run that has found them empty a moment ago must not take them for
@@ -55,22 +55,22 @@ bool is_nowhere(const char* file) {
 // Settings that are missing or damaged are replaced by their copy on the configuration flash. Returns whether
 // no settings are left that may be good and were not loaded.
 bool load_settings() {
-  int ended = load_surely(kSettingsFile);
-  if (ended == 0) return true;
-  if (ended != kSettingsRefused) return is_nowhere(kSettingsFile) && is_nowhere(kFlashCopy);
+  const int saved = load_surely(kSettingsFile);
+  if (saved == 0) return true;
+  const bool refused = saved == kSettingsRefused;
+  const bool has_copy = !is_nowhere(kFlashCopy);
+  if (!refused && (saved != kLoadFailed || !has_copy)) return is_nowhere(kSettingsFile) && !has_copy;
   keep_damaged_settings();
-  if (is_nowhere(kFlashCopy)) return true;
-  ended = load_surely(kFlashCopy);
-  if (ended == 0) LOG(0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
-  return ended == 0 || ended == kSettingsRefused;
+  if (!has_copy) return true;
+  const int copy = load_surely(kFlashCopy);
+  if (copy == 0) LOG(0, "%s is missing or damaged, %s was loaded instead", kSettingsFile, kFlashCopy);
+  return copy == 0 || (refused && copy == kSettingsRefused);
 }
 
-// A run that was killed between starting the daemon and loading has left a tree that answers and holds
-// nothing.
-bool was_left_empty() {
-  return tree_is_missing(key::kVersion, key::kVersion) &&
-         tree_is_missing(key::kTargetCount, key::kTargetCount) &&
-         (settings_file_has_targets(kSettingsFile) || settings_file_has_targets(kFlashCopy));
+// A run that was killed between starting the daemon and loading has left a tree that answers and holds no
+// settings; a command may have put something into it since.
+bool was_never_loaded() {
+  return tree_is_missing(key::kVersion, key::kVersion) && unloaded_settings() != nullptr;
 }
 
 }  // namespace
@@ -78,7 +78,7 @@ bool was_left_empty() {
 // A killed daemon leaves its pid file behind. The result key was set a moment ago.
 bool start_settings_daemon() {
   const bool runs = check_path_exist(kSettingsPidFile) == 0 && tree_answers(KeyText("%s/init", key::kResult));
-  if (runs && !was_left_empty()) return true;
+  if (runs && !was_never_loaded()) return true;
   if (!runs) start_tree_daemon(kVolumesSocket);
   return load_settings();
 }

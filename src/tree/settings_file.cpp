@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <initializer_list>
 
 #include "frontend/log.h"
 #include "ktreec.h"
@@ -81,9 +82,11 @@ bool find_value(FileText text, const char* name) {
   return false;
 }
 
+// The same of the file at `path`; one that is there and cannot be read may have it.
 bool has_value(const char* path, const char* name) {
   const File file(fopen(path, "re"));
-  return file != nullptr && find_value({file.get()}, name);
+  if (file == nullptr) return errno != ENOENT;
+  return find_value({file.get()}, name) || ferror(file.get()) != 0;
 }
 
 // Where the folder is missing nobody keeps settings: that is no line of the log, which programs read.
@@ -98,14 +101,6 @@ void tell_failed_dump() {
 
 }  // namespace
 
-bool settings_file_has_version(const char* path) {
-  return has_value(path, "ver");
-}
-
-bool settings_file_has_targets(const char* path) {
-  return settings_file_has_version(path) || has_value(path, "count");
-}
-
 bool settings_file_is_torn(const char* path) {
   char end[64];
   const File file(fopen(path, "re"));
@@ -117,13 +112,20 @@ bool settings_file_is_torn(const char* path) {
   return length < kEndLength || memcmp(end + length - kEndLength, kFileEnd, kEndLength) != 0;
 }
 
-bool dump_would_bury_settings() {
-  return !tree_present(key::kVersion) && settings_file_has_version(kSettingsFile);
+// A tree that was loaded from settings of version 0 has their count. The copy counts where kSettingsFile
+// holds no settings: it would be loaded then.
+const char* unloaded_settings() {
+  if (tree_present(key::kVersion)) return nullptr;
+  for (const char* file : {kSettingsFile, kFlashCopy}) {
+    if (has_value(file, "ver")) return file;
+    if (has_value(file, "count")) return tree_present_surely(key::kTargetCount) ? nullptr : file;
+  }
+  return nullptr;
 }
 
 bool store_settings() {
-  if (dump_would_bury_settings()) {
-    LOG(0, "%s is kept as it is: the tree was never loaded from it", kSettingsFile);
+  if (const char* file = unloaded_settings(); file != nullptr) {
+    LOG(0, "%s is kept as it is: the tree was never loaded from it", file);
     return false;
   }
   if (ktreec_dump(kVolumesSocket, 0, kSettingsFile) == 0) return true;

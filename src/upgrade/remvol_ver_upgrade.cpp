@@ -9,6 +9,7 @@
 #include "support/result.h"
 #include "support/text.h"
 #include "tree/access.h"
+#include "tree/settings_file.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "tree_layout.h"
@@ -126,7 +127,8 @@ int upgrade_from(int stored, int current) {
     return kOk;
   }
   const int result = version_upgrade_v0_to_v1();
-  if (result == kOk) (void)set_remvol_ver_to_db(current);
+  // With a version a tree that was never loaded would be dumped over the settings.
+  if (result == kOk && unloaded_settings() == nullptr) (void)set_remvol_ver_to_db(current);
   return result;
 }
 

@@ -10,10 +10,15 @@ SAVED, COPY, DAMAGED = "/etc/NAS_CFG/vv.xml", "/usr/local/config/vv.xml", "/etc/
 FLASH = f'system flashrun "cp -f {SAVED} /usr/local/config/"'
 LOAD_COPY = f"system ktreec -S /var/run/ktree_sock_vv -l {COPY}"
 MARK = "/tmp/reset_default"
+NOT_DONE = 4 << 8  # nothing is said against the file
 
 
 def settings(prefix, version="<ver>1</ver>"):
     return f"<config>\n <iscsi>\n  <initiator>{version}<prefix>{prefix}</prefix></initiator>\n </iscsi>\n</config>\n"
+
+
+# Those of version 0 have no version.
+OLD = "<config><iscsi><initiator><prefix>precious</prefix><count>0</count></initiator></iscsi></config>"
 
 
 def prefix(box):
@@ -61,6 +66,73 @@ VERSIONS = {
                   "</initiator></iscsi></config>", False),
     "rubbish": ("</a></b><config><iscsi><initiator><ver>1</ver>", False),
 }
+
+
+@pytest.mark.parametrize("saved, copy", [(settings("precious"), None), (None, settings("precious")), ("", settings("precious")),
+                                         (OLD, None), (None, OLD)],
+                         ids=["saved", "copy", "copy of a torn one", "saved of version 0", "copy of version 0"])
+@pytest.mark.parametrize("command", [["--verupgrade"], ["--check_share_name", "-s", "x"]])
+def test_no_command_makes_a_tree_that_was_never_loaded_one_that_was(box, saved, copy, command):
+    """An upgrade stores a version, which would make the next dump one of the settings."""
+    box.path("/etc/NAS_CFG").mkdir()
+    for path, text in ((SAVED, saved), (COPY, copy)):
+        if text is not None:
+            box.write(path, text)
+    done = box.remvol(*command)
+    assert (done.status, box.trace("dump")) == (0, [])
+    assert box.tree.get("/iscsi/initiator/ver") is None
+    assert f"{SAVED if saved else COPY} is kept as it is: the tree was never loaded from it" in done.stdout
+    assert (box.path(SAVED).read_text() if box.path(SAVED).exists() else None) == saved
+
+
+@pytest.mark.parametrize("copy", [None, settings("of today")])
+def test_loaded_settings_of_version_0_are_upgraded_and_saved(box, copy):
+    box.tree.set({"/iscsi/initiator/prefix": "precious", "/iscsi/initiator/count": "0"})
+    box.write(SAVED, OLD)
+    if copy is not None:
+        box.write(COPY, copy)
+    assert box.remvol("--verupgrade").status == 0
+    assert "<ver>1</ver>" in box.path(SAVED).read_text() and "precious" in box.path(SAVED).read_text()
+
+
+def test_a_count_does_not_make_an_empty_tree_a_loaded_one(box):
+    """The next dump of one without the settings would bury them, and the copy would follow."""
+    appliance(box)
+    box.write(SAVED, settings("precious"))
+    assert box.remvol("--del", "-n", "iqn.gone").status == 255
+    assert box.tree.get("/iscsi/initiator/count") == "0"
+    init(box)
+    assert prefix(box) == "precious"
+    assert "precious" in box.path(SAVED).read_text()
+
+
+def test_a_count_in_an_empty_tree_is_not_saved_over_the_only_copy(box):
+    appliance(box)
+    box.path("/etc/NAS_CFG").mkdir()
+    box.write(COPY, settings("precious"))
+    assert box.remvol("--del", "-n", "iqn.gone").status == 255
+    box.fake("iscsiadm", first=True, times=1)
+    assert box.remvol("--disconnect").status == 0
+    assert not box.path(SAVED).exists() and FLASH not in box.trace("system")
+    init(box)
+    assert prefix(box) == "precious"
+    assert "precious" in box.path(SAVED).read_text()
+
+
+@pytest.mark.parametrize("target", ["vv.xml", "/proc/self/mem"])
+def test_settings_that_cannot_be_read_are_not_buried(box, target):
+    """The one cannot be opened, of the other no byte can be read."""
+    appliance(box)
+    box.path("/etc/NAS_CFG").mkdir()
+    box.path(SAVED).symlink_to(target)
+    assert box.remvol("--verupgrade").status == 0
+    init(box)
+    assert box.tree.get("/iscsi/initiator/ver") is None
+    assert box.path(SAVED).is_symlink()
+    box.path(SAVED).unlink()
+    box.write(SAVED, settings("readable again"))
+    init(box)
+    assert prefix(box) == "readable again"
 
 
 @pytest.mark.parametrize("text, withheld", VERSIONS.values(), ids=VERSIONS)
@@ -182,12 +254,11 @@ def test_a_tree_that_a_killed_start_left_empty_is_loaded(box, saved):
 
 
 def test_settings_of_version_0_are_loaded_into_a_tree_that_a_killed_start_left_empty(box):
-    """They have no version."""
     appliance(box)
-    box.write(SAVED, "<config><iscsi><initiator><prefix>saved</prefix><count>0</count></initiator></iscsi></config>")
+    box.write(SAVED, OLD)
     assert box.tree.get("/x") is None
     init(box)
-    assert prefix(box) == "saved"
+    assert prefix(box) == "precious"
 
 
 def test_a_tree_that_cannot_be_read_is_not_loaded_again(box):
@@ -215,7 +286,7 @@ def test_what_was_read_of_the_slots_before_settings_are_loaded_is_believed_no_mo
 
 
 @pytest.mark.parametrize("source", [SAVED, COPY])
-@pytest.mark.parametrize("status", [-1, 9, 127 << 8])
+@pytest.mark.parametrize("status", [-1, 9, 127 << 8, NOT_DONE])
 def test_a_command_that_could_not_load_the_settings_is_run_again(bare_box, source, status):
     """The tree would count as fresh, and be dumped over them."""
     box = bare_box
@@ -228,22 +299,56 @@ def test_a_command_that_could_not_load_the_settings_is_run_again(bare_box, sourc
     assert box.trace("system", "sleep").count("sleep 1") >= 1
 
 
-@pytest.mark.parametrize("source", [SAVED, COPY])
-def test_settings_that_can_never_be_loaded_are_not_buried(bare_box, source):
+@pytest.mark.parametrize("source, saved, copy, status", [
+    (SAVED, settings("saved"), settings("copy"), 127 << 8),
+    (SAVED, settings("saved"), None, 127 << 8),
+    (SAVED, settings("saved"), None, NOT_DONE),
+    (COPY, "<config><precious", settings("copy"), 127 << 8),
+    (COPY, "<config><precious", settings("copy"), NOT_DONE),
+    (COPY, None, settings("copy"), NOT_DONE),
+], ids=["never runs", "never runs without a copy", "fails without a copy", "copy never runs", "copy fails", "copy alone fails"])
+def test_settings_that_can_never_be_loaded_are_not_buried(bare_box, source, saved, copy, status):
     """With a version the tree would count as theirs, and be dumped over them and copied to the flash."""
     box = bare_box
     appliance(box)
     box.path("/etc/NAS_CFG").mkdir()
-    box.write(SAVED, settings("saved") if source == SAVED else "<config><precious")
-    box.write(COPY, settings("copy"))
+    for path, text in ((SAVED, saved), (COPY, copy)):
+        if text is not None:
+            box.write(path, text)
     before = box.path(source).read_text()
-    box.hook("system", f"ktreec -S /var/run/ktree_sock_vv -l {source}", ret=127 << 8)
+    box.hook("system", f"ktreec -S /var/run/ktree_sock_vv -l {source}", ret=status)
     done = init(box)
     assert box.trace("sleep").count("sleep 1") == 11
     assert box.tree.get("/iscsi/initiator/ver") is None
     assert box.path(source).read_text() == before
-    if source == SAVED:
-        assert f"{SAVED} is kept as it is: the tree was never loaded from it" in done.stdout
+    assert f"{source} is kept as it is: the tree was never loaded from it" in done.stdout
+    assert not box.path(DAMAGED).exists() or source == COPY
+
+
+def test_settings_that_cannot_be_loaded_and_are_not_damaged_are_kept_beside_their_copy(bare_box):
+    box = bare_box
+    appliance(box)
+    box.write(SAVED, settings("saved"))
+    box.write(COPY, settings("copy"))
+    box.hook("system", f"ktreec -S /var/run/ktree_sock_vv -l {SAVED}", ret=NOT_DONE)
+    init(box)
+    assert prefix(box) == "copy"
+    assert "saved" in box.path(DAMAGED).read_text()
+
+
+@pytest.mark.parametrize("copy", [None, "<config><iscsi>"])
+def test_damaged_settings_with_a_version_are_replaced(box, copy):
+    """Nobody could save anything any more."""
+    appliance(box)
+    damaged = settings("old").replace("</prefix>", "</suffix>")
+    box.write(SAVED, damaged)
+    if copy is not None:
+        box.write(COPY, copy)
+    assert box.remvol("--del", "-n", "iqn.gone").status == 255
+    init(box)
+    assert box.tree.get("/iscsi/initiator/ver") == "1"
+    assert box.path(DAMAGED).read_text() == damaged
+    assert "<ver>1</ver>" in box.path(SAVED).read_text() and "old" not in box.path(SAVED).read_text()
 
 
 def test_damaged_settings_without_a_copy_are_kept(bare_box):
