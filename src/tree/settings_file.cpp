@@ -118,7 +118,7 @@ const char* unloaded_settings() {
   if (tree_present(key::kVersion)) return nullptr;
   for (const char* file : {kSettingsFile, kFlashCopy}) {
     if (has_value(file, "ver")) return file;
-    if (has_value(file, "count")) return tree_present_surely(key::kTargetCount) ? nullptr : file;
+    if (has_value(file, "count")) return tree_present(key::kTargetCount) ? nullptr : file;
   }
   return nullptr;
 }
