@@ -14,6 +14,7 @@
 #include "tasks/connect.h"
 #include "tasks/ftp_share.h"
 #include "tasks/whole_target.h"
+#include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
 #include "tree/recover_queue.h"
@@ -174,15 +175,13 @@ int recover_target(const char* name) {
   return kOk;
 }
 
-// Recovers the target called `name` and then whatever is queued. Returns the result of the last one.
-int drain_queue(const char* name) {
-  int result = recover_target(name);
-  TargetEntry queued = {};
-  while (ktree_pop_recover_queue(queued.target_name) == kOk && queued.target_name[0] != '\0') {
-    result = recover_target(queued.target_name);
-    queued = {};
-  }
-  return result;
+// Recovers whatever is queued; `result` becomes that of the last target. Returns whether the queue is worked
+// off.
+bool drain_queue(int* result) {
+  TreeValue name;
+  int popped;
+  while ((popped = ktree_pop_recover_queue(name)) == kOk) *result = recover_target(name);
+  return popped == kFailed;
 }
 
 // Leaves the target to the run that is recovering. Returns 0, -1 or -103.
@@ -223,10 +222,15 @@ int recover_or_queue(const char* name, int wait_seconds) {
     LOG(0, "create lock directory failed");
     return kFailed;
   }
-  const int lock = get_recover_cri_flock();
+  int lock = get_recover_cri_flock();
   if (lock < 0) return queue_target(name);
-  const int result = drain_queue(name);
-  (void)unlock_recover_cri_flock(lock);
+  int result = recover_target(name);
+  bool drained;
+  do {
+    drained = drain_queue(&result);
+    (void)unlock_recover_cri_flock(lock);
+    // Whoever found the lock held may have queued its target behind the last look at the queue.
+  } while (drained && !recover_queue_is_empty() && (lock = get_recover_cri_flock()) >= 0);
   return result;
 }
 

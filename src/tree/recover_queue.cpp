@@ -30,6 +30,10 @@ int ktree_insert_recover_queue(const char* target_name) {
   return tree_write_once(KeyText(key::kRecoverName, q), target_name);
 }
 
+bool recover_queue_is_empty() {
+  return !tree_present(KeyText(key::kRecoverName, 1));
+}
+
 int ktree_pop_recover_queue(char* target_name) {
   const LogScope scope;
   TreeValue name;

@@ -13,6 +13,9 @@ namespace remvol {
 // Appends a name. Returns 0, -1 when the queue is full, -103 when the write failed.
 [[nodiscard]] int ktree_insert_recover_queue(const char* target_name);
 
+// Returns whether no name is queued.
+[[nodiscard]] bool recover_queue_is_empty();
+
 // Takes the oldest name into `target_name`, which holds at least 256 bytes. Returns 0; -1 when the queue is
 // empty; -103 when the entry could not be deleted (the name is copied out all the same).
 [[nodiscard]] int ktree_pop_recover_queue(char* target_name);

@@ -446,6 +446,27 @@ class TestQueue:
         assert done.status == 0
         assert "==> Processing - iqn.t2" not in messages(done)
 
+    def test_a_target_that_is_queued_behind_the_last_look_is_recovered(self, lost, box):
+        lost.store("iqn.t2", slot=2, conn_set=1, conn_state=3)
+        lost.offer("iqn.t2", {})
+        lost.log_in("iqn.t2")
+        box.hook("fcntl", "unlock", through=True, times=1,
+                 effect="touch /tmp/unlocking; until [ -e /tmp/go ]; do sleep 0.01; done")
+        first = box.start(["remvol", "--oiscsi_evt_recover", "-n", "iqn.t1"])
+        box.wait_until(box.path("/tmp/unlocking").exists, what="the end of the queue")
+        assert recover(box, name="iqn.t2").status == 0
+        assert (box.tree.get(QUEUE % 1), lost.target("conn_state", 2)) == ("iqn.t2", "3")
+        box.write("/tmp/go", "")
+        assert first.wait().status == 0
+        assert (box.tree.get(QUEUE % 1), lost.target("conn_state", 2)) == (None, "1")
+
+    def test_what_another_run_takes_over_is_left_to_it(self, lost, box):
+        """Behind the unlock the queue is another run's, which has the lock again."""
+        box.hook("fcntl", "unlock", through=True, times=1, effect=f"ktreec -S /var/run/ktree_sock_vv -s {QUEUE % 1} iqn.t2")
+        box.hook("fcntl", "lock", ret=-1, errno=11, skip=1, times=1)
+        assert recover(box).status == 0
+        assert box.tree.get(QUEUE % 1) == "iqn.t2"
+
     def test_while_another_run_recovers_the_target_is_queued(self, lost, box):
         holder = self.hold(box, RECOVER_LOCK)
         self.queue(box, "iqn.t9")
