@@ -5,11 +5,14 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstring>
+#include <ctime>
 #include <initializer_list>
+#include <string>
 #include <string_view>
 
 #include "common/report.h"
@@ -17,6 +20,7 @@
 #include "common/start.h"
 #include "events/kernel_event.h"
 #include "events/netlink.h"
+#include "events/recovery.h"
 #include "events/targets.h"
 
 namespace events {
@@ -38,6 +42,12 @@ struct Listener {
   int status = 0;
   Targets targets;
 };
+
+time_t now() {
+  timespec time{};
+  clock_gettime(CLOCK_MONOTONIC, &time);
+  return time.tv_sec;
+}
 
 void complain(const char* what) {
   platform::report(LOG_ERR, "remvol-events: %s: %s", what, strerror(errno));
@@ -82,6 +92,16 @@ void give_orders(Listener& daemon) {
   while (daemon.targets.next(order)) daemon.targets.started(order.target, start_tool(order));
 }
 
+// A recovery may have ended well and left its target to a run that did not.
+void settle_doubts(Listener& daemon) {
+  std::string target;
+  while (daemon.targets.next_doubt(target, now())) {
+    if (!daemon.targets.settle_doubt(target, recovery_of(target), read_sessions(), now())) continue;
+    platform::report(LOG_WARNING, "remvol-events: %s: its recovery was not finished, it is tried again",
+                     target.c_str());
+  }
+}
+
 // The socket is open only while there is a session, so that the kernel module can be unloaded after the last
 // one.
 void follow_sessions(Listener& daemon, bool any) {
@@ -112,7 +132,7 @@ void take_signals(Listener& daemon) {
   }
   int status = 0;
   for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) {
-    const OrderEnd end = daemon.targets.ended(child, status != 0);
+    const OrderEnd end = daemon.targets.ended(child, status != 0, now());
     if (end.ordered) notify(daemon.notifier, end);
   }
 }
@@ -159,7 +179,8 @@ void take_iscsi_events(Listener& daemon) {
   });
 }
 
-int patience(const Listener& daemon) {
+// Milliseconds until the sessions are looked at, -1 for no end.
+int patience_with_sessions(const Listener& daemon) {
   switch (daemon.targets.hurry()) {
     case Hurry::kMuch:
       return kMuchHurry;
@@ -170,9 +191,18 @@ int patience(const Listener& daemon) {
   }
 }
 
+int patience(const Listener& daemon) {
+  const int look = patience_with_sessions(daemon);
+  const time_t due = daemon.targets.next_doubt_due();
+  if (due == 0) return look;
+  const int wait = static_cast<int>(std::max<time_t>(due - now(), 0)) * 1000;
+  return look < 0 ? wait : std::min(look, wait);
+}
+
 void run(Listener& daemon) {
   look_after_a_gap(daemon);
   while (!daemon.ended) {
+    settle_doubts(daemon);
     give_orders(daemon);
     pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}, {daemon.iscsi, POLLIN, 0}};
     if (poll(inputs, 3, patience(daemon)) == 0) look(daemon);

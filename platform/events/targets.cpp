@@ -12,6 +12,9 @@ constexpr int kSuspectLooks = 600;
 constexpr int kMostRetries = 3;
 constexpr int kRetryPause = 3;  // looks, a second apart when nothing else happens
 
+// Seconds. A recovery that was put off comes back after ten.
+constexpr time_t kFirstDoubtPause = 15, kLongestDoubtPause = 600;
+
 struct Links {
   bool any = false, any_down = false, all_up = true;
 };
@@ -43,6 +46,7 @@ void Targets::order_reopen(FollowedTarget& target) {
   target.wants_reopen = true;
   target.wants_recover = false;
   target.retries = target.pause = 0;
+  target.doubt_due = target.doubt_pause = 0;
 }
 
 void Targets::take(const KernelEvent& event, const std::vector<Session>& sessions) {
@@ -84,7 +88,7 @@ void Targets::look(const std::vector<Session>& sessions) {
   for (FollowedTarget& target : targets_) settle(target, sessions);
   std::erase_if(targets_, [](const FollowedTarget& target) {
     return !target.present && !target.lost && !target.busy && !target.wants_reopen && !target.wants_recover &&
-           target.pause == 0;
+           target.pause == 0 && target.doubt_due == 0;
   });
 }
 
@@ -102,6 +106,7 @@ bool Targets::next(Order& order) {
     (target.wants_reopen ? target.wants_reopen : target.wants_recover) = false;
     target.busy = true;
     target.recovering = order.action == Action::kRecover;
+    target.doubt_due = 0;
     return true;
   }
   return false;
@@ -113,7 +118,7 @@ void Targets::started(const std::string& target, pid_t process) {
   chosen.busy = process > 0;
 }
 
-OrderEnd Targets::ended(pid_t process, bool failed) {
+OrderEnd Targets::ended(pid_t process, bool failed, time_t now) {
   OrderEnd end;
   for (FollowedTarget& target : targets_) {
     if (!target.busy || target.process != process) continue;
@@ -122,14 +127,50 @@ OrderEnd Targets::ended(pid_t process, bool failed) {
     if (!target.recovering) continue;
     if (!failed) {
       target.retries = 0;
+      if (!target.lost) target.doubt_due = now + target.doubt_pause;
     } else if (!target.lost && target.retries < kMostRetries) {
       target.retries++;
       target.pause = kRetryPause;
     } else if (!target.lost) {
       end.given_up = target.name;
+      target.doubt_pause = 0;
     }
   }
   return end;
+}
+
+bool Targets::next_doubt(std::string& name, time_t now) const {
+  for (const FollowedTarget& target : targets_) {
+    if (target.doubt_due == 0 || target.doubt_due > now) continue;
+    name = target.name;
+    return true;
+  }
+  return false;
+}
+
+bool Targets::settle_doubt(const std::string& name, Recovery recovery, const std::vector<Session>& sessions,
+                           time_t now) {
+  FollowedTarget& target = find(name);
+  const time_t pause = target.doubt_pause;
+  target.doubt_due = target.doubt_pause = 0;
+  if (recovery == Recovery::kOver) return false;
+  target.doubt_pause = std::clamp(2 * pause, kFirstDoubtPause, kLongestDoubtPause);
+  const Links links = links_of(name, sessions);
+  const bool again = recovery == Recovery::kMissing && pause > 0 && links.any && links.all_up;
+  if (again) {
+    target.wants_recover = true;
+  } else {
+    target.doubt_due = now + target.doubt_pause;
+  }
+  return again;
+}
+
+time_t Targets::next_doubt_due() const {
+  time_t due = 0;
+  for (const FollowedTarget& target : targets_) {
+    if (target.doubt_due != 0 && (due == 0 || target.doubt_due < due)) due = target.doubt_due;
+  }
+  return due;
 }
 
 Hurry Targets::hurry() const {

@@ -5,6 +5,7 @@
 #include <sys/types.h>
 
 #include <cstdint>
+#include <ctime>
 #include <string>
 #include <vector>
 
@@ -29,6 +30,13 @@ struct OrderEnd {
   std::string given_up;  // the target whose recovery failed for the last time; empty for none
 };
 
+// How a recovery stands whose run has ended well: that run may have left the work to another one.
+enum class Recovery {
+  kOver,      // nothing is to be recovered
+  kUnderWay,  // another run is at it, or that cannot be told
+  kMissing,   // the target is lost, and no run is at it
+};
+
 // How soon the sessions must be looked at again although no event came.
 enum class Hurry { kNone, kSome, kMuch };
 
@@ -50,8 +58,20 @@ class Targets {
   void started(const std::string& target, pid_t process);
 
   // The process has ended. A recovery that failed is tried again some seconds later, a few times: runs that
-  // come together wait for each other only so long.
-  OrderEnd ended(pid_t process, bool failed);
+  // come together wait for each other only so long. One that ended well is in doubt from then on.
+  OrderEnd ended(pid_t process, bool failed, time_t now);
+
+  // Takes a target whose recovery is to be looked up now. Returns false when there is none. The caller says
+  // with settle_doubt() how it stands: what is not over is looked up again, less and less often.
+  bool next_doubt(std::string& target, time_t now) const;
+
+  // Returns whether the recovery is ordered again: it is missing, was so some time ago, and the target has
+  // its session.
+  bool settle_doubt(const std::string& target, Recovery recovery, const std::vector<Session>& sessions,
+                    time_t now);
+
+  // When the next one is to be looked up; 0: none is.
+  time_t next_doubt_due() const;
 
   Hurry hurry() const;
 
@@ -66,6 +86,8 @@ class Targets {
     bool wants_recover = false;
     int retries = 0;          // of a recovery that failed
     int pause = 0;            // looks until it is tried again; 0: it is not to be
+    time_t doubt_due = 0;     // when a recovery that ended well is looked up; 0: it is not to be
+    time_t doubt_pause = 0;   // seconds to the next time; 0: it was not looked up yet
     bool busy = false;        // an order is being run
     bool recovering = false;  // the order is a recovery
     pid_t process = -1;

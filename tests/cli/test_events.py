@@ -7,10 +7,15 @@ import struct
 import termios
 
 import pytest
+from harness.initiator import INITIATOR, store
+from harness.world import TIMEOUT
 
 DEVICE_EVENTS, ISCSI_EVENTS = 15, 8
 LOST, PDU = 102, 101
 SESSIONS = "/sys/class/iscsi_session"
+# When it is looked up whether a recovery that ended well is over, in milliseconds: later than one comes back that was put
+# off for ten seconds.
+FIRST_DOUBT = 15000
 
 
 def message(kind, session, rest=b""):
@@ -26,7 +31,7 @@ def login_response(session, flags=0x87, status=0):
 
 
 class Events:
-    """A box with sessions in its sysfs and a running listener whose netlink sockets the test writes to."""
+    """A box with sessions in its sysfs, a tree and a running listener whose netlink sockets the test writes to."""
 
     def __init__(self, box):
         self.box = box
@@ -81,15 +86,26 @@ class Events:
 
         self.box.wait_until(idle, what="the listener being idle")
 
-    def asleep_for_good(self):
-        """True when only an event can wake the listener: it has no time limit to its poll(2)."""
+    def patience(self):
+        """How long the listener waits for an event, in milliseconds: the time limit of its poll(2), -1 for none. Nothing
+        while it does not wait."""
         call = self.box.path(f"/proc/{self.daemon.pid}/syscall").read_text().split()
-        return len(call) > 3 and int(call[3], 16) & 0xFFFFFFFF == 0xFFFFFFFF
+        return struct.unpack("i", struct.pack("Q", int(call[3], 16))[:4])[0] if len(call) > 3 else None
+
+    def asleep_for_good(self):
+        """True when only an event can wake the listener."""
+        return self.patience() == -1
 
     def wait_runs(self, *expected):
         """Waits until the tool has been run that often, and compares."""
         self.box.wait_until(lambda: len(self.runs) >= len(expected), what=f"{expected}, ran {self.runs}")
         assert self.runs == list(expected)
+
+    def waits_longer(self):
+        return (self.patience() or 0) > FIRST_DOUBT
+
+    def wait_for_doubt(self, condition, what):
+        self.box.wait_until(condition, TIMEOUT + FIRST_DOUBT / 1000, what)
 
     @property
     def runs(self):
@@ -109,8 +125,8 @@ def recover(target):
 
 
 @pytest.fixture
-def events(bare_box):
-    events = Events(bare_box)
+def events(box):
+    events = Events(box)
     yield events
     if events.daemon is not None and events.daemon.result is None:
         assert events.stop().status == 0
@@ -346,6 +362,80 @@ def test_a_recovery_that_is_given_up_is_told(connected):
     connected.box.wait_until(lambda: given_up in connected.box.runs("remvol-notify"), what="news")
     connected.box.wait_until(lambda: connected.asleep_for_good(), what="the end of the retries")
     assert connected.box.runs("remvol-notify").count(given_up) == 1
+
+
+LOST_TARGETS = ["iqn.a", "iqn.b", "iqn.c", "iqn.d"]
+
+
+def store_lost_targets(box):
+    for number, name in enumerate(LOST_TARGETS, 1):
+        store(box, name, slot=number, conn_set=1, conn_state=3)
+
+
+@pytest.fixture
+def doubtful(events):
+    """A listener with targets that are lost, whatever recoveries do."""
+    store_lost_targets(events.box)
+    for number, name in enumerate(LOST_TARGETS, 1):
+        events.session(number, name)
+    events.start()
+    events.box.wait_until(lambda: len(events.box.runs("remvol-notify")) == 4, what="the recoveries' ends")
+    events.box.wait_until(lambda: 10000 < (events.patience() or 0) <= FIRST_DOUBT, what="the doubt")
+    events.box.forget()
+    return events
+
+
+@pytest.mark.native
+def test_a_recovery_that_nobody_finished_is_ordered_again(doubtful):
+    """Also one that is queued without a run that is at the queue, and where the tree was started anew meanwhile."""
+    doubtful.box.tree.restart()
+    store_lost_targets(doubtful.box)
+    doubtful.box.tree.set({"/temp/remvol/recover/queue/id:1/target_name": "iqn.a"})
+    doubtful.wait_for_doubt(lambda: len(doubtful.runs) >= 4, "the next recoveries")
+    doubtful.box.wait_until(doubtful.waits_longer, what="a longer wait for the next ones")
+    assert sorted(doubtful.runs) == [recover(name) for name in LOST_TARGETS]
+    assert doubtful.daemon.stderr.count("its recovery was not finished, it is tried again") == 4
+
+
+@pytest.mark.native
+def test_a_recovery_that_a_run_is_at_is_waited_for(doubtful):
+    box = doubtful.box
+    for number, name in enumerate(["iqn.x", "iqn.b", "iqn.c"], 1):
+        box.tree.set(f"/temp/remvol/recover/queue/id:{number}/target_name", name)
+    at_work = [("-w", "10", *recover("iqn.a")), recover("iqn.d")]
+    for words in at_work:
+        box.fake("remvol", " ".join(words), exact=True, effect="until [ -e /go ]; do sleep 0.01; done")
+        box.start(["remvol", *words])
+    box.wait_until(lambda: len(doubtful.runs) == 2, what="the runs")
+    doubtful.wait_for_doubt(doubtful.waits_longer, "the next look")
+    assert sorted(doubtful.runs) == sorted(at_work)
+    box.write("/go", "")
+
+
+@pytest.mark.native
+def test_a_recovery_that_is_over_is_forgotten(doubtful):
+    """Recovered, taken out, not wanted any more, deleted."""
+    values = {"id:1/conn_state": 1, "id:2/conn_state": 0, "id:3/conn_set": 0, "id:4/target": "iqn.e"}
+    doubtful.box.tree.set({f"{INITIATOR}/{key}": value for key, value in values.items()})
+    doubtful.wait_for_doubt(doubtful.asleep_for_good, "the end of the doubt")
+    assert doubtful.runs == []
+
+
+@pytest.mark.native
+def test_a_tree_that_is_away_is_asked_later(doubtful):
+    doubtful.box.tree.stop()
+    doubtful.wait_for_doubt(doubtful.waits_longer, "the next look")
+    assert doubtful.runs == []
+
+
+@pytest.mark.native
+def test_a_recovery_that_did_its_work_is_never_in_doubt(events):
+    store(events.box, "iqn.a", conn_set=1, conn_state=1)
+    events.session(1, "iqn.a")
+    events.start()
+    events.wait_runs(recover("iqn.a"))
+    events.box.wait_until(lambda: events.box.runs("remvol-notify"), what="the end of the recovery")
+    events.box.wait_until(events.asleep_for_good, what="no doubt")
 
 
 def test_a_test_of_what_is_told(bare_box):
