@@ -1,15 +1,15 @@
 #include "events/recovery.h"
 
+#include "common/processes.h"
 #include "common/start.h"
 #include "common/tree_reader.h"
-#include "keeper/processes.h"
 #include "tree_layout.h"
 
 namespace events {
 namespace {
 
-using keeper::runs;
 using platform::kTool;
+using platform::runs;
 using platform::TreeReader;
 
 constexpr char kWholeTree[] = "/";

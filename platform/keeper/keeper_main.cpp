@@ -17,13 +17,13 @@
 #include <string_view>
 #include <vector>
 
+#include "common/processes.h"
 #include "common/report.h"
 #include "common/sessions.h"
 #include "common/start.h"
 #include "common/tree_reader.h"
 #include "events/netlink.h"
 #include "keeper/attempt.h"
-#include "keeper/processes.h"
 #include "keeper/schedule.h"
 #include "tree_layout.h"
 
@@ -50,11 +50,12 @@ time_t now() {
 
 // Sessions go because somebody wants them to: this target's, or any.
 bool is_taken_down(const std::string& target = {}) {
-  return runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"}, target);
+  return platform::runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"},
+                        target);
 }
 
 bool is_brought_up() {
-  return runs(platform::kTool, {"--oiscsi_evt_recover", "--connect"});
+  return platform::runs(platform::kTool, {"--oiscsi_evt_recover", "--connect"});
 }
 
 // Starts a program that goes on when this one ends. Returns its process, or -1.
@@ -69,7 +70,8 @@ pid_t start_program(std::initializer_list<const char*> words, const char* progra
 // Without the daemon no lost session is healed and none is made. Whoever stops it on purpose stops the tree
 // as well, or is still at work.
 void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
-  if (!tree_answers || taken_down || runs(kInitiatorDaemon) || runs(platform::kTool, {"--init"})) {
+  if (!tree_answers || taken_down || platform::runs(kInitiatorDaemon) ||
+      platform::runs(platform::kTool, {"--init"})) {
     daemon.no_initiator = 0;
     return;
   }

@@ -1,17 +1,17 @@
 // Processes of the machine, as /proc shows them.
-#ifndef PLATFORM_KEEPER_PROCESSES_H
-#define PLATFORM_KEEPER_PROCESSES_H
+#ifndef PLATFORM_COMMON_PROCESSES_H
+#define PLATFORM_COMMON_PROCESSES_H
 
 #include <initializer_list>
 #include <string_view>
 
-namespace keeper {
+namespace platform {
 
 // True when a process runs the program of that name, and one of its arguments is one of `options` (any when
 // there are none). With a target, only when it names no other one behind "-n".
 bool runs(std::string_view program, std::initializer_list<std::string_view> options = {},
           std::string_view target = {});
 
-}  // namespace keeper
+}  // namespace platform
 
 #endif

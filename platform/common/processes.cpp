@@ -1,4 +1,4 @@
-#include "keeper/processes.h"
+#include "common/processes.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -7,7 +7,7 @@
 #include <algorithm>
 #include <string>
 
-namespace keeper {
+namespace platform {
 namespace {
 
 std::string read_process_file(const char* process, const char* name) {
@@ -69,4 +69,4 @@ bool runs(std::string_view program, std::initializer_list<std::string_view> opti
   return found;
 }
 
-}  // namespace keeper
+}  // namespace platform
