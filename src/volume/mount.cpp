@@ -273,7 +273,9 @@ MountResult put_in_place(const Mounting* volume) {
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
   if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
-  if (is_foreign_mount(volume->entry, volume->mount_point)) return kMountNoMountPoint;
+  if (hold.is_anothers(volume->mount_point) || is_foreign_mount(volume->entry, volume->mount_point)) {
+    return kMountNoMountPoint;
+  }
   MountResult result = make_mount_point(volume);
   if (result == kMounted) result = mount_file_system(volume);
   if (result == kMounted) result = record_outcome(volume);

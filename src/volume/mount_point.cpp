@@ -68,10 +68,23 @@ bool has_link_below_root(const char* path) {
   return false;
 }
 
+// Returns the first folder below the mount root that the path leads into.
+MountPointText first_folder(const char* path) {
+  const char* component = path + strlen(kMountRoot);
+  while (*component == '/' || strncmp(component, "./", 2) == 0) component++;
+  return MountPointText("%.*s", static_cast<int>(strcspn(component, "/")), component);
+}
+
 }  // namespace
 
-MountPointHold::MountPointHold(const char* path) {
-  lock_.take_in_time(hashed_lock_name("volume", path), LockMode::kExclusive, kLongestHold);
+MountPointHold::MountPointHold(const char* path)
+    : tried_(lock_.take_in_time(hashed_lock_name("volume", first_folder(path)), LockMode::kExclusive,
+                                kLongestHold)) {}
+
+bool MountPointHold::is_anothers(const char* path) const {
+  if (tried_ != LockTry::kBusy) return false;
+  LOG(0, "%s is neither made nor removed, another run is at work there", path);
+  return true;
 }
 
 MountPointText mount_point_of(const char* share) {

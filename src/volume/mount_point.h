@@ -12,14 +12,21 @@ namespace remvol {
 // The mount root and a share name.
 using MountPointText = Text<sizeof kMountRoot + 128>;
 
-// Mounting there, unmounting and removing it, one run after another; one that does not come to an end is
-// waited for a minute.
+// Mounting there, unmounting and removing it, one run after another. Held with it is all below the same first
+// folder of the mount root, however the path is written, since one share may lie below another. A run that
+// does not come to an end is waited for a minute.
 class MountPointHold {
  public:
   explicit MountPointHold(const char* path);
 
+  // Returns whether another run has it still: the mount point is then neither made, since that run may be
+  // removing it, nor removed, since that run may be mounting there. Logged at level 0 in the innermost
+  // scope's name.
+  [[nodiscard]] bool is_anothers(const char* path) const;
+
  private:
   RunLock lock_;
+  LockTry tried_;
 };
 
 // Returns the mount point of the share.

@@ -138,7 +138,7 @@ Result Target_LUN_umount(const TargetEntry* entry) {
     umount_with_rounds(mount_point);
     detach_mounts(mount_point);
   }
-  const Result result = remove_mount_point(mount_point);
+  const Result result = hold.is_anothers(mount_point) ? kFailed : remove_mount_point(mount_point);
   LOG(2, "end");
   return result;
 }

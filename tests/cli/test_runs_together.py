@@ -1,5 +1,6 @@
 """Runs beside one another, and what a killed run leaves to the next."""
 
+import posixpath
 import re
 import time
 
@@ -431,6 +432,70 @@ class TestTakingEverythingAway:
         everything.wait()
         connect.wait()
         assert not mounted
+
+    @pytest.fixture
+    def another(self, stored):
+        """Makes a second target, logged in, whose share has the name."""
+        def make(share):
+            stored.store("iqn.t2", slot=2, conn_set=0, luns=[(share, 0)])
+            stored.offer("iqn.t2", {0: "sdc"})
+            stored.disk("sdc")
+            stored.log_in("iqn.t2")
+        return make
+
+    @pytest.mark.parametrize("removed, share", [("a", "a/b"), ("a/b", "a"), ("a", "./a"), ("a", "a/"), ("./a", "/.//a/b")])
+    def test_nothing_is_mounted_above_or_below_a_mount_point_that_is_removed(self, stored, box, another, removed, share):
+        another(share)
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/share", removed)
+        stored.log_in("iqn.t1")
+        box.path(f"/mnt/VV/{removed}").mkdir(parents=True)
+        meet(box, "system", f'rm -rf "/mnt/VV/{removed}"')
+        disconnect = box.start(["remvol", "--disconnect", "-n", "iqn.t1"])
+        until(lambda: is_there(box))
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t2"])
+        mounted = comes_true(lambda: stored.mounted(posixpath.normpath(share.lstrip("/"))))
+        go_on(box)
+        assert (disconnect.wait().status, connect.wait().status) == (0, 0)
+        assert not mounted and stored.mounted(posixpath.normpath(share.lstrip("/")))
+
+    @pytest.mark.parametrize("share", ["b", "ab", ".a"])
+    def test_a_mount_elsewhere_does_not_wait_for_a_removal(self, stored, box, another, share):
+        another(share)
+        stored.log_in("iqn.t1")
+        box.path("/mnt/VV/a").mkdir(parents=True)
+        meet(box, "system", 'rm -rf "/mnt/VV/a"')
+        disconnect = box.start(["remvol", "--disconnect", "-n", "iqn.t1"])
+        until(lambda: is_there(box))
+        assert box.remvol("--connect", "-n", "iqn.t2").status == 0
+        assert stored.mounted(share)
+        go_on(box)
+        disconnect.wait()
+
+    def test_nothing_is_mounted_beside_a_removal_that_does_not_end(self, stored, box, another):
+        another("a/b")
+        stored.log_in("iqn.t1")
+        box.path("/mnt/VV/a").mkdir(parents=True)
+        meet(box, "system", 'rm -rf "/mnt/VV/a"')
+        disconnect = box.start(["remvol", "--disconnect", "-n", "iqn.t1"])
+        until(lambda: is_there(box))
+        box.sleep_takes(0)
+        said = messages(box.remvol("--connect", "-n", "iqn.t2"), "Target_mount")
+        assert said == ["/mnt/VV/a/b is neither made nor removed, another run is at work there"]
+        assert not any(line.startswith("mkdir") for line in box.shell())
+        go_on(box)
+        disconnect.wait()
+
+    def test_nothing_is_removed_beside_a_mount_that_does_not_end(self, stored, box):
+        stored.log_in("iqn.t1")
+        meet(box, "system", MOUNT)
+        connect = box.start(["remvol", "--connect", "-n", "iqn.t1"])
+        until(lambda: is_there(box))
+        box.sleep_takes(0)
+        said = messages(box.remvol("--disconnect"), "Target_LUN_umount")
+        assert said == ["/mnt/VV/a is neither made nor removed, another run is at work there"]
+        assert box.path("/mnt/VV/a").is_dir()
+        go_on(box)
+        connect.wait()
 
     @pytest.mark.parametrize("function, what", [
         ("sys_create_1_partition", "/dev/sdb"), ("system", "fuser -mk /dev/sdb1"),

@@ -17,6 +17,7 @@
 #include "support/target_hold.h"
 #include "support/temp_file.h"
 #include "tree/slots.h"
+#include "volume/mount_point.h"
 #include "volume_fixture.h"
 
 using namespace remvol;
@@ -322,6 +323,30 @@ TEST_F(RunLocks, LoginsThatAreHeldOffWait) {
   });
   { const LoginUnderWay login; }
   EXPECT_EQ(fakes::calls().size(), 3000U);
+}
+
+TEST_F(RunLocks, MountPointsBelowOneFolderAreHeldTogetherForAMinuteAtMost) {
+  start_run([] {
+    const MountPointHold hold("/mnt/VV/a");
+    stay();
+  });
+  for (const char* path : {"/mnt/VV/b", "/mnt/VV/ab", "/mnt/VV/.a/a", "/mnt/VV/..a"}) {
+    EXPECT_FALSE(MountPointHold(path).is_anothers(path));
+  }
+  EXPECT_TRUE(fakes::calls().empty());
+  size_t waits = 0;
+  for (const char* path : {"/mnt/VV/a", "/mnt/VV/a/b", "/mnt/VV/./a", "/mnt/VV//.//./a/", "/mnt/VV/a/."}) {
+    const std::string log = fakes::output_of([=] { EXPECT_TRUE(MountPointHold(path).is_anothers(path)); });
+    EXPECT_TRUE(has(log, std::string(path) + " is neither made nor removed, another run is at work there"));
+    EXPECT_EQ(fakes::calls().size(), waits += 3000);
+  }
+  end_run();
+  EXPECT_FALSE(MountPointHold("/mnt/VV/a").is_anothers("/mnt/VV/a"));
+}
+
+TEST_F(RunLocks, WhereNoLockCanBeHadTheMountPointIsNobodys) {
+  ASSERT_EQ(mount(nullptr, "/run", nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0);
+  EXPECT_FALSE(MountPointHold("/mnt/VV/a").is_anothers("/mnt/VV/a"));
 }
 
 class TempFiles : public RunLocks {
