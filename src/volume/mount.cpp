@@ -268,12 +268,13 @@ MountResult keep_standing(const Mounting* volume) {
 }
 
 // Mounts the file system and records what became of that. No other run closes the session meanwhile, or
-// removes the mount point.
+// removes the mount point. The format may have taken long: a link may have been planted since the first look.
 MountResult put_in_place(const Mounting* volume) {
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
   if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
-  if (hold.is_anothers(volume->mount_point) || is_foreign_mount(volume->entry, volume->mount_point)) {
+  if (hold.is_anothers(volume->mount_point) || leads_through_link(volume->mount_point) ||
+      is_foreign_mount(volume->entry, volume->mount_point)) {
     return kMountNoMountPoint;
   }
   MountResult result = make_mount_point(volume);

@@ -56,18 +56,6 @@ bool is_link(const char* path, size_t length) {
   return lstat(prefix, &found) == 0 && S_ISLNK(found.st_mode);
 }
 
-// Returns whether a component of the path below the mount root is a symbolic link: whoever planted it would
-// choose what is mounted over and what is removed.
-bool has_link_below_root(const char* path) {
-  const char* component = path + strlen(kMountRoot);
-  while (*component != '\0') {
-    component += strcspn(component, "/");
-    if (is_link(path, static_cast<size_t>(component - path))) return true;
-    component += strspn(component, "/");
-  }
-  return false;
-}
-
 // Returns the first folder below the mount root that the path leads into.
 MountPointText first_folder(const char* path) {
   const char* component = path + strlen(kMountRoot);
@@ -96,11 +84,18 @@ bool is_share_inside_root(const char* share) {
     LOG(0, "share name %s leaves %s", share, kMountRoot);
     return false;
   }
-  if (has_link_below_root(mount_point_of(share))) {
+  return !leads_through_link(mount_point_of(share));
+}
+
+bool leads_through_link(const char* path) {
+  const char* const share = path + strlen(kMountRoot);
+  for (const char* end = share; *end != '\0'; end += strspn(end, "/")) {
+    end += strcspn(end, "/");
+    if (!is_link(path, static_cast<size_t>(end - path))) continue;
     LOG(0, "share name %s leads through a symbolic link below %s", share, kMountRoot);
-    return false;
+    return true;
   }
-  return true;
+  return false;
 }
 
 bool is_mounted_from(const char* node, const char* path, MountLine* mount) {
@@ -120,6 +115,7 @@ void detach_mounts(const char* path) {
 }
 
 bool is_removal_unsafe(const char* path) {
+  if (leads_through_link(path)) return true;
   char real[PATH_MAX];
   const char* name = realpath(path, real) != nullptr ? real : path;
   MountLine mount;

@@ -33,9 +33,14 @@ class MountPointHold {
 [[nodiscard]] MountPointText mount_point_of(const char* share);
 
 // Returns whether the share's mount point lies below the mount root. It does not when the name has a
-// component "..", or none besides empty ones and ".", or when a component of the path below the root is a
-// symbolic link; that is logged at level 0 in the innermost scope's name.
+// component "..", or none besides empty ones and ".", or when the mount point leads through a link; that is
+// logged at level 0 in the innermost scope's name.
 [[nodiscard]] bool is_share_inside_root(const char* share);
+
+// Returns whether a component of the path below the mount root is a symbolic link: whoever planted it would
+// choose what is mounted over and what is removed. Inside a volume that is open to everybody anybody can
+// plant one at any moment. Logged at level 0 in the innermost scope's name.
+[[nodiscard]] bool leads_through_link(const char* path);
 
 // Returns whether the kernel's table shows the block device `node`, by its number and whatever its name, as
 // mounted on `path`, and nothing else covers it there; `mount` is the table's line then.
@@ -45,9 +50,10 @@ class MountPointHold {
 // Processes that use a layer keep it until they end. Stops at the first layer that cannot be detached.
 void detach_mounts(const char* path);
 
-// Returns whether "rm -rf" of `path` would run into a mounted file system: one is mounted on the path or
-// below it, or the path lies inside another volume. Where the kernel's table cannot be read, the path itself
-// is asked. Logged at level 0 in the innermost scope's name.
+// Returns whether "rm -rf" of `path`, which is below the mount root, would leave the root through a link or
+// run into a mounted file system: one is mounted on the path or below it, or the path lies inside another
+// volume. Where the kernel's table cannot be read, the path itself is asked. Logged at level 0 in the
+// innermost scope's name.
 [[nodiscard]] bool is_removal_unsafe(const char* path);
 
 }  // namespace remvol

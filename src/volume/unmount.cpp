@@ -69,12 +69,13 @@ bool force_umount(const char* mount_point) {
 
 // Unmounts the path with its users killed. Another round starts only while something is mounted there: on a
 // path that another run has unmounted meanwhile, the kill would hit every process that uses the system's own
-// disk.
+// disk. A link that was planted meanwhile ends it: the users and the mount would be others.
 void umount_with_rounds(const char* mount_point) {
   kill_users(mount_point);
   sleep(1);
-  bool done = force_umount(mount_point);
+  bool done = leads_through_link(mount_point) || force_umount(mount_point);
   for (int round = 0; !done && round < kFurtherRounds && sys_mount_point(mount_point) != 0; round++) {
+    if (leads_through_link(mount_point)) break;
     kill_users(mount_point);
     done = force_umount(mount_point);
   }
@@ -131,11 +132,13 @@ Result Target_LUN_umount(const TargetEntry* entry) {
   // Between the look and the kill another run could unmount, and the kill would then hit the users of the
   // system's own disk; between the look and the removal another run could mount.
   const MountPointHold hold(mount_point);
+  if (leads_through_link(mount_point)) return kFailed;
   if (check_path_exist(mount_point) != 0) return kOk;
   if (is_foreign_mount(entry, mount_point)) return kFailed;
   if (sys_mount_point(mount_point) != 0) {
     (void)remount_mnt_path(mount_point, 0);
     umount_with_rounds(mount_point);
+    if (leads_through_link(mount_point)) return kFailed;
     detach_mounts(mount_point);
   }
   const Result result = hold.is_anothers(mount_point) ? kFailed : remove_mount_point(mount_point);

@@ -7,6 +7,7 @@ import stat
 import string
 
 import pytest
+from harness import messages, startswith
 from harness.sysaux import Loop, image, make_ambivalent, make_ext, md_member, mounted, run
 from harness.volumes import drive, luns
 
@@ -523,6 +524,59 @@ def test_a_planted_link_is_not_followed(luns, share):
     assert lun.unmount().result == -1
     assert not lun.box.shell()
     assert lun.disk.digest() == before
+    assert kept.read_text() == "stays"
+
+
+def lead_elsewhere(name):
+    """Shell text of somebody who may write in the volume "outer": NAME in it leads elsewhere from now on."""
+    return f"cd /mnt/VV/outer; [ ! -e {name} ] || mv {name} was; ln -s /mnt/elsewhere {name}"
+
+
+def test_a_link_that_is_planted_during_a_format_is_not_followed(luns):
+    outer, inner = luns(300 * MIB, "outer"), luns(200 * MIB, "outer/inner")
+    outer.mount()
+    outer.box.write("/mnt/elsewhere/kept", "stays")
+    outer.box.hook("semop", "-1 SEM_UNDO", through=True, effect=lead_elsewhere("inner"))
+    done = inner.mount()
+    assert done.result == -4
+    assert "share name outer/inner leads through a symbolic link below /mnt/VV/" in messages(done, "Target_mount")
+    assert formatted(inner) and not inner.mounts()
+
+
+REMOUNT, KILL, UMOUNT = (command + ' "/mnt/VV/outer/x/inner"' for command in ("mount -o remount", "fuser -mk", "umount -f"))
+
+
+@pytest.mark.parametrize("in_use", [False, True])
+@pytest.mark.parametrize("function, what, done", [("system", "fuser -mk ", []), ("sleep", "1", [REMOUNT, KILL]),
+                                                  ("system", UMOUNT, [REMOUNT, KILL, UMOUNT])])
+def test_a_link_that_is_planted_during_an_unmount_is_not_followed(luns, function, what, done, in_use):
+    outer, inner = luns(300 * MIB, "outer"), luns(200 * MIB, "outer/x/inner")
+    box = outer.box
+    outer.mount()
+    inner.mount()
+    if in_use:
+        box.path("/mnt/elsewhere/inner").mkdir(parents=True)
+        assert box.run(["/usr/bin/mount", "-t", "tmpfs", "none", "/mnt/elsewhere/inner"]).status == 0
+    kept = box.write("/mnt/elsewhere/inner/kept", "stays")
+    box.forget()
+    box.fake("fuser", first=True)  # without users the real one fails and is tried again
+    box.hook(function, startswith(what), times=1, through=what != UMOUNT, ret=256, effect=lead_elsewhere("x"))
+    unmount = inner.unmount()
+    assert unmount.result == -1
+    assert "share name outer/x/inner leads through a symbolic link below /mnt/VV/" in messages(unmount)
+    assert [line for line in box.shell() if inner.mount_point in line] == done
+    assert kept.read_text() == "stays"
+
+
+def test_a_link_that_is_planted_while_a_mount_fails_is_not_removed_through(luns):
+    lun = luns(64 * MIB, "a/share1")
+    kept = lun.box.write("/mnt/elsewhere/share1/kept", "stays")
+    lun.box.fake("mount", "-t ext4", first=True, status=32, times=1,
+                 effect="cd /mnt/VV; mv a was; ln -s /mnt/elsewhere a")
+    lun.box.fake("mount", "-t ext4", first=True, skip=1, status=32)
+    done = lun.mount()
+    assert (done.result, lun.key("volume_state")) == (0, "3")
+    assert "share name a/share1 leads through a symbolic link below /mnt/VV/" in messages(done)
     assert kept.read_text() == "stays"
 
 

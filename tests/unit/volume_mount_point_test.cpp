@@ -111,10 +111,12 @@ TEST_F(MountedPath, ADetachedVolumeIsHeldByNobody) {
   }
 }
 
-TEST_F(MountedPath, ALinkToAMountIsNotRemovedThrough) {
+TEST_F(MountedPath, AMountBelowARootThatIsALinkIsNotRemoved) {
   put_layer();
-  std::filesystem::create_symlink("/mnt/VV", "/mnt/link");
-  EXPECT_TRUE(is_removal_unsafe("/mnt/link/Data"));
+  std::filesystem::rename("/mnt/VV", "/mnt/volumes");
+  std::filesystem::create_directory_symlink("/mnt/volumes", "/mnt/VV");
+  const std::string log = fakes::output_of([this] { EXPECT_TRUE(is_removal_unsafe(path.c_str())); });
+  EXPECT_TRUE(has(log, path + " is not removed, tmpfs is mounted on /mnt/volumes/Data"));
 }
 
 // The table writes such characters as octal numbers, and /proc/mounts shifts its columns without a source.
@@ -161,6 +163,8 @@ TEST_F(MountedPath, LinksBelowTheRootAreRefused) {
         has(log, std::string("share name ") + share + " leads through a symbolic link below /mnt/VV/"));
   }
   for (const char* share : {"lin", "links", "Data", "Data/link"}) EXPECT_TRUE(is_share_inside_root(share));
+  const std::string log = fakes::output_of([] { EXPECT_TRUE(is_removal_unsafe("/mnt/VV/link/a")); });
+  EXPECT_TRUE(has(log, "share name link/a leads through a symbolic link below /mnt/VV/"));
 }
 
 // --- the bare folder ---
