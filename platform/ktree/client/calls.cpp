@@ -18,20 +18,6 @@ CallResult file_result(int error, Reason& reason) {
   return CallResult::kFailed;
 }
 
-// Whether the file that could not be read for this reason is none, or none that could ever be loaded.
-bool is_no_settings_file(int error) {
-  switch (error) {
-    case ENOENT:
-    case ENOTDIR:
-    case EISDIR:
-    case EINVAL:
-    case EFBIG:
-      return true;
-    default:
-      return false;
-  }
-}
-
 // Lets the daemon fill `document`.
 CallResult fetch(const char* socket, Operation operation, const char* path, const MemoryFile& document,
                  Reason& reason) {
@@ -91,10 +77,7 @@ CallResult load(const char* socket, const char* file, Reason& reason) {
   reason.text[0] = '\0';
   const MemoryFile document;
   const int wrong = document.fd() < 0 ? errno : document.read_from(file);
-  if (wrong != 0) {
-    const CallResult failed = file_result(wrong, reason);
-    return is_no_settings_file(wrong) ? CallResult::kDamaged : failed;
-  }
+  if (wrong != 0) return file_result(wrong, reason);
   Call call = {Operation::kLoad, {}, {}, document.fd(), reason.text, kMaxErrorBytes, 0};
   const CallResult result = request(socket, call);
   reason.text[call.size] = '\0';

@@ -27,8 +27,7 @@ struct Reason {
 // Writes the settings file of the tree to `fd`.
 [[nodiscard]] CallResult dump_to(const char* socket, int fd, Reason& reason);
 
-// Makes the tree what `file` holds. A file that is missing or no regular one counts as damaged; kFailed says
-// nothing against it.
+// Makes the tree what `file` holds.
 [[nodiscard]] CallResult load(const char* socket, const char* file, Reason& reason);
 
 // Has the daemon write the listing of the subtree at `path` ("/" is the whole tree) into `document`.

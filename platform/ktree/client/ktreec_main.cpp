@@ -19,7 +19,6 @@ using ktree::client::Reason;
 constexpr int kNo = 1;  // the node is missing, or the daemon refused
 constexpr int kUsageError = 2;
 constexpr int kUnreachable = 3;
-constexpr int kNotLoaded = 4;
 
 constexpr char kUsage[] =
     "Usage: ktreec [-S SOCKET] OPERATION\n"
@@ -36,8 +35,7 @@ constexpr char kUsage[] =
     "  -V, --version  print the version and exit\n"
     "\n"
     "Exit status: 0 done, 1 missing or refused, 2 wrong usage,\n"
-    "3 the daemon cannot be reached, 4 a settings file that may be good could not\n"
-    "be loaded.\n";
+    "3 the daemon cannot be reached.\n";
 
 struct CommandLine {
   const char* socket;
@@ -105,8 +103,7 @@ int do_list(const CommandLine& arguments) {
 int do_load(const CommandLine& arguments) {
   Reason reason;
   const CallResult result = ktree::client::load(arguments.socket, arguments.operands[0], reason);
-  const int status = conclude(arguments, result, arguments.operands[0], reason.text);
-  return result == CallResult::kFailed ? kNotLoaded : status;
+  return conclude(arguments, result, arguments.operands[0], reason.text);
 }
 
 int do_dump(const CommandLine& arguments) {
