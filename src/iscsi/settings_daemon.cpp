@@ -20,10 +20,10 @@ namespace {
 
 constexpr char kSettingsPidFile[] = "/var/run/ktree_sock_vv_config.pid";
 
-// Exit statuses of ktreec.
-constexpr int kSettingsRefused = 1;  // missing or damaged
-constexpr int kLoadFailed = 4;       // nothing is said against the file
-constexpr int kLoadTries = 10;       // one a second
+// Exit status of ktreec.
+constexpr int kSettingsRefused = 1;
+constexpr int kUnreadable = -2;  // refused, and nothing can be said against what the file holds
+constexpr int kLoadTries = 10;   // one a second
 
 // Returns the exit status of the command that loads `file` into the tree, or -1 when it did not come to its
 // end. Loading moves all slots at once: a run that has found them empty a moment ago must not take them for
@@ -33,6 +33,7 @@ int load_tree(const char* file) {
   slots_move();
   const int status = run_command(load_tree_command(kVolumesSocket, file));
   const int ended = command_exit_code(status);
+  if (ended == kSettingsRefused && settings_file_is_unreadable(file)) return kUnreadable;
   return ended == 0 && status != 0 ? -1 : ended;
 }
 
@@ -59,7 +60,7 @@ bool load_settings() {
   if (saved == 0) return true;
   const bool refused = saved == kSettingsRefused;
   const bool has_copy = !is_nowhere(kFlashCopy);
-  if (!refused && (saved != kLoadFailed || !has_copy)) return is_nowhere(kSettingsFile) && !has_copy;
+  if (!refused && (saved != kUnreadable || !has_copy)) return is_nowhere(kSettingsFile) && !has_copy;
   keep_damaged_settings();
   if (!has_copy) return true;
   const int copy = load_surely(kFlashCopy);

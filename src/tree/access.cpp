@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <cstring>
+#include <ctime>
 
 #include "frontend/log.h"
 #include "ktreec.h"
@@ -17,6 +18,9 @@
 namespace remvol {
 
 namespace {
+
+constexpr time_t kPatience =
+    1;  // seconds of a read that is done once more: one that has timed out would again
 
 // A daemon that is too busy to take the connection at once is one.
 bool tree_takes_connections() {
@@ -56,8 +60,10 @@ TreeInstance tree_instance() {
 }
 
 int tree_get(const char* key, char* buffer, size_t size) {
+  const time_t begin = time(nullptr);
   const int got = get_once(key, buffer, size);
-  return got == -1 && errno != ENODATA ? get_once(key, buffer, size) : got;
+  if (got != -1 || errno == ENODATA || time(nullptr) - begin > kPatience) return got;
+  return get_once(key, buffer, size);
 }
 
 bool tree_read(const char* key, char* buffer, size_t size) {

@@ -36,7 +36,7 @@ struct TreeInstance {
 // Reads `key` into `buffer` of `size` bytes, which is cleared first. Returns what the read gives: the number
 // of bytes, -1 for a key that is missing; errno is ENODATA when the tree has said so, and it is no read that
 // failed (a tree's library of another platform may not tell). What is read decides what is written, formatted
-// and taken away, so a read that may have failed is done once more.
+// and taken away, so a read that may have failed at once is done once more.
 [[nodiscard]] int tree_get(const char* key, char* buffer, size_t size);
 
 // The same. Returns whether the key is present.

@@ -10,6 +10,7 @@
 #include "frontend/log.h"
 #include "ktreec.h"
 #include "support/files.h"
+#include "support/text.h"
 #include "tree/access.h"
 #include "tree_layout.h"
 
@@ -61,32 +62,41 @@ bool next_tag(FileText* text, Tag* tag) {
   return false;
 }
 
-// Returns whether text follows, not the next tag.
-bool has_text(FileText* text) {
+// Returns the first character of the text that follows, 0 when the next tag does.
+char text_start(FileText* text) {
   const int c = text->next();
-  return c != EOF && c != '<';
+  return c != EOF && c != '<' ? static_cast<char>(c) : '\0';
 }
 
-// Returns whether the initiator's first element `name` has a text.
-bool find_value(FileText text, const char* name) {
+// Returns the first character of the text of the initiator's first element `name`, 0 when it has none.
+char find_value(FileText text, const char* name) {
   int depth = 0;
   int on_path = 0;  // how many of the open elements lead to it
   for (Tag tag; depth >= 0 && next_tag(&text, &tag);) {
     const bool next = tag.opens() && on_path == depth;
-    if (next && depth == kInitiatorDepth && tag.is_named(name)) return has_text(&text);
+    if (next && depth == kInitiatorDepth && tag.is_named(name)) return text_start(&text);
     if (next && depth < kInitiatorDepth && tag.is_named(kInitiatorPath[depth])) on_path++;
     if (tag.opens()) depth++;
     if (tag.closes()) depth--;
     if (on_path > depth) on_path = depth;
   }
-  return false;
+  return '\0';
 }
 
 // The same of the file at `path`; one that is there and cannot be read may have it.
-bool has_value(const char* path, const char* name) {
+char find_value(const char* path, const char* name) {
   const File file(fopen(path, "re"));
-  if (file == nullptr) return errno != ENOENT;
-  return find_value({file.get()}, name) || ferror(file.get()) != 0;
+  if (file == nullptr) return errno != ENOENT ? '?' : '\0';
+  const char found = find_value(FileText{file.get()}, name);
+  return found == '\0' && ferror(file.get()) != 0 ? '?' : found;
+}
+
+// Nothing but a load of settings of version 0 brings a share beside a target's name.
+bool holds_old_targets() {
+  for (int n = 1; n <= kMaxTargets; n++) {
+    if (tree_present(KeyText(key::kOldShare, n))) return true;
+  }
+  return false;
 }
 
 // Where the folder is missing nobody keeps settings: that is no line of the log, which programs read.
@@ -112,15 +122,25 @@ bool settings_file_is_torn(const char* path) {
   return length < kEndLength || memcmp(end + length - kEndLength, kFileEnd, kEndLength) != 0;
 }
 
-// A tree that was loaded from settings of version 0 has their count. The copy counts where kSettingsFile
+// Of version 0 without targets the count is all that tells a loaded tree. The copy counts where kSettingsFile
 // holds no settings: it would be loaded then.
 const char* unloaded_settings() {
-  if (tree_present(key::kVersion)) return nullptr;
+  if (tree_present(key::kVersion) || holds_old_targets()) return nullptr;
   for (const char* file : {kSettingsFile, kFlashCopy}) {
-    if (has_value(file, "ver")) return file;
-    if (has_value(file, "count")) return tree_present(key::kTargetCount) ? nullptr : file;
+    if (find_value(file, "ver") != '\0') return file;
+    const char count = find_value(file, "count");
+    if (count != '\0') return count == '0' && tree_present(key::kTargetCount) ? nullptr : file;
   }
   return nullptr;
+}
+
+bool settings_file_is_unreadable(const char* path) {
+  const File file(fopen(path, "re"));
+  if (file == nullptr) return errno != ENOENT && errno != ENOTDIR;
+  char text[4096];
+  while (fread(text, 1, sizeof text, file.get()) > 0) {
+  }
+  return ferror(file.get()) != 0 && errno != EISDIR;
 }
 
 bool store_settings() {

@@ -7,10 +7,13 @@ namespace remvol {
 // Returns whether there is a file at `path` that does not end like a settings file: it is empty or cut off.
 [[nodiscard]] bool settings_file_is_torn(const char* path);
 
+// Returns whether the settings file at `path` is there and cannot be read just now. No regular file is none.
+[[nodiscard]] bool settings_file_is_unreadable(const char* path);
+
 // Returns the file that a dump would lose the settings of, kSettingsFile or kFlashCopy: it has a settings
-// version and the tree has none, or it is of version 0, which has none, and the tree has no count of targets
-// either, so the tree was started and never loaded. A look at the first mebibytes of its text, not a check;
-// one that cannot be read may hold anything. Returns null when there is none.
+// version and the tree has none, or it is of version 0, which has none, and the tree holds nothing of such
+// settings either, so the tree was started and never loaded. A look at the first mebibytes of its text, not a
+// check; one that cannot be read may hold anything. Returns null when there is none.
 [[nodiscard]] const char* unloaded_settings();
 
 // Dumps the tree to kSettingsFile. A dump that is withheld or fails is logged at level 0 in the innermost

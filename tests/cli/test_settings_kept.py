@@ -10,7 +10,6 @@ SAVED, COPY, DAMAGED = "/etc/NAS_CFG/vv.xml", "/usr/local/config/vv.xml", "/etc/
 FLASH = f'system flashrun "cp -f {SAVED} /usr/local/config/"'
 LOAD_COPY = f"system ktreec -S /var/run/ktree_sock_vv -l {COPY}"
 MARK = "/tmp/reset_default"
-NOT_DONE = 4 << 8  # nothing is said against the file
 
 
 def settings(prefix, version="<ver>1</ver>"):
@@ -19,6 +18,13 @@ def settings(prefix, version="<ver>1</ver>"):
 
 # Those of version 0 have no version.
 OLD = "<config><iscsi><initiator><prefix>precious</prefix><count>0</count></initiator></iscsi></config>"
+
+
+OLD_TARGET = OLD.replace("<count>0</count>", "<count>1</count><id><target>iqn.t1</target><share>old</share></id>")
+
+
+def load(box, path):
+    assert box.run(["ktreec", "-S", box.tree.socket, "-l", path], env={"LD_PRELOAD": None}, own=True).status == 0
 
 
 def prefix(box):
@@ -85,20 +91,32 @@ def test_no_command_makes_a_tree_that_was_never_loaded_one_that_was(box, saved, 
     assert (box.path(SAVED).read_text() if box.path(SAVED).exists() else None) == saved
 
 
-@pytest.mark.parametrize("copy", [None, settings("of today")])
-def test_loaded_settings_of_version_0_are_upgraded_and_saved(box, copy):
-    box.tree.set({"/iscsi/initiator/prefix": "precious", "/iscsi/initiator/count": "0"})
-    box.write(SAVED, OLD)
+@pytest.mark.parametrize("saved, copy", [(OLD, None), (OLD, settings("of today")), (OLD_TARGET, None)])
+def test_loaded_settings_of_version_0_are_upgraded_and_saved(box, saved, copy):
+    box.write(SAVED, saved)
+    load(box, SAVED)
     if copy is not None:
         box.write(COPY, copy)
     assert box.remvol("--verupgrade").status == 0
     assert "<ver>1</ver>" in box.path(SAVED).read_text() and "precious" in box.path(SAVED).read_text()
 
 
-def test_a_count_does_not_make_an_empty_tree_a_loaded_one(box):
+@pytest.mark.parametrize("command", ["--verupgrade", "--init"])
+def test_settings_of_version_0_that_were_loaded_by_hand_take_the_place_of_todays(box, command):
+    appliance(box)
+    box.write("/root/old.xml", OLD_TARGET)
+    load(box, "/root/old.xml")
+    box.write(SAVED, settings("of today"))
+    assert box.remvol(command).status == 0
+    assert box.tree.get("/iscsi/initiator/id:1/lun/id:1/share") == "old"
+    assert "<ver>1</ver>" in box.path(SAVED).read_text() and "precious" in box.path(SAVED).read_text()
+
+
+@pytest.mark.parametrize("text", [settings("precious"), OLD_TARGET], ids=["today", "version 0"])
+def test_a_count_does_not_make_an_empty_tree_a_loaded_one(box, text):
     """The next dump of one without the settings would bury them, and the copy would follow."""
     appliance(box)
-    box.write(SAVED, settings("precious"))
+    box.write(SAVED, text)
     assert box.remvol("--del", "-n", "iqn.gone").status == 255
     assert box.tree.get("/iscsi/initiator/count") == "0"
     init(box)
@@ -286,7 +304,7 @@ def test_what_was_read_of_the_slots_before_settings_are_loaded_is_believed_no_mo
 
 
 @pytest.mark.parametrize("source", [SAVED, COPY])
-@pytest.mark.parametrize("status", [-1, 9, 127 << 8, NOT_DONE])
+@pytest.mark.parametrize("status", [-1, 9, 127 << 8])
 def test_a_command_that_could_not_load_the_settings_is_run_again(bare_box, source, status):
     """The tree would count as fresh, and be dumped over them."""
     box = bare_box
@@ -302,11 +320,8 @@ def test_a_command_that_could_not_load_the_settings_is_run_again(bare_box, sourc
 @pytest.mark.parametrize("source, saved, copy, status", [
     (SAVED, settings("saved"), settings("copy"), 127 << 8),
     (SAVED, settings("saved"), None, 127 << 8),
-    (SAVED, settings("saved"), None, NOT_DONE),
     (COPY, "<config><precious", settings("copy"), 127 << 8),
-    (COPY, "<config><precious", settings("copy"), NOT_DONE),
-    (COPY, None, settings("copy"), NOT_DONE),
-], ids=["never runs", "never runs without a copy", "fails without a copy", "copy never runs", "copy fails", "copy alone fails"])
+], ids=["never runs", "never runs without a copy", "copy never runs"])
 def test_settings_that_can_never_be_loaded_are_not_buried(bare_box, source, saved, copy, status):
     """With a version the tree would count as theirs, and be dumped over them and copied to the flash."""
     box = bare_box
@@ -325,15 +340,26 @@ def test_settings_that_can_never_be_loaded_are_not_buried(bare_box, source, save
     assert not box.path(DAMAGED).exists() or source == COPY
 
 
-def test_settings_that_cannot_be_loaded_and_are_not_damaged_are_kept_beside_their_copy(bare_box):
+def test_settings_that_cannot_be_read_are_kept_beside_their_copy(bare_box):
     box = bare_box
     appliance(box)
-    box.write(SAVED, settings("saved"))
+    box.path("/etc/NAS_CFG").mkdir()
+    box.path(SAVED).symlink_to("/proc/self/mem")
     box.write(COPY, settings("copy"))
-    box.hook("system", f"ktreec -S /var/run/ktree_sock_vv -l {SAVED}", ret=NOT_DONE)
     init(box)
     assert prefix(box) == "copy"
-    assert "saved" in box.path(DAMAGED).read_text()
+    assert box.path(DAMAGED).is_symlink()
+
+
+def test_a_copy_that_cannot_be_read_is_not_buried(bare_box):
+    box = bare_box
+    appliance(box)
+    box.path("/etc/NAS_CFG").mkdir()
+    box.path(COPY).parent.mkdir(parents=True, exist_ok=True)
+    box.path(COPY).symlink_to("vv.xml")
+    init(box)
+    assert box.tree.get("/iscsi/initiator/ver") is None
+    assert box.path(COPY).is_symlink() and not box.path(SAVED).exists()
 
 
 @pytest.mark.parametrize("copy", [None, "<config><iscsi>"])
