@@ -15,7 +15,7 @@ namespace {
 
 constexpr key_t kFormatSemKey = 90111;
 constexpr int kFormatSemMode = 0666;
-constexpr int kOwnMode = 0600;    // of a set of ours, from its making on
+constexpr int kOwnMode = 0600;    // what a set of ours is left with
 constexpr int kMaxReplaced = 16;  // a stranger may be quick to make another one
 
 int held_sem_id = -1;  // the set that this process has taken and not left
@@ -74,12 +74,36 @@ int get_own_set(int flags) {
   return -1;
 }
 
-// Makes the semaphore set and gives it its value. No other user may wait for it meanwhile, who would have it
-// first. The create is not exclusive: two runs that found it missing at the same moment may both set the
-// value, and both format then. That costs memory and time, not data, since they format different volumes.
+// Takes a set of ours from all other users. It has no value yet, so nobody has it.
+void close_to_others(int sem_id) {
+  semid_ds status{};
+  if (!read_status(sem_id, &status)) return;
+  status.sem_perm.mode = kOwnMode;
+  semun argument{};
+  argument.buf = &status;
+  semctl(sem_id, 0, IPC_SET, argument);
+}
+
+// Returns the id of a new set, or -1 with errno. Whoever waits for it already would have it before us, and
+// need never leave: that set is thrown away.
+int make_own_set() {
+  for (int i = 0; i < kMaxReplaced; i++) {
+    const int sem_id = get_own_set(IPC_CREAT | kFormatSemMode);
+    if (sem_id == -1) return -1;
+    close_to_others(sem_id);
+    if (semctl(sem_id, 0, GETNCNT) <= 0) return sem_id;
+    semctl(sem_id, 0, IPC_RMID);
+  }
+  errno = EACCES;
+  return -1;
+}
+
+// Makes the semaphore set and gives it its value. The create is not exclusive: two runs that found it missing
+// at the same moment may both set the value, and both format then. That costs memory and time, not data,
+// since they format different volumes.
 int create_format_sem(int initial) {
   LOG(2, "try to semget(%d 1, 0666 | IPC_CREATE )", kFormatSemKey);
-  const int sem_id = get_own_set(IPC_CREAT | kOwnMode);
+  const int sem_id = make_own_set();
   if (sem_id == -1) {
     LOG(0, "semget(..., IPC_CREATE ) failed");
     return -1;

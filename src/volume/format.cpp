@@ -28,7 +28,6 @@ namespace {
 constexpr int kStartTries = 3;
 constexpr int kFirstWordMs = 5000;  // of mke2fs, at most
 using FsName = char[16];
-using FoundFs = char[64];
 
 constexpr FormatResult kGoOn = kFormatted;  // of a step
 
@@ -54,10 +53,12 @@ void log_failed_update(int result) {
 }
 
 // A partition that carried ext2 or ext3 keeps its kind.
-void choose_fs(FsName& fs_type, const char* found) {
-  if (found[0] == '\0') {
+void choose_fs(FsName& fs_type, const char* partition) {
+  char found[64] = "";
+  if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') {
     LOG(2, "set strFS to default fs: %s", kDefaultFileSystem);
-    found = kDefaultFileSystem;
+    copy_text(fs_type, kDefaultFileSystem);
+    return;
   }
   copy_text(fs_type, found);
 }
@@ -100,17 +101,17 @@ void follow_mke2fs(FILE* output, const TargetEntry* entry, const char* partition
   log_failed_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 100));
 }
 
-// Whether the partition, chosen a while ago, may still be formatted. Puts what is recognised on it into
-// `found`. Returns kGoOn, kFormatRefused or kFormatLeftAlone.
-FormatResult look_again(const TargetEntry* entry, const char* partition, const SeenContent* seen,
-                        FoundFs& found) {
+// Whether the partition, chosen a while ago, may still be formatted. Returns kGoOn, kFormatRefused or
+// kFormatLeftAlone.
+FormatResult look_again(const TargetEntry* entry, const char* partition, const SeenContent* seen) {
   if (is_foreign_disk(entry, partition)) return kFormatRefused;
   if (is_node_mounted(partition)) {
     LOG(0, "%s is mounted by now, it is not formatted", partition);
     return kFormatLeftAlone;
   }
-  if (sys_get_fs_type(found, partition) != 0) found[0] = '\0';
-  if (seen == nullptr || found[0] == '\0') return kGoOn;
+  if (seen == nullptr) return kGoOn;
+  char found[64] = "";
+  if (sys_get_fs_type(found, partition) != 0 || found[0] == '\0') return kGoOn;
   if (strcmp(found, seen->fs_type) == 0 && content_mark(partition) == seen->mark) return kGoOn;
   LOG(0, "%s carries %s by now, it is not formatted", partition, found);
   return kFormatLeftAlone;
@@ -154,9 +155,9 @@ FormatResult begin_making(const TargetEntry* entry, FsName& fs_type, const char*
   return kGoOn;
 }
 
-// Makes the file system in the place of the one found, everybody else on the partition ended and its
-// beginning wiped before. Returns kGoOn, kFormatRefused, kFormatNotWritable, or kFormatNotStarted.
-FormatResult make_file_system(TargetEntry* entry, const char* partition, const char* found) {
+// Makes the file system, everybody else on the partition ended and its beginning wiped before. Returns
+// kGoOn, kFormatRefused, kFormatNotWritable, or kFormatNotStarted.
+FormatResult make_file_system(TargetEntry* entry, const char* partition) {
   log_failed_update(ktree_update_formatting_state(entry, kFormatting));
   log_failed_update(ktree_update_format_progress(entry->db_idx, entry->lun_db_idx, 0));
   log_failed_update(ktree_update_lun_status(entry, 1));
@@ -165,7 +166,7 @@ FormatResult make_file_system(TargetEntry* entry, const char* partition, const c
   FormatResult result = end_users(entry, partition);
   if (result != kGoOn) return result;
   FsName fs_type;
-  choose_fs(fs_type, found);
+  choose_fs(fs_type, partition);
   result = wipe_beginning(entry, partition);
   if (result != kGoOn) return result;
   sleep(1);
@@ -188,9 +189,8 @@ FormatResult Target_format(TargetEntry* entry, const char* partition, const Seen
     LOG(0, "wait fmt_sem failed, exit");
     return kFormatRefused;
   }
-  FoundFs found = "";
-  FormatResult result = look_again(entry, partition, seen, found);
-  if (result == kGoOn) result = make_file_system(entry, partition, found);
+  FormatResult result = look_again(entry, partition, seen);
+  if (result == kGoOn) result = make_file_system(entry, partition);
   // The semaphore stays taken and the format state stays "formatting" until this run ends; the kernel then
   // undoes the semaphore's change.
   if (result == kFormatNotWritable) return result;

@@ -53,8 +53,8 @@ class FormatSemaphore : public VolumeTest {
 TEST_F(FormatSemaphore, TheFirstFormatMakesTheSemaphoreAndTheLastRemovesIt) {
   int sem_id = -1;
   EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), 0);
-  EXPECT_EQ(fakes::calls(),
-            (Texts{"semget 90111 1 666", "semget 90111 1 1600", "semctl SETVAL 1", "semop -1 SEM_UNDO"}));
+  EXPECT_EQ(fakes::calls(), (Texts{"semget 90111 1 666", "semget 90111 1 1666", "semctl IPC_SET 600",
+                                   "semctl GETNCNT", "semctl SETVAL 1", "semop -1 SEM_UNDO"}));
   EXPECT_GE(sem_id, 0);
   EXPECT_TRUE(has(log, "semget(...) == -1, errno = 2"));
   EXPECT_TRUE(has(log, "try to semget(90111 1, 0666 | IPC_CREATE )"));
@@ -94,7 +94,7 @@ TEST_F(FormatSemaphore, ASemaphoreThatCannotBeHad) {
   EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), -1);
   EXPECT_TRUE(has(log, "semget() failed"));
   fakes::on("semget", "90111 1 666").returns(-1).error(EIDRM).times(1);
-  fakes::on("semget", "90111 1 1600").returns(-1).error(ENOSPC).times(1);
+  fakes::on("semget", "90111 1 1666").returns(-1).error(ENOSPC).times(1);
   EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), -1);
   EXPECT_TRUE(has(log, "semget(..., IPC_CREATE ) failed"));
   fakes::on("semctl", "SETVAL").returns(-1).error(ERANGE).times(1);
@@ -159,7 +159,7 @@ TEST_F(FormatSemaphore, WhatAFormatLeftIsReleasedOnce) {
   EXPECT_EQ(format_sem_P(&sem_id, 1), 0) << "it can be taken again";
 }
 
-TEST_F(FormatSemaphore, FromItsMakingOnItIsClosedToOthers) {
+TEST_F(FormatSemaphore, AfterItsMakingItIsClosedToOthers) {
   int sem_id = -1;
   ASSERT_EQ(format_sem_P(&sem_id, 1), 0);
   const semid_ds status = status_of(sem_id);

@@ -69,9 +69,10 @@ TEST_F(Format, TheStepsComeInOrder) {
   fakes::on("popen").text("Writing inode tables: \b1/4\b\b\b2/4\b\b\b3/4\b\n");
   EXPECT_EQ(Target_format(&entry, kNode), 0);
   EXPECT_EQ(fakes::calls(),
-            (Texts{"semget 90111 1 666", "semget 90111 1 1600", "semctl SETVAL 1", "semop -1 SEM_UNDO",
-                   "system fuser -mk \"/dev/sdb1\"", "system dd if=/dev/zero of=/dev/sdb1 bs=1M count=1",
-                   "sleep 1", std::string("popen ") + kExt4Command, "semctl GETNCNT", "semctl IPC_RMID"}));
+            (Texts{"semget 90111 1 666", "semget 90111 1 1666", "semctl IPC_SET 600", "semctl GETNCNT",
+                   "semctl SETVAL 1", "semop -1 SEM_UNDO", "system fuser -mk \"/dev/sdb1\"",
+                   "system dd if=/dev/zero of=/dev/sdb1 bs=1M count=1", "sleep 1",
+                   std::string("popen ") + kExt4Command, "semctl GETNCNT", "semctl IPC_RMID"}));
   EXPECT_EQ(written("format_progress"), (Texts{"0", "65", "100"}));
   EXPECT_EQ(written("status"), Texts{"Disable"})
       << "the tree of this test says nothing of the LUN being enabled";
@@ -138,7 +139,8 @@ TEST_F(Format, APartitionThatCannotBeWrittenKeepsTheSemaphore) {
   EXPECT_TRUE(has(log, "dd /dev/sdb1 failed, this device is not able to write."));
   EXPECT_EQ(written("format_state"), (Texts{"4", "1"}));
   EXPECT_EQ(written("format_progress"), Texts{"0"});
-  EXPECT_EQ(fakes::calls({"semctl", "semop"}), (Texts{"semctl SETVAL 1", "semop -1 SEM_UNDO"}));
+  EXPECT_EQ(fakes::calls({"semctl", "semop"}),
+            (Texts{"semctl IPC_SET 600", "semctl GETNCNT", "semctl SETVAL 1", "semop -1 SEM_UNDO"}));
   EXPECT_EQ(fakes::calls({"popen", "sleep"}), Texts{});
 }
 
