@@ -1,5 +1,8 @@
 #include "events/recovery.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include "common/processes.h"
 #include "common/start.h"
 #include "common/tree_reader.h"
@@ -13,6 +16,7 @@ using platform::runs;
 using platform::TreeReader;
 
 constexpr char kWholeTree[] = "/";
+constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.lock";  // the tool's
 
 // A target that was taken out meanwhile is not lost.
 bool is_lost(const TreeReader& tree, const std::string& target) {
@@ -24,17 +28,21 @@ bool is_lost(const TreeReader& tree, const std::string& target) {
   return false;
 }
 
-bool is_queued(const TreeReader& tree, const std::string& target) {
-  for (int q = 1; q <= remvol::kMaxRecoverQueue; q++) {
-    if (tree.value(remvol::key::kRecoverName, q) == target) return true;
-  }
-  return false;
+// A run that recovers goes on with what is queued, and nothing names the target that it has taken from there.
+bool is_recovering() {
+  const int fd = open(kRecoverLock, O_RDONLY | O_CLOEXEC);
+  if (fd < 0) return false;
+  struct flock lock {};
+  lock.l_type = F_WRLCK;
+  lock.l_whence = SEEK_SET;
+  const bool held = fcntl(fd, F_GETLK, &lock) == 0 && lock.l_type != F_UNLCK;
+  close(fd);
+  return held;
 }
 
-// Whatever names the target is at it, also a run that waits before it begins. What is queued is recovered by
-// any run that recovers.
-bool is_at_work(const TreeReader& tree, const std::string& target) {
-  return runs(kTool, {target}) || (is_queued(tree, target) && runs(kTool, {"--oiscsi_evt_recover"}));
+// Whatever names the target is at it, also a run that waits before it begins.
+bool is_at_work(const std::string& target) {
+  return runs(kTool, {target}) || is_recovering();
 }
 
 }  // namespace
@@ -43,7 +51,7 @@ Recovery recovery_of(const std::string& target) {
   const TreeReader tree(remvol::kVolumesSocket, kWholeTree);
   if (!tree.answered()) return Recovery::kUnderWay;
   if (!is_lost(tree, target)) return Recovery::kOver;
-  return is_at_work(tree, target) ? Recovery::kUnderWay : Recovery::kMissing;
+  return is_at_work(target) ? Recovery::kUnderWay : Recovery::kMissing;
 }
 
 }  // namespace events

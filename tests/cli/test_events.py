@@ -397,11 +397,22 @@ def test_a_recovery_that_nobody_finished_is_ordered_again(doubtful):
     assert doubtful.daemon.stderr.count("its recovery was not finished, it is tried again") == 4
 
 
+HOLD = """
+import fcntl, os, time
+os.makedirs("/var/lock/virtual_volume", exist_ok=True)
+lock = open("/var/lock/virtual_volume/remvol_recover.lock", "w")
+fcntl.lockf(lock, fcntl.LOCK_EX)
+open("/held", "w")
+time.sleep(1000)
+"""
+
+
 @pytest.mark.native
 def test_a_recovery_that_a_run_is_at_is_waited_for(doubtful):
+    """What a run has taken from the queue is named nowhere; the run has the lock."""
     box = doubtful.box
-    for number, name in enumerate(["iqn.x", "iqn.b", "iqn.c"], 1):
-        box.tree.set(f"/temp/remvol/recover/queue/id:{number}/target_name", name)
+    box.start(["/usr/bin/python3", "-c", HOLD], env={"LD_PRELOAD": None})
+    box.wait_until(lambda: box.path("/held").exists(), what="the lock")
     at_work = [("-w", "10", *recover("iqn.a")), recover("iqn.d")]
     for words in at_work:
         box.fake("remvol", " ".join(words), exact=True, effect="until [ -e /go ]; do sleep 0.01; done")
