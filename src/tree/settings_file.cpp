@@ -122,14 +122,15 @@ bool settings_file_is_torn(const char* path) {
   return length < kEndLength || memcmp(end + length - kEndLength, kFileEnd, kEndLength) != 0;
 }
 
-// Of version 0 without targets the count is all that tells a loaded tree. The copy counts where kSettingsFile
-// holds no settings: it would be loaded then.
+// Without a version the count tells a loaded tree, but for a count of 0, which a deletion stores in any tree.
+// The copy counts where kSettingsFile holds no settings: it would be loaded then.
 const char* unloaded_settings() {
   if (tree_present(key::kVersion) || holds_old_targets()) return nullptr;
+  const int counted = tree_read_number(key::kTargetCount, -1);
   for (const char* file : {kSettingsFile, kFlashCopy}) {
     if (find_value(file, "ver") != '\0') return file;
     const char count = find_value(file, "count");
-    if (count != '\0') return count == '0' && tree_present(key::kTargetCount) ? nullptr : file;
+    if (count != '\0') return counted > 0 || (counted == 0 && count == '0') ? nullptr : file;
   }
   return nullptr;
 }
