@@ -19,8 +19,8 @@ namespace remvol {
 
 namespace {
 
-constexpr time_t kPatience =
-    1;  // seconds of a read that is done once more: one that has timed out would again
+// Seconds that a read may have taken which is done once more: one that has timed out would do so again.
+constexpr time_t kPatience = 1;
 
 // A daemon that is too busy to take the connection at once is one.
 bool tree_takes_connections() {
