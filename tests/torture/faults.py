@@ -47,6 +47,10 @@ class Fault:
         what = f"{self.road}: {CLASSES[self.kind_of]} {self.index} ({self.name} {self.subject})".replace("\t", " ")
         return f"{what[:200]} {KINDS[self.kind]}{' for ever' if self.forever else ''}, errno {self.error}"
 
+    @property
+    def killed(self):
+        return self.kind == KILL and self.kind_of != COMMAND
+
     def key(self):
         return f"{self.road}/{self.kind_of}/{self.index}/{int(self.forever)}/{self.kind}/{self.error}"
 
@@ -199,7 +203,7 @@ class Walk:
         return [line.split("\t", 3) for line in calls]
 
     def suffer(self, fault, outcomes):
-        """Findings of one fault; None when it was never met."""
+        """What is wrong after one fault and not settled; None when it was never met."""
         with self.world() as world:
             self.begin(world)
             job, fired = self.run(world, fault)
@@ -208,14 +212,14 @@ class Walk:
             if not fired:
                 return None
             world.box.wait_quiet()
-            job.killed = fault.kind == KILL and fault.kind_of != COMMAND
+            job.killed = fault.killed
             found = world.findings()
             outcome = self.outcome(world, outcomes)
             if job.status == 0 != self.road.status:
                 found.append(f"success: result 0 for {self.road.status}")
             if job.status in (0, self.road.status):
                 found += [f"success: {text}" for text in difference(self.first, outcome.seen, job.output)]
-            return found + outcome.later
+            return [text for text in found + outcome.later if not settled.reason(fault, text, job.output)]
 
     def run(self, world, fault):
         """Runs the road's command with the fault. Gives the run, and whether the fault was met."""
@@ -321,8 +325,4 @@ class Faults:
                       dice.choice(SYSTEM_CALLS), "") for _ in range(count)]
 
     def play(self, fault, outcomes):
-        """(kind of finding, text) for what is wrong and not settled."""
-        found = self.walks[fault.road].suffer(fault, outcomes)
-        if found is None:
-            return None
-        return [text for text in found if not settled.reason(fault, text)]
+        return self.walks[fault.road].suffer(fault, outcomes)

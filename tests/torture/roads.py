@@ -71,22 +71,30 @@ class Road:
 CONNECT_1, CONNECT_2, CONNECT_3 = ("connect", on(1)), ("connect", on(2)), ("connect", on(3))
 INIT, DEINIT, SYSTEM_OFF = ("init", {}), ("deinit", {}), ("system_off", {})
 EVENT_1, EVENT_3 = ("oiscsi_evt_reopen", on(1)), ("oiscsi_evt_reopen", on(3))
-ADDRESS_3 = {"t": 3, "i": "10.9.0.3", "p": 3260}
+MOVED_3 = {"t": 3, "i": "10.9.0.3", "p": 3261}
+
+
+def changed(t):
+    """What --modify stores anew: other secrets than the target's --add, which the made-up target takes as well."""
+    return {"t": t, "U": f"user{t}x", "P": f"secret{t}secret{t}x"}
 
 
 def searching(t):
     return {"t": t, "i": f"10.9.0.{t}", "p": 3260, "o": FOUND}
 
 
+# A login of a start-up that shows no disk is for ever: the target is not wanted any more, until somebody connects it.
+WANTED_AGAIN = (CONNECT_1, CONNECT_2)
+
 ROADS = {
     road.name: road
     for road in (
         Road("init", FULL, INIT),
-        Road("init-boot", FULL, INIT, boots=booted, heal=(CONNECT_1, CONNECT_2)),
-        Road("init-alone", FULL, INIT, boots=booted, unit=False, heal=(CONNECT_1, CONNECT_2)),
-        Road("init-empty", FULL, INIT, boots=empty_settings, unit=False, heal=(CONNECT_1, CONNECT_2)),
-        Road("init-flash", FULL, INIT, boots=no_settings, unit=False, heal=(CONNECT_1, CONNECT_2)),
-        Road("init-old", FULL, INIT, boots=old_settings, heal=(CONNECT_1, CONNECT_2)),
+        Road("init-boot", FULL, INIT, boots=booted, heal=WANTED_AGAIN),
+        Road("init-alone", FULL, INIT, boots=booted, unit=False, heal=WANTED_AGAIN),
+        Road("init-empty", FULL, INIT, boots=empty_settings, unit=False, heal=WANTED_AGAIN),
+        Road("init-flash", FULL, INIT, boots=no_settings, unit=False, heal=WANTED_AGAIN),
+        Road("init-old", FULL, INIT, boots=old_settings, heal=WANTED_AGAIN),
         Road("add", FULL, ("add", on(4, 0, "v40")), heal=(("connect", on(4)),)),
         Road("add-first", EMPTY, ("add", on(1, 0, "v10")), heal=(CONNECT_1,)),
         Road("add-second", HELD, ("add", on(2, 1, "v21")), heal=(CONNECT_2,)),
@@ -100,9 +108,9 @@ ROADS = {
         Road("del_lun", FULL, ("del_lun", on(1, 0))),
         Road("del_lun-last", FULL, ("del_lun", on(2, 0))),
         Road("format", FULL, ("format", on(1, 0)), heal=(CONNECT_1,)),
-        Road("modify", FULL, ("modify", on(1)), heal=(CONNECT_1,)),
-        Road("modify-stored", HELD, ("modify", on(3)), heal=(CONNECT_3,)),
-        Road("modify_address", FULL, ("modify_address", ADDRESS_3), heal=(CONNECT_3,)),
+        Road("modify", FULL, ("modify", changed(1)), heal=(CONNECT_1,)),
+        Road("modify-stored", HELD, ("modify", changed(3)), heal=(CONNECT_3,)),
+        Road("modify_address", FULL, ("modify_address", MOVED_3), heal=(CONNECT_3,)),
         Road("status", FULL, ("status", {})),
         Road("status-boot", FULL, ("status", {}), boots=booted, heal=(INIT,)),
         Road("check_share_name", FULL, ("check_share_name", on(share="v20")), status=1),

@@ -1,8 +1,9 @@
 """Results that are settled as they are although a step failed, each with its reason: a run says 0 and this is missing.
 
-A row: the roads ("ROAD for ever" is one where that fault stayed), the finding that it explains (expressions, searched), the
-reason. What stays wrong after the command was run again is a matter of its own: the second table. Nothing here explains a
-crash, a hang, lost data, or a touch of a disk that is not the run's."""
+A row: the fault (its road, or more of its text: "ROAD: call 7 (stat /x) fails for ever, errno 5"), the finding that it explains
+(expressions, searched), the reason; a fourth expression is of the output, which must tell of it. What stays wrong after the command
+was run again is a matter of its own: the second table. Nothing here explains a crash, a hang, lost data, or a touch of a disk that
+is not the run's."""
 
 import re
 
@@ -24,8 +25,20 @@ SUCCESS = (
      "a volume that cannot be mounted is told by its volume state and fails no command that brings a target up"),
     (r"^(modify|init|recover)", r"target \d",
      "a login that fails is told by the connect state, and the command has done its work"),
-    (r"^init", r"(daemon: gone|tree /iscsi/initiator/)",
+    (r"^init", r"daemon: gone",
      "--init is through whatever failed on the way; the next one brings up what is not"),
+    (r"^modify", r"tree /iscsi/initiator/id:\d+/chap_",
+     "--modify says 0 when its target is known; that the tree fails is told at level 0",
+     r"ktreec_\w+"),
+    (r"^modify_address$", r"tree /iscsi/initiator/id:3/port: 3260 for 3261",
+     "what refuses a new address says 0 as well; the printed text tells a refusal from a change",
+     r"Can not find \S+ at IP: |is connecting, disconnect it before"),
+    (r"^init", r"tree /iscsi/initiator/iqn: iqn.2013-03.org.example:",
+     "a host name or address of the network card that cannot be read is missing from the initiator's name"),
+    (r"^init-(alone|empty|flash): .* for ever", r"tree /iscsi/initiator/",
+     "--init is through whatever failed on the way; the next one loads what is not loaded"),
+    (r"^init-old: .* for ever", r"tree /iscsi/initiator/(ver|id:\d+/lun/)",
+     "--init is through whatever failed on the way; the next one converts what is not converted"),
     (r"^add(-first|-second)?$", r"target \d:",
      "the node record is made anew by every login, so a failure to make it fails no --add"),
     (r"^add-connected$", r"(disk|folder|mount) ",
@@ -40,13 +53,16 @@ SUCCESS = (
      "a failure to unmount or to log out stops neither a --disconnect nor a deletion nor a shutdown"),
     (r"^(deinit|system_off)$", r"daemon: there",
      "a failure to end the tree's daemon fails no shutdown"),
-    (r"^(search|search_lun)", r"found: ",
-     "what of a search's results could not be written is told at level 0 and fails no search; its end is in them"),
+    (r"^search", r"found: ",
+     "what of a search's results could not be written is told at level 0 and fails no search; its end is in them",
+     r"failed|cannot"),
+    (r"^search_lun: (memory .*calloc|.*\((fgets |access /dev/|sys_get_|fopen /tmp/remvol_session_get_lun_|iscsiadm -m session -P 3\)))", r"found: ",
+     "what a search cannot see of the LUNs in that moment is not in its results"),
     (r"^search$", r"target \d: None for online=0 record=1",
      "a discovery whose command says 0 has found what it has recorded"),
     (r"^search_lun", r"target ",
      "a search that has logged in ends with its own result, whatever the logout's is"),
-    (r"^check_share_name for ever$", r"result 0 ",
+    (r"^check_share_name: .* for ever", r"result 0 ",
      "a name is free when no LUN is seen to have it, also in a tree that cannot be read; --add looks again"),
 )
 
@@ -56,16 +72,17 @@ AFTER = (
     (r"^del", r"(folder|mount|target) ",
      "a slot is deleted although its volume could not be unmounted or its session closed, and the deletion that is "
      "asked for again finds no slot"),
-    (r"^search_lun-", r"(target \d|tree /iscsi/initiator/id:\d+/(lun/id:\d+/)?(conn_state|status|dev):)",
-     "a search that ends before its logout leaves the target logged in, and the status says so; nobody can tell any "
+    (r"^search_lun-.*( is killed| for ever|: memory|--logout\)|iscsiadm -m session\b|_session\.tmp\)|fgets |str_insert_back_slash |/mountinfo\))",
+     r"(target \d|tree /iscsi/initiator/id:\d+/(lun/id:\d+/)?(conn_state|status|dev):)",
+     "a search that does not come to its logout or whose logout fails, that does not see the session which it has opened, or "
+     "cannot see that nothing is mounted from it leaves the target logged in, and the status says so; nobody can tell any "
      "more who logged in"),
 )
 
-def reason(fault, text):
+def reason(fault, text, output):
     kind, _, rest = text.partition(": ")
-    table = {"success": SUCCESS, "after": AFTER}.get(kind, ())
-    for roads, finding, why in table:
-        of_road = re.search(roads, fault.road) or (fault.forever and re.search(roads, f"{fault.road} for ever"))
-        if of_road and re.match(finding, rest):
-            return why
+    for faults, finding, why, *said in {"success": SUCCESS, "after": AFTER}.get(kind, ()):
+        if re.match(finding, rest) and any(re.search(faults, name) for name in (fault.road, str(fault))):
+            if not said or re.search(said[0], output):
+                return why
     return None
