@@ -8,6 +8,7 @@
 #include "tree/slots.h"
 #include "tree/status_text.h"
 #include "tree_layout.h"
+#include "volume/disk_use.h"
 #include "volume/mount_point.h"
 
 namespace remvol {
@@ -58,6 +59,11 @@ int write_recognised(const TargetEntry* entry, const LunState& state, const char
   return type_result != kOk ? type_result : result;
 }
 
+bool recognise(const char* node, char* fs_type) {
+  const DiskLook look;
+  return sys_get_fs_type(fs_type, node) == 0;
+}
+
 // The size of a disabled LUN stays as it was.
 int write_disabled(const TargetEntry* entry) {
   const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
@@ -70,9 +76,7 @@ int compose_lun_status(const TargetEntry* entry, bool formatting, const LunState
   if (formatting) return write_status(entry, formatting_text(read_progress(entry)), "0/0");
   if (entry->dev[0] == '\0') return write_status(entry, kLunOffline, "0/0");
   char fs_type[16] = "";
-  if (sys_get_fs_type(fs_type, entry->mnt_dev) == 0) {
-    return write_recognised(entry, state, fs_type);
-  }
+  if (recognise(entry->mnt_dev, fs_type)) return write_recognised(entry, state, fs_type);
   return write_status(entry, unformatted_text(state, progress_of(entry, state)), "0/0");
 }
 

@@ -48,6 +48,7 @@ void kill_node_users(const TargetEntry* entry) {
   wait_for_udev(entry->mnt_dev);
   LoginsHeldOff logins;
   if (!has_disk(entry->mnt_dev)) logins.begin();
+  const DiskLooksHeldOff looks;
   if (is_foreign_disk(entry, entry->mnt_dev)) return;
   System("%s", end_node_users_command(entry->mnt_dev).c_str());
 }

@@ -17,7 +17,10 @@
 #include "support/target_hold.h"
 #include "support/temp_file.h"
 #include "tree/slots.h"
+#include "volume/disk_use.h"
+#include "volume/lun_status.h"
 #include "volume/mount_point.h"
+#include "volume/unmount.h"
 #include "volume_fixture.h"
 
 using namespace remvol;
@@ -323,6 +326,36 @@ TEST_F(RunLocks, LoginsThatAreHeldOffWait) {
   });
   { const LoginUnderWay login; }
   EXPECT_EQ(fakes::calls().size(), 3000U);
+}
+
+TEST_F(RunLocks, WhoeverLooksAtADiskIsNotEndedAsItsUser) {
+  store_entry();
+  fakes::tree_set({{lun("mnt_dev"), "/dev/sdb1"}});
+  copy_text(entry.mnt_dev, "/dev/sdb1");
+  start_run([] {
+    const DiskLook look;
+    stay();
+  });
+  { const DiskLook beside; }
+  EXPECT_TRUE(fakes::calls().empty());
+  EXPECT_EQ(Target_LUN_umount(&entry), 0);
+  const Texts calls = fakes::calls();
+  ASSERT_EQ(calls.size(), 251U) << "5 seconds, then it goes on";
+  EXPECT_EQ(calls.front(), "usleep 20000");
+  EXPECT_EQ(calls.back(), "system fuser -mk /dev/sdb1");
+}
+
+TEST_F(RunLocks, ADiskWhoseUsersAreEndedIsNotLookedAt) {
+  store_entry();
+  fakes::tree_set({{lun("enable"), "1"}});
+  fakes::on("sys_get_fs_type").returns(-1);
+  copy_text(entry.mnt_dev, "/dev/sdb1");
+  start_run([] {
+    const DiskLooksHeldOff kept_off;
+    stay();
+  });
+  EXPECT_EQ(ktree_update_lun_status(&entry, 0), 0);
+  EXPECT_EQ(fakes::calls({"usleep"}).size(), 250U);
 }
 
 TEST_F(RunLocks, MountPointsBelowOneFolderAreHeldTogetherForAMinuteAtMost) {
