@@ -98,6 +98,62 @@ within() {
     say "  not judged: a program takes $each ms to start"
 }
 
+# ---- the end of the volumes ----
+
+# ends_in_order COMMAND...: the command ends everything: the shares first, then the volumes, the sessions, the initiator's
+# daemon, and the tree.
+ends_in_order() {
+    watch_the_end "/proc/$(systemctl show -P MainPID remvol-tree)" "/proc/$(initiators)" &
+    renice -n 19 $! >/dev/null
+    "$@" || fail "'$*' gave status $?"
+    wait $!
+    expect_equal "what ended before its turn" "" "$(sort -u /tmp/disorder)"
+}
+
+# watch_the_end TREE INITIATOR: looks at all five, the last first, until the tree has ended; nothing can end between two
+# looks that is not seen to. No program is started for it. Processes that nobody has waited for yet have ended as well.
+watch_the_end() {
+    : >/tmp/disorder
+    gone=
+    while [ "$gone" != everything ]; do
+        gone=
+        ends "the tree" [ -e "$1/exe" ]
+        all=${gone:+everything}
+        ends "the initiator's daemon" [ -e "$2/exe" ]
+        ends "a session" any_session
+        ends "a volume" any_volume
+        ends "a share" any_share
+        gone=$all
+    done
+}
+
+# ends NAME COMMAND...: what is there while the command succeeds, when something that ends later is gone.
+ends() {
+    name=$1
+    shift
+    if ! "$@"; then
+        gone=$name
+    elif [ -n "$gone" ]; then
+        echo "$gone, before $name" >>/tmp/disorder
+    fi
+}
+
+any_session() { set -- /sys/class/iscsi_session/session*; [ -e "$1" ]; }
+
+any_volume() {
+    while read -r node point rest; do
+        case $point in /mnt/VV/*) return 0 ;; esac
+    done </proc/mounts
+    return 1
+}
+
+any_share() {
+    while read -r line; do
+        case $line in \[*) return 0 ;; esac
+    done </run/remvol/smb-shares.conf
+    return 1
+} 2>/dev/null
+
 # ---- the power ----
 
 # reboot_machine: as an operator does it; the scenario starts again with PHASE one higher.

@@ -20,7 +20,7 @@ mkdir -p /var/lib/prometheus/node-exporter
 systemctl enable --now remvol-metrics.timer
 systemctl start remvol-metrics.service
 sh -c 'while date; do sleep 0.2; done >/mnt/VV/Photos/busy 2>/dev/null' &
-apt_quiet remove remvol || fail "the package is not removed"
+ends_in_order apt_quiet remove remvol
 expect_nothing_runs
 as_before /etc/iscsi/iscsid.conf
 as_before /etc/iscsi/initiatorname.iscsi

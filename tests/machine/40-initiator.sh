@@ -31,7 +31,7 @@ died() { ! kill -0 "$old"; }
 wait_for 5 died
 died_at=$(uptime_seconds)
 wait_for 30 one_initiator
-say "another daemon after $(($(uptime_seconds) - died_at)) s"
+within "another daemon is there" $(($(uptime_seconds) - died_at)) 5
 cable_cut 0
 wait_for 60 session_is $IQN:t1 FAILED
 cable_plug 0
