@@ -1,4 +1,6 @@
-# Runs open-iscsi by hand in the virtual appliance and keeps what it prints; lab/record-samples starts it.
+# Runs open-iscsi, mount and Samba by hand in the virtual appliance and keeps what they and the kernel say; lab/record-samples
+# starts it.
+# needs: samba
 # timeout: 300
 OUT=/data/output
 mkdir -p $OUT
@@ -90,6 +92,45 @@ echo , | sfdisk -q -X gpt "$disk" || fail "partition"
 record mke2fs-ext2 env MKE2FS_SYNC=100 mke2fs -m0 -b4096 "$disk"1
 record mke2fs-ext3 env MKE2FS_SYNC=100 mke2fs -j -m0 -b4096 "$disk"1
 record mke2fs-ext4 env MKE2FS_SYNC=100 mke2fs -j -m0 -b4096 -T ext4 "$disk"1
+
+# The disk's volume, as the kernel, mount(8) and Samba speak of it. A name that the kernel's tables have to write in another way.
+session_values() {
+    cd /sys/class/iscsi_session || return
+    for value in */targetname */state */recovery_tmo */tpgt; do echo "$value: $(cat "$value")"; done
+}
+volume="/mnt/VV/Grüße aus \\Köln"
+mkdir -p "$volume"
+mount -t ext4 "$disk"1 "$volume" || fail "mount"
+record kernel-version uname -rm
+record kernel-mountinfo cat /proc/self/mountinfo
+record kernel-mounts cat /proc/mounts
+record kernel-session session_values
+record kernel-disk readlink -f "/sys/block/${disk#/dev/}/device"
+record util-linux-version mount --version
+cd "$volume" || fail "the volume"
+record util-linux-umount-in-use umount -f "$volume"
+cd / || fail "the root"
+mount -o remount,ro "$volume" || fail "remount"
+record kernel-mountinfo-read-only cat /proc/self/mountinfo
+umount "$volume" || fail "umount"
+record util-linux-umount-not-mounted umount -f "$volume"
+mount -t ext4 "$disk"1 "$volume" || fail "mount"
+record util-linux-mount-again mount -t ext4 "$disk"1 "$volume"
+while umount "$volume" 2>/dev/null; do :; done
+record util-linux-mount-other-type mount -t xfs "$disk"1 "$volume"
+record util-linux-mount-no-disk mount -t ext4 /dev/sdzz1 "$volume"
+mkdir -p /etc/samba /var/lib/samba/private /var/cache/samba /var/log/samba /run/samba
+printf '[global]\n   load printers = no\n   disable spoolss = yes\n' >/etc/samba/smb.conf
+printf 'nobody:x:65534:65534::/:/bin/false\n' >>/etc/passwd
+printf 'nogroup:x:65534:\n' >>/etc/group
+record samba-version smbd --version
+record samba-reload-without-server smbcontrol all reload-config
+smbd -D || fail "smbd"
+wait_for 30 smbcontrol smbd ping
+record samba-reload smbcontrol all reload-config
+record samba-close-share smbcontrol smbd close-share Photos
+pkill smbd
+
 record logout iscsiadm -m node -T $IQN:t1-x --logout
 record logout-again iscsiadm -m node -T $IQN:t1-x --logout
 record delete-in-use iscsiadm -m node -I default -T $IQN:t10 -p 10.9.0.2:3260 -o delete

@@ -4,6 +4,14 @@
 #include <gtest/gtest.h>
 #include <sys/sysmacros.h>
 
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <string>
+#include <utility>
+#include <vector>
+
 namespace vvstat {
 namespace {
 
@@ -24,6 +32,26 @@ TEST(Mounts, AreReadWithTheirDeviceAndOptions) {
   EXPECT_EQ(mounts[1].point, "/mnt/VV/Gr\303\274\303\237e aus K\303\266ln\\");
   EXPECT_EQ(mounts[1].options, "ro,noatime,stripe=32");
   EXPECT_EQ(mounts[2].options, "rw,nosuid,size=20480k");
+}
+
+TEST(Mounts, AreReadAsTheKernelsOfAllReleasesWriteThem) {
+  int read = 0;
+  for (const auto& release : std::filesystem::directory_iterator(SAMPLES "/kernel")) {
+    for (const auto& [name, writable] :
+         {std::pair("mountinfo.out", true), {"mountinfo-read-only.out", false}}) {
+      std::ifstream file(release.path() / name);
+      const std::string text(std::istreambuf_iterator<char>(file), {});
+      const std::vector<Mount> mounts = mounts_of(text);
+      const auto lines = std::count(text.begin(), text.end(), '\n');
+      EXPECT_EQ(mounts.size(), static_cast<size_t>(lines)) << release;
+      const Mount* volume = mount_on(mounts, "/mnt/VV/Gr\303\274\303\237e aus \\K\303\266ln");
+      ASSERT_NE(volume, nullptr) << release;
+      EXPECT_EQ(major(volume->device), 8U) << release;
+      EXPECT_EQ(volume->options.compare(0, 3, writable ? "rw," : "ro,"), 0) << volume->options;
+      read++;
+    }
+  }
+  EXPECT_GE(read, 4);
 }
 
 TEST(Mounts, TheLastOneOnAPlaceCounts) {
