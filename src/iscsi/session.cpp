@@ -9,6 +9,7 @@
 #include "iscsi/iscsiadm.h"
 #include "iscsi/session_check.h"
 #include "iscsi/session_listing.h"
+#include "support/disk_look.h"
 #include "support/files.h"
 #include "support/program.h"
 #include "support/result.h"
@@ -155,6 +156,7 @@ void read_fs_type(LunNode* node) {
   bool known = false;
   if (check_path_exist(partition) == 0) {
     LOG(2, "try to get_fs_type from %s", partition.c_str());
+    const DiskLook look(partition);
     known = sys_get_fs_type(node->fs_type, partition) == 0;
   }
   if (!known) copy_text(node->fs_type, "unknown");

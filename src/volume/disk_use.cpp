@@ -23,8 +23,6 @@ constexpr size_t kMarkedSize = 4096;
 constexpr useconds_t kLookPause = 100000;  // microseconds
 constexpr int kClaimLooks = 10;            // a second
 constexpr int kUdevLooks = 50;             // 5 seconds
-constexpr char kLooks[] = "looks.lock";
-constexpr int kLookWait = 5;  // seconds
 constexpr char kUdev[] = "/run/udev";
 constexpr char kUdevQueue[] = "/run/udev/queue";  // there while events are pending; see udevadm(8), settle
 
@@ -60,14 +58,6 @@ bool is_udev_at(const char* disk) {
 }
 
 }  // namespace
-
-DiskLook::DiskLook() {
-  lock_.take_in_time(kLooks, LockMode::kShared, kLookWait);
-}
-
-DiskLooksHeldOff::DiskLooksHeldOff() {
-  lock_.take_in_time(kLooks, LockMode::kExclusive, kLookWait);
-}
 
 DiskHeld::DiskHeld(const char* partition) {
   const PathText disk("/dev/%s", disk_of_node(partition).c_str());

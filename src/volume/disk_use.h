@@ -5,28 +5,7 @@
 
 #include <cstdint>
 
-#include "support/run_lock.h"
-
 namespace remvol {
-
-// A look at what is on a disk, for which its node is open a moment. Looks go on beside each other.
-class DiskLook {
- public:
-  DiskLook();
-
- private:
-  RunLock lock_;
-};
-
-// While it lives no other run looks at a disk: who ends the users of its node would end that run as one of
-// them. Looks that are under way are waited for, 5 seconds at most.
-class DiskLooksHeldOff {
- public:
-  DiskLooksHeldOff();
-
- private:
-  RunLock lock_;
-};
 
 // Stands for the beginning of a partition; two that differ tell that it was written in between.
 using ContentMark = uint64_t;

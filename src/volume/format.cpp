@@ -8,6 +8,7 @@
 
 #include "frontend/log.h"
 #include "support/coreutils.h"
+#include "support/disk_look.h"
 #include "support/format_semaphore.h"
 #include "support/fuser.h"
 #include "support/session_hold.h"
@@ -129,6 +130,7 @@ bool may_overwrite(const TargetEntry* entry, const char* partition) {
 FormatResult end_users(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
   wait_for_udev(partition);
+  const DiskLooksHeldOff looks(partition);
   if (is_foreign_disk(entry, partition)) return kFormatRefused;
   System("%s", end_users_command(partition).c_str());
   return kGoOn;

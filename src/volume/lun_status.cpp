@@ -1,6 +1,7 @@
 #include "volume/lun_status.h"
 
 #include "frontend/log.h"
+#include "support/disk_look.h"
 #include "support/result.h"
 #include "support/text.h"
 #include "sysaux.h"
@@ -8,7 +9,6 @@
 #include "tree/slots.h"
 #include "tree/status_text.h"
 #include "tree_layout.h"
-#include "volume/disk_use.h"
 #include "volume/mount_point.h"
 
 namespace remvol {
@@ -60,7 +60,7 @@ int write_recognised(const TargetEntry* entry, const LunState& state, const char
 }
 
 bool recognise(const char* node, char* fs_type) {
-  const DiskLook look;
+  const DiskLook look(node);
   return sys_get_fs_type(fs_type, node) == 0;
 }
 

@@ -10,6 +10,7 @@
 #include "frontend/log.h"
 #include "support/command.h"
 #include "support/coreutils.h"
+#include "support/disk_look.h"
 #include "support/files.h"
 #include "support/fuser.h"
 #include "support/result.h"
@@ -48,7 +49,7 @@ void kill_node_users(const TargetEntry* entry) {
   wait_for_udev(entry->mnt_dev);
   LoginsHeldOff logins;
   if (!has_disk(entry->mnt_dev)) logins.begin();
-  const DiskLooksHeldOff looks;
+  const DiskLooksHeldOff looks(entry->mnt_dev);
   if (is_foreign_disk(entry, entry->mnt_dev)) return;
   System("%s", end_node_users_command(entry->mnt_dev).c_str());
 }

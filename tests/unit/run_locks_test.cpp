@@ -4,6 +4,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <csignal>
 #include <cstring>
 #include <filesystem>
@@ -12,12 +13,15 @@
 #include <iterator>
 #include <string>
 
+#include "iscsi/session.h"
+#include "support/disk_look.h"
+#include "support/lun_list.h"
 #include "support/run_lock.h"
 #include "support/session_hold.h"
 #include "support/target_hold.h"
 #include "support/temp_file.h"
 #include "tree/slots.h"
-#include "volume/disk_use.h"
+#include "volume/format.h"
 #include "volume/lun_status.h"
 #include "volume/mount_point.h"
 #include "volume/unmount.h"
@@ -333,10 +337,11 @@ TEST_F(RunLocks, WhoeverLooksAtADiskIsNotEndedAsItsUser) {
   fakes::tree_set({{lun("mnt_dev"), "/dev/sdb1"}});
   copy_text(entry.mnt_dev, "/dev/sdb1");
   start_run([] {
-    const DiskLook look;
+    const DiskLook look("/dev/sdb1");
     stay();
   });
-  { const DiskLook beside; }
+  { const DiskLook beside("/dev/sdb1"); }
+  { const DiskLooksHeldOff another("/dev/sdc1"); }
   EXPECT_TRUE(fakes::calls().empty());
   EXPECT_EQ(Target_LUN_umount(&entry), 0);
   const Texts calls = fakes::calls();
@@ -345,16 +350,56 @@ TEST_F(RunLocks, WhoeverLooksAtADiskIsNotEndedAsItsUser) {
   EXPECT_EQ(calls.back(), "system fuser -mk /dev/sdb1");
 }
 
+TEST_F(RunLocks, AFormatWaitsForLooksBeforeItEndsTheUsers) {
+  store_entry();
+  fakes::otherwise("sys_get_fs_type", "/dev/sdb1").returns(-1);
+  fakes::otherwise("popen").text("");
+  start_run([] {
+    const DiskLook look("/dev/sdb1");
+    stay();
+  });
+  EXPECT_EQ(Target_format(&entry, "/dev/sdb1"), 0);
+  const Texts calls = fakes::calls();
+  const auto end = std::find(calls.begin(), calls.end(), "system fuser -mk \"/dev/sdb1\"");
+  ASSERT_NE(end, calls.end());
+  EXPECT_EQ(std::count(calls.begin(), end, "usleep 20000"), 250);
+}
+
 TEST_F(RunLocks, ADiskWhoseUsersAreEndedIsNotLookedAt) {
   store_entry();
   fakes::tree_set({{lun("enable"), "1"}});
   fakes::on("sys_get_fs_type").returns(-1);
   copy_text(entry.mnt_dev, "/dev/sdb1");
   start_run([] {
-    const DiskLooksHeldOff kept_off;
+    const DiskLooksHeldOff kept_off("/dev/sdb1");
     stay();
   });
   EXPECT_EQ(ktree_update_lun_status(&entry, 0), 0);
+  EXPECT_EQ(fakes::calls({"usleep"}).size(), 250U);
+}
+
+TEST_F(RunLocks, ASearchIsNotEndedAsAUserOfTheDiskThatItFinds) {
+  cover("/dev");
+  std::ofstream("/dev/sdb1") << "";
+  fakes::on("system", fakes::Expression{"^iscsiadm -m session -P 3"}).does([] {
+    const std::string command = fakes::commands().back();
+    const size_t from = command.find('>') + 1;
+    std::ofstream(command.substr(from, command.find(' ', from) - from))
+        << "Target: iqn.t\n\t\tiSCSI Session State: LOGGED_IN\n\t\tHost Number: 7\tState: running\n"
+           "\t\tscsi7 Channel 00 Id 0 Lun: 0\n\t\t\tAttached scsi disk sdb\t\tState: running\n";
+  });
+  fakes::on("sys_get_disk_space").returns(2000000000);
+  fakes::on("sys_get_fs_type").text("ext4").returns(0);
+  start_run([] {
+    const DiskLooksHeldOff kept_off("/dev/sdb1");
+    stay();
+  });
+  LunNode* luns = nullptr;
+  EXPECT_EQ(_get_sess_lun_list(&luns, "iqn.t", [](const char*) { return kOk; }), 0);
+  uncover("/dev");
+  ASSERT_NE(luns, nullptr);
+  EXPECT_EQ(luns->fs_type, std::string("ext4"));
+  lun_node_free_list(luns);
   EXPECT_EQ(fakes::calls({"usleep"}).size(), 250U);
 }
 
