@@ -13,6 +13,7 @@ import os
 import pathlib
 import random
 import select
+import sys
 import time
 
 REPOSITORY = pathlib.Path(__file__).resolve().parents[2]
@@ -27,6 +28,8 @@ def load_lab():
 
 
 lab = load_lab()
+if lab.ARCH:
+    sys.exit("lab: the machine of a torture has this machine's own architecture, not that of LAB_ARCH")
 
 
 class PowerCut(Exception):
