@@ -30,4 +30,6 @@ ends_in_order systemctl stop remvol
 systemctl start remvol
 all_there() { mounted Photos && mounted Music && vvstat; }
 wait_for 60 all_there
+systemctl restart remvol
+wait_for 60 all_there
 expect_equal "warnings and errors after a restart" "" "$(alarms)"
