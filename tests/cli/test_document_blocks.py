@@ -51,6 +51,10 @@ ELSEWHERE = [
         "lab/run -j5 --all": (RUNNER, "lab/run -j$((2 * jobs + 1)) --all"),
         "lab/run --output": ("lab/record-samples", "lab/run --output"),
         "lab/shell": BY_HAND}),
+    ("docs/lab.md", "scripts/install-packages lab a", {
+        "scripts/install-packages": (RUNNER, "install_groups lab armlab"),
+        "scripts/package --arch": (RUNNER, 'scripts/package --arch "$arch"'),
+        "LAB_ARCH=arm64": (RUNNER, "LAB_ARCH=arm64 lab/run lab/demo.sh")}),
     ("docs/lab.md", "scripts/package", {
         "scripts/package": (RUNNER, "scripts/package"), "scripts/test machine": (RUNNER, "layer_machine()"),
         "lab/machine/run bookworm restart": (RUNNER, "lab/machine/run"),
