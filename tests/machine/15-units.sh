@@ -26,10 +26,7 @@ alarms() {
         $(printf -- '-u %s ' remvol remvol-tree remvol-general-tree remvol-events remvol-keeper)
 }
 expect_equal "warnings and errors of ours" "" "$(alarms)"
-systemctl restart remvol
+ends_in_order systemctl restart remvol
 all_there() { mounted Photos && mounted Music && vvstat; }
-wait_for 60 all_there
-ends_in_order systemctl stop remvol
-systemctl start remvol
 wait_for 60 all_there
 expect_equal "warnings and errors after a restart" "" "$(alarms)"
