@@ -12,7 +12,6 @@
 #include "tasks/whole_target.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
-#include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/lun_status.h"
 #include "volume/mount.h"
@@ -50,15 +49,16 @@ void mount_connected_lun(TargetEntry* entry) {
   unmount_if_deleted(entry);
 }
 
-// Mounts the enabled LUNs of the target at `dbidx`, with `entry` as the record for each. Returns 0, or why
-// the last LUN visited could not be asked whether it is enabled.
-int mount_enabled_luns(TargetEntry* entry, int dbidx) {
+// Mounts the enabled LUNs of the target at `dbidx`. Returns 0, or why the last LUN visited could not be asked
+// whether it is enabled.
+int mount_enabled_luns(int dbidx) {
   int result = kOk;
+  TargetEntry volume;
   LunWalk luns(dbidx, LunWalk::kAtUnreadable);
-  while (luns.next(entry)) {
+  while (luns.next(&volume)) {
     int enable = 0;
-    result = ktree_get_lun_enable(&enable, dbidx, entry->lun_db_idx);
-    if (result == kOk && enable == 1) mount_connected_lun(entry);
+    result = ktree_get_lun_enable(&enable, dbidx, volume.lun_db_idx);
+    if (result == kOk && enable == 1) mount_connected_lun(&volume);
   }
   return result;
 }
@@ -75,7 +75,7 @@ int present_volumes(TargetEntry* entry) {
     return kFailed;
   }
   sleep(kSettleSeconds);
-  const int result = mount_enabled_luns(entry, entry->db_idx);
+  const int result = mount_enabled_luns(entry->db_idx);
   (void)ktree_update_status(entry);
   reload_share_services();
   return result;
@@ -122,7 +122,7 @@ int task_connect(const TargetEntry& request) {
   (void)ktree_record_connect_set(&entry);
   (void)ktree_set_connect_state(entry.db_idx, kConnected);
   const int result = present_volumes(&entry);
-  if (!HeldSlot(entry.db_idx)) (void)Target_Logout(&entry);  // deleted meanwhile
+  log_out_if_deleted(&entry);
   LOG(2, "end, ret = %d", result);
   return result;
 }

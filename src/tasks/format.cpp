@@ -98,6 +98,7 @@ void reconnect(TargetEntry* entry, int conn_set) {
   (void)ktree_update_dev(entry);
   sleep(kSettleSeconds);
   (void)Target_mount_all_lun(entry, 0, 1);
+  log_out_if_deleted(entry);
 }
 
 }  // namespace

@@ -52,7 +52,9 @@ int search_luns(const char* socket, TargetEntry* target) {
   bool logged_in = false;
   int result = open_session(socket, target, connected, &logged_in);
   if (result == kOk) result = publish_luns(socket, name, _create_device_node);
-  if (logged_in) (void)_target_disconnect(target);
+  // A run that brings the target up for longer than this one could wait needs the session.
+  const bool is_needed = hold && hold->given_up();
+  if (logged_in && !is_needed) (void)_target_disconnect(target);
   return result;
 }
 

@@ -73,6 +73,7 @@ bool load_connected_target(TargetEntry* entry, int* result) {
   }
   sleep(kSettleSeconds);
   (void)Target_mount_all_lun(entry, 0, 0);
+  log_out_if_deleted(entry);
   return true;
 }
 
@@ -107,6 +108,10 @@ int Target_Logout(TargetEntry* entry) {
   entry->conn_set = 0;
   (void)ktree_set_connect_state(entry->db_idx, kDisconnected);
   return result;
+}
+
+void log_out_if_deleted(TargetEntry* entry) {
+  if (!HeldSlot(entry->db_idx)) (void)Target_Logout(entry);
 }
 
 void give_up_session(TargetEntry* entry, int reason, VolumeState state) {

@@ -11,6 +11,10 @@ namespace remvol {
 // command failed.
 [[nodiscard]] int Target_Logout(TargetEntry* entry);
 
+// Logs out a target that was deleted while this run brought it up: the run that deleted it may have found no
+// session yet.
+void log_out_if_deleted(TargetEntry* entry);
+
 // Gives up a login whose session shows no disk that could be mounted: logs out, stores that the target stays
 // disconnected and `state` for all its LUNs. `reason` is the result of ktree_update_dev; it and the outcome
 // are logged in the innermost scope's name.

@@ -75,6 +75,18 @@ class TestConnect:
         )
         assert stored.mounted("a") and stored.mounted("b")
 
+    def test_a_target_that_is_deleted_meanwhile_is_logged_out_alone(self, stored, box):
+        """An empty name would be every target's."""
+        stored.store("iqn.t2", slot=2, conn_set=1, luns=[("other", 0)])
+        stored.offer("iqn.t2", {0: "sdd"})
+        stored.log_in("iqn.t2")
+        stored.disk("sdb")
+        box.hook("system", 'mount -t ext4 /dev/sdb1 "/mnt/VV/a"', through=True, times=1,
+                 effect="ktreec -S /var/run/ktree_sock_vv -d /iscsi/initiator/id:1")
+        connect(box)
+        assert stored.sessions() == ["iqn.t2"]
+        assert [line for line in box.shell() if "--logout" in line] == [LOGOUT]
+
     def test_it_ends_connected_in_every_key(self, stored, box):
         stored.disk("sdb")
         stored.disk("sdc")

@@ -302,7 +302,9 @@ static int do_iscsiadm(char** argv) {
   } else if (login) {
     status = log_in(target_number(argv));
   } else if (has(argv, "--logout")) {
-    status = log_out(target_number(argv));
+    /* An empty name is every session's. */
+    const char* name = option(argv, "-T");
+    status = name != NULL && name[0] == '\0' ? log_out_all() : log_out(target_number(argv));
   } else if (has(argv, "-u")) {
     status = log_out_all();
   } else if (option(argv, "-o") != NULL) {

@@ -45,7 +45,9 @@ case "$*" in
     [ ! -e "refused/$name" ] || { echo 'iscsiadm: Could not login' >&2; exit "$(cat "refused/$name")"; }
     [ -e "details/$name" ] || exit 8
     : >"on/$name" ;;
-*--logout) rm "on/$(named "$@")" 2>/dev/null || exit 21 ;;
+*--logout)
+    name=$(named "$@")
+    if [ "$name" ]; then rm "on/$name"; else rm on/*; fi 2>/dev/null || exit 21 ;;  # an empty name is every session's
 esac
 """
 
