@@ -101,6 +101,7 @@ int task_add(const TargetEntry& request) {
   (void)ktree_update_status(&entry);
 
   const TargetHold hold(entry.target_name, entry.lun);
+  if (!HeldSlot(dbidx, lun_dbidx)) return kFailed;  // deleted meanwhile
   int result = kOk;
   if (check_target_connected(entry.target_name) == kNotLoggedIn) {
     (void)Target_Config_Gen(&entry);  // no login: the volume is mounted when the target is next connected

@@ -208,6 +208,20 @@ class TestOneAfterAnother:
         assert not stored.mounted("a") and not stored.logged_in("iqn.t1")
         assert (stored.target("conn_set"), stored.target("conn_state")) == ("0", "0")
 
+    def test_an_addition_that_waits_for_the_deletion_of_its_target_fails(self, stored, box):
+        assert box.remvol("--connect", "-n", "iqn.t1").status == 0
+        before = len(box.shell())
+        meet(box, "system", 'iscsiadm -m node -T "iqn.t1" --logout')
+        deletion = box.start(["remvol", "--del", "-n", "iqn.t1"])
+        until(lambda: is_there(box))
+        addition = box.start(["remvol", "--add", "-n", "iqn.t1", "-l", "1", "-i", "10.9.0.2", "-p", "3260", "-s", "b", "-c", "0"])
+        until(lambda: stored.lun("enable", 2) == "1")
+        go_on(box)
+        assert deletion.wait().status == 0
+        assert addition.wait().status == 255
+        assert stored.target("target") is None
+        assert not any("-o new" in line for line in box.shell()[before:])
+
     def test_settings_are_dumped_by_one_run_at_a_time(self, stored, box):
         box.hook("ktreec_dump", through=True, effect=held(box, "settings.lock"))
         status(box)
