@@ -103,7 +103,7 @@ def difference(good, seen, output=""):
             continue
         if key == "settings":
             if seen[key] != seen["now"]:  # else it is the tree that differs
-                said = re.search(r"(?m)^(\(|remvol: ).*(dump|saved|settings|vv\.xml)", output)
+                said = re.search(r"(?m)^(\(|remvol: ).*(dump|saved|settings|vv\.xml|is kept as it is)", output)
                 texts.append(f"settings differ{' (said)' if said else ''}")
         elif key != "now":
             texts.append(f"{key}: {seen.get(key)} for {good.get(key)}")
