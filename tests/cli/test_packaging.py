@@ -388,6 +388,33 @@ def test_the_unit_starts_with_the_saved_settings_or_their_copy(bare_box, saved, 
     assert box.path("/etc/NAS_CFG/vv.xml.damaged").exists() == (saved is not None and loaded != "saved")
 
 
+# --- purge ---
+
+
+def purge(box):
+    return box.run(["sh", PACKAGING.parent / "debian/remvol.postrm", "purge"], env={"LD_PRELOAD": None})
+
+
+def test_a_purge_leaves_no_settings(bare_box):
+    """Also not those that a program wrote when it was killed: all of them have secrets."""
+    for name in ("vv.xml", "vv.xml.damaged", "vv.xml.77.tmp"):
+        bare_box.write(f"/etc/NAS_CFG/{name}", settings("saved"))
+    for name in ("vv.xml", ".vv.xml.77.kept", ".vv.xml.78.new"):
+        bare_box.write(f"/usr/local/config/{name}", settings("copy"))
+    done = purge(bare_box)
+    assert (done.status, done.stdout, done.stderr) == (0, "", "")
+    for folder in ("/etc/NAS_CFG", "/usr/local/config"):
+        assert not bare_box.path(folder).exists()
+    assert purge(bare_box).status == 0
+
+
+def test_a_purge_leaves_what_is_somebody_elses(bare_box):
+    bare_box.write("/usr/local/config/other.xml", "")
+    bare_box.write("/usr/local/config/.vv.xmlx", "")
+    assert purge(bare_box).status == 0
+    assert sorted(path.name for path in bare_box.path("/usr/local/config").iterdir()) == [".vv.xmlx", "other.xml"]
+
+
 # --- units ---
 
 # Each of these gives a unit a mount namespace of its own, systemd.exec(5): what it mounts is seen by nobody else.
