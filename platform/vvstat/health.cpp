@@ -68,11 +68,12 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume, bool wo
   const std::string format = vv_command("format --destroy-data", volume.share);
   if (volume.format_state == remvol::kFormatFailed) {
     return {Ailment::kFailed, "Format Failed", "its format failed",
-            "look at the storage server and the kernel's log", format};
+            "look at the storage server and the kernel's log; a new format destroys what is on the disk",
+            format};
   }
   if (volume.volume_state == remvol::kVolumeUnsupported) {
     return {Ailment::kFailed, "Unsupported", "what is on its disk cannot be mounted here",
-            "the data is left as it is; this destroys it", format};
+            "the data is left as it is; a new format destroys it", format};
   }
   if (volume.volume_state == remvol::kVolumeFailed) {
     return {Ailment::kFailed, "Failed", "its partition, format or mount failed",

@@ -780,6 +780,8 @@ def test_a_format_that_fails_says_so(machine):
     assert done.status == 1
     assert "vv: Photos is not mounted as it should be\n  step: format\n  why:  no file system could be made on it\n" in done.stderr
     assert "  said: dd: error writing '/dev/sdb1': Input/output error\n" in done.stderr
+    machine.box.hook("sys_get_fs_type", "/dev/sdb1", out="reiserfs", first=True)
+    assert "  try:  the data is left as it is; a new format destroys it\n" in machine.vv("connect", "Photos").stderr
 
 
 def test_a_target_is_not_formatted(machine):

@@ -203,6 +203,15 @@ def test_a_volume_that_is_not_mounted(example, values, status, problem, command)
     assert volumes(example)[0]["size"] is None
 
 
+@pytest.mark.parametrize("values", [{"format_state": "3"}, {"volume_state": "5"}])
+def test_what_formats_says_that_it_destroys(example, values):
+    """The command that stands below is made to be copied."""
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    change(example, {f"lun/id:1/{key}": value for key, value in values.items()})
+    told = volumes(example)[0]
+    assert told["command"] == FORMAT and "; a new format destroys " in told["advice"]
+
+
 @contextlib.contextmanager
 def a_run_works(box, target, how=fcntl.LOCK_EX):
     """What a run of the tool does while it works on a target."""
