@@ -50,8 +50,8 @@ int exit_status(const Snapshot& look) {
 }
 
 const char* why_unreachable() {
-  return geteuid() == 0 ? "vvstat: the configuration tree cannot be reached\n"
-                        : "vvstat: only root may read the configuration tree\n";
+  if (geteuid() != 0) return "vvstat: only root may read the configuration tree\n";
+  return "vvstat: the configuration tree cannot be reached; see systemctl status remvol-tree\n";
 }
 
 std::vector<Row> ailing_among(const std::vector<Row>& rows) {
@@ -117,6 +117,16 @@ int show_metrics() {
   return finish(exit_status(seen));
 }
 
+// Names that would have been one, for a message.
+std::string names_in(const Snapshot& look) {
+  std::string names;
+  for (const Row& row : look.rows) {
+    if (row.volume != nullptr) names += ", " + row.volume->share;
+  }
+  for (const Target& target : look.status.targets) names += ", " + target.name;
+  return names.empty() ? "none is configured" : "there are: " + names.substr(2);
+}
+
 // Everything of the volume of that share, or of all volumes of that target.
 int show_one(const PageOptions& options) {
   const bool is_block = options.layout.form == Form::kTable;
@@ -132,7 +142,8 @@ int show_one(const PageOptions& options) {
     }
   }
   if (rows.empty()) {
-    fprintf(stderr, "vvstat: there is no share and no target of this name\n");
+    fprintf(stderr, "vvstat: there is no share or target \"%s\"; %s\n",
+            platform::printable(options.name).c_str(), platform::printable(names_in(seen)).c_str());
     return kFailed;
   }
   const std::vector<Row> shown = options.ailing_only ? ailing_among(rows) : rows;
@@ -173,8 +184,9 @@ constexpr char kHelp[] =
     "  -V, --version       the version\n"
     "Columns:\n";
 constexpr char kStatusHelp[] =
-    "Exit status: 0 all that is wanted is healthy, 1 something is not, 2 wrong usage\n"
-    "or the output cannot be written, 3 the configuration tree cannot be reached.\n";
+    "Exit status: 0 all that is wanted is healthy, 1 something is not, 2 wrong usage,\n"
+    "no such share or target, or the output cannot be written, 3 the configuration\n"
+    "tree cannot be reached.\n";
 
 constexpr option kLongOptions[] = {{"unhealthy", no_argument, nullptr, 'x'},
                                    {"watch", no_argument, nullptr, 'w'},
@@ -246,16 +258,25 @@ bool asks_for_more(const PageOptions& options) {
          layout.bytes || !layout.headings || !layout.columns.empty();
 }
 
+// What of the command line does not go together; empty when all of it does. `second` is a word behind the
+// name, or null.
+std::string conflict(const PageOptions& options, const char* second) {
+  if (options.metrics && asks_for_more(options)) return "--prometheus goes with no other option and no name";
+  if (second != nullptr) return "one name at a time: \"" + platform::printable(second) + "\" is a second one";
+  const bool is_watched = options.watch && options.name != nullptr;
+  return is_watched ? "--watch shows all volumes: it goes with no name" : "";
+}
+
 int take_arguments(int argc, char** argv, PageOptions& options) {
   for (int letter; (letter = getopt_long(argc, argv, "xwo:bnrJPhV", kLongOptions, nullptr)) != -1;) {
     const int status = take_option(letter, options);
     if (status != kGoOn) return status;
   }
   if (optind < argc) options.name = argv[optind++];
-  return optind == argc && !(options.metrics && asks_for_more(options)) &&
-                 !(options.watch && options.name != nullptr)
-             ? kGoOn
-             : wrong_usage();
+  const std::string why = conflict(options, argv[optind]);
+  if (why.empty()) return kGoOn;
+  fprintf(stderr, "vvstat: %s\n", why.c_str());
+  return wrong_usage();
 }
 
 // Colour for a terminal, unless NO_COLOR asks for none (no-color.org).

@@ -220,7 +220,7 @@ def test_promtool_accepts_the_rules_of_the_monitoring_guide(tmp_path):
 
 @pytest.mark.parametrize("wanted, status, line", [
     ("0", 0, "VOLUMES OK - nothing is wanted, as of "), ("1", 2, "VOLUMES CRITICAL - 1 of 1 needs attention, as of "),
-    (None, 3, "VOLUMES UNKNOWN - vvstat: the configuration tree cannot be reached")])
+    (None, 3, "VOLUMES UNKNOWN - vvstat: the configuration tree cannot be reached; see systemctl status remvol-tree")])
 def test_the_check_of_the_monitoring_guide(box, wanted, status, line):
     check = box.write("/check_remvol", block(DOCS / "monitoring.md", "sh"), mode=0o755)
     assert check

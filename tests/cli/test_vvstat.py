@@ -116,7 +116,7 @@ def test_without_the_tree(box):
     for options in ([], ["--json"], ["-x"], ["Backup"]):
         done = vvstat(box, *options)
         assert (done.status, done.stdout) == (3, "")
-        assert done.stderr == "vvstat: the configuration tree cannot be reached\n"
+        assert done.stderr == "vvstat: the configuration tree cannot be reached; see systemctl status remvol-tree\n"
 
 
 def test_somebody_who_may_not_read_the_tree_is_told(example):
@@ -710,8 +710,15 @@ def test_one_share_counts_alone(example):
 
 
 def test_a_name_that_is_not_there(example):
-    done = vvstat(example, "Nowhere")
-    assert (done.status, done.stdout, done.stderr) == (2, "", "vvstat: there is no share and no target of this name\n")
+    for options in ([], ["--json"]):
+        done = vvstat(example, *options, "No\x1bwhere")
+        assert (done.status, done.stdout) == (2, "")
+        assert done.stderr == ('vvstat: there is no share or target "No\\x1Bwhere"; '
+                               f"there are: Backup, Fotos 日本, {T1_NAME}, iqn.t2\n")
+
+
+def test_a_name_where_none_is(box):
+    assert vvstat(box, "Nowhere").stderr == 'vvstat: there is no share or target "Nowhere"; none is configured\n'
 
 
 LONG_VALUES = {f"{T1}/target": LONG_NAME, f"{T1}/lun/id:1/share": "s" * 80, f"{T1}/ip": "[fe80::1234:5678:9abc:def0]",
@@ -809,6 +816,23 @@ def test_the_usual_options(bare_box, options, status):
     assert done.status == status
     told, silent = (done.stdout, done.stderr) if status == 0 else (done.stderr, done.stdout)
     assert told and not silent
+
+
+@pytest.mark.parametrize("options, said", [
+    (["-w", "Backup"], "--watch shows all volumes: it goes with no name"),
+    (["--watch", "--json", "Backup"], "--watch shows all volumes: it goes with no name"),
+    (["-P", "-x"], "--prometheus goes with no other option and no name"),
+    (["-P", "Backup"], "--prometheus goes with no other option and no name"),
+    (["Backup", "Photos"], 'one name at a time: "Photos" is a second one'),
+    (["-J", "a", "\x1b", "c"], 'one name at a time: "\\x1B" is a second one')])
+def test_what_does_not_go_together_is_said(bare_box, options, said):
+    done = vvstat(bare_box, *options)
+    assert (done.status, done.stdout, done.stderr) == (2, "", f"vvstat: {said}\nTry 'vvstat --help'.\n")
+
+
+def test_the_help_names_every_reason_of_a_status(bare_box):
+    text = " ".join(vvstat(bare_box, "--help").stdout.split())
+    assert "2 wrong usage, no such share or target, or the output cannot be written," in text
 
 
 @pytest.mark.parametrize("options", [[], ["--json"], ["Backup"], ["--help"], ["--watch"]])
