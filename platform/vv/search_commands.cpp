@@ -96,6 +96,7 @@ int discover(const Options& options) {
   Portal portal;
   std::string why;
   std::vector<std::string> names;
+  if (!job.can_look()) return job.end();
   if (!read_portal(options.name, portal, why)) {
     job.refuse(kUsage, platform::printable(why));
     return job.end();
@@ -110,6 +111,7 @@ int discover(const Options& options) {
 
 int luns(const Options& options) {
   Job job(options);
+  if (!job.can_look()) return job.end();
   const Row* share = job.before.share(options.name);
   const std::string name = share != nullptr ? share->target->name : options.name;
   Portal portal;

@@ -180,11 +180,13 @@ def test_what_is_no_portal_is_refused(machine, words, portal):
 
 def test_without_the_tree(machine):
     machine.tree.stop()
-    for command in (["connect", "Photos"], ["disconnect", "Photos"], ["add", "Photos", "--portal", "10.9.0.2", "--lun", "1"]):
+    for command in (["connect", "Photos"], ["disconnect", "Photos"], ["add", "Photos", "--portal", "10.9.0.2", "--lun", "1"],
+                    ["luns", "Photos"], ["luns", T1, "--portal", "10.9.0.2"], ["discover", "10.9.0.2"]):
         done = machine.vv(*command)
         assert (done.status, done.stdout) == (3, "")
         assert done.stderr == "vv: the configuration tree cannot be reached; see systemctl status remvol-tree\n"
         assert machine.says(*command)[0] == 3
+    assert not machine.box.shell()
 
 
 def test_without_the_general_tree(machine):
@@ -196,9 +198,10 @@ def test_without_the_general_tree(machine):
 
 
 def test_somebody_who_is_not_root_is_told(machine):
-    done = machine.box.run(["/usr/bin/setpriv", "--reuid=65534", "--regid=65534", "--clear-groups", "vv", "connect", "x"],
-                           env={"LD_PRELOAD": None})
-    assert (done.status, done.stderr) == (3, "vv: only root may do this\n")
+    for command in ("connect", "luns"):
+        done = machine.box.run(["/usr/bin/setpriv", "--reuid=65534", "--regid=65534", "--clear-groups", "vv", command, "x"],
+                               env={"LD_PRELOAD": None})
+        assert (done.status, done.stderr) == (3, "vv: only root may do this\n")
 
 
 @pytest.mark.native
