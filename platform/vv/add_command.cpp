@@ -2,6 +2,7 @@
 #include "shares/share_name.h"
 #include "tree_layout.h"
 #include "vv/job.h"
+#include "vv/list.h"
 #include "vv/search_commands.h"
 #include "vv/volume_commands.h"
 
@@ -50,15 +51,21 @@ bool choose_target(Job& job, const Portal& portal, std::string& target) {
   return job.refuse(kUsage, message);
 }
 
+// What would do in place of a portal.
+std::string other_place(const Job& job) {
+  std::string names;
+  for (const Target& target : job.before.targets()) append(names, platform::printable(target.name));
+  return names.empty() || !job.options.target.empty() ? "for a target that is not configured yet"
+                                                      : "or --target with one that is configured: " + names;
+}
+
 // Fills portal and target from the options, the tree and, if need be, the portal itself.
 bool find_place(Job& job, Portal& portal, std::string& target) {
   const Options& options = job.options;
   const Target* stored = options.target.empty() ? nullptr : job.before.target(options.target);
   target = options.target;
   if (options.portal.empty()) {
-    if (stored == nullptr) {
-      return job.refuse(kUsage, "add needs --portal, for a target that is not configured yet");
-    }
+    if (stored == nullptr) return job.refuse(kUsage, "add needs --portal, " + other_place(job));
     portal = stored_portal(stored->address, stored->port);
     return true;
   }

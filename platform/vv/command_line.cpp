@@ -123,24 +123,26 @@ bool read_lun(std::string_view text, int& lun, std::string& why) {
   return false;
 }
 
-bool take_text(const char* argument, std::string& field, std::string& why) {
-  if (argument[0] == '\0') why = "the value of an option is empty";
-  field = argument;
-  return argument[0] != '\0';
+bool take_text(int letter, std::string& field, std::string& why) {
+  field = optarg;
+  for (const OptionRow& row : option_rows()) {
+    if (field.empty() && row.letter == letter) why = std::string("the value of --") + row.name + " is empty";
+  }
+  return !field.empty();
 }
 
 bool take_option(int letter, Options& options, std::string& why) {
   switch (letter) {
     case kPortalOption:
-      return take_text(optarg, options.portal, why);
+      return take_text(letter, options.portal, why);
     case kTargetOption:
-      return take_text(optarg, options.target, why);
+      return take_text(letter, options.target, why);
     case kLunOption:
       return read_lun(optarg, options.lun, why);
     case kUserOption:
-      return take_text(optarg, options.user, why);
+      return take_text(letter, options.user, why);
     case kPasswordFileOption:
-      return take_text(optarg, options.password_file, why);
+      return take_text(letter, options.password_file, why);
     case kPasswordOption:
       why = "a password is never an argument, others could see it: --password-file FILE";
       return false;
@@ -201,6 +203,14 @@ int read_words(int argc, char** argv, Options& options, std::string& why) {
   return fits(options, given, why) ? kGoOn : kUsage;
 }
 
+// What is wrong with a line that does not begin with a command.
+std::string why_no_command(int argc, char** argv) {
+  if (argc > 1 && argv[1][0] != '-') return with_quoted("there is no command", argv[1]);
+  const auto is_command = [](const char* word) { return find_command(word) != nullptr; };
+  return std::any_of(argv + 1, argv + argc, is_command) ? "the command comes first, options behind it"
+                                                        : "a command is missing";
+}
+
 }  // namespace
 
 int read_options(int argc, char** argv, Options& options) {
@@ -215,12 +225,10 @@ int read_options(int argc, char** argv, Options& options) {
   }
   const bool json = asks_for_json(argc, argv);
   options.command = argc > 1 ? find_command(argv[1]) : nullptr;
-  std::string why = "a command is missing";
   if (options.command == nullptr) {
-    if (argc > 1 && argv[1][0] != '-') why = with_quoted("there is no command", argv[1]);
-    return wrong_usage(platform::printable(argc > 1 ? argv[1] : ""), why, json);
+    return wrong_usage(platform::printable(argc > 1 ? argv[1] : ""), why_no_command(argc, argv), json);
   }
-  why.clear();
+  std::string why;
   options.rest = argv + 2;
   if (options.command->argument == nullptr) return kGoOn;
   const int status = read_words(argc - 1, argv + 1, options, why);

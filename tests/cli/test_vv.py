@@ -131,7 +131,8 @@ def test_version(box):
     (["add", "a", "--lun"], 'an argument is missing after the option "--lun"'),
     (["add", "a", "--lun", "1x"], 'no number of a LUN: "1x"'),
     (["add", "a", "--lun", "-1"], "no number of a LUN"), (["add", "a", "--lun", "99999"], "no number of a LUN"),
-    (["add", "a", "--lun", ""], "no number of a LUN"), (["luns", "a", "--portal", ""], "the value of an option is empty"),
+    (["add", "a", "--lun", ""], "no number of a LUN"), (["luns", "a", "--portal", ""], "the value of --portal is empty"),
+    (["luns", "a", "--user="], "the value of --user is empty"),
     (["luns", "a", "--password-file", "f"], "--password-file needs --user"),
     (["luns", "a", "--user", "u", "--password", "secret"], "a password is never an argument"),
     (["luns", "a", "--user", "u", "--password=secret"], "a password is never an argument"),
@@ -153,6 +154,15 @@ def test_what_is_no_command_at_all_as_json(box):
     done = box.run(["vv", "", "--json"])
     jsonschema.validate(json.loads(done.stdout), SCHEMA)
     assert done.status == 2 and json.loads(done.stdout)["outcomes"][0]["command"] is None
+
+
+def test_the_command_comes_first(box):
+    told = json.loads(box.run(["vv", "--json", "status"]).stdout)
+    jsonschema.validate(told, SCHEMA)
+    assert told["outcomes"][0]["message"] == "the command comes first, options behind it"
+    done = box.run(["vv", "--yes", "delete", "Photos"])
+    assert (done.status, done.stderr) == (2, "vv: the command comes first, options behind it\nTry 'vv --help'.\n")
+    assert box.run(["vv", "--yes", "Photos"]).stderr.startswith("vv: a command is missing\n")
 
 
 def test_an_option_that_takes_no_value(box):
@@ -477,6 +487,15 @@ def test_the_ninth_volume_is_refused(machine):
 
 def test_add_without_a_portal_of_a_new_target(machine, words):
     done = machine.vv("add", "Photos", "--lun", "1", "--target", T1)
+    assert (done.status, done.stderr) == (2, "vv: add needs --portal, for a target that is not configured yet\n")
+    assert words() == []
+
+
+def test_add_without_a_portal_and_a_target(photos, words):
+    done = photos.vv("add", "Music", "--lun", "2")
+    assert (done.status, done.stderr) == (2, f"vv: add needs --portal, or --target with one that is configured: {T1}\n")
+    photos.tree.set(f"{INITIATOR}/id:1/target", "")
+    done = photos.vv("add", "Music", "--lun", "2")
     assert (done.status, done.stderr) == (2, "vv: add needs --portal, for a target that is not configured yet\n")
     assert words() == []
 
