@@ -44,7 +44,7 @@ bool choose_target(Job& job, const Portal& portal, std::string& target) {
     return true;
   }
   std::string message = "the portal " + portal.text();
-  message += names.empty() ? " offers no target to this machine" : " offers several targets, name one";
+  message += names.empty() ? " offers no target to " + this_machine() : " offers several targets, name one";
   for (const std::string& name : names) {
     message += "\n  --target " + platform::printable(vvstat::quoted(name));
   }
@@ -102,9 +102,9 @@ int tell_added(Job& job, const std::string& target, const ToolRun& run) {
   const std::string name = platform::printable(share);
   const Look after;
   const Row* row = after.share(share);
-  if (row == nullptr) return job.failed(name + " was not added", explain_run(run, kStoreStep));
+  if (row == nullptr) return job.failed(name + " was not added", job.explain(run, kStoreStep));
   if (!row->session.empty()) return job.tell_brought_up(target, share, run);
-  if (!run.succeeded()) return job.failed(name + " was not added", explain_run(run, kStoreStep));
+  if (!run.succeeded()) return job.failed(name + " was not added", job.explain(run, kStoreStep));
   return job.done(name + " is added: LUN " + std::to_string(row->volume->lun) + " of " +
                   platform::printable(target) +
                   "\nconnect it: " + platform::printable(vvstat::vv_command("connect", share)));

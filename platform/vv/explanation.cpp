@@ -22,6 +22,9 @@ constexpr struct {
   const char* advice;
   const char* step = nullptr;  // that failed, where this tells it; what else was said matters then
 } kReasons[] = {
+    {"SendTargets discovery: iSCSI login failed due to authorization",
+     "the portal wants a user and a password before it names its targets",
+     "have the storage server name them without; vv luns, and vv add with --target, need no discovery"},
     {"authorization", "the target refused the user name or the password",
      "set those of the storage server: vv password SHARE --user NAME"},
     {"Connection refused", "the storage server's machine answers, but nothing listens at that port",
@@ -33,13 +36,13 @@ constexpr struct {
     {" timed out", "the storage server does not answer",
      "look at the address, the cable and the storage server"},
     {"No portals found", "the portal offers no target to this machine",
-     "see whether the storage server lets this initiator in"},
+     "see whether the storage server lets MACHINE in"},
     {"target likely not connected", "the target is not connected", ""},
     {"could not connect to iscsid", "the initiator's daemon does not run",
-     "start it: systemctl start remvol; see journalctl -u remvol-keeper"},
+     "systemctl start remvol && systemctl restart remvol-keeper; see journalctl -u remvol-keeper"},
     {"iSCSI driver not found", "the kernel has no iSCSI", "/usr/lib/remvol/modules says what is missing"},
     {"non-retryable iSCSI login failure", "the storage server refused the login",
-     "see whether the target is still there, and lets this initiator in"},
+     "see whether the target is still there, and lets MACHINE in"},
     {"No records found", "the target's record could not be made",
      "look at the target's name and at the initiator's records: /etc/iscsi/nodes, /var/lib/iscsi/nodes"},
     {"is not the disk of", "the disk's name is another disk's by now", "connect it again"},
@@ -146,7 +149,7 @@ Failure explain_volume(const Row& row, std::string_view output) {
   failure.why = row.volume->enabled ? "its target was logged in to, but showed no disk of it"
                                     : "it is switched off in the settings";
   if (row.volume->enabled) {
-    failure.advice = "see whether the storage server still offers its LUN, and to this initiator";
+    failure.advice = "see whether the storage server still offers its LUN, and to MACHINE";
   }
   return failure;
 }

@@ -17,8 +17,9 @@ struct Failure {
   std::vector<std::string> details;  // lines of the tool and of the kernel, as they came
 };
 
-// Stands in an advice for the name of the share.
-inline constexpr char kShareToName[] = "SHARE";
+// What stands in an advice for a name that is known where it is told: of the share, of the portal, and of
+// this machine as an initiator. One advice has one of them.
+inline constexpr char kShareToName[] = "SHARE", kPortalToName[] = "PORTAL", kMachineToName[] = "MACHINE";
 
 // The steps that can fail, as they are named.
 inline constexpr char kDiscoveryStep[] = "discovery", kLoginStep[] = "login", kLunsStep[] = "LUN search",

@@ -29,6 +29,22 @@ bool is_up(const Row& row) {
   return row.mounted && row.healthy() && row.session == kLoggedIn;
 }
 
+std::string shown_word(const std::string& name) {
+  return platform::printable(vvstat::quoted(name));
+}
+
+constexpr struct {
+  std::string_view stands;  // in an advice
+  std::string (*name)(const Options& options);
+} kNames[] = {
+    {kShareToName, [](const Options& options) { return shown_word(options.name); }},
+    {kPortalToName,
+     [](const Options& options) {
+       return shown_word(options.portal.empty() ? options.name : options.portal);
+     }},
+    {kMachineToName, [](const Options&) { return this_machine(); }},
+};
+
 }  // namespace
 
 std::string why_unreachable(const char* tree, const char* unit) {
@@ -36,7 +52,12 @@ std::string why_unreachable(const char* tree, const char* unit) {
   return std::string("the ") + tree + " tree cannot be reached; see systemctl status " + unit;
 }
 
-Failure explain_run(const ToolRun& run, const char* step) {
+std::string this_machine() {
+  const std::string name = initiator_name();
+  return name.empty() ? "this machine" : "this machine (" + platform::printable(name) + ")";
+}
+
+Failure Job::explain(const ToolRun& run, const char* step) const {
   if (!run.started) return {kToolStep, "remvol cannot be run", "see whether it is installed", {}};
   Failure failure = explain_output(run.output, step);
   if (run.signal != 0) {
@@ -44,6 +65,16 @@ Failure explain_run(const ToolRun& run, const char* step) {
     failure.advice = "vv status shows how things are now";
   } else if (failure.why.empty() && !failure.details.empty()) {
     failure.why = failure.details.back();
+  }
+  return with_name(failure);
+}
+
+Failure Job::with_name(Failure failure) const {
+  for (const auto& [stands, name] : kNames) {
+    const size_t place = failure.advice.find(stands);
+    if (place == std::string::npos) continue;
+    failure.advice.replace(place, stands.size(), name(options));
+    break;
   }
   return failure;
 }
@@ -118,12 +149,6 @@ int Job::done(const std::string& message) {
 
 int Job::failed(const std::string& message, const Failure& failure) {
   refuse(kFailed, message, failure);
-  std::string& advice = outcome_.failure.advice;
-  const size_t name = advice.find(kShareToName);
-  if (name != std::string::npos && !options.name.empty()) {
-    advice.replace(name, std::string_view(kShareToName).size(),
-                   platform::printable(vvstat::quoted(options.name)));
-  }
   return end();
 }
 
@@ -132,7 +157,7 @@ int Job::end() {
 }
 
 int Job::tell_not_up(const Row& ailing, const ToolRun& run) {
-  Failure failure = explain_volume(ailing, run.output);
+  Failure failure = with_name(explain_volume(ailing, run.output));
   for (const std::string& message : kernel_.messages_of(ailing.volume->device)) {
     failure.details.push_back("kernel: " + message);
   }
@@ -144,11 +169,11 @@ int Job::tell_brought_up(const std::string& target_name, const std::string& shar
   outcome_.share = share;
   const std::string name = platform::printable(share.empty() ? target_name : share);
   if (!run.started || run.signal != 0) {
-    return failed(name + " was not brought up", explain_run(run, kToolStep));
+    return failed(name + " was not brought up", explain(run, kToolStep));
   }
   const Look after;
   const Target* now = after.target(target_name);
-  if (now == nullptr) return failed(name + " was deleted meanwhile", explain_run(run, kStoreStep));
+  if (now == nullptr) return failed(name + " was deleted meanwhile", explain(run, kStoreStep));
   std::string message;
   for (const Row* each : after.volumes_of(*now)) {
     if (share.empty() ? !each->volume->enabled : each->volume->share != share) continue;
@@ -156,7 +181,7 @@ int Job::tell_brought_up(const std::string& target_name, const std::string& shar
     append(message, up_message(*each), "\n");
   }
   if (!run.succeeded() || !after.in_use(target_name)) {
-    return failed(name + " was not brought up", explain_run(run, kLoginStep));
+    return failed(name + " was not brought up", explain(run, kLoginStep));
   }
   return done(message.empty() ? name + " is connected" : message);
 }

@@ -36,6 +36,9 @@ class Job {
   // Runs the tool, and shows how it gets on with the target.
   ToolRun run(const Arguments& arguments, const std::string& target_name);
 
+  // What a run of the tool that failed is put down to: its output, or how it ended.
+  Failure explain(const ToolRun& run, const char* step) const;
+
   // Keeps how the command ends, and returns false.
   bool refuse(int status, const std::string& message, const Failure& failure = {});
 
@@ -53,6 +56,7 @@ class Job {
 
  private:
   int tell_not_up(const vvstat::Row& ailing, const ToolRun& run);
+  Failure with_name(Failure failure) const;
 
   Outcome outcome_;
   std::vector<std::string> warnings_;  // of the run
@@ -62,8 +66,8 @@ class Job {
 // Why the tree cannot be read, for a message.
 std::string why_unreachable(const char* tree, const char* unit);
 
-// What a run of the tool that failed is put down to: its output, or how it ended.
-Failure explain_run(const ToolRun& run, const char* step);
+// "this machine", with the name that a storage server knows it by.
+std::string this_machine();
 
 }  // namespace vv
 

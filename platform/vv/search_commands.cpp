@@ -69,7 +69,7 @@ bool is_lost(const Look& look, const std::string& name) {
 }
 
 int tell_luns_failed(Job& job, const FoundLuns& found, const ToolRun& run) {
-  Failure failure = explain_run(run, found.login_failed ? kLoginStep : kLunsStep);
+  Failure failure = job.explain(run, found.login_failed ? kLoginStep : kLunsStep);
   if (run.output.find("authorization") != std::string::npos) {
     failure.advice = "give those of the storage server: --user NAME, and --password-file FILE";
   }
@@ -85,7 +85,7 @@ bool discover_targets(Job& job, const Portal& portal, std::vector<std::string>& 
   const FoundTargets found = read_found_targets();
   if (!run.succeeded() || !found.done) {
     return job.refuse(kFailed, "the portal " + portal.text() + " cannot be asked for its targets",
-                      explain_run(run, kDiscoveryStep));
+                      job.explain(run, kDiscoveryStep));
   }
   names = found.names;
   return true;
@@ -104,7 +104,7 @@ int discover(const Options& options) {
   if (!discover_targets(job, portal, names)) return job.end();
   Table table{"targets", {{"TARGET"}, {"SHARES"}}, {}};
   for (const std::string& name : names) table.rows.push_back({name, shares_on(job.before, name)});
-  if (names.empty() && !options.json) return job.done("the portal offers no target to this machine");
+  if (names.empty() && !options.json) return job.done("the portal offers no target to " + this_machine());
   put(shown(table, options.json));
   return finish(kDone);
 }
@@ -129,7 +129,7 @@ int luns(const Options& options) {
   const ToolRun run = job.run(search_lun_arguments(name, portal, credentials), "");
   const FoundLuns found = read_found_luns(name);
   if (!run.succeeded() || !found.done) return tell_luns_failed(job, found, run);
-  if (found.luns.empty() && !options.json) return job.done("the target offers no LUN to this machine");
+  if (found.luns.empty() && !options.json) return job.done("the target offers no LUN to " + this_machine());
   put(shown(table_of(job.before, name, found, options.json), options.json));
   return finish(kDone);
 }

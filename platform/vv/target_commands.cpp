@@ -40,7 +40,7 @@ int password(const Options& options) {
   const Target target = *job.target;
   const ToolRun run = job.run(modify_arguments(target.name, credentials), target.name);
   if (!run.succeeded() || !is_stored(target.name, credentials)) {
-    return job.failed("the password is not changed", explain_run(run, kStoreStep));
+    return job.failed("the password is not changed", job.explain(run, kStoreStep));
   }
   if (target.wanted) return job.tell_brought_up(target.name, job.row != nullptr ? options.name : "", run);
   return job.done("the password is stored\nconnect it: " +
@@ -70,7 +70,7 @@ int rename_portal(const Options& options) {
   const Target* now = after.target(target);
   // The tool succeeds as well when it refuses.
   if (!run.succeeded() || now == nullptr || stored_portal(now->address, now->port).text() != portal.text()) {
-    return job.failed("the portal of " + name + " is not changed", explain_run(run, kDiscoveryStep));
+    return job.failed("the portal of " + name + " is not changed", job.explain(run, kDiscoveryStep));
   }
   return job.done(name + " is reached at " + portal.text() + " from now on\nconnect it: " +
                   platform::printable(vvstat::vv_command("connect", options.name)));

@@ -48,7 +48,7 @@ int disconnect(const Options& options) {
   }
   const ToolRun run = job.run(target_arguments("--disconnect", job.target->name), job.target->name);
   if (!run.succeeded() || Look().in_use(job.target->name)) {
-    return job.failed(shown_name(job) + " is not disconnected", explain_run(run, kUnmountStep));
+    return job.failed(shown_name(job) + " is not disconnected", job.explain(run, kUnmountStep));
   }
   return job.done(shown_name(job) + " is disconnected, and stays so until it is connected");
 }
@@ -75,7 +75,7 @@ int remove(const Options& options) {
   const Look after;
   const bool gone = whole ? after.target(options.name) == nullptr : after.share(options.name) == nullptr;
   if (!run.succeeded() || !gone) {
-    return job.failed(shown_name(job) + " is not deleted", explain_run(run, kStoreStep));
+    return job.failed(shown_name(job) + " is not deleted", job.explain(run, kStoreStep));
   }
   return job.done(names + " is deleted; the data is still on the storage server");
 }

@@ -69,6 +69,10 @@ std::string Look::share_names() const {
   return names;
 }
 
+std::string initiator_name() {
+  return platform::TreeReader().value(remvol::key::kInitiatorName);
+}
+
 Credentials stored_credentials(const std::string& target) {
   const platform::TreeReader tree;
   Credentials credentials;

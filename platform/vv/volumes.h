@@ -46,6 +46,9 @@ class Look {
   std::vector<vvstat::Row> rows_;
 };
 
+// The name that this machine has as an initiator; empty when the tree has none.
+std::string initiator_name();
+
 // User and secret that the tree has of the target; none when it is not stored or uses none.
 Credentials stored_credentials(const std::string& target);
 

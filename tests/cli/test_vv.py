@@ -261,6 +261,45 @@ def test_a_portal_that_offers_nothing(machine):
     assert machine.says("discover", "10.9.0.2") == (0, {"targets": []})
 
 
+NAME = "iqn.2013-03.com.example:box:initiator-1b2c3d"
+
+
+def test_what_the_storage_server_is_to_let_in_is_named(photos):
+    """The initiator by its own name, which is what a storage server asks for."""
+    photos.tree.set(f"{INITIATOR}/iqn", NAME)
+    photos.offers()
+    assert photos.vv("discover", "10.9.0.2").stdout == f"the portal offers no target to this machine ({NAME})\n"
+    done = photos.vv("add", "Music", "--portal", "10.9.0.2", "--lun", "2")
+    assert (done.status, done.stderr) == (2, f"vv: the portal 10.9.0.2:3260 offers no target to this machine ({NAME})\n")
+    photos.target(T2, {1: "sdc"}, size=4096)  # too small to be listed
+    assert photos.vv("luns", T2, "--portal", "10.9.0.2").stdout == f"the target offers no LUN to this machine ({NAME})\n"
+    photos.box.fake("iscsiadm", "-m discovery", stderr="iscsiadm: No portals found\n", status=21, first=True)
+    assert f"  try:  see whether the storage server lets this machine ({NAME}) in\n" in photos.vv("discover", "10.9.0.2").stderr
+    photos.tree.set(f"{INITIATOR}/iqn", "iqn.\x1b[31m")
+    assert "lets this machine (iqn.\\x1B[31m) in\n" in photos.vv("discover", "10.9.0.2").stderr
+    photos.tree.set(f"{INITIATOR}/iqn", "")
+    assert "lets this machine in\n" in photos.vv("discover", "10.9.0.2").stderr
+
+
+def test_a_portal_that_wants_a_password_for_a_discovery(machine):
+    machine.box.fake("iscsiadm", "-m discovery", status=24, stderr=(
+        "iscsiadm: Login failed to authenticate with target \n"
+        "iscsiadm: discovery login to 10.9.0.2 rejected: initiator failed authorization\n"
+        "iscsiadm: Could not perform SendTargets discovery: iSCSI login failed due to authorization failure\n"))
+    done = machine.vv("discover", "10.9.0.2")
+    assert done.status == 1
+    assert ("  why:  the portal wants a user and a password before it names its targets\n"
+            "  try:  have the storage server name them without; vv luns, and vv add with --target, need no discovery\n") in done.stderr
+
+
+def test_an_initiator_whose_daemon_does_not_run(machine):
+    machine.box.fake("iscsiadm", "-m discovery", status=20, stderr="iscsiadm: can not connect to iSCSI daemon (111)!\n"
+                     "iscsiadm: Could not perform SendTargets discovery: could not connect to iscsid\n")
+    assert ("  why:  the initiator's daemon does not run\n"
+            "  try:  systemctl start remvol && systemctl restart remvol-keeper; see journalctl -u remvol-keeper\n"
+            ) in machine.vv("discover", "10.9.0.2").stderr
+
+
 SAMPLES = pathlib.Path(__file__).resolve().parents[1] / "samples/iscsiadm/bookworm"  # tests/unit reads those of all releases
 
 
@@ -887,6 +926,7 @@ def test_a_portal_that_does_not_offer_the_target(photos):
     done = photos.vv("rename-portal", "Photos", "--portal", "10.9.0.3")
     assert (done.status, done.stdout) == (1, "")
     assert "the portal of Photos is not changed" in done.stderr and "the target is not offered there" in done.stderr
+    assert "  try:  see what is: vv discover 10.9.0.3\n" in done.stderr
     assert photos.site.target("ip") == "10.9.0.2"
 
 
@@ -897,6 +937,19 @@ def test_the_portal_of_a_connected_target_is_not_changed(machine):
                                              "  why:  a portal is changed while the target is not connected\n"
                                              "  try:  vv disconnect Photos\n")
     assert not machine.box.shell()
+
+
+@pytest.mark.parametrize("share", ["MYSHARE", "SHARE", "this machine", "PORTAL"])
+def test_an_advice_has_the_name_as_it_is(machine, share):
+    machine.store(T1, conn_set=0, luns=[(share, 1)])
+    machine.target(T1, {1: "sdb"})
+    machine.tree.set(f"{INITIATOR}/iqn", NAME)
+    word = f"'{share}'" if " " in share else share
+    assert machine.vv("connect", share).status == 0
+    assert f"  try:  vv disconnect {word}\n" in machine.vv("rename-portal", share, "--portal", "10.9.0.3").stderr
+    machine.box.fake("iscsiadm", re.compile("--login$"), stderr=sample("login-no-secret.err"), status=24, first=True)
+    assert machine.vv("disconnect", share).status == 0
+    assert f"  try:  set those of the storage server: vv password {word} --user NAME\n" in machine.vv("connect", share).stderr
 
 
 # --- at a terminal ---
