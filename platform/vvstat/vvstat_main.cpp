@@ -12,6 +12,7 @@
 #include "common/memory.h"
 #include "common/utf8.h"
 #include "vvstat/columns.h"
+#include "vvstat/folding.h"
 #include "vvstat/metrics.h"
 #include "vvstat/past.h"
 #include "vvstat/verdict.h"
@@ -50,8 +51,12 @@ int exit_status(const Snapshot& look) {
 }
 
 const char* why_unreachable() {
-  if (geteuid() != 0) return "vvstat: only root may read the configuration tree\n";
-  return "vvstat: the configuration tree cannot be reached; see systemctl status remvol-tree\n";
+  if (geteuid() != 0) return "vvstat: only root may read the configuration tree";
+  return "vvstat: the configuration tree cannot be reached; see systemctl status remvol-tree";
+}
+
+void tell_unreachable() {
+  fprintf(stderr, "%s\n", why_unreachable());
 }
 
 std::vector<Row> ailing_among(const std::vector<Row>& rows) {
@@ -63,11 +68,17 @@ std::vector<Row> ailing_among(const std::vector<Row>& rows) {
 }
 
 Page page_of(const Snapshot& look, const PageOptions& options) {
-  if (!look.status.reachable) return {"", why_unreachable()};
+  const Layout& layout = options.layout;
+  if (!look.status.reachable && layout.form == Form::kTable) {
+    return {"", folded(why_unreachable(), {}, layout.width)};
+  }
+  if (!look.status.reachable) {
+    tell_unreachable();
+    return {};
+  }
   const std::vector<Row> ailing = options.ailing_only ? ailing_among(look.rows) : std::vector<Row>();
   const std::vector<Row>& rows = options.ailing_only ? ailing : look.rows;
   Page page;
-  const Layout& layout = options.layout;
   if (!rows.empty() || layout.form == Form::kJson) page.table = volume_report(rows, layout);
   // Whoever takes a report apart wants the rows alone.
   if (layout.form == Form::kTable && layout.headings) {
@@ -99,7 +110,7 @@ size_t width_of_output() {
 int show_once(const PageOptions& options) {
   const Snapshot seen = look(detail_of_report(options.layout));
   if (!seen.status.reachable) {
-    fputs(why_unreachable(), stderr);
+    tell_unreachable();
     return kUnreachable;
   }
   Page page = page_of(seen, options);
@@ -112,7 +123,7 @@ int show_once(const PageOptions& options) {
 // only where that is the user.
 int show_metrics() {
   const Snapshot seen = look(Detail::kHealth);
-  if (!seen.status.reachable && geteuid() != 0) fputs(why_unreachable(), stderr);
+  if (!seen.status.reachable && geteuid() != 0) tell_unreachable();
   put(metrics(seen.status.reachable, seen.rows, time(nullptr)));
   return finish(exit_status(seen));
 }
@@ -132,7 +143,7 @@ int show_one(const PageOptions& options) {
   const bool is_block = options.layout.form == Form::kTable;
   const Snapshot seen = look(is_block ? detail_of_block(options.layout) : detail_of_report(options.layout));
   if (!seen.status.reachable) {
-    fputs(why_unreachable(), stderr);
+    tell_unreachable();
     return kUnreachable;
   }
   std::vector<Row> rows;

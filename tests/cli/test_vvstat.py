@@ -937,6 +937,17 @@ def test_watch_goes_on_while_the_tree_is_away(example):
     assert terminal.end() == 1
 
 
+def test_watch_folds_what_it_says_of_the_tree(box):
+    box.tree.stop()
+    terminal = on_a_terminal(box, "--watch", columns=60, lines=5)
+    terminal.wait_for("remvol-tree")
+    terminal.running.kill(signal.SIGTERM)
+    assert terminal.end() == 3
+    text = "vvstat: the configuration tree cannot be reached; see systemctl status remvol-tree"
+    lines = [line for line in frames(terminal)[0] if line]
+    assert " ".join(lines) == text and max(map(width, lines)) <= 60
+
+
 def test_watch_without_a_terminal_is_plain(example):
     running = example.start(["vvstat", "--watch"], env={"LD_PRELOAD": None})
     example.wait_until(lambda: running.stdout.count("SHARE ") >= 2, what="a second table")
@@ -953,6 +964,17 @@ def test_watch_as_json_is_one_object_after_the_other(example):
     assert done.status == 0
     for text in done.stdout.split("\n\n")[:-1]:
         jsonschema.validate(json.loads(text), SCHEMA)
+
+
+@pytest.mark.parametrize("form", ["--json", "--raw"])
+def test_watch_for_programs_says_on_standard_error_that_the_tree_is_away(box, form):
+    box.tree.stop()
+    running = box.start(["vvstat", "--watch", form], env={"LD_PRELOAD": None})
+    box.wait_until(lambda: running.stdout.count("\n") >= 2, what="a second look")
+    running.kill(signal.SIGTERM)
+    done = running.wait()
+    assert (done.status, done.stdout.strip()) == (3, "")
+    assert set(done.stderr.splitlines()) == {"vvstat: the configuration tree cannot be reached; see systemctl status remvol-tree"}
 
 
 def test_watch_ends_when_nobody_reads(example):
