@@ -7,9 +7,10 @@ import re
 import subprocess
 import xml.etree.ElementTree
 
+import jsonschema
 import pytest
 
-from harness.documents import blocks_of
+from harness.documents import blocks_of, published_schema, strict_schema
 from harness.initiator import store
 from harness.ktree_daemon import BUILD, Daemon
 from test_vvstat import TREE_PROBLEMS, UNMOUNTED_PROBLEMS, promtool
@@ -309,6 +310,23 @@ def test_the_picture_is_the_recording_s_end():
             if row.tag.endswith("}text")]
     lines = [line.strip() for line in recorded().splitlines() if line.strip()]
     assert len(rows) > 20 and [" ".join(row.split()) for row in rows] == [" ".join(line.split()) for line in lines[-len(rows):]]
+
+
+# Of each schema what it describes, with a member that a later version may add, at any depth.
+LATER = {
+    "vv.schema.json": [{"targets": [{"target": "iqn.t1", "shares": None, "later": 1}]},
+                       {"luns": [{"lun": 1, "size": 0, "fstype": None, "share": None}], "later": 1},
+                       {"outcomes": [{"command": None, "share": None, "target": None, "outcome": "failed", "status": 2, "message": "",
+                                      "step": None, "why": None, "advice": None, "details": None, "later": {}}], "luns": []}],
+    "vvstat.schema.json": [{"volumes": [{"share": "Photos", "later": 1}]}, {"volumes": [], "later": 1}],
+}
+
+
+@pytest.mark.parametrize("schema, told", [(schema, told) for schema in LATER for told in LATER[schema]])
+def test_a_schema_lets_pass_what_a_later_version_adds(schema, told):
+    jsonschema.validate(told, published_schema(schema))
+    with pytest.raises(jsonschema.ValidationError):
+        jsonschema.validate(told, strict_schema(schema))
 
 
 PAGES = sorted(path.name for path in (DOCS / "man").iterdir())

@@ -8,13 +8,14 @@ import jsonschema
 import pytest
 
 from appliance import settings
+from harness.documents import strict_schema
 from harness.terminal import Terminal
 from harness.tree import Tree
 
 T = "iqn.2026-01.org.example:t"
 T1, T2 = f"{T}1", f"{T}2"
 INITIATOR = "/iscsi/initiator"
-SCHEMA = json.loads((pathlib.Path(__file__).resolve().parents[2] / "docs/vv.schema.json").read_text())
+SCHEMA = strict_schema("vv.schema.json")
 
 # What the kernel shows of a session as long as there is one.
 SESSION = r"""

@@ -17,10 +17,11 @@ import jsonschema
 import prometheus_client.parser
 import pytest
 
+from harness.documents import strict_schema
 from harness.initiator import store
 from harness.terminal import Terminal
 
-SCHEMA = json.loads((pathlib.Path(__file__).resolve().parents[2] / "docs/vvstat.schema.json").read_text())
+SCHEMA = strict_schema("vvstat.schema.json")
 T1, T2 = "/iscsi/initiator/id:1", "/iscsi/initiator/id:2"
 T1_NAME = "iqn.2026-01.org.example:t1"
 LONG_NAME = "iqn.2026-01.org.example:a-target-whose-name-has-a-length-as-in-life"
