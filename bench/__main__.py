@@ -36,7 +36,7 @@ def show(found):
             print(f"    {' | '.join(row)}")
         return
     limit = f"  ({found.limit}{'' if found.holds else ': MISSED'})" if found.limit else ""
-    print(f"  {found.what}: {number(found.value)} {found.unit}".rstrip() + limit)
+    print(f"  {found.what}: {found.text}{limit}")
     if found.detail:
         print(f"    {found.detail}")
 

@@ -15,9 +15,24 @@ class Figure:
     least: float | None = None
     detail: str = ""  # what it was computed of, and how it varied
 
+    def allows(self, value):
+        return (self.most is None or value <= self.most) and (self.least is None or value >= self.least)
+
     @property
     def holds(self):
-        return (self.most is None or self.value <= self.most) and (self.least is None or self.value >= self.least)
+        return self.allows(self.value)
+
+    @property
+    def text(self):
+        """The value with its unit. One that misses its limit has as many digits as show that it does."""
+        digits = 3
+        while not self.holds and self.allows(float(number(self.value, digits).replace(",", ""))):
+            digits += 1
+        return f"{number(self.value, digits)} {self.unit}".rstrip()
+
+    @property
+    def measured(self):
+        return self.text + ("" if self.holds else " **missed**")
 
     @property
     def limit(self):
@@ -46,10 +61,10 @@ class Table:
     text: str = ""
 
 
-def number(value):
+def number(value, digits=3):
     if value >= 1000:
-        return f"{value:,.0f}"
-    return f"{value:.3g}"
+        return f"{value:,.{digits - 3}f}"
+    return f"{value:.{digits}g}"
 
 
 def ratio(group, what, ours, theirs, most=None, unit="us"):
