@@ -20,14 +20,25 @@ BLOCK = """
 """
 
 
+def shipped():
+    """The documents that the package brings, all in one folder, and the pictures below it."""
+    for line in (PACKAGING.parent / "debian/remvol.docs").read_text().splitlines():
+        path = PACKAGING.parent / line
+        yield from path.iterdir() if path.is_dir() else [path]
+
+
 def test_the_documents_that_the_manual_pages_name_are_in_the_package():
-    folder = PACKAGING.parent
-    shipped = {pathlib.Path(line).name for line in (folder / "debian/remvol.docs").read_text().splitlines()}
-    named = {name for page in (folder / "docs/man").iterdir()
+    named = {name for page in (PACKAGING.parent / "docs/man").iterdir()
              for name in re.findall(r"/usr/share/doc/remvol/([\w.-]+\w)", page.read_text())}
-    first = (folder / "README.md").read_text().split("\n## ")[0]
-    named |= {name.split("/")[-1] for name in re.findall(r"`((?:docs/)?[\w-]+\.md)`", first)}
-    assert {"vv.schema.json", "SECURITY.md"} <= named and named <= shipped
+    assert "vv.schema.json" in named and named <= {path.name for path in shipped()}
+
+
+@pytest.mark.parametrize("path", [path for path in shipped() if path.suffix == ".md"], ids=lambda path: path.name)
+def test_the_documents_that_an_installed_one_names_are_in_the_package(path):
+    text = path.read_text()
+    named = set(re.findall(r"`(?:docs/)?([\w-]+\.(?:md|json|cast|svg))`", text))
+    named |= {link.split("/")[-1] for link in re.findall(r"\]\(([^):]*)\)", text)}
+    assert named <= {path.name for path in shipped()}
 
 
 def helper(box, name, *args):
