@@ -145,7 +145,7 @@ def test_a_test_that_reads_a_block_is_there(document, start, test):
 # --- the blocks of HERE ---
 
 
-def run(box, text, shell="bash"):
+def run(box, text, shell="sh"):  # what cron and a script have
     done = box.run([shell, "-c", text], env={"LD_PRELOAD": None})
     return done.status, done.stdout, done.stderr
 
@@ -169,7 +169,7 @@ def test_the_example_of_a_tree_of_one_s_own(box):
     box.tree.set("/a", "b")
     text = block("docs/man/ktree.8", "ktree -n config").replace("\nktreec", "\nsleep 0.5\nktreec")
     box.write("/etc/NAS_CFG/vv.xml", "<config><one>two</one></config>", mode=0o600)
-    status, printed, errors = run(box, "set -m\n" + text)
+    status, printed, errors = run(box, "set -m\n" + text, "bash")
     assert (status, printed, errors) == (0, "/one=two\n", "")
 
 
