@@ -39,13 +39,15 @@ ELSEWHERE = [
     ("README.md", "apt-get install", {"apt-get install ./build/package/": (STAGE, "install_packages")}),
     ("README.md", "scripts/demo", {"scripts/demo": ("scripts/record-demo", '"scripts/demo"'),
                                    "scripts/test": (".ci/run", "scripts/test")}),
-    ("README.md", "cmake --preset", {"cmake --preset release &&": (RUNNER, "cmake --preset $1 && cmake --build build/$1"),
-                                     "cmake --install": ("tests/cli/test_documents.py", '"cmake", "--install", BUILD')}),
+    ("README.md", "scripts/install-packages build", {
+        "scripts/install-packages": ("scripts/demo", "scripts/install-packages build lab"),
+        "cmake -S . -B": ("scripts/demo", "cmake -S . -B $build -DCMAKE_BUILD_TYPE=Release"),
+        "cmake --build": ("tests/cli/test_documents.py", '"cmake", "--install", BUILD')}),
     ("CONTRIBUTING.md", "scripts/demo", {"scripts/demo": ("scripts/record-demo", '"scripts/demo"'),
                                          "scripts/test LAYER": (RUNNER, "scripts/test [LAYER...]"),
                                          "scripts/test format": (RUNNER, "layer_format()")}),
-    ("docs/lab.md", "scripts/install-packages build lab", {
-        "scripts/install-packages": ("scripts/demo", "scripts/install-packages build lab"),
+    ("docs/lab.md", "scripts/install-packages build test lab", {
+        "scripts/install-packages": (RUNNER, "install_groups build test"),
         "cmake --preset": (RUNNER, "cmake --preset $1 && cmake --build build/$1"),
         "scripts/package": (RUNNER, "scripts/package"), "lab/run smoke": ("tests/lab/check-runner", "lab/run"),
         "lab/run -j5 --all": (RUNNER, "lab/run -j$((2 * jobs + 1)) --all"),
