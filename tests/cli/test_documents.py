@@ -96,6 +96,13 @@ def test_the_manual_page_has_every_command_and_option_of_the_tool():
         assert re.search(rf"^\.[BI]\w* .*(?<![\w-]){word}(?![\w-])", page, re.M), word
 
 
+@pytest.mark.parametrize("document", [*sorted(TOP.glob("*.md")), *sorted(DOCS.glob("*.md"))], ids=lambda path: path.name)
+def test_a_file_of_the_sources_that_a_document_names_is_there(document):
+    text = re.sub(r"^```.*?^```", "", document.read_text(), flags=re.M | re.S)
+    for name in re.findall(r"`((?:bench|debian|include|lab|packaging|platform|scripts|src|tests)/[\w./-]+)[` ]", text):
+        assert [*TOP.glob(name), *TOP.glob(name + ".*")], name
+
+
 # The form of what all commands print, and one that does not end by itself (test_vvstat.py).
 NO_COMMANDS = ("vv --json", "vvstat --watch")
 
