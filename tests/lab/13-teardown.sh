@@ -25,7 +25,7 @@ expect_equal "its file" text "$(cat /mnt/VV/Data/file)"
 expect "deinit" remvol --deinit
 wait_for 5 nothing_left
 expect_equal "modules are gone" 0 "$(modules)"
-expect_equal "shells that live on" 1 "$(pgrep -fc '^sh /lab/scenario')"
+expect_equal "shells that live on" 1 "$(pgrep -fc '^sh /brought/scenario')"
 
 works --init
 expect "the volume is back" mounted Data

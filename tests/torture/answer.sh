@@ -1,7 +1,7 @@
 # What power.sh and disks.sh end with: brings up the targets, then runs one command line after the other as the runner sends
 # them (machine.py), and answers each with "done STATUS" and what it printed.
 start_targets
-printf '\036ready\n' >&9
+printf '\036up\n' >&9
 while read -r line; do
     status=0
     eval "$line" >/tmp/answer 2>&1 </dev/null 9>&- || status=$?

@@ -93,7 +93,7 @@ class Appliance:
         self.boots += 1
         self.pending = b""
         self.qemu, self.port = self.machine.boot(self.boots)
-        self.wait("ready")
+        self.wait("up")
 
     def cut(self):
         """The power goes at once. What the appliance had said before stays to be read."""
