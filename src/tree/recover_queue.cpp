@@ -4,11 +4,19 @@
 
 #include "frontend/log.h"
 #include "support/result.h"
+#include "support/run_lock.h"
 #include "support/text.h"
 #include "tree/access.h"
 #include "tree_layout.h"
 
 namespace remvol {
+
+namespace {
+
+// Whoever adds an entry or takes one has this alone: the later ones move down when one is taken.
+constexpr char kEntriesLock[] = "recover_queue.lock";
+
+}  // namespace
 
 int ktree_get_free_recover_queue_db_idx() {
   const LogScope scope;
@@ -22,6 +30,8 @@ int ktree_get_free_recover_queue_db_idx() {
 
 int ktree_insert_recover_queue(const char* target_name) {
   const LogScope scope;
+  RunLock lock;
+  lock.take(kEntriesLock, LockMode::kExclusive);
   const int q = ktree_get_free_recover_queue_db_idx();
   if (q < 1) {
     LOG(0, "db failed or exceed max queue length");
@@ -36,6 +46,8 @@ bool recover_queue_is_empty() {
 
 int ktree_pop_recover_queue(char* target_name) {
   const LogScope scope;
+  RunLock lock;
+  lock.take(kEntriesLock, LockMode::kExclusive);
   TreeValue name;
   if (!tree_read(KeyText(key::kRecoverName, 1), name)) return kFailed;
   memcpy(target_name, name, sizeof name);

@@ -1,6 +1,10 @@
 // The recover queue.
 #include "tree/recover_queue.h"
 
+#include <poll.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
 #include "fakes.h"
 #include "frontend/log.h"
 
@@ -29,6 +33,33 @@ TEST_F(RecoverQueue, FirstInFirstOut) {
   EXPECT_EQ(ktree_pop_recover_queue(name_), 0);
   EXPECT_STREQ(name_, "b");
   EXPECT_EQ(ktree_pop_recover_queue(name_), -1);
+}
+
+TEST_F(RecoverQueue, WhatIsTakenAndWhereANameGoesIsLogged) {
+  debug_level = 2;
+  EXPECT_EQ(messages([] { (void)ktree_insert_recover_queue("a"); }), "");
+  EXPECT_EQ(messages([this] { (void)ktree_pop_recover_queue(name_); }), "pop a\n");
+  debug_level = 3;
+  EXPECT_EQ(messages([] { (void)ktree_insert_recover_queue("b"); }), "free ent id: 1\n");
+  debug_level = 1;
+  EXPECT_EQ(messages([this] { (void)ktree_pop_recover_queue(name_); }), "");
+}
+
+TEST_F(RecoverQueue, ANameThatComesWhileAnotherIsTakenIsNotLost) {
+  ASSERT_EQ(ktree_insert_recover_queue("a"), 0);
+  pid_t other_run = 0;
+  fakes::on("ktreec_get_wb", entry(2) + "/target_name").times(1).then_real().does([&] {
+    other_run = fork();
+    if (other_run == 0) _exit(ktree_pop_recover_queue(name_));
+    poll(nullptr, 0, 200);
+  });
+  EXPECT_EQ(ktree_insert_recover_queue("b"), 0);
+  int status = -1;
+  ASSERT_EQ(waitpid(other_run, &status, 0), other_run);
+  EXPECT_EQ(status, 0);
+  EXPECT_FALSE(recover_queue_is_empty());
+  EXPECT_EQ(ktree_pop_recover_queue(name_), 0);
+  EXPECT_STREQ(name_, "b");
 }
 
 TEST_F(RecoverQueue, TheHundredAndFirstIsRefused) {
