@@ -59,7 +59,7 @@ void repair_lun_state(const TargetEntry* lun, LunState* state) {
   if (lun->dev[0] != '\0' && has_process(kMke2fs, Text<32>("/dev/%s", lun->dev))) return;
   if (is_format_under_way(state->format)) (void)ktree_update_formatting_state(lun, kFormatIdle);
   if (state->volume == kVolumeCreating) (void)ktree_update_volume_state(lun, kVolumeNormal);
-  (void)read_lun_state(lun->db_idx, lun->lun_db_idx, state);
+  *state = read_lun_state(lun->db_idx, lun->lun_db_idx);
 }
 
 }  // namespace remvol

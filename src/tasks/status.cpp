@@ -25,12 +25,12 @@ namespace {
 // Refreshes the status texts of the LUNs of the target in `entry`, which is the record for each. The slots
 // are let go of while disks are looked at.
 void refresh_luns(TargetEntry* entry, SlotsHeld* held) {
-  LunState state;
   LunWalk luns(entry->db_idx, LunWalk::kAtUnreadable);
-  while (luns.next_of_target(entry) && read_lun_state(entry->db_idx, entry->lun_db_idx, &state) == kOk) {
+  while (luns.next_of_target(entry)) {
+    LunState state = read_lun_state(entry->db_idx, entry->lun_db_idx);
     held->let_go();
     repair_lun_state(entry, &state);
-    (void)ktree_update_lun_status(entry, state);
+    (void)ktree_update_lun_status(entry, state.format == kFormatting ? 1 : 0);
     held->take();
   }
   (void)ktree_refresh_total_luncnt();

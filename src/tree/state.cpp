@@ -179,14 +179,12 @@ int ktree_record_connect_set(const TargetEntry* entry) {
   return tree_write_once(key, value);
 }
 
-int read_lun_state(int dbidx, int lun_dbidx, LunState* state) {
+LunState read_lun_state(int dbidx, int lun_dbidx) {
   const SlotsHeld held;
-  int enabled = 0;
-  if (ktree_get_lun_vol_access_right(&state->right, dbidx, lun_dbidx) != kOk) return kFailed;
-  state->enabled = ktree_get_lun_enable(&enabled, dbidx, lun_dbidx) == kOk && enabled != 0;
-  (void)ktree_get_lun_format_state(dbidx, lun_dbidx, &state->format);
-  (void)ktree_get_lun_volume_state(dbidx, lun_dbidx, &state->volume);
-  return kOk;
+  LunState state;
+  (void)ktree_get_lun_format_state(dbidx, lun_dbidx, &state.format);
+  (void)ktree_get_lun_volume_state(dbidx, lun_dbidx, &state.volume);
+  return state;
 }
 
 }  // namespace remvol

@@ -53,16 +53,13 @@ namespace remvol {
 // Stores the entry's conn_set, in one try. Returns 0 or -103.
 [[nodiscard]] int ktree_record_connect_set(const TargetEntry* entry);
 
-// What is stored of a LUN that its status text is made of.
+// What is stored of the work on a LUN that is not mounted.
 struct LunState {
-  int right = VOL_AC_RW;  // AccessRight
-  bool enabled = false;
-  int format = -1;  // FormatState, -1 when missing
-  int volume = -1;  // VolumeState, -1 when missing
+  int format;  // FormatState, -1 when missing
+  int volume;  // VolumeState, -1 when missing
 };
 
-// Reads it. Returns 0, or -1 for a dbidx below 1.
-[[nodiscard]] int read_lun_state(int dbidx, int lun_dbidx, LunState* state);
+[[nodiscard]] LunState read_lun_state(int dbidx, int lun_dbidx);
 
 }  // namespace remvol
 

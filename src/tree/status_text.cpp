@@ -38,27 +38,27 @@ StatusText formatting_text(int progress) {
   return StatusText("%s %d%%", kFormattingText, progress);
 }
 
-StatusText running_text(const LunState& state) {
-  return with_right("Running", state.right);
+StatusText running_text(int right) {
+  return with_right("Running", right);
 }
 
-StatusText unmounted_text(const LunState& state, int progress) {
+StatusText unmounted_text(const LunState& state, int right, int progress) {
   if (state.format == kFormatting) return formatting_text(progress);
   if (state.volume == kVolumeCreating) return StatusText(kCreatingText);
-  if (state.volume == kVolumeUnsupported) return with_right("Unsupported File System", state.right);
+  if (state.volume == kVolumeUnsupported) return with_right("Unsupported File System", right);
   if (!failed(state)) return StatusText(kLunOffline);
-  return with_right("Create Volume Failed", state.right);
+  return with_right("Create Volume Failed", right);
 }
 
-StatusText unformatted_text(const LunState& state, int progress) {
+StatusText unformatted_text(const LunState& state, int right, int progress) {
   if (state.format == kFormatting) return formatting_text(progress);
   if (state.format == kFormatWaiting) return StatusText(kWaitingText);
   if (state.volume == kVolumeCreating) return StatusText(kCreatingText);
-  if (failed(state)) return with_right("Create Volume Failed", state.right);
+  if (failed(state)) return with_right("Create Volume Failed", right);
   if (state.volume == kVolumeOffline) return StatusText(kLunOffline);
   // The user interface knows no read-only form of this text here.
   if (state.volume == kVolumeUnsupported) return StatusText("Unsupported File System");
-  return with_right("No Format", state.right);
+  return with_right("No Format", right);
 }
 
 bool tells_of_work(const char* text) {

@@ -29,13 +29,13 @@ inline constexpr char kLunOffline[] = "Offline";
 // The text of a LUN that is being formatted, `progress` in percent.
 [[nodiscard]] StatusText formatting_text(int progress);
 
-// The text of a mounted LUN.
-[[nodiscard]] StatusText running_text(const LunState& state);
+// The text of a mounted LUN, `right` an AccessRight.
+[[nodiscard]] StatusText running_text(int right);
 
 // The text of a LUN on which a file system is that is not mounted, and of one on which none was recognised.
 // `progress` in percent counts while the state is kFormatting.
-[[nodiscard]] StatusText unmounted_text(const LunState& state, int progress);
-[[nodiscard]] StatusText unformatted_text(const LunState& state, int progress);
+[[nodiscard]] StatusText unmounted_text(const LunState& state, int right, int progress);
+[[nodiscard]] StatusText unformatted_text(const LunState& state, int right, int progress);
 
 // Returns whether the status text of a target or a LUN tells of work that goes on.
 [[nodiscard]] bool tells_of_work(const char* text);

@@ -12,10 +12,6 @@ namespace remvol {
 // still run).
 [[nodiscard]] int ktree_update_lun_status(const TargetEntry* entry, int formatting);
 
-// Writes the status of a LUN whose state was just read, as formatting when the state says so. Returns 0 or
-// -103.
-[[nodiscard]] int ktree_update_lun_status(const TargetEntry* entry, const LunState& state);
-
 }  // namespace remvol
 
 #endif

@@ -123,6 +123,31 @@ def test_a_format_without_stored_progress_shows_zero(box):
     assert status(box) == "Formatting 0%"
 
 
+@pytest.mark.parametrize("volume_state", ["0", "1"])
+@pytest.mark.parametrize("fs_type, last_look", [("", ("sys_get_fs_type", "/dev/sdb1")),
+                                                ("ext4", ("sys_get_df_info", "/mnt/VV/data"))])
+def test_a_format_that_begins_while_the_disk_is_looked_at_shows(box, fs_type, last_look, volume_state):
+    store(box, format_state="0", volume_state=volume_state)
+    sessions(box)
+    begin = "; ".join(f"ktreec -S /var/run/ktree_sock_vv -s {LUN}/{key} {value}"
+                      for key, value in (("format_state", 1), ("format_progress", 7)))
+    box.hook(*last_look, ret=-1, effect=begin)
+    box.hook("sys_get_fs_type", "/dev/sdb1", out=fs_type, ret=0)
+    assert status(box) == "Formatting 7%"
+
+
+def test_no_format_begins_between_the_look_at_the_states_and_the_text(box):
+    """Whoever stores a state has the slots, which are not to be had meanwhile."""
+    store(box, format_state="0")
+    sessions(box)
+    box.hook("sys_get_fs_type", "/dev/sdb1", ret=1)
+    had = "flock -n -s /run/remvol/slots.lock true; echo $? >>/root/had"
+    box.hook("ktreec_get_wb", f"{LUN}/volume_state", through=True, skip=1, effect=had)
+    box.hook("ktreec_set", f"{LUN}/status", through=True, effect=had)
+    assert status(box) == "No Format"
+    assert box.path("/root/had").read_text() == "1\n1\n"
+
+
 @pytest.mark.parametrize("enable", ["0", "", None])
 def test_a_disabled_lun_keeps_its_size(box, enable):
     store(box, enable=enable, size="5/9", format_state="1", volume_state="3", vol_access_right="0")
