@@ -60,7 +60,7 @@ int refresh_target(TargetEntry* entry, SlotsHeld* held) {
 // read before is believed although a person at ktreec may have stored a target since.
 bool delete_nameless_slot(int slot) {
   const SlotsHeld held(SlotsHeld::kChange);
-  if (tree_present(KeyText(key::kTargetName, slot))) return false;
+  if (!tree_is_missing(KeyText(key::kTargetName, slot), key::kTargetCount)) return false;
   const KeyText path(key::kTarget, slot);
   if (delete_slot(path) == kOk) return true;
   LOG(0, "ktreec_del() of path '%s' failed", path.c_str());
@@ -107,8 +107,10 @@ void prune_slots_behind(int count) {
   const SlotsHeld held(SlotsHeld::kChange);
   int slot = count + 1;
   for (int visited = count; visited < kMaxTargets; visited++) {
-    if (!tree_present(KeyText(key::kTargetStatus, slot))) return;
-    if (!tree_slot_is_free(KeyText(key::kTargetName, slot))) {  // asked for anew, as above
+    const KeyText status(key::kTargetStatus, slot);
+    const KeyText name(key::kTargetName, slot);
+    if (!tree_present(status)) return;
+    if (!tree_slot_is_free(name) || !tree_is_missing(name, status)) {  // asked for anew, as above
       slot++;
       continue;
     }

@@ -1,6 +1,7 @@
 """--status."""
 
 import os
+import re
 
 import pytest
 
@@ -168,6 +169,26 @@ class TestBrokenSlots:
                  effect=f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/id:1/target iqn.t1")
         assert status(box).status == 0
         assert site.target("target") == "iqn.t1"
+
+    @pytest.fixture(params=[0, 2], ids=["uncounted", "counted"])
+    def named(self, site, box, request):
+        for slot in (1, 2):
+            site.store(f"iqn.t{slot}", slot=slot, status="old")
+        box.tree.set(f"{INITIATOR}/count", request.param)
+        return site
+
+    @pytest.mark.parametrize("slot", [1, 2])
+    @pytest.mark.parametrize("skip", range(4))
+    def test_a_name_that_cannot_be_read_for_a_moment_is_there(self, named, box, slot, skip):
+        box.hook("ktreec_get_wb", f"{INITIATOR}/id:{slot}/target", ret=-1, skip=skip, times=4)
+        assert status(box).status == 0
+        assert self.names(named)[:3] == ["iqn.t1", "iqn.t2", None]
+
+    @pytest.mark.parametrize("reads", range(16, 40))
+    def test_a_tree_that_cannot_be_read_any_more_loses_no_name(self, named, box, reads):
+        box.hook("ktreec_get_wb", re.compile("."), ret=-1, skip=reads)
+        status(box)
+        assert self.names(named)[:3] == ["iqn.t1", "iqn.t2", None]
 
     def test_a_slot_without_a_name_is_deleted_and_its_successor_visited_next(self, site, box):
         site.store("iqn.t1")
