@@ -1,6 +1,7 @@
 #include "tree/slots.h"
 
 #include <cerrno>
+#include <climits>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
@@ -18,7 +19,7 @@ namespace {
 
 constexpr char kSlotsLock[] = "slots.lock";
 constexpr int kNoLun = -1;
-constexpr int kGone = 0;
+constexpr int kGone = INT_MIN;  // not 0, which an entry without a slot has
 
 using TargetName = TreeValue;
 
@@ -195,7 +196,7 @@ void SlotsHeld::let_go() {
 
 HeldSlot::HeldSlot(int n, int m)
     : target_(find_target(n)), lun_(target_ != kGone ? find_lun(n, m, target_) : kGone) {
-  found_ = target_ != kGone && (m == 0 || lun_ != kGone);
+  found_ = lun_ != kGone;
 }
 
 bool read_target_name(int n, TargetName& name) {

@@ -285,6 +285,15 @@ TEST_F(Slots, ANumberThatNothingWasReadFromIsTakenAsItIs) {
   EXPECT_EQ(fakes::tree_get(key(7, "conn_state")), "2");
 }
 
+TEST_F(Slots, ANumberThatIsNoSlotIsTakenAsItIs) {
+  for (const int number : {0, -1, 9}) {
+    EXPECT_TRUE(HeldSlot(number)) << number;
+    EXPECT_TRUE(HeldSlot(number, 1)) << number;
+    EXPECT_EQ(HeldSlot(number, number).target(), number);
+    EXPECT_EQ(HeldSlot(number, number).lun(), number);
+  }
+}
+
 TEST_F(Slots, AnEntryIsReadFromItsTargetWhereverThatIs) {
   TargetEntry entry;
   ASSERT_EQ(ktree_get_entry_by_targetname("iqn.t3", &entry), 0);

@@ -94,6 +94,26 @@ TEST_F(State, FormatStateIsWrittenEvenWithoutSlots) {
   EXPECT_EQ(fakes::writes().at(0), "set /iscsi/initiator/id:2/lun/id:0/format_state=1");
 }
 
+// The tree refuses a slot below 1, and the failure is logged as any other.
+TEST_F(State, ATargetWithoutASlotIsWrittenAsItIs) {
+  TargetEntry entry = lun_entry();
+  for (const int slot : {0, -1}) {
+    entry.db_idx = slot;
+    const std::string target = "/iscsi/initiator/id:" + std::to_string(slot);
+    const std::string log = fakes::output_of([&] {
+      EXPECT_EQ(ktree_update_formatting_state(&entry, 1), -103);
+      EXPECT_EQ(ktree_update_volume_state(&entry, 1), -103);
+      EXPECT_EQ(ktree_set_connect_state(slot, 1), -103);
+      EXPECT_EQ(ktree_record_connect_set(&entry), -103);
+    });
+    for (const char* name : {"lun/id:3/format_state", "lun/id:3/volume_state", "conn_state"}) {
+      EXPECT_TRUE(has(log, "ktreec_set(" + target + "/" + name + ") failed"));
+    }
+    EXPECT_TRUE(has(log, "ktreec_set() failed"));
+  }
+  EXPECT_EQ(fakes::writes().size(), 16u) << "three tries twice, one try twice, for two numbers";
+}
+
 TEST_F(State, FormatProgressNeedsSlots) {
   const std::string log = fakes::output_of([] { EXPECT_EQ(ktree_update_format_progress(0, 3, 10), -1); });
   EXPECT_TRUE(has(log, "target or lun db index not given"));
