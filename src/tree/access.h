@@ -14,7 +14,7 @@
 namespace remvol {
 
 // Hold a value that is read, and the NUL behind it: a name, a path or a setting, and the number of a state. A
-// longer one reads as missing.
+// longer one is cut.
 using TreeValue = char[256];
 using StateValue = char[128];
 

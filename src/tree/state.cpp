@@ -83,9 +83,8 @@ int ktree_get_lun_vol_access_right(int* right, int dbidx, int lun_dbidx) {
     return kFailed;
   }
   const HeldSlot slot(dbidx, lun_dbidx);
-  const KeyText key(key::kLunAccessRight, slot.target(), slot.lun());
-  const int stored = slot ? tree_read_number(key, VOL_AC_RW) : VOL_AC_RW;
-  *right = stored == VOL_AC_RO ? VOL_AC_RO : VOL_AC_RW;
+  (void)read_state(KeyText(key::kLunAccessRight, slot.target(), slot.lun()), bool(slot), right, VOL_AC_RW);
+  if (*right != VOL_AC_RO) *right = VOL_AC_RW;
   return kOk;
 }
 

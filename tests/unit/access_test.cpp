@@ -90,6 +90,13 @@ TEST_F(DebugLevel, IsTheStoredNumberOrZero) {
   }
 }
 
+TEST_F(DebugLevel, IsCutToTheSizeOfAStateNumber) {
+  fakes::tree_set({{"/iscsi/initiator/dbg", std::string(126, '0') + "2"}});
+  EXPECT_EQ(dbg_get_remvol_debug_lv(), 2);
+  fakes::tree_set({{"/iscsi/initiator/dbg", std::string(127, '0') + "2"}});
+  EXPECT_EQ(dbg_get_remvol_debug_lv(), 0);
+}
+
 TEST_F(DebugLevel, IsLoggedUnderItsOwnFileName) {
   fakes::tree_set({{"/iscsi/initiator/dbg", "7"}});
   EXPECT_EQ(fakes::logged(1, [] { (void)dbg_get_remvol_debug_lv(); }),

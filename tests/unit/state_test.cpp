@@ -74,6 +74,13 @@ TEST_F(State, OnlyAStoredZeroIsReadOnly) {
   }
 }
 
+TEST_F(State, AnAccessRightOfTooManyDigitsIsCut) {
+  int right = 7;
+  fakes::tree_set({{key_of(kLun, "vol_access_right"), std::string(127, '0') + "1"}});
+  EXPECT_EQ(ktree_get_lun_vol_access_right(&right, 2, 3), 0);
+  EXPECT_EQ(right, VOL_AC_RO);
+}
+
 TEST_F(State, SingleValuesAreTriedThreeTimes) {
   const TargetEntry entry = lun_entry();
   fakes::on("ktreec_set", key_of(kLun, "format_state")).returns(-1).times(2);
