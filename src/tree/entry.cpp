@@ -1,5 +1,6 @@
 #include "tree/entry.h"
 
+#include <cerrno>
 #include <cstdlib>
 #include <cstring>
 
@@ -70,13 +71,25 @@ int count_all_luns_at(int n) {
   return count;
 }
 
+enum class SecondLook { kTaken, kEmpty, kUnreadable };
+
+// Looks once more at a slot, by the value that defines it. An empty one ends a search as it did the first;
+// one that could not be read then, and so seemed to be empty, does not.
+SecondLook look_again(const char* key, TreeValue& value) {
+  const int length = tree_get(key, value, sizeof value);
+  if (length < 0 && errno != ENODATA) return SecondLook::kUnreadable;
+  return value[0] == '\0' ? SecondLook::kEmpty : SecondLook::kTaken;
+}
+
 // Returns where a target is to be stored, by a second look: its own slot, else `free`, which seems to be
 // free; kFailed when another target is there.
 int slot_to_take(int free, const char* target_name) {
   bool taken = false;
   for (int n = 1; n <= kMaxTargets; n++) {
     TreeValue name;
-    if (!tree_read(KeyText(key::kTargetName, n), name)) continue;
+    const SecondLook look = look_again(KeyText(key::kTargetName, n), name);
+    if (look == SecondLook::kEmpty) break;
+    if (look == SecondLook::kUnreadable) continue;
     if (strcmp(name, target_name) == 0) return n;
     taken = taken || n == free;
   }
@@ -87,9 +100,9 @@ int slot_to_take(int free, const char* target_name) {
 bool may_take_lun_slot(int n, int m, int lun) {
   for (int slot = 1; slot <= kMaxLunsPerTarget; slot++) {
     TreeValue number;
-    if (tree_read(KeyText(key::kLunNumber, n, slot), number) && (slot == m || atoi(number) == lun)) {
-      return false;
-    }
+    const SecondLook look = look_again(KeyText(key::kLunNumber, n, slot), number);
+    if (look == SecondLook::kEmpty) break;
+    if (look == SecondLook::kTaken && (slot == m || atoi(number) == lun)) return false;
   }
   return true;
 }

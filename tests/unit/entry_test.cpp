@@ -499,6 +499,24 @@ TEST_F(AddLun, RefusesANumberThatHasASlot) {
   EXPECT_EQ(fakes::writes(), Texts{});
 }
 
+TEST_F(AddLun, ANumberBehindAGapHasNoSlot) {
+  put_target(1);
+  put_lun(1, 1, 4);
+  put_lun(1, 3, 6);
+  TargetEntry entry = new_lun("iqn.t1", 6);
+  EXPECT_EQ(ktree_add_lun_entry(&entry), 2);
+  EXPECT_EQ(fakes::tree_get(lun_key(1, 2, "lun")), "6");
+}
+
+TEST_F(AddLun, RefusesANumberBehindASlotThatCouldNotBeRead) {
+  put_target(1);
+  for (int m = 1; m <= 3; m++) put_lun(1, m, m);
+  fakes::on("ktreec_get_wb", lun_key(1, 2, "lun")).returns(-1);
+  TargetEntry entry = new_lun("iqn.t1", 3);
+  EXPECT_EQ(ktree_add_lun_entry(&entry), -1);
+  EXPECT_EQ(fakes::writes(), Texts{});
+}
+
 TEST_F(AddLun, RefusesTheNinthLunOfTheSystem) {
   for (int n = 1; n <= 2; n++) {
     put_target(n);
@@ -566,6 +584,24 @@ TEST_F(AddTarget, FillsAGap) {
   put_target(3);
   TargetEntry entry = new_target("iqn.new");
   EXPECT_EQ(ktree_add_entry(&entry), 2);
+}
+
+TEST_F(AddTarget, ANameBehindAGapIsNew) {
+  put_target(1);
+  put_target(3);
+  TargetEntry entry = new_target("iqn.t3");
+  EXPECT_EQ(ktree_add_entry(&entry), 2);
+  EXPECT_EQ(entry.db_idx, 2);
+  put(target_key(2, "target"), "");
+  EXPECT_EQ(ktree_add_entry(&entry), 2) << "an empty name is a gap too";
+}
+
+TEST_F(AddTarget, ANameBehindASlotThatCouldNotBeReadKeepsItsOwn) {
+  for (int n = 1; n <= 3; n++) put_target(n);
+  fakes::on("ktreec_get_wb", target_key(2, "target")).returns(-1);
+  TargetEntry entry = new_target("iqn.t3");
+  EXPECT_EQ(ktree_add_entry(&entry), 3);
+  EXPECT_EQ(fakes::tree_get(target_key(2, "target")), "iqn.t2");
 }
 
 TEST_F(AddTarget, RefusesWhatIsIncomplete) {
