@@ -51,15 +51,14 @@ int fail(bool show_usage) {
   return kFailureStatus;
 }
 
-// Anybody can make a file in /tmp. A mark that is not root's is none.
-bool is_strangers_file(const char* path) {
+// Anybody can make a mark in /tmp. One that is not root's is none.
+bool is_strangers(const char* path) {
   struct stat info;
-  if (lstat(path, &info) != 0) return false;
-  return !S_ISREG(info.st_mode) || (info.st_uid != 0 && info.st_uid != geteuid());
+  return lstat(path, &info) == 0 && info.st_uid != 0 && info.st_uid != geteuid();
 }
 
 void copy_to_flash() {
-  if (access(kResetMark, F_OK) == 0 && !is_strangers_file(kResetMark)) return;
+  if (access(kResetMark, F_OK) == 0 && !is_strangers(kResetMark)) return;
   RunLock lock;
   lock.take("flash.lock", LockMode::kExclusive);               // the last to copy copies the newest settings
   System("%s", copy_to_flash_command(kSettingsFile).c_str());  // tells of a failure itself
