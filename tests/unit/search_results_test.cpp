@@ -2,6 +2,7 @@
 #include "tree/search_results.h"
 
 #include "fakes.h"
+#include "frontend/log.h"
 
 using namespace remvol;
 
@@ -11,6 +12,7 @@ constexpr char kSocket[] = "/var/run/ktree_sock_vv_search_lun";
 
 class SearchResults : public fakes::Test {
  protected:
+  ~SearchResults() override { debug_level = 0; }
   SearchResults() {
     second_.lun = 7;
     second_.size = 3000000000;
@@ -45,6 +47,30 @@ TEST_F(SearchResults, LunsOfAStoredTarget) {
           "set /temp/vv_search_lun/lun/id:2/size=3000000000", "set /temp/vv_search_lun/lun/id:2/avaliable=0",
           "set /temp/vv_search_lun/lun/id:2/fstype=ext4", "set /temp/vv_search_lun/lun/count=2"}));
   EXPECT_EQ(found("lun/count"), "2");
+}
+
+TEST_F(SearchResults, EveryWriteIsLogged) {
+  debug_level = 1;
+  const std::string log =
+      fakes::output_of([this] { EXPECT_EQ(ktree_update_search_lun_result(kSocket, &first_, "t"), 0); });
+  for (const std::string& write : fakes::writes()) {
+    EXPECT_TRUE(has(log, "ktreec_set " + write.substr(strlen("set "))));
+  }
+  EXPECT_EQ(fakes::writes().size(), 10u);
+}
+
+TEST_F(SearchResults, NothingFoundIsLoggedToo) {
+  debug_level = 1;
+  const std::string log =
+      fakes::output_of([] { EXPECT_EQ(ktree_update_search_lun_result(kSocket, nullptr, "t"), 0); });
+  EXPECT_TRUE(has(log, "ktreec_set /temp/vv_search_lun/lun/count=0"));
+}
+
+TEST_F(SearchResults, AShareNameThatIsUsedIsLogged) {
+  fakes::tree_set({{"/iscsi/initiator/id:2/lun/id:1/share", "data"}});
+  debug_level = 1;
+  EXPECT_EQ(messages([] { EXPECT_EQ(ktree_check_duplicate_share_name("data"), 1); }), "Found data\n");
+  EXPECT_EQ(messages([] { EXPECT_EQ(ktree_check_duplicate_share_name("Data"), 0); }), "");
 }
 
 TEST_F(SearchResults, EveryLunOfAnUnknownTargetIsAvailable) {
