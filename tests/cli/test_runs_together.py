@@ -616,7 +616,8 @@ class TestATreeThatIsStartedAnew:
         site.log_in("iqn.t1")
         site.disk("sdb")
         box.hook("system", re.compile("^chmod 777 "), through=True, times=1,
-                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); "
+                 "until ktreec -S /var/run/ktree_sock_vv -t >/dev/null 2>&1; [ $? -eq 3 ]; do sleep 0.01; done")
         assert box.remvol(*TestAdding.ADD).status == 255
         assert box.trace("usleep").count("usleep 100000") == 50
         assert "/mnt/VV/a" in box.run(["cat", "/proc/mounts"]).stdout
