@@ -7,6 +7,7 @@
 #include "iscsi/node.h"
 #include "iscsi/session.h"
 #include "iscsi/session_check.h"
+#include "iscsi/target_status.h"
 #include "support/program.h"
 #include "support/result.h"
 #include "support/text.h"
@@ -259,6 +260,15 @@ TEST_F(Iscsi, DisconnectFindsTheSlotByName) {
   EXPECT_EQ(Target_Disconnect(&known), 1);
   EXPECT_EQ(known.db_idx, 1);
   EXPECT_EQ(fakes::tree_get("/iscsi/initiator/id:1/conn_set"), "0");
+}
+
+TEST_F(Iscsi, TheStatusOfATargetWithoutASlotIsRefusedByTheTree) {
+  const TargetEntry nobody = {};
+  const std::string status = "ktreec_set(/iscsi/initiator/id:0/status) failed\n";
+  EXPECT_EQ(messages([&] { EXPECT_EQ(ktree_update_status(&nobody), -103); }),
+            status + status + status +
+                "ktreec_set(/iscsi/initiator/id:0/conn_state) failed\n"
+                "ktree_set_connect_state(0, 0) failed\n");
 }
 
 TEST_F(Iscsi, OfferOfNothing) {
