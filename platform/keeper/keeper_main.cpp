@@ -17,6 +17,7 @@
 #include <string_view>
 #include <vector>
 
+#include "common/begin.h"
 #include "common/processes.h"
 #include "common/report.h"
 #include "common/sessions.h"
@@ -197,6 +198,7 @@ constexpr char kHelp[] =
 }  // namespace keeper
 
 int main(int argc, char** argv) {
+  platform::begin();
   if (argc == 1) return keeper::serve();
   const std::string_view option = argv[1];
   if (option == "--try-first" && argc == 3) return keeper::try_target(argv[2], true);

@@ -19,6 +19,7 @@
 #include <string>
 #include <vector>
 
+#include "common/begin.h"
 #include "common/report.h"
 #include "ktree/endpoint.h"
 #include "ktree/server.h"
@@ -83,10 +84,7 @@ int parse_options(int argc, char** argv, DaemonOptions& options) {
   return -1;
 }
 
-// The tree holds secrets, which no core file may carry to a disk.
-void limit_process() {
-  const rlimit no_core = {0, 0};
-  setrlimit(RLIMIT_CORE, &no_core);
+void raise_descriptor_limit() {
   rlimit files = {};
   if (getrlimit(RLIMIT_NOFILE, &files) == 0) {
     files.rlim_cur = files.rlim_max;
@@ -139,7 +137,7 @@ int run_daemon(const DaemonOptions& options) {
   // lives. Nor is the folder that it was started in: a volume would stay busy.
   ktree::fill_standard_descriptors();
   close_range(STDERR_FILENO + 1, ~0U, 0);
-  limit_process();
+  raise_descriptor_limit();
   const int signals = open_signals();
   // Before anybody can ask: an empty tree counts as fresh.
   ktree::Service service;
@@ -166,6 +164,7 @@ int run_daemon(const DaemonOptions& options) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  platform::begin();
   try {
     DaemonOptions options;
     const int status = parse_options(argc, argv, options);

@@ -9,6 +9,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "common/begin.h"
 #include "common/file_text.h"
 #include "common/report.h"
 #include "common/tree_listing.h"
@@ -164,5 +165,6 @@ int run(int argc, char** argv) {
 }  // namespace notify
 
 int main(int argc, char** argv) {
+  platform::begin();
   return notify::run(argc, argv);
 }

@@ -16,6 +16,7 @@
 #include <cstring>
 #include <initializer_list>
 
+#include "common/begin.h"
 #include "common/report.h"
 #include "shares/flash.h"
 #include "shares/settings_copy.h"
@@ -112,6 +113,7 @@ int run_command(char** command, pid_t group, const sigset_t& callers_mask, bool 
 }  // namespace
 
 int main(int argc, char** argv) {
+  platform::begin();
   if (argc < 2) {
     fprintf(stderr, "usage: flashrun COMMAND-LINE | COMMAND ARGUMENT...\n");
     return kUsage;

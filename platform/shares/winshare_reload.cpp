@@ -14,6 +14,7 @@
 #include <string>
 #include <string_view>
 
+#include "common/begin.h"
 #include "shares/process.h"
 #include "shares/reload.h"
 #include "shares/server_config.h"
@@ -88,6 +89,7 @@ void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool h
 }  // namespace
 
 int main(int argc, char** argv) {
+  platform::begin();
   const ReloadCommand command = read_command(argc, argv);
   if (command == ReloadCommand::kWrong) return 2;
   open_log("winshare_reload");
