@@ -61,12 +61,14 @@ sigset_t awaited_signals() {
   return set;
 }
 
-// Waits for `child` and passes signals on to it. Returns its wait status.
+// Waits for `child` and passes signals on to it. Returns its wait status; of one that cannot be waited for,
+// as if it could not be run.
 int wait_for(pid_t child) {
   const sigset_t awaited = awaited_signals();
   for (;;) {
     int status = 0;
-    if (waitpid(child, &status, WNOHANG) == child) return status;
+    const pid_t ended = waitpid(child, &status, WNOHANG);
+    if (ended != 0) return ended == child ? status : kCannotRun << 8;
     const int number = sigwaitinfo(&awaited, nullptr);
     if (number > 0 && number != SIGCHLD) kill(child, number);
   }

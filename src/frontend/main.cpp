@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 
@@ -124,6 +125,11 @@ void leave_no_core() {
   prctl(PR_SET_DUMPABLE, 0);
 }
 
+// A caller that ignores the end of its children passes that on, and no command's status would be known.
+void hear_of_children() {
+  signal(SIGCHLD, SIG_DFL);
+}
+
 void log_arguments(int argc, char** argv, const int* shown) {
   for (int i = 0; i < argc; i++) {
     LOG(1, "arg[%d]: '%.*s%s'", i, shown[i], argv[i], shown[i] < 0 ? "" : kMaskedSecret);
@@ -135,6 +141,7 @@ void log_arguments(int argc, char** argv, const int* shown) {
 int main(int argc, char** argv) {
   const LogScope scope;
   leave_no_core();
+  hear_of_children();
   const Memory<int> shown = allocate<int>(static_cast<size_t>(argc) + 1);
   if (!shown) return fail(false);
   hide_secrets(argc, argv, shown.get());

@@ -54,9 +54,10 @@ class Events:
         folder = self.box.path(f"{SESSIONS}/session{number}")
         folder.rename(self.box.path(f"/sys/class/gone{number}"))
 
-    def start(self, *options):
+    def start(self, *options, under=()):
         preload = self.box.tools / "libnetlink.so"
-        self.daemon = self.box.start([self.box.build / "bin" / "remvol-events", *options], env={"LD_PRELOAD": str(preload)})
+        self.daemon = self.box.start([*under, self.box.build / "bin" / "remvol-events", *options],
+                                     env={"LD_PRELOAD": str(preload)})
         self.box.wait_until(self.place(DEVICE_EVENTS).exists, what="the listener")
         self.sync()
 
@@ -150,6 +151,13 @@ def test_a_loss_and_a_return_are_told(connected):
     connected.send(login_response(1))
     connected.state(1, "LOGGED_IN")
     connected.wait_runs(reopen("iqn.a"), recover("iqn.a"))
+
+
+def test_a_starter_that_ignores_the_end_of_its_children_makes_no_difference(events):
+    events.session(1, "iqn.a")
+    events.start(under=("env", "--ignore-signal=CHLD"))
+    events.wait_runs(recover("iqn.a"))
+    events.box.wait_until(lambda: events.box.runs("remvol-notify"), what="news of the end of the recovery")
 
 
 def test_the_return_is_told_when_the_session_is_usable_again(connected):

@@ -146,6 +146,21 @@ def test_the_status_is_the_commands(flash):
     assert flash.read_only
 
 
+@pytest.mark.parametrize("mounted", [False, True])
+def test_a_caller_that_ignores_the_end_of_its_children_gets_the_status(flash, mounted):
+    if mounted:
+        flash.mount()
+    done = flash.box.run(["env", "--ignore-signal=CHLD", *flash.argv(f"touch {FOLDER}/f; exit 7")], env={"LD_PRELOAD": None})
+    assert done.status == 7
+    assert not mounted or flash.read_only
+
+
+@pytest.mark.unsanitized
+def test_a_command_that_cannot_be_waited_for_has_failed(flash):
+    flash.mount()
+    assert traced(flash, ["-e", "inject=wait4:error=ECHILD"], "true").status == 126
+
+
 def test_several_words_are_run_without_a_shell(flash):
     flash.mount()
     assert flash.run("printf", "%s|", "a b", "$HOME").stdout == "a b|$HOME|"

@@ -95,6 +95,11 @@ def test_the_status_is_that_of_the_last_command(box, initiator, command, failing
     assert [call for call in box.trace() if call != "system winshare_reload"] == ROAD[command]
 
 
+def test_a_caller_that_ignores_the_end_of_its_children_gets_the_status(box, initiator):
+    done = box.run(["env", "--ignore-signal=CHLD", "remvol", "--deinit"])
+    assert done.status == 0 and "failed" not in done.stdout
+
+
 def test_the_log_tells_the_steps(box, initiator):
     box.tree.set("/iscsi/initiator/dbg", "2")
     done = take_down(box, "--deinit")

@@ -27,9 +27,9 @@ class Keeper:
         self.box.write(f"{SESSIONS}/session{number}/targetname", f"iqn.t{number}\n")
         self.box.write(f"{SESSIONS}/session{number}/state", "LOGGED_IN\n")
 
-    def start(self):
+    def start(self, *under):
         env = {"LD_PRELOAD": str(self.box.tools / "libnetlink.so")}
-        self.daemon = self.box.start([self.box.build / "bin/remvol-keeper"], env=env)
+        self.daemon = self.box.start([*under, self.box.build / "bin/remvol-keeper"], env=env)
 
     def wait_runs(self, *expected):
         self.box.wait_until(lambda: len(self.runs) >= len(expected), what=f"{expected}, ran {self.runs}")
@@ -63,6 +63,13 @@ def test_a_wanted_target_is_connected_when_its_portal_answers(keeper):
     assert keeper.runs == [("--status",)]
     listen(box)
     keeper.wait_runs(("--status",), ("--connect", "-n", "iqn.t1"))
+
+
+def test_a_starter_that_ignores_the_end_of_its_children_makes_no_difference(keeper):
+    keeper.target(1, port=3260)
+    listen(keeper.box)
+    keeper.start()
+    keeper.wait_runs(("--status",), ("--connect", "-n", "iqn.t1"), ("--connect", "-n", "iqn.t1"))
 
 
 @pytest.mark.parametrize("values", [{"wanted": 0}, {"state": 0}], ids=["not wanted", "taken away"])

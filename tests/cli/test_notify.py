@@ -230,6 +230,12 @@ def test_a_program_that_fails_does_not_keep_the_others_from_running(example):  #
     assert told(example)[0][0] == "test"
 
 
+def test_a_caller_that_ignores_the_end_of_its_children_hears_of_a_failure(example):  # noqa: F811
+    program(example, f"{PROGRAMS}/1", "exit 3")
+    done = example.run(["env", "--ignore-signal=CHLD", "remvol-notify", "--test"], env={"LD_PRELOAD": None})
+    assert done.status == 1 and f"remvol-notify: {PROGRAMS}/1: failed\n" in done.stderr
+
+
 @pytest.mark.long
 def test_a_program_that_hangs_is_ended(example):  # noqa: F811
     program(example, f"{PROGRAMS}/1", "trap '' TERM; sleep 1000 & sleep 1000; sleep 1000")

@@ -430,6 +430,13 @@ def test_without_the_tree_the_mounted_volumes_stay_shared(shares):
     assert shares.told() == [["all", "reload-config"], ["smbd", "close-share", "Goes"]]
 
 
+def test_a_caller_that_ignores_the_end_of_its_children_reads_of_no_failure(shares):
+    shares.add("V")
+    done = shares.box.run(["env", "--ignore-signal=CHLD", shares.box.build / "bin/winshare_reload"],
+                          env={"LD_PRELOAD": None, "PATH": f"{shares.path}:/usr/bin"})
+    assert (done.status, done.stderr) == (0, "")
+
+
 def test_a_hung_smbcontrol_does_not_hang_the_reload(shares):
     shares.box.fake("smbcontrol", delay=1000, times=1)
     shares.add("V")

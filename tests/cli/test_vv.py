@@ -665,6 +665,11 @@ def test_a_signal_ends_the_tool(photos):
     assert "remvol was ended by a signal: Killed" in done.stderr
 
 
+def test_a_caller_that_ignores_the_end_of_its_children_hears_of_a_failure(photos):
+    photos.box.fake("remvol", status=255)
+    assert photos.box.run(["env", "--ignore-signal=CHLD", "vv", "connect", "Photos"]).status == 1
+
+
 def test_the_tool_goes_on_when_the_front_end_is_killed(photos):
     photos.box.fake("winshare_reload", delay=1, stdout="reloaded\n" * 2000)
     running = photos.box.start(["vv", "connect", "Photos"])
