@@ -106,12 +106,10 @@ class Replacement {
     return wrong;
   }
 
-  // Writes it to the disk and gives it the name `file`. Returns 0 or an errno value.
+  // Writes it to the disk and gives it the name `file`; it stays open, and locked, until it has that. Returns
+  // 0 or an errno value.
   int commit(const char* file) {
-    if (fsync(fd_) != 0) return errno;
-    const int closed = close(fd_);
-    fd_ = -1;
-    if (closed != 0 || rename(path_, file) != 0) return errno;
+    if (fsync(fd_) != 0 || rename(path_, file) != 0) return errno;
     path_[0] = '\0';
     return 0;
   }
