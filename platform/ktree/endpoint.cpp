@@ -56,10 +56,11 @@ std::string system_error(const std::string& what) {
 
 }  // namespace
 
+// The socket last: as long as it is there, no successor has files of these names.
 Endpoint::~Endpoint() {
   if (folder_ >= 0) {
-    remove(socket_);
     remove(pid_);
+    remove(socket_);
     close(folder_);
   }
   if (pid_file_ >= 0) close(pid_file_);
@@ -74,8 +75,11 @@ int Endpoint::open_lock(const std::string& name) const {
       (info.st_mode & 077) == 0) {
     return fd;
   }
+  const int error = fd < 0 ? errno : EACCES;
   if (fd >= 0) close(fd);
-  return unlinkat(folder_, name.c_str(), 0) == 0 ? kNoLock : -1;
+  if (unlinkat(folder_, name.c_str(), 0) == 0) return kNoLock;
+  errno = error;
+  return -1;
 }
 
 // The holder removes the file when it is done, so the one that was waited for may be gone.
@@ -128,7 +132,7 @@ bool Endpoint::open_locked(const std::string& socket_path, const std::string& na
   return true;
 }
 
-bool Endpoint::make_free(const std::string& socket_path, std::string& error) const {
+bool Endpoint::is_free(const std::string& socket_path, std::string& error) {
   sockaddr_un address = {};
   struct stat info = {};
   if (!socket_address(socket_path, address)) {
@@ -144,11 +148,14 @@ bool Endpoint::make_free(const std::string& socket_path, std::string& error) con
     error = socket_path + ": another daemon listens on this socket";
     return false;
   }
-  if (unlink(socket_path.c_str()) != 0) {
-    error = system_error(socket_path);
-    return false;
-  }
   return true;
+}
+
+bool Endpoint::make_free(const std::string& socket_path, std::string& error) {
+  if (!is_free(socket_path, error)) return false;
+  if (unlink(socket_path.c_str()) == 0 || errno == ENOENT) return true;
+  error = system_error(socket_path);
+  return false;
 }
 
 // Under another name first: whoever sees the socket finds it answered.

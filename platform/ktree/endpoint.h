@@ -16,10 +16,14 @@ class Endpoint {
   Endpoint& operator=(const Endpoint&) = delete;
   ~Endpoint();
 
+  // Whether the place of the socket can be taken: no daemon answers there, and there is nothing else than a
+  // socket. Returns false with a message in `error`; nothing is touched.
+  [[nodiscard]] static bool is_free(const std::string& socket_path, std::string& error);
+
   // Makes the pid file SOCKET_NAME.pid and listens on `socket_path` (mode 0600), of at most 103 bytes. Both
-  // get their names when they are ready. A socket file that a dead daemon left is replaced; when a daemon
-  // answers on it, or it is no socket, nothing is touched. Two daemons that start at the same time keep out
-  // of each other's way by the lock file SOCKET.lock. Returns false with a message in `error`.
+  // get their names when they are ready. A socket file that a dead daemon left is replaced; when the place is
+  // not free, nothing is touched. Two daemons that start at the same time keep out of each other's way by the
+  // lock file SOCKET.lock. Returns false with a message in `error`.
   [[nodiscard]] bool open(const std::string& socket_path, const std::string& name, std::string& error);
 
   [[nodiscard]] int listener() const { return listener_; }
@@ -32,7 +36,7 @@ class Endpoint {
     ino_t inode = 0;
   };
 
-  [[nodiscard]] bool make_free(const std::string& socket_path, std::string& error) const;
+  [[nodiscard]] static bool make_free(const std::string& socket_path, std::string& error);
   [[nodiscard]] bool listen_on(const std::string& socket_path);
   [[nodiscard]] bool write_pid(const std::string& name);
   [[nodiscard]] bool remember(OwnFile& file, const std::string& name) const;

@@ -139,12 +139,13 @@ int run_daemon(const DaemonOptions& options) {
   close_range(STDERR_FILENO + 1, ~0U, 0);
   raise_descriptor_limit();
   const int signals = open_signals();
-  // Before anybody can ask: an empty tree counts as fresh.
   ktree::Service service;
-  ktree::load_first(options.settings, service);
   ktree::Endpoint endpoint;
   std::string error;
-  if (signals < 0 || !endpoint.open(options.socket, options.name, error)) {
+  const bool is_free = ktree::Endpoint::is_free(options.socket, error);
+  // Before anybody can ask: an empty tree counts as fresh. One that has to refuse leaves the settings alone.
+  if (is_free) ktree::load_first(options.settings, service);
+  if (signals < 0 || !is_free || !endpoint.open(options.socket, options.name, error)) {
     platform::report(LOG_ERR, "ktree: %s", error.empty() ? strerror(errno) : error.c_str());
     return EXIT_FAILURE;
   }

@@ -145,6 +145,23 @@ def test_the_files_of_a_successor_are_left_alone(daemon):
     assert daemon.pid_file.read_text() == "another's"
 
 
+def test_the_files_of_a_successor_stay_however_long_the_end_takes(place):
+    """The last of the files is removed a while later: the fifth removal, three belong to the start."""
+    words = [KTREE, "-n", "config", "-s", place.socket]
+    place.process = old = subprocess.Popen(
+        ["strace", "-f", "-o", "/dev/null", "-e", "inject=unlinkat:delay_enter=1500000:when=5", *words], env=TRACED)
+    until(place.answers)
+    os.kill(place.pid(), signal.SIGTERM)
+    while True:  # until one is not refused
+        place.process = subprocess.Popen(words, stderr=subprocess.DEVNULL)
+        try:
+            place.process.wait(1)
+        except subprocess.TimeoutExpired:
+            break
+    old.wait(20)
+    assert place.answers() and place.pid_file.read_text() == f"{place.process.pid}\n"
+
+
 def test_a_relative_path_does(place):
     place.process = subprocess.Popen([KTREE, "-n", "config", "-s", "sock"], cwd=place.folder)
     until(place.answers)
@@ -163,12 +180,24 @@ def test_places_it_cannot_use_are_named(place):
     assert os.listdir(place.folder) == []
 
 
-def start_as_nobody(place):
-    os.chown(place.folder, 65534, 65534)
-    place.folder.chmod(0o777)
+@pytest.mark.skipif(os.geteuid() != 0, reason="needs root to be somebody else")
+def test_a_folder_that_it_may_not_write_to_is_named(place):
+    done = run(for_nobody(place), "-n", "config", "-s", place.socket, user=65534, group=65534, extra_groups=[])
+    assert done.returncode == 1 and done.stderr == f"ktree: {place.folder}: Permission denied\n"
+
+
+def for_nobody(place):
+    """A copy of the daemon, which anybody may run."""
     ktree = place.folder / "ktree"
     ktree.write_bytes(KTREE.read_bytes())
     ktree.chmod(0o755)
+    return ktree
+
+
+def start_as_nobody(place):
+    os.chown(place.folder, 65534, 65534)
+    place.folder.chmod(0o777)
+    ktree = for_nobody(place)
     place.process = subprocess.Popen([ktree, "-n", "config", "-s", place.socket], user=65534, group=65534,
                                      extra_groups=[])
     until(place.answers)
@@ -235,6 +264,16 @@ def test_it_starts_with_the_next_file_and_keeps_the_damaged_one(place, damaged, 
     assert (kept.read_text() if kept.exists() else None) == damaged
     assert place.run("-D", place.folder / "vv.xml").returncode == 0
     assert (kept.read_text() if kept.exists() else None) == damaged
+
+
+def test_a_second_daemon_touches_no_settings(daemon):
+    file, kept = daemon.folder / "vv.xml", daemon.folder / "vv.xml.damaged"
+    file.write_text("rubbish")
+    kept.write_text("kept before")
+    second = run(KTREE, "-n", "config", "-s", daemon.socket, "-l", file)
+    assert second.returncode == 1
+    assert second.stderr == f"ktree: {daemon.socket}: another daemon listens on this socket\n"
+    assert kept.read_text() == "kept before"
 
 
 def test_without_any_settings_it_starts_empty(place):
