@@ -37,9 +37,9 @@ int main(int argc, char** argv) {
   } else if (!config.includes_shares && !done.shares.empty()) {
     log_line(LOG_WARNING, "%s does not include %s; nobody sees the shares", kConfig, kShares);
   }
+  if (!done.untold) return 0;
   // netatalk(8): SIGHUP makes it and its servers read the configuration again.
-  if (done.changed && run({"killall", "-q", "-HUP", "netatalk"}) != 0) {
-    log_line(LOG_WARNING, "netatalk does not run");
-  }
+  if (run({"killall", "-q", "-HUP", "netatalk"}) != 0) log_line(LOG_WARNING, "netatalk does not run");
+  remember_told(kShares);
   return 0;
 }

@@ -1,5 +1,7 @@
 #include "shares/reload.h"
 
+#include <unistd.h>
+
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
@@ -12,6 +14,8 @@
 
 namespace shares {
 namespace {
+
+constexpr char kUntoldMark[] = ".untold";  // behind the name of the generated file
 
 Section share_of(const SharedVolume& volume, const ShareServer& server, const AccessRule* rule) {
   std::string options = volume.read_only ? "\tread only = yes\n" : "\tread only = no\n";
@@ -57,6 +61,30 @@ std::vector<Section> missing_from(const std::vector<Section>& now, std::vector<S
                        [&old](const Section& share) { return share.name == old.name; });
   });
   return before;
+}
+
+// Takes the names that are in the mark: one a line.
+std::vector<std::string> untold_names(const std::string& mark) {
+  std::vector<std::string> names;
+  const std::string text = read_file(mark.c_str());
+  for (std::string_view rest = text; !rest.empty();) {
+    const size_t end = std::min(rest.find('\n'), rest.size());
+    names.emplace_back(rest.substr(0, end));
+    rest.remove_prefix(std::min(end + 1, rest.size()));
+  }
+  return names;
+}
+
+void add_names(const std::vector<Section>& sections, std::vector<std::string>& names) {
+  for (const Section& section : sections) {
+    if (std::find(names.begin(), names.end(), section.name) == names.end()) names.push_back(section.name);
+  }
+}
+
+void mark_untold(const std::string& mark, const std::vector<std::string>& names) {
+  std::string text;
+  for (const std::string& name : names) text += name + "\n";
+  replace_file(mark.c_str(), text);
 }
 
 // Shares whose users have changed: whoever is in one and may no longer be is to be put out.
@@ -120,13 +148,22 @@ Reload reload_shares(const ShareServer& server) {
   Reload done{};
   done.has_tree = server.withdraw || read_volumes(volumes);
   done.shares = done.has_tree ? shares_of_tree(server, volumes, before) : still_mounted(before);
-  done.gone = missing_from(done.shares, before);
-  done.barred = barred_in(done.shares, before);
-  done.changed = done.shares != before;
-  if (done.changed && !replace_file(server.file, compose(server.reload, done.shares))) {
+  const std::string mark = server.file + std::string(kUntoldMark);
+  done.cut_off = untold_names(mark);
+  add_names(missing_from(done.shares, before), done.cut_off);
+  add_names(barred_in(done.shares, before), done.cut_off);
+  const bool changed = done.shares != before;
+  done.untold = changed || access(mark.c_str(), F_OK) == 0;
+  // The mark first: whoever dies behind the other file has told nobody.
+  if (changed) mark_untold(mark, done.cut_off);
+  if (changed && !replace_file(server.file, compose(server.reload, done.shares))) {
     log_line(LOG_WARNING, "%s cannot be written: %s", server.file, strerror(errno));
   }
   return done;
+}
+
+void remember_told(const char* file) {
+  unlink((file + std::string(kUntoldMark)).c_str());
 }
 
 }  // namespace shares

@@ -28,11 +28,10 @@ enum class ReloadCommand { kReload, kWithdraw, kWrong };
 ReloadCommand read_command(int argc, char** argv);
 
 struct Reload {
-  bool has_tree;                // false: the tree was asked, and the shares are those that are still mounted
-  bool changed;                 // the generated file was replaced
-  std::vector<Section> shares;  // what it holds now
-  std::vector<Section> gone;    // what it held before
-  std::vector<Section> barred;  // shares whose users have changed
+  bool has_tree;  // false: the tree was asked, and the shares are those that are still mounted
+  bool untold;    // the server is to be told of a change: of this one, or of one that it was not told of
+  std::vector<Section> shares;       // what the generated file is to hold now
+  std::vector<std::string> cut_off;  // shares that it held and that are gone, or whose users have changed
 };
 
 inline constexpr char kAccessFile[] = "/etc/remvol/shares.conf";
@@ -40,8 +39,11 @@ inline constexpr char kAccessFile[] = "/etc/remvol/shares.conf";
 // Brings the generated file up to date. While the file that says who may use a share is wrong, of which a
 // line in the log tells, shares stay as they are as long as they are mounted, and no new one comes. A volume
 // that failed or whose name the server cannot use is left out with a line in the log, and so is a change that
-// cannot be written.
+// cannot be written. A mark beside the file keeps what is untold until remember_told().
 Reload reload_shares(const ShareServer& server);
+
+// The server has been told all, or will read it when it starts.
+void remember_told(const char* file);
 
 }  // namespace shares
 

@@ -2,8 +2,8 @@
 // go.
 //
 // The shares stand in a file of their own that smb.conf includes. A running server is told only when that
-// file changed, and clients of a share that is gone are cut off, since the folder below it is no volume any
-// more, and so are those of a share whose users have changed.
+// file changed, or when it could not be told the last time. Clients of a share that is gone are cut off,
+// since the folder below it is no volume any more, and so are those of a share whose users have changed.
 #include <glob.h>
 
 #include <algorithm>
@@ -64,14 +64,16 @@ bool samba_runs() {
   return pid > 0 && (kill(pid, 0) == 0 || errno == EPERM);
 }
 
-void tell_samba(const Reload& done) {
-  if (!samba_runs()) log_line(LOG_NOTICE, "Samba does not run; it finds the shares when it starts");
-  if (run({"smbcontrol", "all", "reload-config"}) != 0) {
-    log_line(LOG_WARNING, "smbcontrol failed; Samba may not know the shares");
+// Returns whether it was told all; one that does not run reads it when it starts.
+bool tell_samba(const Reload& done) {
+  const bool runs = samba_runs();
+  if (!runs) log_line(LOG_NOTICE, "Samba does not run; it finds the shares when it starts");
+  bool told = run({"smbcontrol", "all", "reload-config"}) == 0;
+  if (!told) log_line(LOG_WARNING, "smbcontrol failed; Samba may not know the shares");
+  for (const std::string& share : done.cut_off) {
+    told = run({"smbcontrol", "smbd", "close-share", share}) == 0 && told;
   }
-  for (const std::vector<Section>* shares : {&done.gone, &done.barred}) {
-    for (const Section& share : *shares) run({"smbcontrol", "smbd", "close-share", share.name});
-  }
+  return told || !runs;
 }
 
 void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool has_samba) {
@@ -103,6 +105,6 @@ int main(int argc, char** argv) {
                                      options_for_macs(config), command == ReloadCommand::kWithdraw});
   const bool has_samba = is_installed("smbcontrol");
   tell_what_is_missing(done, config, has_samba);
-  if (done.changed && has_samba) tell_samba(done);
+  if (done.untold && (!has_samba || tell_samba(done))) remember_told(kShares);
   return 0;
 }

@@ -17,6 +17,10 @@ def section(name, read_only=False, options=""):
     return f"[{name}]\n\tpath = /mnt/VV/{name}\n\tread only = {'yes' if read_only else 'no'}\n{options}"
 
 
+# The fake that it runs is the parent of the effect's shell.
+KILL_THE_RELOAD = "kill -9 $(cut -d' ' -f4 /proc/$PPID/stat)"
+
+
 class Shares:
     """A box with Samba (its control program fake, its server the box's first process) and no module for Macs."""
 
@@ -415,6 +419,45 @@ def test_a_failing_smbcontrol_is_one_line(shares):
     assert shares.reload() == "winshare_reload: smbcontrol failed; Samba may not know the shares\n"
 
 
+def test_what_samba_was_not_told_it_is_told_by_the_next_reload(shares):
+    for name in ("Stays", "Goes", "Follows"):
+        shares.add(name)
+    shares.reload()
+    shares.umount("Goes")
+    shares.box.fake("smbcontrol", status=1, times=3)
+    failed = "winshare_reload: smbcontrol failed; Samba may not know the shares\n"
+    assert shares.reload() == failed
+    shares.umount("Follows")
+    assert shares.reload() == failed
+    shares.told()
+    assert shares.reload() == ""
+    assert shares.told() == [["all", "reload-config"], ["smbd", "close-share", "Goes"], ["smbd", "close-share", "Follows"]]
+    assert shares.reload() == "" and shares.told() == []
+    assert sorted(os.listdir(shares.box.path("/run/remvol"))) == ["smb-shares.conf", "smb-shares.lock"]
+
+
+@pytest.mark.parametrize("killed", ["all reload-config", "smbd close-share Goes"])
+def test_what_a_killed_reload_left_untold_is_told_by_the_next(shares, killed):
+    shares.add("Goes")
+    shares.reload()
+    shares.umount("Goes")
+    shares.box.fake("smbcontrol", killed, effect=KILL_THE_RELOAD, times=1)
+    env = {"LD_PRELOAD": None, "PATH": f"{shares.path}:/usr/bin:/bin"}
+    assert shares.box.run([shares.box.build / "bin/winshare_reload"], env=env).status == -9
+    shares.told()
+    assert shares.reload() == ""
+    assert shares.told() == [["all", "reload-config"], ["smbd", "close-share", "Goes"]]
+
+
+def test_a_samba_that_does_not_run_is_told_once(shares):
+    shares.box.path("/run/samba/smbd.pid").unlink()
+    shares.box.fake("smbcontrol", status=1)
+    shares.add("V")
+    assert "Samba does not run" in shares.reload()
+    shares.told()
+    assert shares.reload() == "" and shares.told() == []
+
+
 def test_without_the_tree_the_mounted_volumes_stay_shared(shares):
     shares.add("Stays", vol_access_right="0")
     shares.add("Goes")
@@ -570,6 +613,16 @@ def test_a_stopped_netatalk_is_one_line(netatalk):
     netatalk.box.fake("killall", status=1)
     netatalk.add("V")
     assert netatalk.reload("macshare_reload") == "macshare_reload: netatalk does not run\n"
+    assert netatalk.reload("macshare_reload") == ""
+
+
+def test_what_netatalk_was_not_told_it_is_told_by_the_next_reload(netatalk):
+    netatalk.add("V")
+    netatalk.box.fake("killall", effect=KILL_THE_RELOAD, times=1)
+    env = {"LD_PRELOAD": None, "PATH": f"{netatalk.path}:/usr/bin:/bin"}
+    assert netatalk.box.run([netatalk.box.build / "bin/macshare_reload"], env=env).status == -9
+    assert netatalk.reload("macshare_reload") == ""
+    assert len(netatalk.box.runs("killall")) == 2
 
 
 def test_a_system_without_the_utf8_locale_serves_the_same_names(shares):
