@@ -29,23 +29,6 @@ namespace {
 constexpr char kFolder[] = "/etc/remvol/events.d";
 constexpr int kPatience = 1000;  // milliseconds that a program is waited for before the next one starts
 
-struct LogForm {
-  int priority;            // syslog(3)
-  const char* message_id;  // in packaging/remvol.catalog
-};
-
-// By the numbers of EventKind.
-constexpr LogForm kLogForms[] = {
-    {LOG_ERR, "9ed0f88078e84644a9615f20f9b7ec79"},      // lost
-    {LOG_NOTICE, "a8b67254a84d414cb92c138f6c361f06"},   // back
-    {LOG_ERR, "cec71bd45f8842eca898881f1e7c00d3"},      // read-only
-    {LOG_ERR, "aca10eddad834bdaac8dd594cc5bc8c3"},      // recovery-failed
-    {LOG_ERR, "e4ba738ea99d4eadb5764d1c5b8ae028"},      // volume-failed
-    {LOG_NOTICE, "3c186e39b1474c6490c124c1b5596931"},   // format-done
-    {LOG_WARNING, "098f1413d38b43139c6787ef678e9a8b"},  // nearly-full
-    {LOG_INFO, "746f55b499aa48c6823cf5891c771352"},     // test
-};
-
 bool complain(const std::string& subject, const char* why) {
   platform::report(LOG_WARNING, "remvol-notify: %s: %s", subject.c_str(), why);
   return false;
@@ -53,15 +36,14 @@ bool complain(const std::string& subject, const char* why) {
 
 // Where no journal listens, standard error gets the message.
 bool log_event(const Event& event) {
-  const LogForm& form = kLogForms[static_cast<size_t>(event.kind)];
+  const EventForm& form = form_of(event.kind);
   if (access("/run/systemd/journal/socket", W_OK) != 0) {
     fprintf(stderr, "%s\n", event.message.c_str());
     return true;
   }
-  const int result =
-      sd_journal_send("MESSAGE=%s", event.message.c_str(), "PRIORITY=%d", form.priority, "MESSAGE_ID=%s",
-                      form.message_id, "EVENT=%s", name_of(event.kind).c_str(), "TARGET=%s",
-                      event.target.c_str(), "SHARE=%s", event.share.c_str(), nullptr);
+  const int result = sd_journal_send("MESSAGE=%s", event.message.c_str(), "PRIORITY=%d", form.priority,
+                                     "MESSAGE_ID=%s", form.message_id, "EVENT=%s", form.name, "TARGET=%s",
+                                     event.target.c_str(), "SHARE=%s", event.share.c_str(), nullptr);
   return result >= 0 || complain("journal", strerror(-result));
 }
 
@@ -138,7 +120,7 @@ std::string host_name() {
 void mail_event(const Event& event, const Config& config, Runs& runs) {
   std::string text = "From: " + (config.mail_from.empty() ? "root" : config.mail_from) + "\n";
   text.append("To: ").append(config.mail_address).append("\n");
-  text.append("Subject: ").append(name_of(event.kind)).append(" on ").append(host_name());
+  text.append("Subject: ").append(form_of(event.kind).name).append(" on ").append(host_name());
   text.append("\nContent-Type: text/plain; charset=utf-8\nAuto-Submitted: auto-generated\n\n");
   text.append(event.message).append("\n\nvvstat -x shows what needs attention.\n");
   const int mail = memfd_create("mail", MFD_CLOEXEC);
@@ -173,7 +155,7 @@ std::vector<std::string> programs() {
 }
 
 void put_into_environment(const Event& event) {
-  setenv("REMVOL_EVENT", name_of(event.kind).c_str(), 1);
+  setenv("REMVOL_EVENT", form_of(event.kind).name, 1);
   setenv("REMVOL_TARGET", event.target.c_str(), 1);
   setenv("REMVOL_SHARE", event.share.c_str(), 1);
   setenv("REMVOL_MESSAGE", event.message.c_str(), 1);
@@ -181,7 +163,8 @@ void put_into_environment(const Event& event) {
 
 void run_programs(const Event& event, const Config& config, Runs& runs) {
   put_into_environment(event);
-  if (!config.program.empty()) runs.start({config.program, name_of(event.kind), event.target, event.share});
+  if (!config.program.empty())
+    runs.start({config.program, form_of(event.kind).name, event.target, event.share});
   for (const std::string& program : programs()) runs.start({program});
 }
 

@@ -1,6 +1,9 @@
 #include "notify/history.h"
 
+#include <syslog.h>
+
 #include <algorithm>
+#include <iterator>
 #include <utility>
 
 #include "common/utf8.h"
@@ -14,6 +17,25 @@ using vvstat::Row;
 constexpr time_t kSettled = 60;  // seconds
 // A volume is nearly full from the first on, and no longer so below the second.
 constexpr double kNearlyFull = 0.95, kNotSoFull = 0.90;
+
+constexpr EventForm kForms[] = {
+    {EventKind::kLost, "lost", LOG_ERR, "9ed0f88078e84644a9615f20f9b7ec79"},
+    {EventKind::kBack, "back", LOG_NOTICE, "a8b67254a84d414cb92c138f6c361f06"},
+    {EventKind::kReadOnly, "read-only", LOG_ERR, "cec71bd45f8842eca898881f1e7c00d3"},
+    {EventKind::kRecoveryFailed, "recovery-failed", LOG_ERR, "aca10eddad834bdaac8dd594cc5bc8c3"},
+    {EventKind::kVolumeFailed, "volume-failed", LOG_ERR, "e4ba738ea99d4eadb5764d1c5b8ae028"},
+    {EventKind::kFormatDone, "format-done", LOG_NOTICE, "3c186e39b1474c6490c124c1b5596931"},
+    {EventKind::kNearlyFull, "nearly-full", LOG_WARNING, "098f1413d38b43139c6787ef678e9a8b"},
+    {EventKind::kTest, "test", LOG_INFO, "746f55b499aa48c6823cf5891c771352"},
+};
+
+constexpr bool is_each_at_its_number() {
+  for (size_t at = 0; at < std::size(kForms); at++) {
+    if (static_cast<size_t>(kForms[at].kind) != at) return false;
+  }
+  return std::size(kForms) == static_cast<size_t>(EventKind::kTest) + 1;
+}
+static_assert(is_each_at_its_number());
 
 std::string share_of(const Row& row) {
   return row.volume != nullptr ? platform::printable(row.volume->share) : std::string();
@@ -103,10 +125,8 @@ Past first_look(const Row& row, time_t now, time_t last_look) {
 
 }  // namespace
 
-std::string name_of(EventKind kind) {
-  constexpr const char* kNames[] = {"lost",          "back",        "read-only",   "recovery-failed",
-                                    "volume-failed", "format-done", "nearly-full", "test"};
-  return kNames[static_cast<size_t>(kind)];
+const EventForm& form_of(EventKind kind) {
+  return kForms[static_cast<size_t>(kind)];
 }
 
 std::vector<Event> compare(const std::vector<Row>& rows, time_t now, time_t last_look, History& history) {

@@ -23,14 +23,22 @@ enum class EventKind {
   kTest
 };
 
+// What is the same for all events of a kind.
+struct EventForm {
+  EventKind kind;
+  const char* name;
+  int priority;            // syslog(3)
+  const char* message_id;  // in packaging/remvol.catalog
+};
+
+const EventForm& form_of(EventKind kind);
+
 struct Event {
   EventKind kind;
   std::string target;
   std::string share;    // empty for one of a target without volumes
   std::string message;  // a sentence for a person, of printable text
 };
-
-std::string name_of(EventKind kind);
 
 // Compares the rows with the history, brings it up to date, and returns what is to be told. What is
 // wrong is told at once, and not again before the volume has been well for a minute, which is told then: a

@@ -185,7 +185,7 @@ def test_the_command_of_a_message_can_be_copied_whatever_the_name_is(example, jo
 
 
 def test_every_event_has_a_text_in_the_catalog(example, journal):  # noqa: F811
-    source = (pathlib.Path(__file__).resolve().parents[2] / "platform/notify/delivery.cpp").read_text()
+    source = (pathlib.Path(__file__).resolve().parents[2] / "platform/notify/history.cpp").read_text()
     ids = re.findall(r'"([0-9a-f]{32})"', source)
     catalog = (PACKAGING / "remvol.catalog").read_text()
     assert len(ids) == len(set(ids)) == 8

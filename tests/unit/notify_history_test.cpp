@@ -28,7 +28,7 @@ class Told : public testing::Test {
     row_.problem.what = ailment == Ailment::kNone ? "" : "is ill";
     std::vector<std::string> names;
     for (const Event& event : compare({row_}, kStart + seconds, last_look_, history_)) {
-      names.push_back(name_of(event.kind));
+      names.push_back(form_of(event.kind).name);
       message_ = event.message;
     }
     last_look_ = kStart + seconds;
