@@ -35,7 +35,8 @@ int ktreec_get_wb(const char* socket, unsigned flags, const char* path, char* bu
 int ktreec_del(const char* socket, unsigned flags, const char* path);
 
 /* Writes the whole tree to `file` as XML, mode 0600, replacing it in one step, and has it on the disk. A file
- * that holds this already, with this mode and owner, stays. Returns 0, or -1; the file is then as it was. */
+ * that holds this already, with this mode and owner, stays. Returns 0, or -1; the file is then as it was,
+ * unless the very last step failed, the writing of the folder to its disk. */
 int ktreec_dump(const char* socket, unsigned flags, const char* file);
 
 /* Makes the tree what `file` holds. Returns 0, or -1 when the file is missing or damaged; the tree is then as

@@ -13,7 +13,7 @@ unsigned digit_value(char c) {
   return c == '/' ? 63 : kNoDigit;
 }
 
-// Decodes the `digits` (2 to 4) characters of one quantum into digits - 1 bytes.
+// Decodes the 2 to 4 characters of a quantum, its padding left off, into one byte less.
 bool decode_quantum(std::string_view quantum, std::string& bytes) {
   unsigned bits = 0;
   for (char c : quantum) {
