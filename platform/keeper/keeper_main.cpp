@@ -37,10 +37,10 @@ constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 
 struct Keeper {
   Schedule schedule;
+  Schedule initiator{kLooksWithoutInitiator};  // its daemon in place of a target
   int signals = -1, devices = -1;
-  pid_t process = -1;    // tries a target at this moment
-  int no_initiator = 0;  // looks in a row
-  bool first = true;     // no look yet: what is away now was taken down when the settings say so
+  pid_t process = -1;  // tries a target at this moment
+  bool first = true;   // no look yet: what is away now was taken down when the settings say so
 };
 
 time_t now() {
@@ -68,18 +68,29 @@ pid_t start_program(std::initializer_list<const char*> words, const char* progra
   return process;
 }
 
-// Without the daemon no lost session is healed and none is made. Whoever stops it on purpose stops the tree
-// as well, or is still at work.
-void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
-  if (!tree_answers || taken_down || platform::runs(kInitiatorDaemon) ||
-      platform::runs(platform::kTool, {"--init"})) {
-    daemon.no_initiator = 0;
-    return;
+void tell_of_initiator(Keeper& daemon) {
+  std::string name;
+  for (Change change; (change = daemon.initiator.next_change(name)) != Change::kNone;) {
+    if (change == Change::kMissing) {
+      platform::report(LOG_WARNING, "remvol-keeper: %s is gone, starting another one", name.c_str());
+    } else {
+      platform::report(LOG_NOTICE, "remvol-keeper: %s is there again", name.c_str());
+    }
   }
-  if (++daemon.no_initiator < kLooksWithoutInitiator) return;
-  daemon.no_initiator = 0;
-  platform::report(LOG_WARNING, "remvol-keeper: %s is gone, starting another one", kInitiatorDaemon);
-  start_program({kInitiatorDaemon, "-f"}, kInitiatorDaemon);
+}
+
+// Without the daemon no lost session is healed and none is made. Whoever stops it on purpose is still at
+// work, or has stopped the tree as well. Where that comes again of itself so does the daemon, as nothing says
+// then that it was stopped.
+void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
+  std::vector<Wanted> wanted;
+  if (tree_answers && !taken_down && !platform::runs(platform::kTool, {"--init"})) {
+    wanted.push_back({kInitiatorDaemon, platform::runs(kInitiatorDaemon), false, false});
+  }
+  daemon.initiator.look(wanted, now());
+  tell_of_initiator(daemon);
+  Try next;
+  if (daemon.initiator.next_try(next, now())) start_program({kInitiatorDaemon, "-f"}, kInitiatorDaemon);
 }
 
 std::vector<Wanted> read_wanted(bool first, bool& answered) {
@@ -146,7 +157,7 @@ bool take_signals(Keeper& daemon) {
 // still there.
 bool wait_for_look(Keeper& daemon) {
   static unsigned char buffer[1 << 14];
-  const bool hurry = daemon.schedule.anything_missing() || daemon.no_initiator > 0;
+  const bool hurry = daemon.schedule.anything_missing() || daemon.initiator.anything_missing();
   const time_t due = now() + (hurry ? kHurry : kRest);
   for (bool session = false; !session && now() < due;) {
     pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}};

@@ -5,9 +5,6 @@
 namespace keeper {
 namespace {
 
-// A recovery logs out and in again: a session is missing only when it stays away for several looks.
-constexpr int kLooks = 3;
-
 // While somebody brings a target up, which takes all the longer where the machine is slow.
 constexpr int kLooksAtWork = 60;
 
@@ -22,7 +19,7 @@ Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
   return targets_.back();
 }
 
-void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) {
+void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) const {
   if (wanted.connected) {
     target.tell = target.missing && !target.tell;
     target.missing = target.taken = false;
@@ -32,7 +29,7 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) {
   // Only a target that loses its session while somebody is at it is meant.
   if (target.absent == 0 && wanted.is_taken) target.taken = true;
   if (target.taken || target.missing) return;
-  if (++target.absent < (wanted.at_work ? kLooksAtWork : kLooks)) return;
+  if (++target.absent < (wanted.at_work ? kLooksAtWork : looks_)) return;
   target.missing = target.tell = true;
   target.pause = kFirstPause;
   target.due = now;

@@ -25,6 +25,10 @@ enum class Change { kNone, kMissing, kBack };
 
 class Schedule {
  public:
+  // A target is missing when it stays away for that many looks: a recovery logs out and in again.
+  static constexpr int kLooks = 3;
+  explicit Schedule(int looks = kLooks) : looks_(looks) {}
+
   // Compares with what the machine has; to be called about once a second, `now` in seconds. A target that is
   // no longer wanted is forgotten.
   void look(const std::vector<Wanted>& wanted, time_t now);
@@ -52,8 +56,9 @@ class Schedule {
   };
 
   AwaitedTarget& find(const std::string& name);
-  static void settle(AwaitedTarget& target, const Wanted& wanted, time_t now);
+  void settle(AwaitedTarget& target, const Wanted& wanted, time_t now) const;
 
+  int looks_;
   std::vector<AwaitedTarget> targets_;
 };
 

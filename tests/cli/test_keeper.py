@@ -115,6 +115,15 @@ def test_the_initiator_is_started_when_it_is_gone(keeper):
     assert list(keeper.box.runs("iscsid")[0]) == ["-f"]
 
 
+def test_an_initiator_that_dies_again_and_again_is_told_of_once(keeper):
+    keeper.box.fake("iscsid", skip=2, delay=1000)
+    keeper.start()
+    keeper.box.wait_until(lambda: "there again" in keeper.daemon.stderr, what="iscsid being there")
+    assert len(keeper.box.runs("iscsid")) == 3
+    assert keeper.daemon.stderr.splitlines() == ["remvol-keeper: iscsid is gone, starting another one",
+                                                 "remvol-keeper: iscsid is there again"]
+
+
 def test_without_the_tree_nothing_is_started(keeper):
     keeper.box.tree.stop()
     keeper.start()

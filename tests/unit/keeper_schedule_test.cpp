@@ -49,6 +49,15 @@ TEST_F(KeeperSchedule, StepsGrowToAMinute) {
   EXPECT_EQ(change(), Change::kNone);
 }
 
+TEST_F(KeeperSchedule, TwoLooksAreEnoughForWhoSaysSo) {
+  schedule_ = Schedule(2);
+  look(kConnected);
+  look(kAbsent);
+  EXPECT_EQ(change(), Change::kNone);
+  look(kAbsent);
+  EXPECT_EQ(change(), Change::kMissing);
+}
+
 TEST_F(KeeperSchedule, WhatARecoveryIsAtIsNotMissingYet) {
   look(kConnected);
   at_work_ = true;
