@@ -4,6 +4,7 @@ import configparser
 import pathlib
 import re
 import shlex
+import signal
 
 import pytest
 
@@ -48,43 +49,115 @@ def helper(box, name, *args):
 # --- smb.conf ---
 
 
+@pytest.fixture
+def samba(bare_box):
+    """A box in which nothing was included yet."""
+    bare_box.run(["rm", "-rf", "/var/lib/remvol", "/etc/samba"])
+    return bare_box
+
+
+def configurations(box):
+    return sorted(path.name for path in box.path("/etc/samba").iterdir())
+
+
 @pytest.mark.parametrize("text", ["", "[global]\n", "[global]\n workgroup = W\n\n[homes]\n\n\n", "a\n\n\nb\n\n", "\n"])
-def test_the_include_comes_and_goes_without_a_trace(bare_box, text):
-    path = bare_box.write(SMB_CONF, text, mode=0o640)
-    assert helper(bare_box, "samba-include", "add").status == 0
+def test_the_include_comes_and_goes_without_a_trace(samba, text):
+    path = samba.write(SMB_CONF, text, mode=0o640)
+    assert helper(samba, "samba-include", "add").status == 0
     assert path.read_text() == text + BLOCK
-    assert helper(bare_box, "samba-include", "add").status == 0
+    assert helper(samba, "samba-include", "add").status == 0
     assert path.read_text() == text + BLOCK
     assert path.stat().st_mode & 0o777 == 0o640
-    assert helper(bare_box, "samba-include", "remove").status == 0
+    assert helper(samba, "samba-include", "remove").status == 0
     assert path.read_text() == text
-    assert sorted(p.name for p in path.parent.iterdir() if p.name.startswith("smb.conf")) == ["smb.conf"]
+    assert configurations(samba) == ["smb.conf"]
 
 
-def test_what_came_after_the_include_stays(bare_box):
-    path = bare_box.write(SMB_CONF, "[global]\n" + BLOCK + "\n[mine]\npath = /srv\n")
-    helper(bare_box, "samba-include", "remove")
+def test_what_came_after_the_include_stays(samba):
+    path = samba.write(SMB_CONF, "[global]\n" + BLOCK + "\n[mine]\npath = /srv\n")
+    helper(samba, "samba-include", "remove")
     assert path.read_text() == "[global]\n\n[mine]\npath = /srv\n"
 
 
-def test_an_include_of_the_administrator_is_left_alone(bare_box):
+def test_an_include_of_the_administrator_is_left_alone(samba):
     text = "[global]\n\tinclude=/run/remvol/smb-shares.conf\n"
-    path = bare_box.write(SMB_CONF, text)
+    path = samba.write(SMB_CONF, text)
     for action in ("add", "remove"):
-        assert helper(bare_box, "samba-include", action).status == 0
+        assert helper(samba, "samba-include", action).status == 0
         assert path.read_text() == text
 
 
-def test_without_samba_nothing_is_included(bare_box):
-    bare_box.run(["rm", "-rf", "/etc/samba"])
+def test_without_samba_nothing_is_included(samba):
     for action in ("add", "remove"):
-        assert helper(bare_box, "samba-include", action).status == 0
-    assert not bare_box.path("/etc/samba").exists()
+        assert helper(samba, "samba-include", action).status == 0
+    assert not samba.path("/etc/samba").exists()
 
 
-def test_samba_include_wants_to_know_what_to_do(bare_box):
-    bare_box.write(SMB_CONF, "")
-    assert helper(bare_box, "samba-include").status == 2
+@pytest.mark.parametrize("text", ["[global]\n", "[global]\n" + BLOCK])
+def test_an_include_that_the_administrator_takes_out_stays_out(samba, text):
+    """Also one that was there before it was noted that it once came."""
+    path = samba.write(SMB_CONF, text)
+    helper(samba, "samba-include", "add")
+    assert path.read_text() == "[global]\n" + BLOCK
+    path.write_text("[global]\n")
+    assert helper(samba, "samba-include", "add").status == 0
+    assert path.read_text() == "[global]\n"
+    helper(samba, "samba-include", "remove")
+    helper(samba, "samba-include", "add")
+    assert path.read_text() == "[global]\n" + BLOCK
+
+
+def test_the_include_comes_with_a_samba_that_comes_later(samba):
+    helper(samba, "samba-include", "add")
+    path = samba.write(SMB_CONF, "")
+    assert helper(samba, "samba-include", "add").status == 0
+    assert path.read_text() == BLOCK
+
+
+@pytest.mark.parametrize("meanwhile", ["add", "remove"])
+def test_a_samba_that_is_purged_and_comes_back_includes_the_shares_again(samba, meanwhile):
+    path = samba.write(SMB_CONF, "")
+    helper(samba, "samba-include", "add")
+    path.unlink()
+    assert helper(samba, "samba-include", meanwhile).status == 0
+    samba.write(SMB_CONF, "")
+    helper(samba, "samba-include", "add")
+    assert path.read_text() == BLOCK
+
+
+@pytest.mark.parametrize("action, text, program", [("add", "[global]\n", "cat"), ("remove", "[global]\n" + BLOCK, "awk")])
+def test_a_program_that_dies_cuts_no_configuration(samba, action, text, program):
+    path = samba.write(SMB_CONF, text)
+    samba.fake(program, kill=signal.SIGKILL, times=1)
+    samba.default(program, real=True)
+    assert helper(samba, "samba-include", action).status == 1
+    assert samba.runs(program) and path.read_text() == text
+    assert configurations(samba) == ["smb.conf"]
+    helper(samba, "samba-include", action)
+    assert path.read_text() == ("[global]\n" + BLOCK if action == "add" else "[global]\n")
+
+
+def test_a_configuration_that_is_a_link_stays_one(samba):
+    path = samba.write("/srv/samba/smb.conf", "[global]\n")
+    samba.path("/etc/samba").mkdir()
+    link = samba.path(SMB_CONF)
+    link.symlink_to("/srv/samba/smb.conf")
+    helper(samba, "samba-include", "add")
+    assert link.is_symlink() and path.read_text() == "[global]\n" + BLOCK
+    helper(samba, "samba-include", "remove")
+    assert link.is_symlink() and path.read_text() == "[global]\n"
+
+
+def test_what_follows_an_include_without_its_last_line_stays(samba):
+    text = "[global]\n" + BLOCK.replace("# End: shares of remote volumes\n", "") + "[mine]\npath = /srv\n"
+    path = samba.write(SMB_CONF, text)
+    assert helper(samba, "samba-include", "remove").status == 0
+    assert path.read_text() == text
+
+
+def test_samba_include_wants_to_know_what_to_do(samba):
+    samba.write(SMB_CONF, "")
+    assert helper(samba, "samba-include").status == 2
 
 
 # --- kernel modules ---
