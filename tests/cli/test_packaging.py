@@ -1,6 +1,7 @@
 """What the package puts beside the programs: helpers of the units, the units' sandbox, completion."""
 
 import configparser
+import os
 import pathlib
 import re
 import shlex
@@ -222,11 +223,12 @@ METRICS = "/var/lib/prometheus/node-exporter"
 
 def test_metrics_are_written_in_one_step(box):
     box.path(METRICS).mkdir(parents=True)
-    box.write(f"{METRICS}/remvol.prom", "old")
+    file = box.write(f"{METRICS}/remvol.prom", "old")
     store(box, "iqn.t1", conn_set=1)
-    assert helper(box, "metrics").status == 0
+    with file.open() as reader:  # of the collector, which has begun before
+        assert helper(box, "metrics").status == 0
+        assert reader.read() == "old"
     assert [path.name for path in box.path(METRICS).iterdir()] == ["remvol.prom"]
-    file = box.path(f"{METRICS}/remvol.prom")
     assert file.stat().st_mode & 0o777 == 0o644
     assert 'remvol_target_wanted{target="iqn.t1"} 1\n' in file.read_text()
 
@@ -246,6 +248,25 @@ def test_metrics_that_cannot_be_written_leave_the_old_ones(box):
     assert helper(box, "metrics", "/metrics").status == 2
     assert [path.name for path in box.path("/metrics").iterdir()] == ["remvol.prom"]
     assert box.path("/metrics/remvol.prom").read_text() == "x" * 4096
+
+
+@pytest.mark.parametrize("number", [signal.SIGHUP, signal.SIGINT, signal.SIGTERM])
+def test_metrics_that_are_ended_leave_nothing_behind(bare_box, number):
+    bare_box.path("/metrics").mkdir()
+    bare_box.fake("vvstat", delay=1)
+    running = bare_box.start([PACKAGING / "helpers/metrics", "/metrics"], env={"LD_PRELOAD": None})
+    bare_box.wait_until(lambda: bare_box.runs("vvstat"))
+    running.kill(number)
+    assert running.wait().status == -number
+    assert list(bare_box.path("/metrics").iterdir()) == []
+
+
+def test_what_killed_metrics_left_is_removed_and_no_others_draft(box):
+    old, new, of_another = (box.write(f"/metrics/{name}", "") for name in (".remvol.a1B2c3", ".remvol.d4E5f6", ".remvolt"))
+    for path in (old, of_another):
+        os.utime(path, (0, 0))
+    assert helper(box, "metrics", "/metrics").status == 0
+    assert sorted(path.name for path in old.parent.iterdir()) == sorted([new.name, of_another.name, "remvol.prom"])
 
 
 def test_a_machine_without_the_folder_is_told(box):
