@@ -385,10 +385,11 @@ def test_records_that_an_update_of_the_initiator_has_moved_stay_whose_they_were(
     assert not initiator.path("/var/lib/iscsi/nodes/iqn.ours").exists() and not ours.exists()
 
 
-def test_a_unit_that_the_administrator_masked_stays_masked(initiator):
+@pytest.mark.parametrize("unit", ["/dev/null", "/nowhere"])
+def test_what_the_administrator_made_of_a_unit_stays(initiator, unit):
     initiator.path("/etc/systemd/system").mkdir(parents=True)
-    initiator.path("/etc/systemd/system/open-iscsi.service").symlink_to("/dev/null")
-    helper(initiator, "initiator", "take")
+    initiator.path("/etc/systemd/system/open-iscsi.service").symlink_to(unit)
+    assert helper(initiator, "initiator", "take").status == 0
     assert masked(initiator) == MASKED
     helper(initiator, "initiator", "give")
     assert masked(initiator) == ["open-iscsi.service"]
@@ -449,6 +450,31 @@ def test_what_cannot_be_put_back_stays_saved(initiator):
 def test_what_cannot_be_saved_is_not_taken(initiator):
     initiator.run(["mkdir", "-p", "/var/lib/remvol/initiator/records.new"])  # as on a full disk: no list is made
     assert helper(initiator, "initiator", "take").status == 1
+    assert masked(initiator) == []
+
+
+@pytest.mark.parametrize("name", ["iscsid.conf", "initiatorname.iscsi"])
+def test_what_may_not_be_on_the_disk_yet_is_not_saved(initiator, name):
+    """After a power cut the list of the records would be there, and an empty file beside it."""
+    initiator.fake("sync", f"/var/lib/remvol/initiator/{name}", status=1, times=1)
+    initiator.default("sync", real=True)
+    assert helper(initiator, "initiator", "take").status == 1
+    assert not initiator.path("/var/lib/remvol/initiator/records").exists() and masked(initiator) == []
+    initiator.forget()
+    assert helper(initiator, "initiator", "take").status == 0
+    synced = [call[-1].split("/")[-1] for call in initiator.runs("sync")]
+    assert synced[:3] == ["iscsid.conf", "initiatorname.iscsi", "records.new"]
+
+
+def test_a_unit_of_which_nobody_would_know_is_not_masked(initiator):
+    listed = "/var/lib/remvol/initiator/masked"
+    initiator.run(["mkdir", "-p", listed])  # as on a full disk: it takes no line
+    assert helper(initiator, "initiator", "take").status == 1
+    assert masked(initiator) == []
+    initiator.run(["rmdir", listed])
+    assert helper(initiator, "initiator", "take").status == 0
+    assert masked(initiator) == MASKED
+    helper(initiator, "initiator", "give")
     assert masked(initiator) == []
 
 
