@@ -463,7 +463,7 @@ def test_what_may_not_be_on_the_disk_yet_is_not_saved(initiator, name):
     initiator.forget()
     assert helper(initiator, "initiator", "take").status == 0
     synced = [call[-1].split("/")[-1] for call in initiator.runs("sync")]
-    assert synced[:3] == ["iscsid.conf", "initiatorname.iscsi", "records.new"]
+    assert synced[:4] == ["iscsid.conf", "initiatorname.iscsi", "active", "records.new"]
 
 
 def test_a_unit_of_which_nobody_would_know_is_not_masked(initiator):
@@ -476,6 +476,52 @@ def test_a_unit_of_which_nobody_would_know_is_not_masked(initiator):
     assert masked(initiator) == MASKED
     helper(initiator, "initiator", "give")
     assert masked(initiator) == []
+
+
+@pytest.fixture
+def units(initiator):
+    """A machine on which the initiator's socket runs, and the unit that logs in at start has run."""
+    initiator.path("/run/systemd/system").mkdir(parents=True)
+    for unit, status in (("iscsid.socket", 0), ("iscsid.service", 3), ("open-iscsi.service", 0)):
+        initiator.fake("systemctl", f"-q is-active {unit}", status=status)
+    initiator.fake("systemctl", "daemon-reload", effect="ls /etc/systemd/system >/tmp/masked")
+    initiator.default("systemctl")
+    return initiator
+
+
+def given(box):
+    """What is done with units while the initiator is given back."""
+    box.forget()
+    assert helper(box, "initiator", "give").status == 0
+    return box.runs("systemctl")
+
+
+@pytest.mark.parametrize("session, action", [(None, "restart"), ("session9", "start")])
+def test_what_ran_of_the_initiator_runs_again(units, session, action):
+    """A unit that has logged in counts as running, though nothing of it is left; where a session is, it would end that."""
+    taken = helper(units, "initiator", "take")
+    assert "connected at start it connects again" in taken.stderr
+    assert {call[0] for call in units.runs("systemctl")} == {"-q"}
+    units.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None})
+    if session:
+        units.write(f"/sys/class/iscsi_session/{session}/targetname", "iqn.other\n")
+    wanted = [["daemon-reload"], ["-q", action, "iscsid.socket"], ["-q", action, "open-iscsi.service"]]
+    assert given(units) == wanted
+    assert units.path("/tmp/masked").read_text() == ""
+
+
+def test_what_ran_is_known_from_before_the_initiator_was_taken(units):
+    helper(units, "initiator", "take")
+    units.fake("systemctl", "-q is-active", status=3, first=True)
+    helper(units, "initiator", "take")
+    assert ["-q", "restart", "iscsid.socket"] in given(units)
+
+
+def test_units_of_which_it_is_not_known_stay_as_they_are(units):
+    """What an older package saved says nothing of them."""
+    helper(units, "initiator", "take")
+    units.run(["rm", "/var/lib/remvol/initiator/active"])
+    assert given(units) == []
 
 
 def test_that_a_recovery_has_failed_is_told_without_the_tree_too():
