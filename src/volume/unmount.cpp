@@ -34,7 +34,7 @@ namespace remvol {
 
 namespace {
 
-constexpr int kFurtherRounds = 3;
+constexpr int kRounds = 4;
 constexpr int kKillTries = 3;
 constexpr int kKillMaxWait = 200000;       // microseconds
 constexpr int kTreeLooks = 50;             // 5 seconds
@@ -69,17 +69,16 @@ bool force_umount(const char* mount_point) {
   return false;
 }
 
-// Unmounts the path with its users killed. Another round starts only while something is mounted there: on a
-// path that another run has unmounted meanwhile, the kill would hit every process that uses the system's own
-// disk. A link that was planted meanwhile ends it: the users and the mount would be others.
+// Unmounts the path with its users killed. A round starts only while something is mounted there: on a path
+// that was unmounted meanwhile, the kill would hit every process that uses the system's own disk. A link that
+// was planted meanwhile ends it: the users and the mount would be others.
 void umount_with_rounds(const char* mount_point) {
-  kill_users(mount_point);
-  sleep(1);
-  bool done = leads_through_link(mount_point) || force_umount(mount_point);
-  for (int round = 0; !done && round < kFurtherRounds && sys_mount_point(mount_point) != 0; round++) {
+  bool done = false;
+  for (int round = 0; !done && round < kRounds && sys_mount_point(mount_point) != 0; round++) {
     if (leads_through_link(mount_point)) break;
     kill_users(mount_point);
-    done = force_umount(mount_point);
+    if (round == 0) sleep(1);
+    done = leads_through_link(mount_point) || force_umount(mount_point);
   }
   LOG(2, "end umount");
 }
@@ -136,14 +135,14 @@ Result Target_LUN_umount(const TargetEntry* entry) {
   const MountPointHold hold(mount_point);
   if (leads_through_link(mount_point)) return kFailed;
   if (check_path_exist(mount_point) != 0) return kOk;
-  if (is_foreign_mount(entry, mount_point)) return kFailed;
+  if (hold.is_anothers(mount_point) || is_foreign_mount(entry, mount_point)) return kFailed;
   if (sys_mount_point(mount_point) != 0) {
     (void)remount_mnt_path(mount_point, 0);
     umount_with_rounds(mount_point);
     if (leads_through_link(mount_point)) return kFailed;
     detach_mounts(mount_point);
   }
-  const Result result = hold.is_anothers(mount_point) ? kFailed : remove_mount_point(mount_point);
+  const Result result = remove_mount_point(mount_point);
   LOG(2, "end");
   return result;
 }

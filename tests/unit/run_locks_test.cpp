@@ -422,6 +422,21 @@ TEST_F(RunLocks, MountPointsBelowOneFolderAreHeldTogetherForAMinuteAtMost) {
   EXPECT_FALSE(MountPointHold("/mnt/VV/a").is_anothers("/mnt/VV/a"));
 }
 
+TEST_F(RunLocks, AMountPointAtWhichAnotherRunWorksIsNotTakenAway) {
+  store_entry();
+  copy_text(entry.mnt_dev, "/dev/sdb1");
+  cover("/mnt");
+  std::filesystem::create_directories("/mnt/VV/Data");
+  fakes::on("sys_mount_point").returns(1);
+  start_run([] {
+    const MountPointHold hold("/mnt/VV/Data");
+    stay();
+  });
+  EXPECT_EQ(Target_LUN_umount(&entry), -1);
+  uncover("/mnt");
+  EXPECT_EQ(fakes::commands(), Texts{"fuser -mk /dev/sdb1"});
+}
+
 TEST_F(RunLocks, WhereNoLockCanBeHadTheMountPointIsNobodys) {
   ASSERT_EQ(mount(nullptr, "/run", nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0);
   EXPECT_FALSE(MountPointHold("/mnt/VV/a").is_anothers("/mnt/VV/a"));

@@ -136,10 +136,17 @@ TEST_F(Unmount, ARoundThatSucceedsIsTheLast) {
 // fuser -m on a folder that is no mount point means the disk that the folder is on.
 TEST_F(Unmount, NoRoundKillsTheUsersOfTheSystemsDisk) {
   fakes::on("system", kUmount).returns(32 << 8);
-  fakes::on("sys_mount_point", kPath).returns(1).times(2);
+  fakes::on("sys_mount_point", kPath).returns(1).times(3);
   not_mounted();
   EXPECT_EQ(unmount(), 0);
   EXPECT_EQ(fakes::commands(), (Texts{kKillDevice, kRemount, kKill, kUmount, kRemove}));
+}
+
+TEST_F(Unmount, NorDoesTheFirstOneAfterALongRemount) {
+  fakes::on("sys_mount_point", kPath).returns(1).times(2);
+  not_mounted();
+  EXPECT_EQ(unmount(), 0);
+  EXPECT_EQ(fakes::commands(), (Texts{kKillDevice, kRemount, kRemove}));
 }
 
 TEST_F(Unmount, AKillThatFailsIsTriedThreeTimes) {
