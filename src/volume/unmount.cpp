@@ -158,12 +158,17 @@ Result Target_umount_all_lun(int dbidx) {
   return kOk;
 }
 
+// What is deleted meanwhile moves the targets behind it down; the walk meets each of them all the same.
 void Target_umount_all() {
   const LogScope scope;
   LOG(2, "start");
-  remember_all_targets();
-  for (int dbidx = 1; dbidx <= kMaxTargets; dbidx++) {
-    if (Target_umount_all_lun(dbidx) != kOk) break;
+  SlotsHeld held;
+  TreeValue name;
+  for (int slot = 1; slot <= kMaxTargets && read_target_name(slot, name); slot = target_slot_after(slot)) {
+    remember_target(slot, name);
+    held.let_go();
+    umount_luns(slot);
+    held.take();
   }
   LOG(2, "end");
 }

@@ -332,6 +332,25 @@ TEST_F(Walk, StopsAtTheFirstMissingTarget) {
   EXPECT_TRUE(fakes::commands().empty());
 }
 
+TEST_F(Walk, MeetsATargetThatMovesDownMeanwhile) {
+  fakes::tree_set({{"/iscsi/initiator/ver", "1"},
+                   {"/iscsi/initiator/id:3/target", "iqn.3"},
+                   {"/iscsi/initiator/id:3/lun/id:1/lun", "1"},
+                   {"/iscsi/initiator/id:3/lun/id:1/share", "share-3"},
+                   {"/iscsi/initiator/id:3/lun/id:1/mnt_dev", "/dev/3"}});
+  fakes::on("system", "fuser -mk /dev/1-1").does([] { fakes::tree_delete("/iscsi/initiator/id:2"); });
+  Target_umount_all();
+  EXPECT_EQ(fakes::commands(), (Texts{"fuser -mk /dev/1-1", "fuser -mk /dev/3"}));
+  EXPECT_EQ(fakes::tree_get("/iscsi/initiator/id:2/lun/id:1/status"), "Disable");
+}
+
+TEST_F(Walk, MeetsATargetThatTakesThePlaceOfTheOneBeforeIt) {
+  fakes::tree_set({{"/iscsi/initiator/ver", "1"}});
+  fakes::on("system", "fuser -mk /dev/1-1").does([] { fakes::tree_delete("/iscsi/initiator/id:1"); });
+  Target_umount_all();
+  EXPECT_EQ(fakes::commands(), (Texts{"fuser -mk /dev/1-1", "fuser -mk /dev/2-1"}));
+}
+
 TEST_F(Walk, OfOneTarget) {
   EXPECT_EQ(Target_umount_all_lun(2), 0);
   EXPECT_EQ(fakes::commands(), Texts{"fuser -mk /dev/2-1"});
