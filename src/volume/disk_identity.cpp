@@ -1,5 +1,7 @@
 #include "volume/disk_identity.h"
 
+#include <unistd.h>
+
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
@@ -111,7 +113,7 @@ bool is_session_disk(const char* node, const char* target_name) {
 }
 
 bool has_disk(const char* node) {
-  return check_path_exist(PathText("/sys/block/%s", disk_of_node(node).c_str())) == 0;
+  return access(PathText("/sys/block/%s", disk_of_node(node).c_str()), F_OK) == 0;
 }
 
 bool is_foreign_disk(const TargetEntry* entry, const char* node) {

@@ -100,7 +100,7 @@ bool has_partition(const char* name) {
   if (!directory) return false;
   while (const dirent* entry = readdir(directory.get())) {
     if (strncmp(entry->d_name, name, strlen(name)) != 0) continue;
-    if (check_path_exist(Text<1024>("/sys/block/%s/%s/partition", name, entry->d_name)) == 0) return true;
+    if (access(Text<1024>("/sys/block/%s/%s/partition", name, entry->d_name), F_OK) == 0) return true;
   }
   return false;
 }

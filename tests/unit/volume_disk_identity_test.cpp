@@ -92,7 +92,8 @@ TEST_F(DiskIdentity, OneThatWasOursAndIsGoneIsForeign) {
 }
 
 TEST_F(DiskIdentity, ADiskIsThereWhosesoeverItIs) {
-  EXPECT_FALSE(has_disk("/dev/sdb1"));
+  debug_level = 2;
+  EXPECT_EQ(fakes::output_of([] { EXPECT_FALSE(has_disk("/dev/sdb1")); }), "");
   lead_to("virtio2");
   EXPECT_TRUE(has_disk("/dev/sdb1"));
 }

@@ -1,6 +1,10 @@
 // The one partition of a disk: made, grown, left alone.
 #include "volume/partition.h"
 
+#include <filesystem>
+#include <fstream>
+
+#include "volume/disk_use.h"
 #include "volume/mount_result.h"
 #include "volume_fixture.h"
 
@@ -166,6 +170,13 @@ TEST_F(Partition, SeveralPartitionsAreLeftAlone) {
   EXPECT_EQ(prepare(), 0);
   EXPECT_STREQ(list, "sdb1,sdb2");
   EXPECT_TRUE(fakes::writes().empty());
+}
+
+TEST_F(Partition, TheLookForPartitionsSaysNothing) {
+  std::filesystem::create_directories("/sys/block/sdb/sdb1");
+  EXPECT_EQ(fakes::output_of([] { EXPECT_FALSE(has_partition("sdb")); }), "");
+  std::ofstream("/sys/block/sdb/sdb1/partition") << "1\n";
+  EXPECT_TRUE(has_partition("sdb"));
 }
 
 TEST_F(Partition, AMissingNodeOfTheDiskIsMade) {
