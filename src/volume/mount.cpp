@@ -66,6 +66,7 @@ struct Mounting {
   HeldNode held;
   char fs_type[64];  // on the node; empty when none is known
   ContentMark mark;  // the node's when the format was decided
+  bool standing;     // at the last look: the node is mounted on the volume's own mount point already
   MountPointText mount_point;
 };
 
@@ -123,12 +124,11 @@ bool is_recognised(Mounting* volume) {
   return is_usable(volume) && detect_fs(volume);
 }
 
-// Returns whether the node is mounted on the volume's own mount point already.
 bool is_standing(Mounting* volume) {
   MountLine mount;
-  if (!is_mounted_from(volume->node, volume->mount_point, &mount)) return false;
-  if (!detect_fs(volume)) copy_text(volume->fs_type, mount.type);
-  return true;
+  volume->standing = is_mounted_from(volume->node, volume->mount_point, &mount);
+  if (volume->standing && !detect_fs(volume)) copy_text(volume->fs_type, mount.type);
+  return volume->standing;
 }
 
 // Takes the first partition that passes the test. Returns whether there is one.
@@ -268,13 +268,18 @@ MountResult keep_standing(const Mounting* volume) {
 }
 
 // Mounts the file system and records what became of that. No other run closes the session meanwhile, or
-// removes the mount point. The format may have taken long: a link may have been planted since the first look.
-MountResult put_in_place(const Mounting* volume) {
+// removes the mount point. The format may have taken long: since the first look another run may have mounted
+// it, and a link may have been planted. A volume that stood and does not any more is not mounted: it has to
+// be looked at first.
+MountResult put_in_place(Mounting* volume) {
+  const bool stood = volume->standing;
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
   if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
-  if (hold.is_anothers(volume->mount_point) || leads_through_link(volume->mount_point) ||
-      is_foreign_mount(volume->entry, volume->mount_point)) {
+  if (hold.is_anothers(volume->mount_point)) return kMountNoMountPoint;
+  if (is_standing(volume)) return keep_standing(volume);
+  if (stood) return kMounted;
+  if (leads_through_link(volume->mount_point) || is_foreign_mount(volume->entry, volume->mount_point)) {
     return kMountNoMountPoint;
   }
   MountResult result = make_mount_point(volume);
@@ -286,11 +291,11 @@ MountResult put_in_place(const Mounting* volume) {
 MountResult bring_up(Mounting* volume) {
   MountResult result = prepare_partitions(volume->entry, volume->partitions, &volume->force_format);
   if (result == kMounted && !volume->asked && find_partition(volume, is_standing)) {
-    return keep_standing(volume);
+    result = put_in_place(volume);
+    if (volume->standing) return result;
   }
   if (result == kMounted) result = pick_partition(volume);
   if (result == kMounted) result = prepare_file_system(volume);
-  if (result == kMounted && is_standing(volume)) return keep_standing(volume);  // another run was quicker
   if (result == kMounted) result = put_in_place(volume);
   return result;
 }

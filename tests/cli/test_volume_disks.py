@@ -122,6 +122,60 @@ def test_a_volume_in_use_is_not_formatted_when_its_disk_shows_nothing(luns):
     assert_files(lun)
 
 
+def test_a_volume_in_use_that_is_taken_away_in_that_moment_is_mounted(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    keep_files(lun)
+    lun.box.forget()
+    lun.box.hook("sys_get_fs_type", lun.disk.part, through=True, times=1, effect=f"umount {lun.mount_point}")
+    assert lun.mount().result == 0
+    assert not formatted(lun)
+    assert_mounted(lun, "ext4")
+    assert_files(lun)
+
+
+def test_nobody_takes_a_volume_in_use_away_while_it_is_recorded(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    look = "for lock in session volume; do flock -n /run/remvol/$lock-*.lock true; echo $?; done >/root/held"
+    lun.box.hook("system", startswith("chmod 777 "), through=True, effect=look)
+    assert lun.mount().result == 0
+    assert lun.box.path("/root/held").read_text() == "1\n1\n"
+
+
+def hold_mount_point(lun):
+    """Another run works at the mount point; /root/holder has its process number."""
+    hold = "exec 9</run/remvol/volume-*.lock; flock 9; echo $$ >/root/holder; exec sleep 1000"
+    holder = lun.box.start(["/bin/bash", "-c", hold], env={"LD_PRELOAD": None, "PATH": "/usr/bin:/bin"})
+    lun.box.wait_until(lambda: lun.box.path("/root/holder").exists())
+    return holder
+
+
+def test_a_volume_in_use_at_whose_mount_point_another_run_works_is_not_recorded(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    hold_mount_point(lun)
+    lun.box.tree.set(f"/iscsi/initiator/id:1/lun/id:{lun.slot}/volume_state", 2)
+    lun.box.forget()
+    done = lun.mount()
+    assert (done.result, lun.key("volume_state"), lun.box.shell()) == (-4, "2", [])
+    assert f"{lun.mount_point} is neither made nor removed, another run is at work there" in messages(done)
+
+
+def test_a_volume_that_another_run_mounts_meanwhile_is_not_mounted_twice(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    lun.unmount()
+    hold_mount_point(lun)
+    mount = f"mkdir {lun.mount_point}; mount {lun.disk.part} {lun.mount_point}; kill $(cat /root/holder)"
+    lun.box.hook("usleep", "20000", through=True, times=1, effect=mount)
+    lun.box.forget()
+    assert lun.mount().result == 0
+    assert not lun.box.runs("mount")
+    assert lun.mounts() == [lun.mount_point]
+    assert_mounted(lun, "ext4")
+
+
 def test_a_volume_that_is_mounted_elsewhere_is_mounted(luns):
     lun = luns(300 * MIB)
     lun.mount()
