@@ -16,7 +16,7 @@ namespace {
 constexpr key_t kFormatSemKey = 90111;
 constexpr int kFormatSemMode = 0666;
 constexpr int kOwnMode = 0600;    // what a set of ours is left with
-constexpr int kMaxReplaced = 16;  // a stranger may be quick to make another one
+constexpr int kMaxReplaced = 16;  // others may be quick to make another one, or to remove it
 
 int held_sem_id = -1;  // the set that this process has taken and not left
 
@@ -145,21 +145,25 @@ int format_sem_P(int* sem_id, int initial) {
     LOG(1, "pid = %lu, is in format critical section still", static_cast<unsigned long>(getpid()));
     return 0;
   }
-  RunLock lock;
-  lock.take("format-semaphore.lock", LockMode::kExclusive);
-  const int found = find_format_sem(initial);
-  lock.release();
-  if (found == -1) return -1;
-  *sem_id = found;
-  LOG(2, "get sem_id = %d", found);
-  LOG(2, "try to get a sem, sem_id = %d, trying......", found);
-  if (change_semaphore(found, -1) != 0) {
-    LOG(0, "set sem failed");
-    return -2;
+  for (int i = 0; i < kMaxReplaced; i++) {
+    RunLock lock;
+    lock.take("format-semaphore.lock", LockMode::kExclusive);
+    const int found = find_format_sem(initial);
+    lock.release();
+    if (found == -1) return -1;
+    *sem_id = found;
+    LOG(2, "get sem_id = %d", found);
+    LOG(2, "try to get a sem, sem_id = %d, trying......", found);
+    if (change_semaphore(found, -1) == 0) {
+      held_sem_id = found;
+      LOG(1, "pid = %lu, go into format critical section ...", static_cast<unsigned long>(getpid()));
+      return 0;
+    }
+    // The run that had it saw nobody wait yet, and removed it.
+    if (errno != EIDRM && errno != EINVAL) break;
   }
-  held_sem_id = found;
-  LOG(1, "pid = %lu, go into format critical section ...", static_cast<unsigned long>(getpid()));
-  return 0;
+  LOG(0, "set sem failed");
+  return -2;
 }
 
 int format_sem_V(int* sem_id) {

@@ -112,6 +112,28 @@ TEST_F(FormatSemaphore, AFailedWait) {
   EXPECT_TRUE(has(log, "set sem failed"));
 }
 
+// The last user removes it when nobody waits: one that has its id may come a moment too late.
+TEST_F(FormatSemaphore, OneThatIsRemovedBeforeTheWaitIsMadeAgain) {
+  fakes::on("semop").does([] { semctl(semget(90111, 1, 0666), 0, IPC_RMID); }).times(1).then_real();
+  int sem_id = -1;
+  EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), 0);
+  EXPECT_EQ(fakes::calls({"semop"}).size(), 2U);
+  EXPECT_EQ(sem_id, semget(90111, 1, 0666));
+  EXPECT_EQ(semctl(sem_id, 0, GETVAL), 0);
+  EXPECT_FALSE(has(log, "set sem failed"));
+}
+
+TEST_F(FormatSemaphore, OneThatIsAlwaysRemovedIsNotMadeForEver) {
+  for (const int error : {EIDRM, EINVAL}) {
+    const size_t before = fakes::calls({"semop"}).size();
+    fakes::on("semop").returns(-1).error(error).times(16);
+    int sem_id = -1;
+    EXPECT_EQ(call([&] { return format_sem_P(&sem_id, 1); }), -2);
+    EXPECT_TRUE(has(log, "set sem failed"));
+    EXPECT_EQ(fakes::calls({"semop"}).size(), before + 16);
+  }
+}
+
 TEST_F(FormatSemaphore, WhileAnotherWaitsTheSemaphoreIsReleased) {
   int sem_id = -1;
   ASSERT_EQ(format_sem_P(&sem_id, 1), 0);
