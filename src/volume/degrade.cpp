@@ -1,6 +1,8 @@
 #include "volume/degrade.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include <cctype>
@@ -12,6 +14,7 @@
 
 #include "frontend/log.h"
 #include "support/files.h"
+#include "support/text.h"
 #include "sysaux.h"
 #include "volume/mount_table.h"
 #include "volume/remount.h"
@@ -124,6 +127,16 @@ bool is_valid(const char* device) {
 bool is_mtab_live() {
   char target[PATH_MAX];
   return realpath(kMtab, target) != nullptr && strncmp(target, "/proc/", 6) == 0;
+}
+
+// Returns whether what is mounted on `path` has lost its disk: its session was closed, and no other brings
+// the disk back. A virtual file system's device has the major number 0, and sysfs does not know it; where
+// sysfs does not tell there is none lost.
+bool has_lost_disk(const char* path) {
+  struct stat mounted;
+  if (stat(path, &mounted) != 0 || major(mounted.st_dev) == 0) return false;
+  const Text<64> disk("/sys/dev/block/%u:%u", major(mounted.st_dev), minor(mounted.st_dev));
+  return access("/sys/dev/block", F_OK) == 0 && access(disk, F_OK) != 0;
 }
 
 }  // namespace

@@ -1,7 +1,6 @@
 #include "volume/mount_table.h"
 
 #include <sys/sysmacros.h>
-#include <unistd.h>
 
 #include <cstdio>
 #include <cstdlib>
@@ -97,17 +96,6 @@ Mounted find_mount_below(const char* path, MountLine* mount) {
 
 Mounted find_mount(bool (*fits)(const MountLine&, const void*), const void* what, MountLine* mount) {
   return find([fits, what](const MountLine& line) { return fits(line, what); }, mount);
-}
-
-// A virtual file system's device has the major number 0, and sysfs does not know it.
-bool has_lost_disk(const char* path) {
-  MountLine mount;
-  const auto is_at = [](const MountLine& line, const void* where) {
-    return strcmp(line.path, static_cast<const char*>(where)) == 0;
-  };
-  if (find_mount(is_at, path, &mount) != Mounted::kYes || major(mount.device) == 0) return false;
-  const Text<64> disk("/sys/dev/block/%u:%u", major(mount.device), minor(mount.device));
-  return access("/sys/dev/block", F_OK) == 0 && access(disk, F_OK) != 0;
 }
 
 Mounted find_mount_of(dev_t device, const char* path, MountLine* mount) {

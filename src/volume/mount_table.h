@@ -34,10 +34,6 @@ enum class Mounted { kNo, kYes, kUnknown };  // kUnknown: the table cannot be re
 // when it is null.
 [[nodiscard]] Mounted find_mount_of(dev_t device, const char* path, MountLine* mount);
 
-// Returns whether what is mounted on `path` has lost its disk: its session was closed, and no other brings
-// the disk back. Where sysfs does not tell there is none lost.
-[[nodiscard]] bool has_lost_disk(const char* path);
-
 }  // namespace remvol
 
 #endif

@@ -64,11 +64,12 @@ def degrade(box, share):
     assert done.status == 0, done.stderr
 
 
-def mount_a_disk(site, box, share):
+def mount_a_disk(site, box, share, on_top=False):
     """Has the share on a disk of its own, with a file system that takes files."""
     box.path("/dev/sdb1").unlink(missing_ok=True)
     box.disk("sdb1", 8 << 20)
-    done = box.run(["sh", "-c", f"PATH=/usr/sbin:/usr/bin:/sbin:/bin; umount /mnt/VV/{share} && mkfs.ext4 -q /dev/sdb1 && "
+    bare = "true" if on_top else f"umount /mnt/VV/{share}"
+    done = box.run(["sh", "-c", f"PATH=/usr/sbin:/usr/bin:/sbin:/bin; {bare} && mkfs.ext4 -q /dev/sdb1 && "
                                 f"mount /dev/sdb1 /mnt/VV/{share}"], env={"LD_PRELOAD": None})
     assert done.status == 0, done.stderr
 
@@ -107,8 +108,10 @@ class TestLostDisk:
     """The session was closed under the volume: nothing shows it but that the disk is gone from sysfs. A write need not
     fail as such: ext4 that cannot read its bitmaps says that it is full."""
 
-    def test_its_volume_is_brought_up_anew(self, lost, box):
-        mount_a_disk(lost, box, "a")
+    @pytest.mark.parametrize("path, on_top", [("a", False), ("./a", False), ("a/", False), ("a", True)])
+    def test_its_volume_is_brought_up_anew(self, lost, box, path, on_top):
+        mount_a_disk(lost, box, "a", on_top)
+        box.tree.set(f"{INITIATOR}/id:1/lun/id:1/mnt", f"/mnt/VV/{path}")
         done = box.run(["/bin/mount", "-t", "tmpfs", "none", "/sys/dev/block"], env={"LD_PRELOAD": None})
         assert done.status == 0, done.stderr
         assert READ_ONLY % "sdb" in messages(recover(box))
