@@ -79,7 +79,12 @@ TEST_F(Format, TheStepsComeInOrder) {
 }
 
 TEST_F(Format, TheStatusShowsTheFormat) {
-  fakes::tree_set({{lun("enable"), "1"}});
+  fakes::tree_set({{lun("enable"), "1"}, {lun("format_progress"), "100"}});
+  fakes::on("system", "fuser -mk \"/dev/sdb1\"").does([] {
+    EXPECT_EQ(stored("format_state"), "1");
+    EXPECT_EQ(stored("format_progress"), "0");
+    EXPECT_EQ(stored("status"), "Formatting 0%");
+  });
   EXPECT_EQ(Target_format(&entry, kNode), 0);
   EXPECT_EQ(written("status"), Texts{"Formatting 0%"});
 }

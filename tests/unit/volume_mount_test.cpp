@@ -94,6 +94,22 @@ TEST_F(Mount, AReadyVolumeIsMountedAndRecorded) {
   EXPECT_STREQ(entry.mnt, "/mnt/VV/Data");
 }
 
+TEST_F(Mount, WhatIsRecordedWhen) {
+  fakes::tree_set({{lun("volume_state"), "2"}});
+  fakes::on("system", kResize).does([] {
+    EXPECT_EQ(stored("mnt_dev"), "/dev/sdb1");
+    EXPECT_EQ(stored("mnt"), "/mnt/VV/Data");
+    EXPECT_EQ(stored("fs_type"), "ext4");
+    EXPECT_EQ(stored("volume_state"), "2");
+  });
+  fakes::on("system", kChmod).does([] {
+    EXPECT_EQ(stored("volume_state"), "0");
+    EXPECT_EQ(stored("vol_access_right"), "");
+  });
+  EXPECT_EQ(mount_it(), 0);
+  EXPECT_EQ(fakes::calls({"system"}).size(), 5U);
+}
+
 TEST_F(Mount, SharesAreReloadedOnlyWhenAsked) {
   EXPECT_EQ(mount_it(0, 0), 0);
   EXPECT_EQ(fakes::commands().back(), kChmod);

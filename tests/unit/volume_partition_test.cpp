@@ -96,7 +96,7 @@ TEST_F(Partition, ADiskOfAMebibyteIsOffline) {
 TEST_F(Partition, AnEmptyDiskGetsAPartitionThatMustBeFormatted) {
   partitions("", 0);
   partitions("sdb1", 1);
-  fakes::on("sys_create_1_partition", "/dev/sdb").returns(0);
+  fakes::on("sys_create_1_partition", "/dev/sdb").does([] { EXPECT_EQ(stored("volume_state"), "1"); });
   EXPECT_EQ(prepare(), 0);
   EXPECT_STREQ(list, "sdb1");
   EXPECT_EQ(force, 1);
@@ -145,7 +145,7 @@ TEST_F(Partition, OnePartitionThatFillsTheDiskIsLeftAlone) {
 TEST_F(Partition, AGrownDiskGetsItsPartitionGrown) {
   for (int i = 0; i < 3; i++) partitions("sdb1", 1);
   fakes::on("sys_get_disk_space", "/dev/sdb").returns(1'200'000'000);
-  fakes::on("sys_expand_1_partition", "/dev/sdb").returns(0);
+  fakes::on("sys_expand_1_partition", "/dev/sdb").does([] { EXPECT_EQ(stored("volume_state"), "1"); });
   EXPECT_EQ(prepare(), 0);
   EXPECT_EQ(force, 0);
   EXPECT_EQ(written("volume_state"), (Texts{"1", "0"}));
