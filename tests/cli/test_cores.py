@@ -11,6 +11,7 @@ PROGRAMS = {
     "winshare_reload": [],
     "macshare_reload": [],
     "flashrun": ["sleep 1000"],
+    "vvstat": ["--json", "--watch"],
 }
 SLOW = ["smbcontrol", "killall"]
 
