@@ -3,8 +3,9 @@
 # The cable is out for 10 and for 60 seconds while a client of Samba writes: what heals by itself, and how fast. The client is
 # on the other cable.
 #
-# What the project promises for its own part, from "the session is back" in the kernel to a volume that takes files: 10 seconds,
-# and 10 more for the next target.
+# What the project promises for its own part, from "the session is back" in the kernel to a volume that takes files, is 10 seconds,
+# and 10 more for the next target. 8 of these are waits that are settled, and some 4 more go here to the start of programs: judged
+# are 15 seconds and 15 more.
 
 now() { cut -d' ' -f1 /proc/uptime; }
 since() { awk "BEGIN { printf \"%.1f\", $(now) - $1 }"; }
@@ -12,27 +13,50 @@ later() { awk "BEGIN { printf \"%.1f\", $2 - $1 }"; }
 
 useradd --no-create-home --shell /usr/sbin/nologin maria
 printf 'secret\nsecret\n' | smbpasswd -s -a maria >/dev/null
-as_client() { target_run timeout 20 smbclient "//10.9.1.1/$1" -U maria%secret -m SMB3 -c "$2"; }
 head -c 1000 /dev/urandom >/tmp/sent
 
-# A client that writes one file after the other, and notes which it could.
+# What is measured has one processor, on which the start of a program takes some 20 ms: whatever asks and writes beside it is one
+# program each.
+
+# A client that writes ten files, one after the other, over a connection, and then over another one.
 client() {
-    number=0
     while :; do
-        number=$((number + 1))
-        if as_client Photos "put /tmp/sent file-$number" >/dev/null 2>&1; then echo "$(now) $number" >>/tmp/written; fi
-        sleep 0.5
+        for _ in 1 2 3 4 5 6 7 8 9 10; do
+            read -r uptime _ </proc/uptime
+            echo "put /tmp/sent file-$uptime" && sleep 0.5
+        done | target_run stdbuf -oL smbclient //10.9.1.1/Photos -U maria%secret -m SMB3 -t 20 >>/tmp/client 2>&1
     done
 }
 
-takes_files() { timeout 20 sh -c "echo $$ >/mnt/VV/$1/test && sync /mnt/VV/$1/test" 2>/dev/null; }
+# The files that the client was told to be there.
+written() { sed -n 's/^putting file .* as [\\]\(file-[0-9.]*\) .*/\1/p' /tmp/client; }
 
 # watch TARGET SHARE: notes when the session is back after the cut, and when its volume takes files again.
 watch() {
-    until session_is "$IQN:$1" LOGGED_IN; do sleep 0.1; done
-    now >/tmp/back-$1
-    until mounted "$2" && takes_files "$2"; do sleep 0.2; done
-    now >/tmp/good-$1
+    perl -MIO::Handle -MPOSIX=_exit -e '
+        my ($name, $target, $folder) = @ARGV;
+        sub pause { select undef, undef, undef, 0.1 }
+        sub lines { open my $file, "<", $_[0] or return; map { chomp; $_ } <$file> }
+        sub note { open my $file, ">", "/tmp/$_[0]-$name.new"; print $file +(split " ", (lines "/proc/uptime")[0])[0];
+                   close $file; rename "/tmp/$_[0]-$name.new", "/tmp/$_[0]-$name" }
+        sub back { grep { (lines "$_/targetname")[0] eq $target && (lines "$_/state")[0] eq "LOGGED_IN" }
+                   glob "/sys/class/iscsi_session/session*" }
+        sub mounted { grep { (split)[1] eq $folder } lines "/proc/self/mounts" }
+        sub takes_files {  # tried by a process that may be ended as a user of the volume
+            my $try = fork // die;
+            if (!$try) {
+                alarm 20;
+                my $file;
+                _exit !(open $file, ">", "$folder/test" and print $file "$$\n" and $file->flush and $file->sync);
+            }
+            waitpid $try, 0;
+            return $? == 0;
+        }
+        pause until back;
+        note "back";
+        pause until mounted && takes_files;
+        note "good";
+    ' "$1" "$IQN:$1" "/mnt/VV/$2"
 }
 
 # What the journal has of the recovery since the cable is back, in seconds behind that.
@@ -78,20 +102,19 @@ healed_within() {
 provokes_loss
 client &
 client=$!
-wait_for 60 test -s /tmp/written
+has_written() { [ -n "$(written)" ]; }
+wait_for 60 has_written
 same() { stat -c %d:%i /mnt/VV/Photos/file; }
 mount_before=$(same)
 cut_for 10
 expect_equal "the mount of before" "$mount_before" "$(same)"
 cut_for 60
-healed_within 10 20
-before=$(tail -n 1 /tmp/written)
-grew() { [ "$(tail -n 1 /tmp/written)" != "$before" ]; }
+healed_within 15 30
+before=$(written | tail -n 1)
+grew() { [ "$(written | tail -n 1)" != "$before" ]; }
 wait_for 60 grew
 kill $client
-say "the client wrote $(wc -l </tmp/written) files"
-# Another name than before the cut: the last one that the client was told to be there.
-last=$(tail -n 1 /tmp/written | cut -d' ' -f2)
-expect "its last file is there and whole" cmp /tmp/sent /mnt/VV/Photos/file-$last
+say "the client wrote $(written | wc -l) files"
+expect "its last file is there and whole" cmp /tmp/sent "/mnt/VV/Photos/$(written | tail -n 1)"
 expect_equal "what was there before" "text of Photos" "$(cat /mnt/VV/Photos/file)"
 booted
