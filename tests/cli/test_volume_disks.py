@@ -110,24 +110,16 @@ def test_a_volume_in_use_is_known_by_its_device_not_by_a_name(luns):
     assert lun.box.run(["/usr/bin/umount", lun.mount_point]).status == 0
 
 
-def test_a_volume_in_use_is_not_formatted_when_its_disk_shows_nothing(luns):
+@pytest.mark.parametrize("look", [
+    lambda lun: {"ret": -1},
+    lambda lun: {"through": True, "times": 1, "effect": f"umount {lun.mount_point}"},
+], ids=["shows nothing", "is when it is taken away"])
+def test_a_volume_in_use_is_not_formatted_whatever_the_look_at_its_disk(luns, look):
     lun = luns(300 * MIB)
     lun.mount()
     keep_files(lun)
     lun.box.forget()
-    lun.box.hook("sys_get_fs_type", lun.disk.part, ret=-1)
-    assert lun.mount().result == 0
-    assert not formatted(lun)
-    assert_mounted(lun, "ext4")
-    assert_files(lun)
-
-
-def test_a_volume_in_use_that_is_taken_away_in_that_moment_is_mounted(luns):
-    lun = luns(300 * MIB)
-    lun.mount()
-    keep_files(lun)
-    lun.box.forget()
-    lun.box.hook("sys_get_fs_type", lun.disk.part, through=True, times=1, effect=f"umount {lun.mount_point}")
+    lun.box.hook("sys_get_fs_type", lun.disk.part, **look(lun))
     assert lun.mount().result == 0
     assert not formatted(lun)
     assert_mounted(lun, "ext4")
