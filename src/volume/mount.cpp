@@ -67,6 +67,7 @@ struct Mounting {
   char fs_type[64];  // on the node; empty when none is known
   ContentMark mark;  // the node's when the format was decided
   bool standing;     // at the last look: the node is mounted on the volume's own mount point already
+  bool stood;        // at an earlier one
   MountPointText mount_point;
 };
 
@@ -145,15 +146,17 @@ bool find_partition(Mounting* volume, bool (*passes)(Mounting*)) {
 
 MountResult pick_partition(Mounting* volume) {
   if (find_partition(volume, is_recognised)) return kMounted;
-  volume->looks_empty = volume->force_format == 0;
-  volume->force_format = 1;
+  if (!volume->stood) {
+    volume->looks_empty = volume->force_format == 0;
+    volume->force_format = 1;
+  }
   if (!find_partition(volume, is_usable)) return kMountNoPartition;
   return kMounted;
 }
 
 // Data that nobody asked to overwrite is never formatted: what is recognised on a second look is mounted, and
-// what was recognised on the first is not taken for empty on the second, which only a fault can make of it.
-// Returns whether the node can be used.
+// what was recognised on the first, or stood mounted, is not taken for empty on the second, which only a
+// fault can make of it. Returns whether the node can be used.
 bool protect_data(Mounting* volume) {
   const bool known = volume->fs_type[0] != '\0';
   if (known && volume->looks_empty) volume->force_format = 0;
@@ -270,15 +273,16 @@ MountResult keep_standing(const Mounting* volume) {
 // Mounts the file system and records what became of that. No other run closes the session meanwhile, or
 // removes the mount point. The format may have taken long: since the first look another run may have mounted
 // it, and a link may have been planted. A volume that stood and does not any more is not mounted: it has to
-// be looked at first.
+// be looked at first. One that stands where another run works for too long fails in the way that leaves its
+// state as after a mount.
 MountResult put_in_place(Mounting* volume) {
-  const bool stood = volume->standing;
+  const bool stands = volume->standing;
   const SessionKept kept(volume->entry->target_name);
   const MountPointHold hold(volume->mount_point);
   if (is_foreign_disk(volume->entry, volume->node)) return kMountTooSmall;
-  if (hold.is_anothers(volume->mount_point)) return kMountNoMountPoint;
+  if (hold.is_anothers(volume->mount_point)) return stands ? kMountFailed : kMountNoMountPoint;
   if (is_standing(volume)) return keep_standing(volume);
-  if (stood) return kMounted;
+  if (stands) return kMounted;
   if (leads_through_link(volume->mount_point) || is_foreign_mount(volume->entry, volume->mount_point)) {
     return kMountNoMountPoint;
   }
@@ -293,6 +297,7 @@ MountResult bring_up(Mounting* volume) {
   if (result == kMounted && !volume->asked && find_partition(volume, is_standing)) {
     result = put_in_place(volume);
     if (volume->standing) return result;
+    volume->stood = true;
   }
   if (result == kMounted) result = pick_partition(volume);
   if (result == kMounted) result = prepare_file_system(volume);

@@ -126,6 +126,19 @@ def test_a_volume_in_use_is_not_formatted_whatever_the_look_at_its_disk(luns, lo
     assert_files(lun)
 
 
+def test_a_volume_in_use_that_is_taken_away_is_not_formatted_when_its_disk_shows_nothing(luns):
+    lun = luns(300 * MIB)
+    lun.mount()
+    keep_files(lun)
+    lun.box.hook("sys_get_fs_type", lun.disk.part, ret=-1, effect=f"umount {lun.mount_point}")
+    lun.box.forget()
+    done = lun.mount()
+    assert (done.result, formatted(lun)) == (-2, False)
+    assert f"{lun.disk.part} carried a file system a moment ago and shows none now, it is left alone" in messages(done)
+    assert lun.box.run(["/usr/bin/mount", lun.disk.part, lun.mount_point]).status == 0
+    assert_files(lun)
+
+
 def test_nobody_takes_a_volume_in_use_away_while_it_is_recorded(luns):
     lun = luns(300 * MIB)
     lun.mount()
@@ -150,7 +163,7 @@ def test_a_volume_in_use_at_whose_mount_point_another_run_works_is_not_recorded(
     lun.box.tree.set(f"/iscsi/initiator/id:1/lun/id:{lun.slot}/volume_state", 2)
     lun.box.forget()
     done = lun.mount()
-    assert (done.result, lun.key("volume_state"), lun.box.shell()) == (-4, "2", [])
+    assert (done.result, lun.key("volume_state"), lun.box.shell()) == (-1, "2", [])
     assert f"{lun.mount_point} is neither made nor removed, another run is at work there" in messages(done)
 
 
