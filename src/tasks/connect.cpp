@@ -49,17 +49,21 @@ void mount_connected_lun(TargetEntry* entry) {
   unmount_if_deleted(entry);
 }
 
-// Mounts the enabled LUNs of the target at `dbidx`. Returns 0, or why the last LUN visited could not be asked
+// Mounts the enabled LUNs of the target in `entry`. Returns 0, or why the last LUN visited could not be asked
 // whether it is enabled.
-int mount_enabled_luns(int dbidx) {
+//
+// The target's wish to be connected is that of the last record read, and the one behind the last LUN has
+// none: a loss during the mounts is not shown as "Reconnecting" by the status that follows.
+int mount_enabled_luns(TargetEntry* entry) {
   int result = kOk;
-  TargetEntry volume;
-  LunWalk luns(dbidx, LunWalk::kAtUnreadable);
+  TargetEntry volume = {};
+  LunWalk luns(entry->db_idx, LunWalk::kAtUnreadable);
   while (luns.next(&volume)) {
     int enable = 0;
-    result = ktree_get_lun_enable(&enable, dbidx, volume.lun_db_idx);
+    result = ktree_get_lun_enable(&enable, entry->db_idx, volume.lun_db_idx);
     if (result == kOk && enable == 1) mount_connected_lun(&volume);
   }
+  entry->conn_set = volume.conn_set;
   return result;
 }
 
@@ -75,7 +79,7 @@ int present_volumes(TargetEntry* entry) {
     return kFailed;
   }
   sleep(kSettleSeconds);
-  const int result = mount_enabled_luns(entry->db_idx);
+  const int result = mount_enabled_luns(entry);
   (void)ktree_update_status(entry);
   reload_share_services();
   return result;

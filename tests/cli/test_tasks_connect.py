@@ -75,15 +75,32 @@ class TestConnect:
         )
         assert stored.mounted("a") and stored.mounted("b")
 
-    def test_a_target_that_is_deleted_meanwhile_is_logged_out_alone(self, stored, box):
+    @pytest.mark.parametrize("luns, status, state", [(1, "Connected", "1"), (7, "Connected", "1"), (8, "Reconnecting", "3")])
+    def test_a_loss_during_the_mounts_shows_with_eight_luns_alone(self, site, box, luns, status, state):
+        """A recovery that follows asks for that state."""
+        disks = "bcdefghi"[:luns]
+        site.store("iqn.t1", luns=[(disk, number) for number, disk in enumerate(disks)])
+        site.offer("iqn.t1", {number: f"sd{disk}" for number, disk in enumerate(disks)})
+        for disk in disks:
+            site.disk(f"sd{disk}")
+        box.hook("system", 'mount -t ext4 /dev/sdb1 "/mnt/VV/b"', through=True, times=1,
+                 effect="ktreec -S /var/run/ktree_sock_vv -s /iscsi/initiator/id:1/conn_state 3")
+        assert connect(box).status == 0
+        assert (site.target("status"), site.target("conn_state")) == (status, state)
+
+    @pytest.mark.parametrize("command", [["--connect", "-n", "iqn.t1"], ["--init"]])
+    def test_a_target_that_is_deleted_meanwhile_is_logged_out_alone(self, stored, box, command):
         """An empty name would be every target's."""
-        stored.store("iqn.t2", slot=2, conn_set=1, luns=[("other", 0)])
+        box.tree.set({"/iscsi/initiator/ver": 1, "/iscsi/initiator/id:1/conn_set": 1})
+        for program in ("killall", "rmmod", "insmod", "iscsid"):
+            box.default(program)
+        stored.store("iqn.t2", slot=2, luns=[("other", 0)])
         stored.offer("iqn.t2", {0: "sdd"})
         stored.log_in("iqn.t2")
         stored.disk("sdb")
         box.hook("system", 'mount -t ext4 /dev/sdb1 "/mnt/VV/a"', through=True, times=1,
                  effect="ktreec -S /var/run/ktree_sock_vv -d /iscsi/initiator/id:1")
-        connect(box)
+        box.remvol(*command)
         assert stored.sessions() == ["iqn.t2"]
         assert [line for line in box.shell() if "--logout" in line] == [LOGOUT]
 
