@@ -40,6 +40,13 @@ int open_session(const char* socket, TargetEntry* target, int connected, bool* l
   return kFailed;
 }
 
+// A run that brings the target up for longer than this one could wait, and does so still, needs the session.
+void log_out_again(const TargetEntry* target, bool given_up) {
+  std::optional<IdleTarget> idle;
+  if (given_up && !idle.emplace(target->target_name)) return;
+  (void)_target_disconnect(target);
+}
+
 // The search itself. While it is logged in for its own sake no other run brings the target up: the session
 // would be closed under that run's volumes.
 int search_luns(const char* socket, TargetEntry* target) {
@@ -52,9 +59,7 @@ int search_luns(const char* socket, TargetEntry* target) {
   bool logged_in = false;
   int result = open_session(socket, target, connected, &logged_in);
   if (result == kOk) result = publish_luns(socket, name, _create_device_node);
-  // A run that brings the target up for longer than this one could wait needs the session.
-  const bool is_needed = hold && hold->given_up();
-  if (logged_in && !is_needed) (void)_target_disconnect(target);
+  if (logged_in) log_out_again(target, hold && hold->given_up());
   return result;
 }
 

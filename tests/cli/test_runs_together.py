@@ -408,6 +408,17 @@ class TestASessionUnderAVolume:
         assert "the session of target iqn.t1 stays, a volume is mounted from it" in said
         assert unknown.logged_in("iqn.t1") and unknown.mounted("unknown")
 
+    @pytest.mark.parametrize("ends, stays", [(False, True), (True, False)])
+    def test_a_search_leaves_its_session_to_a_run_that_needs_it_still(self, stored, box, ends, stays):
+        hold = "exec 9</run/remvol/target-*.lock; flock 9; echo held; exec sleep 1000"
+        box.remvol("--disconnect", "-n", "iqn.t1")
+        holder = box.start(["/bin/bash", "-c", hold], env={"LD_PRELOAD": None, "PATH": "/usr/bin:/bin"})
+        box.wait_until(lambda: holder.stdout == "held\n")
+        if ends:
+            box.hook("popen", LOGIN, through=True, effect=f"kill -KILL {holder.pid}", times=1)
+        assert box.remvol("--search_lun", "-n", "iqn.t1", "-c", "0", "-i", "10.9.0.2", "-p", "3260").status == 0
+        assert stored.logged_in("iqn.t1") == stays
+
     def test_a_listing_that_fails_gives_no_session_up(self, unknown, box):
         box.fake("iscsiadm", "-m session -P3", status=1)
         said = messages(box.remvol("--connect", "-n", "iqn.t1"))

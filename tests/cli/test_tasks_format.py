@@ -191,6 +191,16 @@ class TestModify:
         assert volume.lun("share") is None
         assert not volume.mounted("data")
 
+    def test_a_target_that_is_deleted_while_it_is_connected_again_is_logged_out_alone(self, volume, box):
+        volume.store("iqn.t2", slot=2, conn_set=1, luns=[("other", 0)])
+        volume.offer("iqn.t2", {0: "sdd"})
+        volume.log_in("iqn.t2")
+        box.hook("system", 'mount -t ext4 /dev/sdb1 "/mnt/VV/data"', through=True, times=1,
+                 effect="ktreec -S /var/run/ktree_sock_vv -d /iscsi/initiator/id:1")
+        self.modify(box, "-c", "0")
+        assert volume.sessions() == ["iqn.t2"]
+        assert [line for line in box.shell() if "--logout" in line] == [LOGOUT, LOGOUT]
+
     def test_a_disconnected_target_stays_so(self, disconnected, box):
         assert self.modify(box, "-c", "1", "-U", "user", "-P", "secret").status == 0
         assert [disconnected.target(key) for key in ("chap", "chap_name", "chap_pwd", "conn_set", "status")] == [
