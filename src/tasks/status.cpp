@@ -22,6 +22,15 @@ namespace remvol {
 
 namespace {
 
+// Writes the status text of a LUN that is being formatted, unless that has ended since. Returns whether it
+// did.
+bool write_progress(const TargetEntry* entry) {
+  const SlotsHeld held(SlotsHeld::kChange);
+  if (read_lun_state(entry->db_idx, entry->lun_db_idx).format != kFormatting) return false;
+  (void)ktree_update_lun_status(entry, 1);
+  return true;
+}
+
 // Refreshes the status texts of the LUNs of the target in `entry`, which is the record for each. The slots
 // are let go of while disks are looked at.
 void refresh_luns(TargetEntry* entry, SlotsHeld* held) {
@@ -30,7 +39,7 @@ void refresh_luns(TargetEntry* entry, SlotsHeld* held) {
     LunState state = read_lun_state(entry->db_idx, entry->lun_db_idx);
     held->let_go();
     repair_lun_state(entry, &state);
-    (void)ktree_update_lun_status(entry, state.format == kFormatting ? 1 : 0);
+    if (state.format != kFormatting || !write_progress(entry)) (void)ktree_update_lun_status(entry, 0);
     held->take();
   }
   (void)ktree_refresh_total_luncnt();

@@ -136,6 +136,17 @@ def test_a_format_that_begins_while_the_disk_is_looked_at_shows(box, fs_type, la
     assert status(box) == "Formatting 7%"
 
 
+def test_the_progress_of_a_format_that_has_ended_meanwhile_is_not_written(box):
+    store(box, format_state="1", format_progress="7", volume_state="1")
+    sessions(box)
+    end = "; ".join(f"ktreec -S /var/run/ktree_sock_vv -s {LUN}/{key} {value}"
+                    for key, value in (("volume_state", 3), ("format_state", 0)))
+    box.hook("ktreec_get_wb", f"{LUN}/volume_state", through=True, times=1, effect=end)
+    box.hook("sys_get_fs_type", "/dev/sdb1", ret=1)
+    assert box.remvol("--status").status == 0
+    assert box.tree.get(f"{LUN}/status") == "Create Volume Failed"
+
+
 def test_no_format_begins_between_the_look_at_the_states_and_the_text(box):
     """Whoever stores a state has the slots, which are not to be had meanwhile."""
     store(box, format_state="0")
