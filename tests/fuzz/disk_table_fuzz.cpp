@@ -41,6 +41,12 @@ void fill(const Disk& disk, const uint8_t* data, size_t size) {
 
 }  // namespace
 
+// libfdisk 2.38 loses 512 bytes for each of several extended partitions whose tables cannot be read; fdisk(8)
+// shows the same. What is ours to free is looked after where the library's calls are tested on real disks.
+extern "C" const char* __lsan_default_suppressions() {
+  return "leak:libfdisk.so";
+}
+
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static const Disk disk;
   static uint8_t start_before[kPart];
