@@ -1,16 +1,13 @@
 #include "tree/slots.h"
 
-#include <cerrno>
 #include <climits>
 #include <cstdlib>
 #include <cstring>
-#include <ctime>
 
 #include "frontend/log.h"
-#include "support/command.h"
 #include "support/run_lock.h"
 #include "support/text.h"
-#include "tree/access.h"
+#include "tree/slot_reads.h"
 #include "tree_layout.h"
 
 namespace remvol {
@@ -21,11 +18,9 @@ constexpr char kSlotsLock[] = "slots.lock";
 constexpr int kNoLun = -1;
 constexpr int kGone = INT_MIN;  // not 0, which an entry without a slot has
 
-using TargetName = TreeValue;
-
 // What this run knows of one target slot.
 struct KnownSlot {
-  TargetName target = "";                // empty: nothing was read from it
+  TreeValue target = "";                 // empty: nothing was read from it
   int luns[kMaxLunsPerTarget + 1] = {};  // LUN numbers by slot, plus 1; 0: nothing was read from it
 };
 
@@ -33,108 +28,13 @@ KnownSlot known_slots[kMaxTargets + 1];
 
 RunLock slots_lock;  // open for as long as the run lives
 int holders = 0;
-bool are_locked = false;  // false also while they are held without a lock, since none can be had
-bool are_moved = false;   // this run stores or deletes a slot since they are held
-
-// What the tree has answered for a value that defines a slot.
-template <size_t N>
-struct Seen {
-  enum { kNothing, kMissing, kValue } what;
-  int commands;  // how many had been noticed
-  char value[N];
-};
-
-// What was read from a target slot since then nobody has changed slots.
-struct SeenSlot {
-  Seen<sizeof(TargetName)> target;
-  Seen<16> luns[kMaxLunsPerTarget + 1];
-};
-
-SeenSlot seen_slots[kMaxTargets + 1];
-
-// By what it is known that nobody has: the lock's count, and that it is the same tree. For a second only,
-// since a person at ktreec asks for no lock.
-struct SeenWhen {
-  long long changes = -1;
-  TreeInstance tree = {};
-  time_t second = 0;
-};
-
-SeenWhen seen_when;
-
-// What a slot holds is looked at after a command to see what has become of it meanwhile, by whomever.
-int commands_noticed = 0;
-
-void notice_commands() {
-  static long last_mark = 0;
-  const long mark = command_mark();
-  if (mark != last_mark) commands_noticed++;
-  last_mark = mark;
-}
-
-void forget_seen_slots() {
-  memset(seen_slots, 0, sizeof seen_slots);
-}
-
-void forget_changed_slots() {
-  timespec now;
-  clock_gettime(CLOCK_MONOTONIC, &now);
-  const SeenWhen present = {slots_lock.changes(), tree_instance(), now.tv_sec};
-  const bool unchanged = are_locked && present.changes == seen_when.changes &&
-                         present.second == seen_when.second && present.tree == seen_when.tree;
-  if (!unchanged) forget_seen_slots();
-  seen_when = present;
-}
-
-// What was read before the last command is believed by those who count slots and look for a free one, which
-// is looked at again.
-enum class Belief { kSinceCommand, kAny };
-
-// Reads the value at key(), which defines a slot, or takes it from `seen` while the slots are held; null:
-// nothing is kept of it. Returns what tree_get() does.
-template <size_t N, typename Key>
-int get_slot_value(Key key, Seen<N>* seen, TreeValue& value, Belief belief) {
-  if (!are_locked) seen = nullptr;
-  if (seen != nullptr && seen->what != seen->kNothing &&
-      (belief == Belief::kAny || seen->commands == commands_noticed)) {
-    memcpy(value, seen->value, N);
-    return seen->what == seen->kMissing ? -1 : static_cast<int>(strlen(value));
-  }
-  const int length = tree_get(key(), value, sizeof value);
-  if (seen == nullptr) return length;
-  *seen = {};
-  seen->commands = commands_noticed;
-  if (length == -1 && errno == ENODATA && !are_moved) seen->what = seen->kMissing;
-  if (length <= 0 || strlen(value) >= N) return length;
-  seen->what = seen->kValue;
-  copy_text(seen->value, value);
-  return length;
-}
-
-bool is_target_slot(int n) {
-  return n >= 1 && n <= kMaxTargets;
-}
-
-bool is_lun_slot(int n, int m) {
-  return is_target_slot(n) && m >= 1 && m <= kMaxLunsPerTarget;
-}
 
 int known_lun(int n, int m) {
   return known_slots[n].luns[m] - 1;
 }
 
-int get_target_name(int n, TargetName& name, Belief belief) {
-  auto* const seen = is_target_slot(n) ? &seen_slots[n].target : nullptr;
-  return get_slot_value([n] { return KeyText(key::kTargetName, n); }, seen, name, belief);
-}
-
-int get_lun_number(int n, int m, TreeValue& number, Belief belief) {
-  auto* const seen = is_lun_slot(n, m) ? &seen_slots[n].luns[m] : nullptr;
-  return get_slot_value([n, m] { return KeyText(key::kLunNumber, n, m); }, seen, number, belief);
-}
-
 bool holds_target(int n, const char* target_name) {
-  TargetName stored;
+  TreeValue stored;
   return read_target_name(n, stored) && strcmp(stored, target_name) == 0;
 }
 
@@ -181,16 +81,15 @@ void SlotsHeld::take() {
   held_ = true;
   if (holders++ > 0) return;
   const LockMode mode = purpose_ == kChange ? LockMode::kExclusive : LockMode::kShared;
-  are_locked = slots_lock.take_again(kSlotsLock, mode) == LockTry::kTaken;
-  forget_changed_slots();
-  notice_commands();
+  // A machine on which no lock can be had works without.
+  const bool is_locked = slots_lock.take_again(kSlotsLock, mode) == LockTry::kTaken;
+  begin_slot_reads(is_locked ? slots_lock.changes() : kUnknownChanges);
 }
 
 void SlotsHeld::let_go() {
   held_ = false;
   if (--holders > 0) return;
-  if (are_moved) forget_seen_slots();
-  are_locked = are_moved = false;
+  end_slot_reads();
   slots_lock.pause();
 }
 
@@ -199,7 +98,7 @@ HeldSlot::HeldSlot(int n, int m)
   found_ = lun_ != kGone;
 }
 
-bool read_target_name(int n, TargetName& name) {
+bool read_target_name(int n, TreeValue& name) {
   return get_target_name(n, name, Belief::kSinceCommand) > 0 && name[0] != '\0';
 }
 
@@ -211,7 +110,7 @@ bool read_lun_number(int n, int m, int* lun) {
 }
 
 bool is_target_stored_at(int n) {
-  TargetName name;
+  TreeValue name;
   return read_target_name(n, name);
 }
 
@@ -236,7 +135,7 @@ bool is_lun_stored(int dbidx, int lun_dbidx) {
 }
 
 bool is_target_slot_free(int n) {
-  TargetName name;
+  TreeValue name;
   return get_target_name(n, name, Belief::kAny) == -1 || name[0] == '\0';
 }
 
@@ -247,8 +146,7 @@ bool is_lun_slot_free(int n, int m) {
 
 void slots_move() {
   slots_lock.count_change();
-  are_moved = true;
-  forget_seen_slots();
+  doubt_slot_reads();
 }
 
 int delete_slot(const char* path) {
@@ -271,7 +169,7 @@ void remember_all_targets() {
   const SlotsHeld held;
   for (int n = 1; n <= kMaxTargets; n++) {
     known_slots[n] = KnownSlot();
-    TargetName name;
+    TreeValue name;
     if (read_target_name(n, name)) remember_target(n, name);
   }
 }
