@@ -16,9 +16,9 @@
 #include <string_view>
 
 #include "common/begin.h"
+#include "common/program.h"
 #include "common/report.h"
 #include "common/sessions.h"
-#include "common/start.h"
 #include "events/kernel_event.h"
 #include "events/netlink.h"
 #include "events/recovery.h"
@@ -66,7 +66,7 @@ pid_t start_tool(const Order& order) {
   const bool reopen = order.action == Action::kReopen;
   const char* option = reopen ? "--oiscsi_evt_reopen" : "--oiscsi_evt_recover";
   const char* argv[] = {platform::kTool, option, "-n", order.target.c_str(), nullptr};
-  const pid_t process = platform::start(platform::kTool, argv);
+  const pid_t process = platform::start_apart(platform::kTool, argv);
   const char* target = order.target.c_str();
   if (process < 0) {
     platform::report(LOG_ERR, "remvol-events: %s: %s", target, strerror(errno));
@@ -82,7 +82,7 @@ pid_t start_tool(const Order& order) {
 void notify(const char* notifier, const OrderEnd& end) {
   const char* changes[] = {notifier, nullptr};
   const char* failure[] = {notifier, "--recovery-failed", end.given_up.c_str(), nullptr};
-  const auto start = platform::start;
+  const auto start = platform::start_apart;
   if (start(notifier, changes) < 0 || (!end.given_up.empty() && start(notifier, failure) < 0)) {
     complain(notifier);
   }

@@ -4,7 +4,7 @@
 #include <unistd.h>
 
 #include "common/processes.h"
-#include "common/start.h"
+#include "common/program.h"
 #include "common/tree_reader.h"
 #include "tree_layout.h"
 

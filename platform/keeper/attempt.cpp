@@ -1,21 +1,18 @@
 #include "keeper/attempt.h"
 
-#include <fcntl.h>
 #include <mntent.h>
 #include <net/if.h>
 #include <netdb.h>
 #include <netinet/in.h>
 #include <poll.h>
-#include <spawn.h>
 #include <sys/socket.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdio>
 #include <vector>
 
-#include "common/start.h"
+#include "common/program.h"
 #include "common/tree_reader.h"
 #include "tree_layout.h"
 
@@ -55,17 +52,10 @@ bool accepts_at_a_port(const addrinfo& address) {
 int run_silently(std::vector<const char*> arguments) {
   arguments.insert(arguments.begin(), platform::kTool);
   arguments.push_back(nullptr);
-  posix_spawn_file_actions_t files;
-  posix_spawn_file_actions_init(&files);
-  posix_spawn_file_actions_addopen(&files, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
-  posix_spawn_file_actions_addopen(&files, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
-  pid_t process = -1;
-  const int error = posix_spawnp(&process, platform::kTool, &files, nullptr,
-                                 const_cast<char* const*>(arguments.data()), environ);
-  posix_spawn_file_actions_destroy(&files);
-  int status = 0;
-  if (error != 0 || waitpid(process, &status, 0) < 0) return 1;
-  return WIFEXITED(status) ? WEXITSTATUS(status) : 1;
+  const platform::Streams silent = {STDIN_FILENO, platform::kNowhere, platform::kNowhere};
+  const pid_t process = platform::start(platform::kTool, arguments.data(), silent);
+  const int status = process > 0 ? platform::exit_status(platform::end_of(process)) : -1;
+  return status >= 0 ? status : 1;
 }
 
 struct Stored {

@@ -19,9 +19,9 @@
 
 #include "common/begin.h"
 #include "common/processes.h"
+#include "common/program.h"
 #include "common/report.h"
 #include "common/sessions.h"
-#include "common/start.h"
 #include "common/tree_reader.h"
 #include "events/netlink.h"
 #include "keeper/attempt.h"
@@ -63,7 +63,7 @@ bool is_brought_up() {
 pid_t start_program(std::initializer_list<const char*> words, const char* program) {
   std::vector<const char*> argv(words);
   argv.push_back(nullptr);
-  const pid_t process = platform::start(program, argv.data());
+  const pid_t process = platform::start_apart(program, argv.data());
   if (process < 0) platform::report(LOG_ERR, "remvol-keeper: %s: %s", program, strerror(errno));
   return process;
 }

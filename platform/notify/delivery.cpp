@@ -2,13 +2,9 @@
 
 #include <dirent.h>
 #include <fcntl.h>
-#include <poll.h>
-#include <spawn.h>
 #include <strings.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
-#include <sys/syscall.h>
-#include <sys/wait.h>
 #include <syslog.h>
 #include <systemd/sd-journal.h>
 #include <unistd.h>
@@ -20,6 +16,7 @@
 #include <cstring>
 #include <vector>
 
+#include "common/program.h"
 #include "common/report.h"
 #include "common/utf8.h"
 
@@ -51,23 +48,15 @@ bool log_event(const Event& event) {
 class Runs {
  public:
   // Runs the words under timeout(1), which ends the program and what it started; `input` is its standard
-  // input, or negative for none.
-  void start(std::vector<std::string> words, int input = -1) {
+  // input.
+  void start(std::vector<std::string> words, int input = platform::kNowhere) {
     const std::string program = words.front();
     words.insert(words.begin(), {"timeout", "--kill-after=2", "30"});
-    std::vector<char*> argv;
-    for (std::string& word : words) argv.push_back(word.data());
-    argv.push_back(nullptr);
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-    if (input >= 0) posix_spawn_file_actions_adddup2(&actions, input, STDIN_FILENO);
-    pid_t child = -1;
-    const int error = posix_spawnp(&child, argv[0], &actions, nullptr, argv.data(), environ);
-    posix_spawn_file_actions_destroy(&actions);
-    if (error != 0) {
-      note(complain(program, strerror(error)));
-    } else if (ends_soon(child)) {
+    const std::vector<const char*> arguments = platform::arguments_of(words);
+    const pid_t child = platform::start(arguments[0], arguments.data(), {input});
+    if (child < 0) {
+      note(complain(program, strerror(errno)));
+    } else if (platform::ends_within(child, kPatience)) {
       take_end({program, child});
     } else {
       running_.push_back({program, child});
@@ -89,22 +78,12 @@ class Runs {
     pid_t process;
   };
 
-  static bool ends_soon(pid_t process) {
-    const int handle = static_cast<int>(syscall(SYS_pidfd_open, process, 0));
-    pollfd ended{handle, POLLIN, 0};
-    const bool soon = poll(&ended, 1, kPatience) > 0;
-    if (handle >= 0) close(handle);
-    return soon;
-  }
-
   void take_end(const Running& running) {
-    int status = 0;
-    while (waitpid(running.process, &status, 0) < 0 && errno == EINTR) continue;
-    if (WIFEXITED(status) && WEXITSTATUS(status) == 0) return;
+    const int status = platform::exit_status(platform::end_of(running.process));
+    if (status == 0) return;
     constexpr int kTimedOut = 124, kKilled = 137;
-    const int exit = WIFEXITED(status) ? WEXITSTATUS(status) : kKilled;
-    note(complain(running.program,
-                  exit == kTimedOut || exit == kKilled ? "took longer than 30 seconds" : "failed"));
+    const bool took_too_long = status == kTimedOut || status == kKilled || status < 0;
+    note(complain(running.program, took_too_long ? "took longer than 30 seconds" : "failed"));
   }
 
   std::vector<Running> running_;

@@ -1,10 +1,6 @@
 #include "vv/tool.h"
 
-#include <fcntl.h>
-#include <poll.h>
-#include <spawn.h>
 #include <sys/mman.h>
-#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -12,7 +8,7 @@
 #include <cstring>
 
 #include "common/file_text.h"
-#include "common/start.h"
+#include "common/program.h"
 
 namespace vv {
 namespace {
@@ -35,37 +31,14 @@ Arguments with_portal(Arguments arguments, const Portal& portal) {
 // What the tool prints goes into a memory file: unlike a pipe it has room for everything, and the tool may go
 // on writing to it when the reader is gone.
 pid_t start_tool(const Arguments& arguments, int output) {
-  std::vector<char*> words{const_cast<char*>(platform::kTool)};
-  for (const std::string& argument : arguments) words.push_back(const_cast<char*>(argument.c_str()));
-  words.push_back(nullptr);
-  posix_spawn_file_actions_t files;
-  posix_spawn_file_actions_init(&files);
-  posix_spawn_file_actions_addopen(&files, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-  posix_spawn_file_actions_adddup2(&files, output, STDOUT_FILENO);
-  posix_spawn_file_actions_adddup2(&files, output, STDERR_FILENO);
-  posix_spawnattr_t attributes;
-  sigset_t usual;
-  sigemptyset(&usual);
-  sigaddset(&usual, SIGINT);
-  sigaddset(&usual, SIGQUIT);
-  posix_spawnattr_init(&attributes);
-  posix_spawnattr_setsigdefault(&attributes, &usual);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF);
-  pid_t process = -1;
-  if (posix_spawnp(&process, platform::kTool, &files, &attributes, words.data(), environ) != 0) process = -1;
-  posix_spawnattr_destroy(&attributes);
-  posix_spawn_file_actions_destroy(&files);
-  return process;
+  std::vector<const char*> words = platform::arguments_of(arguments);
+  words.insert(words.begin(), platform::kTool);
+  return platform::start(platform::kTool, words.data(), {platform::kNowhere, output, output});
 }
 
 int wait_for(pid_t process, const std::function<void()>& look) {
-  const auto handle = static_cast<int>(syscall(SYS_pidfd_open, process, 0));
-  pollfd ended{handle, POLLIN, 0};
-  while (handle >= 0 && poll(&ended, 1, kLookEvery) == 0) look();
-  if (handle >= 0) close(handle);
-  int status = 0;
-  while (waitpid(process, &status, 0) < 0 && errno == EINTR) {
-  }
+  while (!platform::ends_within(process, kLookEvery)) look();
+  const int status = platform::end_of(process);
   look();
   return status;
 }
@@ -112,16 +85,16 @@ ToolRun run_tool(const Arguments& arguments, const std::function<void()>& look) 
   ToolRun run;
   const int output = memfd_create("output", MFD_CLOEXEC);
   if (output < 0) return run;
-  const sighandler_t interrupt = signal(SIGINT, SIG_IGN), quit = signal(SIGQUIT, SIG_IGN);
   const pid_t process = start_tool(arguments, output);
   if (process > 0) {
+    const sighandler_t interrupt = signal(SIGINT, SIG_IGN), quit = signal(SIGQUIT, SIG_IGN);
     const int status = wait_for(process, look);
     run.started = true;
-    run.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    run.status = platform::exit_status(status);
     run.signal = WIFSIGNALED(status) ? WTERMSIG(status) : 0;
+    signal(SIGINT, interrupt);
+    signal(SIGQUIT, quit);
   }
-  signal(SIGINT, interrupt);
-  signal(SIGQUIT, quit);
   run.output = platform::content_of(output);
   close(output);
   return run;
