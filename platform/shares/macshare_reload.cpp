@@ -40,6 +40,6 @@ int main(int argc, char** argv) {
   if (!done.untold) return 0;
   // netatalk(8): SIGHUP makes it and its servers read the configuration again.
   if (run({"killall", "-q", "-HUP", "netatalk"}) != 0) log_line(LOG_WARNING, "netatalk does not run");
-  remember_told(kShares);
+  remember_told(kShares, {});
   return 0;
 }

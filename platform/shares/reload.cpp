@@ -162,8 +162,13 @@ Reload reload_shares(const ShareServer& server) {
   return done;
 }
 
-void remember_told(const char* file) {
-  unlink((file + std::string(kUntoldMark)).c_str());
+void remember_told(const char* file, const std::vector<std::string>& left) {
+  const std::string mark = file + std::string(kUntoldMark);
+  if (left.empty()) {
+    unlink(mark.c_str());
+  } else {
+    mark_untold(mark, left);
+  }
 }
 
 }  // namespace shares

@@ -42,8 +42,9 @@ inline constexpr char kAccessFile[] = "/etc/remvol/shares.conf";
 // cannot be written. A mark beside the file keeps what is untold until remember_told().
 Reload reload_shares(const ShareServer& server);
 
-// The server has been told all, or will read it when it starts.
-void remember_told(const char* file);
+// The server knows the shares, or will read them when it starts. Clients of the shares named are still to be
+// cut off, whatever has become of these shares since.
+void remember_told(const char* file, const std::vector<std::string>& left);
 
 }  // namespace shares
 

@@ -13,6 +13,7 @@
 #include <cstring>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "common/begin.h"
 #include "shares/process.h"
@@ -64,16 +65,23 @@ bool samba_runs() {
   return pid > 0 && (kill(pid, 0) == 0 || errno == EPERM);
 }
 
-// Returns whether it was told all; one that does not run reads it when it starts.
-bool tell_samba(const Reload& done) {
+// One that does not run reads the shares when it starts, and has no clients.
+void tell_samba(const Reload& done) {
   const bool runs = samba_runs();
   if (!runs) log_line(LOG_NOTICE, "Samba does not run; it finds the shares when it starts");
-  bool told = run({"smbcontrol", "all", "reload-config"}) == 0;
+  const bool told = run({"smbcontrol", "all", "reload-config"}) == 0;
   if (!told) log_line(LOG_WARNING, "smbcontrol failed; Samba may not know the shares");
+  std::vector<std::string> left;
   for (const std::string& share : done.cut_off) {
-    told = run({"smbcontrol", "smbd", "close-share", share}) == 0 && told;
+    // Without "--" a name that begins with a dash is an option.
+    if (run({"smbcontrol", "smbd", "close-share", "--", share}) == 0 || !runs) continue;
+    left.push_back(share);
+    if (told) {
+      log_line(LOG_WARNING, "smbcontrol failed; clients of the share \"%s\" may still be in it",
+               share.c_str());
+    }
   }
-  return told || !runs;
+  if (told || !runs) remember_told(kShares, left);
 }
 
 void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool has_samba) {
@@ -105,6 +113,11 @@ int main(int argc, char** argv) {
                                      options_for_macs(config), command == ReloadCommand::kWithdraw});
   const bool has_samba = is_installed("smbcontrol");
   tell_what_is_missing(done, config, has_samba);
-  if (done.untold && (!has_samba || tell_samba(done))) remember_told(kShares);
+  if (!done.untold) return 0;
+  if (has_samba) {
+    tell_samba(done);
+  } else {
+    remember_told(kShares, {});
+  }
   return 0;
 }
