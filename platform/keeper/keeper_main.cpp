@@ -37,7 +37,7 @@ constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 
 struct Keeper {
   Schedule schedule;
-  Schedule initiator{kLooksWithoutInitiator};  // its daemon in place of a target
+  Schedule initiator{kLooksWithoutInitiator, Schedule::kLongestPause};  // its daemon in place of a target
   int signals = -1, devices = -1;
   pid_t process = -1;  // tries a target at this moment
   bool first = true;   // no look yet: what is away now was taken down when the settings say so

@@ -20,7 +20,15 @@ Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
 }
 
 void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) const {
+  if (wanted.connected && !target.connected) target.since = now;
+  target.connected = wanted.connected;
   if (wanted.connected) {
+    const time_t there = now - target.since;
+    if (there >= lasting_) {
+      target.pause = kFirstPause;
+      target.due = now;
+    }
+    if (target.missing && there < std::min(lasting_, target.pause)) return;
     target.tell = target.missing && !target.tell;
     target.missing = target.taken = false;
     target.absent = 0;
@@ -31,8 +39,6 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) c
   if (target.taken || target.missing) return;
   if (++target.absent < (wanted.at_work ? kLooksAtWork : looks_)) return;
   target.missing = target.tell = true;
-  target.pause = kFirstPause;
-  target.due = now;
 }
 
 void Schedule::look(const std::vector<Wanted>& wanted, time_t now) {
@@ -57,7 +63,7 @@ Change Schedule::next_change(std::string& name) {
 
 bool Schedule::next_try(Try& next, time_t now) {
   for (AwaitedTarget& target : targets_) {
-    if (!target.missing || now < target.due) continue;
+    if (!target.missing || target.connected || now < target.due) continue;
     next = {target.name, target.pause == kFirstPause};
     target.due = now + target.pause;
     target.pause = std::min(2 * target.pause, kLongestPause);

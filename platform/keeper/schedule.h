@@ -27,7 +27,9 @@ class Schedule {
  public:
   // A target is missing when it stays away for that many looks: a recovery logs out and in again.
   static constexpr int kLooks = 3;
-  explicit Schedule(int looks = kLooks) : looks_(looks) {}
+  // What is back begins anew when it has been there for `lasting` seconds: until then its pauses go on, and
+  // it is told as back only when it has been there for as long as the next of them.
+  explicit Schedule(int looks = kLooks, time_t lasting = 0) : looks_(looks), lasting_(lasting) {}
 
   // Compares with what the machine has; to be called about once a second, `now` in seconds. A target that is
   // no longer wanted is forgotten.
@@ -47,18 +49,20 @@ class Schedule {
  private:
   struct AwaitedTarget {
     std::string name;
-    bool seen = false;     // it is among those that are wanted
-    bool taken = false;    // it was taken away on purpose, and stays away until it has been connected again
-    bool missing = false;  // told
+    bool seen = false;       // it is among those that are wanted
+    bool connected = false;  // at the last look
+    bool taken = false;      // it was taken away on purpose, and stays away until it has been connected again
+    bool missing = false;    // told, and not yet told as back
     bool tell = false;
     int absent = 0;  // looks in a row without a session
-    time_t pause = kFirstPause, due = 0;
+    time_t since = 0, pause = kFirstPause, due = 0;
   };
 
   AwaitedTarget& find(const std::string& name);
   void settle(AwaitedTarget& target, const Wanted& wanted, time_t now) const;
 
   int looks_;
+  time_t lasting_;
   std::vector<AwaitedTarget> targets_;
 };
 

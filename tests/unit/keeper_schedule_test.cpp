@@ -37,6 +37,21 @@ class KeeperSchedule : public testing::Test {
     for (int i = 0; i < 3; i++) look(kAbsent);
   }
 
+  // The same when what is tried lives for that many seconds, again and again; takes the changes.
+  std::vector<long> tries_with_life(long life, long seconds, std::vector<Change>& changes) {
+    std::vector<long> found;
+    const long start = now_;
+    for (long dies = start; now_ < start + seconds; look(now_ + 1 < dies)) {
+      if (const Change one = change(); one != Change::kNone) changes.push_back(one);
+      Try next;
+      if (!schedule_.next_try(next, now_)) continue;
+      EXPECT_GE(now_, dies) << "it is tried while it is there";
+      found.push_back(now_ - start);
+      dies = now_ + life;
+    }
+    return found;
+  }
+
   Schedule schedule_;
   bool at_work_ = false;
   long now_ = 100;
@@ -94,6 +109,33 @@ TEST_F(KeeperSchedule, WhatIsBackIsToldAndBeginsAnew) {
   EXPECT_EQ(change(), Change::kBack);
   EXPECT_EQ(change(), Change::kNone);
   EXPECT_FALSE(schedule_.anything_missing());
+  lose();
+  EXPECT_EQ(tries(5), (std::vector<long>{0, 1, 3}));
+}
+
+TEST_F(KeeperSchedule, WhatIsToLastIsTriedWithGrowingPausesAndToldOfOnceWhileItDoesNot) {
+  schedule_ = Schedule(2, Schedule::kLongestPause);
+  lose();
+  std::vector<Change> changes;
+  EXPECT_EQ(tries_with_life(2, 250, changes), (std::vector<long>{0, 2, 4, 8, 16, 32, 64, 124, 184, 244}));
+  EXPECT_EQ(changes, std::vector<Change>{Change::kMissing});
+}
+
+TEST_F(KeeperSchedule, WhatIsToLastAndIsLostOnceIsSoonToldAsBack) {
+  schedule_ = Schedule(2, Schedule::kLongestPause);
+  lose();
+  std::vector<Change> changes;
+  EXPECT_EQ(tries_with_life(1000, 5, changes), std::vector<long>{0});
+  EXPECT_EQ(changes, (std::vector<Change>{Change::kMissing, Change::kBack}));
+}
+
+TEST_F(KeeperSchedule, WhatIsToLastBeginsAnewWhenItHasLasted) {
+  schedule_ = Schedule(2, Schedule::kLongestPause);
+  lose();
+  std::vector<Change> changes;
+  tries_with_life(2, 100, changes);
+  tries_with_life(1000, 120, changes);
+  EXPECT_EQ(changes, (std::vector<Change>{Change::kMissing, Change::kBack}));
   lose();
   EXPECT_EQ(tries(5), (std::vector<long>{0, 1, 3}));
 }
