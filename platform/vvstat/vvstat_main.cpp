@@ -70,7 +70,9 @@ std::vector<Row> ailing_among(const std::vector<Row>& rows) {
 
 Page page_of(const Snapshot& look, const PageOptions& options) {
   const Layout& layout = options.layout;
-  if (!look.status.reachable && layout.form == Form::kTable) {
+  // Whoever takes a report apart wants the rows alone.
+  const bool for_people = layout.form == Form::kTable && layout.headings;
+  if (!look.status.reachable && for_people) {
     return {"", folded(why_unreachable(), {}, layout.width)};
   }
   if (!look.status.reachable) {
@@ -81,10 +83,7 @@ Page page_of(const Snapshot& look, const PageOptions& options) {
   const std::vector<Row>& rows = options.ailing_only ? ailing : look.rows;
   Page page;
   if (!rows.empty() || layout.form == Form::kJson) page.table = volume_report(rows, layout);
-  // Whoever takes a report apart wants the rows alone.
-  if (layout.form == Form::kTable && layout.headings) {
-    page.verdict = verdict(look.rows, time(nullptr), layout.width);
-  }
+  if (for_people) page.verdict = verdict(look.rows, time(nullptr), layout.width);
   return page;
 }
 

@@ -967,7 +967,7 @@ def test_watch_as_json_is_one_object_after_the_other(example):
         jsonschema.validate(json.loads(text), SCHEMA)
 
 
-@pytest.mark.parametrize("form", ["--json", "--raw"])
+@pytest.mark.parametrize("form", ["--json", "--raw", "--noheadings"])
 def test_watch_for_programs_says_on_standard_error_that_the_tree_is_away(box, form):
     box.tree.stop()
     running = box.start(["vvstat", "--watch", form], env={"LD_PRELOAD": None})
