@@ -14,6 +14,7 @@ from harness.tree import Tree
 
 PACKAGING = pathlib.Path(__file__).resolve().parents[2] / "packaging"
 SMB_CONF = "/etc/samba/smb.conf"
+SMBD = "/usr/sbin/smbd"
 BLOCK = """
 # Begin: shares of remote volumes, added by remvol
 [global]
@@ -52,8 +53,9 @@ def helper(box, name, *args):
 
 @pytest.fixture
 def samba(bare_box):
-    """A box in which nothing was included yet."""
+    """A box with Samba's server in which nothing was included yet."""
     bare_box.run(["rm", "-rf", "/var/lib/remvol", "/etc/samba"])
+    bare_box.write(SMBD, "", mode=0o755)
     return bare_box
 
 
@@ -116,12 +118,39 @@ def test_the_include_comes_with_a_samba_that_comes_later(samba):
 
 
 @pytest.mark.parametrize("meanwhile", ["add", "remove"])
-def test_a_samba_that_is_purged_and_comes_back_includes_the_shares_again(samba, meanwhile):
-    path = samba.write(SMB_CONF, "")
-    helper(samba, "samba-include", "add")
-    path.unlink()
-    assert helper(samba, "samba-include", meanwhile).status == 0
+@pytest.mark.parametrize("first", [SMBD, SMB_CONF])
+def test_a_samba_that_is_purged_and_comes_back_includes_the_shares_again(samba, first, meanwhile):
+    """A package that goes loses its programs, then the packages that look at these are called, then its files go."""
     samba.write(SMB_CONF, "")
+    helper(samba, "samba-include", "add")
+    samba.path(first).unlink()
+    assert helper(samba, "samba-include", meanwhile).status == 0
+    samba.path(SMBD).unlink(missing_ok=True)
+    path = samba.write(SMB_CONF, "")
+    samba.write(SMBD, "", mode=0o755)
+    helper(samba, "samba-include", "add")
+    assert path.read_text() == BLOCK
+
+
+@pytest.mark.parametrize("text", ["[global]\n", "[global]\n" + BLOCK], ids=["taken out", "there"])
+def test_a_samba_that_is_removed_and_comes_back_to_its_configuration_finds_it_as_it_was(samba, text):
+    path = samba.write(SMB_CONF, "[global]\n")
+    helper(samba, "samba-include", "add")
+    path.write_text(text)
+    samba.path(SMBD).unlink()
+    assert helper(samba, "samba-include", "add").status == 0
+    samba.write(SMBD, "", mode=0o755)
+    helper(samba, "samba-include", "add")
+    assert path.read_text() == text
+
+
+def test_a_configuration_without_a_samba_is_left_alone(samba):
+    """Samba's client brings it, and takes it along when it goes."""
+    samba.path(SMBD).unlink()
+    path = samba.write(SMB_CONF, "")
+    assert helper(samba, "samba-include", "add").status == 0
+    assert path.read_text() == ""
+    samba.write(SMBD, "", mode=0o755)
     helper(samba, "samba-include", "add")
     assert path.read_text() == BLOCK
 
