@@ -31,7 +31,7 @@ expect_equal "connect state" 3 "$(target_key 1 conn_state)"
 postponed_run() { pgrep -f "remvol -w 10 --oiscsi_evt_recover -n $T" >/tmp/run; }
 expect "another run waits" postponed_run
 first_run=$(cat /tmp/run)
-another_run() { postponed_run && [ "$(cat /tmp/run)" != "$first_run" ] && ! kill -0 "${first_run%%?[0-9]*}"; }
+another_run() { postponed_run && [ "$(cat /tmp/run)" != "$first_run" ] && ! kill -0 "${first_run%%[!0-9]*}"; }
 wait_for 60 another_run
 expect_equal "connect state" 3 "$(target_key 1 conn_state)"
 expect_not "nothing is mounted yet" mounted s1
