@@ -94,6 +94,20 @@ class Worker:
         return self.passing.get(name, True)
 
 
+def must_pass_unbroken(copy, breakages):
+    """Ends the run where a test that these name fails by itself: it would seem to notice everything."""
+    for name in sorted({test for breakage in breakages for test in breakage.tests}):
+        if name.endswith(".py"):
+            status, output = copy.cli([f"tests/cli/{name}"], 300, 2)
+            # Many tests at once on a busy machine, as with a broken line.
+            passes = status == 0 or failing(output) and all(copy.cli([one], 300, 1)[0] == 0 for one in failing(output))
+        else:
+            status, output = copy.unit(name, UNIT_LIMIT)
+            passes = status == 0
+        if not passes:
+            raise SystemExit(f"{name} fails with nothing broken:\n{output[-3000:]}")
+
+
 def share_out(workers, breakages, test, done):
     """Every worker takes the next of the breakages."""
     waiting = queue.Queue()
@@ -149,6 +163,8 @@ def run_all(breakages, options, cover):
         worker.prepare(targets_of(breakages, cover))
     if cover:  # the unbroken programs, for the tests as they are now
         Copy("cover").refresh("tests/cli/")
+    else:
+        must_pass_unbroken(workers[0].copy, breakages)
     share_out(workers, breakages, "units", done)
     if options.units:
         for breakage in later:

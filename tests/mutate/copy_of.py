@@ -81,8 +81,12 @@ class Copy:
         return status == 0, output
 
     def unit(self, name, limit):
-        """Runs a unit test up to its first failure."""
-        return self.fenced([str(self.build / "bin" / name)], limit, {"GTEST_FAIL_FAST": "1", "GTEST_BRIEF": "1"})
+        """Runs a unit test up to its first failure, each of its cases in a process of its own, as ctest does."""
+        each = """cases=$("$0" --gtest_list_tests) && [ "$cases" ] || exit 1
+                  for case in $(echo "$cases" | awk '/^[^ ]/ { suite = $1 } /^ / { print suite $1 }'); do
+                      "$0" --gtest_filter="$case" || exit
+                  done"""
+        return self.fenced(["sh", "-c", each, str(self.build / "bin" / name)], limit, {"GTEST_BRIEF": "1"})
 
     def cli(self, arguments, limit, jobs):
         workers = ["-n", str(jobs)] if jobs > 1 else []
