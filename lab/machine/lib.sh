@@ -79,8 +79,8 @@ messages() { journalctl -b -o cat --no-pager $(printf -- '-u %s ' "$@"); }
 # ---- promises ----
 
 # A promise in seconds is judged only while the emulated machine has a processor to itself: it says nothing where a program
-# takes ten times as long to start.
-QUICK=15  # milliseconds for the start of a program
+# takes longer to start than twice what it takes where nothing else happens, some 10 milliseconds.
+QUICK=20  # milliseconds for the start of a program
 
 start_time() {
     read -r began rest </proc/uptime
@@ -89,13 +89,21 @@ start_time() {
     awk "BEGIN { printf \"%d\", ($ended - $began) * 10 }"
 }
 
-# within DESCRIPTION SECONDS PROMISE: the promise was kept, or the machine was too busy to judge it.
+# at_rest: looks how long that is, while nothing of the scenario itself runs; the longest counts.
+at_rest() {
+    each=$(start_time)
+    [ "$each" -le "$slowest" ] || slowest=$each
+}
+slowest=0
+
+# within DESCRIPTION SECONDS PROMISE: the promise was kept, or the machine was too busy to judge it, now or at an at_rest before.
 within() {
     say "$1: $2 s, at most $3 s are promised"
     awk "BEGIN { exit !($2 <= $3) }" && return
-    each=$(start_time)
-    [ "$each" -gt $QUICK ] || fail "$1: $2 s, more than $3 s"
-    say "  not judged: a program takes $each ms to start"
+    at_rest
+    [ "$slowest" -gt $QUICK ] || fail "$1: $2 s, more than $3 s"
+    say "  not judged: a program takes $slowest ms to start"
+    printf '\036unjudged\n' >&9
 }
 
 # ---- the end of the volumes ----

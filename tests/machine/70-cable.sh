@@ -20,7 +20,7 @@ head -c 1000 /dev/urandom >/tmp/sent
 
 # A client that writes ten files, one after the other, over a connection, and then over another one.
 client() {
-    while :; do
+    until [ -e /tmp/enough ]; do
         for _ in 1 2 3 4 5 6 7 8 9 10; do
             read -r uptime _ </proc/uptime
             echo "put /tmp/sent file-$uptime" && sleep 0.5
@@ -100,6 +100,7 @@ healed_within() {
 }
 
 provokes_loss
+at_rest
 client &
 client=$!
 has_written() { [ -n "$(written)" ]; }
@@ -109,11 +110,12 @@ mount_before=$(same)
 cut_for 10
 expect_equal "the mount of before" "$mount_before" "$(same)"
 cut_for 60
-healed_within 15 30
 before=$(written | tail -n 1)
 grew() { [ "$(written | tail -n 1)" != "$before" ]; }
 wait_for 60 grew
-kill $client
+touch /tmp/enough
+wait $client
+healed_within 15 30
 say "the client wrote $(written | wc -l) files"
 expect "its last file is there and whole" cmp /tmp/sent "/mnt/VV/Photos/$(written | tail -n 1)"
 expect_equal "what was there before" "text of Photos" "$(cat /mnt/VV/Photos/file)"
