@@ -19,14 +19,15 @@ def pytest_configure(config):
 
 
 def pytest_addoption(parser):
-    parser.addoption("--cases", type=choice, metavar="N[/EVERY]",
+    parser.addoption("--cases", type=choice, metavar="N[/EVERY[+FIRST]]",
                      help="of each test at most N cases: the first, the last, and some at equal distances between them; "
-                          "of each EVERY tests one alone")
+                          "of each EVERY tests one alone, beginning with the one behind FIRST others")
 
 
 def choice(text):
-    most, _, every = text.partition("/")
-    return int(most), int(every or 1)
+    most, _, share = text.partition("/")
+    every, _, first = share.partition("+")
+    return int(most), int(every or 1), int(first or 0)
 
 
 def leave_out(config, items, left_out):
@@ -34,13 +35,13 @@ def leave_out(config, items, left_out):
     items[:] = [item for item in items if item not in left_out]
 
 
-def not_chosen(items, most, every):
+def not_chosen(items, most, every, first):
     """The tests beyond so many cases of one function, and all of the functions between those that are chosen."""
     cases = {}
     for item in items:
         cases.setdefault(item.nodeid.partition("[")[0], []).append(item)
     for place, same in enumerate(cases.values()):
-        chosen = {i * (len(same) - 1) // max(most - 1, 1) for i in range(most)} if place % every == 0 else ()
+        chosen = {i * (len(same) - 1) // max(most - 1, 1) for i in range(most)} if place % every == first else ()
         yield from (item for number, item in enumerate(same) if number not in chosen)
 
 
