@@ -71,7 +71,8 @@ wait_for() {
     until_uptime=$(($(uptime_seconds) + limit))
     until "$@" >/dev/null 2>&1; do
         tries=$((tries + 1))
-        [ "$(uptime_seconds)" -lt "$until_uptime" ] || [ $tries -lt $((5 * limit)) ] ||
+        read -r now_uptime _ </proc/uptime # as uptime_seconds, which costs a process
+        [ "${now_uptime%.*}" -lt "$until_uptime" ] || [ $tries -lt $((5 * limit)) ] ||
             fail "waited $limit seconds for '$*'"
         sleep 0.2
     done

@@ -78,32 +78,11 @@ messages() { journalctl -b -o cat --no-pager $(printf -- '-u %s ' "$@"); }
 
 # ---- promises ----
 
-# A promise in seconds is judged only while the emulated machine has a processor to itself: it says nothing where a program
-# takes longer to start than twice what it takes where nothing else happens, some 10 milliseconds.
-QUICK=20  # milliseconds for the start of a program
-
-start_time() {
-    read -r began rest </proc/uptime
-    for _ in $(seq 100); do /bin/true; done
-    read -r ended rest </proc/uptime
-    awk "BEGIN { printf \"%d\", ($ended - $began) * 10 }"
-}
-
-# at_rest: looks how long that is, while nothing of the scenario itself runs; the longest counts.
-at_rest() {
-    each=$(start_time)
-    [ "$each" -le "$slowest" ] || slowest=$each
-}
-slowest=0
-
-# within DESCRIPTION SECONDS PROMISE: the promise was kept, or the machine was too busy to judge it, now or at an at_rest before.
+# within DESCRIPTION SECONDS PROMISE: a promise that was not kept fails the scenario at its end, unless the build machine was too
+# busy to judge it, which the runner sees.
 within() {
     say "$1: $2 s, at most $3 s are promised"
-    awk "BEGIN { exit !($2 <= $3) }" && return
-    at_rest
-    [ "$slowest" -gt $QUICK ] || fail "$1: $2 s, more than $3 s"
-    say "  not judged: a program takes $slowest ms to start"
-    printf '\036unjudged\n' >&9
+    awk "BEGIN { exit !($2 <= $3) }" || printf '\036missed\n' >&9
 }
 
 # ---- the end of the volumes ----

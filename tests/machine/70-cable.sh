@@ -100,7 +100,6 @@ healed_within() {
 }
 
 provokes_loss
-at_rest
 client &
 client=$!
 has_written() { [ -n "$(written)" ]; }
