@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include <cerrno>
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
@@ -22,9 +23,10 @@ constexpr char kSession[] = "/session";
 using SysfsPath = char[PATH_MAX];
 
 // Resolves the disk's `device` link: .../host2/session1/target2:0:0/2:0:0:1 for a LUN. A virtual device has
-// none.
+// none. A failure leaves its reason in errno.
 bool find_device(const char* node, SysfsPath& path) {
   const Text<256> disk = disk_of_node(node);
+  errno = ENOENT;
   return !disk.empty() && realpath(PathText("/sys/block/%s/device", disk.c_str()), path) != nullptr;
 }
 
@@ -38,12 +40,14 @@ const char* find_session_end(const char* path) {
   return nullptr;
 }
 
-// Reads the target's name from sessionN/iscsi_session/sessionN/targetname. Returns whether it has one.
+// Reads the target's name from sessionN/iscsi_session/sessionN/targetname. Returns whether it has one; a
+// failure leaves its reason in errno.
 bool read_session_target(const char* path, const char* session_end, char (&name)[256]) {
   const Text<PATH_MAX> session("%.*s", static_cast<int>(session_end - path), path);
   const char* session_name = strrchr(session, '/');
   const Text<2 * PATH_MAX> file_path("%s/iscsi_session%s/targetname", session.c_str(), session_name);
   const File file(fopen(file_path, "re"));
+  if (file) errno = ENOENT;  // also for an empty one
   if (!file || fgets(name, sizeof name, file.get()) == nullptr) return false;
   name[strcspn(name, "\n")] = '\0';
   return name[0] != '\0';
@@ -79,6 +83,13 @@ void log_foreign(const TargetEntry* entry, const char* node) {
   LOG(0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun, entry->target_name);
 }
 
+// Whose disk it is that could not be looked at. Only what is not there tells nothing; memory or descriptors
+// that have run out, and a disk that goes away just then, do not make a disk ours.
+DiskOwner owner_unseen() {
+  const bool is_absent = errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG;
+  return is_absent ? kDiskUnknown : kDiskForeign;
+}
+
 struct EntryPath {
   const TargetEntry* entry;
   const char* path;
@@ -94,12 +105,14 @@ bool is_others_mount(const MountLine& mount, const void* what) {
 
 DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
   SysfsPath path;
-  if (entry->target_name[0] == '\0' || !find_device(node, path)) return kDiskUnknown;
+  if (entry->target_name[0] == '\0') return kDiskUnknown;
+  if (!find_device(node, path)) return owner_unseen();
   const char* session_end = find_session_end(path);
   if (session_end == nullptr) return kDiskForeign;
   char name[256];
   long long lun = 0;
-  if (!read_session_target(path, session_end, name) || !read_lun(path, &lun)) return kDiskUnknown;
+  if (!read_session_target(path, session_end, name)) return owner_unseen();
+  if (!read_lun(path, &lun)) return kDiskUnknown;
   return strcmp(name, entry->target_name) == 0 && lun == entry->lun ? kDiskOurs : kDiskForeign;
 }
 

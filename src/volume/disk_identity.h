@@ -10,7 +10,8 @@ namespace remvol {
 
 enum DiskOwner : int {
   kDiskOurs,     // the session of the entry's target, the entry's LUN number
-  kDiskForeign,  // another session's, another LUN, or no session's at all: a disk of the machine
+  kDiskForeign,  // another session's, another LUN, or no session's at all: a disk of the machine; also one
+                 // that is there and could not be looked at
   kDiskUnknown,  // sysfs tells nothing: no such disk, a virtual one such as a loop device, no target given
 };
 

@@ -77,6 +77,26 @@ TEST_F(DiskIdentity, ALargeLunIsComparedAsTheKernelShowsIt) {
   EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskForeign);
 }
 
+TEST_F(DiskIdentity, WhatCannotBeLookedAtIsForeign) {
+  name_session(7, "iqn.t1\n");
+  lead_to("host2/session7/target2:0:0/2:0:0:3");
+  const std::string name = std::string(kDevices) + "/host2/session7/iscsi_session/session7/targetname";
+  std::filesystem::remove(name);
+  EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskUnknown);
+  std::filesystem::create_directory(name);  // opens, and cannot be read
+  EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskForeign);
+  std::filesystem::remove("/sys/block/sdb/device");
+  std::filesystem::create_symlink("device", "/sys/block/sdb/device");
+  EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskForeign);
+}
+
+TEST_F(DiskIdentity, NoDiskHasSuchANode) {
+  for (const std::string& node :
+       {std::string("/dev/"), std::string("sdz"), "/dev/" + std::string(300, 'x')}) {
+    EXPECT_EQ(disk_owner(&entry, node.c_str()), kDiskUnknown) << node;
+  }
+}
+
 TEST_F(DiskIdentity, OneThatWasOursAndIsGoneIsForeign) {
   name_session(7, "iqn.t1\n");
   lead_to("host2/session7/target2:0:0/2:0:0:3");
