@@ -1,6 +1,6 @@
-// The folder where the tool's runs, and the platform's programs, keep what is theirs while the machine runs.
-#ifndef REMVOL_RUN_FOLDER_H
-#define REMVOL_RUN_FOLDER_H
+// The files by which the tool's runs, and the platform's programs, know of each other while the machine runs.
+#ifndef REMVOL_RUN_FILES_H
+#define REMVOL_RUN_FILES_H
 
 #include <cstdint>
 
@@ -12,6 +12,9 @@ inline constexpr char kRunDir[] = "/run/remvol";  // only root may enter it
 // on a target as a whole has the file of the kind kTargetLock locked alone (flock(2), LOCK_EX).
 inline constexpr char kLockFormat[] = "%s-%016llx.lock";
 inline constexpr char kTargetLock[] = "target";
+
+// The run that recovers has a record lock on it (fcntl(2), F_WRLCK).
+inline constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.lock";
 
 // FNV-1a.
 constexpr unsigned long long name_hash(const char* name) {

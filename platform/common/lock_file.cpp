@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <cstdio>
 
-#include "run_folder.h"
+#include "run_files.h"
 
 namespace platform {
 namespace {

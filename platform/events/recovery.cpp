@@ -6,6 +6,7 @@
 #include "common/processes.h"
 #include "common/program.h"
 #include "common/tree_reader.h"
+#include "run_files.h"
 #include "tree_layout.h"
 
 namespace events {
@@ -16,7 +17,6 @@ using platform::runs;
 using platform::TreeReader;
 
 constexpr char kWholeTree[] = "/";
-constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.lock";  // the tool's
 
 // A target that was taken out meanwhile is not lost.
 bool is_lost(const TreeReader& tree, const std::string& target) {
@@ -30,7 +30,7 @@ bool is_lost(const TreeReader& tree, const std::string& target) {
 
 // A run that recovers goes on with what is queued, and nothing names the target that it has taken from there.
 bool is_recovering() {
-  const int fd = open(kRecoverLock, O_RDONLY | O_CLOEXEC);
+  const int fd = open(remvol::kRecoverLock, O_RDONLY | O_CLOEXEC);
   if (fd < 0) return false;
   struct flock lock {};
   lock.l_type = F_WRLCK;

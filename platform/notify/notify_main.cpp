@@ -19,7 +19,7 @@
 #include "vvstat/kernel.h"
 #include "vvstat/status.h"
 
-#include "run_folder.h"
+#include "run_files.h"
 
 namespace notify {
 namespace {

@@ -17,7 +17,7 @@
 #include "common/sessions.h"
 #include "vvstat/mounts.h"
 
-#include "run_folder.h"
+#include "run_files.h"
 
 namespace vvstat {
 namespace {

@@ -39,7 +39,7 @@ struct TargetFacts {
 // Reads /sys/class/iscsi_session, and of what is mounted statx(2), statvfs(3), the disk's
 // /sys/class/block/NAME/ro and the errors that an ext4 has counted; none of it waits for a disk. One with
 // errors, whose target answers, is asked for a file without a name, which leaves nothing behind: only that
-// tells whether it refuses writes. A run of the tool is known by its lock (run_folder.h). For all there is to
+// tells whether it refuses writes. A run of the tool is known by its lock (run_files.h). For all there is to
 // know, and where a file system has shut itself down, also /proc/self/mountinfo. The facts are in the order
 // of status.targets; what cannot be read counts as not there. Of several sessions of one target the one that
 // is logged in counts.

@@ -9,6 +9,7 @@
 #include <ctime>
 
 #include "frontend/log.h"
+#include "run_files.h"
 #include "support/files.h"
 #include "support/result.h"
 #include "support/text.h"

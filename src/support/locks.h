@@ -5,7 +5,6 @@
 namespace remvol {
 
 inline constexpr char kLockDir[] = "/var/lock/virtual_volume/";
-inline constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.lock";
 inline constexpr char kRecoverQueueLock[] = "/var/lock/virtual_volume/remvol_recover_queue.lock";
 
 // Makes the lock directory when missing. Returns 0, or -108 after printing the system error.

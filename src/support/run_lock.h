@@ -6,7 +6,7 @@
 #ifndef REMVOL_SUPPORT_RUN_LOCK_H
 #define REMVOL_SUPPORT_RUN_LOCK_H
 
-#include "run_folder.h"
+#include "run_files.h"
 #include "support/text.h"
 
 namespace remvol {

@@ -9,6 +9,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "run_files.h"
 #include "volume_fixture.h"
 
 using namespace remvol;
