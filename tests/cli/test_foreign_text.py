@@ -1,5 +1,8 @@
 """Text from outside (options, a settings file, remote machines) reaches a shell only as text."""
 
+import pathlib
+import re
+
 import pytest
 from appliance import Site
 from harness import messages
@@ -11,6 +14,10 @@ HOSTILE = [
     "x;touch /f\ntouch /f\n", "$(touch /f)`touch /f`", '";touch /f;"', "';touch /f;'>/f", "-x /f",
     "\x01\x7f*?{x,touch /f}~#!üm\\",
 ]
+PRINTABLE = "".join(map(chr, range(ord(" "), 127))) + ";touch /f"
+COMMANDS_OF_THE_TOOL = [name for name in re.findall(r'^    \{"(\w+)"', pathlib.Path(
+    __file__).parents[2].joinpath("src/frontend/commands.cpp").read_text("utf-8"), re.M) if name != "help"]
+ENDS_THE_TREE = ("system_off", "deinit")
 SETTINGS = {
     "target": "/iscsi/initiator/id:1/target", "ip": "/iscsi/initiator/id:1/ip",
     "user": "/iscsi/initiator/id:1/chap_name", "secret": "/iscsi/initiator/id:1/chap_pwd",
@@ -73,6 +80,24 @@ def test_no_option_runs_a_command(site, box, option):
             box.remvol(f"--{command}", *words)
         box.wait_quiet()
         check_calls(box, value)
+
+
+@pytest.mark.parametrize("given", [*SETTINGS, *(f"-{letter}" for letter in "nsiUPo")])
+def test_no_printable_character_gets_out_of_any_command(site, box, given):
+    options = {"-n": TARGET, "-i": "10.0.0.2", "-p": "3260", "-l": "0", "-s": "s", "-c": "1", "-U": "u", "-P": "p",
+               "-o": "/tmp/o", "-w": "1"}
+    options.update({given: PRINTABLE} if given in options else {"-n": PRINTABLE} if given == "target" else {})
+    words = [word for pair in options.items() for word in pair]
+    assert len(COMMANDS_OF_THE_TOOL) == 18
+    for command in sorted(COMMANDS_OF_THE_TOOL, key=lambda name: name in ENDS_THE_TREE):
+        if command in ENDS_THE_TREE[1:]:
+            box.tree.start()
+        store(site)
+        if given in SETTINGS:
+            box.tree.set(SETTINGS[given], PRINTABLE)
+        box.remvol(f"--{command}", *words)
+    box.wait_quiet()
+    check_calls(box, PRINTABLE)
 
 
 @pytest.mark.parametrize("secret", ["a$b", '"quoted"', "back`tick`", "back\\slash", "$(x)", "a'b", "a b ", "!#~*?", "ümläut"])
