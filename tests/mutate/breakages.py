@@ -11,14 +11,17 @@ SCOPE = [
     for name in ("unmount", "mount_point", "bare_folder", "cover", "format", "partition", "disk_identity", "disk_use",
                  "degrade", "mount", "mount_table", "mount_command")
 ] + ["platform/ktree/client/document.cpp", "src/tree/settings_file.cpp", "platform/shares/flash.cpp",
-     "platform/shares/flashrun.cpp", "platform/common/lock_file.cpp", "platform/ktree/settings_writer.cpp"] + [
+     "platform/shares/flashrun.cpp", "platform/shares/settings_copy.cpp", "platform/common/lock_file.cpp",
+     "platform/ktree/settings_writer.cpp"] + [
     f"src/support/{name}.cpp"
-    for name in ("run_lock", "target_hold", "locks", "format_semaphore", "temp_file", "files", "shell_text")
-] + [f"platform/sysaux/{name}.cpp" for name in ("content", "probe", "partitions")] + [
-    f"src/tree/{name}.cpp" for name in ("slots", "half_made", "state", "entry")
-] + [f"src/tasks/{name}.cpp" for name in ("format", "remove", "connect", "recover", "repair", "add", "status")] + [
-    f"src/iscsi/{name}.cpp" for name in ("session", "node", "iscsiadm")
-] + ["platform/ktree/service.cpp", "platform/ktree/endpoint.cpp", "src/frontend/options.cpp", "src/frontend/main.cpp"]
+    for name in ("run_lock", "target_hold", "session_hold", "disk_look", "locks", "format_semaphore", "temp_file", "files", "shell_text")
+] + [f"platform/sysaux/{name}.cpp" for name in ("content", "probe", "partitions", "disk_table", "copies")] + [
+    f"src/tree/{name}.cpp" for name in ("slots", "slot_reads", "half_made", "state", "entry")
+] + [f"src/tasks/{name}.cpp" for name in ("format", "remove", "connect", "recover", "repair", "add", "status", "whole_target")] + [
+    f"src/iscsi/{name}.cpp" for name in ("session", "node", "iscsiadm", "settings_daemon")
+] + ["src/volume/session_volumes.cpp", "src/upgrade/remvol_ver_upgrade.cpp", "platform/events/recovery.cpp",
+     "platform/events/targets.cpp", "platform/ktree/service.cpp", "platform/ktree/endpoint.cpp", "src/frontend/options.cpp",
+     "src/frontend/log.cpp", "src/frontend/main.cpp"]
 
 SWAPS = {
     "and for or": [(" || ", " && "), (" && ", " || ")],

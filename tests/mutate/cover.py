@@ -13,7 +13,7 @@ STORE = FOLDER / "cover.json"
 # The tree's daemon and the children that a box ends by force write no counts: their tests go by name.
 BY_NAME = {"platform/ktree/": ("test_ktree", "test_documents", "test_settings_kept"),
            "platform/shares/": ("test_flashrun", "test_shares", "test_settings_kept"),
-           "platform/sysaux/": ("test_sysaux",),
+           "platform/sysaux/": ("test_sysaux",), "platform/events/": ("test_events",),
            "src/volume/bare_folder.cpp": ("test_volume_disks",), "src/volume/cover.cpp": ("test_volume_disks",)}
 LONGEST = 900  # seconds for a test file, sixteen times what any takes
 

@@ -9,7 +9,8 @@ from concurrent.futures import ThreadPoolExecutor
 
 REPOSITORY = pathlib.Path(__file__).resolve().parents[2]
 SOURCES = REPOSITORY / "tests/fuzz"
-ENOUGH = 1000  # executions a second: a target that is slower finds little in its time
+ENOUGH = 1000  # executions a second of a processor: a target that is slower finds little in its time
+WARM = 60  # seconds after which a rate says something: a short run reads the cases of old alone
 # Freed memory that is kept for the sanitizer's reports costs more than the parsers when there is much of it.
 ENVIRONMENT = {**os.environ, "ASAN_OPTIONS": "quarantine_size_mb=16"}
 
@@ -27,13 +28,17 @@ def run(options):
     names = [source.stem for source in sorted(SOURCES.glob("*_fuzz.cpp")) if re.search(options.only, source.stem)]
     begin = time.monotonic()
     with ThreadPoolExecutor(options.jobs) as pool:
-        good = list(pool.map(lambda name: fuzz(name, options), names))
-    print(f"fuzz: {sum(good)} passed, {len(good) - sum(good)} failed ({options.seconds} s each, {time.monotonic() - begin:.0f} s)")
-    return all(good) and bool(good)
+        ended = dict(zip(names, pool.map(lambda name: fuzz(name, options), names)))
+    good = sum(is_good for is_good, _ in ended.values())
+    slowest = min(ended, key=lambda name: ended[name][1], default="")
+    print(f"fuzz: {good} passed, {len(ended) - good} failed ({options.seconds} s each, {time.monotonic() - begin:.0f} s"
+          + (f"; slowest {slowest}, {ended[slowest][1]:.0f} a second of a processor" if slowest else "") + ")")
+    return good == len(ended) > 0
 
 
 def fuzz(name, options):
-    """Runs one target; what it finds lies in build/fuzz, and belongs into tests/fuzz/corpus once it is mended."""
+    """Runs one target; what it finds lies in build/fuzz, and belongs into tests/fuzz/corpus once it is mended. Returns whether
+    nothing was found in enough executions, and their rate."""
     found = REPOSITORY / "build/fuzz" / name
     found.mkdir(parents=True, exist_ok=True)
     corpora = [found, *([SOURCES / "corpus" / name] if (SOURCES / "corpus" / name).exists() else [])]
@@ -47,9 +52,9 @@ def fuzz(name, options):
     stats = {key: int(value) for key, value in re.findall(r"stat::(\w+):\s+(\d+)", text)}
     executions, seconds = stats.get("number_of_executed_units", 0), used.ru_utime + used.ru_stime
     rate = executions / max(seconds, 0.01)
-    print(f"{name}: {executions} executions, {rate:.0f} a second of {seconds:.0f} s processor time"
-          f"{'' if rate >= ENOUGH else ' (slow)'}, {stats.get('new_units_added', 0)} new inputs, peak {stats.get('peak_rss_mb', 0)} MB, "
-          f"{'no finding' if process.returncode == 0 else 'FAILED'}", flush=True)
+    slow = rate < ENOUGH and options.seconds >= WARM
+    print(f"{name}: {executions} executions, {rate:.0f} a second of {seconds:.0f} s processor time, {stats.get('new_units_added', 0)} new inputs, peak {stats.get('peak_rss_mb', 0)} MB, "
+          f"{'FAILED' if process.returncode != 0 else 'TOO SLOW' if slow else 'no finding'}", flush=True)
     if process.returncode != 0:
         print(text[-4000:], flush=True)
-    return process.returncode == 0
+    return process.returncode == 0 and not slow, rate

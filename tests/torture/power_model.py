@@ -68,12 +68,16 @@ class Model:
         self.copied = False  # what was answered since then has made a new flash copy
 
     def choose(self, dice, number):
-        """The next step; `number` tells its file from all others."""
-        share = dice.choice(list(VOLUMES))
+        """The next step; `number` tells its file from all others. The first steps bring a volume up and write to it: without a
+        file there is little to lose."""
+        opening = not any(self.files.values())
+        share = next(iter(VOLUMES)) if opening else dice.choice(list(VOLUMES))
         if share not in self.present:
             verb = "add"
         elif not self.wish[VOLUMES[share][0]]:
             verb = "connect"
+        elif opening:
+            verb = "write"
         else:
             verb = dice.choices(list(WEIGHTS), list(WEIGHTS.values()))[0]
         step = Step(verb, "" if verb == "status" else share)
