@@ -53,7 +53,8 @@ def fuzz(name, options):
     executions, seconds = stats.get("number_of_executed_units", 0), used.ru_utime + used.ru_stime
     rate = executions / max(seconds, 0.01)
     slow = rate < ENOUGH and options.seconds >= WARM
-    print(f"{name}: {executions} executions, {rate:.0f} a second of {seconds:.0f} s processor time, {stats.get('new_units_added', 0)} new inputs, peak {stats.get('peak_rss_mb', 0)} MB, "
+    print(f"{name}: {executions} executions, {rate:.0f} a second of {seconds:.0f} s processor time, "
+          f"{stats.get('new_units_added', 0)} new inputs, peak {stats.get('peak_rss_mb', 0)} MB, "
           f"{'FAILED' if process.returncode != 0 else 'TOO SLOW' if slow else 'no finding'}", flush=True)
     if process.returncode != 0:
         print(text[-4000:], flush=True)
