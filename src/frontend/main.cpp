@@ -23,6 +23,7 @@
 #include "tree/access.h"
 #include "tree/settings_file.h"
 #include "tree_layout.h"
+#include "volume/session_volumes.h"
 #include "volume/share_services.h"
 
 using namespace remvol;
@@ -77,22 +78,24 @@ bool dump_settings(const CommandRow& command) {
 }
 
 // Returns whether the tree that the command has changed is gone, and the change with it: its daemon was
-// started anew and has loaded the settings of before, or does not answer any more. Logged at level 0. Where
-// there was no socket before the command, nothing is known of that.
-bool was_change_lost(const TreeInstance& tree) {
-  if (tree.inode == 0) return false;
-  if (tree == tree_instance() && tree_answers(result_key())) return false;
-  LOG(0, "the configuration tree was started anew meanwhile, what was changed may be lost");
-  return true;
+// started anew and has loaded the settings of before, or does not answer any more. Where there was no socket
+// before the command, nothing is known of that.
+bool is_tree_gone(const TreeInstance& tree) {
+  return tree.inode != 0 && !(tree == tree_instance() && tree_answers(result_key()));
 }
 
-int succeed(const CommandRow& command, int result, const TreeInstance& tree) {
+// Stores what the command has done. Returns whether it lasts.
+bool keep_change(const CommandRow& command, int result, const TreeInstance& tree) {
   record_result(NumberText("%d", result));
   const bool stored = dump_settings(command);
-  if (command.persists && was_change_lost(tree)) return fail(false);
-  if (command.persists && stored) copy_to_flash();
-  if (command.persists) reload_share_services();
-  return result;
+  if (!command.persists) return true;
+  if (is_tree_gone(tree)) {
+    LOG(0, "the configuration tree was started anew meanwhile, what was changed may be lost");
+    return false;
+  }
+  if (stored) copy_to_flash();
+  reload_share_services();
+  return true;
 }
 
 const char* failure_message(const CommandRow& command) {
@@ -111,9 +114,11 @@ int run(const CommandRow& command) {
   const int result = command.run();
   if (result != 0 && !command.reports_value) {
     LOG(1, "%s", failure_message(command));
-    return fail(false);
+  } else if (keep_change(command, result, tree)) {
+    return result;
   }
-  return succeed(command, result, tree);
+  if (command.persists && is_tree_gone(tree)) unmount_lost_volumes(request_target.target_name);
+  return fail(false);
 }
 
 void keep_program_path(int argc, char** argv) {

@@ -17,6 +17,7 @@
 #include "support/session_hold.h"
 #include "support/text.h"
 #include "sysaux.h"
+#include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
 #include "tree/slots.h"
@@ -36,9 +37,7 @@ namespace {
 
 constexpr int kRounds = 4;
 constexpr int kKillTries = 3;
-constexpr int kKillMaxWait = 200000;       // microseconds
-constexpr int kTreeLooks = 50;             // 5 seconds
-constexpr useconds_t kTreePause = 100000;  // microseconds
+constexpr int kKillMaxWait = 200000;  // microseconds
 constexpr char kPublicFtp[] = "/home/Public";
 constexpr size_t kFtpPathSize = 512;
 
@@ -94,19 +93,14 @@ Result remove_mount_point(const char* mount_point) {
   return kFailed;
 }
 
-// Returns whether the entry's LUN is stored no more. A tree that was started anew is waited for until it has
-// loaded its settings: a volume that they do not know would be nobody's, and its share name given again.
+bool is_stored(const TargetEntry* entry) {
+  const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
+  return slot && is_lun_stored_at(slot.target(), slot.lun());
+}
+
+// A tree that was started anew is waited for: a volume that its settings do not know would be nobody's.
 bool is_deleted(const TargetEntry* entry) {
-  bool deleted = false;
-  bool stored = false;
-  const auto look = [&] {
-    const HeldSlot slot(entry->db_idx, entry->lun_db_idx);
-    deleted = !slot;
-    stored = slot && is_lun_stored_at(slot.target(), slot.lun());
-    return deleted || stored;
-  };
-  for (int looks = 0; !look() && looks < kTreeLooks; looks++) usleep(kTreePause);
-  return deleted;
+  return !is_stored(entry) && await_loaded_tree() && !HeldSlot(entry->db_idx, entry->lun_db_idx);
 }
 
 // Unmounts every LUN of the target up to the first empty slot.

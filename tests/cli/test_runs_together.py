@@ -600,6 +600,37 @@ class TestATreeThatIsStartedAnew:
         assert box.tree.get("/result/add") == "-1"
         assert "the configuration tree was started anew meanwhile, what was changed may be lost" in messages(done)
 
+    def test_a_volume_that_was_lost_at_the_very_end_is_taken_away(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        site.log_in("iqn.t1")
+        site.disk("sdb")
+        box.session_disk("sdb", "iqn.t1")
+        box.tree.set(f"{INITIATOR}/ver", 1)
+        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
+                   "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & sleep 0.3")
+        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=restart, times=1)
+        box.hook("usleep", "100000", skip=3, times=1, through=True,
+                 effect=f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1")
+        assert box.remvol(*TestAdding.ADD).status == 255
+        assert any("mount -t ext4" in line for line in box.shell())
+        assert "/mnt/VV/a" not in box.run(["cat", "/proc/mounts"]).stdout
+
+    def test_a_volume_that_the_new_tree_knows_stays(self, site, box):
+        site.offer("iqn.t1", {0: "sdb", 1: "sdc"})
+        site.log_in("iqn.t1")
+        for lun, disk in enumerate(["sdb", "sdc"]):
+            site.disk(disk)
+            box.session_disk(disk, "iqn.t1", lun=lun)
+        box.path("/etc/NAS_CFG").mkdir(parents=True)
+        box.tree.set(f"{INITIATOR}/ver", 1)
+        assert box.remvol(*TestAdding.ADD).status == 0
+        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
+                   "ktree -n config -s /var/run/ktree_sock_vv -l /etc/NAS_CFG/vv.xml >/dev/null 2>&1 & sleep 0.3")
+        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=restart, times=1)
+        assert box.remvol("--add", "-n", "iqn.t1", "-i", "10.0.0.1", "-p", "3260", "-l", "1", "-s", "b").status == 255
+        mounts = box.run(["cat", "/proc/mounts"]).stdout
+        assert "/mnt/VV/a" in mounts and "/mnt/VV/b" not in mounts
+
     def test_an_add_whose_tree_does_not_answer_is_no_success(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})
         box.hook("ktreec_set", "/result/add", value="0", through=True, times=1,
