@@ -23,8 +23,8 @@
 #include "tree/access.h"
 #include "tree/settings_file.h"
 #include "tree_layout.h"
-#include "volume/session_volumes.h"
 #include "volume/share_services.h"
+#include "volume/unmount.h"
 
 using namespace remvol;
 
@@ -117,8 +117,9 @@ int run(const CommandRow& command) {
   } else if (keep_change(command, result, tree)) {
     return result;
   }
-  if (command.persists && is_tree_gone(tree)) unmount_lost_volumes(request_target.target_name);
-  return fail(false);
+  const int status = fail(false);
+  if (command.persists && is_tree_gone(tree)) unmount_lost_volumes();
+  return status;
 }
 
 void keep_program_path(int argc, char** argv) {

@@ -85,9 +85,16 @@ void log_foreign(const TargetEntry* entry, const char* node) {
 
 // Whose disk it is that could not be looked at. Only what is not there tells nothing; memory or descriptors
 // that have run out, and a disk that goes away just then, do not make a disk ours.
+bool is_absent() {
+  return errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG;
+}
+
 DiskOwner owner_unseen() {
-  const bool is_absent = errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG;
-  return is_absent ? kDiskUnknown : kDiskForeign;
+  return is_absent() ? kDiskUnknown : kDiskForeign;
+}
+
+SessionDisk session_unseen() {
+  return is_absent() ? SessionDisk::kNo : SessionDisk::kUnseen;
 }
 
 struct EntryPath {
@@ -116,13 +123,15 @@ DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
   return strcmp(name, entry->target_name) == 0 && lun == entry->lun ? kDiskOurs : kDiskForeign;
 }
 
-bool is_session_disk(const char* node, const char* target_name) {
+SessionDisk is_session_disk(const char* node, const char* target_name) {
   SysfsPath path;
-  if (!find_device(node, path)) return false;
+  if (!find_device(node, path)) return session_unseen();
   const char* session_end = find_session_end(path);
-  if (session_end == nullptr || target_name == nullptr) return session_end != nullptr;
+  if (session_end == nullptr) return SessionDisk::kNo;
+  if (target_name == nullptr) return SessionDisk::kYes;
   char name[256];
-  return read_session_target(path, session_end, name) && strcmp(name, target_name) == 0;
+  if (!read_session_target(path, session_end, name)) return session_unseen();
+  return strcmp(name, target_name) == 0 ? SessionDisk::kYes : SessionDisk::kNo;
 }
 
 bool has_disk(const char* node) {

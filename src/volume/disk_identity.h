@@ -18,9 +18,11 @@ enum DiskOwner : int {
 // Asks sysfs for the disk of `node`, a disk or partition with or without "/dev/" in front.
 [[nodiscard]] DiskOwner disk_owner(const TargetEntry* entry, const char* node);
 
+enum class SessionDisk { kNo, kYes, kUnseen };  // kUnseen: it is there and could not be looked at
+
 // Returns whether the disk of `node` is one of a session to the target called `target_name`, or to any when
 // that is null.
-[[nodiscard]] bool is_session_disk(const char* node, const char* target_name);
+[[nodiscard]] SessionDisk is_session_disk(const char* node, const char* target_name);
 
 // Returns whether sysfs has a disk of `node`, whosever it is.
 [[nodiscard]] bool has_disk(const char* node);

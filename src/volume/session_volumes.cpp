@@ -7,11 +7,8 @@
 #include "support/command.h"
 #include "support/result.h"
 #include "support/session_hold.h"
-#include "support/target_hold.h"
 #include "support/text.h"
-#include "tree/access.h"
 #include "tree/record.h"
-#include "tree/search_results.h"
 #include "volume/disk_identity.h"
 #include "volume/mount_point.h"
 #include "volume/mount_table.h"
@@ -25,22 +22,14 @@ constexpr int kMaxVolumes = 64;
 
 bool is_session_volume(const MountLine& mount, const void* target_name) {
   return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0 &&
-         is_session_disk(mount.source, static_cast<const char*>(target_name));
+         is_session_disk(mount.source, static_cast<const char*>(target_name)) != SessionDisk::kNo;
 }
 
-// Of the volumes of a target that is brought up by no other run now. A tree that does not answer knows each.
-bool is_lost_volume(const MountLine& mount, const void* target_name) {
-  return is_session_volume(mount, target_name) &&
-         ktree_check_duplicate_share_name(mount.path + strlen(kMountRoot)) == 0 && tree_is_loaded();
-}
-
-// Unmounts the volumes that `fits(mount, target_name)`. Returns whether none is left. A table that is there
-// and cannot be read may show one.
-bool unmount_session_volumes(bool (*fits)(const MountLine& mount, const void* target_name),
-                             const char* target_name) {
+// Returns whether none is left. A table that is there and cannot be read may show one.
+bool unmount_session_volumes(const char* target_name) {
   MountLine mount;
   for (int volumes = 0;; volumes++) {
-    const Mounted found = find_mount(fits, target_name, &mount);
+    const Mounted found = find_mount(is_session_volume, target_name, &mount);
     if (found == Mounted::kNo || (found == Mounted::kUnknown && errno == ENOENT)) return true;
     if (found == Mounted::kUnknown) {
       LOG(0, "%s cannot be read: %s, no session is closed", kMountInfo, strerror(errno));
@@ -49,7 +38,10 @@ bool unmount_session_volumes(bool (*fits)(const MountLine& mount, const void* ta
     TargetEntry entry = {};
     copy_text(entry.share, mount.path + strlen(kMountRoot));
     copy_text(entry.mnt_dev, mount.source);
-    if (volumes < kMaxVolumes && Target_LUN_umount(&entry) == kOk) continue;
+    if (volumes < kMaxVolumes && is_session_disk(mount.source, target_name) == SessionDisk::kYes &&
+        Target_LUN_umount(&entry) == kOk) {
+      continue;
+    }
     LOG(0, "the session of %s stays, it is mounted on %s", mount.source, mount.path);
     return false;
   }
@@ -65,14 +57,8 @@ bool has_session_volume(const char* target_name) {
 
 int close_sessions(const char* target_name, const char* logout) {
   const SessionClosing closing(target_name);
-  if (!unmount_session_volumes(is_session_volume, target_name)) return 1;
+  if (!unmount_session_volumes(target_name)) return 1;
   return run_command(logout) == 0 ? 0 : 1;
-}
-
-void unmount_lost_volumes(const char* target_name) {
-  const LogScope scope;
-  const TargetHold hold(target_name);
-  if (await_loaded_tree()) (void)unmount_session_volumes(is_lost_volume, target_name);
 }
 
 }  // namespace remvol

@@ -16,11 +16,6 @@ namespace remvol {
 // then the command does not run.
 [[nodiscard]] int close_sessions(const char* target_name, const char* logout);
 
-// Unmounts the volumes of the target that the tree, which was started anew during this run, does not know:
-// what was added last is not in the settings that it has loaded. They would be nobody's, and their share
-// names given again.
-void unmount_lost_volumes(const char* target_name);
-
 }  // namespace remvol
 
 #endif

@@ -15,11 +15,13 @@
 #include "support/fuser.h"
 #include "support/result.h"
 #include "support/session_hold.h"
+#include "support/target_hold.h"
 #include "support/text.h"
 #include "sysaux.h"
 #include "tree/access.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
+#include "tree/settings_file.h"
 #include "tree/slots.h"
 #include "volume/bare_folder.h"
 #include "volume/disk_identity.h"
@@ -98,10 +100,16 @@ bool is_stored(const TargetEntry* entry) {
   return slot && is_lun_stored_at(slot.target(), slot.lun());
 }
 
-// A tree that was started anew is waited for: a volume that its settings do not know would be nobody's.
+// A tree that was started anew is waited for: a volume that its settings do not know would be nobody's. One
+// that was not loaded from them knows nothing, whatever others have stored in it by now.
 bool is_deleted(const TargetEntry* entry) {
-  return !is_stored(entry) && await_loaded_tree() && !HeldSlot(entry->db_idx, entry->lun_db_idx);
+  return !is_stored(entry) && await_loaded_tree() && unloaded_settings() == nullptr &&
+         !HeldSlot(entry->db_idx, entry->lun_db_idx);
 }
+
+// The volumes that this run was asked of; those of one target, as a rule.
+TargetEntry brought_up[kMaxLunsPerTarget];
+int number_brought_up = 0;
 
 // Unmounts every LUN of the target up to the first empty slot.
 void umount_luns(int dbidx) {
@@ -143,7 +151,18 @@ Result Target_LUN_umount(const TargetEntry* entry) {
 
 void unmount_if_deleted(const TargetEntry* entry) {
   const LogScope scope;
-  if (is_deleted(entry)) (void)Target_LUN_umount(entry);
+  if (is_deleted(entry)) {
+    (void)Target_LUN_umount(entry);
+  } else if (number_brought_up < kMaxLunsPerTarget) {
+    brought_up[number_brought_up++] = *entry;
+  }
+}
+
+void unmount_lost_volumes() {
+  for (int i = 0; i < number_brought_up; i++) {
+    const TargetHold hold(brought_up[i].target_name, brought_up[i].lun);
+    if (is_deleted(&brought_up[i])) (void)Target_LUN_umount(&brought_up[i]);
+  }
 }
 
 Result Target_umount_all_lun(int dbidx) {

@@ -15,6 +15,11 @@ Result Target_LUN_umount(const TargetEntry* entry);
 // that was started anew meanwhile.
 void unmount_if_deleted(const TargetEntry* entry);
 
+// Does that again for every volume of which it was asked and that stayed: the tree's daemon may have died
+// since, and what was added last is not in the settings that a new one has loaded. The volume would be
+// nobody's, and its share name given again.
+void unmount_lost_volumes();
+
 // Unmounts every LUN of the target up to the first empty slot. Returns 0, or -1 when the slot is empty.
 Result Target_umount_all_lun(int dbidx);
 

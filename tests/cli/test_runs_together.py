@@ -394,6 +394,13 @@ class TestASessionUnderAVolume:
         shell = box.shell()
         assert shell.index('umount -f "/mnt/VV/unknown"') < shell.index(logout)
 
+    def test_a_disk_that_cannot_be_looked_at_may_be_the_sessions(self, unknown, box):
+        done = box.run(["sh", "-c", "cd $(realpath /sys/block/sdq/device)/../../iscsi_session/session*/ && rm targetname && mkdir targetname"])
+        assert done.status == 0, done.stderr
+        said = messages(box.remvol("--disconnect", "-n", "iqn.t1"))
+        assert "the session of /dev/sdq1 stays, it is mounted on /mnt/VV/unknown" in said
+        assert unknown.logged_in("iqn.t1") and unknown.mounted("unknown")
+
     @pytest.mark.parametrize("command", [["--disconnect", "-n", "iqn.t1"], ["--disconnect"]])
     def test_another_targets_volume_does_not_matter(self, stored, box, command):
         stored.log_in("iqn.t1")
@@ -630,6 +637,21 @@ class TestATreeThatIsStartedAnew:
         assert box.remvol("--add", "-n", "iqn.t1", "-i", "10.0.0.1", "-p", "3260", "-l", "1", "-s", "b").status == 255
         mounts = box.run(["cat", "/proc/mounts"]).stdout
         assert "/mnt/VV/a" in mounts and "/mnt/VV/b" not in mounts
+
+    def test_a_new_tree_that_was_not_loaded_tells_nothing_of_volumes(self, site, box):
+        site.offer("iqn.t1", {0: "sdb"})
+        site.log_in("iqn.t1")
+        site.disk("sdb")
+        box.path("/etc/NAS_CFG").mkdir(parents=True)
+        box.run(["sh", "-c", f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1; "
+                             "ktreec -S /var/run/ktree_sock_vv -D /etc/NAS_CFG/vv.xml"])
+        box.tree.set(f"{INITIATOR}/ver", 1)
+        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
+                   "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & sleep 0.3; "
+                   f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/count 1")
+        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=restart, times=1)
+        assert box.remvol(*TestAdding.ADD).status == 255
+        assert "/mnt/VV/a" in box.run(["cat", "/proc/mounts"]).stdout
 
     def test_an_add_whose_tree_does_not_answer_is_no_success(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})

@@ -43,6 +43,8 @@ TEST_F(DiskIdentity, TheTargetAndTheLunMakeItOurs) {
   lead_to("host2/session7/target2:0:0/2:0:0:3");
   for (const char* node : {"sdb", "/dev/sdb", "sdb1", "/dev/sdb1", "/dev/sdb12"}) {
     EXPECT_EQ(disk_owner(&entry, node), kDiskOurs) << node;
+    EXPECT_EQ(is_session_disk(node, "iqn.t1"), SessionDisk::kYes) << node;
+    EXPECT_EQ(is_session_disk(node, nullptr), SessionDisk::kYes) << node;
   }
 }
 
@@ -51,6 +53,7 @@ TEST_F(DiskIdentity, AnotherTargetOrLunMakesItForeign) {
     name_session(7, name);
     lead_to("host2/session7/target2:0:0/2:0:0:3");
     EXPECT_EQ(disk_owner(&entry, "/dev/sdb1"), kDiskForeign) << name;
+    EXPECT_EQ(is_session_disk("/dev/sdb1", "iqn.t1"), SessionDisk::kNo) << name;
   }
   name_session(7, "iqn.t1\n");
   for (const char* lun : {"0", "33", "4294967299"}) {
@@ -64,6 +67,7 @@ TEST_F(DiskIdentity, ADiskOfTheMachineIsForeign) {
        {"ata1/host0/target0:0:0/0:0:0:3", "virtio2", "session/0:0:0:3", "sessions7/0:0:0:3"}) {
     lead_to(device);
     EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskForeign) << device;
+    EXPECT_EQ(is_session_disk("sdb", nullptr), SessionDisk::kNo) << device;
   }
 }
 
@@ -83,11 +87,14 @@ TEST_F(DiskIdentity, WhatCannotBeLookedAtIsForeign) {
   const std::string name = std::string(kDevices) + "/host2/session7/iscsi_session/session7/targetname";
   std::filesystem::remove(name);
   EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskUnknown);
+  EXPECT_EQ(is_session_disk("sdb", "iqn.t1"), SessionDisk::kNo);
   std::filesystem::create_directory(name);  // opens, and cannot be read
   EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskForeign);
+  EXPECT_EQ(is_session_disk("sdb", "iqn.t1"), SessionDisk::kUnseen);
   std::filesystem::remove("/sys/block/sdb/device");
   std::filesystem::create_symlink("device", "/sys/block/sdb/device");
   EXPECT_EQ(disk_owner(&entry, "sdb"), kDiskForeign);
+  EXPECT_EQ(is_session_disk("sdb", nullptr), SessionDisk::kUnseen);
 }
 
 TEST_F(DiskIdentity, NoDiskHasSuchANode) {
