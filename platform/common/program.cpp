@@ -12,12 +12,6 @@
 namespace platform {
 namespace {
 
-// Whether the program has the caller's file as its stream already. A file that was opened where a stream was
-// missing has its number and goes when the program begins; a duplicate of itself stays.
-bool is_inherited(int file, int stream) {
-  return file == stream && fcntl(file, F_GETFD) != FD_CLOEXEC;
-}
-
 // Duplicates come before what is closed by being replaced: /dev/null last.
 class Files {
  public:
@@ -25,7 +19,7 @@ class Files {
     posix_spawn_file_actions_init(&actions_);
     const int wanted[] = {streams.input, streams.output, streams.error};
     for (int stream = STDIN_FILENO; stream <= STDERR_FILENO; stream++) {
-      if (wanted[stream] >= 0 && !is_inherited(wanted[stream], stream)) {
+      if (wanted[stream] >= 0 && wanted[stream] != stream) {
         posix_spawn_file_actions_adddup2(&actions_, wanted[stream], stream);
       }
     }

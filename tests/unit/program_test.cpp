@@ -10,6 +10,8 @@
 #include <csignal>
 #include <string>
 
+#include "common/begin.h"
+
 using namespace platform;
 
 namespace {
@@ -43,23 +45,35 @@ TEST(Program, ItsOutputAndErrorsGoWhereTheyAreTold) {
   close(file);
 }
 
-// A file that is opened gets the number of a stream then, and is closed when the program begins.
+// A file that is opened would get the number of a stream.
 TEST(Program, ACallerWithoutStreamsOfItsOwnMakesNoDifference) {
   for (const int first : {STDIN_FILENO, STDOUT_FILENO}) {
     EXPECT_EQ(apart([first] {
                 for (int stream = first; stream <= STDERR_FILENO; stream++) close(stream);
+                begin();
                 const int file = memfd_create("output", MFD_CLOEXEC);
+                const int other = memfd_create("other", MFD_CLOEXEC);
                 const int status = exit_status(end_of(start_shell("echo out", {kNowhere, file, kNowhere})));
-                return file == first && status == 0 && content(file) == "out\n" ? 0 : 1;
+                const int told = exit_status(end_of(start_shell("echo out; exit 7", {})));
+                const bool sent = status == 0 && content(file) == "out\n" && told == 7;
+                return sent && write(first, "", 0) < 0 && content(other).empty() ? 0 : 1;
               }),
               0)
         << first;
   }
+}
+
+TEST(Program, StreamsThatAreThereStay) {
   EXPECT_EQ(apart([] {
-              for (int stream = STDIN_FILENO; stream <= STDERR_FILENO; stream++) close(stream);
-              return exit_status(end_of(start_shell("exit 7", {})));
+              const int file = memfd_create("output", 0);
+              dup2(file, STDOUT_FILENO);
+              close(file);
+              begin();
+              const int next = memfd_create("next", MFD_CLOEXEC);
+              const int status = exit_status(end_of(start_shell("echo out", {})));
+              return next == file && status == 0 && content(STDOUT_FILENO) == "out\n" ? 0 : 1;
             }),
-            7);
+            0);
 }
 
 TEST(Program, ItsEndIsTold) {
