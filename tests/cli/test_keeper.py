@@ -146,7 +146,7 @@ def test_a_volume_that_somebody_else_unmounts_is_mounted_again(keeper):
     mount(box)
     box.wait_until(lambda: "Photos is mounted again" in keeper.daemon.stderr, what="its being told")
     assert [line for line in keeper.daemon.stderr.splitlines() if "Photos" in line] == [
-        "remvol-keeper: Photos was unmounted by somebody else, it is mounted again", "remvol-keeper: Photos is mounted again"]
+        "remvol-keeper: Photos was unmounted by somebody else, it is going to be mounted", "remvol-keeper: Photos is mounted again"]
 
 
 def test_a_volume_that_cannot_be_mounted_is_left_to_a_person(keeper):

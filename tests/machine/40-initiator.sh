@@ -72,4 +72,5 @@ wait_for 120 vvstat
 expect_well "after a stranger unmounted"
 expect_equal "the other volume stayed" "$other" "$(stat -c %d:%i /mnt/VV/Music/now)"
 expect_equal "the sessions stayed" "$sessions" "$(ls /sys/class/iscsi_session)"
-expect_has "the keeper says so" "remvol-keeper: Photos is mounted again" "$(journalctl --no-pager -b -u remvol-keeper)"
+keeper_says_so() { messages remvol-keeper | grep -qx 'remvol-keeper: Photos is mounted again'; }
+wait_for 30 keeper_says_so

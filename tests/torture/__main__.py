@@ -67,10 +67,9 @@ def run_pairs(options):
 
 def run_faults(options):
     begin = time.monotonic()
-    faults = Faults(options.only or (options.at or "").split("/")[0], options.seed, options.jobs)
-    everything = faults.system_calls(options.count, options.seed) if options.system_calls else faults.all
+    faults = Faults(options.only or (options.at or "").split("/")[0], options.seed, options.jobs, options.system_calls)
     share, shares = options.shard
-    chosen = sorted((fault for fault in everything
+    chosen = sorted((fault for fault in faults.all
                      if options.at in (None, fault.key()) and re.search(options.named or "", str(fault))
                      and faults.order(fault) % shares == share), key=faults.order)
     results = Results(options.results)
@@ -152,7 +151,7 @@ def main():
     faults.add_argument("--seconds", type=float, help="begin none after so long")
     faults.add_argument("--only", default="", help="one road")
     faults.add_argument("--at", help="one fault, by its key")
-    faults.add_argument("--system-calls", action="store_true", help="below the C library, by strace: a sample")
+    faults.add_argument("--system-calls", action="store_true", help="those below the C library, by strace")
     faults.add_argument("--named", help="those whose text this expression finds")
     faults.add_argument("--seed", type=int, default=1)
     faults.add_argument("--jobs", type=int, default=2)

@@ -3,13 +3,13 @@
 After a fault: no crash, no hang, no success that is none; and the same command again, without the fault, ends as if
 nothing had happened (beside a run that never had a fault). What is settled otherwise stands in settled.py."""
 
+import collections
 import dataclasses
 import errno
 import json
 import multiprocessing
 import os
 import pathlib
-import random
 import re
 import time
 import zlib
@@ -21,13 +21,14 @@ from world import SAVED, World
 
 CALL, TREE, COMMAND, MEMORY, SYSTEM = range(5)
 CLASSES = ("call", "tree", "command", "memory", "system call")
-SYSTEM_CALLS = ("openat read write close newfstatat socket connect sendmsg recvmsg pipe2 clone3 clone vfork execve wait4 "
-                "dup2 mmap fcntl flock unlink rename mkdir fsync semop getdents64").split()
+# They do not fail, or nothing is left that could take notice.
+UNFAILING = "exit exit_group rt_sigreturn restart_syscall arch_prctl set_tid_address set_robust_list rseq".split()
 INJECTED = "/tmp/injected"
 FAIL, KILL, NOTHING, MUTE, LATE = range(5)
 KINDS = ("fails", "is killed", "does nothing and says 0", "prints nothing", "works and says 1")
 EIO, ENOMEM, ENOSPC, EMFILE = 5, 12, 28, 24
 ERRORS = (EIO, ENOSPC, EMFILE)
+SYSTEM_ERRORS = (*ERRORS, ENOMEM)
 PACE = 5  # percent: nobody meets anybody here
 HANG = 30  # seconds
 
@@ -52,7 +53,8 @@ class Fault:
         return self.kind == KILL and self.kind_of != COMMAND
 
     def key(self):
-        return f"{self.road}/{self.kind_of}/{self.index}/{int(self.forever)}/{self.kind}/{self.error}"
+        what = f"{self.index}.{self.name}" if self.kind_of == SYSTEM else self.index
+        return f"{self.road}/{self.kind_of}/{what}/{int(self.forever)}/{self.kind}/{self.error}"
 
 
 # --- what is there afterwards ---
@@ -202,6 +204,23 @@ class Walk:
                 raise RuntimeError(f"{self.name}: {world.findings()}")
         return [line.split("\t", 3) for line in calls]
 
+    def system_calls(self):
+        """What clean() tells of the calls, below the C library: those of a kind that any one process made, the tool or
+        what it starts."""
+        with self.world() as world:
+            self.begin(world)
+            command, options = self.road.command
+            job = world.begin(command, under=["strace", "-f", "-qq", "-o", INJECTED], **options)
+            job.running.wait(HANG)
+            job.ended = time.monotonic()
+            world.box.wait_quiet()
+            text = world.box.path(INJECTED).read_text("utf-8", "replace")
+        made = collections.Counter(re.findall(r"(?m)^(\d+) +(\w+)\(", text))
+        most = {}
+        for (_, name), number in made.items():
+            most[name] = max(number, most.get(name, 0))
+        return [(SYSTEM, index, name, "") for name in sorted(most.keys() - set(UNFAILING)) for index in range(1, most[name] + 1)]
+
     def suffer(self, fault, outcomes):
         """What is wrong after one fault and not settled; None when it was never met."""
         with self.world() as world:
@@ -290,25 +309,28 @@ def possible(road, calls, seed):
             yield fault(False, FAIL, ENOMEM)
             yield fault(True, FAIL, ENOMEM)
         else:
+            errors = SYSTEM_ERRORS if kind_of == SYSTEM else ERRORS
             for forever in (False, True):
-                yield fault(forever, FAIL, ERRORS[draw(seed, road, kind_of, index, forever) % len(ERRORS)])
+                yield fault(forever, FAIL, errors[draw(seed, road, kind_of, index, forever) % len(errors)])
             yield fault(False, KILL)
 
 
-def walk_clean(name):
+def walk_clean(name, below):
     """A road's walk, and the calls on it."""
     road = ROADS[name]
     walk = Walk(name, road.beginning(beginning(*road.furnish)[0]))
-    return walk, walk.clean()
+    calls = walk.clean()
+    return walk, walk.system_calls() if below else calls
 
 
 class Faults:
-    """All roads: their clean walks, and the list of what can fail."""
+    """All roads: their clean walks, and the list of what can fail, in the C library or `below` it."""
 
-    def __init__(self, only="", seed=1, jobs=2):
-        names = [name for name in ROADS if only in ("", name)]
+    def __init__(self, only="", seed=1, jobs=2, below=False):
+        # strace waits for the daemon that a road without one starts.
+        names = [name for name, road in ROADS.items() if only in ("", name) and (road.unit or not below)]
         with multiprocessing.Pool(jobs) as pool:
-            walked = dict(zip(names, pool.map(walk_clean, names, chunksize=1)))
+            walked = dict(zip(names, pool.starmap(walk_clean, [(name, below) for name in names], chunksize=1)))
         self.seed = seed
         self.walks = {name: walk for name, (walk, _) in walked.items()}
         self.all = [fault for name, (_, calls) in walked.items() for fault in possible(name, calls, seed)]
@@ -316,13 +338,6 @@ class Faults:
     def order(self, fault):
         """Where a fault stands among all: the same in every run, whatever else is chosen."""
         return draw(self.seed, fault.key())
-
-    def system_calls(self, count, seed):
-        """Faults below the C library, in the tool and in everything that it starts: the index-th of a kind in each."""
-        dice = random.Random(seed)
-        return [Fault(dice.choice(list(self.walks)), SYSTEM, dice.randint(1, 40), dice.random() < 0.3,
-                      dice.choice([FAIL, FAIL, KILL]), dice.choice([EIO, ENOSPC, EMFILE, ENOMEM]),
-                      dice.choice(SYSTEM_CALLS), "") for _ in range(count)]
 
     def play(self, fault, outcomes):
         return self.walks[fault.road].suffer(fault, outcomes)
