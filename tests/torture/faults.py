@@ -21,9 +21,10 @@ from world import SAVED, World
 
 CALL, TREE, COMMAND, MEMORY, SYSTEM = range(5)
 CLASSES = ("call", "tree", "command", "memory", "system call")
-# They do not fail, or nothing is left that could take notice.
-UNFAILING = "exit exit_group rt_sigreturn restart_syscall arch_prctl set_tid_address set_robust_list rseq".split()
+# They do not fail, or nothing is left that could take notice; a descriptor is closed whatever close(2) says.
+UNFAILING = "close exit exit_group rt_sigreturn restart_syscall arch_prctl set_tid_address set_robust_list rseq".split()
 INJECTED = "/tmp/injected"
+STRACE = ["strace", "-f", "-b", "execve", "-qq", "-o", INJECTED]  # not what it starts: that is made up, and fails as a whole
 FAIL, KILL, NOTHING, MUTE, LATE = range(5)
 KINDS = ("fails", "is killed", "does nothing and says 0", "prints nothing", "works and says 1")
 EIO, ENOMEM, ENOSPC, EMFILE = 5, 12, 28, 24
@@ -206,11 +207,11 @@ class Walk:
 
     def system_calls(self):
         """What clean() tells of the calls, below the C library: those of a kind that any one process made, the tool or
-        what it starts."""
+        one that is to become what it starts."""
         with self.world() as world:
             self.begin(world)
             command, options = self.road.command
-            job = world.begin(command, under=["strace", "-f", "-qq", "-o", INJECTED], **options)
+            job = world.begin(command, under=STRACE, **options)
             job.running.wait(HANG)
             job.ended = time.monotonic()
             world.box.wait_quiet()
@@ -246,7 +247,7 @@ class Walk:
         if fault.kind_of == SYSTEM:
             when = f"{fault.index}{'+' if fault.forever else ''}"
             effect = "signal=KILL" if fault.kind == KILL else f"error={errno.errorcode[fault.error]}"
-            under = ["strace", "-f", "-qq", "-o", INJECTED, "-e", f"trace={fault.name}",
+            under = [*STRACE, "-e", f"trace={fault.name}",
                      "-e", f"inject={fault.name}:{effect}:when={when}"]
         else:
             world.plan(kind_of=fault.kind_of, index=fault.index, forever=fault.forever, kind=fault.kind, error=fault.error)
@@ -327,8 +328,7 @@ class Faults:
     """All roads: their clean walks, and the list of what can fail, in the C library or `below` it."""
 
     def __init__(self, only="", seed=1, jobs=2, below=False):
-        # strace waits for the daemon that a road without one starts.
-        names = [name for name, road in ROADS.items() if only in ("", name) and (road.unit or not below)]
+        names = [name for name in ROADS if only in ("", name)]
         with multiprocessing.Pool(jobs) as pool:
             walked = dict(zip(names, pool.starmap(walk_clean, [(name, below) for name in names], chunksize=1)))
         self.seed = seed

@@ -1,5 +1,6 @@
 #include "world.h"
 
+#include <errno.h>
 #include <fcntl.h>
 #include <signal.h>
 #include <stdarg.h>
@@ -17,6 +18,11 @@ static int raw_open(const char* path, int flags) {
   return (int)syscall(SYS_openat, AT_FDCWD, path, flags | O_CLOEXEC, 0666);
 }
 
+/* As early as can be: a fault below the C library (--system-calls) would take this world for the tool. */
+__attribute__((constructor)) static void map_early(void) {
+  world_map();
+}
+
 struct world* world_map(void) {
   static struct world* world;
   if (world != NULL) return world;
@@ -30,9 +36,9 @@ struct world* world_map(void) {
 
 int world_lock(void) {
   int fd = raw_open("/fake/world/lock", O_RDWR | O_CREAT);
-  while (syscall(SYS_flock, fd, LOCK_EX) != 0) {
+  while (syscall(SYS_flock, fd, LOCK_EX) != 0 && errno == EINTR) {
   }
-  return fd;
+  return fd; /* without the lock where it cannot be had: nobody meets anybody then, but for a fault */
 }
 
 void world_unlock(int lock) {
