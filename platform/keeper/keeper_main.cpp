@@ -168,7 +168,8 @@ void tell_of_volumes(Keeper& daemon) {
   std::string share;
   for (Change change; (change = daemon.volumes.next_change(share)) != Change::kNone;) {
     if (change == Change::kMissing) {
-      platform::report(LOG_WARNING, "remvol-keeper: %s was unmounted by somebody else, it is going to be mounted",
+      platform::report(LOG_WARNING,
+                       "remvol-keeper: %s was unmounted by somebody else, it is going to be mounted",
                        share.c_str());
     } else if (change == Change::kGivenUp) {
       platform::report(LOG_ERR, "remvol-keeper: %s cannot be mounted again, see vvstat", share.c_str());
