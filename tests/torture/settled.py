@@ -30,6 +30,8 @@ SUCCESS = (
     (r"^modify", r"tree /iscsi/initiator/id:\d+/chap_",
      "--modify says 0 when its target is known; that the tree fails is told at level 0",
      r"ktreec_\w+"),
+    (r"system call \d+ \(write \) fails for ever", r"settings differ$",
+     "nor can anything be told when nothing can be written"),
     (r"^modify_address$", r"tree /iscsi/initiator/id:3/port: 3260 for 3261",
      "what refuses a new address says 0 as well; the printed text tells a refusal from a change",
      r"Can not find \S+ at IP: |is connecting, disconnect it before"),
@@ -72,7 +74,7 @@ AFTER = (
     (r"^del", r"(folder|mount|target) ",
      "a slot is deleted although its volume could not be unmounted or its session closed, and the deletion that is "
      "asked for again finds no slot"),
-    (r"^search_lun-.*( is killed| for ever|: memory|--logout\)|iscsiadm -m session\b|_session\.tmp\)|fgets |str_insert_back_slash |/mountinfo\))",
+    (r"^search_lun-.*( is killed| for ever|: memory|: system call|--logout\)|iscsiadm -m session\b|_session\.tmp\)|fgets |str_insert_back_slash |/mountinfo\))",
      r"(target \d|tree /iscsi/initiator/id:\d+/(lun/id:\d+/)?(conn_state|status|dev):)",
      "a search that does not come to its logout or whose logout fails, that does not see the session which it has opened, or "
      "cannot see that nothing is mounted from it leaves the target logged in, and the status says so; nobody can tell any "
