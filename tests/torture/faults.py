@@ -21,8 +21,9 @@ from world import SAVED, World
 
 CALL, TREE, COMMAND, MEMORY, SYSTEM = range(5)
 CLASSES = ("call", "tree", "command", "memory", "system call")
-# They do not fail, or nothing is left that could take notice; a descriptor is closed whatever close(2) says.
-UNFAILING = "close exit exit_group rt_sigreturn restart_syscall arch_prctl set_tid_address set_robust_list rseq".split()
+# They do not fail, or nothing is left that could take notice; a descriptor is closed whatever close(2) says, and a child of
+# one's own is waited for.
+UNFAILING = "close wait4 exit exit_group rt_sigreturn restart_syscall arch_prctl set_tid_address set_robust_list rseq".split()
 INJECTED = "/tmp/injected"
 STRACE = ["strace", "-f", "-b", "execve", "-qq", "-o", INJECTED]  # not what it starts: that is made up, and fails as a whole
 FAIL, KILL, NOTHING, MUTE, LATE = range(5)
