@@ -15,7 +15,24 @@ expect_nothing_runs() {
 # as_before FILE: a file of open-iscsi is what its package brought, not what ours wrote.
 as_before() { expect_not "$1 is ours" grep -q -e 'replacement_timeout = 30$' -e 'iqn\.2013-03' "$1"; }
 
-works --modify -n $IQN:t1 -c 1 -U maria -P s3cr3tw0rd
+# Where the secret lies: in the settings, their copy and the target's record, for root alone.
+with_secret() { grep -rl s3cr3tw0rd /etc /usr/local /var /run /tmp /root /home 2>/dev/null | sort; }
+
+remvol -d 3 >/dev/null
+for command in "--modify -n $IQN:t1 -c 1 -U maria -P s3cr3tw0rd" "--connect -n $IQN:t1" --status; do
+    # shellcheck disable=SC2086 # words
+    expect "remvol $command" systemd-cat -t remvol remvol $command
+done
+remvol -d 0 >/dev/null
+wait_for 30 mounted Photos
+records=$(find /etc/iscsi/nodes /var/lib/iscsi/nodes -path "*$IQN:t1*" -type f 2>/dev/null)
+expect_equal "the target's records" 1 "$(printf '%s\n' "$records" | grep -c .)"
+expect_equal "files with the secret" "$(printf '%s\n' /etc/NAS_CFG/vv.xml "$records" /usr/local/config/vv.xml | sort)" "$(with_secret)"
+with_secret | while read -r file; do
+    expect_equal "the mode of $file" "600 root root" "$(stat -c '%a %U %G' "$file")"
+done || exit 1
+expect_has "the journal at level 3" "arg[9]: '***'" "$(journalctl --no-pager -b -t remvol)"
+expect_lacks "the journal" s3cr3tw0rd "$(journalctl --no-pager -b -o export)"
 mkdir -p /var/lib/prometheus/node-exporter
 systemctl enable --now remvol-metrics.timer
 systemctl start remvol-metrics.service
