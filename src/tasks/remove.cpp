@@ -31,12 +31,14 @@ void reload_lun_share([[maybe_unused]] const TargetEntry* entry) {
 
 // Deletes a slot, or the whole target's when `lun_dbidx` is 0; the tree moves the slots behind it down. What
 // another run has deleted meanwhile is deleted, and so is what a try has deleted whose answer was lost:
-// another one would take the slot that has moved there. Returns 0 or kNotDeleted.
+// another one would take the slot that has moved there. So it would while the tree tells nothing: what was
+// asked of it may still be done. Returns 0 or kNotDeleted.
 Result delete_stored_slot(int dbidx, int lun_dbidx) {
   const SlotsHeld held(SlotsHeld::kChange);
   for (int tries = 0; tries < kDeleteTries; tries++) {
     const HeldSlot slot(dbidx, lun_dbidx);
     if (!slot) return kOk;
+    if (tries > 0 && !slot.is_seen()) break;
     const KeyText key =
         lun_dbidx > 0 ? KeyText(key::kLun, slot.target(), slot.lun()) : KeyText(key::kTarget, slot.target());
     if (delete_slot(key) == kOk) return kOk;

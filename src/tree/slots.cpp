@@ -45,32 +45,34 @@ bool holds_lun(int n, int m, int lun) {
 
 // Returns the slot of 1 to `last` that `holds` tells, asked for `slot` first; `slot` in a tree that does not
 // answer, and kGone when none does. One that was silent during the first look, since its daemon was started
-// anew, answers the second.
+// anew, answers the second. `seen` becomes false where the tree tells nothing.
 template <typename Holds>
-int find_slot(int slot, int last, Holds holds) {
+int find_slot(int slot, int last, bool* seen, Holds holds) {
   for (int looks = 0; looks < 2; looks++) {
     if (holds(slot)) return slot;
     for (int other = 1; other <= last; other++) {
       if (holds(other)) return other;
     }
-    if (!tree_is_loaded()) return slot;
+    if (tree_is_loaded()) continue;
+    *seen = false;
+    return slot;
   }
   return kGone;
 }
 
-int find_target(int n) {
+int find_target(int n, bool* seen) {
   if (!is_target_slot(n) || known_slots[n].target[0] == '\0') return n;
   const char* name = known_slots[n].target;
-  const int now = find_slot(n, kMaxTargets, [name](int slot) { return holds_target(slot, name); });
+  const int now = find_slot(n, kMaxTargets, seen, [name](int slot) { return holds_target(slot, name); });
   if (now == kGone) LOG(1, "target %s is stored no more", name);
   return now;
 }
 
-int find_lun(int n, int m, int target) {
+int find_lun(int n, int m, int target, bool* seen) {
   if (!is_lun_slot(n, m) || known_lun(n, m) == kNoLun) return m;
   const int lun = known_lun(n, m);
   const int now =
-      find_slot(m, kMaxLunsPerTarget, [target, lun](int slot) { return holds_lun(target, slot, lun); });
+      find_slot(m, kMaxLunsPerTarget, seen, [target, lun](int slot) { return holds_lun(target, slot, lun); });
   if (now == kGone) LOG(1, "lun %d of target %s is stored no more", lun, known_slots[n].target);
   return now;
 }
@@ -94,7 +96,7 @@ void SlotsHeld::let_go() {
 }
 
 HeldSlot::HeldSlot(int n, int m)
-    : target_(find_target(n)), lun_(target_ != kGone ? find_lun(n, m, target_) : kGone) {
+    : target_(find_target(n, &seen_)), lun_(target_ != kGone ? find_lun(n, m, target_, &seen_) : kGone) {
   found_ = lun_ != kGone;
 }
 

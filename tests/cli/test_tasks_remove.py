@@ -104,6 +104,15 @@ class TestTarget:
         assert box.remvol("--del", "-n", "iqn.t1").status == 0
         assert (site.target("target"), site.target("target", 2)) == ("iqn.t2", None)
 
+    def test_a_tree_that_tells_nothing_any_more_is_not_asked_again(self, site, box):
+        """Requests that wait are carried out later, and what has moved into the slot would be deleted by a further one."""
+        site.store("iqn.t1")
+        site.store("iqn.t2", slot=2)
+        box.hook("ktreec_del", "/iscsi/initiator/id:1", ret=-1, times=1,
+                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+        assert box.remvol("--del", "-n", "iqn.t1").status == 255
+        assert site.trace().count("del id:1") == 1
+
     @pytest.mark.parametrize("name", ["iqn.t3", "iqn.t", "", "x" * 255])
     def test_an_unknown_target_refreshes_the_count_alone(self, site, box, name):
         site.store("iqn.t1", luns=[("a", 0)])
@@ -177,6 +186,13 @@ class TestLun:
         box.hook("ktreec_del", "/iscsi/initiator/id:1/lun/id:1", ret=-1, times=1, effect=f"{DELETED}/lun/id:1")
         assert box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0").status == 0
         assert [site.lun("share", n) for n in (1, 2, 3)] == ["b", "c", None]
+
+    def test_a_tree_that_tells_nothing_any_more_is_not_asked_again(self, site, box):
+        site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
+        box.hook("ktreec_del", "/iscsi/initiator/id:1/lun/id:1", ret=-1, times=1,
+                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+        assert box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0").status == 255
+        assert site.trace().count("del id:1/lun/id:1") == 1
 
     def test_a_failed_unmount_does_not_stop_it(self, mounted, box):
         box.fake("rm", status=1)

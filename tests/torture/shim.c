@@ -205,7 +205,8 @@ PUBLIC FILE* fopen(const char* path, const char* mode) {
   int outer = inside;
   inside = 1;
   FILE* stream = REAL(fopen)(path, mode);
-  if (in_tool && !outer && strcmp(path, "/proc/self/mountinfo") == 0) stream = table_of_disks(stream);
+  if (stream != NULL && in_tool && !outer && strcmp(path, "/proc/self/mountinfo") == 0)
+    stream = table_of_disks(stream);
   inside = outer;
   return stream;
 }
