@@ -14,7 +14,8 @@ COMMANDS = {
     "": [],
     "valgrind": ["/usr/bin/valgrind", "-q", "--error-exitcode=99", "--leak-check=full", "--errors-for-leak-kinds=definite",
                  "--show-leak-kinds=definite", "--trace-children=yes", "--trace-children-skip=/bin/*,/usr/*,/fake/*,/sbin/*",
-                 "--child-silent-after-fork=yes"],
+                 "--child-silent-after-fork=yes",
+                 f"--suppressions={pathlib.Path(__file__).resolve().parents[2] / 'torture/memcheck.supp'}"],
 }
 
 
