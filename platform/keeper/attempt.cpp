@@ -1,5 +1,6 @@
 #include "keeper/attempt.h"
 
+#include <mntent.h>
 #include <net/if.h>
 #include <netdb.h>
 #include <netinet/in.h>
@@ -7,11 +8,10 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
+#include <cstdio>
 #include <vector>
 
-#include "common/mounts.h"
 #include "common/program.h"
 #include "common/tree_reader.h"
 #include "tree_layout.h"
@@ -78,10 +78,16 @@ bool read_stored(const std::string& target, Stored& stored) {
 }
 
 bool has_mounted(const Stored& stored) {
-  const std::vector<platform::Mount> mounts = platform::read_mounts();
-  return std::any_of(stored.shares.begin(), stored.shares.end(), [&mounts](const std::string& share) {
-    return !share.empty() && platform::mount_on(mounts, remvol::kMountRoot + share) != nullptr;
-  });
+  FILE* table = setmntent("/proc/self/mounts", "re");
+  if (table == nullptr) return false;
+  bool found = false;
+  while (const mntent* entry = found ? nullptr : getmntent(table)) {
+    for (const std::string& share : stored.shares) {
+      found = found || (!share.empty() && remvol::kMountRoot + share == entry->mnt_dir);
+    }
+  }
+  endmntent(table);
+  return found;
 }
 
 }  // namespace
@@ -110,17 +116,6 @@ int try_target(const std::string& target, bool refresh) {
   if (refresh) run_silently({"--status"});
   if (!portal_answers(stored.address, stored.port)) return 1;
   return run_silently({mounted ? "--oiscsi_evt_recover" : "--connect", "-n", target.c_str()});
-}
-
-int mount_again(const std::string& share) {
-  platform::TreeReader tree;
-  for (int n = 1; n <= remvol::kMaxTargets; n++) {
-    for (int m = 1; m <= remvol::kMaxLunsPerTarget; m++) {
-      if (tree.value(remvol::key::kLunShare, n, m) != share) continue;
-      return run_silently({"--connect", "-n", tree.value(remvol::key::kTargetName, n).c_str()});
-    }
-  }
-  return 1;
 }
 
 }  // namespace keeper

@@ -1,4 +1,4 @@
-// One try to connect a target again, or to mount a volume again.
+// One try to connect a target again.
 #ifndef PLATFORM_KEEPER_ATTEMPT_H
 #define PLATFORM_KEEPER_ATTEMPT_H
 
@@ -14,10 +14,6 @@ bool portal_answers(const std::string& address, const std::string& port);
 // Returns the exit status, 1 when the portal does not answer. With `refresh` the status texts are brought up
 // to date before.
 int try_target(const std::string& target, bool refresh);
-
-// Has the tool connect the target of the volume, which mounts what is not mounted. Returns the exit status, 1
-// when there is no such volume.
-int mount_again(const std::string& share);
 
 }  // namespace keeper
 

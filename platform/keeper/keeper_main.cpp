@@ -1,11 +1,12 @@
-// remvol-keeper: sees to it that what should be there is there: the initiator's daemon, a session of each
-// target that is to be connected, and the mounts of its volumes.
+// remvol-keeper: sees to it that what should be there is there: the initiator's daemon, and a session of each
+// target that is to be connected.
 
 #include <poll.h>
 #include <sys/signalfd.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
@@ -17,7 +18,6 @@
 #include <vector>
 
 #include "common/begin.h"
-#include "common/mounts.h"
 #include "common/processes.h"
 #include "common/program.h"
 #include "common/report.h"
@@ -32,18 +32,14 @@ namespace keeper {
 namespace {
 
 constexpr char kInitiatorDaemon[] = "iscsid";
+constexpr int kLooksWithoutInitiator = 2;
 constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 
-constexpr Terms kInitiatorTerms = {.looks = 2, .lasting = Schedule::kLongestPause};
-// One that cannot be mounted needs a person.
-constexpr Terms kVolumeTerms = {.tries = 4, .once_there = true};
-
 struct Keeper {
-  Schedule targets;
-  Schedule volumes{kVolumeTerms};
-  Schedule initiator{kInitiatorTerms};  // its daemon
+  Schedule schedule;
+  Schedule initiator{kLooksWithoutInitiator, Schedule::kLongestPause};  // its daemon in place of a target
   int signals = -1, devices = -1;
-  pid_t process = -1;  // tries a target or volume at this moment
+  pid_t process = -1;  // tries a target at this moment
   bool first = true;   // no look yet: what is away now was taken down when the settings say so
 };
 
@@ -57,11 +53,6 @@ time_t now() {
 bool is_taken_down(const std::string& target = {}) {
   return platform::runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"},
                         target);
-}
-
-// Its volume goes because somebody wants it to.
-bool is_volume_taken_down(const std::string& target) {
-  return is_taken_down(target) || platform::runs(platform::kTool, {"--format", "--del_lun"}, target);
 }
 
 bool is_brought_up() {
@@ -102,86 +93,35 @@ void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
   if (daemon.initiator.next_try(next, now())) start_program({kInitiatorDaemon, "-f"}, kInitiatorDaemon);
 }
 
-// What is to be there of the settings.
-struct AllWanted {
-  std::vector<Wanted> targets;
-  std::vector<Wanted> volumes;  // of targets that are logged in, unless something else is wrong with them
-  bool answered = false;        // the tree did
-};
-
-void add_volumes(const platform::TreeReader& tree, int n, const std::vector<platform::Mount>& mounts,
-                 bool at_work, std::vector<Wanted>& volumes) {
-  using namespace remvol;
-  for (int m = 1; m <= kMaxLunsPerTarget; m++) {
-    const std::string share = tree.value(key::kLunShare, n, m);
-    if (share.empty() || tree.number(0, key::kLunEnable, n, m) != 1 ||
-        tree.number(kVolumeNormal, key::kLunVolumeState, n, m) != kVolumeNormal ||
-        tree.number(kFormatIdle, key::kLunFormatState, n, m) != kFormatIdle) {
-      continue;
-    }
-    const bool mounted = platform::mount_on(mounts, kMountRoot + share) != nullptr;
-    const bool is_taken = !mounted && is_volume_taken_down(tree.value(key::kTargetName, n));
-    volumes.push_back({share, mounted, is_taken, at_work});
-  }
-}
-
-AllWanted read_wanted(bool first) {
+std::vector<Wanted> read_wanted(bool first, bool& answered) {
   const std::vector<platform::Session> sessions = platform::read_sessions();
   const bool at_work = is_brought_up();
-  const std::vector<platform::Mount> mounts = platform::read_mounts();
   platform::TreeReader tree;
-  AllWanted wanted;
+  std::vector<Wanted> wanted;
   for (int n = 1; n <= remvol::kMaxTargets; n++) {
     const std::string name = tree.value(remvol::key::kTargetName, n);
     if (name.empty()) break;
     if (tree.number(0, remvol::key::kTargetConnSet, n) == 0) continue;
-    bool connected = false, up = false;
-    for (const platform::Session& session : sessions) {
-      connected = connected || session.target == name;
-      up = up || (session.target == name && session.link == platform::Link::kUp);
-    }
-    const int state = tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n);
-    const bool was_taken = first && state == remvol::kDisconnected;
+    const bool connected =
+        std::any_of(sessions.begin(), sessions.end(),
+                    [&name](const platform::Session& session) { return session.target == name; });
+    const bool was_taken = first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) ==
+                                        remvol::kDisconnected;
     const bool is_taken = !connected && (was_taken || is_taken_down(name));
-    wanted.targets.push_back({name, connected, is_taken, at_work});
-    if (up && state == remvol::kConnected) add_volumes(tree, n, mounts, at_work, wanted.volumes);
+    wanted.push_back({name, connected, is_taken, at_work});
   }
-  wanted.answered = tree.answered();
+  answered = tree.answered();
   return wanted;
 }
 
-void try_again(Keeper& daemon, const char* what, const Try& next) {
-  daemon.process = start_program({"remvol-keeper", what, next.target.c_str()}, "/proc/self/exe");
+void try_again(Keeper& daemon, const Try& next) {
+  daemon.process = start_program({"remvol-keeper", next.first ? "--try-first" : "--try", next.target.c_str()},
+                                 "/proc/self/exe");
 }
 
-void try_what_is_due(Keeper& daemon) {
-  Try next;
-  if (daemon.process >= 0) return;
-  if (daemon.targets.next_try(next, now())) {
-    try_again(daemon, next.first ? "--try-first" : "--try", next);
-  } else if (daemon.volumes.next_try(next, now())) {
-    try_again(daemon, "--mount", next);
-  }
-}
-
-void tell_of_volumes(Keeper& daemon) {
-  std::string share;
-  for (Change change; (change = daemon.volumes.next_change(share)) != Change::kNone;) {
-    if (change == Change::kMissing) {
-      platform::report(LOG_WARNING,
-                       "remvol-keeper: %s was unmounted by somebody else, it is going to be mounted",
-                       share.c_str());
-    } else if (change == Change::kGivenUp) {
-      platform::report(LOG_ERR, "remvol-keeper: %s cannot be mounted again, see vvstat", share.c_str());
-    } else {
-      platform::report(LOG_NOTICE, "remvol-keeper: %s is mounted again", share.c_str());
-    }
-  }
-}
-
-void tell_of_targets(Keeper& daemon) {
+void tell(Keeper& daemon) {
   std::string target;
-  for (Change change; (change = daemon.targets.next_change(target)) != Change::kNone;) {
+  for (Change change; (change = daemon.schedule.next_change(target)) != Change::kNone;) {
     if (change == Change::kMissing) {
       platform::report(LOG_WARNING,
                        "remvol-keeper: %s should be connected and is not, it is tried until it is",
@@ -193,14 +133,13 @@ void tell_of_targets(Keeper& daemon) {
 }
 
 void look(Keeper& daemon) {
-  const AllWanted wanted = read_wanted(daemon.first);
-  keep_initiator(daemon, wanted.answered, is_taken_down());
-  if (!wanted.answered) return;
+  bool answered = false;
+  const std::vector<Wanted> wanted = read_wanted(daemon.first, answered);
+  keep_initiator(daemon, answered, is_taken_down());
+  if (!answered) return;
   daemon.first = false;
-  daemon.targets.look(wanted.targets, now());
-  daemon.volumes.look(wanted.volumes, now());
-  tell_of_targets(daemon);
-  tell_of_volumes(daemon);
+  daemon.schedule.look(wanted, now());
+  tell(daemon);
 }
 
 // Returns false when the daemon is to end.
@@ -218,8 +157,7 @@ bool take_signals(Keeper& daemon) {
 // still there.
 bool wait_for_look(Keeper& daemon) {
   static unsigned char buffer[1 << 14];
-  const bool hurry = daemon.targets.anything_missing() || daemon.volumes.anything_missing() ||
-                     daemon.initiator.anything_missing();
+  const bool hurry = daemon.schedule.anything_missing() || daemon.initiator.anything_missing();
   const time_t due = now() + (hurry ? kHurry : kRest);
   for (bool session = false; !session && now() < due;) {
     pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}};
@@ -253,15 +191,16 @@ int serve() {
   }
   do {
     look(daemon);
-    try_what_is_due(daemon);
+    Try next;
+    if (daemon.process < 0 && daemon.schedule.next_try(next, now())) try_again(daemon, next);
   } while (wait_for_look(daemon));
   return 0;
 }
 
 constexpr char kHelp[] =
     "usage: remvol-keeper\n"
-    "Starts the initiator's daemon again when it has died, has targets connected that\n"
-    "should be and are not, and volumes mounted that somebody else has unmounted.\n"
+    "Starts the initiator's daemon again when it has died, and has targets connected\n"
+    "that should be and are not.\n"
     "Stays in the foreground.\n"
     "  -h, --help     this text\n"
     "  -V, --version  the version\n";
@@ -275,7 +214,6 @@ int main(int argc, char** argv) {
   const std::string_view option = argv[1];
   if (option == "--try-first" && argc == 3) return keeper::try_target(argv[2], true);
   if (option == "--try" && argc == 3) return keeper::try_target(argv[2], false);
-  if (option == "--mount" && argc == 3) return keeper::mount_again(argv[2]);
   if (argc == 2 && (option == "-h" || option == "--help")) return platform::print_asked_for(keeper::kHelp);
   if (argc == 2 && (option == "-V" || option == "--version")) {
     return platform::print_asked_for("remvol-keeper " REMVOL_VERSION "\n");

@@ -1,7 +1,6 @@
 #include "keeper/schedule.h"
 
 #include <algorithm>
-#include <utility>
 
 namespace keeper {
 namespace {
@@ -17,7 +16,6 @@ Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
   }
   targets_.push_back({});
   targets_.back().name = name;
-  targets_.back().taken = terms_.once_there;
   return targets_.back();
 }
 
@@ -26,13 +24,12 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) c
   target.connected = wanted.connected;
   if (wanted.connected) {
     const time_t there = now - target.since;
-    if (there >= terms_.lasting) {
+    if (there >= lasting_) {
       target.pause = kFirstPause;
       target.due = now;
-      target.tries = 0;
     }
-    if (target.missing && there < std::min(terms_.lasting, target.pause)) return;
-    if (target.missing) target.tell = target.tell == Change::kMissing ? Change::kNone : Change::kBack;
+    if (target.missing && there < std::min(lasting_, target.pause)) return;
+    target.tell = target.missing && !target.tell;
     target.missing = target.taken = false;
     target.absent = 0;
     return;
@@ -40,9 +37,8 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) c
   // Only a target that loses its session while somebody is at it is meant.
   if (target.absent == 0 && wanted.is_taken) target.taken = true;
   if (target.taken || target.missing) return;
-  if (++target.absent < (wanted.at_work ? kLooksAtWork : terms_.looks)) return;
-  target.missing = true;
-  target.tell = Change::kMissing;
+  if (++target.absent < (wanted.at_work ? kLooksAtWork : looks_)) return;
+  target.missing = target.tell = true;
 }
 
 void Schedule::look(const std::vector<Wanted>& wanted, time_t now) {
@@ -57,9 +53,10 @@ void Schedule::look(const std::vector<Wanted>& wanted, time_t now) {
 
 Change Schedule::next_change(std::string& name) {
   for (AwaitedTarget& target : targets_) {
-    if (target.tell == Change::kNone) continue;
+    if (!target.tell) continue;
+    target.tell = false;
     name = target.name;
-    return std::exchange(target.tell, Change::kNone);
+    return target.missing ? Change::kMissing : Change::kBack;
   }
   return Change::kNone;
 }
@@ -67,12 +64,6 @@ Change Schedule::next_change(std::string& name) {
 bool Schedule::next_try(Try& next, time_t now) {
   for (AwaitedTarget& target : targets_) {
     if (!target.missing || target.connected || now < target.due) continue;
-    if (terms_.tries != 0 && target.tries++ == terms_.tries) {
-      target.tell = Change::kGivenUp;
-      target.missing = false;
-      target.taken = true;
-      continue;
-    }
     next = {target.name, target.pause == kFirstPause};
     target.due = now + target.pause;
     target.pause = std::min(2 * target.pause, kLongestPause);

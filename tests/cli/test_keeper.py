@@ -1,4 +1,4 @@
-"""remvol-keeper: what should be connected or mounted and is not is tried again; the initiator's daemon is there."""
+"""remvol-keeper: what should be connected and is not is tried again; the initiator's daemon is there."""
 
 import signal
 
@@ -107,95 +107,6 @@ def test_volumes_of_a_lost_session_are_recovered(keeper):
     listen(box)
     keeper.start()
     keeper.wait_runs(("--oiscsi_evt_reopen", "-n", "iqn.t1"), ("--status",), ("--oiscsi_evt_recover", "-n", "iqn.t1"))
-
-
-VOLUME = "/iscsi/initiator/id:1/lun/id:1"
-
-
-def photos(keeper, **values):
-    """A connected target with a volume that is mounted, and that the keeper has seen."""
-    box = keeper.box
-    keeper.target(1, state=1)
-    keeper.session(1)
-    box.tree.set({f"{VOLUME}/{key}": value for key, value in {"lun": 0, "share": "Photos", "enable": 1, **values}.items()})
-    box.run(["/bin/mkdir", "-p", "/mnt/VV/Photos"])
-    mount(box)
-    keeper.start()
-    box.run(["/bin/sleep", "3"], env={"LD_PRELOAD": None})
-    return box
-
-
-def mount(box):
-    done = box.run(["/bin/mount", "-t", "tmpfs", "vol", "/mnt/VV/Photos"], env={"LD_PRELOAD": None})
-    assert done.status == 0, done.stderr
-
-
-def unmount(box):
-    done = box.run(["/bin/umount", "/mnt/VV/Photos"], env={"LD_PRELOAD": None})
-    assert done.status == 0, done.stderr
-
-
-CONNECT = ("--connect", "-n", "iqn.t1")
-
-
-def test_a_volume_that_somebody_else_unmounts_is_mounted_again(keeper):
-    box = photos(keeper)
-    assert keeper.runs == []
-    unmount(box)
-    keeper.wait_runs(CONNECT)
-    mount(box)
-    box.wait_until(lambda: "Photos is mounted again" in keeper.daemon.stderr, what="its being told")
-    assert [line for line in keeper.daemon.stderr.splitlines() if "Photos" in line] == [
-        "remvol-keeper: Photos was unmounted by somebody else, it is going to be mounted", "remvol-keeper: Photos is mounted again"]
-
-
-def test_a_volume_that_cannot_be_mounted_is_left_to_a_person(keeper):
-    box = photos(keeper)
-    unmount(box)
-    keeper.wait_runs(*[CONNECT] * 4)
-    box.wait_until(lambda: "cannot be mounted again" in keeper.daemon.stderr, what="its being given up")
-    assert keeper.runs == [CONNECT] * 4
-    mount(box)
-    box.run(["/bin/sleep", "3"], env={"LD_PRELOAD": None})
-    unmount(box)
-    keeper.wait_runs(*[CONNECT] * 5)
-
-
-@pytest.mark.parametrize("values", [{"enable": 0}, {"volume_state": 3}, {"format_state": 1}], ids=["off", "failed", "formatted"])
-def test_a_volume_that_is_not_to_be_mounted_stays_so(keeper, values):
-    box = photos(keeper, **values)
-    unmount(box)
-    box.run(["/bin/sleep", "6"], env={"LD_PRELOAD": None})
-    assert keeper.runs == []
-
-
-def test_a_volume_that_was_not_mounted_yet_is_left_alone(keeper):
-    box = keeper.box
-    keeper.target(1, state=1)
-    keeper.session(1)
-    box.tree.set({f"{VOLUME}/lun": 0, f"{VOLUME}/share": "Photos", f"{VOLUME}/enable": 1})
-    keeper.start()
-    box.run(["/bin/sleep", "6"], env={"LD_PRELOAD": None})
-    assert keeper.runs == []
-
-
-@pytest.mark.parametrize("state", ["FAILED", "FREE"])
-def test_a_volume_of_a_lost_session_is_not_the_keepers(keeper, state):
-    box = photos(keeper)
-    box.write(f"{SESSIONS}/session1/state", f"{state}\n")
-    unmount(box)
-    box.run(["/bin/sleep", "6"], env={"LD_PRELOAD": None})
-    assert keeper.runs == []
-
-
-@pytest.mark.parametrize("command", ["--disconnect", "--format", "--del_lun"])
-def test_a_volume_that_the_tool_takes_away_stays_away(keeper, command):
-    box = photos(keeper)
-    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
-    box.start(["/tmp/bin/remvol", command, "-n", "iqn.t1"], env={"LD_PRELOAD": None})
-    unmount(box)
-    box.run(["/bin/sleep", "8"], env={"LD_PRELOAD": None})
-    assert keeper.runs == []
 
 
 def test_the_initiator_is_started_when_it_is_gone(keeper):

@@ -84,7 +84,7 @@ done || exit 1
 run_dialogue docs/tree-layout.md "# ktreec -S /var/run/ktree_sock_vv -g"
 tree_set /iscsi/initiator/dbg 0
 run_block docs/man/flashrun.8 "flashrun"
-run_block docs/operators-guide.md "systemctl stop remvol-keeper" "/^systemctl/d; s/fsck -f/& -p/; s/TARGET/$IQN:t1/"
+run_block docs/operators-guide.md "partition=" "s/fsck -f/& -p/; s/TARGET/$IQN:t1/"
 expect "the volume is back" mounted Photos
 
 say "the file servers' part"

@@ -100,7 +100,7 @@ $(block 10)
 END
 expect "smb.conf is good" testparm -s
 
-text 11 "systemctl stop remvol-keeper"
+text 11 "partition="
 # A check of a file system wants a person.
 block 11 | as_operator >/tmp/commands
 converse "sh -e /tmp/commands"

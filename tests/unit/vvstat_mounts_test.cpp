@@ -1,5 +1,5 @@
 // The table of mounts.
-#include "common/mounts.h"
+#include "vvstat/mounts.h"
 
 #include <gtest/gtest.h>
 #include <sys/sysmacros.h>
@@ -12,7 +12,7 @@
 #include <utility>
 #include <vector>
 
-namespace platform {
+namespace vvstat {
 namespace {
 
 constexpr char kTable[] =
@@ -70,4 +70,4 @@ TEST(Mounts, ALineThatIsNoneIsLeftOut) {
 }
 
 }  // namespace
-}  // namespace platform
+}  // namespace vvstat
