@@ -161,7 +161,9 @@ void unmount_if_deleted(const TargetEntry* entry) {
 void unmount_lost_volumes() {
   for (int i = 0; i < number_brought_up; i++) {
     const TargetHold hold(brought_up[i].target_name, brought_up[i].lun);
-    if (is_deleted(&brought_up[i])) (void)Target_LUN_umount(&brought_up[i]);
+    if (!is_deleted(&brought_up[i])) continue;
+    (void)Target_LUN_umount(&brought_up[i]);
+    reload_share_services();
   }
 }
 

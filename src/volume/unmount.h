@@ -17,7 +17,7 @@ void unmount_if_deleted(const TargetEntry* entry);
 
 // Does that again for every volume of which it was asked and that stayed: the tree's daemon may have died
 // since, and what was added last is not in the settings that a new one has loaded. The volume would be
-// nobody's, and its share name given again.
+// nobody's, and its share name given again. The share services reload then.
 void unmount_lost_volumes();
 
 // Unmounts every LUN of the target up to the first empty slot. Returns 0, or -1 when the slot is empty.
