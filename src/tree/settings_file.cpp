@@ -117,7 +117,7 @@ bool settings_file_is_torn(const char* path) {
   if (file == nullptr) return false;
   if (fseek(file.get(), -static_cast<long>(sizeof end), SEEK_END) != 0) rewind(file.get());
   size_t length = fread(end, 1, sizeof end, file.get());
-  while (length > 0 && strchr(" \t\r\n", end[length - 1]) != nullptr) length--;
+  while (length > 0 && memchr(" \t\r\n", end[length - 1], 4) != nullptr) length--;
   constexpr size_t kEndLength = sizeof kFileEnd - 1;
   return length < kEndLength || memcmp(end + length - kEndLength, kFileEnd, kEndLength) != 0;
 }

@@ -174,7 +174,8 @@ def test_settings_that_nobody_made_a_place_for_are_told_beside_the_log(box):
     assert done.stderr == "remvol: the settings are not saved, there is no /etc/NAS_CFG\n"
 
 
-@pytest.mark.parametrize("text, copied", [(settings("whole"), True), ("<config><iscsi>", False), ("", False)])
+@pytest.mark.parametrize("text, copied", [(settings("whole"), True), (settings("whole") + " \r\n\t", True), ("<config><iscsi>", False),
+                                          (settings("whole") + "\0\0", False), ("", False)])
 def test_after_a_failed_dump_only_a_whole_file_goes_to_flash(box, text, copied):
     box.tree.set("/iscsi/initiator/ver", "1")
     box.write(SAVED, text)
