@@ -74,7 +74,7 @@ AFTER = (
     (r"^del", r"(folder|mount|target) ",
      "a slot is deleted although its volume could not be unmounted or its session closed, and the deletion that is "
      "asked for again finds no slot"),
-    (r"^search_lun-.*( is killed| for ever|: memory|: system call|--logout\)|iscsiadm -m session\b|_session\.tmp\)|fgets |str_insert_back_slash |/mountinfo\))",
+    (r"^search_lun-.*( is killed| for ever|: memory|: system call|--logout\)|iscsiadm -m session\b|_session\.tmp\)|fgets |str_insert_back_slash |/(mountinfo|targetname)\))",
      r"(target \d|tree /iscsi/initiator/id:\d+/(lun/id:\d+/)?(conn_state|status|dev):)",
      "a search that does not come to its logout or whose logout fails, that does not see the session which it has opened, or "
      "cannot see that nothing is mounted from it leaves the target logged in, and the status says so; nobody can tell any "
