@@ -8,6 +8,9 @@ from harness.initiator import SHARES
 
 LOGOUT = 'iscsiadm -m node -T "iqn.t1" --logout'
 DELETED = "ktreec -S /var/run/ktree_sock_vv -d /iscsi/initiator/id:1"
+# Shell text: the tree's daemon is gone behind it.
+TREE_ENDS = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); "
+             "until ktreec -S /var/run/ktree_sock_vv -t >/dev/null 2>&1; [ $? -eq 3 ]; do sleep 0.01; done")
 RECORD_DELETE = "iscsiadm -m node -I default -T iqn.t1 -p 10.9.0.2:3260 -o delete"
 
 
@@ -109,7 +112,7 @@ class TestTarget:
         site.store("iqn.t1")
         site.store("iqn.t2", slot=2)
         box.hook("ktreec_del", "/iscsi/initiator/id:1", ret=-1, times=1,
-                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+                 effect=TREE_ENDS)
         assert box.remvol("--del", "-n", "iqn.t1").status == 255
         assert site.trace().count("del id:1") == 1
 
@@ -190,7 +193,7 @@ class TestLun:
     def test_a_tree_that_tells_nothing_any_more_is_not_asked_again(self, site, box):
         site.store("iqn.t1", luns=[("a", 0), ("b", 1)])
         box.hook("ktreec_del", "/iscsi/initiator/id:1/lun/id:1", ret=-1, times=1,
-                 effect="kill -KILL $(cat /var/run/ktree_sock_vv_config.pid)")
+                 effect=TREE_ENDS)
         assert box.remvol("--del_lun", "-n", "iqn.t1", "-l", "0").status == 255
         assert site.trace().count("del id:1/lun/id:1") == 1
 
