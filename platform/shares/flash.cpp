@@ -40,8 +40,8 @@ bool is_read_only(const char* folder, unsigned long& flags) {
 }
 
 bool remount(const char* folder, unsigned long flags) {
-  return mount(nullptr, folder, "", MS_REMOUNT | flags, nullptr) ==
-         0;  // memcheck knows no call without a type
+  // The kernel takes no notice of the type; memcheck knows no call without one.
+  return mount(nullptr, folder, "", MS_REMOUNT | flags, nullptr) == 0;
 }
 
 void write_out(const char* folder) {

@@ -45,7 +45,7 @@ class HeldSlot {
   // False when what the slot stood for is stored no more. A number that this run has read nothing from, and
   // one in a tree that does not answer, is taken as it is.
   explicit operator bool() const { return found_; }
-  bool is_seen() const { return seen_; }  // the tree has just told that it holds that
+  bool is_seen() const { return seen_; }  // false when the tree was asked for it and told nothing
   int target() const { return target_; }  // where the target is now
   int lun() const { return lun_; }        // where the LUN is now
 

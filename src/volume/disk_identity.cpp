@@ -83,8 +83,8 @@ void log_foreign(const TargetEntry* entry, const char* node) {
   LOG(0, "%s is not the disk of LUN %d of %s, it is left alone", node, entry->lun, entry->target_name);
 }
 
-// Whose disk it is that could not be looked at. Only what is not there tells nothing; memory or descriptors
-// that have run out, and a disk that goes away just then, do not make a disk ours.
+// Whether a look has failed for what is not there. That alone tells nothing: memory or descriptors that have
+// run out, and a disk that goes away just then, make no disk ours, nor nobody's.
 bool is_absent() {
   return errno == ENOENT || errno == ENOTDIR || errno == ENAMETOOLONG;
 }

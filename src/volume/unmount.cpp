@@ -107,7 +107,8 @@ bool is_deleted(const TargetEntry* entry) {
          !HeldSlot(entry->db_idx, entry->lun_db_idx);
 }
 
-// The volumes that this run was asked of; those of one target, as a rule.
+// The volumes that unmount_if_deleted() has left where they are. A command that changes settings brings up
+// those of one target.
 TargetEntry brought_up[kMaxLunsPerTarget];
 int number_brought_up = 0;
 

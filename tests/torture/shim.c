@@ -318,8 +318,8 @@ PUBLIC unsigned sleep(unsigned seconds) {
 
 PUBLIC int usleep(useconds_t microseconds) {
   if (!in_tool) return REAL(usleep)(microseconds);
-  nap(10LL *
-      microseconds); /* whoever looks again and again waits for others, which are as slow as they are */
+  /* Whoever looks again and again waits for others, which are as slow as they are. */
+  nap(10LL * microseconds);
   return 0;
 }
 
