@@ -14,8 +14,8 @@
 #include <cstdlib>
 
 #include "common/fd.h"
+#include "common/mounts.h"
 #include "common/sessions.h"
-#include "vvstat/mounts.h"
 
 #include "run_files.h"
 
@@ -28,14 +28,14 @@ using platform::Session;
 // The table of mounts, read when it is first asked for: the kernel writes all of it anew for every reader.
 class MountTable {
  public:
-  const Mount* on(std::string_view point) {
-    if (!read_) mounts_ = read_mounts();
+  const platform::Mount* on(std::string_view point) {
+    if (!read_) mounts_ = platform::read_mounts();
     read_ = true;
-    return mount_on(mounts_, point);
+    return platform::mount_on(mounts_, point);
   }
 
  private:
-  std::vector<Mount> mounts_;
+  std::vector<platform::Mount> mounts_;
   bool read_ = false;
 };
 
@@ -87,7 +87,7 @@ bool find_mount(const std::string& path, Tables& tables, VolumeFacts& facts, dev
     return (info.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
   }
   if (errno != EIO) return false;
-  const Mount* mount = tables.mounts.on(path);
+  const platform::Mount* mount = tables.mounts.on(path);
   if (mount == nullptr) return false;
   facts.shut_down = true;
   device = mount->device;
@@ -132,7 +132,7 @@ bool refuses_writes(const std::string& mount_point, const std::string& disk) {
 }
 
 std::string options_of(const std::string& mount_point, MountTable& mounts) {
-  const Mount* mount = mounts.on(mount_point);
+  const platform::Mount* mount = mounts.on(mount_point);
   return mount != nullptr ? mount->options : std::string();
 }
 

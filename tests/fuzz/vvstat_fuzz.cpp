@@ -5,11 +5,11 @@
 #include <cstdint>
 #include <string>
 
+#include "common/mounts.h"
 #include "common/utf8.h"
 #include "require.h"
 #include "vvstat/columns.h"
 #include "vvstat/metrics.h"
-#include "vvstat/mounts.h"
 #include "vvstat/verdict.h"
 
 using namespace vvstat;
@@ -77,7 +77,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   layout.width = kLeast + data[0];
   layout.colour = false;
   const std::string_view listing(reinterpret_cast<const char*>(data + 2), size - 2);
-  for (const Mount& mount : mounts_of(listing)) {
+  for (const platform::Mount& mount : platform::mounts_of(listing)) {
     require(!mount.point.empty() && (mount.options.starts_with("rw") || mount.options.starts_with("ro")));
   }
   const Status status = read_status(platform::TreeListing(listing));

@@ -1,6 +1,6 @@
 // The table of mounts, as the kernel shows it.
-#ifndef PLATFORM_VVSTAT_MOUNTS_H
-#define PLATFORM_VVSTAT_MOUNTS_H
+#ifndef PLATFORM_COMMON_MOUNTS_H
+#define PLATFORM_COMMON_MOUNTS_H
 
 #include <sys/types.h>
 
@@ -8,7 +8,7 @@
 #include <string_view>
 #include <vector>
 
-namespace vvstat {
+namespace platform {
 
 struct Mount {
   std::string point;
@@ -25,6 +25,6 @@ std::vector<Mount> read_mounts();
 // What is mounted on `point`: the last one, which hides the others. Null when nothing is.
 const Mount* mount_on(const std::vector<Mount>& mounts, std::string_view point);
 
-}  // namespace vvstat
+}  // namespace platform
 
 #endif

@@ -1,5 +1,5 @@
 // The table of mounts.
-#include "vvstat/mounts.h"
+#include "common/mounts.h"
 
 #include <gtest/gtest.h>
 #include <sys/sysmacros.h>
@@ -12,7 +12,7 @@
 #include <utility>
 #include <vector>
 
-namespace vvstat {
+namespace platform {
 namespace {
 
 constexpr char kTable[] =
@@ -70,4 +70,4 @@ TEST(Mounts, ALineThatIsNoneIsLeftOut) {
 }
 
 }  // namespace
-}  // namespace vvstat
+}  // namespace platform

@@ -1,4 +1,4 @@
-#include "vvstat/mounts.h"
+#include "common/mounts.h"
 
 #include <fcntl.h>
 #include <sys/sysmacros.h>
@@ -9,7 +9,7 @@
 
 #include "common/file_text.h"
 
-namespace vvstat {
+namespace platform {
 namespace {
 
 // Takes what stands before the next separator, and the separator.
@@ -96,7 +96,7 @@ std::vector<Mount> mounts_of(std::string_view text) {
 std::vector<Mount> read_mounts() {
   const int file = open("/proc/self/mountinfo", O_RDONLY | O_CLOEXEC);
   if (file < 0) return {};
-  std::vector<Mount> mounts = mounts_of(platform::content_of(file));
+  std::vector<Mount> mounts = mounts_of(content_of(file));
   close(file);
   return mounts;
 }
@@ -107,4 +107,4 @@ const Mount* mount_on(const std::vector<Mount>& mounts, std::string_view point) 
   return found == mounts.rend() ? nullptr : &*found;
 }
 
-}  // namespace vvstat
+}  // namespace platform
