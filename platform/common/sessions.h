@@ -32,6 +32,10 @@ std::vector<Session> read_sessions();
 // none.
 std::string address_of(const Session& session);
 
+// The kernel's name of the disk that is a LUN of the session, such as "sdb"; empty when there is none, or
+// when it takes no commands just now.
+std::string running_disk(const Session& session, int lun);
+
 }  // namespace platform
 
 #endif

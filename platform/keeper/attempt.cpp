@@ -1,6 +1,5 @@
 #include "keeper/attempt.h"
 
-#include <mntent.h>
 #include <net/if.h>
 #include <netdb.h>
 #include <netinet/in.h>
@@ -8,10 +7,11 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
-#include <cstdio>
 #include <vector>
 
+#include "common/mounts.h"
 #include "common/program.h"
 #include "common/tree_reader.h"
 #include "tree_layout.h"
@@ -47,17 +47,6 @@ bool accepts_at_a_port(const addrinfo& address) {
   return false;
 }
 
-// Runs the tool silently: that a target is missing has been told, and whoever connects it by hand is told
-// why.
-int run_silently(std::vector<const char*> arguments) {
-  arguments.insert(arguments.begin(), platform::kTool);
-  arguments.push_back(nullptr);
-  const platform::Streams silent = {STDIN_FILENO, platform::kNowhere, platform::kNowhere};
-  const pid_t process = platform::start(platform::kTool, arguments.data(), silent);
-  const int status = process > 0 ? platform::exit_status(platform::end_of(process)) : -1;
-  return status >= 0 ? status : 1;
-}
-
 struct Stored {
   std::string address, port;
   std::vector<std::string> shares;
@@ -78,19 +67,22 @@ bool read_stored(const std::string& target, Stored& stored) {
 }
 
 bool has_mounted(const Stored& stored) {
-  FILE* table = setmntent("/proc/self/mounts", "re");
-  if (table == nullptr) return false;
-  bool found = false;
-  while (const mntent* entry = found ? nullptr : getmntent(table)) {
-    for (const std::string& share : stored.shares) {
-      found = found || (!share.empty() && remvol::kMountRoot + share == entry->mnt_dir);
-    }
-  }
-  endmntent(table);
-  return found;
+  const std::vector<platform::Mount> mounts = platform::read_mounts();
+  return std::any_of(stored.shares.begin(), stored.shares.end(), [&mounts](const std::string& share) {
+    return !share.empty() && platform::mount_on(mounts, remvol::kMountRoot + share) != nullptr;
+  });
 }
 
 }  // namespace
+
+int run_silently(std::vector<const char*> arguments) {
+  arguments.insert(arguments.begin(), platform::kTool);
+  arguments.push_back(nullptr);
+  const platform::Streams silent = {STDIN_FILENO, platform::kNowhere, platform::kNowhere};
+  const pid_t process = platform::start(platform::kTool, arguments.data(), silent);
+  const int status = process > 0 ? platform::exit_status(platform::end_of(process)) : -1;
+  return status >= 0 ? status : 1;
+}
 
 bool portal_answers(const std::string& address, const std::string& port) {
   std::string bare = address;

@@ -3,8 +3,13 @@
 #define PLATFORM_KEEPER_ATTEMPT_H
 
 #include <string>
+#include <vector>
 
 namespace keeper {
+
+// Runs the tool silently: that something is missing has been told, and whoever gives the command by hand is
+// told why it failed. Returns the exit status, 1 when there is none.
+int run_silently(std::vector<const char*> arguments);
 
 // Whether a portal accepts connections; waits some seconds for it. A link-local address is tried at every LAN
 // port.

@@ -1,5 +1,5 @@
-// remvol-keeper: sees to it that what should be there is there: the initiator's daemon, and a session of each
-// target that is to be connected.
+// remvol-keeper: sees to it that what should be there is there: the initiator's daemon, a session of each
+// target that is to be connected, and the mounts of its volumes.
 
 #include <poll.h>
 #include <sys/signalfd.h>
@@ -26,21 +26,27 @@
 #include "events/netlink.h"
 #include "keeper/attempt.h"
 #include "keeper/schedule.h"
+#include "keeper/volumes.h"
 #include "tree_layout.h"
 
 namespace keeper {
 namespace {
 
 constexpr char kInitiatorDaemon[] = "iscsid";
-constexpr int kLooksWithoutInitiator = 2;
+// How it calls itself, with a target or a share behind.
+constexpr char kTryFirst[] = "--try-first", kTry[] = "--try", kMount[] = "--mount";
 constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 
+constexpr Terms kInitiatorTerms = {.looks = 2, .lasting = Schedule::kLongestPause};
+// Whoever unmounts a volume to work on its disk has begun by then.
+constexpr Terms kVolumeTerms = {.looks = 10, .lasting = Schedule::kLongestPause, .once_there = true};
+
 struct Keeper {
-  Schedule schedule;
-  Schedule initiator{kLooksWithoutInitiator, Schedule::kLongestPause};  // its daemon in place of a target
+  Schedule targets, volumes{kVolumeTerms};
+  Schedule initiator{kInitiatorTerms};  // its daemon in place of a target
   int signals = -1, devices = -1;
-  pid_t process = -1;  // tries a target at this moment
-  bool first = true;   // no look yet: what is away now was taken down when the settings say so
+  pid_t target_try = -1, volume_try = -1;  // the processes of the tries under way
+  bool first = true;  // no look yet: what is away now was taken down when the settings say so
 };
 
 time_t now() {
@@ -68,14 +74,12 @@ pid_t start_program(std::initializer_list<const char*> words, const char* progra
   return process;
 }
 
-void tell_of_initiator(Keeper& daemon) {
+void tell(Schedule& schedule, const char* missing, const char* back) {
   std::string name;
-  for (Change change; (change = daemon.initiator.next_change(name)) != Change::kNone;) {
-    if (change == Change::kMissing) {
-      platform::report(LOG_WARNING, "remvol-keeper: %s is gone, starting another one", name.c_str());
-    } else {
-      platform::report(LOG_NOTICE, "remvol-keeper: %s is there again", name.c_str());
-    }
+  for (Change change; (change = schedule.next_change(name)) != Change::kNone;) {
+    const bool is_missing = change == Change::kMissing;
+    platform::report(is_missing ? LOG_WARNING : LOG_NOTICE, "remvol-keeper: %s %s", name.c_str(),
+                     is_missing ? missing : back);
   }
 }
 
@@ -88,15 +92,14 @@ void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
     wanted.push_back({kInitiatorDaemon, platform::runs(kInitiatorDaemon), false, false});
   }
   daemon.initiator.look(wanted, now());
-  tell_of_initiator(daemon);
+  tell(daemon.initiator, "is gone, starting another one", "is there again");
   Try next;
   if (daemon.initiator.next_try(next, now())) start_program({kInitiatorDaemon, "-f"}, kInitiatorDaemon);
 }
 
-std::vector<Wanted> read_wanted(bool first, bool& answered) {
-  const std::vector<platform::Session> sessions = platform::read_sessions();
+std::vector<Wanted> wanted_targets(const platform::TreeReader& tree,
+                                   const std::vector<platform::Session>& sessions, bool first) {
   const bool at_work = is_brought_up();
-  platform::TreeReader tree;
   std::vector<Wanted> wanted;
   for (int n = 1; n <= remvol::kMaxTargets; n++) {
     const std::string name = tree.value(remvol::key::kTargetName, n);
@@ -110,36 +113,31 @@ std::vector<Wanted> read_wanted(bool first, bool& answered) {
     const bool is_taken = !connected && (was_taken || is_taken_down(name));
     wanted.push_back({name, connected, is_taken, at_work});
   }
-  answered = tree.answered();
   return wanted;
 }
 
-void try_again(Keeper& daemon, const Try& next) {
-  daemon.process = start_program({"remvol-keeper", next.first ? "--try-first" : "--try", next.target.c_str()},
-                                 "/proc/self/exe");
-}
-
-void tell(Keeper& daemon) {
-  std::string target;
-  for (Change change; (change = daemon.schedule.next_change(target)) != Change::kNone;) {
-    if (change == Change::kMissing) {
-      platform::report(LOG_WARNING,
-                       "remvol-keeper: %s should be connected and is not, it is tried until it is",
-                       target.c_str());
-    } else {
-      platform::report(LOG_NOTICE, "remvol-keeper: %s is connected again", target.c_str());
-    }
-  }
+// Starts the next try of a schedule, `option` and what is to be tried being its arguments, unless one is
+// under way.
+void try_next(Schedule& schedule, const char* first_option, const char* option, pid_t& process) {
+  Try next;
+  if (process >= 0 || !schedule.next_try(next, now())) return;
+  process = start_program({"remvol-keeper", next.first ? first_option : option, next.name.c_str()},
+                          "/proc/self/exe");
 }
 
 void look(Keeper& daemon) {
-  bool answered = false;
-  const std::vector<Wanted> wanted = read_wanted(daemon.first, answered);
-  keep_initiator(daemon, answered, is_taken_down());
-  if (!answered) return;
+  const std::vector<platform::Session> sessions = platform::read_sessions();
+  const platform::TreeReader tree;
+  keep_initiator(daemon, tree.answered(), is_taken_down());
+  if (!tree.answered()) return;
+  daemon.targets.look(wanted_targets(tree, sessions, daemon.first), now());
   daemon.first = false;
-  daemon.schedule.look(wanted, now());
-  tell(daemon);
+  tell(daemon.targets, "should be connected and is not, it is tried until it is", "is connected again");
+  // The states that a try stores for a moment are no news.
+  if (daemon.volume_try >= 0) return;
+  daemon.volumes.look(wanted_volumes(tree, sessions), now());
+  tell(daemon.volumes, "was unmounted by somebody else, it is mounted as soon as it can be",
+       "is mounted again");
 }
 
 // Returns false when the daemon is to end.
@@ -148,7 +146,9 @@ bool take_signals(Keeper& daemon) {
   signalfd_siginfo info;
   while (read(daemon.signals, &info, sizeof info) == sizeof info) ended = ended || info.ssi_signo != SIGCHLD;
   for (pid_t child; (child = waitpid(-1, nullptr, WNOHANG)) > 0;) {
-    if (child == daemon.process) daemon.process = -1;
+    for (pid_t* attempt : {&daemon.target_try, &daemon.volume_try}) {
+      if (child == *attempt) *attempt = -1;
+    }
   }
   return !ended;
 }
@@ -157,7 +157,8 @@ bool take_signals(Keeper& daemon) {
 // still there.
 bool wait_for_look(Keeper& daemon) {
   static unsigned char buffer[1 << 14];
-  const bool hurry = daemon.schedule.anything_missing() || daemon.initiator.anything_missing();
+  const bool hurry = daemon.targets.anything_missing() || daemon.volumes.anything_missing() ||
+                     daemon.initiator.anything_missing();
   const time_t due = now() + (hurry ? kHurry : kRest);
   for (bool session = false; !session && now() < due;) {
     pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}};
@@ -191,16 +192,16 @@ int serve() {
   }
   do {
     look(daemon);
-    Try next;
-    if (daemon.process < 0 && daemon.schedule.next_try(next, now())) try_again(daemon, next);
+    try_next(daemon.targets, kTryFirst, kTry, daemon.target_try);
+    try_next(daemon.volumes, kMount, kMount, daemon.volume_try);
   } while (wait_for_look(daemon));
   return 0;
 }
 
 constexpr char kHelp[] =
     "usage: remvol-keeper\n"
-    "Starts the initiator's daemon again when it has died, and has targets connected\n"
-    "that should be and are not.\n"
+    "Starts the initiator's daemon again when it has died, has targets connected that\n"
+    "should be and are not, and volumes mounted that somebody else has unmounted.\n"
     "Stays in the foreground.\n"
     "  -h, --help     this text\n"
     "  -V, --version  the version\n";
@@ -212,8 +213,9 @@ int main(int argc, char** argv) {
   platform::begin();
   if (argc == 1) return keeper::serve();
   const std::string_view option = argv[1];
-  if (option == "--try-first" && argc == 3) return keeper::try_target(argv[2], true);
-  if (option == "--try" && argc == 3) return keeper::try_target(argv[2], false);
+  if (option == keeper::kTryFirst && argc == 3) return keeper::try_target(argv[2], true);
+  if (option == keeper::kTry && argc == 3) return keeper::try_target(argv[2], false);
+  if (option == keeper::kMount && argc == 3) return keeper::mount_again(argv[2]);
   if (argc == 2 && (option == "-h" || option == "--help")) return platform::print_asked_for(keeper::kHelp);
   if (argc == 2 && (option == "-V" || option == "--version")) {
     return platform::print_asked_for("remvol-keeper " REMVOL_VERSION "\n");

@@ -16,6 +16,7 @@ Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
   }
   targets_.push_back({});
   targets_.back().name = name;
+  targets_.back().taken = terms_.once_there;
   return targets_.back();
 }
 
@@ -24,11 +25,11 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) c
   target.connected = wanted.connected;
   if (wanted.connected) {
     const time_t there = now - target.since;
-    if (there >= lasting_) {
+    if (there >= terms_.lasting) {
       target.pause = kFirstPause;
       target.due = now;
     }
-    if (target.missing && there < std::min(lasting_, target.pause)) return;
+    if (target.missing && there < std::min(terms_.lasting, target.pause)) return;
     target.tell = target.missing && !target.tell;
     target.missing = target.taken = false;
     target.absent = 0;
@@ -37,7 +38,7 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) c
   // Only a target that loses its session while somebody is at it is meant.
   if (target.absent == 0 && wanted.is_taken) target.taken = true;
   if (target.taken || target.missing) return;
-  if (++target.absent < (wanted.at_work ? kLooksAtWork : looks_)) return;
+  if (++target.absent < (wanted.at_work ? kLooksAtWork : terms_.looks)) return;
   target.missing = target.tell = true;
 }
 

@@ -1,4 +1,5 @@
-// When targets that should be connected and are not are tried again: decides, without trying.
+// When what should be there and is not is tried again, such as the session of a target: decides, without
+// trying.
 #ifndef PLATFORM_KEEPER_SCHEDULE_H
 #define PLATFORM_KEEPER_SCHEDULE_H
 
@@ -8,28 +9,35 @@
 
 namespace keeper {
 
-// A target of the settings that is to be connected, as the machine has it now.
+// What is to be there, as the machine has it now: a target that is to be connected, or a volume that is to be
+// mounted.
 struct Wanted {
   std::string name;
-  bool connected;  // it has a session, working or not
-  bool is_taken;   // when it has none: somebody takes sessions away on purpose
-  bool at_work;    // when it has none: a recovery or a connection is under way, perhaps this target's
+  bool connected;  // it has a session, working or not; or it is mounted
+  bool is_taken;   // when it is not there: somebody takes it away on purpose
+  bool at_work;    // when it is not there: a recovery or a connection is under way, perhaps this target's
 };
 
 struct Try {
-  std::string target;
+  std::string name;
   bool first;  // since it went missing
 };
 
 enum class Change { kNone, kMissing, kBack };
 
+struct Terms {
+  // It is missing when it stays away for that many looks: a recovery logs out and in again.
+  int looks = 3;
+  // What is back begins anew when it has been there for so many seconds: until then its pauses go on, and it
+  // is told as back only when it has been there for as long as the next of them.
+  time_t lasting = 0;
+  // What has not been there since it was first looked for is not missing.
+  bool once_there = false;
+};
+
 class Schedule {
  public:
-  // A target is missing when it stays away for that many looks: a recovery logs out and in again.
-  static constexpr int kLooks = 3;
-  // What is back begins anew when it has been there for `lasting` seconds: until then its pauses go on, and
-  // it is told as back only when it has been there for as long as the next of them.
-  explicit Schedule(int looks = kLooks, time_t lasting = 0) : looks_(looks), lasting_(lasting) {}
+  explicit Schedule(const Terms& terms = {}) : terms_(terms) {}
 
   // Compares with what the machine has; to be called about once a second, `now` in seconds. A target that is
   // no longer wanted is forgotten.
@@ -51,7 +59,7 @@ class Schedule {
     std::string name;
     bool seen = false;       // it is among those that are wanted
     bool connected = false;  // at the last look
-    bool taken = false;      // it was taken away on purpose, and stays away until it has been connected again
+    bool taken = false;      // it is not missed until it has been connected again
     bool missing = false;    // told, and not yet told as back
     bool tell = false;
     int absent = 0;  // looks in a row without a session
@@ -61,8 +69,7 @@ class Schedule {
   AwaitedTarget& find(const std::string& name);
   void settle(AwaitedTarget& target, const Wanted& wanted, time_t now) const;
 
-  int looks_;
-  time_t lasting_;
+  Terms terms_;
   std::vector<AwaitedTarget> targets_;
 };
 

@@ -1,4 +1,4 @@
-"""remvol-keeper: what should be connected and is not is tried again; the initiator's daemon is there."""
+"""remvol-keeper: what should be connected or mounted and is not is tried again; the initiator's daemon is there."""
 
 import signal
 
@@ -28,7 +28,7 @@ class Keeper:
         self.box.write(f"{SESSIONS}/session{number}/state", "LOGGED_IN\n")
 
     def start(self, *under):
-        env = {"LD_PRELOAD": str(self.box.tools / "libnetlink.so")}
+        env = {"LD_PRELOAD": f"{self.box.tools}/libnetlink.so:{self.box.tools}/libpreload.so"}
         self.daemon = self.box.start([*under, self.box.build / "bin/remvol-keeper"], env=env)
 
     def wait_runs(self, *expected):
@@ -107,6 +107,182 @@ def test_volumes_of_a_lost_session_are_recovered(keeper):
     listen(box)
     keeper.start()
     keeper.wait_runs(("--oiscsi_evt_reopen", "-n", "iqn.t1"), ("--status",), ("--oiscsi_evt_recover", "-n", "iqn.t1"))
+
+
+VOLUME = "/iscsi/initiator/id:1/lun/id:{}"
+CONNECT = ("--connect", "-n", "iqn.t1")
+
+
+def volume(keeper, slot, disk, share, **values):
+    """A volume of the connected target t1, whose disk runs and shows a file system."""
+    box = keeper.box
+    good = {"lun": slot - 1, "share": share, "enable": 1, "volume_state": 0, "format_state": 0}
+    box.tree.set({f"{VOLUME.format(slot)}/{key}": value for key, value in {**good, **values}.items()})
+    device = f"{SESSIONS}/session1/device/target1:0:0/1:0:0:{slot - 1}"
+    box.write(f"{device}/state", "running\n")
+    box.path(f"{device}/block/{disk}").mkdir(parents=True)
+    box.disk(disk, 1 << 20)
+    box.hook("sys_get_partition_list", f"/dev/{disk}", ret=1, out=f"{disk}1")
+    box.hook("sys_get_fs_type", f"/dev/{disk}1", out="ext4")
+
+
+def photos(keeper, **values):
+    """Two volumes that are mounted, and that the keeper has seen."""
+    box = keeper.box
+    keeper.target(1, state=1)
+    keeper.session(1)
+    volume(keeper, 1, "sdb", "Photos", **values)
+    volume(keeper, 2, "sdc", "Music")
+    mount(box, "Photos")
+    mount(box, "Music")
+    keeper.start()
+    wait(box, 3)
+    return box
+
+
+def wait(box, seconds):
+    box.run(["/bin/sleep", str(seconds)], env={"LD_PRELOAD": None})
+
+
+def mount(box, share):
+    box.run(["/bin/mkdir", "-p", f"/mnt/VV/{share}"])
+    done = box.run(["/bin/mount", "-t", "tmpfs", "vol", f"/mnt/VV/{share}"], env={"LD_PRELOAD": None})
+    assert done.status == 0, done.stderr
+
+
+def unmount(box, share="Photos"):
+    done = box.run(["/bin/umount", f"/mnt/VV/{share}"], env={"LD_PRELOAD": None})
+    assert done.status == 0, done.stderr
+
+
+# A volume is missed after ten looks.
+MISSED = "Photos was unmounted by somebody else, it is mounted as soon as it can be"
+MISSED_SOON, LONG_ENOUGH = 30, 13
+
+
+def wait_missed(keeper):
+    keeper.box.wait_until(lambda: MISSED in keeper.daemon.stderr, timeout=MISSED_SOON, what="its being missed")
+
+
+def test_a_volume_that_somebody_else_unmounts_is_mounted_again(keeper):
+    box = photos(keeper)
+    assert keeper.runs == []
+    unmount(box)
+    wait_missed(keeper)
+    keeper.wait_runs(CONNECT)
+    mount(box, "Photos")
+    box.wait_until(lambda: "Photos is mounted again" in keeper.daemon.stderr, what="its being told")
+    told = [line for line in keeper.daemon.stderr.splitlines() if "Photos" in line]
+    assert told == [f"remvol-keeper: {MISSED}", "remvol-keeper: Photos is mounted again"]
+
+
+def run_down(box):
+    box.write(f"{SESSIONS}/session1/device/target1:0:0/1:0:0:1/state", "offline\n")
+
+
+def nothing_recognised(box):
+    box.hook("sys_get_fs_type", "/dev/sdc1", ret=1, first=True)
+    unmount(box, "Music")
+
+
+def not_partitioned(box):
+    box.hook("sys_get_partition_list", "/dev/sdc", ret=0, first=True)
+    unmount(box, "Music")
+
+
+def failed(box):
+    unmount(box, "Music")
+    box.tree.set({f"{VOLUME.format(2)}/volume_state": 3})
+
+
+def being_formatted(box):
+    unmount(box, "Music")
+    box.tree.set({f"{VOLUME.format(2)}/format_state": 4})
+
+
+@pytest.mark.parametrize("sibling", [run_down, nothing_recognised, not_partitioned, failed, being_formatted])
+def test_a_volume_waits_while_a_connection_could_harm_another_one_of_its_target(keeper, sibling):
+    box = photos(keeper)
+    sibling(box)
+    unmount(box)
+    wait_missed(keeper)
+    wait(box, 5)
+    assert keeper.runs == []
+
+
+def test_a_volume_whose_disk_somebody_has_for_himself_waits(keeper):
+    box = photos(keeper)
+    unmount(box)
+    worker = box.start(["/usr/bin/python3", "-c", "import os,time\nos.open('/dev/sdb', os.O_RDONLY | os.O_EXCL)\ntime.sleep(1000)"],
+                       env={"LD_PRELOAD": None})
+    wait_missed(keeper)
+    wait(box, 4)
+    assert keeper.runs == []
+    worker.kill(signal.SIGKILL)
+    keeper.wait_runs(CONNECT)
+
+
+@pytest.mark.parametrize("values", [{"enable": 0}, {"volume_state": 3}, {"format_state": 1}], ids=["off", "failed", "formatted"])
+def test_a_volume_that_is_not_to_be_mounted_stays_so(keeper, values):
+    box = photos(keeper, **values)
+    unmount(box)
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == [] and "Photos" not in keeper.daemon.stderr
+
+
+def test_a_volume_that_was_not_mounted_yet_is_left_alone(keeper):
+    box = keeper.box
+    keeper.target(1, state=1)
+    keeper.session(1)
+    volume(keeper, 1, "sdb", "Photos")
+    keeper.start()
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == [] and "Photos" not in keeper.daemon.stderr
+
+
+@pytest.mark.parametrize("state", ["FAILED", "FREE"])
+def test_a_volume_of_a_lost_session_is_not_the_keepers(keeper, state):
+    box = photos(keeper)
+    box.write(f"{SESSIONS}/session1/state", f"{state}\n")
+    unmount(box)
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == [] and "Photos" not in keeper.daemon.stderr
+
+
+@pytest.mark.parametrize("command, late", [("--disconnect", False), ("--disconnect", True), ("--format", False), ("--del_lun", True)])
+def test_a_volume_that_the_tool_takes_away_stays_away(keeper, command, late):
+    box = photos(keeper)
+    if late:
+        unmount(box)
+        wait(box, 3)
+    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 3\n").chmod(0o755)
+    run = box.start(["/tmp/bin/remvol", command, "-n", "iqn.t1"], env={"LD_PRELOAD": None})
+    if not late:
+        unmount(box)
+    run.wait()
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == [] and "Photos" not in keeper.daemon.stderr
+
+
+def test_a_volume_that_a_command_for_another_target_leaves_alone_is_mounted_again(keeper):
+    box = photos(keeper)
+    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
+    box.start(["/tmp/bin/remvol", "--disconnect", "-n", "iqn.t2"], env={"LD_PRELOAD": None})
+    unmount(box)
+    wait_missed(keeper)
+    keeper.wait_runs(CONNECT)
+
+
+def test_a_volume_is_not_mounted_beside_another_run_that_mounts(keeper):
+    box = photos(keeper)
+    unmount(box)
+    wait_missed(keeper)
+    keeper.wait_runs(CONNECT)
+    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
+    before = len(keeper.runs)
+    box.start(["/tmp/bin/remvol", "--add", "-n", "iqn.t1"], env={"LD_PRELOAD": None})
+    wait(box, 8)
+    assert len(keeper.runs) <= before + 1  # one may have been under way
 
 
 def test_the_initiator_is_started_when_it_is_gone(keeper):

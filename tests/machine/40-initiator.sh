@@ -1,7 +1,7 @@
 # timeout: 900
 # after: installed
-# The initiator's daemon dies, the volumes are started anew, open-iscsi is installed again, a stranger logs out: the
-# volumes are always there again, without hands.
+# The initiator's daemon dies, the volumes are started anew, open-iscsi is installed again, a stranger logs out and
+# another one unmounts: the volumes are always there again, without hands.
 # As in lab/lib.sh, but whoever started them.
 initiators() {
     for process in $(pgrep -x iscsid); do
@@ -63,3 +63,14 @@ says_so() { ! vvstat >/tmp/vvstat.out; }
 wait_for 30 says_so
 wait_for 120 vvstat
 expect_well "after a stranger logged out"
+
+other=$(stat -c %d:%i /mnt/VV/Music/now)
+sessions=$(ls /sys/class/iscsi_session)
+expect "a stranger unmounts" umount /mnt/VV/Photos
+wait_for 30 says_so
+wait_for 120 vvstat
+expect_well "after a stranger unmounted"
+expect_equal "the other volume stayed" "$other" "$(stat -c %d:%i /mnt/VV/Music/now)"
+expect_equal "the sessions stayed" "$sessions" "$(ls /sys/class/iscsi_session)"
+keeper_says_so() { messages remvol-keeper | grep -qx 'remvol-keeper: Photos is mounted again'; }
+wait_for 30 keeper_says_so

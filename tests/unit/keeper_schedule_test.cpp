@@ -65,7 +65,7 @@ TEST_F(KeeperSchedule, StepsGrowToAMinute) {
 }
 
 TEST_F(KeeperSchedule, TwoLooksAreEnoughForWhoSaysSo) {
-  schedule_ = Schedule(2);
+  schedule_ = Schedule({.looks = 2});
   look(kConnected);
   look(kAbsent);
   EXPECT_EQ(change(), Change::kNone);
@@ -95,7 +95,7 @@ TEST_F(KeeperSchedule, OnlyTheFirstTryIsTheFirst) {
   Try next;
   ASSERT_TRUE(schedule_.next_try(next, now_));
   EXPECT_TRUE(next.first);
-  EXPECT_EQ(next.target, "a");
+  EXPECT_EQ(next.name, "a");
   look(kAbsent);
   ASSERT_TRUE(schedule_.next_try(next, now_));
   EXPECT_FALSE(next.first);
@@ -114,7 +114,7 @@ TEST_F(KeeperSchedule, WhatIsBackIsToldAndBeginsAnew) {
 }
 
 TEST_F(KeeperSchedule, WhatIsToLastIsTriedWithGrowingPausesAndToldOfOnceWhileItDoesNot) {
-  schedule_ = Schedule(2, Schedule::kLongestPause);
+  schedule_ = Schedule({.looks = 2, .lasting = Schedule::kLongestPause});
   lose();
   std::vector<Change> changes;
   EXPECT_EQ(tries_with_life(2, 250, changes), (std::vector<long>{0, 2, 4, 8, 16, 32, 64, 124, 184, 244}));
@@ -122,7 +122,7 @@ TEST_F(KeeperSchedule, WhatIsToLastIsTriedWithGrowingPausesAndToldOfOnceWhileItD
 }
 
 TEST_F(KeeperSchedule, WhatIsToLastAndIsLostOnceIsSoonToldAsBack) {
-  schedule_ = Schedule(2, Schedule::kLongestPause);
+  schedule_ = Schedule({.looks = 2, .lasting = Schedule::kLongestPause});
   lose();
   std::vector<Change> changes;
   EXPECT_EQ(tries_with_life(1000, 5, changes), std::vector<long>{0});
@@ -130,7 +130,7 @@ TEST_F(KeeperSchedule, WhatIsToLastAndIsLostOnceIsSoonToldAsBack) {
 }
 
 TEST_F(KeeperSchedule, WhatIsToLastBeginsAnewWhenItHasLasted) {
-  schedule_ = Schedule(2, Schedule::kLongestPause);
+  schedule_ = Schedule({.looks = 2, .lasting = Schedule::kLongestPause});
   lose();
   std::vector<Change> changes;
   tries_with_life(2, 100, changes);
@@ -171,6 +171,25 @@ TEST_F(KeeperSchedule, WhatIsNotWantedAnyMoreIsForgotten) {
   EXPECT_EQ(change(), Change::kNone);
   Try next;
   EXPECT_FALSE(schedule_.next_try(next, now_));
+}
+
+TEST_F(KeeperSchedule, WhatWasNotThereYetIsNotMissing) {
+  schedule_ = Schedule({.once_there = true});
+  for (int i = 0; i < 10; i++) look(kAbsent);
+  EXPECT_EQ(change(), Change::kNone);
+  EXPECT_FALSE(schedule_.anything_missing());
+  lose();
+  EXPECT_EQ(change(), Change::kMissing);
+}
+
+TEST_F(KeeperSchedule, WhatWasForgottenHasToBeThereOnce) {
+  schedule_ = Schedule({.once_there = true});
+  lose();
+  EXPECT_EQ(tries(5), (std::vector<long>{0, 1, 3}));
+  schedule_.look({}, now_);
+  EXPECT_EQ(tries(100), std::vector<long>{});
+  lose();
+  EXPECT_FALSE(tries(5).empty());
 }
 
 }  // namespace
