@@ -2,6 +2,7 @@
 // the device.
 #include <dirent.h>
 
+#include <cstring>
 #include <string>
 
 #include "frontend/log.h"
@@ -21,13 +22,14 @@ extern "C" {
 
 DIR* __real_opendir(const char* path);
 
-// The folder /proc of this run has few entries, all of them numbers.
-DIR* __wrap_opendir(const char*) {
+// The folder /proc of this run has few entries, all of them numbers. Other folders are the fuzzer's.
+DIR* __wrap_opendir(const char* path) {
+  if (strcmp(path, "/proc") != 0) return __real_opendir(path);
   return listed ? nullptr : __real_opendir("/proc/self/fdinfo");
 }
 
 FILE* __wrap_popen(const char*, const char*) {
-  return listed ? __wrap_fopen("", "") : nullptr;
+  return listed ? __wrap_fopen("", "re") : nullptr;
 }
 
 int __wrap_pclose(FILE* file) {

@@ -41,7 +41,8 @@ def fuzz(name, options):
     nothing was found in enough executions, and their rate."""
     found = REPOSITORY / "build/fuzz" / name
     found.mkdir(parents=True, exist_ok=True)
-    corpora = [found, *([SOURCES / "corpus" / name] if (SOURCES / "corpus" / name).exists() else [])]
+    seeds = SOURCES / "corpus" / name
+    corpora = [found, *([seeds] if seeds.exists() else [])]
     process = subprocess.Popen(
         [options.build / name, f"-max_total_time={options.seconds}", "-timeout=10", "-rss_limit_mb=2048",
          "-print_final_stats=1", f"-artifact_prefix={found.parent}/", *corpora],
@@ -53,9 +54,14 @@ def fuzz(name, options):
     executions, seconds = stats.get("number_of_executed_units", 0), used.ru_utime + used.ru_stime
     rate = executions / max(seconds, 0.01)
     slow = rate < ENOUGH and options.seconds >= WARM
+    # A target stands in for functions that the fuzzer itself reads and keeps its inputs with.
+    unread = f" 0 files found in {seeds}\n" in text
+    unkept = stats.get("new_units_added", 0) > 0 and not any(found.iterdir())
+    verdict = ("FAILED" if process.returncode != 0 else "SEEDS NOT READ" if unread else "INPUTS NOT KEPT" if unkept
+               else "TOO SLOW" if slow else "")
     print(f"{name}: {executions} executions, {rate:.0f} a second of {seconds:.0f} s processor time, "
           f"{stats.get('new_units_added', 0)} new inputs, peak {stats.get('peak_rss_mb', 0)} MB, "
-          f"{'FAILED' if process.returncode != 0 else 'TOO SLOW' if slow else 'no finding'}", flush=True)
+          f"{verdict or 'no finding'}", flush=True)
     if process.returncode != 0:
         print(text[-4000:], flush=True)
-    return process.returncode == 0 and not slow, rate
+    return verdict == "", rate
