@@ -40,17 +40,20 @@ bool run_with_retries(const char* command) {
 }
 
 // Returns whether the running kernel lacks the driver. One that is a module is listed once a mount has asked
-// for it.
+// for it. A list that cannot be read to its end tells nothing.
 bool lacks_driver(const char* name) {
   const File list(fopen(kDriverList, "re"));
   if (!list) return false;
-  char line[128];
-  while (fgets(line, sizeof line, list.get()) != nullptr) {
+  char* line = nullptr;
+  size_t size = 0;
+  bool found = false;
+  while (!found && getline(&line, &size, list.get()) > 0) {
     line[strcspn(line, "\n")] = '\0';
     const char* driver = strchr(line, '\t');  // "nodev" or nothing stands before it
-    if (driver != nullptr && strcmp(driver + 1, name) == 0) return false;
+    found = driver != nullptr && strcmp(driver + 1, name) == 0;
   }
-  return true;
+  const Memory<char> owner(line);
+  return !found && feof(list.get()) != 0;
 }
 
 }  // namespace

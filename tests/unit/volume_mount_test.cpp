@@ -390,6 +390,11 @@ TEST_F(StockKernel, AKernelWithTheDriverIsTakenAtItsWord) {
   EXPECT_EQ(mount_with("ntfs", "\text4\n\tufsd\n\tntfs3\n"), (Texts{kUfsd, kUfsd, kUfsd, kUfsd}));
 }
 
+TEST_F(StockKernel, TheEndOfALongLineIsNoLine) {
+  const std::string drivers = "nodev\t" + std::string(121, 'x') + "\tufsd\n\tntfs3\n";
+  EXPECT_EQ(mount_with("ntfs", drivers.c_str()).size(), 5u);
+}
+
 TEST_F(StockKernel, WithoutAListOfDriversNothingElseIsTried) {
   EXPECT_EQ(mount_with("ntfs", nullptr), (Texts{kUfsd, kUfsd, kUfsd, kUfsd}));
 }
