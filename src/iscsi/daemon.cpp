@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
@@ -23,8 +24,9 @@ bool find_tree_daemon(const char* pid_file, pid_t* pid) {
   char text[32] = "";
   File file(fopen(pid_file, "re"));
   if (file == nullptr || fgets(text, sizeof text, file.get()) == nullptr) return false;
-  *pid = atoi(text);
-  if (*pid <= 1) return false;
+  const long long number = str2ll(text);
+  if (number <= 1 || number > INT_MAX) return false;
+  *pid = static_cast<pid_t>(number);
   file.reset(fopen(Text<64>("/proc/%d/comm", *pid), "re"));
   return file != nullptr && fgets(text, sizeof text, file.get()) != nullptr && strcmp(text, "ktree\n") == 0;
 }

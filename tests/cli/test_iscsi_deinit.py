@@ -138,6 +138,13 @@ def test_a_pid_file_without_a_process_harms_nobody(box, initiator, text):
     assert tree_runs(box)
 
 
+def test_a_number_that_no_process_has_is_not_cut_to_one(box, initiator):
+    pid = int(box.path(PID_FILE).read_text())
+    box.path(PID_FILE).write_text(f"{(1 << 32) + pid}\n")
+    assert box.remvol("--system_off").status == 0
+    assert tree_runs(box)
+
+
 def test_the_settings_are_saved_no_more(box, initiator):
     box.write("/etc/NAS_CFG/vv.xml", "saved before\n")
     take_down(box, "--deinit")

@@ -19,11 +19,6 @@ namespace {
 constexpr std::string_view kEnd = "</config>";
 constexpr size_t kLooked = 64;  // bytes at its end
 
-void give(const std::string& text) {
-  file_data = reinterpret_cast<const uint8_t*>(text.data());
-  file_size = text.size();
-}
-
 bool ends_as_settings_do(std::string_view text) {
   if (text.size() > kLooked) text.remove_prefix(text.size() - kLooked);
   while (!text.empty() && std::string_view(" \t\r\n").find(text.back()) != std::string_view::npos) {
@@ -36,7 +31,7 @@ void check_own_file(const std::string& between) {
   std::string text;
   for (const char* tag : {"<config>", "<iscsi>", "<initiator>", "<ver>1</ver>", "</initiator>"})
     text += between + tag;
-  give(text);
+  give_file(text);
   require(unloaded_settings() == kSettingsFile);
 }
 
@@ -47,7 +42,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (size == 0) return 0;  // no file
   values.assign(1, "-");
   const std::string text(reinterpret_cast<const char*>(data), size);
-  give(text);
+  give_file(text);
   require(!settings_file_is_unreadable(kSettingsFile));
   require(settings_file_is_torn(kSettingsFile) != ends_as_settings_do(text));
   const char* file = unloaded_settings();
