@@ -76,7 +76,9 @@ int sysaux_state_check_fs_state(const char* node) {
   ext2_filsys file_system = nullptr;
   if (node == nullptr) return 0;
   const errcode_t error = ext2fs_open(node, kFlags, 0, 0, &plain_reads, &file_system);
-  if (error == EXT2_ET_SB_CSUM_INVALID || error == EXT2_ET_CORRUPT_SUPERBLOCK) return 1;
+  const bool is_damaged = error == EXT2_ET_SB_CSUM_INVALID || error == EXT2_ET_CORRUPT_SUPERBLOCK ||
+                          error == EXT2_ET_BAD_DESC_SIZE;
+  if (is_damaged) return 1;
   if (error != 0) return 0;
   // On a 32-bit processor Debian 12's library has times of 32 bits, unlike this code: what stands behind the
   // structure's `now` is elsewhere for it.

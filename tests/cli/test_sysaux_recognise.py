@@ -287,9 +287,9 @@ def test_a_state_that_is_not_valid_wants_a_check(loop, state):
     assert call("check_fs_state", disk.node) != 0
 
 
-@pytest.mark.parametrize("feature, at", [("metadata_csum", 120), ("^metadata_csum", 24)])
+@pytest.mark.parametrize("feature, at", [("metadata_csum", 120), ("^metadata_csum", 24), ("^metadata_csum,64bit", 254)])
 def test_a_damaged_superblock_wants_a_check(loop, feature, at):
-    """The label does not fit the checksum; the block size is none."""
+    """The label does not fit the checksum; the block size is none; nor is that of a group's descriptor."""
     disk = loop()
     run("mke2fs", "-q", "-t", "ext4", "-O", feature, disk.node)
     disk.write(1024 + at, b"DATA")
