@@ -28,9 +28,14 @@ std::string_view take_argument(std::string_view& arguments) {
   return argument;
 }
 
+// An option may be given by its beginning, see getopt_long(3).
 bool has_argument(std::string_view arguments, std::initializer_list<std::string_view> options) {
   while (!arguments.empty()) {
-    if (std::find(options.begin(), options.end(), take_argument(arguments)) != options.end()) return true;
+    const std::string_view argument = take_argument(arguments);
+    if (!argument.starts_with("--") || argument == "--") continue;
+    for (const std::string_view option : options) {
+      if (option.starts_with(argument)) return true;
+    }
   }
   return false;
 }
@@ -54,6 +59,28 @@ bool is_it(const char* process, std::string_view program, std::initializer_list<
          (target.empty() || is_for(arguments, target));
 }
 
+// The name of a process's folder in /proc.
+bool is_number(const char* name) {
+  return name[0] >= '1' && name[0] <= '9';
+}
+
+// Whether one of the descriptors in `folder`, such as /proc/1/fd, leads to the disk or a partition of it.
+bool leads_to(const std::string& folder, const std::string& disk) {
+  bool found = false;
+  DIR* descriptors = opendir(folder.c_str());
+  if (descriptors == nullptr) return false;
+  while (const dirent* entry = found ? nullptr : readdir(descriptors)) {
+    char path[64];
+    const ssize_t size = readlinkat(dirfd(descriptors), entry->d_name, path, sizeof path);
+    std::string_view rest(path, size > 0 ? static_cast<size_t>(size) : 0);
+    if (!rest.starts_with(disk)) continue;
+    rest.remove_prefix(disk.size());
+    found = rest.find_first_not_of("p0123456789") == std::string_view::npos;
+  }
+  closedir(descriptors);
+  return found;
+}
+
 }  // namespace
 
 bool runs(std::string_view program, std::initializer_list<std::string_view> options,
@@ -62,8 +89,18 @@ bool runs(std::string_view program, std::initializer_list<std::string_view> opti
   if (folder == nullptr) return false;
   bool found = false;
   while (const dirent* entry = found ? nullptr : readdir(folder)) {
-    found =
-        entry->d_name[0] >= '1' && entry->d_name[0] <= '9' && is_it(entry->d_name, program, options, target);
+    found = is_number(entry->d_name) && is_it(entry->d_name, program, options, target);
+  }
+  closedir(folder);
+  return found;
+}
+
+bool has_open(const std::string& disk) {
+  DIR* folder = opendir("/proc");
+  if (folder == nullptr) return true;
+  bool found = false;
+  while (const dirent* entry = found ? nullptr : readdir(folder)) {
+    found = is_number(entry->d_name) && leads_to("/proc/" + std::string(entry->d_name) + "/fd", disk);
   }
   closedir(folder);
   return found;

@@ -3,14 +3,19 @@
 #define PLATFORM_COMMON_PROCESSES_H
 
 #include <initializer_list>
+#include <string>
 #include <string_view>
 
 namespace platform {
 
-// True when a process runs the program of that name, and one of its arguments is one of `options` (any when
-// there are none). With a target, only when it names no other one behind "-n".
+// True when a process runs the program of that name, and one of its arguments is one of `options`, or the
+// beginning of one (any when there are none). With a target, only when it names no other one behind "-n".
 bool runs(std::string_view program, std::initializer_list<std::string_view> options = {},
           std::string_view target = {});
+
+// True when a process has the disk, such as /dev/sdb, or a partition of it open by a name in /dev; also when
+// none can be looked at.
+bool has_open(const std::string& disk);
 
 }  // namespace platform
 

@@ -46,6 +46,7 @@ struct Keeper {
   Schedule initiator{kInitiatorTerms};  // its daemon in place of a target
   int signals = -1, devices = -1;
   pid_t target_try = -1, volume_try = -1;  // the processes of the tries under way
+  std::string tried_volume;
   bool first = true;  // no look yet: what is away now was taken down when the settings say so
 };
 
@@ -61,8 +62,10 @@ bool is_taken_down(const std::string& target = {}) {
                         target);
 }
 
-bool is_brought_up() {
-  return platform::runs(platform::kTool, {"--oiscsi_evt_recover", "--connect"});
+// One recovery may take over another.
+bool is_brought_up(const std::string& target) {
+  return platform::runs(platform::kTool, {"--oiscsi_evt_recover"}) ||
+         platform::runs(platform::kTool, {"--connect"}, target);
 }
 
 // Starts a program that goes on when this one ends. Returns its process, or -1.
@@ -99,7 +102,6 @@ void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
 
 std::vector<Wanted> wanted_targets(const platform::TreeReader& tree,
                                    const std::vector<platform::Session>& sessions, bool first) {
-  const bool at_work = is_brought_up();
   std::vector<Wanted> wanted;
   for (int n = 1; n <= remvol::kMaxTargets; n++) {
     const std::string name = tree.value(remvol::key::kTargetName, n);
@@ -111,18 +113,33 @@ std::vector<Wanted> wanted_targets(const platform::TreeReader& tree,
     const bool was_taken = first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) ==
                                         remvol::kDisconnected;
     const bool is_taken = !connected && (was_taken || is_taken_down(name));
-    wanted.push_back({name, connected, is_taken, at_work});
+    wanted.push_back({name, connected, is_taken, !connected && is_brought_up(name)});
   }
   return wanted;
 }
 
-// Starts the next try of a schedule, `option` and what is to be tried being its arguments, unless one is
-// under way.
-void try_next(Schedule& schedule, const char* first_option, const char* option, pid_t& process) {
+// Starts a try as a process of its own.
+pid_t start_try(const char* option, const std::string& name) {
+  return start_program({"remvol-keeper", option, name.c_str()}, "/proc/self/exe");
+}
+
+void try_what_is_due(Keeper& daemon) {
   Try next;
-  if (process >= 0 || !schedule.next_try(next, now())) return;
-  process = start_program({"remvol-keeper", next.first ? first_option : option, next.name.c_str()},
-                          "/proc/self/exe");
+  if (daemon.target_try < 0 && daemon.targets.next_try(next, now())) {
+    daemon.target_try = start_try(next.first ? kTryFirst : kTry, next.name);
+  }
+  if (daemon.volume_try < 0 && daemon.volumes.next_try(next, now())) {
+    daemon.volume_try = start_try(kMount, next.name);
+    daemon.tried_volume = next.name;
+  }
+}
+
+// A volume that is not mounted although the tool has said 0 cannot be: it is left to a person.
+void end_try(Keeper& daemon, pid_t process, int status) {
+  if (process == daemon.target_try) daemon.target_try = -1;
+  if (process != daemon.volume_try) return;
+  daemon.volume_try = -1;
+  if (platform::exit_status(status) == 0) daemon.volumes.leave(daemon.tried_volume);
 }
 
 void look(Keeper& daemon) {
@@ -145,11 +162,8 @@ bool take_signals(Keeper& daemon) {
   bool ended = false;
   signalfd_siginfo info;
   while (read(daemon.signals, &info, sizeof info) == sizeof info) ended = ended || info.ssi_signo != SIGCHLD;
-  for (pid_t child; (child = waitpid(-1, nullptr, WNOHANG)) > 0;) {
-    for (pid_t* attempt : {&daemon.target_try, &daemon.volume_try}) {
-      if (child == *attempt) *attempt = -1;
-    }
-  }
+  int status = 0;
+  for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) end_try(daemon, child, status);
   return !ended;
 }
 
@@ -192,8 +206,7 @@ int serve() {
   }
   do {
     look(daemon);
-    try_next(daemon.targets, kTryFirst, kTry, daemon.target_try);
-    try_next(daemon.volumes, kMount, kMount, daemon.volume_try);
+    try_what_is_due(daemon);
   } while (wait_for_look(daemon));
   return 0;
 }

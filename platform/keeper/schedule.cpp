@@ -64,13 +64,19 @@ Change Schedule::next_change(std::string& name) {
 
 bool Schedule::next_try(Try& next, time_t now) {
   for (AwaitedTarget& target : targets_) {
-    if (!target.missing || target.connected || now < target.due) continue;
+    if (!target.missing || target.taken || target.connected || now < target.due) continue;
     next = {target.name, target.pause == kFirstPause};
     target.due = now + target.pause;
     target.pause = std::min(2 * target.pause, kLongestPause);
     return true;
   }
   return false;
+}
+
+void Schedule::leave(const std::string& name) {
+  for (AwaitedTarget& target : targets_) {
+    if (target.name == name) target.taken = true;
+  }
 }
 
 bool Schedule::anything_missing() const {

@@ -49,6 +49,9 @@ class Schedule {
   // Takes a target that is to be tried now; the next try comes later, up to kLongestPause seconds.
   bool next_try(Try& next, time_t now);
 
+  // It is not tried again until it has been there.
+  void leave(const std::string& name);
+
   // True when something is missing, so that looking every second is worth it.
   bool anything_missing() const;
 

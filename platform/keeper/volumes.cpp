@@ -1,8 +1,12 @@
 #include "keeper/volumes.h"
 
 #include <fcntl.h>
+#include <sys/prctl.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <csignal>
 #include <string_view>
 
 #include "common/fd.h"
@@ -44,7 +48,7 @@ std::vector<Volume> volumes_of(const TreeReader& tree, int target) {
   std::vector<Volume> volumes;
   for (int lun = 1; lun <= kMaxLunsPerTarget; lun++) {
     const std::string share = tree.value(key::kLunShare, target, lun);
-    if (!share.empty() && tree.number(0, key::kLunEnable, target, lun) == 1) {
+    if (!share.empty() && tree.number(0, key::kLunEnable, target, lun) != 0) {
       volumes.push_back({target, lun, share});
     }
   }
@@ -60,49 +64,82 @@ bool is_mounted(const std::vector<platform::Mount>& mounts, const Volume& volume
   return platform::mount_on(mounts, kMountRoot + volume.share) != nullptr;
 }
 
-// The session of a target that is wanted and connected; null when there is none.
+// The session of a target that is wanted and connected; null when there is none, or several, whose disks are
+// the same ones under other names.
 const Session* session_of(const TreeReader& tree, int target, const std::vector<Session>& sessions) {
   if (tree.number(0, key::kTargetConnSet, target) == 0 ||
       tree.number(kDisconnected, key::kTargetConnState, target) != kConnected) {
     return nullptr;
   }
   const std::string name = tree.value(key::kTargetName, target);
-  const auto found = std::find_if(sessions.begin(), sessions.end(), [&name](const Session& session) {
-    return session.target == name && session.link == platform::Link::kUp;
-  });
-  return found == sessions.end() ? nullptr : &*found;
+  const Session* found = nullptr;
+  for (const Session& session : sessions) {
+    if (session.target != name) continue;
+    if (found != nullptr || session.link != platform::Link::kUp) return nullptr;
+    found = &session;
+  }
+  return found;
 }
 
-// A disk that nobody has for himself, as who checks or changes a file system does, and that shows one, or
-// something else that is not overwritten.
-bool is_ready(const std::string& disk) {
-  const std::string node = "/dev/" + disk;
+// The partitions of a disk, such as /dev/sdb1, as the tool takes them.
+std::vector<std::string> partitions_of(const std::string& disk) {
   char names[1024];
-  char content[16];
-  if (!platform::Fd(open(node.c_str(), O_RDONLY | O_EXCL | O_NONBLOCK | O_CLOEXEC)).ok() ||
-      sys_get_partition_list(names, node.c_str()) <= 0) {
-    return false;
-  }
+  std::vector<std::string> partitions;
+  if (sys_get_partition_list(names, disk.c_str()) <= 0) return partitions;
   for (std::string_view rest = names; !rest.empty();) {
     const size_t end = std::min(rest.find(','), rest.size());
-    const std::string partition = "/dev/" + std::string(rest.substr(0, end));
-    if (sys_get_fs_type(content, partition.c_str()) == 0) return true;
+    partitions.push_back("/dev/" + std::string(rest.substr(0, end)));
     rest.remove_prefix(std::min(end + 1, rest.size()));
   }
-  return false;
+  return partitions;
+}
+
+// Whether one of the partitions is what is mounted there.
+bool is_mounted_from(const std::vector<platform::Mount>& mounts, const Volume& volume,
+                     const std::vector<std::string>& partitions) {
+  const platform::Mount* mount = platform::mount_on(mounts, kMountRoot + volume.share);
+  struct stat node {};
+  return mount != nullptr &&
+         std::any_of(partitions.begin(), partitions.end(), [mount, &node](const std::string& partition) {
+           return stat(partition.c_str(), &node) == 0 && node.st_rdev == mount->device;
+         });
+}
+
+bool is_free(const std::string& disk) {
+  return platform::Fd(open(disk.c_str(), O_RDONLY | O_EXCL | O_NONBLOCK | O_CLOEXEC)).ok();
+}
+
+// Whether the disk can be mounted from: nobody has it for himself, as who checks a file system does, nor
+// open; and the partition that the tool takes shows something, which does not say that it wants a check. That
+// it says also while another machine has it mounted.
+bool is_ready(const std::string& disk, const std::vector<std::string>& partitions) {
+  char content[16];
+  if (!is_free(disk) || platform::has_open(disk)) return false;
+  const auto first = std::find_if(
+      partitions.begin(), partitions.end(),
+      [&content](const std::string& partition) { return sys_get_fs_type(content, partition.c_str()) == 0; });
+  return first != partitions.end() && sys_check_fs_state(first->c_str()) == 0;
+}
+
+// Whether the volume is mounted, or would be by a connection, and no more would happen to it.
+bool is_safe(const TreeReader& tree, const Session& session, const Volume& volume) {
+  const int lun = tree.number(-1, key::kLunNumber, volume.target, volume.lun);
+  const std::string name = platform::running_disk(session, lun);
+  if (name.empty()) return false;
+  const std::string disk = "/dev/" + name;
+  const std::vector<std::string> partitions = partitions_of(disk);
+  const std::vector<platform::Mount> mounts = platform::read_mounts();
+  if (is_mounted_from(mounts, volume, partitions)) return true;
+  return !is_mounted(mounts, volume) && is_normal(tree, volume) && is_ready(disk, partitions);
 }
 
 bool can_connect(const TreeReader& tree, int target) {
   const std::vector<Session> sessions = platform::read_sessions();
   const Session* session = session_of(tree, target, sessions);
-  if (session == nullptr) return false;
-  const std::vector<platform::Mount> mounts = platform::read_mounts();
   const std::vector<Volume> volumes = volumes_of(tree, target);
-  return std::all_of(volumes.begin(), volumes.end(), [&](const Volume& volume) {
-    const int lun = tree.number(-1, key::kLunNumber, volume.target, volume.lun);
-    const std::string disk = platform::running_disk(*session, lun);
-    return !disk.empty() && (is_mounted(mounts, volume) || (is_normal(tree, volume) && is_ready(disk)));
-  });
+  return session != nullptr && std::all_of(volumes.begin(), volumes.end(), [&](const Volume& volume) {
+           return is_safe(tree, *session, volume);
+         });
 }
 
 // The slot of the target that has a volume of that share; 0 when there is none.
@@ -133,6 +170,8 @@ std::vector<Wanted> wanted_volumes(const TreeReader& tree, const std::vector<Ses
 }
 
 int mount_again(const std::string& share) {
+  const pid_t keeper = getppid();
+  if (prctl(PR_SET_PDEATHSIG, SIGTERM) != 0 || getppid() != keeper || keeper == 1) return 1;
   const TreeReader tree;
   const int target = target_of(tree, share);
   if (target == 0) return 1;

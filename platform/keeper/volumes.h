@@ -19,8 +19,9 @@ std::vector<Wanted> wanted_volumes(const platform::TreeReader& tree,
 
 // Has the tool connect the target of the volume, which mounts what of it is not mounted, and would format
 // what shows no file system. So it does so only when every volume of the target is mounted, or nothing is
-// wrong with it and its disk runs, is used by nobody, and shows something; and when no other run is at work
-// there. Returns the exit status, 1 when that is not so.
+// wrong with it and its disk runs, is used by nobody, and shows something that wants no check; and when no
+// other run is at work there. Returns the exit status, 1 when that is not so. Ends with the process that
+// started it, but for a run of the tool that has begun.
 int mount_again(const std::string& share);
 
 }  // namespace keeper

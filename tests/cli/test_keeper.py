@@ -1,6 +1,7 @@
 """remvol-keeper: what should be connected or mounted and is not is tried again; the initiator's daemon is there."""
 
 import signal
+import subprocess
 
 import pytest
 from harness.initiator import store
@@ -114,7 +115,7 @@ CONNECT = ("--connect", "-n", "iqn.t1")
 
 
 def volume(keeper, slot, disk, share, **values):
-    """A volume of the connected target t1, whose disk runs and shows a file system."""
+    """A volume of the connected target t1, whose disk runs and shows a file system; it is mounted."""
     box = keeper.box
     good = {"lun": slot - 1, "share": share, "enable": 1, "volume_state": 0, "format_state": 0}
     box.tree.set({f"{VOLUME.format(slot)}/{key}": value for key, value in {**good, **values}.items()})
@@ -122,8 +123,12 @@ def volume(keeper, slot, disk, share, **values):
     box.write(f"{device}/state", "running\n")
     box.path(f"{device}/block/{disk}").mkdir(parents=True)
     box.disk(disk, 1 << 20)
+    # The partition is a device by itself, so that what is on it can be mounted.
+    backing = box.disk(f"{disk}1", 1 << 20)
+    subprocess.run(["mke2fs", "-q", "-F", "-t", "ext4", "-O", "^has_journal", backing], check=True)
+    box.path(f"/mnt/VV/{share}").mkdir(parents=True)
+    mount(box, share)
     box.hook("sys_get_partition_list", f"/dev/{disk}", ret=1, out=f"{disk}1")
-    box.hook("sys_get_fs_type", f"/dev/{disk}1", out="ext4")
 
 
 def photos(keeper, **values):
@@ -133,8 +138,6 @@ def photos(keeper, **values):
     keeper.session(1)
     volume(keeper, 1, "sdb", "Photos", **values)
     volume(keeper, 2, "sdc", "Music")
-    mount(box, "Photos")
-    mount(box, "Music")
     keeper.start()
     wait(box, 3)
     return box
@@ -144,9 +147,11 @@ def wait(box, seconds):
     box.run(["/bin/sleep", str(seconds)], env={"LD_PRELOAD": None})
 
 
+DISKS = {"Photos": "sdb", "Music": "sdc"}
+
+
 def mount(box, share):
-    box.run(["/bin/mkdir", "-p", f"/mnt/VV/{share}"])
-    done = box.run(["/bin/mount", "-t", "tmpfs", "vol", f"/mnt/VV/{share}"], env={"LD_PRELOAD": None})
+    done = box.run(["/bin/mount", "-t", "ext4", f"/dev/{DISKS[share]}1", f"/mnt/VV/{share}"], env={"LD_PRELOAD": None})
     assert done.status == 0, done.stderr
 
 
@@ -185,9 +190,30 @@ def nothing_recognised(box):
     unmount(box, "Music")
 
 
+def another_disk_there(box):
+    unmount(box, "Music")
+    done = box.run(["/bin/mount", "-t", "tmpfs", "vol", "/mnt/VV/Music"], env={"LD_PRELOAD": None})
+    assert done.status == 0, done.stderr
+
+
+def wants_a_check(box):
+    unmount(box, "Music")
+    box.hook("sys_check_fs_state", "/dev/sdc1", ret=1)
+
+
 def not_partitioned(box):
     box.hook("sys_get_partition_list", "/dev/sdc", ret=0, first=True)
     unmount(box, "Music")
+
+
+def a_second_session(box):
+    box.write(f"{SESSIONS}/session2/targetname", "iqn.t1\n")
+    box.write(f"{SESSIONS}/session2/state", "LOGGED_IN\n")
+
+
+def switched_on_otherwise(box):
+    box.tree.set({f"{VOLUME.format(2)}/enable": 2})
+    nothing_recognised(box)
 
 
 def failed(box):
@@ -200,7 +226,8 @@ def being_formatted(box):
     box.tree.set({f"{VOLUME.format(2)}/format_state": 4})
 
 
-@pytest.mark.parametrize("sibling", [run_down, nothing_recognised, not_partitioned, failed, being_formatted])
+@pytest.mark.parametrize("sibling", [run_down, nothing_recognised, another_disk_there, wants_a_check, not_partitioned, failed,
+                                     being_formatted, switched_on_otherwise])
 def test_a_volume_waits_while_a_connection_could_harm_another_one_of_its_target(keeper, sibling):
     box = photos(keeper)
     sibling(box)
@@ -210,11 +237,11 @@ def test_a_volume_waits_while_a_connection_could_harm_another_one_of_its_target(
     assert keeper.runs == []
 
 
-def test_a_volume_whose_disk_somebody_has_for_himself_waits(keeper):
+@pytest.mark.parametrize("use", ["'/dev/sdb', os.O_RDONLY | os.O_EXCL", "'/dev/sdb1', os.O_WRONLY"], ids=["exclusive", "writing"])
+def test_a_volume_whose_disk_somebody_uses_waits(keeper, use):
     box = photos(keeper)
     unmount(box)
-    worker = box.start(["/usr/bin/python3", "-c", "import os,time\nos.open('/dev/sdb', os.O_RDONLY | os.O_EXCL)\ntime.sleep(1000)"],
-                       env={"LD_PRELOAD": None})
+    worker = box.start(["/usr/bin/python3", "-c", f"import os,time\nos.open({use})\ntime.sleep(1000)"], env={"LD_PRELOAD": None})
     wait_missed(keeper)
     wait(box, 4)
     assert keeper.runs == []
@@ -235,21 +262,26 @@ def test_a_volume_that_was_not_mounted_yet_is_left_alone(keeper):
     keeper.target(1, state=1)
     keeper.session(1)
     volume(keeper, 1, "sdb", "Photos")
+    unmount(keeper.box)
     keeper.start()
     wait(box, LONG_ENOUGH)
     assert keeper.runs == [] and "Photos" not in keeper.daemon.stderr
 
 
-@pytest.mark.parametrize("state", ["FAILED", "FREE"])
-def test_a_volume_of_a_lost_session_is_not_the_keepers(keeper, state):
+def lost(box):
+    box.write(f"{SESSIONS}/session1/state", "FAILED\n")
+
+
+@pytest.mark.parametrize("session", [lost, a_second_session])
+def test_a_volume_of_a_lost_session_or_of_two_is_not_the_keepers(keeper, session):
     box = photos(keeper)
-    box.write(f"{SESSIONS}/session1/state", f"{state}\n")
+    session(box)
     unmount(box)
     wait(box, LONG_ENOUGH)
     assert keeper.runs == [] and "Photos" not in keeper.daemon.stderr
 
 
-@pytest.mark.parametrize("command, late", [("--disconnect", False), ("--disconnect", True), ("--format", False), ("--del_lun", True)])
+@pytest.mark.parametrize("command, late", [("--disconnect", False), ("--disc", True), ("--format", False), ("--del_lun", True)])
 def test_a_volume_that_the_tool_takes_away_stays_away(keeper, command, late):
     box = photos(keeper)
     if late:
@@ -273,16 +305,38 @@ def test_a_volume_that_a_command_for_another_target_leaves_alone_is_mounted_agai
     keeper.wait_runs(CONNECT)
 
 
-def test_a_volume_is_not_mounted_beside_another_run_that_mounts(keeper):
+def test_a_volume_that_the_tool_did_not_mount_is_left_to_a_person(keeper):
     box = photos(keeper)
     unmount(box)
-    wait_missed(keeper)
     keeper.wait_runs(CONNECT)
+    wait(box, 5)
+    assert keeper.runs == [CONNECT]
+    mount(box, "Photos")
+    wait(box, 3)
+    unmount(box)
+    keeper.wait_runs(CONNECT, CONNECT)
+
+
+def test_a_volume_is_not_mounted_beside_another_run_that_mounts(keeper):
+    box = photos(keeper)
     box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
-    before = len(keeper.runs)
     box.start(["/tmp/bin/remvol", "--add", "-n", "iqn.t1"], env={"LD_PRELOAD": None})
-    wait(box, 8)
-    assert len(keeper.runs) <= before + 1  # one may have been under way
+    unmount(box)
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == []
+
+
+def test_a_try_ends_with_the_keeper(keeper):
+    box = photos(keeper)
+    box.hook("sys_check_fs_state", "/dev/sdb1", ret=0, delay=5)
+    unmount(box)
+    wait_missed(keeper)
+    wait(box, 1)
+    keeper.daemon.kill(signal.SIGKILL)
+    keeper.daemon.wait()
+    keeper.daemon = None
+    wait(box, 7)
+    assert keeper.runs == []
 
 
 def test_the_initiator_is_started_when_it_is_gone(keeper):

@@ -182,6 +182,19 @@ TEST_F(KeeperSchedule, WhatWasNotThereYetIsNotMissing) {
   EXPECT_EQ(change(), Change::kMissing);
 }
 
+TEST_F(KeeperSchedule, WhatIsLeftIsTriedAgainOnlyWhenItWasThere) {
+  lose();
+  EXPECT_EQ(change(), Change::kMissing);
+  EXPECT_EQ(tries(2), (std::vector<long>{0, 1}));
+  schedule_.leave("a");
+  EXPECT_EQ(tries(100), std::vector<long>{});
+  EXPECT_FALSE(schedule_.anything_missing());
+  look(kConnected);
+  EXPECT_EQ(change(), Change::kBack);
+  lose();
+  EXPECT_FALSE(tries(5).empty());
+}
+
 TEST_F(KeeperSchedule, WhatWasForgottenHasToBeThereOnce) {
   schedule_ = Schedule({.once_there = true});
   lose();
