@@ -15,7 +15,7 @@
 #include <string>
 #include <string_view>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "common/program.h"
 #include "common/report.h"
 #include "common/sessions.h"
@@ -242,7 +242,7 @@ constexpr char kHelp[] =
 }  // namespace events
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   if (argc == 1) return events::serve(events::kDefaultNotifier);
   const std::string_view option = argc == 2 ? argv[1] : "";
   if (argc == 3 && std::string_view(argv[1]) == "--notifier") return events::serve(argv[2]);

@@ -17,7 +17,7 @@
 #include <string_view>
 #include <vector>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "common/processes.h"
 #include "common/program.h"
 #include "common/report.h"
@@ -223,7 +223,7 @@ constexpr char kHelp[] =
 }  // namespace keeper
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   if (argc == 1) return keeper::serve();
   const std::string_view option = argv[1];
   if (option == keeper::kTryFirst && argc == 3) return keeper::try_target(argv[2], true);

@@ -19,11 +19,10 @@
 #include <string>
 #include <vector>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "common/report.h"
 #include "ktree/endpoint.h"
 #include "ktree/server.h"
-#include "ktree/standard_descriptors.h"
 #include "ktree/start_settings.h"
 
 namespace {
@@ -135,7 +134,6 @@ void tell_ready() {
 int run_daemon(const DaemonOptions& options) {
   // What the starting process left open is not the daemon's: a lock file would stay locked for as long as it
   // lives. Nor is the folder that it was started in: a volume would stay busy.
-  ktree::fill_standard_descriptors();
   close_range(STDERR_FILENO + 1, ~0U, 0);
   raise_descriptor_limit();
   const int signals = open_signals();
@@ -165,7 +163,7 @@ int run_daemon(const DaemonOptions& options) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   try {
     DaemonOptions options;
     const int status = parse_options(argc, argv, options);

@@ -9,7 +9,6 @@
 #include <cstdio>
 #include <cstring>
 
-#include "common/begin.h"
 #include "common/file_text.h"
 #include "common/report.h"
 #include "common/tree_listing.h"
@@ -19,6 +18,7 @@
 #include "vvstat/kernel.h"
 #include "vvstat/status.h"
 
+#include "begin.h"
 #include "run_files.h"
 
 namespace notify {
@@ -165,6 +165,6 @@ int run(int argc, char** argv) {
 }  // namespace notify
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   return notify::run(argc, argv);
 }

@@ -16,7 +16,7 @@
 #include <cstring>
 #include <initializer_list>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "common/report.h"
 #include "shares/flash.h"
 #include "shares/settings_copy.h"
@@ -115,7 +115,7 @@ int run_command(char** command, pid_t group, const sigset_t& callers_mask, bool 
 }  // namespace
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   if (argc < 2) {
     fprintf(stderr, "usage: flashrun COMMAND-LINE | COMMAND ARGUMENT...\n");
     return kUsage;

@@ -3,7 +3,7 @@
 #include <cerrno>
 #include <cstring>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "shares/process.h"
 #include "shares/reload.h"
 #include "shares/server_config.h"
@@ -19,7 +19,7 @@ constexpr char kLock[] = "afp-shares.lock";
 }  // namespace
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   const ReloadCommand command = read_command(argc, argv);
   if (command == ReloadCommand::kWrong) return 2;
   open_log("macshare_reload");

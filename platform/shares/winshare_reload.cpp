@@ -15,7 +15,7 @@
 #include <string_view>
 #include <vector>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "shares/process.h"
 #include "shares/reload.h"
 #include "shares/server_config.h"
@@ -99,7 +99,7 @@ void tell_what_is_missing(const Reload& done, const ServerConfig& config, bool h
 }  // namespace
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   const ReloadCommand command = read_command(argc, argv);
   if (command == ReloadCommand::kWrong) return 2;
   open_log("winshare_reload");

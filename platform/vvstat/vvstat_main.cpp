@@ -9,7 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "common/memory.h"
 #include "common/utf8.h"
 #include "vvstat/columns.h"
@@ -312,7 +312,7 @@ int run(int argc, char** argv) {
 }  // namespace vvstat
 
 int main(int argc, char** argv) {
-  platform::begin();
+  remvol::begin();
   platform::end_when_memory_is_short(vvstat::kFailed);
   return vvstat::run(argc, argv);
 }

@@ -1,13 +1,12 @@
 // remvol: one command of the appliance for each run. main reads the command line, runs the command's handler
 // and records the outcome.
-#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 
+#include "begin.h"
 #include "frontend/commands.h"
 #include "frontend/log.h"
 #include "frontend/options.h"
@@ -126,16 +125,6 @@ void keep_program_path(int argc, char** argv) {
   if (argc > 0) copy_text(program_path, argv[0]);
 }
 
-// A core would hold the secrets. Programs that the tool starts are not changed: exec sets it back.
-void leave_no_core() {
-  prctl(PR_SET_DUMPABLE, 0);
-}
-
-// A caller that ignores the end of its children passes that on, and no command's status would be known.
-void hear_of_children() {
-  signal(SIGCHLD, SIG_DFL);
-}
-
 void log_arguments(int argc, char** argv, const int* shown) {
   for (int i = 0; i < argc; i++) {
     LOG(1, "arg[%d]: '%.*s%s'", i, shown[i], argv[i], shown[i] < 0 ? "" : kMaskedSecret);
@@ -146,8 +135,7 @@ void log_arguments(int argc, char** argv, const int* shown) {
 
 int main(int argc, char** argv) {
   const LogScope scope;
-  leave_no_core();
-  hear_of_children();
+  begin();
   const Memory<int> shown = allocate<int>(static_cast<size_t>(argc) + 1);
   if (!shown) return fail(false);
   hide_secrets(argc, argv, shown.get());

@@ -150,3 +150,10 @@ class TestJournal:
         lines = in_a_unit(box, "timeout", "2", "ktree", "-n", "config", "-s", "/run/other", "-l", "/etc/NAS_CFG/vv.xml",
                           "-l", "/usr/local/config/vv.xml")
         assert [priority for priority, text in lines if text.startswith("ktree: ")] == [4, 5]
+
+
+def test_without_an_output_no_line_goes_into_another_file(box):
+    box.tree.set("/iscsi/initiator/dbg", "3")
+    assert box.run(["sh", "-c", "exec remvol --check_share_name -s abc >&-"]).status == 0
+    texts = [file.read_bytes() for file in box.path("/run/remvol").iterdir() if file.is_file()]
+    assert texts and not any(b"share name" in text for text in texts)

@@ -1,5 +1,6 @@
 // Programs that are started: what they get as their streams, how their end is told.
 #include "common/program.h"
+#include "begin.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -9,8 +10,6 @@
 #include <cerrno>
 #include <csignal>
 #include <string>
-
-#include "common/begin.h"
 
 using namespace platform;
 
@@ -50,7 +49,7 @@ TEST(Program, ACallerWithoutStreamsOfItsOwnMakesNoDifference) {
   for (const int first : {STDIN_FILENO, STDOUT_FILENO}) {
     EXPECT_EQ(apart([first] {
                 for (int stream = first; stream <= STDERR_FILENO; stream++) close(stream);
-                begin();
+                remvol::begin();
                 const int file = memfd_create("output", MFD_CLOEXEC);
                 const int other = memfd_create("other", MFD_CLOEXEC);
                 const int status = exit_status(end_of(start_shell("echo out", {kNowhere, file, kNowhere})));
@@ -68,7 +67,7 @@ TEST(Program, StreamsThatAreThereStay) {
               const int file = memfd_create("output", 0);
               dup2(file, STDOUT_FILENO);
               close(file);
-              begin();
+              remvol::begin();
               const int next = memfd_create("next", MFD_CLOEXEC);
               const int status = exit_status(end_of(start_shell("echo out", {})));
               return next == file && status == 0 && content(STDOUT_FILENO) == "out\n" ? 0 : 1;

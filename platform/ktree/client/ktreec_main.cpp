@@ -7,9 +7,8 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "common/begin.h"
+#include "begin.h"
 #include "ktree/client/calls.h"
-#include "ktree/standard_descriptors.h"
 #include "tree_layout.h"
 
 namespace {
@@ -167,8 +166,7 @@ bool is_one_of(const char* word, const char* one, const char* other) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  platform::begin();
-  ktree::fill_standard_descriptors();
+  remvol::begin();
   if (argc == 2 && is_one_of(argv[1], "-h", "--help")) {
     fputs(kUsage, stdout);
     return EXIT_SUCCESS;

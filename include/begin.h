@@ -1,6 +1,6 @@
-// How a program of the platform begins.
-#ifndef PLATFORM_COMMON_BEGIN_H
-#define PLATFORM_COMMON_BEGIN_H
+// How the tool and the programs of the platform begin.
+#ifndef REMVOL_BEGIN_H
+#define REMVOL_BEGIN_H
 
 #include <fcntl.h>
 #include <sys/prctl.h>
@@ -8,7 +8,7 @@
 
 #include <csignal>
 
-namespace platform {
+namespace remvol {
 
 // Comes first in main(). The end of a child is heard of: a caller that ignores it passes that on. No core is
 // left, which would hold the passwords of the tree; the programs that are started may leave one. A standard
@@ -23,6 +23,6 @@ inline void begin() {
   if (stream > STDERR_FILENO) close(stream);
 }
 
-}  // namespace platform
+}  // namespace remvol
 
 #endif
