@@ -65,7 +65,7 @@ LOOKS = [
     Wait(("src/iscsi/iscsid.cpp", "src/support/run_lock.cpp"), "usleep(kPoll)"),
     Wait(("src/support/target_hold.cpp",), "usleep(kBriefPoll)"),
     Wait(("src/volume/disk_use.cpp",), "usleep(kLookPause)"),
-    Wait(("src/tree/access.cpp",), "usleep(kLoadPause)"),
+    Wait(("src/tree/settings_file.cpp",), "usleep(kLoadPause)"),
     Wait(("src/volume/format.cpp",), "poll(&said, 1, kFirstWordMs)"),
     Wait(("platform/sysaux/disk_table.cpp",), "nanosleep(&kPause, nullptr)"),
     Wait(("platform/sysaux/disk_table.cpp",), "nanosleep(&kReaction, nullptr)"),

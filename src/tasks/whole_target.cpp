@@ -12,6 +12,7 @@
 #include "sysaux.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
+#include "tree/settings_file.h"
 #include "tree/slots.h"
 #include "tree/state.h"
 #include "volume/mount.h"
@@ -111,7 +112,7 @@ int Target_Logout(TargetEntry* entry) {
 }
 
 void log_out_if_deleted(TargetEntry* entry) {
-  if (!HeldSlot(entry->db_idx)) (void)Target_Logout(entry);
+  if (!HeldSlot(entry->db_idx) && unloaded_settings() == nullptr) (void)Target_Logout(entry);
 }
 
 void give_up_session(TargetEntry* entry, int reason, VolumeState state) {

@@ -22,9 +22,6 @@ namespace {
 // Seconds that a read may have taken which is done once more: one that has timed out would do so again.
 constexpr time_t kPatience = 1;
 
-constexpr int kLoadLooks = 50;             // 5 seconds
-constexpr useconds_t kLoadPause = 100000;  // microseconds
-
 // A daemon that is too busy to take the connection at once is one.
 bool tree_takes_connections() {
   sockaddr_un address = {};
@@ -85,16 +82,6 @@ bool tree_is_missing(const char* key, const char* present) {
 
 bool tree_is_loaded() {
   return tree_present(key::kVersion) || tree_present(key::kTargetCount);
-}
-
-bool await_loaded_tree() {
-  static int looks = 0;
-  while (!tree_is_loaded()) {
-    if (looks == kLoadLooks) return false;
-    looks++;
-    usleep(kLoadPause);
-  }
-  return true;
 }
 
 int tree_read_number(const char* key, int missing) {

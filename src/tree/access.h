@@ -58,10 +58,6 @@ template <size_t N>
 // there, but one of two keys is in every tree that was loaded.
 [[nodiscard]] bool tree_is_loaded();
 
-// Waits for a tree that was started anew until it has loaded its settings, at most 5 s in a run. Returns
-// whether it has.
-[[nodiscard]] bool await_loaded_tree();
-
 // Returns the decimal number at `key`, 0 when its text is no number, `missing` when the key is not present.
 [[nodiscard]] int tree_read_number(const char* key, int missing);
 

@@ -23,6 +23,8 @@ constexpr const char* kInitiatorPath[] = {"config", "iscsi", "initiator"};
 constexpr int kInitiatorDepth = sizeof kInitiatorPath / sizeof *kInitiatorPath;
 constexpr char kSettingsFolder[] = "/etc/NAS_CFG";
 constexpr char kFileEnd[] = "</config>";
+constexpr int kLoadLooks = 50;             // 5 seconds
+constexpr useconds_t kLoadPause = 100000;  // microseconds
 
 // A tag of the file: its text, cut to the size, and its last character.
 struct Tag {
@@ -133,6 +135,16 @@ const char* unloaded_settings() {
     if (count != '\0') return counted > 0 || (counted == 0 && count == '0') ? nullptr : file;
   }
   return nullptr;
+}
+
+bool await_loaded_settings() {
+  static int looks = 0;
+  while (!tree_is_loaded() || unloaded_settings() != nullptr) {
+    if (looks == kLoadLooks) return false;
+    looks++;
+    usleep(kLoadPause);
+  }
+  return true;
 }
 
 bool settings_file_is_unreadable(const char* path) {

@@ -16,6 +16,11 @@ namespace remvol {
 // check; one that cannot be read may hold anything. Returns null when there is none.
 [[nodiscard]] const char* unloaded_settings();
 
+// Waits for a tree that was started anew until it has loaded its settings, at most 5 s in a run, and the time
+// that the looks take. Returns whether it has: one that was not loaded from them knows nothing, whatever
+// others have stored in it by now.
+[[nodiscard]] bool await_loaded_settings();
+
 // Dumps the tree to kSettingsFile. A dump that is withheld or fails is logged at level 0 in the innermost
 // scope's name; one for which there is no folder is told on standard error. Returns whether what
 // kSettingsFile holds then may go to the configuration flash.

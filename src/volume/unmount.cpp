@@ -100,11 +100,9 @@ bool is_stored(const TargetEntry* entry) {
   return slot && is_lun_stored_at(slot.target(), slot.lun());
 }
 
-// A tree that was started anew is waited for: a volume that its settings do not know would be nobody's. One
-// that was not loaded from them knows nothing, whatever others have stored in it by now.
+// A tree that was started anew is waited for: a volume that its settings do not know would be nobody's.
 bool is_deleted(const TargetEntry* entry) {
-  return !is_stored(entry) && await_loaded_tree() && unloaded_settings() == nullptr &&
-         !HeldSlot(entry->db_idx, entry->lun_db_idx);
+  return !is_stored(entry) && await_loaded_settings() && !HeldSlot(entry->db_idx, entry->lun_db_idx);
 }
 
 // The volumes that unmount_if_deleted() has left where they are. A command that changes settings brings up

@@ -639,20 +639,46 @@ class TestATreeThatIsStartedAnew:
         mounts = box.run(["cat", "/proc/mounts"]).stdout
         assert "/mnt/VV/a" in mounts and "/mnt/VV/b" not in mounts
 
-    def test_a_new_tree_that_was_not_loaded_tells_nothing_of_volumes(self, site, box):
+    # A new tree that has a count, which any run stores there, and not the settings of the file.
+    ANEW = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); "
+            "until ktreec -S /var/run/ktree_sock_vv -t >/dev/null 2>&1; [ $? -eq 3 ]; do sleep 0.01; done; "
+            "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & "
+            f"until ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/count 1; do sleep 0.01; done")
+
+    @staticmethod
+    def save(box):
+        box.path("/etc/NAS_CFG").mkdir(parents=True, exist_ok=True)
+        box.run(["sh", "-c", f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1; "
+                             "ktreec -S /var/run/ktree_sock_vv -D /etc/NAS_CFG/vv.xml"])
+
+    @pytest.fixture
+    def offered(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})
         site.log_in("iqn.t1")
         site.disk("sdb")
-        box.path("/etc/NAS_CFG").mkdir(parents=True)
-        box.run(["sh", "-c", f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1; "
-                             "ktreec -S /var/run/ktree_sock_vv -D /etc/NAS_CFG/vv.xml"])
-        box.tree.set(f"{INITIATOR}/ver", 1)
-        restart = ("kill -KILL $(cat /var/run/ktree_sock_vv_config.pid); sleep 0.1; "
-                   "ktree -n config -s /var/run/ktree_sock_vv >/dev/null 2>&1 & sleep 0.3; "
-                   f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/count 1")
-        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=restart, times=1)
+        box.session_disk("sdb", "iqn.t1")
+        self.save(box)
+
+    def test_a_new_tree_that_was_not_loaded_tells_nothing_of_volumes(self, offered, box):
+        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=self.ANEW, times=1)
         assert box.remvol(*TestAdding.ADD).status == 255
         assert "/mnt/VV/a" in box.run(["cat", "/proc/mounts"]).stdout
+        assert box.tree.get(f"{INITIATOR}/count") == "1"
+
+    def test_a_new_tree_that_is_loaded_later_is_waited_for_although_it_has_a_count(self, offered, box):
+        box.hook("ktreec_set", "/result/add", value="0", through=True, effect=self.ANEW, times=1)
+        box.hook("usleep", "100000", skip=3, times=1, through=True,
+                 effect=f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1")
+        assert box.remvol(*TestAdding.ADD).status == 255
+        assert "/mnt/VV/a" not in box.run(["cat", "/proc/mounts"]).stdout
+
+    def test_a_connection_is_not_closed_by_a_new_tree_that_was_not_loaded(self, offered, site, box):
+        site.store("iqn.t1", ip="10.0.0.1", port=3260, luns=[("a", 0)])
+        self.save(box)
+        box.hook("system", re.compile("^chmod 777 "), through=True, effect=self.ANEW, times=1)
+        box.remvol("--connect", "-n", "iqn.t1")
+        assert "/mnt/VV/a" in box.run(["cat", "/proc/mounts"]).stdout
+        assert box.tree.get(f"{INITIATOR}/count") == "1"
 
     def test_an_add_whose_tree_does_not_answer_is_no_success(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})
