@@ -71,7 +71,7 @@ bool is_whole(int fd) {
   if (!is_regular(fd) || fstat(fd, &info) != 0) return false;
   const off_t from = info.st_size > off_t{sizeof end} ? info.st_size - off_t{sizeof end} : 0;
   ssize_t length = pread(fd, end, sizeof end, from);
-  while (length > 0 && strchr(" \t\r\n", end[length - 1]) != nullptr) length--;
+  while (length > 0 && memchr(" \t\r\n", end[length - 1], 4) != nullptr) length--;
   return length >= ssize_t{kEndLength} && memcmp(end + length - kEndLength, kEnd, kEndLength) == 0;
 }
 

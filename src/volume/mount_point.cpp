@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <climits>
 #include <cstdlib>
 #include <cstring>
@@ -27,11 +28,12 @@ void sync_mount(const char* path) {
   close(fd);
 }
 
-// Returns whether the path lies on the file system of the mount root, or either cannot be looked at.
+// Returns whether the path lies on the file system of the mount root, or either is missing.
 bool is_on_root_file_system(const char* path) {
   struct stat root;
   struct stat own;
-  return stat(kMountRoot, &root) != 0 || lstat(path, &own) != 0 || own.st_dev == root.st_dev;
+  if (stat(kMountRoot, &root) == 0 && lstat(path, &own) == 0) return own.st_dev == root.st_dev;
+  return errno == ENOENT || errno == ENOTDIR;
 }
 
 // Returns whether a component of the share's name is ".." or every one is "." or empty.

@@ -376,7 +376,7 @@ def test_a_link_in_the_place_of_the_copy_is_replaced(copied):
 
 
 @pytest.mark.parametrize("mounted", [False, True])
-@pytest.mark.parametrize("line", [f"head -c 100 {SAVED} >{COPY}", f": >{COPY}; exit 5", f": >{COPY}; kill -9 $$"])
+@pytest.mark.parametrize("line", [f"head -c 100 {SAVED} >{COPY}", f"{{ cat {SAVED}; head -c 9 /dev/zero; }} >{COPY}", f": >{COPY}; exit 5", f": >{COPY}; kill -9 $$"])
 def test_settings_that_another_command_leaves_torn_are_put_back(copied, line, mounted):
     if mounted:
         copied.mount("rw")

@@ -81,6 +81,9 @@ TEST_F(MountPoint, ThePathIsTheRootAndTheShare) {
 TEST_F(MountedPath, AFolderThatIsNotMountedMayBeRemoved) {
   EXPECT_FALSE(is_removal_unsafe(path.c_str()));
   EXPECT_FALSE(is_removal_unsafe("/mnt/VV/never made"));
+  const std::string unseen =
+      "/mnt/VV/" + std::string(300, 'x');  // longer than a name may be: it cannot be looked at
+  EXPECT_TRUE(is_removal_unsafe(unseen.c_str()));
 }
 
 TEST_F(MountedPath, AMountIsNotRemoved) {
