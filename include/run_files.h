@@ -8,10 +8,12 @@ namespace remvol {
 
 inline constexpr char kRunDir[] = "/run/remvol";  // only root may enter it
 
-// The name of a run's lock file, by printf(3): the kind, and name_hash() of what it is for. A run that works
-// on a target as a whole has the file of the kind kTargetLock locked alone (flock(2), LOCK_EX).
+// The name of a run's lock file, by printf(3): the kind, and name_hash() of the target's name. A run that
+// works on a target as a whole has the file of the kind kTargetLock locked alone (flock(2), LOCK_EX); one
+// that works on a LUN of it has that shared, and the file of the kind kLunLock, with the LUN's number, alone.
 inline constexpr char kLockFormat[] = "%s-%016llx.lock";
 inline constexpr char kTargetLock[] = "target";
+inline constexpr char kLunLock[] = "lun-%d";
 
 // The run that recovers has a record lock on it (fcntl(2), F_WRLCK).
 inline constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.lock";

@@ -79,17 +79,18 @@ Problem problem_of_unmounted(const Target& target, const Volume& volume, bool wo
     return {Ailment::kFailed, "Failed", "its partition, format or mount failed",
             "look at the kernel's log for errors of the disk", connect_command_of(target, &volume)};
   }
+  // Also while its disk is being looked for: the tree says already that the target is connected.
+  if (worked_on)
+    return {Ailment::kBusy, "Busy", "is not mounted while a command works on its target", "wait", ""};
   if (volume.device.empty()) {
     return {Ailment::kFailed, "No Disk", "its LUN has no disk here",
             "see whether the storage server still offers it", connect_command_of(target, &volume)};
   }
-  if (worked_on)
-    return {Ailment::kBusy, "Busy", "is not mounted while a command works on its target", "wait", ""};
   return {Ailment::kFailed, "Not Mounted", "is not mounted", "mount it again",
           connect_command_of(target, &volume)};
 }
 
-Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts, bool worked_on) {
+Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts& facts) {
   if (volume.format_state == remvol::kFormatting) {
     return {Ailment::kBusy, "Formatting", "is being formatted, " + std::to_string(volume.progress) + "%",
             "wait", ""};
@@ -100,7 +101,7 @@ Problem problem_of(const Target& target, const Volume& volume, const VolumeFacts
   if (volume.volume_state == remvol::kVolumeCreating) {
     return {Ailment::kBusy, "Creating", "is being created", "wait", ""};
   }
-  if (!facts.mounted) return problem_of_unmounted(target, volume, worked_on);
+  if (!facts.mounted) return problem_of_unmounted(target, volume, facts.worked_on);
   if (facts.disk_lost) {
     return {Ailment::kFailed, "No Disk", "its disk is gone, though its target is connected",
             "have it mounted anew", mount_anew(volume)};
@@ -164,7 +165,7 @@ Row row_of_volume(const Target& target, const TargetFacts& target_facts, size_t 
   row.wanted = row.wanted && volume.enabled;
   if (!row.wanted) row.problem = kNone;
   const bool lost = !row.healthy();
-  if (row.wanted && !lost) row.problem = problem_of(target, volume, facts, target_facts.worked_on);
+  if (row.wanted && !lost) row.problem = problem_of(target, volume, facts);
   row.status = lost ? row.problem.status : status_of(volume, row);
   row.otherwise = otherwise(row, volume.status);
   return row;

@@ -7,7 +7,6 @@
 #include <sys/sysmacros.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -156,17 +155,19 @@ VolumeFacts facts_of(const Volume& volume, bool answering, Detail detail, Tables
   return facts;
 }
 
-// Whether a run of the tool has the target for itself. What is tried in vain is held for a moment otherwise.
-bool is_worked_on(const std::string& target) {
+// Whether a run of the tool has that lock for itself. What is tried in vain is held for a moment otherwise.
+bool is_held(const char* kind, const std::string& target) {
   char name[64];
-  snprintf(name, sizeof name, remvol::kLockFormat, remvol::kTargetLock, remvol::name_hash(target.c_str()));
+  snprintf(name, sizeof name, remvol::kLockFormat, kind, remvol::name_hash(target.c_str()));
   const std::string path = std::string(remvol::kRunDir) + "/" + name;
   const platform::Fd lock(open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
   return lock.ok() && flock(lock.get(), LOCK_SH | LOCK_NB) != 0 && errno == EWOULDBLOCK;
 }
 
-bool lacks_a_mount(const std::vector<VolumeFacts>& volumes) {
-  return std::any_of(volumes.begin(), volumes.end(), [](const VolumeFacts& each) { return !each.mounted; });
+bool is_worked_on(const Volume& volume, const std::string& target) {
+  char lun[32];
+  snprintf(lun, sizeof lun, remvol::kLunLock, volume.lun);
+  return is_held(remvol::kTargetLock, target) || is_held(lun, target);
 }
 
 const Session* session_of(const Target& target, const std::vector<Session>& sessions) {
@@ -193,9 +194,9 @@ std::vector<TargetFacts> read_facts(const Status& status, Detail detail) {
     const bool answering = session != nullptr && session->link == Link::kUp;
     facts.volumes.reserve(target.volumes.size());
     for (const Volume& volume : target.volumes) {
-      facts.volumes.push_back(facts_of(volume, answering, detail, tables));
+      VolumeFacts& of_volume = facts.volumes.emplace_back(facts_of(volume, answering, detail, tables));
+      of_volume.worked_on = answering && !of_volume.mounted && is_worked_on(volume, target.name);
     }
-    facts.worked_on = answering && lacks_a_mount(facts.volumes) && is_worked_on(target.name);
     all.push_back(std::move(facts));
   }
   return all;

@@ -26,6 +26,8 @@ struct VolumeFacts {
   unsigned long long size = 0;
   bool shut_down = false;  // its file system refuses everything
   time_t made = 0;         // its file system was; 0: it is not mounted, or does not tell
+  bool worked_on = false;  // a run of the tool has it; known of one that is not mounted though its target
+                           // is logged in
   std::string options{};   // of the mount; of Detail::kAll
 };
 
@@ -33,7 +35,6 @@ struct TargetFacts {
   std::string session;  // its state: LOGGED_IN, FAILED, FREE; empty without a session
   std::string address;  // the portal that it is connected with, without its port; of Detail::kAll
   std::vector<VolumeFacts> volumes;  // in the order of the tree
-  bool worked_on = false;  // a run of the tool has it; known of one that is logged in and lacks a mount
 };
 
 // Reads /sys/class/iscsi_session, and of what is mounted statx(2), statvfs(3), the disk's

@@ -22,7 +22,7 @@ LockName target_lock(const char* target_name) {
 }
 
 LockName lun_lock(const char* target_name, int lun) {
-  return hashed_lock_name(Text<32>("lun-%d", lun), target_name);
+  return hashed_lock_name(Text<32>(kLunLock, lun), target_name);
 }
 
 // Returns whether this run did not hold the target before.

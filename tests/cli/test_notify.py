@@ -102,9 +102,11 @@ def test_events(example, journal, values, mounted, event, priority):  # noqa: F8
     assert [(e["EVENT"], e["PRIORITY"]) for e in journal.entries() if e["SHARE"] == "Backup"] == [(event, priority)]
 
 
-def test_a_volume_that_is_being_mounted_has_not_failed(example, journal):  # noqa: F811
+@pytest.mark.parametrize("device", ["", "sdb"])
+def test_a_volume_that_is_being_mounted_has_not_failed(example, journal, device):  # noqa: F811
     notify(example)
     run(example, "/bin/umount", "/mnt/VV/Backup")
+    change(example, {"lun/id:1/dev": device})
     with a_run_works(example, T1_NAME):
         notify(example)
         assert journal.entries() == []

@@ -214,29 +214,46 @@ def test_what_formats_says_that_it_destroys(example, values):
 
 
 @contextlib.contextmanager
-def a_run_works(box, target, how=fcntl.LOCK_EX):
-    """What a run of the tool does while it works on a target."""
+def a_run_works(box, target, lun=None):
+    """What a run of the tool does while it works on a target, or on one LUN of it."""
     digest = 14695981039346656037
     for byte in target.encode():
         digest = (digest ^ byte) * 1099511628211 % 2 ** 64
     folder = box.path("/run/remvol")
     folder.mkdir(mode=0o700, parents=True, exist_ok=True)
-    with open(folder / f"target-{digest:016x}.lock", "w", encoding="ascii") as lock:
-        fcntl.flock(lock, how)
+    with contextlib.ExitStack() as held:
+        def hold(kind, how):
+            lock = held.enter_context(open(folder / f"{kind}-{digest:016x}.lock", "w", encoding="ascii"))
+            fcntl.flock(lock, how)
+
+        hold("target", fcntl.LOCK_EX if lun is None else fcntl.LOCK_SH)
+        if lun is not None:
+            hold(f"lun-{lun}", fcntl.LOCK_EX)
         yield
 
 
-def test_a_volume_that_is_not_mounted_while_a_command_works_on_its_target(example):
+@pytest.mark.parametrize("lun", [None, 0])
+def test_a_volume_that_is_not_mounted_while_a_command_works_on_it(example, lun):
     run(example, "/bin/umount", "/mnt/VV/Backup")
-    with a_run_works(example, T1_NAME):
+    with a_run_works(example, T1_NAME, lun):
         check_problem(example, "Busy", "is not mounted while a command works on its target", None)
     check_problem(example, "Not Mounted", "is not mounted", CONNECT)
 
 
 def test_a_command_that_works_on_another_volume_of_the_target_mounts_this_one_not(example):
     run(example, "/bin/umount", "/mnt/VV/Backup")
-    with a_run_works(example, T1_NAME, fcntl.LOCK_SH):
+    with a_run_works(example, T1_NAME, lun=1):
         check_problem(example, "Not Mounted", "is not mounted", CONNECT)
+
+
+@pytest.mark.parametrize("lun", [None, 0])
+def test_a_volume_whose_disk_is_yet_to_be_found_while_a_command_works_on_it(example, lun):
+    """A command says that the target is connected before it has looked for the disks."""
+    run(example, "/bin/umount", "/mnt/VV/Backup")
+    change(example, {"lun/id:1/dev": ""})
+    with a_run_works(example, T1_NAME, lun):
+        check_problem(example, "Busy", "is not mounted while a command works on its target", None)
+    check_problem(example, "No Disk", "its LUN has no disk here", CONNECT)
 
 
 def test_a_session_that_is_gone_is_lost_whoever_works_on_its_target(example):
