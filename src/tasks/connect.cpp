@@ -3,7 +3,6 @@
 #include <unistd.h>
 
 #include "frontend/log.h"
-#include "iscsi/iscsiadm.h"
 #include "iscsi/node.h"
 #include "iscsi/session.h"
 #include "iscsi/target_status.h"
@@ -15,7 +14,6 @@
 #include "tree/state.h"
 #include "volume/lun_status.h"
 #include "volume/mount.h"
-#include "volume/session_volumes.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
@@ -90,7 +88,7 @@ int disconnect_all() {
   LOG(1, "update share folder status");
   reload_share_services();
   LOG(1, "finish share folder status");
-  return close_sessions(nullptr, logout_all_command());
+  return log_out_all();
 }
 
 int disconnect_target(const char* target_name) {

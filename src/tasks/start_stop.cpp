@@ -3,12 +3,10 @@
 #include "frontend/log.h"
 #include "iscsi/iface.h"
 #include "iscsi/initiator.h"
-#include "iscsi/iscsiadm.h"
 #include "iscsi/settings_daemon.h"
 #include "tasks/whole_target.h"
 #include "tree/state.h"
 #include "upgrade/remvol_ver_upgrade.h"
-#include "volume/session_volumes.h"
 #include "volume/share_services.h"
 #include "volume/unmount.h"
 
@@ -34,7 +32,7 @@ int task_deinit(int system_off) {
   const LogScope scope;
   LOG(2, system_off != 0 ? "system off" : "deinit start");
   Target_umount_all();
-  (void)close_sessions(nullptr, logout_all_command());
+  (void)log_out_all();
   bool succeeded = stop_initiator();
   LOG(2, "deinit end");
   if (system_off == 0) {

@@ -8,6 +8,7 @@
 #include "iscsi/session.h"
 #include "iscsi/target_status.h"
 #include "support/result.h"
+#include "support/session_hold.h"
 #include "support/target_hold.h"
 #include "sysaux.h"
 #include "tree/entry.h"
@@ -108,6 +109,17 @@ int Target_Logout(TargetEntry* entry) {
   const int result = log_out(entry);
   entry->conn_set = 0;
   (void)ktree_set_connect_state(entry->db_idx, kDisconnected);
+  return result;
+}
+
+int log_out_all() {
+  if (!is_session_used_by_others()) return close_sessions(nullptr, logout_all_command());
+  const SessionClosing closing(nullptr);
+  int result = kFailed;
+  for (int n = 1; n <= kMaxTargets; n++) {
+    TargetEntry entry;
+    if (is_target_stored(n) && ktree_get_entry_by_dbidx(n, &entry) == kOk) result = log_out(&entry);
+  }
   return result;
 }
 

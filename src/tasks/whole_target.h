@@ -11,6 +11,10 @@ namespace remvol {
 // command failed.
 [[nodiscard]] int Target_Logout(TargetEntry* entry);
 
+// Logs out of all targets, whosever they are; where somebody else uses the disk of one, of the stored targets
+// alone. Returns 0; 1 when the last command failed, or there was nothing to log out of.
+[[nodiscard]] int log_out_all();
+
 // Logs out a target that was deleted while this run brought it up: the run that deleted it may have found no
 // session yet.
 void log_out_if_deleted(TargetEntry* entry);

@@ -5,6 +5,7 @@
 
 #include "frontend/log.h"
 #include "support/command.h"
+#include "support/files.h"
 #include "support/result.h"
 #include "support/session_hold.h"
 #include "support/text.h"
@@ -19,10 +20,31 @@ namespace remvol {
 namespace {
 
 constexpr int kMaxVolumes = 64;
+constexpr char kDisks[] = "/sys/class/block";
+
+bool is_volume(const MountLine& mount) {
+  return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0;
+}
 
 bool is_session_volume(const MountLine& mount, const void* target_name) {
-  return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0 &&
+  return is_volume(mount) &&
          is_session_disk(mount.source, static_cast<const char*>(target_name)) != SessionDisk::kNo;
+}
+
+bool is_session_mount_of_others(const MountLine& mount, const void* /*what*/) {
+  return !is_volume(mount) && is_session_disk(mount.source, nullptr) != SessionDisk::kNo;
+}
+
+// Returns whether there is something in the folder besides itself and the one above.
+bool has_entries(const char* folder) {
+  const Directory directory(opendir(folder));
+  int entries = 0;
+  while (directory && readdir(directory.get()) != nullptr) entries++;
+  return entries > 2;
+}
+
+void log_use(const char* disk, const char* place) {
+  LOG(0, "the session of %s stays, it is in use at %s", disk, place);
 }
 
 // Returns whether none is left. A table that is there and cannot be read may show one.
@@ -42,12 +64,29 @@ bool unmount_session_volumes(const char* target_name) {
         Target_LUN_umount(&entry) == kOk) {
       continue;
     }
-    LOG(0, "the session of %s stays, it is mounted on %s", mount.source, mount.path);
+    log_use(mount.source, mount.path);
     return false;
   }
 }
 
 }  // namespace
+
+bool is_session_used_by_others() {
+  MountLine mount;
+  if (find_mount(is_session_mount_of_others, nullptr, &mount) == Mounted::kYes) {
+    log_use(mount.source, mount.path);
+    return true;
+  }
+  // The folder has a link for each disk and partition.
+  const Directory disks(opendir(kDisks));
+  while (const dirent* disk = disks ? readdir(disks.get()) : nullptr) {
+    const PathText holders("%s/%s/holders", kDisks, disk->d_name);
+    if (is_session_disk(disk->d_name, nullptr) == SessionDisk::kNo || !has_entries(holders)) continue;
+    log_use(disk->d_name, holders);
+    return true;
+  }
+  return false;
+}
 
 bool has_session_volume(const char* target_name) {
   MountLine mount;

@@ -1,5 +1,5 @@
-// The volumes that are mounted from the disks of iSCSI sessions, by the kernel's own tables: a session that
-// is closed under a volume takes what was not yet written with it.
+// What is mounted from the disks of iSCSI sessions, by the kernel's own tables: a session that is closed
+// under a file system takes what was not yet written with it.
 #ifndef REMVOL_VOLUME_SESSION_VOLUMES_H
 #define REMVOL_VOLUME_SESSION_VOLUMES_H
 
@@ -8,6 +8,10 @@ namespace remvol {
 // Returns whether a volume is mounted below "/mnt/VV/" from a disk of a session to the target, or to any
 // target when it is null. A table of mounts that is there and cannot be read may show one.
 [[nodiscard]] bool has_session_volume(const char* target_name);
+
+// Returns whether somebody else uses a disk of a session, which is logged at level 0: it is mounted elsewhere
+// than volumes are, or held by LVM or the like.
+[[nodiscard]] bool is_session_used_by_others();
 
 // Closes the target's session, or all for null, by the command `logout`. Volumes that are mounted still,
 // since the tree does not know them or another run has mounted them meanwhile, are unmounted before; no run

@@ -398,7 +398,7 @@ class TestASessionUnderAVolume:
         done = box.run(["sh", "-c", "cd $(realpath /sys/block/sdq/device)/../../iscsi_session/session*/ && rm targetname && mkdir targetname"])
         assert done.status == 0, done.stderr
         said = messages(box.remvol("--disconnect", "-n", "iqn.t1"))
-        assert "the session of /dev/sdq1 stays, it is mounted on /mnt/VV/unknown" in said
+        assert "the session of /dev/sdq1 stays, it is in use at /mnt/VV/unknown" in said
         assert unknown.logged_in("iqn.t1") and unknown.mounted("unknown")
 
     @pytest.mark.parametrize("command", [["--disconnect", "-n", "iqn.t1"], ["--disconnect"]])
@@ -433,6 +433,53 @@ class TestASessionUnderAVolume:
         assert unknown.logged_in("iqn.t1") and unknown.target("conn_set") == "1"
         assert unknown.mounted("unknown")
 
+
+class TestADiskThatSomebodyElseUses:
+    """On one session a target of the settings, on another one somebody else's, whose disk is sdx."""
+
+    @pytest.fixture
+    def theirs(self, stored, box):
+        assert box.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None}).status == 0
+        box.default("killall")
+        box.default("rmmod")
+        stored.offer("iqn.theirs", {0: "sdx"})
+        for number, (name, disk) in enumerate({"iqn.t1": "sdb", "iqn.theirs": "sdx"}.items(), start=1):
+            stored.log_in(name)
+            box.session_disk(disk, name, session=number)
+        return stored
+
+    COMMANDS = [["--disconnect"], ["--system_off"], ["--deinit"]]
+
+    @pytest.mark.parametrize("command", COMMANDS)
+    def test_the_session_stays_while_it_is_mounted(self, theirs, box, command):
+        theirs.mount("sdx", "/srv/theirs")
+        done = box.remvol(*command)
+        assert theirs.sessions() == ["iqn.theirs"]
+        assert "the session of /dev/sdx1 stays, it is in use at /srv/theirs" in messages(done)
+        assert "iscsiadm -m node -u" not in box.shell() and 'iscsiadm -m node -T "iqn.t1" --logout' in box.shell()
+        assert done.status == 0
+
+    @pytest.mark.parametrize("held", ["sdx", "sdx1"])
+    def test_the_session_stays_while_something_is_built_on_it(self, theirs, box, held):
+        box.path(f"/sys/class/block/{held}/holders/dm-0").mkdir(parents=True)
+        done = box.remvol("--disconnect")
+        assert done.status == 0 and theirs.sessions() == ["iqn.theirs"]
+        assert f"the session of {held} stays, it is in use at /sys/class/block/{held}/holders" in messages(done)
+
+    def test_without_another_session_nothing_is_closed(self, theirs, box):
+        theirs.mount("sdx", "/srv/theirs")
+        assert box.remvol("--disconnect").status == 0
+        assert box.remvol("--disconnect").status == 255
+        assert theirs.sessions() == ["iqn.theirs"]
+
+    @pytest.mark.parametrize("command", COMMANDS)
+    def test_one_that_nobody_uses_is_closed_like_all(self, theirs, box, command):
+        box.local_disk("sdl")
+        box.path("/sys/class/block/sdl/holders/dm-0").mkdir(parents=True)
+        box.path("/sys/class/block/sdx/holders").mkdir(parents=True)
+        theirs.mount("sdl", "/srv/local")
+        box.remvol(*command)
+        assert theirs.sessions() == [] and "iscsiadm -m node -u" in box.shell()
 
 class TestTakingEverythingAway:
     """It holds no target: what it closes and removes, another run may bring up in the same moment."""
