@@ -24,20 +24,20 @@ BLOCK = """
 
 
 def shipped():
-    """The documents that the package brings, all in one folder, and the pictures below it."""
-    for line in (PACKAGING.parent / "debian/remvol.docs").read_text().splitlines():
-        path = PACKAGING.parent / line
-        yield from path.iterdir() if path.is_dir() else [path]
+    """The documents that are installed, all in one folder, and the pictures below it."""
+    docs = PACKAGING.parent / "docs"
+    yield from PACKAGING.parent.glob("*.md")
+    yield from (path for path in docs.rglob("*") if path.is_file() and docs / "man" not in path.parents)
 
 
-def test_the_documents_that_the_manual_pages_name_are_in_the_package():
+def test_the_documents_that_the_manual_pages_name_are_installed():
     named = {name for page in (PACKAGING.parent / "docs/man").iterdir()
              for name in re.findall(r"/usr/share/doc/remvol/([\w.-]+\w)", page.read_text())}
     assert "vv.schema.json" in named and named <= {path.name for path in shipped()}
 
 
 @pytest.mark.parametrize("path", [path for path in shipped() if path.suffix == ".md"], ids=lambda path: path.name)
-def test_the_documents_that_an_installed_one_names_are_in_the_package(path):
+def test_the_documents_that_an_installed_one_names_are_installed(path):
     text = path.read_text()
     named = set(re.findall(r"`(?:docs/)?([\w-]+\.(?:md|json|cast|svg))`", text))
     named |= {link.split("/")[-1] for link in re.findall(r"\]\(([^):]*)\)", text)}
