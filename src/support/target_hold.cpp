@@ -48,14 +48,24 @@ void mark_target(const char* target_name) {
   (void)lock.try_take(target_lock(target_name), LockMode::kShared);
 }
 
-TargetHold::TargetHold(const char* target_name) : outermost_(enter(target_name)) {
+TargetHold::TargetHold(const char* target_name) : outermost_(enter(target_name)), held_(true) {
   if (outermost_) waited_ = take_waiting(&target_, target_lock(target_name), LockMode::kExclusive);
 }
 
-TargetHold::TargetHold(const char* target_name, int lun) : outermost_(enter(target_name)) {
-  if (!outermost_) return;
-  waited_ = take_waiting(&target_, target_lock(target_name), LockMode::kShared);
-  waited_ |= take_waiting(&lun_, lun_lock(target_name, lun), LockMode::kExclusive);
+TargetHold::TargetHold(const char* target_name, int lun, HoldWait wait)
+    : lun_number_(lun), outermost_(enter(target_name)) {
+  held_ = !outermost_ || (target_.try_take(target_lock(target_name), LockMode::kShared) != LockTry::kBusy &&
+                          lun_.try_take(lun_lock(target_name, lun), LockMode::kExclusive) != LockTry::kBusy);
+  if (held_) return;
+  target_.release();
+  if (wait == HoldWait::kAtOnce) await();
+}
+
+void TargetHold::await() {
+  if (held_) return;
+  (void)take_waiting(&target_, target_lock(held_target), LockMode::kShared);
+  (void)take_waiting(&lun_, lun_lock(held_target, lun_number_), LockMode::kExclusive);
+  held_ = waited_ = true;
 }
 
 TargetHold::~TargetHold() {

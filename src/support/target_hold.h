@@ -14,18 +14,23 @@ namespace remvol {
 // Leaves a sign that a run works on the target, for IdleTarget.
 void mark_target(const char* target_name);
 
+enum class HoldWait { kAtOnce, kLater };
+
 class TargetHold {
  public:
   // For the whole target. Waits for every run that brings it, or a LUN of it, up. A target that this run
   // holds already is held on.
   explicit TargetHold(const char* target_name);
 
-  // For one LUN of the target. Runs that bring other LUNs of it up go on meanwhile.
-  TargetHold(const char* target_name, int lun);
+  // For one LUN of the target. Runs that bring other LUNs of it up go on meanwhile. With kLater the LUN is
+  // held from now on where no run is in the way, and everywhere once await() has waited for those.
+  TargetHold(const char* target_name, int lun, HoldWait wait = HoldWait::kAtOnce);
 
   TargetHold(const TargetHold&) = delete;
   TargetHold& operator=(const TargetHold&) = delete;
   ~TargetHold();
+
+  void await();
 
   // Whether another run held it: what was read before may have changed.
   bool waited() const { return waited_; }
@@ -33,7 +38,9 @@ class TargetHold {
  private:
   RunLock target_;
   RunLock lun_;
+  int lun_number_ = -1;
   bool outermost_ = false;
+  bool held_ = false;
   bool waited_ = false;
 };
 

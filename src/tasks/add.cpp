@@ -96,11 +96,14 @@ int task_add(const TargetEntry& request) {
   TargetEntry entry = request;
   int dbidx = 0;
   int lun_dbidx = 0;
+  // It is stored at once, also while another run brings its target up. Where none does, it is held from the
+  // beginning, so that nobody takes it for one that should be mounted by now.
+  TargetHold hold(entry.target_name, entry.lun, HoldWait::kLater);
   if (store_lun(&entry, &dbidx, &lun_dbidx) != kOk) return kFailed;
   (void)ktree_update_lun_status(&entry, 0);
   (void)ktree_update_status(&entry);
 
-  const TargetHold hold(entry.target_name, entry.lun);
+  hold.await();
   if (!HeldSlot(dbidx, lun_dbidx)) return kFailed;  // deleted meanwhile
   int result = kOk;
   if (check_target_connected(entry.target_name) == kNotLoggedIn) {

@@ -1,5 +1,6 @@
 """Runs beside one another, and what a killed run leaves to the next."""
 
+import json
 import posixpath
 import re
 import time
@@ -373,6 +374,46 @@ class TestTargetsThatMove:
         assert [site.lun(key) for key in ("dev", "status")] == ["sdb", "Offline"]
         assert [site.lun(key, target=2) for key in ("dev", "status")] == [None, None]
 
+
+class TestAFurtherVolume:
+    """Added to a target that is connected, and looked at meanwhile."""
+
+    ADD = ["remvol", "--add", "-n", "iqn.t1", "-l", "1", "-i", "10.9.0.2", "-p", "3260", "-s", "b", "-c", "0"]
+
+    @pytest.fixture
+    def connected(self, stored, box):
+        assert box.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None}).status == 0
+        box.write("/sys/class/iscsi_session/session1/targetname", "iqn.t1\n")
+        box.write("/sys/class/iscsi_session/session1/state", "LOGGED_IN\n")
+        assert box.remvol("--connect", "-n", "iqn.t1").status == 0
+        stored.offer("iqn.t1", {0: "sdb", 1: "sdc"})
+        stored.disk("sdc")
+        return stored
+
+    @staticmethod
+    def seen(box):
+        told = json.loads(box.run(["vvstat", "--json", "b"], env={"LD_PRELOAD": None}).stdout)["volumes"]
+        return [volume["problem"] for volume in told]
+
+    @pytest.mark.parametrize("call", ["iscsiadm -m session >", "iscsiadm -m session -P3"])
+    def test_it_has_not_failed_before_it_is_mounted(self, connected, box, call):
+        meet(box, "system", re.compile("^" + call))
+        run = box.start(self.ADD)
+        until(lambda: is_there(box))
+        assert self.seen(box) == ["is not mounted while a command works on its target"]
+        go_on(box)
+        assert run.wait().status == 0
+        assert self.seen(box) == [None]
+
+    def test_it_is_stored_while_another_run_has_the_target(self, connected, box):
+        hold = "exec 9</run/remvol/target-*.lock; flock 9; echo held; exec sleep 1000"
+        holder = box.start(["/bin/bash", "-c", hold], env={"LD_PRELOAD": None, "PATH": "/usr/bin:/bin"})
+        box.wait_until(lambda: holder.stdout == "held\n")
+        run = box.start(self.ADD)
+        until(lambda: connected.lun("share", slot=2) == "b")
+        assert not comes_true(lambda: connected.mounted("b"))
+        holder.kill()
+        assert run.wait().status == 0 and connected.mounted("b")
 
 class TestASessionUnderAVolume:
     """A volume that the tree does not name is known by the kernel's tables alone."""
