@@ -528,6 +528,7 @@ def given(box):
 @pytest.mark.parametrize("session, action", [(None, "restart"), ("session9", "start")])
 def test_what_ran_of_the_initiator_runs_again(units, session, action):
     """A unit that has logged in counts as running, though nothing of it is left; where a session is, it would end that."""
+    units.default("iscsiadm")
     taken = helper(units, "initiator", "take")
     assert "connected at start it connects again" in taken.stderr
     assert {call[0] for call in units.runs("systemctl")} == {"-q"}
@@ -536,6 +537,7 @@ def test_what_ran_of_the_initiator_runs_again(units, session, action):
         units.write(f"/sys/class/iscsi_session/{session}/targetname", "iqn.other\n")
     wanted = [["daemon-reload"], ["-q", action, "iscsid.socket"], ["-q", action, "open-iscsi.service"]]
     assert given(units) == wanted
+    assert units.runs("iscsiadm") == ([["-m", "node", "--loginall=automatic"]] if session else [])
     assert units.path("/tmp/masked").read_text() == ""
 
 
