@@ -32,9 +32,9 @@ std::string_view take_argument(std::string_view& arguments) {
 bool has_argument(std::string_view arguments, std::initializer_list<std::string_view> options) {
   while (!arguments.empty()) {
     const std::string_view argument = take_argument(arguments);
-    if (!argument.starts_with("--") || argument == "--") continue;
+    const bool may_begin_one = argument.starts_with("--") && argument != "--";
     for (const std::string_view option : options) {
-      if (option.starts_with(argument)) return true;
+      if (option == argument || (may_begin_one && option.starts_with(argument))) return true;
     }
   }
   return false;
