@@ -51,10 +51,6 @@ bool is_scsi_target(std::string_view name) {
   return name.starts_with(kScsiTarget);
 }
 
-std::string folder_of(uint32_t session) {
-  return std::string(kFolder) + "/" + std::string(kSession) + std::to_string(session);
-}
-
 // A session gets a SCSI target when the first login is through and a LUN was found; without one no volume
 // depends on it.
 bool had_luns(const std::string& session) {
@@ -77,9 +73,9 @@ std::vector<Session> read_sessions() {
   std::vector<Session> sessions;
   for_entries(kFolder, [&sessions](std::string_view name) {
     if (!name.starts_with(kSession)) return true;
-    const auto number = static_cast<uint32_t>(strtoul(name.data() + kSession.size(), nullptr, 10));
-    const std::string path = folder_of(number);
+    const std::string path = std::string(kFolder) + "/" + std::string(name);
     const std::string target = read_line(path + "/targetname");
+    const auto number = static_cast<uint32_t>(strtoul(name.data() + kSession.size(), nullptr, 10));
     const std::string state = read_line(path + "/state");
     if (!target.empty()) sessions.push_back({number, target, state, link_of(path, state)});
     return true;
@@ -95,7 +91,8 @@ std::string address_of(const Session& session) {
 // Below the session are the SCSI target, the LUN's SCSI device, and the disk, whose names are those of the
 // kernel: target2:0:0/2:0:0:1/block/sdb.
 std::string running_disk(const Session& session, int lun) {
-  const std::string session_device = folder_of(session.number) + "/device";
+  const std::string session_device =
+      std::string(kFolder) + "/" + std::string(kSession) + std::to_string(session.number) + "/device";
   const std::string target = find_entry(session_device, is_scsi_target);
   if (target.empty()) return {};
   const std::string device =
