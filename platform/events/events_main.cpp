@@ -19,6 +19,7 @@
 #include "common/program.h"
 #include "common/report.h"
 #include "common/sessions.h"
+#include "common/tree_reader.h"
 #include "events/kernel_event.h"
 #include "events/netlink.h"
 #include "events/recovery.h"
@@ -90,7 +91,11 @@ void notify(const char* notifier, const OrderEnd& end) {
 
 void give_orders(Listener& daemon) {
   Order order;
-  while (daemon.targets.next(order)) daemon.targets.started(order.target, start_tool(order));
+  if (!daemon.targets.next(order)) return;
+  const platform::TreeReader tree;
+  do {
+    daemon.targets.started(order.target, is_others(tree, order.target) ? -1 : start_tool(order));
+  } while (daemon.targets.next(order));
 }
 
 // A recovery may have ended well and left its target to a run that did not.

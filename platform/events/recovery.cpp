@@ -5,7 +5,6 @@
 
 #include "common/processes.h"
 #include "common/program.h"
-#include "common/tree_reader.h"
 #include "run_files.h"
 #include "tree_layout.h"
 
@@ -18,14 +17,19 @@ using platform::TreeReader;
 
 constexpr char kWholeTree[] = "/";
 
+// 0: the tree has no such target.
+int slot_of(const TreeReader& tree, const std::string& target) {
+  for (int n = 1; n <= remvol::kMaxTargets; n++) {
+    if (tree.value(remvol::key::kTargetName, n) == target) return n;
+  }
+  return 0;
+}
+
 // A target that was taken out meanwhile is not lost.
 bool is_lost(const TreeReader& tree, const std::string& target) {
-  for (int n = 1; n <= remvol::kMaxTargets; n++) {
-    if (tree.value(remvol::key::kTargetName, n) != target) continue;
-    return tree.number(0, remvol::key::kTargetConnSet, n) != 0 &&
-           tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) == remvol::kRecovering;
-  }
-  return false;
+  const int n = slot_of(tree, target);
+  return n != 0 && tree.number(0, remvol::key::kTargetConnSet, n) != 0 &&
+         tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) == remvol::kRecovering;
 }
 
 // A run that recovers goes on with what is queued, and nothing names the target that it has taken from there.
@@ -46,6 +50,10 @@ bool is_at_work(const std::string& target) {
 }
 
 }  // namespace
+
+bool is_others(const TreeReader& tree, const std::string& target) {
+  return !tree.value(remvol::key::kVersion).empty() && slot_of(tree, target) == 0;
+}
 
 Recovery recovery_of(const std::string& target) {
   const TreeReader tree(remvol::kVolumesSocket, kWholeTree);

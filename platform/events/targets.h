@@ -53,7 +53,7 @@ class Targets {
   void look_after_a_gap(const std::vector<Session>& sessions);
 
   // Takes the next order that may be run now: one at a time for each target, in the order of the events.
-  // Returns false when there is none. The caller says with started() which process does it.
+  // Returns false when there is none. The caller says with started() which process does it, -1 for none.
   bool next(Order& order);
   void started(const std::string& target, pid_t process);
 

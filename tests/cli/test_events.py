@@ -372,6 +372,41 @@ def test_a_recovery_that_is_given_up_is_told(connected):
     assert connected.box.runs("remvol-notify").count(given_up) == 1
 
 
+def test_the_sessions_of_others_are_nobodys_business_here(events):
+    """From the first look to the return, and without a word in the log."""
+    store(events.box, "iqn.a")
+    events.box.tree.set({f"{INITIATOR}/ver": 1})
+    for number, name in enumerate(["iqn.a1", "iqn.a", "iqn.A"], 1):
+        events.session(number, name)
+    events.start()
+    events.wait_runs(recover("iqn.a"))
+    for state, event in (("FAILED", message(LOST, 1)), ("LOGGED_IN", login_response(1))):
+        for number in (1, 3, 2):
+            events.state(number, state)
+        events.send(event)
+    events.wait_runs(recover("iqn.a"), reopen("iqn.a"), recover("iqn.a"))
+    events.box.wait_until(lambda: len(events.box.runs("remvol-notify")) == 3, what="news of each order")
+    assert "iqn.a1" not in events.daemon.stderr and "iqn.A" not in events.daemon.stderr
+
+
+def test_a_target_that_is_added_while_its_session_is_there_is_told_of(events):
+    events.box.tree.set({f"{INITIATOR}/ver": 1})
+    events.session(1, "iqn.a")
+    events.start()
+    events.box.wait_until(events.asleep_for_good, what="the end of the first look")
+    store(events.box, "iqn.a")
+    events.state(1, "FAILED")
+    events.send(message(LOST, 1))
+    events.wait_runs(reopen("iqn.a"))
+
+
+def test_a_tree_without_its_settings_does_not_say_whose_a_session_is(events):
+    store(events.box, "iqn.b")
+    events.session(1, "iqn.a", state="FAILED")
+    events.start()
+    events.wait_runs(reopen("iqn.a"))
+
+
 LOST_TARGETS = ["iqn.a", "iqn.b", "iqn.c", "iqn.d"]
 
 
