@@ -41,6 +41,15 @@ class Keeper:
         return [tuple(call) for call in self.box.runs("remvol")]
 
 
+def at_work(box, *words, seconds=1000):
+    """A run of the tool that takes its time; returns when it is seen."""
+    tool = "/tmp/bin/remvol"
+    box.write(tool, f"#!/bin/sh\nsleep {seconds}\n").chmod(0o755)
+    run = box.start([tool, *words], env={"LD_PRELOAD": None})
+    box.wait_until(lambda: [tool, *words] in [process[1:] for process in box.processes().values()], what="the run")
+    return run
+
+
 @pytest.fixture
 def keeper(box):
     keeper = Keeper(box)
@@ -86,8 +95,7 @@ def test_a_target_that_is_to_be_away_is_left_away(keeper, values):
 @pytest.mark.parametrize("named", ["-n iqn.t2", "-n iqn.t1", ""], ids=["another", "itself", "all"])
 def test_only_a_command_for_the_target_keeps_it_away(keeper, named):
     box = keeper.box
-    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
-    box.start(["/tmp/bin/remvol", "--disconnect", *named.split()], env={"LD_PRELOAD": None})
+    run = at_work(box, "--disconnect", *named.split())
     keeper.target(1, port=3260)
     listen(box)
     keeper.start()
@@ -95,7 +103,7 @@ def test_only_a_command_for_the_target_keeps_it_away(keeper, named):
         keeper.wait_runs(("--status",), ("--connect", "-n", "iqn.t1"))
     else:
         box.run(["/bin/sleep", "6"], env={"LD_PRELOAD": None})
-        assert keeper.runs == []
+        assert run.result is None and keeper.runs == []
 
 
 def test_volumes_of_a_lost_session_are_recovered(keeper):
@@ -287,8 +295,7 @@ def test_a_volume_that_the_tool_takes_away_stays_away(keeper, command, late):
     if late:
         unmount(box)
         wait(box, 3)
-    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 3\n").chmod(0o755)
-    run = box.start(["/tmp/bin/remvol", command, "-n", "iqn.t1"], env={"LD_PRELOAD": None})
+    run = at_work(box, command, "-n", "iqn.t1", seconds=3)
     if not late:
         unmount(box)
     run.wait()
@@ -298,8 +305,7 @@ def test_a_volume_that_the_tool_takes_away_stays_away(keeper, command, late):
 
 def test_a_volume_that_a_command_for_another_target_leaves_alone_is_mounted_again(keeper):
     box = photos(keeper)
-    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
-    box.start(["/tmp/bin/remvol", "--disconnect", "-n", "iqn.t2"], env={"LD_PRELOAD": None})
+    at_work(box, "--disconnect", "-n", "iqn.t2")
     unmount(box)
     wait_missed(keeper)
     keeper.wait_runs(CONNECT)
@@ -319,8 +325,7 @@ def test_a_volume_that_the_tool_did_not_mount_is_left_to_a_person(keeper):
 
 def test_a_volume_is_not_mounted_beside_another_run_that_mounts(keeper):
     box = photos(keeper)
-    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 1000\n").chmod(0o755)
-    box.start(["/tmp/bin/remvol", "--add", "-n", "iqn.t1"], env={"LD_PRELOAD": None})
+    at_work(box, "--add", "-n", "iqn.t1")
     unmount(box)
     wait(box, LONG_ENOUGH)
     assert keeper.runs == []
