@@ -4,16 +4,20 @@
 #include <netdb.h>
 #include <netinet/in.h>
 #include <poll.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <vector>
 
 #include "common/mounts.h"
 #include "common/program.h"
+#include "common/sessions.h"
 #include "common/tree_reader.h"
+#include "keeper/tool_runs.h"
 #include "tree_layout.h"
 
 namespace keeper {
@@ -48,6 +52,7 @@ bool accepts_at_a_port(const addrinfo& address) {
 }
 
 struct Stored {
+  bool wanted = false;
   std::string address, port;
   std::vector<std::string> shares;
 };
@@ -56,6 +61,7 @@ bool read_stored(const std::string& target, Stored& stored) {
   platform::TreeReader tree;
   for (int n = 1; n <= remvol::kMaxTargets; n++) {
     if (tree.value(remvol::key::kTargetName, n) != target) continue;
+    stored.wanted = tree.number(0, remvol::key::kTargetConnSet, n) != 0;
     stored.address = tree.value(remvol::key::kTargetIp, n);
     stored.port = tree.value(remvol::key::kTargetPort, n);
     for (int m = 1; m <= remvol::kMaxLunsPerTarget; m++) {
@@ -73,7 +79,21 @@ bool has_mounted(const Stored& stored) {
   });
 }
 
+// Looked up again behind all that takes its time.
+bool is_still_missing(const std::string& target) {
+  Stored stored;
+  if (!read_stored(target, stored) || !stored.wanted || is_taken_down(target)) return false;
+  const std::vector<platform::Session> sessions = platform::read_sessions();
+  return std::none_of(sessions.begin(), sessions.end(),
+                      [&target](const platform::Session& session) { return session.target == target; });
+}
+
 }  // namespace
+
+bool end_with_keeper() {
+  const pid_t keeper = getppid();
+  return prctl(PR_SET_PDEATHSIG, SIGTERM) == 0 && getppid() == keeper && keeper != 1;
+}
 
 int run_silently(std::vector<const char*> arguments) {
   arguments.insert(arguments.begin(), platform::kTool);
@@ -101,12 +121,12 @@ bool portal_answers(const std::string& address, const std::string& port) {
 
 int try_target(const std::string& target, bool refresh) {
   Stored stored;
-  if (!read_stored(target, stored)) return 1;
+  if (!end_with_keeper() || !read_stored(target, stored)) return 1;
   const bool mounted = has_mounted(stored);
   // Says "Reconnecting", which is also what a recovery wants to find.
   if (mounted) run_silently({"--oiscsi_evt_reopen", "-n", target.c_str()});
   if (refresh) run_silently({"--status"});
-  if (!portal_answers(stored.address, stored.port)) return 1;
+  if (!portal_answers(stored.address, stored.port) || !is_still_missing(target)) return 1;
   return run_silently({mounted ? "--oiscsi_evt_recover" : "--connect", "-n", target.c_str()});
 }
 

@@ -11,13 +11,17 @@ namespace keeper {
 // told why it failed. Returns the exit status, 1 when there is none.
 int run_silently(std::vector<const char*> arguments);
 
+// Has the calling process end with the one that started it, the keeper; a run of the tool that has begun goes
+// on. Returns false when the keeper has ended already.
+bool end_with_keeper();
+
 // Whether a portal accepts connections; waits some seconds for it. A link-local address is tried at every LAN
 // port.
 bool portal_answers(const std::string& address, const std::string& port);
 
 // Has the tool connect the target, or, where volumes are still mounted from its lost session, recover it.
-// Returns the exit status, 1 when the portal does not answer. With `refresh` the status texts are brought up
-// to date before.
+// Returns the exit status, 1 when the portal does not answer, or when the target was disconnected, deleted or
+// connected meanwhile. With `refresh` the status texts are brought up to date before. Ends with the keeper.
 int try_target(const std::string& target, bool refresh);
 
 }  // namespace keeper

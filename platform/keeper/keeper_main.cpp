@@ -26,6 +26,7 @@
 #include "events/netlink.h"
 #include "keeper/attempt.h"
 #include "keeper/schedule.h"
+#include "keeper/tool_runs.h"
 #include "keeper/volumes.h"
 #include "tree_layout.h"
 
@@ -39,14 +40,34 @@ constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 
 constexpr Terms kInitiatorTerms = {.looks = 2, .lasting = Schedule::kLongestPause};
 // Whoever unmounts a volume to work on its disk has begun by then.
-constexpr Terms kVolumeTerms = {.looks = 10, .lasting = Schedule::kLongestPause, .once_there = true};
+constexpr Terms kVolumeTerms = {
+    .looks = 10, .lasting = Schedule::kLongestPause, .once_there = true, .taken_later = true};
+
+// What should be there, and the processes of the tries that are under way.
+struct Kept {
+  struct UnderWay {
+    pid_t process;
+    time_t since;
+    std::string name;
+  };
+
+  Schedule schedule;
+  std::vector<UnderWay> tries;
+
+  // One try after the other, but a long one, such as of a target that does not answer, holds up nobody.
+  bool is_trying(time_t now) const {
+    return std::any_of(tries.begin(), tries.end(),
+                       [now](const UnderWay& one) { return now - one.since < Schedule::kLongestPause; });
+  }
+  bool is_trying(const std::string& name) const {
+    return std::any_of(tries.begin(), tries.end(), [&name](const UnderWay& one) { return one.name == name; });
+  }
+};
 
 struct Keeper {
-  Schedule targets, volumes{kVolumeTerms};
+  Kept targets, volumes{Schedule(kVolumeTerms), {}};
   Schedule initiator{kInitiatorTerms};  // its daemon in place of a target
   int signals = -1, devices = -1;
-  pid_t target_try = -1, volume_try = -1;  // the processes of the tries under way
-  std::string tried_volume;
   bool first = true;  // no look yet: what is away now was taken down when the settings say so
 };
 
@@ -54,18 +75,6 @@ time_t now() {
   timespec time{};
   clock_gettime(CLOCK_MONOTONIC, &time);
   return time.tv_sec;
-}
-
-// Sessions go because somebody wants them to: this target's, or any.
-bool is_taken_down(const std::string& target = {}) {
-  return platform::runs(platform::kTool, {"--disconnect", "--system_off", "--deinit", "--del", "--modify"},
-                        target);
-}
-
-// One recovery may take over another.
-bool is_brought_up(const std::string& target) {
-  return platform::runs(platform::kTool, {"--oiscsi_evt_recover"}) ||
-         platform::runs(platform::kTool, {"--connect"}, target);
 }
 
 // Starts a program that goes on when this one ends. Returns its process, or -1.
@@ -80,9 +89,10 @@ pid_t start_program(std::initializer_list<const char*> words, const char* progra
 void tell(Schedule& schedule, const char* missing, const char* back) {
   std::string name;
   for (Change change; (change = schedule.next_change(name)) != Change::kNone;) {
-    const bool is_missing = change == Change::kMissing;
-    platform::report(is_missing ? LOG_WARNING : LOG_NOTICE, "remvol-keeper: %s %s", name.c_str(),
-                     is_missing ? missing : back);
+    const char* news = change == Change::kMissing ? missing : back;
+    if (change == Change::kLeft) news = "was unmounted by somebody who works on its disk, it stays so";
+    platform::report(change == Change::kBack ? LOG_NOTICE : LOG_WARNING, "remvol-keeper: %s %s", name.c_str(),
+                     news);
   }
 }
 
@@ -92,7 +102,7 @@ void tell(Schedule& schedule, const char* missing, const char* back) {
 void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
   std::vector<Wanted> wanted;
   if (tree_answers && !taken_down && !platform::runs(platform::kTool, {"--init"})) {
-    wanted.push_back({kInitiatorDaemon, platform::runs(kInitiatorDaemon), false, false});
+    wanted.push_back({kInitiatorDaemon, platform::runs(kInitiatorDaemon)});
   }
   daemon.initiator.look(wanted, now());
   tell(daemon.initiator, "is gone, starting another one", "is there again");
@@ -118,28 +128,36 @@ std::vector<Wanted> wanted_targets(const platform::TreeReader& tree,
   return wanted;
 }
 
-// Starts a try as a process of its own.
-pid_t start_try(const char* option, const std::string& name) {
-  return start_program({"remvol-keeper", option, name.c_str()}, "/proc/self/exe");
+// Starts the next try that is due as a process of its own.
+void try_next(Kept& kept, const char* first_option, const char* option) {
+  Try next;
+  if (kept.is_trying(now()) || !kept.schedule.next_try(next, now()) || kept.is_trying(next.name)) return;
+  const char* chosen = next.first ? first_option : option;
+  const pid_t process = start_program({"remvol-keeper", chosen, next.name.c_str()}, "/proc/self/exe");
+  if (process > 0) kept.tries.push_back({process, now(), next.name});
 }
 
 void try_what_is_due(Keeper& daemon) {
-  Try next;
-  if (daemon.target_try < 0 && daemon.targets.next_try(next, now())) {
-    daemon.target_try = start_try(next.first ? kTryFirst : kTry, next.name);
-  }
-  if (daemon.volume_try < 0 && daemon.volumes.next_try(next, now())) {
-    daemon.volume_try = start_try(kMount, next.name);
-    daemon.tried_volume = next.name;
-  }
+  try_next(daemon.targets, kTryFirst, kTry);
+  // A new daemon takes the sessions over, whose disks do not run meanwhile.
+  if (!daemon.initiator.anything_missing()) try_next(daemon.volumes, kMount, kMount);
+}
+
+// Returns the name of what the process has tried; empty when it is another one's.
+std::string end_of_try(Kept& kept, pid_t process) {
+  std::string name;
+  std::erase_if(kept.tries, [&name, process](const Kept::UnderWay& one) {
+    if (one.process == process) name = one.name;
+    return one.process == process;
+  });
+  return name;
 }
 
 // A volume that is not mounted although the tool has said 0 cannot be: it is left to a person.
-void end_try(Keeper& daemon, pid_t process, int status) {
-  if (process == daemon.target_try) daemon.target_try = -1;
-  if (process != daemon.volume_try) return;
-  daemon.volume_try = -1;
-  if (platform::exit_status(status) == 0) daemon.volumes.leave(daemon.tried_volume);
+void take_end(Keeper& daemon, pid_t process, int status) {
+  end_of_try(daemon.targets, process);
+  const std::string volume = end_of_try(daemon.volumes, process);
+  if (!volume.empty() && platform::exit_status(status) == 0) daemon.volumes.schedule.leave(volume);
 }
 
 void look(Keeper& daemon) {
@@ -147,13 +165,15 @@ void look(Keeper& daemon) {
   const platform::TreeReader tree;
   keep_initiator(daemon, tree.answered(), is_taken_down());
   if (!tree.answered()) return;
-  daemon.targets.look(wanted_targets(tree, sessions, daemon.first), now());
+  daemon.targets.schedule.look(wanted_targets(tree, sessions, daemon.first), now());
   daemon.first = false;
-  tell(daemon.targets, "should be connected and is not, it is tried until it is", "is connected again");
+  tell(daemon.targets.schedule, "should be connected and is not, it is tried until it is",
+       "is connected again");
   // The states that a try stores for a moment are no news.
-  if (daemon.volume_try >= 0) return;
-  daemon.volumes.look(wanted_volumes(tree, sessions), now());
-  tell(daemon.volumes, "was unmounted by somebody else, it is mounted as soon as it can be",
+  if (daemon.volumes.is_trying(now())) return;
+  daemon.volumes.schedule.look(wanted_volumes(tree, sessions), now());
+  tell(daemon.volumes.schedule,
+       "was unmounted by somebody else, it is mounted as soon as it can be unless its target is disconnected",
        "is mounted again");
 }
 
@@ -163,7 +183,7 @@ bool take_signals(Keeper& daemon) {
   signalfd_siginfo info;
   while (read(daemon.signals, &info, sizeof info) == sizeof info) ended = ended || info.ssi_signo != SIGCHLD;
   int status = 0;
-  for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) end_try(daemon, child, status);
+  for (pid_t child; (child = waitpid(-1, &status, WNOHANG)) > 0;) take_end(daemon, child, status);
   return !ended;
 }
 
@@ -171,8 +191,8 @@ bool take_signals(Keeper& daemon) {
 // still there.
 bool wait_for_look(Keeper& daemon) {
   static unsigned char buffer[1 << 14];
-  const bool hurry = daemon.targets.anything_missing() || daemon.volumes.anything_missing() ||
-                     daemon.initiator.anything_missing();
+  const bool hurry = daemon.targets.schedule.anything_missing() ||
+                     daemon.volumes.schedule.anything_missing() || daemon.initiator.anything_missing();
   const time_t due = now() + (hurry ? kHurry : kRest);
   for (bool session = false; !session && now() < due;) {
     pollfd inputs[] = {{daemon.signals, POLLIN, 0}, {daemon.devices, POLLIN, 0}};

@@ -35,9 +35,15 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) c
     target.absent = 0;
     return;
   }
-  // Only a target that loses its session while somebody is at it is meant.
-  if (target.absent == 0 && wanted.is_taken) target.taken = true;
-  if (target.taken || target.missing) return;
+  if (target.taken) return;
+  // Of targets only one that loses its session while somebody is at it is meant.
+  if (wanted.is_taken && (target.absent == 0 || terms_.taken_later)) {
+    target.taken = true;
+    target.missing = false;
+    target.tell = terms_.taken_later;
+    return;
+  }
+  if (target.missing) return;
   if (++target.absent < (wanted.at_work ? kLooksAtWork : terms_.looks)) return;
   target.missing = target.tell = true;
 }
@@ -57,6 +63,7 @@ Change Schedule::next_change(std::string& name) {
     if (!target.tell) continue;
     target.tell = false;
     name = target.name;
+    if (target.taken) return Change::kLeft;
     return target.missing ? Change::kMissing : Change::kBack;
   }
   return Change::kNone;

@@ -13,9 +13,10 @@ namespace keeper {
 // mounted.
 struct Wanted {
   std::string name;
-  bool connected;  // it has a session, working or not; or it is mounted
-  bool is_taken;   // when it is not there: somebody takes it away on purpose
-  bool at_work;    // when it is not there: a recovery or a connection is under way, perhaps this target's
+  bool connected;         // it has a session, working or not; or it is mounted
+  bool is_taken = false;  // when it is not there: somebody takes it away on purpose
+  bool at_work =
+      false;  // when it is not there: a recovery or a connection is under way, perhaps this target's
 };
 
 struct Try {
@@ -23,7 +24,7 @@ struct Try {
   bool first;  // since it went missing
 };
 
-enum class Change { kNone, kMissing, kBack };
+enum class Change { kNone, kMissing, kLeft, kBack };
 
 struct Terms {
   // It is missing when it stays away for that many looks: a recovery logs out and in again.
@@ -33,6 +34,8 @@ struct Terms {
   time_t lasting = 0;
   // What has not been there since it was first looked for is not missing.
   bool once_there = false;
+  // Somebody may take it away on purpose at any time until it is back, and not only as it goes. That is told.
+  bool taken_later = false;
 };
 
 class Schedule {
@@ -43,7 +46,8 @@ class Schedule {
   // no longer wanted is forgotten.
   void look(const std::vector<Wanted>& wanted, time_t now);
 
-  // Takes a change that is to be told: a target is missing, or is back. Returns kNone when there is none.
+  // Takes a change that is to be told: a target is missing, is left to somebody, or is back. Returns kNone
+  // when there is none.
   Change next_change(std::string& target);
 
   // Takes a target that is to be tried now; the next try comes later, up to kLongestPause seconds.

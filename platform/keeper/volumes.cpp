@@ -1,12 +1,9 @@
 #include "keeper/volumes.h"
 
 #include <fcntl.h>
-#include <sys/prctl.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <csignal>
 #include <string_view>
 
 #include "common/fd.h"
@@ -14,6 +11,7 @@
 #include "common/processes.h"
 #include "common/program.h"
 #include "keeper/attempt.h"
+#include "keeper/tool_runs.h"
 #include "sysaux.h"
 #include "tree_layout.h"
 
@@ -23,19 +21,6 @@ namespace {
 using platform::Session;
 using platform::TreeReader;
 using namespace remvol;
-
-// A run that may unmount volumes of the target because somebody wants it to.
-bool is_unmounting(const std::string& target) {
-  return platform::runs(platform::kTool,
-                        {"--disconnect", "--system_off", "--deinit", "--del", "--del_lun", "--format",
-                         "--modify", "--modify_address"},
-                        target);
-}
-
-// A run that may mount them.
-bool is_mounting(const std::string& target) {
-  return platform::runs(platform::kTool, {"--oiscsi_evt_recover", "--connect", "--add", "--init"}, target);
-}
 
 // A volume that stands in the settings.
 struct Volume {
@@ -110,8 +95,8 @@ bool is_free(const std::string& disk) {
 }
 
 // Whether the disk can be mounted from: nobody has it for himself, as who checks a file system does, nor
-// open; and the partition that the tool takes shows something, which does not say that it wants a check. That
-// it says also while another machine has it mounted.
+// open; and the partition that the tool takes shows something, which does not say that it wants a check. An
+// ext file system says so also while another machine has it mounted.
 bool is_ready(const std::string& disk, const std::vector<std::string>& partitions) {
   char content[16];
   if (!is_free(disk) || platform::has_open(disk)) return false;
@@ -121,12 +106,17 @@ bool is_ready(const std::string& disk, const std::vector<std::string>& partition
   return first != partitions.end() && sys_check_fs_state(first->c_str()) == 0;
 }
 
-// Whether the volume is mounted, or would be by a connection, and no more would happen to it.
-bool is_safe(const TreeReader& tree, const Session& session, const Volume& volume) {
+// The volume's disk, such as /dev/sdb; empty when none runs.
+std::string disk_of(const TreeReader& tree, const Session& session, const Volume& volume) {
   const int lun = tree.number(-1, key::kLunNumber, volume.target, volume.lun);
   const std::string name = platform::running_disk(session, lun);
-  if (name.empty()) return false;
-  const std::string disk = "/dev/" + name;
+  return name.empty() ? name : "/dev/" + name;
+}
+
+// Whether the volume is mounted, or would be by a connection, and no more would happen to it.
+bool is_safe(const TreeReader& tree, const Session& session, const Volume& volume) {
+  const std::string disk = disk_of(tree, session, volume);
+  if (disk.empty()) return false;
   const std::vector<std::string> partitions = partitions_of(disk);
   const std::vector<platform::Mount> mounts = platform::read_mounts();
   if (is_mounted_from(mounts, volume, partitions)) return true;
@@ -140,6 +130,13 @@ bool can_connect(const TreeReader& tree, int target) {
   return session != nullptr && std::all_of(volumes.begin(), volumes.end(), [&](const Volume& volume) {
            return is_safe(tree, *session, volume);
          });
+}
+
+// Whether somebody works on the disk of a volume that is not mounted. The tool looks at it for its texts, and
+// udev whenever something happens to it.
+bool has_stranger(const std::string& disk) {
+  return !disk.empty() &&
+         platform::has_open(disk, {platform::kTool, "remvol-keeper", "(udev-worker)", "systemd-udevd"});
 }
 
 // The slot of the target that has a volume of that share; 0 when there is none.
@@ -158,25 +155,29 @@ std::vector<Wanted> wanted_volumes(const TreeReader& tree, const std::vector<Ses
   const std::vector<platform::Mount> mounts = platform::read_mounts();
   std::vector<Wanted> wanted;
   for (int target = 1; target <= kMaxTargets; target++) {
-    if (session_of(tree, target, sessions) == nullptr) continue;
+    const Session* session = session_of(tree, target, sessions);
+    if (session == nullptr) continue;
     const std::string name = tree.value(key::kTargetName, target);
     for (const Volume& volume : volumes_of(tree, target)) {
-      const bool mounted = is_mounted(mounts, volume);
-      if (!is_normal(tree, volume) || (!mounted && is_unmounting(name))) continue;
-      wanted.push_back({volume.share, mounted, false, !mounted && is_mounting(name)});
+      Wanted one = {.name = volume.share, .connected = is_mounted(mounts, volume)};
+      if (!is_normal(tree, volume) || (!one.connected && is_unmounting(name))) continue;
+      if (!one.connected) {
+        one.at_work = is_brought_up(name);
+        one.is_taken = !one.at_work && has_stranger(disk_of(tree, *session, volume));
+      }
+      wanted.push_back(one);
     }
   }
   return wanted;
 }
 
 int mount_again(const std::string& share) {
-  const pid_t keeper = getppid();
-  if (prctl(PR_SET_PDEATHSIG, SIGTERM) != 0 || getppid() != keeper || keeper == 1) return 1;
+  if (!end_with_keeper()) return 1;
   const TreeReader tree;
   const int target = target_of(tree, share);
   if (target == 0) return 1;
   const std::string name = tree.value(key::kTargetName, target);
-  if (!can_connect(tree, target) || is_unmounting(name) || is_mounting(name)) return 1;
+  if (!can_connect(tree, target) || is_unmounting(name) || is_brought_up(name)) return 1;
   return run_silently({"--connect", "-n", name.c_str()});
 }
 

@@ -41,13 +41,17 @@ class Keeper:
         return [tuple(call) for call in self.box.runs("remvol")]
 
 
-def at_work(box, *words, seconds=1000):
-    """A run of the tool that takes its time; returns when it is seen."""
-    tool = "/tmp/bin/remvol"
-    box.write(tool, f"#!/bin/sh\nsleep {seconds}\n").chmod(0o755)
-    run = box.start([tool, *words], env={"LD_PRELOAD": None})
-    box.wait_until(lambda: [tool, *words] in [process[1:] for process in box.processes().values()], what="the run")
+def lives(box, name, *words, seconds=1000, under=()):
+    """A process of that name that takes its time; returns when it is seen."""
+    program = f"/tmp/bin/{name}"
+    box.write(program, f"#!/bin/sh\nsleep {seconds}\n").chmod(0o755)
+    run = box.start([*under, program, *words], env={"LD_PRELOAD": None})
+    box.wait_until(lambda: ["/bin/sh", program, *words] in box.processes().values(), what=name)
     return run
+
+
+def at_work(box, *words, **how):
+    return lives(box, "remvol", *words, **how)
 
 
 @pytest.fixture
@@ -106,6 +110,44 @@ def test_only_a_command_for_the_target_keeps_it_away(keeper, named):
         assert run.result is None and keeper.runs == []
 
 
+@pytest.mark.parametrize("meanwhile", [
+    "{build}/bin/ktreec -S /var/run/ktree_sock_vv -s /iscsi/initiator/id:1/conn_set 0",
+    "mkdir -p {session}; echo iqn.t1 >{session}/targetname",
+], ids=["disconnected", "connected"])
+def test_what_happens_to_a_target_during_a_try_holds(keeper, meanwhile):
+    box = keeper.box
+    keeper.target(1, port=3260)
+    listen(box)
+    box.fake("remvol", "--status", effect=meanwhile.format(build=box.build, session=f"{SESSIONS}/session1"), times=1)
+    keeper.start()
+    keeper.wait_runs(("--status",))
+    wait(box, 5)
+    assert keeper.runs == [("--status",)]
+
+
+def test_a_try_of_a_target_ends_with_the_keeper(keeper):
+    keeper.target(1, port=3260)
+    listen(keeper.box)
+    keeper.box.fake("remvol", "--status", delay=3)
+    keeper.start()
+    keeper.wait_runs(("--status",))
+    keeper.daemon.kill(signal.SIGKILL)
+    keeper.daemon.wait()
+    keeper.daemon = None
+    wait(keeper.box, 5)
+    assert keeper.runs == [("--status",)]
+
+
+def test_a_try_that_does_not_end_holds_up_no_other_target(keeper):
+    for number in (1, 2):
+        keeper.target(number, port=3260)
+    listen(keeper.box)
+    keeper.box.fake("remvol", "--connect -n iqn.t1", delay=1000)
+    keeper.start()
+    keeper.box.wait_until(lambda: ("--connect", "-n", "iqn.t2") in keeper.runs, timeout=120, what="the other target")
+    assert keeper.runs.count(("--connect", "-n", "iqn.t1")) == 1
+
+
 def test_volumes_of_a_lost_session_are_recovered(keeper):
     box = keeper.box
     keeper.target(1, port=3260)
@@ -139,11 +181,13 @@ def volume(keeper, slot, disk, share, **values):
     box.hook("sys_get_partition_list", f"/dev/{disk}", ret=1, out=f"{disk}1")
 
 
-def photos(keeper, **values):
+def photos(keeper, initiator=True, **values):
     """Two volumes that are mounted, and that the keeper has seen."""
     box = keeper.box
     keeper.target(1, state=1)
     keeper.session(1)
+    if initiator:
+        lives(box, "iscsid")
     volume(keeper, 1, "sdb", "Photos", **values)
     volume(keeper, 2, "sdc", "Music")
     keeper.start()
@@ -169,7 +213,8 @@ def unmount(box, share="Photos"):
 
 
 # A volume is missed after ten looks.
-MISSED = "Photos was unmounted by somebody else, it is mounted as soon as it can be"
+MISSED = "Photos was unmounted by somebody else, it is mounted as soon as it can be unless its target is disconnected"
+LEFT = "Photos was unmounted by somebody who works on its disk, it stays so"
 MISSED_SOON, LONG_ENOUGH = 30, 13
 
 
@@ -214,6 +259,19 @@ def not_partitioned(box):
     unmount(box, "Music")
 
 
+def test_a_volume_waits_for_the_initiator(keeper):
+    """A new one takes the sessions over, and their disks do not run meanwhile."""
+    iscsid = lives(keeper.box, "iscsid")
+    box = photos(keeper, initiator=False)
+    iscsid.kill()
+    unmount(box)
+    wait_missed(keeper)
+    wait(box, 4)
+    assert keeper.runs == []
+    lives(box, "iscsid")
+    keeper.wait_runs(CONNECT)
+
+
 def a_second_session(box):
     box.write(f"{SESSIONS}/session2/targetname", "iqn.t1\n")
     box.write(f"{SESSIONS}/session2/state", "LOGGED_IN\n")
@@ -245,16 +303,58 @@ def test_a_volume_waits_while_a_connection_could_harm_another_one_of_its_target(
     assert keeper.runs == []
 
 
+@pytest.mark.parametrize("late", [False, True], ids=["soon", "when it is missed"])
 @pytest.mark.parametrize("use", ["'/dev/sdb', os.O_RDONLY | os.O_EXCL", "'/dev/sdb1', os.O_WRONLY"], ids=["exclusive", "writing"])
-def test_a_volume_whose_disk_somebody_uses_waits(keeper, use):
+def test_a_volume_on_whose_disk_somebody_works_is_left_to_him(keeper, use, late):
+    """Also between his steps, and after the last one."""
     box = photos(keeper)
+    if late:
+        box.hook("sys_check_fs_state", "/dev/sdb1", ret=1)
     unmount(box)
-    worker = box.start(["/usr/bin/python3", "-c", f"import os,time\nos.open({use})\ntime.sleep(1000)"], env={"LD_PRELOAD": None})
+    if late:
+        wait_missed(keeper)
+    work = f"import os,time\nos.open({use})\ntime.sleep(3)"
+    assert box.run(["/usr/bin/python3", "-c", work], env={"LD_PRELOAD": None}).status == 0
+    box.hook("sys_check_fs_state", "/dev/sdb1", ret=0, first=True)
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == [] and keeper.daemon.stderr.count(LEFT) == 1
+    mount(box, "Photos")
+    wait(box, 3)
+    unmount(box)
+    keeper.wait_runs(CONNECT)
+
+
+@pytest.mark.parametrize("name", ["remvol", "(udev-worker)", "systemd-udevd"])
+def test_whoever_only_looks_at_a_disk_does_not_work_on_it(keeper, name):
+    box = photos(keeper)
+    script = f"import os,time\nopen('/proc/self/comm', 'w').write('{name}')\nos.open('/dev/sdb1', os.O_RDONLY)\ntime.sleep(3)"
+    unmount(box)
+    assert box.run(["/usr/bin/python3", "-c", script], env={"LD_PRELOAD": None}).status == 0
+    keeper.wait_runs(CONNECT)
+    assert LEFT not in keeper.daemon.stderr
+
+
+def test_a_volume_whose_disk_is_mounted_elsewhere_waits(keeper):
+    box = photos(keeper)
+    subprocess.run(["mke2fs", "-q", "-F", box.path("/dev/sdb")], check=True)
+    box.path("/srv/work").mkdir(parents=True)
+    unmount(box)
+    done = box.run(["/bin/mount", "-t", "ext4", "/dev/sdb", "/srv/work"], env={"LD_PRELOAD": None})
+    assert done.status == 0, done.stderr
     wait_missed(keeper)
     wait(box, 4)
     assert keeper.runs == []
-    worker.kill(signal.SIGKILL)
+    assert box.run(["/bin/umount", "/srv/work"], env={"LD_PRELOAD": None}).status == 0
     keeper.wait_runs(CONNECT)
+
+
+def test_a_volume_whose_disk_is_below_a_loop_device_is_left_alone(keeper):
+    box = photos(keeper)
+    box.write("/sys/class/block/loop7/loop/backing_file", "/dev/sdb1\n")
+    box.write("/sys/class/block/sdb/size", "1\n")
+    unmount(box)
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == [] and LEFT in keeper.daemon.stderr
 
 
 @pytest.mark.parametrize("values", [{"enable": 0}, {"volume_state": 3}, {"format_state": 1}], ids=["off", "failed", "formatted"])
@@ -318,7 +418,7 @@ def test_a_volume_that_the_tool_did_not_mount_is_left_to_a_person(keeper):
     wait(box, 5)
     assert keeper.runs == [CONNECT]
     mount(box, "Photos")
-    wait(box, 3)
+    box.wait_until(lambda: "Photos is mounted again" in keeper.daemon.stderr, what="its being told")
     unmount(box)
     keeper.wait_runs(CONNECT, CONNECT)
 
@@ -348,6 +448,13 @@ def test_the_initiator_is_started_when_it_is_gone(keeper):
     keeper.start()
     keeper.box.wait_until(lambda: keeper.box.runs("iscsid"), what="iscsid being started")
     assert list(keeper.box.runs("iscsid")[0]) == ["-f"]
+
+
+def test_the_initiator_of_a_container_is_not_this_machines(keeper):
+    box = keeper.box
+    lives(box, "iscsid", under=["/usr/bin/unshare", "--pid", "--fork"])
+    keeper.start()
+    box.wait_until(lambda: box.runs("iscsid"), what="iscsid being started")
 
 
 def test_an_initiator_that_dies_again_and_again_is_told_of_once(keeper):

@@ -195,6 +195,30 @@ TEST_F(KeeperSchedule, WhatIsLeftIsTriedAgainOnlyWhenItWasThere) {
   EXPECT_FALSE(tries(5).empty());
 }
 
+TEST_F(KeeperSchedule, WhatSomebodyWorksOnLaterIsLeftToHim) {
+  schedule_ = Schedule({.once_there = true, .taken_later = true});
+  look(kConnected);
+  look(kAbsent);
+  look(kAbsent, kTaken);
+  EXPECT_EQ(change(), Change::kLeft);
+  for (int i = 0; i < 10; i++) look(kAbsent);
+  EXPECT_EQ(change(), Change::kNone);
+  EXPECT_FALSE(schedule_.anything_missing());
+  look(kConnected);
+  EXPECT_EQ(change(), Change::kNone);
+  lose();
+  EXPECT_EQ(change(), Change::kMissing);
+  look(kAbsent, kTaken);
+  EXPECT_EQ(change(), Change::kLeft);
+  EXPECT_EQ(tries(100), std::vector<long>{});
+}
+
+TEST_F(KeeperSchedule, WhatWasNotThereYetIsNotSaidToBeLeft) {
+  schedule_ = Schedule({.once_there = true, .taken_later = true});
+  look(kAbsent, kTaken);
+  EXPECT_EQ(change(), Change::kNone);
+}
+
 TEST_F(KeeperSchedule, WhatWasForgottenHasToBeThereOnce) {
   schedule_ = Schedule({.once_there = true});
   lose();
