@@ -15,6 +15,9 @@ inline constexpr char kLockFormat[] = "%s-%016llx.lock";
 inline constexpr char kTargetLock[] = "target";
 inline constexpr char kLunLock[] = "lun-%d";
 
+// Whoever uses the numbers of the tree's slots has it locked shared, and who adds or deletes slots alone.
+inline constexpr char kSlotsLock[] = "slots.lock";
+
 // The run that recovers has a record lock on it (fcntl(2), F_WRLCK).
 inline constexpr char kRecoverLock[] = "/var/lock/virtual_volume/remvol_recover.lock";
 

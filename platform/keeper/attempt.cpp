@@ -18,12 +18,13 @@
 #include "common/sessions.h"
 #include "common/tree_reader.h"
 #include "keeper/tool_runs.h"
+#include "keeper/wish.h"
 #include "tree_layout.h"
 
 namespace keeper {
 namespace {
 
-constexpr int kPatience = 3000;  // milliseconds
+constexpr int kPatience = 3000, kTakerPause = 200;  // milliseconds
 constexpr const char* kPorts[] = {"egiga0", "egiga1", "bond0"};
 
 bool accepts(const addrinfo& address) {
@@ -79,6 +80,18 @@ bool has_mounted(const Stored& stored) {
   });
 }
 
+pid_t start_silently(std::vector<const char*> arguments) {
+  arguments.insert(arguments.begin(), platform::kTool);
+  arguments.push_back(nullptr);
+  const platform::Streams silent = {STDIN_FILENO, platform::kNowhere, platform::kNowhere};
+  return platform::start(platform::kTool, arguments.data(), silent);
+}
+
+int result_of(pid_t process) {
+  const int status = process > 0 ? platform::exit_status(platform::end_of(process)) : -1;
+  return status >= 0 ? status : 1;
+}
+
 // Looked up again behind all that takes its time.
 bool is_still_missing(const std::string& target) {
   Stored stored;
@@ -95,13 +108,14 @@ bool end_with_keeper() {
   return prctl(PR_SET_PDEATHSIG, SIGTERM) == 0 && getppid() == keeper && keeper != 1;
 }
 
-int run_silently(std::vector<const char*> arguments) {
-  arguments.insert(arguments.begin(), platform::kTool);
-  arguments.push_back(nullptr);
-  const platform::Streams silent = {STDIN_FILENO, platform::kNowhere, platform::kNowhere};
-  const pid_t process = platform::start(platform::kTool, arguments.data(), silent);
-  const int status = process > 0 ? platform::exit_status(platform::end_of(process)) : -1;
-  return status >= 0 ? status : 1;
+int bring_up(const char* option, const std::string& target) {
+  const pid_t process = start_silently({option, "-n", target.c_str()});
+  bool is_taken = is_taken_down(target);
+  while (process > 0 && !platform::ends_within(process, kTakerPause))
+    is_taken = is_taken || is_taken_down(target);
+  const int result = result_of(process);
+  if (result != 0 && !is_taken && !is_taken_down(target)) want_again(target, remvol::kVolumeFailed);
+  return result;
 }
 
 bool portal_answers(const std::string& address, const std::string& port) {
@@ -124,10 +138,10 @@ int try_target(const std::string& target, bool refresh) {
   if (!end_with_keeper() || !read_stored(target, stored)) return 1;
   const bool mounted = has_mounted(stored);
   // Says "Reconnecting", which is also what a recovery wants to find.
-  if (mounted) run_silently({"--oiscsi_evt_reopen", "-n", target.c_str()});
-  if (refresh) run_silently({"--status"});
+  if (mounted) (void)result_of(start_silently({"--oiscsi_evt_reopen", "-n", target.c_str()}));
+  if (refresh) (void)result_of(start_silently({"--status"}));
   if (!portal_answers(stored.address, stored.port) || !is_still_missing(target)) return 1;
-  return run_silently({mounted ? "--oiscsi_evt_recover" : "--connect", "-n", target.c_str()});
+  return bring_up(mounted ? "--oiscsi_evt_recover" : "--connect", target);
 }
 
 }  // namespace keeper

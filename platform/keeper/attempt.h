@@ -3,13 +3,13 @@
 #define PLATFORM_KEEPER_ATTEMPT_H
 
 #include <string>
-#include <vector>
 
 namespace keeper {
 
-// Runs the tool silently: that something is missing has been told, and whoever gives the command by hand is
-// told why it failed. Returns the exit status, 1 when there is none.
-int run_silently(std::vector<const char*> arguments);
+// Has the tool connect or recover the target, silently: that something is missing has been told, and whoever
+// gives the command by hand is told why it failed. A target that it gives up, since its session shows no
+// disk, stays wanted, unless somebody takes it down meanwhile. Returns the exit status, 1 when there is none.
+int bring_up(const char* option, const std::string& target);
 
 // Has the calling process end with the one that started it, the keeper; a run of the tool that has begun goes
 // on. Returns false when the keeper has ended already.

@@ -28,6 +28,7 @@
 #include "keeper/schedule.h"
 #include "keeper/tool_runs.h"
 #include "keeper/volumes.h"
+#include "keeper/wish.h"
 #include "tree_layout.h"
 
 namespace keeper {
@@ -110,18 +111,19 @@ void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
   if (daemon.initiator.next_try(next, now())) start_program({kInitiatorDaemon, "-f"}, kInitiatorDaemon);
 }
 
-std::vector<Wanted> wanted_targets(const platform::TreeReader& tree,
-                                   const std::vector<platform::Session>& sessions, bool first) {
+std::vector<Wanted> wanted_targets(const Keeper& daemon, const platform::TreeReader& tree,
+                                   const std::vector<platform::Session>& sessions) {
   std::vector<Wanted> wanted;
   for (int n = 1; n <= remvol::kMaxTargets; n++) {
     const std::string name = tree.value(remvol::key::kTargetName, n);
     if (name.empty()) break;
-    if (tree.number(0, remvol::key::kTargetConnSet, n) == 0) continue;
+    // A try that meets no disk takes the wish back for a moment.
+    if (tree.number(0, remvol::key::kTargetConnSet, n) == 0 && !daemon.targets.is_trying(name)) continue;
     const bool connected =
         std::any_of(sessions.begin(), sessions.end(),
                     [&name](const platform::Session& session) { return session.target == name; });
-    const bool was_taken = first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState, n) ==
-                                        remvol::kDisconnected;
+    const bool was_taken = daemon.first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState,
+                                                       n) == remvol::kDisconnected;
     const bool is_taken = !connected && (was_taken || is_taken_down(name));
     wanted.push_back({name, connected, is_taken, !connected && is_brought_up(name)});
   }
@@ -161,11 +163,12 @@ void take_end(Keeper& daemon, pid_t process, int status) {
 }
 
 void look(Keeper& daemon) {
+  if (daemon.first) want_again({}, remvol::kVolumeLost);
   const std::vector<platform::Session> sessions = platform::read_sessions();
   const platform::TreeReader tree;
   keep_initiator(daemon, tree.answered(), is_taken_down());
   if (!tree.answered()) return;
-  daemon.targets.schedule.look(wanted_targets(tree, sessions, daemon.first), now());
+  daemon.targets.schedule.look(wanted_targets(daemon, tree, sessions), now());
   daemon.first = false;
   tell(daemon.targets.schedule, "should be connected and is not, it is tried until it is",
        "is connected again");

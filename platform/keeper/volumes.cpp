@@ -178,7 +178,7 @@ int mount_again(const std::string& share) {
   if (target == 0) return 1;
   const std::string name = tree.value(key::kTargetName, target);
   if (!can_connect(tree, target) || is_unmounting(name) || is_brought_up(name)) return 1;
-  return run_silently({"--connect", "-n", name.c_str()});
+  return bring_up("--connect", name);
 }
 
 }  // namespace keeper

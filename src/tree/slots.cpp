@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "frontend/log.h"
+#include "run_files.h"
 #include "support/run_lock.h"
 #include "support/text.h"
 #include "tree/slot_reads.h"
@@ -14,7 +15,6 @@ namespace remvol {
 
 namespace {
 
-constexpr char kSlotsLock[] = "slots.lock";
 constexpr int kNoLun = -1;
 constexpr int kGone = INT_MIN;  // not 0, which an entry without a slot has
 

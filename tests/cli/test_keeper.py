@@ -7,6 +7,9 @@ import pytest
 from harness.initiator import store
 
 SESSIONS = "/sys/class/iscsi_session"
+VOLUME = "/iscsi/initiator/id:1/lun/id:{}"
+SET = "{}/bin/ktreec -S /var/run/ktree_sock_vv -s /iscsi/initiator/id:1"
+CONNECT = ("--connect", "-n", "iqn.t1")
 
 
 class Keeper:
@@ -111,7 +114,7 @@ def test_only_a_command_for_the_target_keeps_it_away(keeper, named):
 
 
 @pytest.mark.parametrize("meanwhile", [
-    "{build}/bin/ktreec -S /var/run/ktree_sock_vv -s /iscsi/initiator/id:1/conn_set 0",
+    SET.format("{build}") + "/conn_set 0",
     "mkdir -p {session}; echo iqn.t1 >{session}/targetname",
 ], ids=["disconnected", "connected"])
 def test_what_happens_to_a_target_during_a_try_holds(keeper, meanwhile):
@@ -123,6 +126,62 @@ def test_what_happens_to_a_target_during_a_try_holds(keeper, meanwhile):
     keeper.wait_runs(("--status",))
     wait(box, 5)
     assert keeper.runs == [("--status",)]
+
+
+def gives_up(box, state, more=":"):
+    """What the tool stores, and says, when a session shows no disk."""
+    store = SET.format(box.build)
+    return f"{store}/conn_set 0; {store}/conn_state 0; {store}/lun/id:1/volume_state {state}; {more}; exit 255"
+
+
+def wish(box):
+    return [box.tree.get(f"/iscsi/initiator/id:1/{key}") for key in ("conn_set", "conn_state", "lun/id:1/volume_state")]
+
+
+def test_a_target_whose_disks_are_late_is_tried_until_they_are_there(keeper):
+    """Its portal answers before its LUNs are there, as when storage comes up after a power failure."""
+    box = keeper.box
+    keeper.target(1, port=3260)
+    listen(box)
+    box.fake("remvol", "--connect", effect=gives_up(box, 3), status=255)
+    keeper.start()
+    keeper.wait_runs(("--status",), CONNECT, CONNECT, CONNECT)
+    box.wait_until(lambda: wish(box) == ["1", "4", "2"], what="the wish")
+    assert keeper.daemon.stderr.count("iqn.t1 should be connected and is not") == 1
+
+
+def test_a_target_that_was_given_up_at_start_up_is_tried(keeper):
+    box = keeper.box
+    keeper.target(1, port=3260, state=0, wanted=0)
+    box.tree.set({f"{VOLUME.format(1)}/volume_state": 4})
+    listen(box)
+    keeper.start()
+    keeper.wait_runs(("--status",), CONNECT)
+    assert wish(box) == ["1", "4", "2"]
+
+
+def test_a_target_that_is_disconnected_while_a_try_fails_stays_so(keeper):
+    box = keeper.box
+    keeper.target(1, port=3260)
+    listen(box)
+    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 2\n").chmod(0o755)
+    box.fake("remvol", "--connect", effect=gives_up(box, 3, "/tmp/bin/remvol --disconnect -n iqn.t1; sleep 2"), status=255)
+    keeper.start()
+    keeper.wait_runs(("--status",), CONNECT)
+    wait(box, LONG_ENOUGH)
+    assert keeper.runs == [("--status",), CONNECT] and wish(box) == ["0", "0", "3"]
+
+
+@pytest.mark.parametrize("values", [{"state": 0, "wanted": 0}, {"state": 0, "wanted": 0, "volume": 3}], ids=["plain", "failed"])
+def test_a_disconnected_target_stays_disconnected(keeper, values):
+    box = keeper.box
+    volume_state = values.pop("volume", 0)
+    keeper.target(1, port=3260, **values)
+    box.tree.set({f"{VOLUME.format(1)}/volume_state": volume_state})
+    listen(box)
+    keeper.start()
+    wait(box, 6)
+    assert keeper.runs == [] and wish(box) == ["0", "0", str(volume_state)]
 
 
 def test_a_try_of_a_target_ends_with_the_keeper(keeper):
@@ -160,8 +219,6 @@ def test_volumes_of_a_lost_session_are_recovered(keeper):
     keeper.wait_runs(("--oiscsi_evt_reopen", "-n", "iqn.t1"), ("--status",), ("--oiscsi_evt_recover", "-n", "iqn.t1"))
 
 
-VOLUME = "/iscsi/initiator/id:1/lun/id:{}"
-CONNECT = ("--connect", "-n", "iqn.t1")
 
 
 def volume(keeper, slot, disk, share, **values):
