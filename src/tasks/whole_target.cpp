@@ -124,7 +124,7 @@ int log_out_all() {
 }
 
 void log_out_if_deleted(TargetEntry* entry) {
-  if (!HeldSlot(entry->db_idx) && unloaded_settings() == nullptr) (void)Target_Logout(entry);
+  if (unloaded_settings() == nullptr && !HeldSlot(entry->db_idx)) (void)Target_Logout(entry);
 }
 
 void give_up_session(TargetEntry* entry, int reason, VolumeState state) {

@@ -739,6 +739,14 @@ class TestATreeThatIsStartedAnew:
         box.run(["sh", "-c", f"ktreec -S /var/run/ktree_sock_vv -s {INITIATOR}/ver 1; "
                              "ktreec -S /var/run/ktree_sock_vv -D /etc/NAS_CFG/vv.xml"])
 
+    def test_a_target_that_is_loaded_between_two_looks_keeps_its_session(self, stored, box):
+        self.save(box)
+        box.hook("system", SHARES, through=True, effect=f"{self.ANEW}; touch /root/anew", times=1)
+        box.hook("ktreec_get_wb", f"{INITIATOR}/ver", through=True,
+                 effect="[ ! -e /root/anew ] || ktreec -S /var/run/ktree_sock_vv -l /etc/NAS_CFG/vv.xml")
+        box.remvol("--connect", "-n", "iqn.t1")
+        assert box.path("/root/anew").exists() and stored.logged_in("iqn.t1")
+
     @pytest.fixture
     def offered(self, site, box):
         site.offer("iqn.t1", {0: "sdb"})
