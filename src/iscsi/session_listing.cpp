@@ -158,7 +158,7 @@ bool read_discovered_name(const char* line, char (&name)[kListingLineSize]) {
 }
 
 bool discovery_line_offers(const char* line, const char* name, const char* address, int port) {
-  return is_discovery_line_of(line, address) && strstr(line, Text<16>(":%d,", port)) != nullptr &&
+  return is_discovery_line_of(line, address) && strstr(line, NumberText(":%d,", port)) != nullptr &&
          strstr(line, name) != nullptr;
 }
 

@@ -7,15 +7,19 @@
 #include "iscsi/node.h"
 #include "iscsi/session.h"
 #include "iscsi/target_status.h"
+#include "support/command.h"
+#include "support/files.h"
 #include "support/result.h"
 #include "support/session_hold.h"
 #include "support/target_hold.h"
+#include "support/text.h"
 #include "sysaux.h"
 #include "tree/entry.h"
 #include "tree/lun_walk.h"
 #include "tree/settings_file.h"
 #include "tree/slots.h"
 #include "tree/state.h"
+#include "volume/disk_identity.h"
 #include "volume/mount.h"
 #include "volume/mount_point.h"
 #include "volume/session_volumes.h"
@@ -28,6 +32,8 @@ namespace {
 
 // At start-up no target is asked for.
 constexpr char kNoRequest[] = "";
+
+constexpr const char* kSessions = "/sys/class/iscsi_session";
 
 // After so long without its target (replacement_timeout of the daemon's settings) the kernel gives a disk up.
 constexpr int kTakeOverSeconds = 30;
@@ -113,12 +119,19 @@ int Target_Logout(TargetEntry* entry) {
 }
 
 int log_out_all() {
-  if (!is_session_used_by_others()) return close_sessions(nullptr, logout_all_command());
   const SessionClosing closing(nullptr);
-  int result = kFailed;
-  for (int n = 1; n <= kMaxTargets; n++) {
-    TargetEntry entry;
-    if (is_target_stored(n) && ktree_get_entry_by_dbidx(n, &entry) == kOk) result = log_out(&entry);
+  if (!unmount_session_volumes(nullptr)) return 1;
+  if (!is_session_used(nullptr)) return run_command(logout_all_command()) == 0 ? 0 : 1;
+  const Directory sessions(opendir(kSessions));
+  int result = sessions ? 0 : 1;
+  while (const dirent* session = sessions ? readdir(sessions.get()) : nullptr) {
+    TargetEntry entry = {};
+    const PathText name("%s/%s/%s", kSessions, session->d_name, "targetname");
+    if (!read_session_name(name, entry.target_name)) continue;
+    const bool failed = is_session_used(entry.target_name)
+                            ? ktree_get_dbidx_by_targetname(entry.target_name) >= 1
+                            : run_command(logout_command(entry)) != 0;
+    if (failed) result = 1;
   }
   return result;
 }

@@ -11,8 +11,9 @@ namespace remvol {
 // command failed.
 [[nodiscard]] int Target_Logout(TargetEntry* entry);
 
-// Logs out of all targets, whosever they are; where somebody else uses the disk of one, of the stored targets
-// alone. Returns 0; 1 when the last command failed, or there was nothing to log out of.
+// Logs out of all targets, whosever they are, but of those with a disk that is in use by then, once all
+// volumes are unmounted. Returns 0; 1 when a command failed, a volume or the session of a stored target
+// stays, or there was nothing to log out of.
 [[nodiscard]] int log_out_all();
 
 // Logs out a target that was deleted while this run brought it up: the run that deleted it may have found no

@@ -16,7 +16,7 @@ namespace remvol {
 
 namespace {
 
-constexpr char kBlockDir[] = "/sys/block";
+constexpr const char* kBlockDir = "/sys/block";
 constexpr char kNodeDir[] = "/dev";
 constexpr mode_t kNodeMode = S_IFBLK | 0666;
 

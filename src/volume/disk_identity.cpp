@@ -1,5 +1,6 @@
 #include "volume/disk_identity.h"
 
+#include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -18,7 +19,8 @@ namespace remvol {
 
 namespace {
 
-constexpr char kSession[] = "/session";
+constexpr const char* kBlockDisks = "/sys/block";
+constexpr const char* kSession = "/session";
 
 using SysfsPath = char[PATH_MAX];
 
@@ -27,7 +29,8 @@ using SysfsPath = char[PATH_MAX];
 bool find_device(const char* node, SysfsPath& path) {
   const Text<256> disk = disk_of_node(node);
   errno = ENOENT;
-  return !disk.empty() && realpath(PathText("/sys/block/%s/device", disk.c_str()), path) != nullptr;
+  return !disk.empty() &&
+         realpath(PathText("%s/%s/%s", kBlockDisks, disk.c_str(), "device"), path) != nullptr;
 }
 
 // Returns the end of the path's component sessionN, or null when it has none.
@@ -45,12 +48,8 @@ const char* find_session_end(const char* path) {
 bool read_session_target(const char* path, const char* session_end, char (&name)[256]) {
   const Text<PATH_MAX> session("%.*s", static_cast<int>(session_end - path), path);
   const char* session_name = strrchr(session, '/');
-  const Text<2 * PATH_MAX> file_path("%s/iscsi_session%s/targetname", session.c_str(), session_name);
-  const File file(fopen(file_path, "re"));
-  if (file) errno = ENOENT;  // also for an empty one
-  if (!file || fgets(name, sizeof name, file.get()) == nullptr) return false;
-  name[strcspn(name, "\n")] = '\0';
-  return name[0] != '\0';
+  return read_session_name(Text<PATH_MAX>("%s/iscsi_session%s/targetname", session.c_str(), session_name),
+                           name);
 }
 
 // Reads the LUN from the last component, H:C:T:L. It is the number that the session listing shows and the
@@ -97,6 +96,17 @@ SessionDisk session_unseen() {
   return is_absent() ? SessionDisk::kNo : SessionDisk::kUnseen;
 }
 
+// Looks for the session in the path of a disk, if it was found.
+SessionDisk session_of(bool found, const char* path, const char* target_name) {
+  if (!found) return session_unseen();
+  const char* session_end = find_session_end(path);
+  if (session_end == nullptr) return SessionDisk::kNo;
+  if (target_name == nullptr) return SessionDisk::kYes;
+  char name[256];
+  if (!read_session_target(path, session_end, name)) return session_unseen();
+  return strcmp(name, target_name) == 0 ? SessionDisk::kYes : SessionDisk::kNo;
+}
+
 struct EntryPath {
   const TargetEntry* entry;
   const char* path;
@@ -125,13 +135,21 @@ DiskOwner disk_owner(const TargetEntry* entry, const char* node) {
 
 SessionDisk is_session_disk(const char* node, const char* target_name) {
   SysfsPath path;
-  if (!find_device(node, path)) return session_unseen();
-  const char* session_end = find_session_end(path);
-  if (session_end == nullptr) return SessionDisk::kNo;
-  if (target_name == nullptr) return SessionDisk::kYes;
-  char name[256];
-  if (!read_session_target(path, session_end, name)) return session_unseen();
-  return strcmp(name, target_name) == 0 ? SessionDisk::kYes : SessionDisk::kNo;
+  return session_of(find_device(node, path), path, target_name);
+}
+
+SessionDisk is_session_device(dev_t device, const char* target_name) {
+  SysfsPath path;
+  const PathText link("/sys/dev/block/%u:%u", major(device), minor(device));
+  return session_of(realpath(link, path) != nullptr, path, target_name);
+}
+
+bool read_session_name(const char* file_path, char (&name)[256]) {
+  const File file(fopen(file_path, "re"));
+  if (file) errno = ENOENT;  // also for an empty one
+  if (!file || fgets(name, sizeof name, file.get()) == nullptr) return false;
+  name[strcspn(name, "\n")] = '\0';
+  return name[0] != '\0';
 }
 
 bool has_disk(const char* node) {

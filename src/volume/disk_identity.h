@@ -4,6 +4,8 @@
 #ifndef REMVOL_VOLUME_DISK_IDENTITY_H
 #define REMVOL_VOLUME_DISK_IDENTITY_H
 
+#include <sys/types.h>
+
 #include "tree/record.h"
 
 namespace remvol {
@@ -23,6 +25,12 @@ enum class SessionDisk { kNo, kYes, kUnseen };  // kUnseen: it is there and coul
 // Returns whether the disk of `node` is one of a session to the target called `target_name`, or to any when
 // that is null.
 [[nodiscard]] SessionDisk is_session_disk(const char* node, const char* target_name);
+
+// The same for the disk or partition with this number.
+[[nodiscard]] SessionDisk is_session_device(dev_t device, const char* target_name);
+
+// Reads a session's `targetname` of sysfs. Returns whether it has one; a failure leaves its reason in errno.
+[[nodiscard]] bool read_session_name(const char* file_path, char (&name)[256]);
 
 // Returns whether sysfs has a disk of `node`, whosever it is.
 [[nodiscard]] bool has_disk(const char* node);

@@ -96,11 +96,12 @@ bool is_node_claimed(const char* node) {
 }
 
 bool has_partition(const char* name) {
-  const Directory directory(opendir(PathText("/sys/block/%s", name)));
+  const PathText disk("/sys/block/%s", name);
+  const Directory directory(opendir(disk));
   if (!directory) return false;
   while (const dirent* entry = readdir(directory.get())) {
     if (strncmp(entry->d_name, name, strlen(name)) != 0) continue;
-    if (access(Text<1024>("/sys/block/%s/%s/partition", name, entry->d_name), F_OK) == 0) return true;
+    if (access(PathText("%s/%s/%s", disk.c_str(), entry->d_name, "partition"), F_OK) == 0) return true;
   }
   return false;
 }

@@ -11,8 +11,11 @@
 #include "support/text.h"
 #include "tree/record.h"
 #include "volume/disk_identity.h"
+#include "volume/disk_use.h"
+#include "volume/e2fsprogs.h"
 #include "volume/mount_point.h"
 #include "volume/mount_table.h"
+#include "volume/process_check.h"
 #include "volume/unmount.h"
 
 namespace remvol {
@@ -20,19 +23,17 @@ namespace remvol {
 namespace {
 
 constexpr int kMaxVolumes = 64;
-constexpr char kDisks[] = "/sys/class/block";
-
-bool is_volume(const MountLine& mount) {
-  return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0;
-}
+constexpr const char* kDisks = "/sys/class/block";
 
 bool is_session_volume(const MountLine& mount, const void* target_name) {
-  return is_volume(mount) &&
+  return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0 &&
          is_session_disk(mount.source, static_cast<const char*>(target_name)) != SessionDisk::kNo;
 }
 
-bool is_session_mount_of_others(const MountLine& mount, const void* /*what*/) {
-  return !is_volume(mount) && is_session_disk(mount.source, nullptr) != SessionDisk::kNo;
+bool is_session_mount(const MountLine& mount, const void* target_name) {
+  const auto* name = static_cast<const char*>(target_name);
+  return is_session_device(mount.device, name) != SessionDisk::kNo ||
+         is_session_disk(mount.source, name) != SessionDisk::kNo;  // btrfs has a number of its own
 }
 
 // Returns whether there is something in the folder besides itself and the one above.
@@ -43,11 +44,22 @@ bool has_entries(const char* folder) {
   return entries > 2;
 }
 
+// Returns whether the kernel says that somebody has the disk to himself: another mount namespace, swap, a
+// file system of several disks. Whoever formats is ended with the session. A disk that has lost its target is
+// not opened, which could take until the kernel gives it up.
+bool is_claimed(const char* disk, const char* node) {
+  char state[sizeof "running"] = "";
+  const File file(fopen(PathText("%s/%s/%s", kDisks, disk, "device/state"), "re"));
+  return file && fgets(state, sizeof state, file.get()) != nullptr && strcmp(state, "running") == 0 &&
+         is_node_claimed(node) && !has_process(kMke2fs, node);
+}
+
 void log_use(const char* disk, const char* place) {
   LOG(0, "the session of %s stays, it is in use at %s", disk, place);
 }
 
-// Returns whether none is left. A table that is there and cannot be read may show one.
+}  // namespace
+
 bool unmount_session_volumes(const char* target_name) {
   MountLine mount;
   for (int volumes = 0;; volumes++) {
@@ -69,20 +81,21 @@ bool unmount_session_volumes(const char* target_name) {
   }
 }
 
-}  // namespace
-
-bool is_session_used_by_others() {
+bool is_session_used(const char* target_name) {
   MountLine mount;
-  if (find_mount(is_session_mount_of_others, nullptr, &mount) == Mounted::kYes) {
-    log_use(mount.source, mount.path);
+  if (find_mount(is_session_mount, target_name, &mount) == Mounted::kYes) {
+    if (target_name != nullptr) log_use(mount.source, mount.path);
     return true;
   }
   // The folder has a link for each disk and partition.
   const Directory disks(opendir(kDisks));
   while (const dirent* disk = disks ? readdir(disks.get()) : nullptr) {
-    const PathText holders("%s/%s/holders", kDisks, disk->d_name);
-    if (is_session_disk(disk->d_name, nullptr) == SessionDisk::kNo || !has_entries(holders)) continue;
-    log_use(disk->d_name, holders);
+    if (is_session_disk(disk->d_name, target_name) == SessionDisk::kNo) continue;
+    const PathText holders("%s/%s/%s", kDisks, disk->d_name, "holders");
+    const PathText node("/dev/%s", disk->d_name);
+    const bool held = has_entries(holders);
+    if (!held && !is_claimed(disk->d_name, node)) continue;
+    if (target_name != nullptr) log_use(disk->d_name, held ? holders : node);
     return true;
   }
   return false;

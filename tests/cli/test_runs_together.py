@@ -1,8 +1,10 @@
 """Runs beside one another, and what a killed run leaves to the next."""
 
 import json
+import os
 import posixpath
 import re
+import signal
 import time
 
 import pytest
@@ -478,16 +480,39 @@ class TestASessionUnderAVolume:
 class TestADiskThatSomebodyElseUses:
     """On one session a target of the settings, on another one somebody else's, whose disk is sdx."""
 
+    DISKS = {"iqn.t1": "sdb", "iqn.theirs": "sdx", "iqn.gone": "sdq"}
+
     @pytest.fixture
     def theirs(self, stored, box):
-        assert box.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None}).status == 0
+        for folder in ("class", "dev"):
+            assert box.run(["/bin/mount", "-t", "tmpfs", folder, f"/sys/{folder}"], env={"LD_PRELOAD": None}).status == 0
         box.default("killall")
         box.default("rmmod")
         stored.offer("iqn.theirs", {0: "sdx"})
-        for number, (name, disk) in enumerate({"iqn.t1": "sdb", "iqn.theirs": "sdx"}.items(), start=1):
-            stored.log_in(name)
-            box.session_disk(disk, name, session=number)
+        for name in ("iqn.t1", "iqn.theirs"):
+            self.log_in(stored, box, name)
         return stored
+
+    def log_in(self, stored, box, name):
+        """A session that sysfs shows until it is closed."""
+        number, disk = list(self.DISKS).index(name) + 1, self.DISKS[name]
+        stored.log_in(name)
+        box.session_disk(disk, name, session=number)
+        box.write(f"/fake/initiator/on/{name}", name + "\n")
+        folder = box.path(f"/sys/class/iscsi_session/session{number}")
+        folder.mkdir(parents=True)
+        folder.joinpath("targetname").symlink_to(f"/fake/initiator/on/{name}")
+        for part in (disk, f"{disk}1"):
+            box.path(f"/sys/class/block/{part}/holders").mkdir(parents=True)
+
+    @staticmethod
+    def hold(box, disk):
+        """Something is built on it, such as LVM."""
+        box.path(f"/sys/class/block/{disk}/holders/dm-0").mkdir()
+
+    @staticmethod
+    def said(disk, place):
+        return f"the session of {disk} stays, it is in use at {place}"
 
     COMMANDS = [["--disconnect"], ["--system_off"], ["--deinit"]]
 
@@ -496,31 +521,157 @@ class TestADiskThatSomebodyElseUses:
         theirs.mount("sdx", "/srv/theirs")
         done = box.remvol(*command)
         assert theirs.sessions() == ["iqn.theirs"]
-        assert "the session of /dev/sdx1 stays, it is in use at /srv/theirs" in messages(done)
+        assert [line for line in messages(done) if "stays" in line] == [self.said("/dev/sdx1", "/srv/theirs")]
         assert "iscsiadm -m node -u" not in box.shell() and 'iscsiadm -m node -T "iqn.t1" --logout' in box.shell()
         assert done.status == 0
 
     @pytest.mark.parametrize("held", ["sdx", "sdx1"])
     def test_the_session_stays_while_something_is_built_on_it(self, theirs, box, held):
-        box.path(f"/sys/class/block/{held}/holders/dm-0").mkdir(parents=True)
+        self.hold(box, held)
         done = box.remvol("--disconnect")
         assert done.status == 0 and theirs.sessions() == ["iqn.theirs"]
-        assert f"the session of {held} stays, it is in use at /sys/class/block/{held}/holders" in messages(done)
+        assert self.said(held, f"/sys/class/block/{held}/holders") in messages(done)
+
+    def test_the_session_stays_while_it_is_mounted_by_another_name(self, theirs, box):
+        by_path = "/dev/disk/by-path/ip-10.9.0.2:3260-iscsi-iqn.theirs-lun-0-part"
+        theirs.mount(by_path.removeprefix("/dev/"), "/srv/theirs")
+        device = box.path("/srv/theirs").stat().st_dev
+        box.path("/sys/dev/block").mkdir()
+        disk = "/fake/devices/platform/host3/session2/target3:0:0/3:0:0:0/block/sdx/sdx1"
+        box.path(disk).mkdir(parents=True)
+        box.path(f"/sys/dev/block/{os.major(device)}:{os.minor(device)}").symlink_to(disk)
+        done = box.remvol("--disconnect")
+        assert done.status == 0 and theirs.sessions() == ["iqn.theirs"]
+        assert self.said(f"{by_path}1", "/srv/theirs") in messages(done)
+
+    # What this run sees of it nowhere but in the kernel's answer.
+    CLAIMS = {
+        "mounted in another namespace": "mke2fs -q -t ext4 /dev/sdx && mkdir /srv/theirs && unshare -m mount /dev/sdx /srv/theirs && "
+                                        "exec unshare -m sh -c 'mount /dev/sdx /srv/theirs; echo held; exec sleep 1000'",
+        "swap": "mkswap /dev/sdx >/dev/null && swapon /dev/sdx && trap 'swapoff /dev/sdx; exit' TERM && echo held && "
+                "while sleep 0.05; do :; done",
+        "opened by one alone": """exec python3 -c "import os, time; disk = os.open('/dev/sdx', os.O_RDONLY | os.O_EXCL); """
+                               """print('held', flush=True); time.sleep(1000)" mkfs.ext4 /dev/sdx""",
+    }
+
+    @pytest.fixture
+    def real(self, theirs, box):
+        """With a disk that the kernel knows."""
+        box.disk("sdx", 16 << 20)
+        box.write("/sys/class/block/sdx/device/state", "running\n")
+        return theirs
+
+    @staticmethod
+    def claim(box, text):
+        holder = box.start(["/bin/sh", "-c", text], env={"LD_PRELOAD": None, "PATH": "/usr/sbin:/usr/bin:/sbin:/bin"})
+        box.wait_until(lambda: holder.stdout == "held\n" or holder.result is not None)
+        assert holder.result is None, holder.result
+        return holder
+
+    @pytest.mark.parametrize("how", CLAIMS)
+    def test_the_session_stays_while_the_kernel_says_that_it_is_in_use(self, real, box, how):
+        holder = self.claim(box, self.CLAIMS[how])
+        done = box.remvol("--disconnect")
+        holder.kill(signal.SIGTERM)
+        holder.wait()
+        assert done.status == 0 and real.sessions() == ["iqn.theirs"]
+        assert [line for line in messages(done) if "stays" in line] == [self.said("sdx", "/dev/sdx")]
+
+    def test_a_disk_that_lost_its_target_is_not_opened(self, real, box):
+        box.write("/sys/class/block/sdx/device/state", "blocked\n")
+        holder = self.claim(box, self.CLAIMS["opened by one alone"])
+        assert box.remvol("--disconnect").status == 0 and real.sessions() == []
+        holder.kill()
+
+    def test_whoever_formats_is_ended_with_the_session(self, real, box):
+        rename = "open('/proc/self/comm', 'w').write('mke2fs'); print("
+        holder = self.claim(box, self.CLAIMS["opened by one alone"].replace("print(", rename))
+        assert box.remvol("--disconnect").status == 0 and real.sessions() == []
+        assert "iscsiadm -m node -u" in box.shell()
+        holder.kill()
+
+    def test_a_disk_that_is_merely_open_is_not_in_use(self, real, box):
+        holder = self.claim(box, "exec 9</dev/sdx; echo held; exec sleep 1000")
+        assert box.remvol("--disconnect").status == 0 and real.sessions() == []
+        holder.kill()
+
+    @pytest.mark.parametrize("command", COMMANDS)
+    def test_volumes_that_the_tree_does_not_name_are_unmounted_all_the_same(self, theirs, box, command):
+        theirs.offer("iqn.gone", {0: "sdq"})
+        self.log_in(theirs, box, "iqn.gone")
+        theirs.mount("sdx", "/srv/theirs")
+        theirs.mount("sdq", "/mnt/VV/gone")
+        box.remvol(*command)
+        mounts = box.run(["cat", "/proc/mounts"]).stdout
+        assert "/mnt/VV/gone" not in mounts and "/srv/theirs" in mounts
+        assert theirs.sessions() == ["iqn.theirs"]
+        shell = box.shell()
+        assert shell.index('umount -f "/mnt/VV/gone"') < shell.index('iscsiadm -m node -T "iqn.gone" --logout')
+
+    def test_a_tree_that_is_silent_makes_no_difference(self, theirs, box):
+        theirs.mount("sdx", "/srv/theirs")
+        theirs.mount("sdb", "/mnt/VV/a")
+        box.tree.stop()
+        box.remvol("--system_off")
+        assert "/mnt/VV/a" not in box.run(["cat", "/proc/mounts"]).stdout
+        assert theirs.sessions() == ["iqn.theirs"]
+
+    @pytest.fixture
+    def two(self, theirs, box):
+        """With a second target in the settings, which has no session."""
+        theirs.store("iqn.gone", slot=2, conn_set=0)
+        theirs.mount("sdx", "/srv/theirs")
+        return theirs
+
+    def test_a_logout_that_fails_counts_whichever_it_is(self, two, box):
+        self.log_in(two, box, "iqn.gone")
+        box.fake("iscsiadm", '-m node -T iqn.t1 --logout', status=1, first=True)
+        done = box.remvol("--disconnect")
+        assert (done.status, two.sessions()) == (255, ["iqn.t1", "iqn.theirs"])
+
+    def test_a_target_without_a_session_is_no_failure(self, two, box):
+        done = box.remvol("--disconnect")
+        assert (done.status, two.sessions()) == (0, ["iqn.theirs"])
+        assert "failed" not in done.stdout
 
     def test_without_another_session_nothing_is_closed(self, theirs, box):
         theirs.mount("sdx", "/srv/theirs")
-        assert box.remvol("--disconnect").status == 0
-        assert box.remvol("--disconnect").status == 255
+        for _ in range(2):
+            assert box.remvol("--disconnect").status == 0
         assert theirs.sessions() == ["iqn.theirs"]
+        assert [line for line in box.shell() if "logout" in line or "-u" in line] == ['iscsiadm -m node -T "iqn.t1" --logout']
+
+    @pytest.mark.parametrize("use, said", [
+        (lambda site, box: site.mount("sdb", "/srv/export"), ("/dev/sdb1", "/srv/export")),
+        (lambda site, box: box.path("/sys/class/block/sdb1/holders/dm-0").mkdir(), ("sdb1", "/sys/class/block/sdb1/holders"))],
+        ids=["mounted", "held"])
+    def test_the_session_of_a_target_of_the_settings_stays_as_well(self, theirs, box, use, said):
+        use(theirs, box)
+        done = box.remvol("--disconnect")
+        assert (done.status, theirs.sessions()) == (255, ["iqn.t1"])
+        assert [line for line in messages(done) if "stays" in line] == [self.said(*said)]
+        assert 'iscsiadm -m node -T "iqn.theirs" --logout' in box.shell()
+
+    def test_what_comes_into_use_while_volumes_are_unmounted_stays(self, theirs, box):
+        theirs.mount("sdb", "/mnt/VV/unknown")
+        box.fake("fuser", "-mk /mnt/VV/unknown", first=True, effect="mkdir -p /sys/class/block/sdx1/holders/dm-0")
+        assert box.remvol("--disconnect").status == 0
+        assert theirs.sessions() == ["iqn.theirs"]
+
+    def test_a_volume_that_stays_mounted_keeps_all(self, theirs, box):
+        theirs.mount("sdx", "/srv/theirs")
+        theirs.mount("sdb", f"/mnt/VV/{'long' * 50}")  # as no share is called
+        assert box.remvol("--disconnect").status == 255
+        assert theirs.sessions() == ["iqn.t1", "iqn.theirs"]
 
     @pytest.mark.parametrize("command", COMMANDS)
     def test_one_that_nobody_uses_is_closed_like_all(self, theirs, box, command):
         box.local_disk("sdl")
         box.path("/sys/class/block/sdl/holders/dm-0").mkdir(parents=True)
-        box.path("/sys/class/block/sdx/holders").mkdir(parents=True)
         theirs.mount("sdl", "/srv/local")
         box.remvol(*command)
         assert theirs.sessions() == [] and "iscsiadm -m node -u" in box.shell()
+
 
 class TestTakingEverythingAway:
     """It holds no target: what it closes and removes, another run may bring up in the same moment."""
