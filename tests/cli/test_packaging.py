@@ -403,6 +403,30 @@ def test_the_initiator_is_given_back_as_it_was(initiator, place):
     assert not initiator.path("/var/lib/remvol/initiator").exists()
 
 
+def test_the_record_of_somebody_elses_session_stays(initiator, place):
+    """Made since the installation. Of the targets in the settings none stays, nor one that nobody is connected to."""
+    helper(initiator, "initiator", "take")
+    initiator.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None})
+    records = {name: initiator.write(f"{place}/nodes/{name}/10.9.0.2,3260,1/default", "secret")
+               for name in ("iqn.new", "iqn.ne", "iqn.ours", "iqn.our", "iqn.left")}
+    for number, name in enumerate(["iqn.new", "iqn.ours", "iqn.our"]):
+        initiator.write(f"/sys/class/iscsi_session/session{number}/targetname", f"{name}\n")
+    initiator.write("/etc/NAS_CFG/vv.xml", "<config><id>\n<target>iqn.ours</target>\n</id></config>\n")
+    done = helper(initiator, "initiator", "give")
+    said = "remvol: connected and none of the volumes' targets, its record stays: {} at 10.9.0.2:3260\n"
+    assert (done.status, done.stderr) == (0, said.format("iqn.new") + said.format("iqn.our"))
+    assert [name for name, record in records.items() if record.exists()] == ["iqn.new", "iqn.our"]
+
+
+def test_without_settings_a_connected_target_is_somebody_elses(initiator, place):
+    helper(initiator, "initiator", "take")
+    initiator.run(["/bin/mount", "-t", "tmpfs", "class", "/sys/class"], env={"LD_PRELOAD": None})
+    record = initiator.write(f"{place}/nodes/iqn.new/fe80::1,3260,1/default", "record")
+    initiator.write("/sys/class/iscsi_session/session1/targetname", "iqn.new\n")
+    assert " iqn.new at fe80::1:3260\n" in helper(initiator, "initiator", "give").stderr
+    assert record.read_text() == "record"
+
+
 @pytest.mark.parametrize("place", ["/etc/iscsi"])
 def test_records_that_an_update_of_the_initiator_has_moved_stay_whose_they_were(initiator):
     helper(initiator, "initiator", "take")
