@@ -23,7 +23,7 @@ case $PHASE in
 2)
     note with_storage
     target_at_boot off
-    provokes_loss
+    allows_loss # this boot may end before anybody is told
     reboot_machine
     ;;
 3)
