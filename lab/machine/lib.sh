@@ -112,23 +112,43 @@ within() {
 # ends_in_order COMMAND...: the command ends everything: the shares first, then the volumes, the sessions, the initiator's
 # daemon, and the tree.
 ends_in_order() {
+    what_is_to_end
+    watch_the_end "/proc/$tree" "/proc/$initiator" &
+    watcher=$!
+    "$@" || fail "'$*' gave status $?"
+    wait $watcher || fail "the watcher of the end gave status $?"
+    expect_equal "what ended before its turn" "" "$(sort -u /data/disorder)"
+}
+
+# watch_the_shutdown: the same of a machine that goes down, to be asked in its next boot by "went_down_in_order". The watcher is
+# nothing that systemd stops.
+watch_the_shutdown() {
+    what_is_to_end
+    rm -f /data/watched
+    systemd-run -q -p DefaultDependencies=no sh -c '. /lab/lib.sh
+        watch_the_end "$@"
+        sync /data/disorder
+        echo all >/data/watched' sh "/proc/$tree" "/proc/$initiator"
+}
+
+went_down_in_order() {
+    expect "somebody has seen the end of everything" [ -s /data/watched ]
+    expect_equal "what ended before its turn" "" "$(sort -u /data/disorder)"
+}
+
+what_is_to_end() {
     tree=$(systemctl show -P MainPID remvol-tree)
     initiator=$(initiators)
     expect "the tree and the initiator's daemon run" [ -e "/proc/$tree/exe" -a -e "/proc/$initiator/exe" ]
     expect "there is something to end" any_session
     expect "there is something to end" any_volume
     expect "there is something to end" any_share
-    watch_the_end "/proc/$tree" "/proc/$initiator" &
-    watcher=$!
-    "$@" || fail "'$*' gave status $?"
-    wait $watcher || fail "the watcher of the end gave status $?"
-    expect_equal "what ended before its turn" "" "$(sort -u /tmp/disorder)"
 }
 
 # watch_the_end TREE INITIATOR: looks at all five, the last first, until the tree has ended. No program is started for it, so
 # it sees all that stays wrong for some milliseconds. Processes that nobody has waited for yet have ended as well.
 watch_the_end() {
-    : >/tmp/disorder
+    : >/data/disorder
     gone=
     while [ "$gone" != everything ]; do
         gone=
@@ -149,7 +169,7 @@ ends() {
     if ! "$@"; then
         gone=$name
     elif [ -n "$gone" ]; then
-        echo "$gone, before $name" >>/tmp/disorder
+        echo "$gone, before $name" >>/data/disorder
     fi
 }
 

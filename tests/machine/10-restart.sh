@@ -14,8 +14,12 @@ expect_volumes() {
 
 expect_volumes
 case $PHASE in
-1) reboot_machine ;;
+1)
+    watch_the_shutdown
+    reboot_machine
+    ;;
 2)
+    went_down_in_order
     expect_lacks "the end before" Failed "$(journalctl -b -1 -o cat --no-pager _PID=1)"
     power_pull
     ;;

@@ -20,6 +20,7 @@ mounts() { for share in Photos Music; do stat -c %d:%i /mnt/VV/$share/file; done
 
 if [ "$PHASE" = 2 ]; then
     booted
+    went_down_in_order
     expect_lacks "the end before" Failed "$(journalctl -b -1 -o cat --no-pager _PID=1)"
     expect_lacks "the kernel's words before" "I/O error" "$(journalctl -b -1 -k -o cat --no-pager)"
     expect_lacks "the kernel's words now" "recovery complete" "$(journalctl -b -k -o cat --no-pager)"
@@ -51,4 +52,5 @@ for share in Photos Music; do
     goes_on() { [ "$(wc -l </data/written-$share)" -gt "$written" ]; }
     wait_for 60 goes_on
 done
+watch_the_shutdown
 reboot_machine
