@@ -18,13 +18,12 @@
 #include "common/sessions.h"
 #include "common/tree_reader.h"
 #include "keeper/tool_runs.h"
-#include "keeper/wish.h"
 #include "tree_layout.h"
 
 namespace keeper {
 namespace {
 
-constexpr int kPatience = 3000, kTakerPause = 200;  // milliseconds
+constexpr int kPatience = 3000, kLookPause = 200;  // milliseconds
 constexpr const char* kPorts[] = {"egiga0", "egiga1", "bond0"};
 
 bool accepts(const addrinfo& address) {
@@ -105,17 +104,22 @@ bool is_still_missing(const std::string& target) {
 
 bool end_with_keeper() {
   const pid_t keeper = getppid();
+  (void)prctl(PR_SET_NAME, "remvol-keeper");
   return prctl(PR_SET_PDEATHSIG, SIGTERM) == 0 && getppid() == keeper && keeper != 1;
 }
 
 int bring_up(const char* option, const std::string& target) {
   const pid_t process = start_silently({option, "-n", target.c_str()});
-  bool is_taken = is_taken_down(target);
-  while (process > 0 && !platform::ends_within(process, kTakerPause))
-    is_taken = is_taken || is_taken_down(target);
+  bool unwanted = false;
+  do unwanted = unwanted || is_unwanted(target);
+  while (process > 0 && !platform::ends_within(process, kLookPause));
   const int result = result_of(process);
-  if (result != 0 && !is_taken && !is_taken_down(target)) want_again(target, remvol::kVolumeFailed);
-  return result;
+  if (!unwanted || result != 0 || is_busy(target)) return result;
+  // It has not waited for the connection, but was done before, or gave up waiting: it was the later wish.
+  Stored stored;
+  if (read_stored(target, stored) && stored.wanted)
+    (void)result_of(start_silently({"--disconnect", "-n", target.c_str()}));
+  return 1;
 }
 
 bool portal_answers(const std::string& address, const std::string& port) {

@@ -7,12 +7,12 @@
 namespace keeper {
 
 // Has the tool connect or recover the target, silently: that something is missing has been told, and whoever
-// gives the command by hand is told why it failed. A target that it gives up, since its session shows no
-// disk, stays wanted, unless somebody takes it down meanwhile. Returns the exit status, 1 when there is none.
+// gives the command by hand is told why it failed. Somebody who disconnects the target meanwhile has the last
+// word: a connection that comes behind it is taken back. Returns the exit status, 1 when there is none.
 int bring_up(const char* option, const std::string& target);
 
-// Has the calling process end with the one that started it, the keeper; a run of the tool that has begun goes
-// on. Returns false when the keeper has ended already.
+// Has the calling process end with the one that started it, the keeper, and bear its name; a run of the tool
+// that has begun goes on. Returns false when the keeper has ended already.
 bool end_with_keeper();
 
 // Whether a portal accepts connections; waits some seconds for it. A link-local address is tried at every LAN

@@ -40,9 +40,10 @@ constexpr char kTryFirst[] = "--try-first", kTry[] = "--try", kMount[] = "--moun
 constexpr time_t kHurry = 1, kRest = 2;  // seconds between looks
 
 constexpr Terms kInitiatorTerms = {.looks = 2, .lasting = Schedule::kLongestPause};
-// Whoever unmounts a volume to work on its disk has begun by then.
+// Whoever unmounts a volume to work on its disk has begun by then, and is at it for longer than who looks at
+// all disks.
 constexpr Terms kVolumeTerms = {
-    .looks = 10, .lasting = Schedule::kLongestPause, .once_there = true, .taken_later = true};
+    .looks = 10, .lasting = Schedule::kLongestPause, .once_there = true, .taken_looks = 2};
 
 // What should be there, and the processes of the tries that are under way.
 struct Kept {
@@ -67,6 +68,7 @@ struct Kept {
 
 struct Keeper {
   Kept targets, volumes{Schedule(kVolumeTerms), {}};
+  Wishes wishes;
   Schedule initiator{kInitiatorTerms};  // its daemon in place of a target
   int signals = -1, devices = -1;
   bool first = true;  // no look yet: what is away now was taken down when the settings say so
@@ -117,9 +119,10 @@ std::vector<Wanted> wanted_targets(const Keeper& daemon, const platform::TreeRea
   for (int n = 1; n <= remvol::kMaxTargets; n++) {
     const std::string name = tree.value(remvol::key::kTargetName, n);
     if (name.empty()) break;
-    // A try that meets no disk takes the wish back for a moment.
-    if (tree.number(0, remvol::key::kTargetConnSet, n) == 0 && !daemon.targets.is_trying(name)) continue;
+    if (tree.number(0, remvol::key::kTargetConnSet, n) == 0 && !daemon.wishes.has(name)) continue;
+    // The session of a try may show no disk, and is closed then.
     const bool connected =
+        !daemon.targets.is_trying(name) &&
         std::any_of(sessions.begin(), sessions.end(),
                     [&name](const platform::Session& session) { return session.target == name; });
     const bool was_taken = daemon.first && tree.number(remvol::kDisconnected, remvol::key::kTargetConnState,
@@ -163,11 +166,10 @@ void take_end(Keeper& daemon, pid_t process, int status) {
 }
 
 void look(Keeper& daemon) {
-  if (daemon.first) want_again({}, remvol::kVolumeLost);
   const std::vector<platform::Session> sessions = platform::read_sessions();
   const platform::TreeReader tree;
   keep_initiator(daemon, tree.answered(), is_taken_down());
-  if (!tree.answered()) return;
+  if (!tree.answered() || daemon.wishes.look(tree, sessions)) return;
   daemon.targets.schedule.look(wanted_targets(daemon, tree, sessions), now());
   daemon.first = false;
   tell(daemon.targets.schedule, "should be connected and is not, it is tried until it is",

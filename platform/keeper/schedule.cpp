@@ -21,6 +21,8 @@ Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
 }
 
 void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) const {
+  target.unclear = wanted.is_unclear;
+  if (wanted.is_unclear) return;
   if (wanted.connected && !target.connected) target.since = now;
   target.connected = wanted.connected;
   if (wanted.connected) {
@@ -36,11 +38,13 @@ void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) c
     return;
   }
   if (target.taken) return;
+  target.taken_looks = wanted.is_taken ? target.taken_looks + 1 : 0;
+  const bool later = terms_.taken_looks != 0;
   // Of targets only one that loses its session while somebody is at it is meant.
-  if (wanted.is_taken && (target.absent == 0 || terms_.taken_later)) {
+  if (wanted.is_taken && (later ? target.taken_looks >= terms_.taken_looks : target.absent == 0)) {
     target.taken = true;
     target.missing = false;
-    target.tell = terms_.taken_later;
+    target.tell = later;
     return;
   }
   if (target.missing) return;
@@ -71,7 +75,7 @@ Change Schedule::next_change(std::string& name) {
 
 bool Schedule::next_try(Try& next, time_t now) {
   for (AwaitedTarget& target : targets_) {
-    if (!target.missing || target.taken || target.connected || now < target.due) continue;
+    if (!target.missing || target.taken || target.connected || target.unclear || now < target.due) continue;
     next = {target.name, target.pause == kFirstPause};
     target.due = now + target.pause;
     target.pause = std::min(2 * target.pause, kLongestPause);

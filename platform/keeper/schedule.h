@@ -17,6 +17,7 @@ struct Wanted {
   bool is_taken = false;  // when it is not there: somebody takes it away on purpose
   bool at_work =
       false;  // when it is not there: a recovery or a connection is under way, perhaps this target's
+  bool is_unclear = false;  // what it has cannot be said now, so that all stays as it was
 };
 
 struct Try {
@@ -34,8 +35,9 @@ struct Terms {
   time_t lasting = 0;
   // What has not been there since it was first looked for is not missing.
   bool once_there = false;
-  // Somebody may take it away on purpose at any time until it is back, and not only as it goes. That is told.
-  bool taken_later = false;
+  // Somebody may take it away on purpose at any time until it is back, for that many looks in a row, and not
+  // only as it goes. That is told.
+  int taken_looks = 0;
 };
 
 class Schedule {
@@ -69,7 +71,9 @@ class Schedule {
     bool taken = false;      // it is not missed until it has been connected again
     bool missing = false;    // told, and not yet told as back
     bool tell = false;
-    int absent = 0;  // looks in a row without a session
+    bool unclear = false;  // at the last look
+    int absent = 0;        // looks in a row without a session
+    int taken_looks = 0;   // looks in a row at which somebody took it away
     time_t since = 0, pause = kFirstPause, due = 0;
   };
 

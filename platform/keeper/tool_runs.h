@@ -12,8 +12,14 @@ bool is_taken_down(const std::string& target = {});
 // True when a run may unmount volumes of the target because somebody wants it to.
 bool is_unmounting(const std::string& target);
 
+// True when a run takes the wish that the target be connected away.
+bool is_unwanted(const std::string& target);
+
 // True when a run may connect the target, or mount volumes of it. One recovery may take over another.
 bool is_brought_up(const std::string& target);
+
+// True when a run does any of these to the target.
+bool is_busy(const std::string& target);
 
 }  // namespace keeper
 

@@ -49,13 +49,10 @@ bool is_mounted(const std::vector<platform::Mount>& mounts, const Volume& volume
   return platform::mount_on(mounts, kMountRoot + volume.share) != nullptr;
 }
 
-// The session of a target that is wanted and connected; null when there is none, or several, whose disks are
+// The session of a target that is connected; null when there is none that works, or several, whose disks are
 // the same ones under other names.
 const Session* session_of(const TreeReader& tree, int target, const std::vector<Session>& sessions) {
-  if (tree.number(0, key::kTargetConnSet, target) == 0 ||
-      tree.number(kDisconnected, key::kTargetConnState, target) != kConnected) {
-    return nullptr;
-  }
+  if (tree.number(kDisconnected, key::kTargetConnState, target) != kConnected) return nullptr;
   const std::string name = tree.value(key::kTargetName, target);
   const Session* found = nullptr;
   for (const Session& session : sessions) {
@@ -127,9 +124,9 @@ bool can_connect(const TreeReader& tree, int target) {
   const std::vector<Session> sessions = platform::read_sessions();
   const Session* session = session_of(tree, target, sessions);
   const std::vector<Volume> volumes = volumes_of(tree, target);
-  return session != nullptr && std::all_of(volumes.begin(), volumes.end(), [&](const Volume& volume) {
-           return is_safe(tree, *session, volume);
-         });
+  return session != nullptr && tree.number(0, key::kTargetConnSet, target) != 0 &&
+         std::all_of(volumes.begin(), volumes.end(),
+                     [&](const Volume& volume) { return is_safe(tree, *session, volume); });
 }
 
 // Whether somebody works on the disk of a volume that is not mounted. The tool looks at it for its texts, and
@@ -155,13 +152,14 @@ std::vector<Wanted> wanted_volumes(const TreeReader& tree, const std::vector<Ses
   const std::vector<platform::Mount> mounts = platform::read_mounts();
   std::vector<Wanted> wanted;
   for (int target = 1; target <= kMaxTargets; target++) {
+    if (tree.number(0, key::kTargetConnSet, target) == 0) continue;
     const Session* session = session_of(tree, target, sessions);
-    if (session == nullptr) continue;
     const std::string name = tree.value(key::kTargetName, target);
     for (const Volume& volume : volumes_of(tree, target)) {
       Wanted one = {.name = volume.share, .connected = is_mounted(mounts, volume)};
+      one.is_unclear = session == nullptr;
       if (!is_normal(tree, volume) || (!one.connected && is_unmounting(name))) continue;
-      if (!one.connected) {
+      if (!one.connected && !one.is_unclear) {
         one.at_work = is_brought_up(name);
         one.is_taken = !one.at_work && has_stranger(disk_of(tree, *session, volume));
       }

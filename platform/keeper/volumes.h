@@ -12,9 +12,10 @@
 namespace keeper {
 
 // The volumes that are to be mounted, named by their shares, and whether they are. Nothing else is wrong with
-// them: their target is logged in, the tree calls them normal, and no run of the tool takes them away in this
-// moment. One whose disk a program has open that is not this system's is taken away on purpose: whoever
-// unmounts a volume by hand works on its disk next, in several steps maybe.
+// them: the tree calls them normal, and no run of the tool takes them away in this moment. Unless their
+// target has one session, which works, they are unclear. One whose disk a program has open that is not this
+// system's is taken away on purpose: whoever unmounts a volume by hand works on its disk next, in several
+// steps maybe.
 std::vector<Wanted> wanted_volumes(const platform::TreeReader& tree,
                                    const std::vector<platform::Session>& sessions);
 

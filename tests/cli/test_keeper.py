@@ -1,5 +1,6 @@
 """remvol-keeper: what should be connected or mounted and is not is tried again; the initiator's daemon is there."""
 
+import shutil
 import signal
 import subprocess
 
@@ -128,10 +129,11 @@ def test_what_happens_to_a_target_during_a_try_holds(keeper, meanwhile):
     assert keeper.runs == [("--status",)]
 
 
-def gives_up(box, state, more=":"):
+def gives_up(box, state, more=":", before=":"):
     """What the tool stores, and says, when a session shows no disk."""
     store = SET.format(box.build)
-    return f"{store}/conn_set 0; {store}/conn_state 0; {store}/lun/id:1/volume_state {state}; {more}; exit 255"
+    return (f"{store}/conn_set 1; {before}; {store}/conn_set 0; {store}/conn_state 0; {store}/lun/id:1/volume_state {state}; "
+            f"{more}; exit 255")
 
 
 def wish(box):
@@ -143,11 +145,99 @@ def test_a_target_whose_disks_are_late_is_tried_until_they_are_there(keeper):
     box = keeper.box
     keeper.target(1, port=3260)
     listen(box)
-    box.fake("remvol", "--connect", effect=gives_up(box, 3), status=255)
+    session = f"mkdir {SESSIONS}/session1; echo iqn.t1 >{SESSIONS}/session1/targetname; sleep 3; rm -r {SESSIONS}/session1"
+    box.fake("remvol", "--connect", effect=gives_up(box, 3, before=session), status=255)
     keeper.start()
     keeper.wait_runs(("--status",), CONNECT, CONNECT, CONNECT)
     box.wait_until(lambda: wish(box) == ["1", "4", "2"], what="the wish")
-    assert keeper.daemon.stderr.count("iqn.t1 should be connected and is not") == 1
+    assert keeper.daemon.stderr.count("iqn.t1") == 1  # that it is missing
+
+
+def connected(keeper):
+    """A target that is connected, and that the keeper has seen."""
+    keeper.target(1, port=3260, state=1)
+    keeper.session(1)
+    keeper.start()
+    wait(keeper.box, 4)
+
+
+def run_of_the_tool(box, commands, *words):
+    """A run that does this, which the keeper sees as one."""
+    box.write("/tmp/bin/remvol", f"#!/bin/sh\n{commands}\n").chmod(0o755)
+    return box.run(["/tmp/bin/remvol", *words], env={"LD_PRELOAD": None})
+
+
+def test_a_target_that_a_recovery_gives_up_is_tried(keeper):
+    """Its storage was away for a moment, and its LUNs are late."""
+    box = keeper.box
+    connected(keeper)
+    listen(box)
+    run_of_the_tool(box, f"rm -r {SESSIONS}/session1; sleep 3; {gives_up(box, 3)}", "--oiscsi_evt_recover", "-n", "iqn.t1")
+    box.wait_until(lambda: wish(box) == ["1", "4", "2"], what="the wish")
+    keeper.wait_runs(("--status",), CONNECT)
+
+
+@pytest.mark.parametrize("words", [("--modify", "-n", "iqn.t1"), ("--connect", "-n", "iqn.t1")], ids=" ".join)
+def test_only_a_run_that_means_it_takes_the_wish_away(keeper, words):
+    box = keeper.box
+    connected(keeper)
+    run_of_the_tool(box, f"rm -r {SESSIONS}/session1; sleep 3; {gives_up(box, 3)}", *words)
+    box.wait_until(lambda: wish(box) == ["1", "4", "2"], what="the wish")
+
+
+@pytest.mark.parametrize("words", [("--disconnect", "-n", "iqn.t1"), ("--del", "-n", "iqn.t1")], ids=" ".join)
+def test_a_target_whose_wish_was_taken_away_while_it_was_given_up_stays_so(keeper, words):
+    box = keeper.box
+    connected(keeper)
+    run_of_the_tool(box, f"rm -r {SESSIONS}/session1; sleep 3; {gives_up(box, 3)}", *words)
+    wait(box, 5)
+    assert wish(box) == ["0", "0", "3"]
+
+
+def test_a_target_that_goes_with_all_others_stays_away(keeper):
+    """Its wish stays in the settings, for the next start."""
+    box = keeper.box
+    connected(keeper)
+    listen(box)
+    run_of_the_tool(box, f"sleep 3; rm -r {SESSIONS}/session1; sleep 3", "--disconnect")
+    wait(box, 6)
+    assert keeper.runs == []
+
+
+def test_a_connection_by_hand_that_fails_leaves_no_wish(keeper):
+    box = keeper.box
+    keeper.target(1, port=3260, state=0, wanted=0)
+    keeper.start()
+    wait(box, 3)
+    run_of_the_tool(box, gives_up(box, 3, before="sleep 3"), *CONNECT)
+    wait(box, 5)
+    assert wish(box) == ["0", "0", "3"] and keeper.runs == []
+
+
+def test_a_try_goes_on_when_the_keeper_starts_anew(keeper):
+    box = keeper.box
+    keeper.target(1, port=3260)
+    listen(box)
+    box.fake("remvol", "--connect", effect=gives_up(box, 3, before="sleep 8"), status=255)
+    keeper.start()
+    keeper.wait_runs(("--status",), CONNECT)
+    keeper.daemon.kill(signal.SIGTERM)
+    keeper.daemon.wait()
+    at_work(box, *CONNECT, seconds=9)  # a fake has another name
+    keeper.start()
+    box.wait_until(lambda: wish(box) == ["1", "4", "2"], timeout=30, what="the wish")
+
+
+def test_a_disconnection_that_a_try_overtakes_has_the_last_word(keeper):
+    """It began between the look of the try and its connection, which waited for it."""
+    box = keeper.box
+    keeper.target(1, port=3260)
+    listen(box)
+    box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 2\n").chmod(0o755)
+    store = SET.format(box.build)
+    box.fake("remvol", "--connect", effect=f"/tmp/bin/remvol --disconnect -n iqn.t1; {store}/conn_set 1")
+    keeper.start()
+    keeper.wait_runs(("--status",), CONNECT, ("--disconnect", "-n", "iqn.t1"))
 
 
 def test_a_target_that_was_given_up_at_start_up_is_tried(keeper):
@@ -370,7 +460,7 @@ def test_a_volume_on_whose_disk_somebody_works_is_left_to_him(keeper, use, late)
     unmount(box)
     if late:
         wait_missed(keeper)
-    work = f"import os,time\nos.open({use})\ntime.sleep(3)"
+    work = f"import os,time\nos.open({use})\ntime.sleep(5)"
     assert box.run(["/usr/bin/python3", "-c", work], env={"LD_PRELOAD": None}).status == 0
     box.hook("sys_check_fs_state", "/dev/sdb1", ret=0, first=True)
     wait(box, LONG_ENOUGH)
@@ -379,6 +469,15 @@ def test_a_volume_on_whose_disk_somebody_works_is_left_to_him(keeper, use, late)
     wait(box, 3)
     unmount(box)
     keeper.wait_runs(CONNECT)
+
+
+def test_whoever_looks_at_all_disks_now_and_then_does_not_work_on_it(keeper):
+    box = photos(keeper)
+    unmount(box)
+    script = "import os,time\nfor _ in range(3):\n file = os.open('/dev/sdb', os.O_RDONLY)\n time.sleep(0.3)\n os.close(file)\n time.sleep(2.5)"
+    assert box.run(["/usr/bin/python3", "-c", script], env={"LD_PRELOAD": None}).status == 0
+    keeper.wait_runs(CONNECT)
+    assert LEFT not in keeper.daemon.stderr
 
 
 @pytest.mark.parametrize("name", ["remvol", "(udev-worker)", "systemd-udevd"])
@@ -444,6 +543,15 @@ def test_a_volume_of_a_lost_session_or_of_two_is_not_the_keepers(keeper, session
     unmount(box)
     wait(box, LONG_ENOUGH)
     assert keeper.runs == [] and "Photos" not in keeper.daemon.stderr
+
+
+def test_a_volume_waits_while_its_target_has_two_sessions(keeper):
+    box = photos(keeper)
+    a_second_session(box)
+    unmount(box)
+    wait(box, 3)
+    shutil.rmtree(box.path(f"{SESSIONS}/session2"))
+    keeper.wait_runs(CONNECT)
 
 
 @pytest.mark.parametrize("command, late", [("--disconnect", False), ("--disc", True), ("--format", False), ("--del_lun", True)])

@@ -32,6 +32,11 @@ class KeeperSchedule : public testing::Test {
     return found;
   }
 
+  // The same while somebody works on it, for long enough.
+  void take() {
+    for (int i = 0; i < 2; i++) look(kAbsent, kTaken);
+  }
+
   void lose() {
     look(kConnected);
     for (int i = 0; i < 3; i++) look(kAbsent);
@@ -196,10 +201,10 @@ TEST_F(KeeperSchedule, WhatIsLeftIsTriedAgainOnlyWhenItWasThere) {
 }
 
 TEST_F(KeeperSchedule, WhatSomebodyWorksOnLaterIsLeftToHim) {
-  schedule_ = Schedule({.once_there = true, .taken_later = true});
+  schedule_ = Schedule({.once_there = true, .taken_looks = 2});
   look(kConnected);
   look(kAbsent);
-  look(kAbsent, kTaken);
+  take();
   EXPECT_EQ(change(), Change::kLeft);
   for (int i = 0; i < 10; i++) look(kAbsent);
   EXPECT_EQ(change(), Change::kNone);
@@ -208,15 +213,39 @@ TEST_F(KeeperSchedule, WhatSomebodyWorksOnLaterIsLeftToHim) {
   EXPECT_EQ(change(), Change::kNone);
   lose();
   EXPECT_EQ(change(), Change::kMissing);
-  look(kAbsent, kTaken);
+  take();
   EXPECT_EQ(change(), Change::kLeft);
   EXPECT_EQ(tries(100), std::vector<long>{});
 }
 
 TEST_F(KeeperSchedule, WhatWasNotThereYetIsNotSaidToBeLeft) {
-  schedule_ = Schedule({.once_there = true, .taken_later = true});
-  look(kAbsent, kTaken);
+  schedule_ = Schedule({.once_there = true, .taken_looks = 2});
+  take();
   EXPECT_EQ(change(), Change::kNone);
+}
+
+TEST_F(KeeperSchedule, WhoLooksAtWhatIsAwayNowAndThenDoesNotWorkOnIt) {
+  schedule_ = Schedule({.once_there = true, .taken_looks = 2});
+  look(kConnected);
+  for (int i = 0; i < 5; i++) {
+    look(kAbsent, kTaken);
+    look(kAbsent);
+  }
+  EXPECT_EQ(change(), Change::kMissing);
+  EXPECT_EQ(change(), Change::kNone);
+}
+
+TEST_F(KeeperSchedule, WhatIsUnclearForAWhileStaysAsItWas) {
+  schedule_ = Schedule({.once_there = true});
+  lose();
+  EXPECT_EQ(change(), Change::kMissing);
+  for (int i = 0; i < 100; i++) {
+    schedule_.look({{.name = "a", .connected = false, .is_unclear = true}}, ++now_);
+    Try next;
+    EXPECT_FALSE(schedule_.next_try(next, now_));
+  }
+  look(kAbsent);
+  EXPECT_EQ(tries(5), (std::vector<long>{0, 1, 3}));
 }
 
 TEST_F(KeeperSchedule, WhatWasForgottenHasToBeThereOnce) {
