@@ -1,4 +1,4 @@
-# timeout: 700
+# timeout: 900
 # after: installed
 # The storage server is not there at boot: the boot does not wait for it, the texts say so, and the volumes come when it does.
 if [ "$PHASE" = 1 ]; then
@@ -14,7 +14,9 @@ wait_for 30 started
 [ "$(left multi-user.target)" -le "$(left remvol.service)" ] || fail "the boot waited for the volumes"
 says_so() { ! vvstat >/tmp/vvstat.out && ! grep -q Running /tmp/vvstat.out; }
 wait_for 60 says_so
-sleep 100
+finished() { systemctl is-active --quiet remvol; }
+wait_for 200 finished
+sleep 100 # the keeper's own tries
 expect "the texts are right" says_so
 lines=$(messages remvol-events remvol-keeper | grep -c $IQN:t1)
 expect_has "the log" "Could not login to [iface: default, target: $IQN:t1," "$(messages remvol)"
