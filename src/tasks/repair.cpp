@@ -37,6 +37,16 @@ bool any_text_shows_work(int dbidx) {
   return false;
 }
 
+int read_connect_state(const TargetEntry* target) {
+  int state = kDisconnected;
+  (void)ktree_get_connect_state(target->db_idx, &state);
+  return state;
+}
+
+bool is_busy(const LunState& state) {
+  return is_format_under_way(state.format) || state.volume == kVolumeCreating;
+}
+
 }  // namespace
 
 bool shows_ended_work(const TargetEntry* target) {
@@ -44,18 +54,21 @@ bool shows_ended_work(const TargetEntry* target) {
 }
 
 int repair_target_state(const TargetEntry* target) {
-  int state = kDisconnected;
-  (void)ktree_get_connect_state(target->db_idx, &state);
-  if (state != kConnecting || !IdleTarget(target->target_name)) return state;
-  (void)ktree_set_connect_state(target->db_idx, kDisconnected);
-  (void)ktree_get_connect_state(target->db_idx, &state);
-  return state;
+  if (const int state = read_connect_state(target); state != kConnecting) return state;
+  const IdleTarget idle(target->target_name);
+  // A run that has ended between the two has stored what became of it.
+  if (idle && read_connect_state(target) == kConnecting) {
+    (void)ktree_set_connect_state(target->db_idx, kDisconnected);
+  }
+  return read_connect_state(target);
 }
 
 void repair_lun_state(const TargetEntry* lun, LunState* state) {
-  if (!is_format_under_way(state->format) && state->volume != kVolumeCreating) return;
+  if (!is_busy(*state)) return;
   const IdleTarget idle(lun->target_name, lun->lun);
   if (!idle) return;
+  *state = read_lun_state(lun->db_idx, lun->lun_db_idx);
+  if (!is_busy(*state)) return;
   if (lun->dev[0] != '\0' && has_process(kMke2fs, Text<32>("/dev/%s", lun->dev))) return;
   if (is_format_under_way(state->format)) (void)ktree_update_formatting_state(lun, kFormatIdle);
   if (state->volume == kVolumeCreating) (void)ktree_update_volume_state(lun, kVolumeNormal);

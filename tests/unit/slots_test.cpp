@@ -125,6 +125,30 @@ TEST_F(HeldSlots, ShowEndedWorkWhereTheTargetIsNow) {
   EXPECT_TRUE(shows_ended_work(&target));
 }
 
+// A run ends between the look at its state and that at its lock: what it has stored last holds.
+TEST_F(HeldSlots, KeepWhatARunStoresAsItEnds) {
+  { const TargetHold hold("iqn.t2"); }
+  { const TargetHold hold("iqn.t2", 10); }
+  int reads = 0;
+  fakes::tree_set({{key(2, "conn_state"), "2"}});
+  fakes::on("ktreec_get_wb", fakes::Expression{"id:2/conn_state$"}).then_real().does([&reads] {
+    if (++reads == 2) ktreec_set("/var/run/ktree_sock_vv", 0, key(2, "conn_state").c_str(), "4");
+  });
+  TargetEntry target = {};
+  copy_text(target.target_name, "iqn.t2");
+  target.db_idx = 2;
+  EXPECT_EQ(repair_target_state(&target), 4);
+
+  fakes::tree_set({{lun_key(2, 1, "volume_state"), "3"}, {lun_key(2, 1, "format_state"), "3"}});
+  target.lun_db_idx = 1;
+  target.lun = 10;
+  LunState state = {kFormatting, kVolumeCreating};
+  repair_lun_state(&target, &state);
+  EXPECT_EQ(state.format, kFormatFailed);
+  EXPECT_EQ(state.volume, kVolumeFailed);
+  EXPECT_EQ(read_lun_state(2, 1).volume, kVolumeFailed);
+}
+
 TEST_F(HeldSlots, AreBelievedFromHoldToHold) {
   EXPECT_EQ(target_in_a_new_hold(), 2);
   fakes::on("ktreec_get_wb", fakes::Expression{"/(target|lun)$"}).returns(-1);
