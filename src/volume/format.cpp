@@ -129,8 +129,8 @@ bool may_overwrite(const TargetEntry* entry, const char* partition) {
 // Ends everybody else on the partition. Returns kGoOn or kFormatRefused.
 FormatResult end_users(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
-  wait_for_udev(partition);
   const DiskLooksHeldOff looks(partition);
+  wait_for_udev(partition);
   if (is_foreign_disk(entry, partition)) return kFormatRefused;
   System("%s", end_users_command(partition).c_str());
   return kGoOn;

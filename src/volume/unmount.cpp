@@ -47,10 +47,10 @@ constexpr size_t kFtpPathSize = 512;
 // no disk's becomes none's until then.
 void kill_node_users(const TargetEntry* entry) {
   const SessionKept kept(entry->target_name);
-  wait_for_udev(entry->mnt_dev);
   LoginsHeldOff logins;
   if (!has_disk(entry->mnt_dev)) logins.begin();
   const DiskLooksHeldOff looks(entry->mnt_dev);
+  wait_for_udev(entry->mnt_dev);
   if (is_foreign_disk(entry, entry->mnt_dev)) return;
   System("%s", end_node_users_command(entry->mnt_dev).c_str());
 }
