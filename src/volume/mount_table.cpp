@@ -61,49 +61,53 @@ bool parse_line(char* line, MountLine* mount) {
   return true;
 }
 
-template <typename Fits>
-Mounted search_table(Fits fits, MountLine* mount) {
+using Fits = bool (*)(const MountLine& mount, const void* what);
+
+Mounted search_table(Fits fits, const void* what, MountLine* mount) {
   const File table(fopen(kMountInfo, "re"));
   if (!table) return Mounted::kUnknown;
   char* buffer = nullptr;
   size_t size = 0;
   Mounted found = Mounted::kNo;
   while (found == Mounted::kNo && getline(&buffer, &size, table.get()) > 0) {
-    if (parse_line(buffer, mount) && fits(*mount)) found = Mounted::kYes;
+    if (parse_line(buffer, mount) && fits(*mount, what)) found = Mounted::kYes;
   }
   const Memory<char> owner(buffer);
   return found == Mounted::kNo && feof(table.get()) == 0 ? Mounted::kUnknown : found;
 }
 
-// The table may miss lines while another process unmounts (until kernel 5.8): "not mounted" counts only when
-// a second read says so too.
-template <typename Fits>
-Mounted find(Fits fits, MountLine* mount) {
-  const Mounted found = search_table(fits, mount);
-  return found == Mounted::kNo ? search_table(fits, mount) : found;
+bool is_at_or_below(const MountLine& mount, const void* what) {
+  const auto* root = static_cast<const char*>(what);
+  const size_t length = strlen(root);
+  return strncmp(mount.path, root, length) == 0 && (mount.path[length] == '\0' || mount.path[length] == '/');
 }
 
-bool is_at_or_below(const char* path, const char* root) {
-  const size_t length = strlen(root);
-  return strncmp(path, root, length) == 0 && (path[length] == '\0' || path[length] == '/');
+struct DeviceAt {
+  dev_t device;
+  const char* path;
+};
+
+bool is_device_at(const MountLine& mount, const void* what) {
+  const auto* wanted = static_cast<const DeviceAt*>(what);
+  return mount.device == wanted->device && (wanted->path == nullptr || strcmp(mount.path, wanted->path) == 0);
 }
 
 }  // namespace
 
 Mounted find_mount_below(const char* path, MountLine* mount) {
-  return find([path](const MountLine& line) { return is_at_or_below(line.path, path); }, mount);
+  return find_mount(is_at_or_below, path, mount);
 }
 
-Mounted find_mount(bool (*fits)(const MountLine&, const void*), const void* what, MountLine* mount) {
-  return find([fits, what](const MountLine& line) { return fits(line, what); }, mount);
+// The table may miss lines while another process unmounts (until kernel 5.8): "not mounted" counts only when
+// a second read says so too.
+Mounted find_mount(Fits fits, const void* what, MountLine* mount) {
+  const Mounted found = search_table(fits, what, mount);
+  return found == Mounted::kNo ? search_table(fits, what, mount) : found;
 }
 
 Mounted find_mount_of(dev_t device, const char* path, MountLine* mount) {
-  return find(
-      [device, path](const MountLine& line) {
-        return line.device == device && (path == nullptr || strcmp(line.path, path) == 0);
-      },
-      mount);
+  const DeviceAt wanted = {device, path};
+  return find_mount(is_device_at, &wanted, mount);
 }
 
 }  // namespace remvol
