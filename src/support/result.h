@@ -11,6 +11,7 @@ enum Result : int {
   kOk = 0,
   kNotStored = 1,                // the requested target or LUN
   kNotDeleted = 2,               // its slot
+  kSessionStays = 3,             // a volume on it cannot be unmounted, or its disk is in use elsewhere
   kFailed = -1,                  // bad argument or generic failure
   kTreeFailed = -103,            // the tree refused a write, or an entry or a free slot was not found
   kNoFtpShare = -104,            // the volume has no mount in the public FTP area

@@ -95,9 +95,9 @@ int disconnect_target(const char* target_name) {
   TargetEntry entry;
   if (ktree_get_entry_by_targetname(target_name, &entry) != kOk) return kFailed;
   const BriefTargetHold hold(entry.target_name, is_no_lun_formatting);
-  (void)Target_Disconnect(&entry);
+  const int result = Target_Disconnect(&entry);
   (void)ktree_update_status(&entry);
-  return kOk;
+  return result == kSessionStays ? kFailed : kOk;  // a logout that fails is none of the command's
 }
 
 }  // namespace

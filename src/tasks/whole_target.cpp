@@ -42,6 +42,14 @@ int log_out(const TargetEntry* entry) {
   return close_sessions(entry->target_name, logout_command(*entry));
 }
 
+// The same, but for a session with a disk that is in use. Returns kSessionStays for that.
+int log_out_unused(const TargetEntry* entry) {
+  const SessionClosing closing(entry->target_name);
+  if (!unmount_session_volumes(entry->target_name) || is_session_used(entry->target_name))
+    return kSessionStays;
+  return log_out(entry);
+}
+
 // Returns whether one of the target's volumes is mounted: the appliance is running, and the session was there
 // before.
 bool has_mounted_volume(int db_idx) {
@@ -175,7 +183,7 @@ int Target_Disconnect(TargetEntry* entry) {
   reload_share_services();
   LOG(1, "finish share folder status");
   LOG(2, "logout start");
-  const int result = log_out(entry);
+  const int result = log_out_unused(entry);
   LOG(2, "logout end ");
   (void)ktree_set_connect_state(entry->db_idx, kDisconnected);
   entry->conn_set = 0;

@@ -30,7 +30,8 @@ void give_up_session(TargetEntry* entry, int reason, VolumeState state);
 [[nodiscard]] int _target_disconnect(const TargetEntry* entry);
 
 // Unmounts all volumes of the target, reloads the shares, logs out and stores that the target stays
-// disconnected. Returns 0, 1 when the logout command failed, -1 when the target is unknown.
+// disconnected. While a disk of the session is in use all the same, that stays. Returns 0, 1 when the logout
+// command failed, kSessionStays, or -1 when the target is unknown.
 [[nodiscard]] int Target_Disconnect(TargetEntry* entry);
 
 // Start-up: builds the node record of every stored target, logs in to those that are set to connect and

@@ -25,9 +25,20 @@ namespace {
 constexpr int kMaxVolumes = 64;
 constexpr const char* kDisks = "/sys/class/block";
 
+bool is_volume(const MountLine& mount) {
+  return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0;
+}
+
+bool is_from_session(const MountLine& mount, const void* target_name) {
+  return is_session_disk(mount.source, static_cast<const char*>(target_name)) != SessionDisk::kNo;
+}
+
 bool is_session_volume(const MountLine& mount, const void* target_name) {
-  return strncmp(mount.path, kMountRoot, strlen(kMountRoot)) == 0 &&
-         is_session_disk(mount.source, static_cast<const char*>(target_name)) != SessionDisk::kNo;
+  return is_volume(mount) && is_from_session(mount, target_name);
+}
+
+bool is_session_volume_or_ftp(const MountLine& mount, const void* target_name) {
+  return (is_volume(mount) || is_in_ftp_area(mount.path)) && is_from_session(mount, target_name);
 }
 
 bool is_session_mount(const MountLine& mount, const void* target_name) {
@@ -54,6 +65,14 @@ bool is_claimed(const char* disk, const char* node) {
          is_node_claimed(node) && !has_process(kMke2fs, node);
 }
 
+bool unmount(const MountLine& mount) {
+  TargetEntry entry = {};
+  if (!is_volume(mount)) return Target_umount_ftp(&entry, mount.path) == kOk;
+  copy_text(entry.share, mount.path + strlen(kMountRoot));
+  copy_text(entry.mnt_dev, mount.source);
+  return Target_LUN_umount(&entry) == kOk;
+}
+
 void log_use(const char* disk, const char* place) {
   LOG(0, "the session of %s stays, it is in use at %s", disk, place);
 }
@@ -63,17 +82,14 @@ void log_use(const char* disk, const char* place) {
 bool unmount_session_volumes(const char* target_name) {
   MountLine mount;
   for (int volumes = 0;; volumes++) {
-    const Mounted found = find_mount(is_session_volume, target_name, &mount);
+    const Mounted found = find_mount(is_session_volume_or_ftp, target_name, &mount);
     if (found == Mounted::kNo || (found == Mounted::kUnknown && errno == ENOENT)) return true;
     if (found == Mounted::kUnknown) {
       LOG(0, "%s cannot be read: %s, no session is closed", kMountInfo, strerror(errno));
       return false;
     }
-    TargetEntry entry = {};
-    copy_text(entry.share, mount.path + strlen(kMountRoot));
-    copy_text(entry.mnt_dev, mount.source);
     if (volumes < kMaxVolumes && is_session_disk(mount.source, target_name) == SessionDisk::kYes &&
-        Target_LUN_umount(&entry) == kOk) {
+        unmount(mount)) {
       continue;
     }
     log_use(mount.source, mount.path);

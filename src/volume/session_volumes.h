@@ -9,7 +9,8 @@ namespace remvol {
 // target when it is null. A table of mounts that is there and cannot be read may show one.
 [[nodiscard]] bool has_session_volume(const char* target_name);
 
-// Unmounts the volumes that are mounted from the target's session, or from any for null. Returns whether none
+// Unmounts the volumes that are mounted from the target's session, or from any for null, also where one is
+// mounted a second time inside the public FTP area. Returns whether none
 // is left, which is logged at level 0. A table of mounts that is there and cannot be read may show one.
 [[nodiscard]] bool unmount_session_volumes(const char* target_name);
 

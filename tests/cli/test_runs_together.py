@@ -525,6 +525,26 @@ class TestADiskThatSomebodyElseUses:
         assert "iscsiadm -m node -u" not in box.shell() and 'iscsiadm -m node -T "iqn.t1" --logout' in box.shell()
         assert done.status == 0
 
+    @pytest.mark.parametrize("command, status", [("--disconnect", 255), ("--del", 0), ("--modify", 0)])
+    def test_what_is_done_to_one_target_leaves_its_session_to_who_uses_it(self, theirs, box, command, status):
+        theirs.mount("sdb", "/srv/copy")
+        done = box.remvol(command, "-n", "iqn.t1", *(["-c", "0"] if command == "--modify" else []))
+        assert done.status == status and theirs.logged_in("iqn.t1")
+        assert [line for line in messages(done) if "stays" in line] == [self.said("/dev/sdb1", "/srv/copy")]
+        assert (theirs.target("target") is None) == (command == "--del")
+        assert theirs.target("conn_set") in ("0", None)
+
+    @pytest.mark.parametrize("command", [*COMMANDS, ["--disconnect", "-n", "iqn.t1"]])
+    @pytest.mark.parametrize("stays", [False, True], ids=["free", "held"])
+    def test_a_volume_is_unmounted_from_the_ftp_area_too(self, theirs, box, command, stays):
+        theirs.mount("sdb", "/home/Public/data")
+        if stays:
+            box.hook("system", 'umount -f "/home/Public/data"', ret=256)
+        done = box.remvol(*command)
+        assert 'umount -f "/home/Public/data"' in box.shell()
+        assert ("iqn.t1" in theirs.sessions()) == stays
+        assert (self.said("/dev/sdb1", "/home/Public/data") in messages(done)) == stays
+
     @pytest.mark.parametrize("held", ["sdx", "sdx1"])
     def test_the_session_stays_while_something_is_built_on_it(self, theirs, box, held):
         self.hold(box, held)
