@@ -31,7 +31,7 @@ __attribute__((format(printf, 2, 3))) void store(int number, const char* format,
 }
 
 bool is_wanted(const TreeReader& tree, int target) {
-  return tree.number(1, key::kTargetConnSet, target) != 0;
+  return tree.number(0, key::kTargetConnSet, target) != 0;
 }
 
 // The volumes of a target in one of the states that a target which is given up has: kVolumeLost at start-up,

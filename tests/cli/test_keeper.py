@@ -100,6 +100,16 @@ def test_a_target_that_is_to_be_away_is_left_away(keeper, values):
     assert keeper.runs == []
 
 
+def test_a_target_that_was_never_connected_is_left_away(keeper):
+    """As it is between its addition and its first connection."""
+    listen(keeper.box)
+    keeper.start()
+    wait(keeper.box, 3)
+    keeper.target(1, port=3260, wanted=None, state=None)
+    wait(keeper.box, 6)
+    assert keeper.runs == [] and "iqn.t1" not in keeper.daemon.stderr
+
+
 @pytest.mark.parametrize("named", ["-n iqn.t2", "-n iqn.t1", ""], ids=["another", "itself", "all"])
 def test_only_a_command_for_the_target_keeps_it_away(keeper, named):
     box = keeper.box
