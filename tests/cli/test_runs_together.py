@@ -88,6 +88,28 @@ class TestStandingBehindAState:
         status(box)
         assert stored.target("status") == "Connecting"
 
+    @staticmethod
+    def read_as(box, key, value, then):
+        """The next run reads the value; directly behind that another one stores `then` and ends."""
+        box.tree.set(key, value)
+        box.hook("ktreec_get_wb", key, ret=1, out=str(value), times=1,
+                 effect=f"ktreec -S /var/run/ktree_sock_vv -s {key} {then}")
+
+    def test_a_connection_that_fails_just_now_stays_failed(self, stored, box):
+        stored.refuse("iqn.t1")
+        box.remvol("--connect", "-n", "iqn.t1")
+        self.read_as(box, f"{INITIATOR}/id:1/conn_state", 2, then=4)
+        status(box)
+        assert (stored.target("status"), stored.target("conn_state")) == ("Connect Error", "4")
+
+    @pytest.mark.parametrize("key, value", [("format_state", 1), ("format_state", 4), ("volume_state", 1)])
+    def test_a_volume_that_fails_just_now_stays_failed(self, stored, box, key, value):
+        box.remvol("--connect", "-n", "iqn.t1")
+        box.run(["umount", "/mnt/VV/a"])
+        self.read_as(box, f"{INITIATOR}/id:1/lun/id:1/{key}", value, then=3)
+        status(box)
+        assert (stored.lun(key), stored.lun("status")) == ("3", "Create Volume Failed")
+
     def test_a_killed_creation_of_a_volume_is_put_right(self, stored, box):
         box.hook("system", MOUNT, through=True, effect="kill -KILL $PPID", times=1)
         assert box.remvol("--connect", "-n", "iqn.t1").status == -9
@@ -525,26 +547,6 @@ class TestADiskThatSomebodyElseUses:
         assert "iscsiadm -m node -u" not in box.shell() and 'iscsiadm -m node -T "iqn.t1" --logout' in box.shell()
         assert done.status == 0
 
-    @pytest.mark.parametrize("command, status", [("--disconnect", 255), ("--del", 0), ("--modify", 0)])
-    def test_what_is_done_to_one_target_leaves_its_session_to_who_uses_it(self, theirs, box, command, status):
-        theirs.mount("sdb", "/srv/copy")
-        done = box.remvol(command, "-n", "iqn.t1", *(["-c", "0"] if command == "--modify" else []))
-        assert done.status == status and theirs.logged_in("iqn.t1")
-        assert [line for line in messages(done) if "stays" in line] == [self.said("/dev/sdb1", "/srv/copy")]
-        assert (theirs.target("target") is None) == (command == "--del")
-        assert theirs.target("conn_set") in ("0", None)
-
-    @pytest.mark.parametrize("command", [*COMMANDS, ["--disconnect", "-n", "iqn.t1"]])
-    @pytest.mark.parametrize("stays", [False, True], ids=["free", "held"])
-    def test_a_volume_is_unmounted_from_the_ftp_area_too(self, theirs, box, command, stays):
-        theirs.mount("sdb", "/home/Public/data")
-        if stays:
-            box.hook("system", 'umount -f "/home/Public/data"', ret=256)
-        done = box.remvol(*command)
-        assert 'umount -f "/home/Public/data"' in box.shell()
-        assert ("iqn.t1" in theirs.sessions()) == stays
-        assert (self.said("/dev/sdb1", "/home/Public/data") in messages(done)) == stays
-
     @pytest.mark.parametrize("held", ["sdx", "sdx1"])
     def test_the_session_stays_while_something_is_built_on_it(self, theirs, box, held):
         self.hold(box, held)
@@ -661,16 +663,97 @@ class TestADiskThatSomebodyElseUses:
         assert theirs.sessions() == ["iqn.theirs"]
         assert [line for line in box.shell() if "logout" in line or "-u" in line] == ['iscsiadm -m node -T "iqn.t1" --logout']
 
-    @pytest.mark.parametrize("use, said", [
+    # What others do with the disk of the target of the settings, and where a message says that it is.
+    USES = pytest.mark.parametrize("use, said", [
         (lambda site, box: site.mount("sdb", "/srv/export"), ("/dev/sdb1", "/srv/export")),
         (lambda site, box: box.path("/sys/class/block/sdb1/holders/dm-0").mkdir(), ("sdb1", "/sys/class/block/sdb1/holders"))],
         ids=["mounted", "held"])
+
+    @USES
     def test_the_session_of_a_target_of_the_settings_stays_as_well(self, theirs, box, use, said):
         use(theirs, box)
         done = box.remvol("--disconnect")
         assert (done.status, theirs.sessions()) == (255, ["iqn.t1"])
         assert [line for line in messages(done) if "stays" in line] == [self.said(*said)]
         assert 'iscsiadm -m node -T "iqn.theirs" --logout' in box.shell()
+
+    FTP = ["/home/Public/a", "/mnt/x/home/Public/a b"]
+    ONE = ["--disconnect", "-n", "iqn.t1"]
+
+    @pytest.mark.parametrize("command", [*COMMANDS, ONE])
+    @pytest.mark.parametrize("place", FTP)
+    def test_a_second_mount_in_the_ftp_area_is_unmounted_before(self, theirs, box, command, place):
+        theirs.mount("sdb", "/mnt/VV/a")
+        theirs.mount("sdb", place)
+        done = box.remvol(*command)
+        assert "iqn.t1" not in theirs.sessions() and "stays" not in done.stdout
+        assert place.split()[0] not in box.run(["cat", "/proc/mounts"]).stdout
+        shell = box.shell()
+        last = max(shell.index(f'umount -f "{path}"') for path in ("/mnt/VV/a", place))
+        logout = 'iscsiadm -m node -T "iqn.t1" --logout' if command == self.ONE else "iscsiadm -m node -u"
+        assert shell.index(f'fuser -mk "{place}"') < last < shell.index(logout)
+        if command != ["--deinit"]:
+            assert done.status == 0
+
+    def assert_stays(self, site, box, done, said):
+        """Its volume does not."""
+        assert "iqn.t1" in site.sessions() and not any("logout" in line or "-u" in line for line in box.shell())
+        assert [line for line in messages(done) if "stays" in line] == [self.said(*said)]
+        assert box.shell().count('umount -f "/mnt/VV/a"') == 1
+
+    @USES
+    def test_the_session_of_one_target_stays_until_nobody_uses_it(self, theirs, box, use, said):
+        theirs.mount("sdb", "/mnt/VV/a")
+        use(theirs, box)
+        done = box.remvol(*self.ONE)
+        self.assert_stays(theirs, box, done, said)
+        assert (done.status, theirs.target("conn_set"), theirs.target("status")) == (255, "0", "Connected")
+        box.run(["sh", "-c", "umount /srv/export; rmdir /sys/class/block/sdb1/holders/dm-0"])
+        assert box.remvol(*self.ONE).status == 0
+        assert (theirs.sessions(), theirs.target("status")) == (["iqn.theirs"], "Disconnected")
+
+    @pytest.mark.parametrize("how", CLAIMS)
+    def test_the_session_of_one_target_stays_while_the_kernel_says_that_it_is_in_use(self, real, box, how):
+        real.store("iqn.theirs", slot=2, luns=[("b", 0)])
+        holder = self.claim(box, self.CLAIMS[how])
+        done = box.remvol("--disconnect", "-n", "iqn.theirs")
+        holder.kill(signal.SIGTERM)
+        holder.wait()
+        assert "iqn.theirs" in real.sessions() and self.said("sdx", "/dev/sdx") in messages(done)
+
+    @USES
+    def test_a_target_that_is_deleted_leaves_its_session_to_whoever_uses_it(self, theirs, box, use, said):
+        theirs.mount("sdb", "/mnt/VV/a")
+        use(theirs, box)
+        box.fake("iscsiadm", re.compile("-T iqn.t1 .*-o delete$"), status=15, first=True)
+        done = box.remvol("--del", "-n", "iqn.t1")
+        self.assert_stays(theirs, box, done, said)
+        assert (done.status, theirs.target("target")) == (0, None)
+        box.run(["sh", "-c", "umount /srv/export; rmdir /sys/class/block/sdb1/holders/dm-0"])
+        assert box.remvol("--disconnect").status == 0 and theirs.sessions() == []
+
+    @USES
+    def test_a_target_that_is_modified_is_mounted_again_from_its_session(self, theirs, box, use, said):
+        theirs.tree.set(f"{INITIATOR}/id:1/conn_set", 1)
+        theirs.mount("sdb", "/mnt/VV/a")
+        use(theirs, box)
+        done = box.remvol("--modify", "-n", "iqn.t1", "-c", "1", "-U", "user", "-P", "a long secret")
+        self.assert_stays(theirs, box, done, said)
+        assert (done.status, theirs.target("chap_name"), theirs.target("conn_set")) == (0, "user", "1")
+        assert theirs.mounted("a") and theirs.target("status") == "Connected"
+
+    @pytest.mark.parametrize("command", [["--disconnect"], ONE])
+    def test_a_mount_in_the_ftp_area_that_stays_keeps_the_session(self, theirs, box, command):
+        theirs.mount("sdb", self.FTP[0])
+        box.fake("umount", f"-f {self.FTP[0]}", status=32, first=True)
+        done = box.remvol(*command)
+        assert done.status == 255 and "iqn.t1" in theirs.sessions()
+        assert self.said("/dev/sdb1", self.FTP[0]) in messages(done)
+
+    def test_another_targets_mount_in_the_ftp_area_stays(self, theirs, box):
+        theirs.mount("sdx", self.FTP[0])
+        box.remvol(*self.ONE)
+        assert theirs.sessions() == ["iqn.theirs"] and self.FTP[0] in box.run(["cat", "/proc/mounts"]).stdout
 
     def test_what_comes_into_use_while_volumes_are_unmounted_stays(self, theirs, box):
         theirs.mount("sdb", "/mnt/VV/unknown")

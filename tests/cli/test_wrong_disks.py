@@ -347,6 +347,21 @@ class TestUdev:
         trace = box.trace()
         assert trace.index("usleep 100000") < min(i for i, line in enumerate(trace) if "fuser -mk" in line)
 
+    @pytest.mark.parametrize("argv", [("format", 1, 1, "/dev/sdb1"), ("unmount", 1, 1)])
+    def test_what_comes_while_another_run_looks_at_the_disk_is_waited_for(self, volume, box, argv):
+        assert box.remvol("--status").status == 0  # looks, and so there is a lock for it
+        look = "exec 9</run/remvol/look-*.lock; flock -s 9; echo held; exec sleep 1000"
+        other = box.start(["/bin/bash", "-c", look], env={"LD_PRELOAD": None, "PATH": "/usr/bin:/bin"})
+        box.wait_until(lambda: other.stdout == "held\n")
+        box.path("/run/udev").mkdir()
+        box.hook("usleep", "20000", skip=2, times=1, through=True,
+                 effect=f"touch /run/udev/queue; kill {other.pid}; while kill -0 {other.pid}; do :; done")
+        box.hook("usleep", "100000", skip=2, times=1, through=True, effect="rm /run/udev/queue")
+        drive(box, *argv)
+        trace = box.trace()
+        assert trace.count("usleep 20000") == 3 and self.waits(box) == 3
+        assert trace.index("usleep 100000") < min(i for i, line in enumerate(trace) if "fuser -mk" in line)
+
     def test_but_not_for_ever(self, volume, box):
         box.write("/run/udev/queue", "")
         drive(box, "unmount", 1, 1)
