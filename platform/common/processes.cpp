@@ -46,11 +46,11 @@ bool has_argument(std::string_view arguments, std::initializer_list<std::string_
 }
 
 // Without a name behind "-n", a command is for every target.
-bool is_for(std::string_view arguments, std::string_view target) {
+bool is_for(std::string_view arguments, std::string_view target, Names names) {
   while (!arguments.empty()) {
     if (take_argument(arguments) == "-n") return take_argument(arguments) == target;
   }
-  return true;
+  return names == Names::kNoOther;
 }
 
 // Cut after 15 characters.
@@ -72,12 +72,12 @@ bool is_in_container(const char* process) {
 
 // A process that has ended, and that nobody waited for yet, has no arguments.
 bool is_it(const char* process, std::string_view program, std::initializer_list<std::string_view> options,
-           std::string_view target) {
+           std::string_view target, Names names) {
   if (name_of(process) != program) return false;
   const std::string arguments = read_process_file(process, "cmdline");
   return !arguments.empty() && !is_in_container(process) &&
          (options.size() == 0 || has_argument(arguments, options)) &&
-         (target.empty() || is_for(arguments, target));
+         (target.empty() || is_for(arguments, target, names));
 }
 
 // The name of a process's folder in /proc.
@@ -120,13 +120,13 @@ bool is_below_loop(const std::string& disk) {
 
 }  // namespace
 
-bool runs(std::string_view program, std::initializer_list<std::string_view> options,
-          std::string_view target) {
+bool runs(std::string_view program, std::initializer_list<std::string_view> options, std::string_view target,
+          Names names) {
   DIR* folder = opendir("/proc");
   if (folder == nullptr) return false;
   bool found = false;
   while (const dirent* entry = found ? nullptr : readdir(folder)) {
-    found = is_number(entry->d_name) && is_it(entry->d_name, program, options, target);
+    found = is_number(entry->d_name) && is_it(entry->d_name, program, options, target, names);
   }
   closedir(folder);
   return found;

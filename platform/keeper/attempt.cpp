@@ -11,6 +11,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <string_view>
 #include <vector>
 
 #include "common/mounts.h"
@@ -18,12 +19,14 @@
 #include "common/sessions.h"
 #include "common/tree_reader.h"
 #include "keeper/tool_runs.h"
+#include "keeper/wish.h"
 #include "tree_layout.h"
 
 namespace keeper {
 namespace {
 
 constexpr int kPatience = 3000, kLookPause = 200;  // milliseconds
+constexpr std::string_view kConnect = "--connect";
 constexpr const char* kPorts[] = {"egiga0", "egiga1", "bond0"};
 
 bool accepts(const addrinfo& address) {
@@ -114,7 +117,8 @@ int bring_up(const char* option, const std::string& target) {
   do unwanted = unwanted || is_unwanted(target);
   while (process > 0 && !platform::ends_within(process, kLookPause));
   const int result = result_of(process);
-  if (!unwanted || result != 0 || is_busy(target)) return result;
+  if (result != 0 && !unwanted) want_again(target);
+  if (result != 0 || !unwanted || kConnect != option || is_busy(target)) return result;
   // It has not waited for the connection, but was done before, or gave up waiting: it was the later wish.
   Stored stored;
   if (read_stored(target, stored) && stored.wanted)
@@ -145,7 +149,7 @@ int try_target(const std::string& target, bool refresh) {
   if (mounted) (void)result_of(start_silently({"--oiscsi_evt_reopen", "-n", target.c_str()}));
   if (refresh) (void)result_of(start_silently({"--status"}));
   if (!portal_answers(stored.address, stored.port) || !is_still_missing(target)) return 1;
-  return bring_up(mounted ? "--oiscsi_evt_recover" : "--connect", target);
+  return bring_up(mounted ? "--oiscsi_evt_recover" : kConnect.data(), target);
 }
 
 }  // namespace keeper

@@ -102,9 +102,9 @@ void tell(Schedule& schedule, const char* missing, const char* back) {
 // Without the daemon no lost session is healed and none is made. Whoever stops it on purpose is still at
 // work, or has stopped the tree as well. Where that comes again of itself so does the daemon, as nothing says
 // then that it was stopped.
-void keep_initiator(Keeper& daemon, bool tree_answers, bool taken_down) {
+void keep_initiator(Keeper& daemon, bool tree_answers, bool at_work) {
   std::vector<Wanted> wanted;
-  if (tree_answers && !taken_down && !platform::runs(platform::kTool, {"--init"})) {
+  if (tree_answers && !at_work) {
     wanted.push_back({kInitiatorDaemon, platform::runs(kInitiatorDaemon)});
   }
   daemon.initiator.look(wanted, now());
@@ -168,8 +168,9 @@ void take_end(Keeper& daemon, pid_t process, int status) {
 void look(Keeper& daemon) {
   const std::vector<platform::Session> sessions = platform::read_sessions();
   const platform::TreeReader tree;
-  keep_initiator(daemon, tree.answered(), is_taken_down());
-  if (!tree.answered() || daemon.wishes.look(tree, sessions)) return;
+  const bool starting = platform::runs(platform::kTool, {"--init"});
+  keep_initiator(daemon, tree.answered(), starting || is_taken_down());
+  if (!tree.answered() || daemon.wishes.look(tree, sessions, starting)) return;
   daemon.targets.schedule.look(wanted_targets(daemon, tree, sessions), now());
   daemon.first = false;
   tell(daemon.targets.schedule, "should be connected and is not, it is tried until it is",

@@ -22,6 +22,7 @@ Schedule::AwaitedTarget& Schedule::find(const std::string& name) {
 
 void Schedule::settle(AwaitedTarget& target, const Wanted& wanted, time_t now) const {
   target.unclear = wanted.is_unclear;
+  if (wanted.is_unclear || wanted.connected) target.taken_looks = 0;
   if (wanted.is_unclear) return;
   if (wanted.connected && !target.connected) target.since = now;
   target.connected = wanted.connected;

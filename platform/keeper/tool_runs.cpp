@@ -17,7 +17,7 @@ bool is_unmounting(const std::string& target) {
 }
 
 bool is_unwanted(const std::string& target) {
-  return runs(kTool, {"--disconnect", "--del"}, target);
+  return runs(kTool, {"--disconnect", "--del"}, target, platform::Names::kThatOne);
 }
 
 bool is_brought_up(const std::string& target) {

@@ -12,7 +12,7 @@ bool is_taken_down(const std::string& target = {});
 // True when a run may unmount volumes of the target because somebody wants it to.
 bool is_unmounting(const std::string& target);
 
-// True when a run takes the wish that the target be connected away.
+// True when a run takes the wish that the target be connected away; one that ends all sessions leaves it.
 bool is_unwanted(const std::string& target);
 
 // True when a run may connect the target, or mount volumes of it. One recovery may take over another.

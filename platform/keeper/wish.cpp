@@ -59,6 +59,8 @@ bool has_session(const std::vector<platform::Session>& sessions, const std::stri
                      [&target](const platform::Session& session) { return session.target == target; });
 }
 
+}  // namespace
+
 // By what is stored now, while no target moves to another slot.
 void want_again(const std::string& target) {
   const std::string path = std::string(kRunDir) + "/" + kSlotsLock;
@@ -77,9 +79,8 @@ void want_again(const std::string& target) {
   }
 }
 
-}  // namespace
-
-bool Wishes::look(const TreeReader& tree, const std::vector<platform::Session>& sessions) {
+bool Wishes::look(const TreeReader& tree, const std::vector<platform::Session>& sessions, bool starting) {
+  first_ = first_ || starting;
   std::map<std::string, unsigned> wanted;
   bool changed = false;
   for (int n = 1; n <= kMaxTargets; n++) {
@@ -93,18 +94,21 @@ bool Wishes::look(const TreeReader& tree, const std::vector<platform::Session>& 
       wanted.insert(*before);  // nothing has changed, so that nobody needs to be looked for
     } else if (is_unwanted(name)) {
       continue;
+    } else if (first_ && !wish && has_lost_volume(tree, n)) {
+      want_again(name);
+      changed = true;
     } else if (is_busy(name)) {  // what is between two steps counts when they are done
       if (was_wanted || (first_ && wish)) wanted[name] = was_wanted ? before->second : failed;
     } else if (wish) {
       wanted[name] = failed;
-    } else if (first_ ? has_lost_volume(tree, n) : was_wanted && (failed & ~before->second) != 0) {
+    } else if (was_wanted && (failed & ~before->second) != 0) {
       want_again(name);
       wanted[name] = 0;
       changed = true;
     }
   }
   wanted_ = std::move(wanted);
-  first_ = false;
+  first_ = starting;
   return changed;
 }
 

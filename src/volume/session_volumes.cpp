@@ -9,6 +9,7 @@
 #include "support/result.h"
 #include "support/session_hold.h"
 #include "support/text.h"
+#include "sysaux.h"
 #include "tree/record.h"
 #include "volume/disk_identity.h"
 #include "volume/disk_use.h"
@@ -23,6 +24,7 @@ namespace remvol {
 namespace {
 
 constexpr int kMaxVolumes = 64;
+constexpr const char* kPublicFtp = "/home/Public";
 constexpr const char* kDisks = "/sys/class/block";
 
 bool is_volume(const MountLine& mount) {
@@ -38,7 +40,9 @@ bool is_session_volume(const MountLine& mount, const void* target_name) {
 }
 
 bool is_session_volume_or_ftp(const MountLine& mount, const void* target_name) {
-  return (is_volume(mount) || is_in_ftp_area(mount.path)) && is_from_session(mount, target_name);
+  const size_t length = strlen(kPublicFtp);
+  const bool in_ftp_area = strncmp(mount.path, kPublicFtp, length) == 0 && mount.path[length] == '/';
+  return (is_volume(mount) || in_ftp_area) && is_from_session(mount, target_name);
 }
 
 bool is_session_mount(const MountLine& mount, const void* target_name) {
@@ -67,7 +71,10 @@ bool is_claimed(const char* disk, const char* node) {
 
 bool unmount(const MountLine& mount) {
   TargetEntry entry = {};
-  if (!is_volume(mount)) return Target_umount_ftp(&entry, mount.path) == kOk;
+  // Where it is none any more, the kill would hit the users of the system's own disk.
+  if (!is_volume(mount)) {
+    return sys_mount_point(mount.path) == 0 || Target_umount_ftp(&entry, mount.path) == kOk;
+  }
   copy_text(entry.share, mount.path + strlen(kMountRoot));
   copy_text(entry.mnt_dev, mount.source);
   return Target_LUN_umount(&entry) == kOk;

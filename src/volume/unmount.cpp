@@ -40,7 +40,7 @@ namespace {
 constexpr int kRounds = 4;
 constexpr int kKillTries = 3;
 constexpr int kKillMaxWait = 200000;  // microseconds
-constexpr char kPublicFtp[] = "/home/Public";
+constexpr const char* kPublicFtp = "/home/Public";
 constexpr size_t kFtpPathSize = 512;
 
 // Ends the users of the node that was mounted, unless its name belongs to another disk by now. A name that is
@@ -187,10 +187,6 @@ void Target_umount_all() {
   LOG(2, "end");
 }
 
-bool is_in_ftp_area(const char* path) {
-  return strstr(path, kPublicFtp) != nullptr;
-}
-
 Result get_ftp_share_path(const TargetEntry* entry, char* path) {
   const LogScope scope;
   if (is_foreign_disk(entry, entry->mnt_dev)) {  // a mount of that node is another volume's
@@ -209,7 +205,7 @@ Result get_ftp_share_path(const TargetEntry* entry, char* path) {
     if (strcmp(mount.mnt_dir, "/") == 0 || strcmp(mount.mnt_fsname, entry->mnt_dev) != 0) continue;
     LOG(2, "found pMntInfo->mnt_fsname = %s", mount.mnt_fsname);
     LOG(2, "--> pMntInfo->mnt_dir = %s", mount.mnt_dir);
-    if (!is_in_ftp_area(mount.mnt_dir)) continue;
+    if (strstr(mount.mnt_dir, kPublicFtp) == nullptr) continue;
     snprintf(path, kFtpPathSize, "%s", mount.mnt_dir);
     break;
   }

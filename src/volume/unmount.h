@@ -26,9 +26,6 @@ Result Target_umount_all_lun(int dbidx);
 // Unmounts every LUN of every target; both walks stop at the first empty slot.
 void Target_umount_all();
 
-// Whether a mount there is a volume's second one, for FTP: below "/home/Public".
-bool is_in_ftp_area(const char* path);
-
 // Finds the entry's second mount, below "/home/Public", and puts its path into `path` (512 bytes). Returns 0,
 // -104 when there is none, -105 when /proc/mounts cannot be opened.
 Result get_ftp_share_path(const TargetEntry* entry, char* path);

@@ -238,16 +238,19 @@ def test_a_try_goes_on_when_the_keeper_starts_anew(keeper):
     box.wait_until(lambda: wish(box) == ["1", "4", "2"], timeout=30, what="the wish")
 
 
-def test_a_disconnection_that_a_try_overtakes_has_the_last_word(keeper):
-    """It began between the look of the try and its connection, which waited for it."""
+@pytest.mark.parametrize("words, back", [("--disconnect -n iqn.t1", True), ("--disconnect", False)], ids=["one", "all"])
+def test_a_disconnection_that_a_try_overtakes_has_the_last_word(keeper, words, back):
+    """It began between the look of the try and its connection, which waited for it. That of all takes no wish away."""
     box = keeper.box
     keeper.target(1, port=3260)
     listen(box)
     box.write("/tmp/bin/remvol", "#!/bin/sh\nsleep 2\n").chmod(0o755)
     store = SET.format(box.build)
-    box.fake("remvol", "--connect", effect=f"/tmp/bin/remvol --disconnect -n iqn.t1; {store}/conn_set 1")
+    box.fake("remvol", "--connect", effect=f"/tmp/bin/remvol {words}; {store}/conn_set 1")
     keeper.start()
-    keeper.wait_runs(("--status",), CONNECT, ("--disconnect", "-n", "iqn.t1"))
+    keeper.wait_runs(("--status",), CONNECT)
+    wait(box, 5)
+    assert (keeper.runs[2:3] == [("--disconnect", "-n", "iqn.t1")]) == back
 
 
 def test_a_target_that_was_given_up_at_start_up_is_tried(keeper):
@@ -258,6 +261,37 @@ def test_a_target_that_was_given_up_at_start_up_is_tried(keeper):
     keeper.start()
     keeper.wait_runs(("--status",), CONNECT)
     assert wish(box) == ["1", "4", "2"]
+
+
+def test_a_target_that_was_given_up_at_start_up_is_tried_beside_a_recovery(keeper):
+    """The listener has every connected target recovered as it starts."""
+    box = keeper.box
+    at_work(box, "--oiscsi_evt_recover", "-n", "iqn.t2")
+    keeper.target(1, port=3260, state=0, wanted=0)
+    box.tree.set({f"{VOLUME.format(1)}/volume_state": 4})
+    keeper.start()
+    box.wait_until(lambda: wish(box) == ["1", "4", "2"], what="the wish")
+
+
+def test_a_target_that_a_later_start_up_gives_up_is_tried(keeper):
+    """The tree was empty when the keeper began."""
+    box = keeper.box
+    keeper.start()
+    wait(box, 3)
+    commands = f"sleep 3; {SET.format(box.build)}/target iqn.t1; {gives_up(box, 4, more='sleep 3')}"
+    run_of_the_tool(box, commands, "--init")
+    box.wait_until(lambda: wish(box) == ["1", "4", "2"], what="the wish")
+
+
+def test_a_volume_that_had_failed_before_hides_no_target_that_is_given_up(keeper):
+    box = keeper.box
+    keeper.target(1, port=3260)
+    box.tree.set({f"{VOLUME.format(1)}/volume_state": 3})
+    listen(box)
+    box.fake("remvol", "--connect", effect=gives_up(box, 3), status=255)
+    keeper.start()
+    keeper.wait_runs(("--status",), CONNECT, CONNECT)
+    box.wait_until(lambda: wish(box) == ["1", "4", "2"], what="the wish")
 
 
 def test_a_target_that_is_disconnected_while_a_try_fails_stays_so(keeper):

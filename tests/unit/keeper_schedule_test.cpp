@@ -235,6 +235,15 @@ TEST_F(KeeperSchedule, WhoLooksAtWhatIsAwayNowAndThenDoesNotWorkOnIt) {
   EXPECT_EQ(change(), Change::kNone);
 }
 
+TEST_F(KeeperSchedule, ALookAtItCountsOnlyUntilItIsThereAgain) {
+  schedule_ = Schedule({.once_there = true, .taken_looks = 2});
+  for (int i = 0; i < 5; i++) {
+    look(kConnected);
+    look(kAbsent, kTaken);
+  }
+  EXPECT_EQ(change(), Change::kNone);
+}
+
 TEST_F(KeeperSchedule, WhatIsUnclearForAWhileStaysAsItWas) {
   schedule_ = Schedule({.once_there = true});
   lose();
