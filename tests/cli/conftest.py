@@ -15,7 +15,7 @@ def pytest_configure(config):
     record_outside()
     config.addinivalue_line("markers", "unsanitized: says nothing about a build with sanitizers, and is left out there")
     config.addinivalue_line("markers", "native: is left out where the programs are emulated (docs/lab.md)")
-    config.addinivalue_line("markers", "long: waits for half a minute, and starts first so that nothing waits for it")
+    config.addinivalue_line("markers", "long: waits for many seconds, and starts early so that nothing waits for it")
 
 
 def pytest_addoption(parser):
@@ -45,10 +45,18 @@ def not_chosen(items, most, every, first):
         yield from (item for number, item in enumerate(same) if number not in chosen)
 
 
+def spread_long(items):
+    """Deals the long tests over the first quarter of all: pytest-xdist hands that out to begin with, to each worker one piece."""
+    long = [item for item in items if item.get_closest_marker("long")]
+    items[:] = [item for item in items if not item.get_closest_marker("long")]
+    for place, item in enumerate(long):
+        items.insert(place * max(len(items) // 4 // len(long), 1), item)
+
+
 def pytest_collection_modifyitems(config, items):
     if config.getoption("--cases"):
         leave_out(config, items, set(not_chosen(items, *config.getoption("--cases"))))
-    items.sort(key=lambda item: item.get_closest_marker("long") is None)
+    spread_long(items)
     if machine_folder() != build_folder():
         leave_out(config, items, {item for item in items if item.get_closest_marker("native")})
     if "REMVOL_SANITIZE:STRING=\n" in build_folder().joinpath("CMakeCache.txt").read_text():

@@ -7,6 +7,7 @@ import subprocess
 import pytest
 from harness.initiator import store
 
+pytestmark = pytest.mark.long
 SESSIONS = "/sys/class/iscsi_session"
 VOLUME = "/iscsi/initiator/id:1/lun/id:{}"
 SET = "{}/bin/ktreec -S /var/run/ktree_sock_vv -s /iscsi/initiator/id:1"
