@@ -1,6 +1,5 @@
 #include "iscsi/discovered_names.h"
 
-#include <algorithm>
 #include <cstdlib>
 #include <cstring>
 
@@ -27,8 +26,10 @@ bool DiscoveredNames::add(const DiscoveredName& name) {
 }
 
 void DiscoveredNames::sort() {
-  std::sort(names_, names_ + size_,
-            [](const DiscoveredName& a, const DiscoveredName& b) { return strcmp(a.text, b.text) < 0; });
+  if (size_ == 0) return;
+  qsort(names_, size_, sizeof *names_, [](const void* a, const void* b) {
+    return strcmp(static_cast<const DiscoveredName*>(a)->text, static_cast<const DiscoveredName*>(b)->text);
+  });
 }
 
 }  // namespace remvol

@@ -4,20 +4,22 @@ namespace remvol {
 
 namespace {
 
-constexpr int kWait = 5;  // seconds
+// Seconds. Whoever ends users may wait for udev with the lock held, which takes 5.
+constexpr int kWaitForLooks = 5;
+constexpr int kWaitToLook = 15;
 
-void take(RunLock* lock, const char* node, LockMode mode) {
-  if (node[0] != '\0') lock->take_in_time(hashed_lock_name("look", node), mode, kWait);
+void take(RunLock* lock, const char* node, LockMode mode, int seconds) {
+  if (node[0] != '\0') lock->take_in_time(hashed_lock_name("look", node), mode, seconds);
 }
 
 }  // namespace
 
 DiskLook::DiskLook(const char* node) {
-  take(&lock_, node, LockMode::kShared);
+  take(&lock_, node, LockMode::kShared, kWaitToLook);
 }
 
 DiskLooksHeldOff::DiskLooksHeldOff(const char* node) {
-  take(&lock_, node, LockMode::kExclusive);
+  take(&lock_, node, LockMode::kExclusive, kWaitForLooks);
 }
 
 }  // namespace remvol

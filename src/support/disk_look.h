@@ -8,7 +8,7 @@
 namespace remvol {
 
 // A look at the node, such as "/dev/sdb1". Looks go on beside each other. Users who are being ended are
-// waited for, 5 seconds at most. Without a name there is nothing to look at, and nothing is locked.
+// waited for, 15 seconds at most. Without a name there is nothing to look at, and nothing is locked.
 class DiskLook {
  public:
   explicit DiskLook(const char* node);

@@ -94,7 +94,7 @@ IdleTarget::IdleTarget(const char* target_name)
 IdleTarget::IdleTarget(const char* target_name, int lun) {
   const LockTry target = target_.try_existing(target_lock(target_name), LockMode::kShared);
   idle_ = target == LockTry::kTaken &&
-          lun_.try_existing(lun_lock(target_name, lun), LockMode::kExclusive) != LockTry::kBusy;
+          lun_.try_take(lun_lock(target_name, lun), LockMode::kExclusive) != LockTry::kBusy;
 }
 
 }  // namespace remvol

@@ -57,6 +57,17 @@ bool is_udev_at(const char* disk) {
   return device.fd >= 0 && flock(device.fd, LOCK_EX | LOCK_NB) != 0 && errno == EWOULDBLOCK;
 }
 
+// Returns whether udev has nothing to do with the node, in time.
+bool wait_for_udev(const char* node) {
+  const PathText disk("/dev/%s", disk_of_node(node).c_str());
+  int look = 0;
+  while (look < kUdevLooks && access(kUdev, F_OK) == 0 && is_udev_at(disk)) {
+    usleep(kLookPause);
+    look++;
+  }
+  return look < kUdevLooks;
+}
+
 }  // namespace
 
 DiskHeld::DiskHeld(const char* partition) {
@@ -106,10 +117,8 @@ bool has_partition(const char* name) {
   return false;
 }
 
-void wait_for_udev(const char* node) {
-  if (access(kUdev, F_OK) != 0) return;
-  const PathText disk("/dev/%s", disk_of_node(node).c_str());
-  for (int look = 0; look < kUdevLooks && is_udev_at(disk); look++) usleep(kLookPause);
+NodeLeftAlone::NodeLeftAlone(const char* node) : udev_is_idle_(wait_for_udev(node)), looks_(node) {
+  if (udev_is_idle_) (void)wait_for_udev(node);
 }
 
 }  // namespace remvol

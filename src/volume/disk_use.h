@@ -5,6 +5,8 @@
 
 #include <cstdint>
 
+#include "support/disk_look.h"
+
 namespace remvol {
 
 // Stands for the beginning of a partition; two that differ tell that it was written in between.
@@ -38,9 +40,18 @@ class DiskHeld {
 // Returns whether the kernel knows a partition of the disk `name`, such as sdb.
 [[nodiscard]] bool has_partition(const char* name);
 
-// Waits while udev has events pending or holds the lock on the disk of `node`, 5 seconds at most; not where
-// there is no udev. Whoever kills the users of a node that udev looks at leaves /dev/disk without its links.
-void wait_for_udev(const char* node);
+// While it lives no other run looks at the node. Before that, and again if events came while a look was
+// waited for, udev is waited for, 5 seconds at most, while it has events pending or holds the lock on the
+// disk; not where there is no udev. Whoever kills the users of a node that udev looks at leaves /dev/disk
+// without links.
+class NodeLeftAlone {
+ public:
+  explicit NodeLeftAlone(const char* node);
+
+ private:
+  bool udev_is_idle_;
+  DiskLooksHeldOff looks_;
+};
 
 }  // namespace remvol
 

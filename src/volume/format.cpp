@@ -8,7 +8,6 @@
 
 #include "frontend/log.h"
 #include "support/coreutils.h"
-#include "support/disk_look.h"
 #include "support/format_semaphore.h"
 #include "support/fuser.h"
 #include "support/session_hold.h"
@@ -129,8 +128,7 @@ bool may_overwrite(const TargetEntry* entry, const char* partition) {
 // Ends everybody else on the partition. Returns kGoOn or kFormatRefused.
 FormatResult end_users(const TargetEntry* entry, const char* partition) {
   const SessionKept kept(entry->target_name);
-  const DiskLooksHeldOff looks(partition);
-  wait_for_udev(partition);
+  const NodeLeftAlone alone(partition);
   if (is_foreign_disk(entry, partition)) return kFormatRefused;
   System("%s", end_users_command(partition).c_str());
   return kGoOn;

@@ -39,10 +39,19 @@ bool is_session_volume(const MountLine& mount, const void* target_name) {
   return is_volume(mount) && is_from_session(mount, target_name);
 }
 
-bool is_session_volume_or_ftp(const MountLine& mount, const void* target_name) {
+// The volumes of a target, or of all, and their second mounts, but for so many of these that stay.
+struct MountsToEnd {
+  const char* target_name;
+  int staying;
+  mutable int passed;
+};
+
+bool is_to_be_ended(const MountLine& mount, const void* what) {
+  const auto* mounts = static_cast<const MountsToEnd*>(what);
+  if (is_session_volume(mount, mounts->target_name)) return true;
   const size_t length = strlen(kPublicFtp);
-  const bool in_ftp_area = strncmp(mount.path, kPublicFtp, length) == 0 && mount.path[length] == '/';
-  return (is_volume(mount) || in_ftp_area) && is_from_session(mount, target_name);
+  return strncmp(mount.path, kPublicFtp, length) == 0 && mount.path[length] == '/' &&
+         is_from_session(mount, mounts->target_name) && mounts->passed++ >= mounts->staying;
 }
 
 bool is_session_mount(const MountLine& mount, const void* target_name) {
@@ -71,10 +80,6 @@ bool is_claimed(const char* disk, const char* node) {
 
 bool unmount(const MountLine& mount) {
   TargetEntry entry = {};
-  // Where it is none any more, the kill would hit the users of the system's own disk.
-  if (!is_volume(mount)) {
-    return sys_mount_point(mount.path) == 0 || Target_umount_ftp(&entry, mount.path) == kOk;
-  }
   copy_text(entry.share, mount.path + strlen(kMountRoot));
   copy_text(entry.mnt_dev, mount.source);
   return Target_LUN_umount(&entry) == kOk;
@@ -88,19 +93,23 @@ void log_use(const char* disk, const char* place) {
 
 bool unmount_session_volumes(const char* target_name) {
   MountLine mount;
+  MountsToEnd mounts = {target_name, 0, 0};
   for (int volumes = 0;; volumes++) {
-    const Mounted found = find_mount(is_session_volume_or_ftp, target_name, &mount);
+    mounts.passed = 0;
+    const Mounted found = find_mount(is_to_be_ended, &mounts, &mount);
     if (found == Mounted::kNo || (found == Mounted::kUnknown && errno == ENOENT)) return true;
     if (found == Mounted::kUnknown) {
       LOG(0, "%s cannot be read: %s, no session is closed", kMountInfo, strerror(errno));
       return false;
     }
-    if (volumes < kMaxVolumes && is_session_disk(mount.source, target_name) == SessionDisk::kYes &&
-        unmount(mount)) {
-      continue;
+    const bool sure =
+        volumes < kMaxVolumes && is_session_disk(mount.source, target_name) == SessionDisk::kYes;
+    if (!is_volume(mount)) {
+      if (!sure || !unmount_second_mount(mount.path)) mounts.staying++;
+    } else if (!sure || !unmount(mount)) {
+      log_use(mount.source, mount.path);
+      return false;
     }
-    log_use(mount.source, mount.path);
-    return false;
   }
 }
 

@@ -10,8 +10,9 @@ namespace remvol {
 [[nodiscard]] bool has_session_volume(const char* target_name);
 
 // Unmounts the volumes that are mounted from the target's session, or from any for null, also where one is
-// mounted a second time inside the public FTP area. Returns whether none
-// is left, which is logged at level 0. A table of mounts that is there and cannot be read may show one.
+// mounted a second time inside the public FTP area. Returns whether none is left below "/mnt/VV/", which is
+// logged at level 0 when it is; a second mount may stay. A table of mounts that is there and cannot be read
+// may show one.
 [[nodiscard]] bool unmount_session_volumes(const char* target_name);
 
 // Returns whether somebody uses a disk of the target's sessions, or of any session for null: it is mounted,

@@ -10,10 +10,10 @@
 #include "frontend/log.h"
 #include "support/command.h"
 #include "support/coreutils.h"
-#include "support/disk_look.h"
 #include "support/files.h"
 #include "support/fuser.h"
 #include "support/result.h"
+#include "support/run_lock.h"
 #include "support/session_hold.h"
 #include "support/target_hold.h"
 #include "support/text.h"
@@ -49,8 +49,7 @@ void kill_node_users(const TargetEntry* entry) {
   const SessionKept kept(entry->target_name);
   LoginsHeldOff logins;
   if (!has_disk(entry->mnt_dev)) logins.begin();
-  const DiskLooksHeldOff looks(entry->mnt_dev);
-  wait_for_udev(entry->mnt_dev);
+  const NodeLeftAlone alone(entry->mnt_dev);
   if (is_foreign_disk(entry, entry->mnt_dev)) return;
   System("%s", end_node_users_command(entry->mnt_dev).c_str());
 }
@@ -72,8 +71,8 @@ bool force_umount(const char* mount_point) {
 
 // Unmounts the path with its users killed. A round starts only while something is mounted there: on a path
 // that was unmounted meanwhile, the kill would hit every process that uses the system's own disk. A link that
-// was planted meanwhile ends it: the users and the mount would be others.
-void umount_with_rounds(const char* mount_point) {
+// was planted meanwhile ends it: the users and the mount would be others. Returns whether one mount is gone.
+bool umount_with_rounds(const char* mount_point) {
   bool done = false;
   for (int round = 0; !done && round < kRounds && sys_mount_point(mount_point) != 0; round++) {
     if (leads_through_link(mount_point)) break;
@@ -82,6 +81,7 @@ void umount_with_rounds(const char* mount_point) {
     done = leads_through_link(mount_point) || force_umount(mount_point);
   }
   LOG(2, "end umount");
+  return done || sys_mount_point(mount_point) == 0;
 }
 
 // Removes the mount point, whether or not the unmount worked. What is still mounted is detached first, so
@@ -139,7 +139,7 @@ Result Target_LUN_umount(const TargetEntry* entry) {
   if (hold.is_anothers(mount_point) || is_foreign_mount(entry, mount_point)) return kFailed;
   if (sys_mount_point(mount_point) != 0) {
     (void)remount_mnt_path(mount_point, 0);
-    umount_with_rounds(mount_point);
+    (void)umount_with_rounds(mount_point);
     if (leads_through_link(mount_point)) return kFailed;
     detach_mounts(mount_point);
   }
@@ -185,6 +185,12 @@ void Target_umount_all() {
     held.take();
   }
   LOG(2, "end");
+}
+
+bool unmount_second_mount(const char* path) {
+  RunLock lock;
+  lock.take_in_time(hashed_lock_name("volume", path), LockMode::kExclusive, kLongestHold);
+  return umount_with_rounds(path);
 }
 
 Result get_ftp_share_path(const TargetEntry* entry, char* path) {

@@ -26,6 +26,11 @@ Result Target_umount_all_lun(int dbidx);
 // Unmounts every LUN of every target; both walks stop at the first empty slot.
 void Target_umount_all();
 
+// Kills the users of a mount outside "/mnt/VV/" and unmounts it, as often as it takes, up to four times,
+// while it is one. Returns whether it is gone, or one of several that lay there. Logs in the innermost
+// scope's name.
+[[nodiscard]] bool unmount_second_mount(const char* path);
+
 // Finds the entry's second mount, below "/home/Public", and puts its path into `path` (512 bytes). Returns 0,
 // -104 when there is none, -105 when /proc/mounts cannot be opened.
 Result get_ftp_share_path(const TargetEntry* entry, char* path);

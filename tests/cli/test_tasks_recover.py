@@ -236,6 +236,15 @@ class TestDegradedVolumes:
         assert_order(lost.trace(), 'system umount -f "/mnt/VV/a"', 'system umount -f "/home/Public/b"',
                      'system umount -f "/mnt/VV/b"', f"system {LOGOUT}")
 
+    def test_an_ftp_share_that_stays_keeps_no_session_that_is_to_heal(self, lost, box):
+        for disk in ("sdb", "sdc"):
+            box.session_disk(disk, "iqn.t1")
+        lost.mount("sdc", "/home/Public/b")
+        box.fake("umount", "-f /home/Public/b", status=32, first=True)
+        degrade(box, "b")
+        recover(box)
+        assert LOGOUT in box.shell()
+
     def test_a_mount_table_that_cannot_be_read_any_more(self, lost, box):
         degrade(box, "b")
         lost.debug(2)

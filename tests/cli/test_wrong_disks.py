@@ -362,6 +362,15 @@ class TestUdev:
         assert trace.count("usleep 20000") == 3 and self.waits(box) == 3
         assert trace.index("usleep 100000") < min(i for i, line in enumerate(trace) if "fuser -mk" in line)
 
+    @pytest.mark.parametrize("argv", [("format", 1, 1, "/dev/sdb1"), ("unmount", 1, 1)])
+    def test_meanwhile_other_runs_look_at_the_disk(self, volume, box, argv):
+        assert box.remvol("--status").status == 0  # looks, and so there is a lock for it
+        box.write("/run/udev/queue", "")
+        box.hook("usleep", "100000", skip=2, times=1, through=True,
+                 effect="flock -ns /run/remvol/look-* touch /looked; rm /run/udev/queue")
+        drive(box, *argv)
+        assert box.path("/looked").exists() and self.waits(box) == 3
+
     def test_but_not_for_ever(self, volume, box):
         box.write("/run/udev/queue", "")
         drive(box, "unmount", 1, 1)

@@ -183,6 +183,21 @@ TEST_F(RunLocks, AWaitingRunGoesOnWhenTheHolderIsKilled) {
   EXPECT_EQ(status, 0);
 }
 
+TEST_F(RunLocks, AnIdleLunThatNoRunHasHeldBeforeIsHeldAllTheSame) {
+  mark_target("iqn.t1");
+  pid_t waiter = -1;
+  {
+    const IdleTarget idle("iqn.t1", 2);
+    EXPECT_TRUE(idle);
+    waiter = fork();
+    if (waiter == 0) _exit(TargetHold("iqn.t1", 2).waited() ? 0 : 1);
+    EXPECT_TRUE(comes_to_wait(waiter));
+  }
+  int status = -1;
+  waitpid(waiter, &status, 0);
+  EXPECT_EQ(status, 0);
+}
+
 TEST_F(RunLocks, AHeldTargetIsHeldOn) {
   const TargetHold outer("iqn.t1");
   {
@@ -375,7 +390,7 @@ TEST_F(RunLocks, ADiskWhoseUsersAreEndedIsNotLookedAt) {
     stay();
   });
   EXPECT_EQ(ktree_update_lun_status(&entry, 0), 0);
-  EXPECT_EQ(fakes::calls({"usleep"}).size(), 250U);
+  EXPECT_EQ(fakes::calls({"usleep"}).size(), 750U);
 }
 
 TEST_F(RunLocks, ASearchIsNotEndedAsAUserOfTheDiskThatItFinds) {
@@ -400,7 +415,7 @@ TEST_F(RunLocks, ASearchIsNotEndedAsAUserOfTheDiskThatItFinds) {
   ASSERT_NE(luns, nullptr);
   EXPECT_EQ(luns->fs_type, std::string("ext4"));
   lun_node_free_list(luns);
-  EXPECT_EQ(fakes::calls({"usleep"}).size(), 250U);
+  EXPECT_EQ(fakes::calls({"usleep"}).size(), 750U);
 }
 
 TEST_F(RunLocks, MountPointsBelowOneFolderAreHeldTogetherForAMinuteAtMost) {
